@@ -1,0 +1,30 @@
+#include "platform/files/RootPrefix.h"
+
+#include <cstdlib>
+
+namespace vesk {
+
+namespace {
+
+std::string normalized(std::string_view prefix) {
+  while (!prefix.empty() && prefix.back() == '/') prefix.remove_suffix(1);
+  return std::string(prefix);
+}
+
+std::string& storage() {
+  static std::string prefix = [] {
+    const char* fromEnvironment = std::getenv("VESKREPORTINGD_ROOT");
+    return normalized(fromEnvironment ? fromEnvironment : "");
+  }();
+  return prefix;
+}
+
+}  // namespace
+
+const std::string& rootPrefix() { return storage(); }
+
+void setRootPrefix(std::string_view prefix) { storage() = normalized(prefix); }
+
+std::string pathUnderRoot(std::string_view path) { return rootPrefix() + std::string(path); }
+
+}  // namespace vesk

@@ -1,0 +1,20 @@
+// Where the daemon's files stand: every path of the project is written as on a device and resolved here.
+#pragma once
+
+#include <string>
+#include <string_view>
+
+namespace vesk {
+
+/// The directory that stands for "/" (without a trailing slash; "" is the real root). First use fixes it:
+/// what `setRootPrefix` set, else the environment variable VESKREPORTINGD_ROOT, else the real root.
+/// Thread-safe after start-up.
+const std::string& rootPrefix();
+
+/// Called once, first thing in `main`, before any thread starts.
+void setRootPrefix(std::string_view prefix);
+
+/// `path` (absolute) under the root prefix.
+std::string pathUnderRoot(std::string_view path);
+
+}  // namespace vesk

@@ -1,0 +1,108 @@
+// The process's HTTP client: one shared connection pool, one thread of its own.
+#pragma once
+
+#include <chrono>
+#include <cstddef>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+namespace vesk {
+
+struct HTTPRequest {
+  /// What the client may do when the transport fails before any answer arrived.
+  enum class Retry : unsigned char {
+    Never,      ///< uploads and storebag fetches
+    UntilSent,  ///< posts: again with growing, jittered waits, for at most 60 s and while fewer than 8 MiB
+                ///< wait
+  };
+
+  std::string method = "GET";
+  std::string url;  ///< only http and https are followed
+  /// Sent in this order. Names and values must not hold control characters (such a header is left out and
+  /// logged).
+  std::vector<std::pair<std::string, std::string>> headers;
+  std::string body;
+  std::chrono::milliseconds timeout{60'000};  ///< for each attempt, from start to the last byte
+  Retry retry = Retry::Never;
+};
+
+struct HTTPResponse {
+  long status = 0;  ///< 100 to 599
+  std::vector<std::pair<std::string, std::string>> headers;
+  std::string
+      body;  ///< at most `HTTPClient::Options::maximumBody` bytes; a longer answer is a transport error
+
+  /// The first header of that name, compared without regard to case.
+  std::optional<std::string_view> header(std::string_view name) const;
+};
+
+/// The transport failed: there is no answer at all.
+struct HTTPError {
+  enum class Kind : unsigned char {
+    Connect,
+    Resolve,
+    Timeout,
+    TLS,
+    Interrupted,
+    BadURL,
+    TooLarge,
+    Stopped,
+    Other
+  };
+  Kind kind = Kind::Other;
+  std::string description;
+};
+
+/// Exactly one of the two is given.
+struct HTTPResult {
+  std::optional<HTTPResponse> response;
+  std::optional<HTTPError> error;
+};
+
+/// Sends requests. Thread-safe. TLS certificates are verified against the system's authorities or, when set,
+/// the file named by SSL_CERT_FILE. Redirects are not followed; no response is cached.
+class HTTPClient {
+ public:
+  /// Runs once per request, on the client's thread; must neither block nor throw. What it captured is
+  /// destroyed on that thread right after it ran.
+  using Completion = std::function<void(const HTTPResult&)>;
+
+  struct Options {
+    std::string userAgent = "veskreportingd";
+    std::size_t maximumBody = std::size_t{4} << 20;     ///< bytes of a response body
+    std::size_t maximumWaiting = std::size_t{8} << 20;  ///< bytes of post bodies that wait for a retry
+    std::chrono::milliseconds retryFor{60'000};         ///< from the first attempt of a post
+    std::chrono::milliseconds firstRetryAfter{200};     ///< doubled each time, up to 10 s, ±50 % jitter
+    std::chrono::milliseconds connectTimeout{15'000};
+    std::size_t maximumConnectionsPerHost = 6;  ///< further requests wait in order
+  };
+
+  /// Starts the thread.
+  explicit HTTPClient(Options options);
+  HTTPClient();
+  /// Fails what is still outstanding with `Stopped` (completions run), then ends the thread. Not to be called
+  /// from a completion.
+  ~HTTPClient();
+  HTTPClient(const HTTPClient&) = delete;
+  HTTPClient& operator=(const HTTPClient&) = delete;
+
+  /// Returns at once. Posts to one host are sent in the order of the calls as far as connections allow.
+  void start(HTTPRequest request, Completion completion);
+
+  /// Starts the request and blocks until it is completed. Not to be called from a completion.
+  HTTPResult perform(HTTPRequest request);
+
+  /// Waits until nothing is outstanding, at most `timeout`; true when nothing was left.
+  [[nodiscard]] bool waitUntilIdle(std::chrono::milliseconds timeout);
+
+ private:
+  class Worker;
+  std::unique_ptr<Worker> _worker;
+};
+
+}  // namespace vesk

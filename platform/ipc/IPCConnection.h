@@ -1,0 +1,76 @@
+// One peer-to-peer connection between the daemon and a client process, as both ends see it.
+#pragma once
+
+#include <sys/types.h>
+
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <variant>
+#include <vector>
+
+#include "platform/values/Value.h"
+
+namespace vesk {
+
+class IPCIncomingCall;
+
+/// Who is at the other end, as the kernel vouched for it when the connection was made.
+struct IPCPeer {
+  uid_t user = static_cast<uid_t>(-1);
+  gid_t group = static_cast<gid_t>(-1);
+  pid_t process = 0;
+};
+
+/// What is exported under a connection's object path: receives each method call on the connection's thread
+/// and answers through the call. Must not throw.
+class IPCExportedObject {
+ public:
+  virtual ~IPCExportedObject() = default;
+  /// The D-Bus interface whose members `handle` knows.
+  virtual const char* interfaceName() const = 0;
+  virtual void handle(IPCIncomingCall& call) = 0;
+};
+
+/// An argument of a call to the remote object; its type decides its D-Bus type (docs/wire.md).
+using IPCArgument = std::variant<bool, std::uint16_t, double, std::string, Dictionary, List,
+                                 std::optional<Dictionary>, std::optional<std::string>>;
+
+/// A one-way call to the remote object.
+struct IPCOutgoingCall {
+  const char* interfaceName;
+  const char* member;
+  std::vector<IPCArgument> arguments;
+};
+
+/// Shared by its owner (a session), its handlers and its own thread. The handlers and the exported object are
+/// dropped after the invalidation handler has run, which breaks the rings that they form with the connection.
+class IPCConnection {
+ public:
+  virtual ~IPCConnection() = default;
+
+  virtual std::string description() const = 0;
+  virtual IPCPeer peer() const = 0;
+
+  /// Set before `resume`; run on the connection's thread, each at most once.
+  virtual void setExportedObject(std::shared_ptr<IPCExportedObject> object) = 0;
+  virtual void setInterruptionHandler(std::function<void()> handler) = 0;
+  virtual void setInvalidationHandler(std::function<void()> handler) = 0;
+
+  /// Begins to serve calls, on the connection's own thread.
+  virtual void resume() = 0;
+
+  /// Asks the connection to end; safe from any thread and more than once. The invalidation handler runs on
+  /// the connection's thread soon after.
+  virtual void invalidate() = 0;
+
+  /// Puts a one-way call into the connection's bounded outbox and wakes its thread. Safe from any thread,
+  /// never blocks, takes no lock but the outbox's own. When the call can't be sent (outbox full, connection
+  /// gone) the error handler is called on the calling thread, before this returns; the call is lost.
+  virtual void callRemoteObject(IPCOutgoingCall call,
+                                const std::function<void(const std::string& error)>& errorHandler) = 0;
+};
+
+}  // namespace vesk

@@ -1,0 +1,49 @@
+// The answer that the receiver of a call owes its caller.
+#pragma once
+
+#include <functional>
+#include <utility>
+
+namespace vesk {
+
+/// A reply closure: called once, on the thread that serves the call. When it is destroyed without having been
+/// called, its caller gets an error reply, so that nobody waits for ever. Empty when the caller wants no
+/// answer; calling an empty one does nothing.
+template <class... Arguments>
+class Reply {
+ public:
+  Reply() = default;
+  /// `send` carries the answer; `abandon` tells the caller that none will come. Neither may throw.
+  Reply(std::function<void(const Arguments&...)> send, std::function<void()> abandon)
+      : _send(std::move(send)), _abandon(std::move(abandon)) {}
+  Reply(Reply&& other) noexcept
+      : _send(std::exchange(other._send, nullptr)), _abandon(std::exchange(other._abandon, nullptr)) {}
+  Reply& operator=(Reply&& other) noexcept {
+    if (this != &other) {
+      abandon();
+      _send = std::exchange(other._send, nullptr);
+      _abandon = std::exchange(other._abandon, nullptr);
+    }
+    return *this;
+  }
+  ~Reply() { abandon(); }
+
+  explicit operator bool() const noexcept { return static_cast<bool>(_send); }
+
+  void operator()(const Arguments&... arguments) {
+    auto send = std::exchange(_send, nullptr);
+    _abandon = nullptr;
+    if (send) send(arguments...);
+  }
+
+ private:
+  void abandon() noexcept {
+    _send = nullptr;
+    if (auto tell = std::exchange(_abandon, nullptr)) tell();
+  }
+
+  std::function<void(const Arguments&...)> _send;
+  std::function<void()> _abandon;
+};
+
+}  // namespace vesk

@@ -1,0 +1,155 @@
+#include "platform/log/SystemLog.h"
+
+#include <sys/stat.h>
+#include <sys/uio.h>
+#include <unistd.h>
+
+#define SD_JOURNAL_SUPPRESS_LOCATION
+#include <systemd/sd-journal.h>
+
+#include <cstdarg>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <ctime>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "platform/sync/Mutex.h"
+
+namespace vesk {
+
+namespace {
+
+struct LogState {
+  std::string processName;
+  std::string facility;
+  SystemLog::Sink sink;
+  bool toJournal = false;
+};
+
+// Replaced as a whole and read without a lock: a line is written from any thread, also under other locks.
+// States are few and are kept for ever, because a thread may still be reading an old one, even during process
+// exit.
+std::atomic<const LogState*>& state() {
+  static std::atomic<const LogState*> current{new LogState};
+  return current;
+}
+
+template <class Change>
+void changeState(Change change) {
+  static auto* mutex = new Mutex;
+  static auto* kept = new std::vector<std::unique_ptr<const LogState>>;
+  MutexLock lock(*mutex);
+  auto next = std::make_unique<LogState>(*state().load());
+  change(*next);
+  state().store(next.get());
+  kept->push_back(std::move(next));
+}
+
+bool stderrIsJournal() {
+  const char* stream = std::getenv("JOURNAL_STREAM");
+  if (!stream) return false;
+  unsigned long long device = 0;
+  unsigned long long inode = 0;
+  if (std::sscanf(stream, "%llu:%llu", &device, &inode) != 2) return false;
+  struct stat status {};
+  return ::fstat(STDERR_FILENO, &status) == 0 && status.st_dev == device && status.st_ino == inode;
+}
+
+std::string printable(std::string_view text) {
+  while (!text.empty() && text.back() == '\n') text.remove_suffix(1);
+  std::string out;
+  out.reserve(text.size());
+  for (char c : text) {
+    auto byte = static_cast<unsigned char>(c);
+    if ((byte < 0x20 && c != '\t') || byte == 0x7f) {
+      char escaped[8];
+      std::snprintf(escaped, sizeof escaped, "\\x%02x", byte);
+      out += escaped;
+    } else {
+      out += c;
+    }
+  }
+  return out;
+}
+
+void writeToStderr(const LogState& log, LogLevel level, const std::string& line) {
+  timespec now{};
+  ::clock_gettime(CLOCK_REALTIME, &now);
+  tm local{};
+  ::localtime_r(&now.tv_sec, &local);
+  char date[32];
+  std::strftime(date, sizeof date, "%Y-%m-%d %H:%M:%S", &local);
+  char head[128];
+  int size = std::snprintf(head, sizeof head, "%s.%03ld %s[%d] <%d> ", date, now.tv_nsec / 1'000'000,
+                           log.processName.empty() ? "vesk" : log.processName.c_str(), ::getpid(),
+                           static_cast<int>(level));
+  iovec parts[] = {{head, static_cast<std::size_t>(size)},
+                   {const_cast<char*>(line.data()), line.size()},
+                   {const_cast<char*>("\n"), 1}};
+  // One write, so that lines of several threads and processes do not mix.
+  [[maybe_unused]] auto written = ::writev(STDERR_FILENO, parts, 3);
+}
+
+}  // namespace
+
+std::atomic<int> SystemLog::_level{static_cast<int>(LogLevel::Info)};
+
+void SystemLog::open(std::string_view processName, std::string_view facility) {
+  changeState([&](LogState& log) {
+    log.processName = processName;
+    log.facility = facility;
+    log.toJournal = stderrIsJournal();
+  });
+}
+
+void SystemLog::close() noexcept {
+  try {
+    changeState([](LogState& log) { log = LogState{{}, {}, log.sink, false}; });
+  } catch (...) {
+    // Out of memory while stopping: the old state serves as well.
+  }
+}
+
+void SystemLog::setSink(Sink sink) {
+  changeState([&](LogState& log) { log.sink = std::move(sink); });
+}
+
+void SystemLog::write(LogLevel level, const char* format, ...) noexcept {
+  try {
+    char shortLine[512];
+    va_list arguments;
+    va_start(arguments, format);
+    va_list again;
+    va_copy(again, arguments);
+    int size = std::vsnprintf(shortLine, sizeof shortLine, format, arguments);
+    va_end(arguments);
+    std::string line;
+    if (size >= static_cast<int>(sizeof shortLine)) {
+      line.resize(static_cast<std::size_t>(size) + 1);
+      std::vsnprintf(line.data(), line.size(), format, again);
+      line.resize(static_cast<std::size_t>(size));
+    } else if (size >= 0) {
+      line.assign(shortLine, static_cast<std::size_t>(size));
+    }
+    va_end(again);
+    line = printable(line);
+
+    const LogState* log = state().load();
+    if (log->sink) {
+      log->sink(level, line);
+    } else if (log->toJournal) {
+      sd_journal_send("MESSAGE=%s", line.c_str(), "PRIORITY=%i", static_cast<int>(level),
+                      "SYSLOG_IDENTIFIER=%s", log->processName.c_str(), "VESK_FACILITY=%s",
+                      log->facility.c_str(), nullptr);
+    } else {
+      writeToStderr(*log, level, line);
+    }
+  } catch (...) {
+    // A line that can't be formatted for want of memory is lost; the caller goes on.
+  }
+}
+
+}  // namespace vesk

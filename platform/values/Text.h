@@ -1,0 +1,71 @@
+// Immutable UTF-8 text that is cheap to copy.
+#pragma once
+
+#include <cstddef>
+#include <functional>
+#include <memory>
+#include <string>
+#include <string_view>
+
+namespace vesk {
+
+/// A piece of text that shares its bytes with its copies. Copying costs a reference count, or nothing at all
+/// for a literal. The bytes never change, so any thread may read any copy. They are valid UTF-8 wherever the
+/// text came through one of the decoders (wire, property list, TOML); the class itself does not check.
+class Text {
+ public:
+  Text() noexcept = default;
+
+  /// Copies `text` into storage of its own.
+  Text(std::string_view
+           text);  // NOLINT(google-explicit-constructor): texts are written as literals everywhere
+  Text(const std::string& text) : Text(std::string_view(text)) {}
+  Text(const char* text) : Text(std::string_view(text)) {}
+
+  /// Refers to characters of static storage duration; nothing is copied and no reference is counted.
+  template <std::size_t N>
+  static Text literal(const char (&text)[N]) noexcept {
+    return Text(std::shared_ptr<const char>(std::shared_ptr<const char>(), text), N - 1);
+  }
+
+  /// Refers to `size` bytes at `data`, whose life `data` shares.
+  Text(std::shared_ptr<const char> data, std::size_t size) noexcept : _data(std::move(data)), _size(size) {}
+
+  std::string_view view() const noexcept { return {_data ? _data.get() : "", _size}; }
+  std::string string() const { return std::string(view()); }
+  std::size_t size() const noexcept { return _size; }
+  bool empty() const noexcept { return _size == 0; }
+
+  friend bool operator==(const Text& a, const Text& b) noexcept {
+    return a._size == b._size && (a._data.get() == b._data.get() || a.view() == b.view());
+  }
+  friend bool operator==(const Text& a, std::string_view b) noexcept { return a.view() == b; }
+  friend bool operator==(const Text& a, const char* b) noexcept { return a.view() == b; }
+
+ private:
+  std::shared_ptr<const char> _data;
+  std::size_t _size = 0;
+};
+
+/// Makes many texts out of few allocations: a decoder adds the texts of one message to one arena. A chunk
+/// lives as long as any text in it. Not thread-safe; the texts are.
+class TextArena {
+ public:
+  /// `chunkSize`: bytes per allocation; a text longer than a quarter of it gets an allocation of its own.
+  explicit TextArena(std::size_t chunkSize = 1024) noexcept : _chunkSize(chunkSize) {}
+  Text add(std::string_view text);
+
+ private:
+  std::size_t _chunkSize;
+  std::shared_ptr<char[]> _chunk;
+  std::size_t _used = 0;
+};
+
+}  // namespace vesk
+
+template <>
+struct std::hash<vesk::Text> {
+  std::size_t operator()(const vesk::Text& text) const noexcept {
+    return std::hash<std::string_view>{}(text.view());
+  }
+};

@@ -1,0 +1,215 @@
+// The dynamic values that messages, session infos, preferences and configurations are made of.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <initializer_list>
+#include <memory>
+#include <optional>
+#include <string_view>
+#include <utility>
+#include <variant>
+#include <vector>
+
+#include "Text.h"
+
+namespace vesk {
+
+class Value;
+struct DictionaryEntry;
+class MutableDictionary;
+
+/// A point in time: seconds since 1970 (may be fractional, negative or not finite: it came from outside).
+struct Date {
+  double secondsSince1970 = 0;
+  friend bool operator==(const Date&, const Date&) = default;
+};
+
+/// Immutable byte string; copies share it.
+class Bytes {
+ public:
+  Bytes() noexcept = default;
+  explicit Bytes(std::string data) : _data(std::make_shared<const std::string>(std::move(data))) {}
+  std::string_view view() const noexcept { return _data ? std::string_view(*_data) : std::string_view(); }
+  std::size_t size() const noexcept { return view().size(); }
+  friend bool operator==(const Bytes& a, const Bytes& b) noexcept { return a.view() == b.view(); }
+
+ private:
+  std::shared_ptr<const std::string> _data;
+};
+
+/// Immutable sequence of values; copies share it.
+class List {
+ public:
+  List() noexcept = default;
+  explicit List(std::vector<Value> values);
+  List(std::initializer_list<Value> values);
+
+  std::size_t size() const noexcept;
+  bool empty() const noexcept { return size() == 0; }
+  const Value& operator[](std::size_t index) const noexcept;
+  const Value* begin() const noexcept;
+  const Value* end() const noexcept;
+  friend bool operator==(const List& a, const List& b) noexcept;
+
+ private:
+  std::shared_ptr<const std::vector<Value>> _values;
+};
+
+/// Immutable map from text to value that keeps the order of insertion; keys are unique. A copy is a reference
+/// count, so this is what "a copy of the dictionary" means throughout the project. Looking a key up is a
+/// linear scan up to 32 entries, which is faster than hashing for the sizes that messages have, and indexed
+/// above.
+class Dictionary {
+ public:
+  Dictionary() noexcept = default;
+  Dictionary(std::initializer_list<DictionaryEntry> entries);
+
+  std::size_t size() const noexcept;
+  bool empty() const noexcept { return size() == 0; }
+  const DictionaryEntry* begin() const noexcept;
+  const DictionaryEntry* end() const noexcept;
+
+  /// The value under `key`, or null. It lives as long as any copy of this dictionary.
+  const Value* find(std::string_view key) const noexcept;
+  bool contains(std::string_view key) const noexcept { return find(key) != nullptr; }
+
+  /// The entry under `key` when it is of that kind, else nothing.
+  std::optional<Text> text(std::string_view key) const;
+  std::optional<Dictionary> dictionary(std::string_view key) const;
+  std::optional<List> list(std::string_view key) const;
+
+  friend bool operator==(const Dictionary& a, const Dictionary& b) noexcept;
+
+ private:
+  friend class MutableDictionary;
+  struct Storage;
+  explicit Dictionary(std::shared_ptr<const Storage> storage) noexcept : _storage(std::move(storage)) {}
+  std::shared_ptr<const Storage> _storage;
+};
+
+/// One value of any kind. A default-constructed value is the null marker.
+class Value {
+ public:
+  /// In the order of the alternatives below.
+  enum class Kind : std::uint8_t {
+    None,
+    Boolean,
+    Signed,
+    Unsigned,
+    Double,
+    Text,
+    Bytes,
+    Date,
+    List,
+    Dictionary
+  };
+
+  Value() noexcept = default;
+  Value(bool value) noexcept : _value(value) {}                                            // NOLINT
+  Value(int value) noexcept : _value(static_cast<std::int64_t>(value)) {}                  // NOLINT
+  Value(long value) noexcept : _value(static_cast<std::int64_t>(value)) {}                 // NOLINT
+  Value(long long value) noexcept : _value(static_cast<std::int64_t>(value)) {}            // NOLINT
+  Value(unsigned value) noexcept : _value(static_cast<std::uint64_t>(value)) {}            // NOLINT
+  Value(unsigned long value) noexcept : _value(static_cast<std::uint64_t>(value)) {}       // NOLINT
+  Value(unsigned long long value) noexcept : _value(static_cast<std::uint64_t>(value)) {}  // NOLINT
+  Value(double value) noexcept : _value(value) {}                                          // NOLINT
+  Value(vesk::Text value) noexcept : _value(std::move(value)) {}                           // NOLINT
+  Value(const char* value) : _value(vesk::Text(value)) {}                                  // NOLINT
+  Value(std::string_view value) : _value(vesk::Text(value)) {}                             // NOLINT
+  Value(const std::string& value) : _value(vesk::Text(value)) {}                           // NOLINT
+  Value(vesk::Bytes value) noexcept : _value(std::move(value)) {}                          // NOLINT
+  Value(vesk::Date value) noexcept : _value(value) {}                                      // NOLINT
+  Value(vesk::List value) noexcept : _value(std::move(value)) {}                           // NOLINT
+  Value(vesk::Dictionary value) noexcept : _value(std::move(value)) {}                     // NOLINT
+
+  Kind kind() const noexcept { return static_cast<Kind>(_value.index()); }
+  bool isNone() const noexcept { return kind() == Kind::None; }
+  /// Boolean, integer or double.
+  bool isNumber() const noexcept { return kind() >= Kind::Boolean && kind() <= Kind::Double; }
+
+  /// The alternative of that kind, or null.
+  const bool* boolean() const noexcept { return std::get_if<bool>(&_value); }
+  const std::int64_t* signedInteger() const noexcept { return std::get_if<std::int64_t>(&_value); }
+  const std::uint64_t* unsignedInteger() const noexcept { return std::get_if<std::uint64_t>(&_value); }
+  const double* real() const noexcept { return std::get_if<double>(&_value); }
+  const vesk::Text* text() const noexcept { return std::get_if<vesk::Text>(&_value); }
+  const vesk::Bytes* bytes() const noexcept { return std::get_if<vesk::Bytes>(&_value); }
+  const vesk::Date* date() const noexcept { return std::get_if<vesk::Date>(&_value); }
+  const vesk::List* list() const noexcept { return std::get_if<vesk::List>(&_value); }
+  const vesk::Dictionary* dictionary() const noexcept { return std::get_if<vesk::Dictionary>(&_value); }
+
+  /// Numbers as other number types; nothing for what is no number. Integers are cut to the low bits as an
+  /// integer conversion does; doubles are cut towards zero and held inside the range of 64 bits first, so
+  /// that no number from outside has an undefined result (NaN gives 0).
+  std::optional<std::int64_t> asInteger() const noexcept;
+  std::optional<double> asDouble() const noexcept;
+  std::optional<bool> asBoolean() const noexcept;
+
+  friend bool operator==(const Value& a, const Value& b) noexcept { return a._value == b._value; }
+
+  template <class Visitor>
+  decltype(auto) visit(Visitor&& visitor) const {
+    return std::visit(std::forward<Visitor>(visitor), _value);
+  }
+
+ private:
+  std::variant<std::monostate, bool, std::int64_t, std::uint64_t, double, vesk::Text, vesk::Bytes, vesk::Date,
+               vesk::List, vesk::Dictionary>
+      _value;
+};
+
+struct DictionaryEntry {
+  Text key;
+  Value value;
+  friend bool operator==(const DictionaryEntry&, const DictionaryEntry&) = default;
+};
+
+/// A dictionary under construction, owned by one thread.
+class MutableDictionary {
+ public:
+  MutableDictionary() noexcept = default;
+  /// Starts as a copy of `source`, with room for `extra` more entries.
+  explicit MutableDictionary(const Dictionary& source, std::size_t extra = 0);
+
+  void reserve(std::size_t entries) { _entries.reserve(entries); }
+  std::size_t size() const noexcept { return _entries.size(); }
+  bool empty() const noexcept { return _entries.empty(); }
+
+  /// Replaces the value under `key` where it stands, or appends.
+  void set(Text key, Value value);
+  /// Sets every entry of `source`.
+  void setAll(const Dictionary& source);
+  /// Appends without looking for `key`: the caller knows that it is not there yet.
+  void append(Text key, Value value) { _entries.push_back({std::move(key), std::move(value)}); }
+  void remove(std::string_view key);
+
+  const Value* find(std::string_view key) const noexcept;
+  bool contains(std::string_view key) const noexcept { return find(key) != nullptr; }
+
+  std::vector<DictionaryEntry>& entries() noexcept { return _entries; }
+  const std::vector<DictionaryEntry>& entries() const noexcept { return _entries; }
+
+  /// Hands the entries to an immutable dictionary; this one is empty afterwards.
+  Dictionary share();
+  /// The same for entries appended from outside, which may repeat a key: the last value of a key wins and
+  /// stands where the key stood first.
+  Dictionary shareUnique();
+
+ private:
+  std::vector<DictionaryEntry> _entries;
+};
+
+/// What a dictionary holds under a key, read as a number; what is absent or no number gives nothing.
+std::optional<std::int64_t> integerForKey(const Dictionary& dictionary, std::string_view key) noexcept;
+std::optional<double> doubleForKey(const Dictionary& dictionary, std::string_view key) noexcept;
+std::optional<bool> booleanForKey(const Dictionary& dictionary, std::string_view key) noexcept;
+
+/// One line that shows a value to a person, cut at about `limit` bytes (log lines, tools).
+std::string describe(const Value& value, std::size_t limit = 1024);
+
+/// Memory that a dictionary holds, roughly, in bytes: its entries and texts. Texts shared with other
+/// dictionaries count in full.
+std::size_t approximateMemory(const MutableDictionary& dictionary) noexcept;
+
+}  // namespace vesk
