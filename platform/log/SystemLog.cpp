@@ -33,7 +33,8 @@ struct LogState {
 // States are few and are kept for ever, because a thread may still be reading an old one, even during process
 // exit.
 std::atomic<const LogState*>& state() {
-  static std::atomic<const LogState*> current{new LogState};
+  static const LogState* initial = new LogState;
+  static std::atomic<const LogState*> current{initial};
   return current;
 }
 

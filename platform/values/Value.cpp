@@ -224,13 +224,27 @@ std::optional<bool> booleanForKey(const Dictionary& dictionary, std::string_view
   return value ? value->asBoolean() : std::nullopt;
 }
 
+namespace {
+
+std::size_t approximateMemory(const Value& value) noexcept {
+  if (const Text* text = value.text()) return text->size();
+  if (const Bytes* bytes = value.bytes()) return bytes->size();
+  std::size_t size = 0;
+  if (const List* list = value.list()) {
+    for (const Value& item : *list) size += sizeof(Value) + approximateMemory(item);
+  } else if (const Dictionary* dictionary = value.dictionary()) {
+    for (const auto& entry : *dictionary) {
+      size += sizeof(DictionaryEntry) + entry.key.size() + approximateMemory(entry.value);
+    }
+  }
+  return size;
+}
+
+}  // namespace
+
 std::size_t approximateMemory(const MutableDictionary& dictionary) noexcept {
   std::size_t size = dictionary.entries().capacity() * sizeof(DictionaryEntry);
-  for (const auto& entry : dictionary.entries()) {
-    size += entry.key.size();
-    if (const Text* text = entry.value.text()) size += text->size();
-    if (const Bytes* bytes = entry.value.bytes()) size += bytes->size();
-  }
+  for (const auto& entry : dictionary.entries()) size += entry.key.size() + approximateMemory(entry.value);
   return size;
 }
 
