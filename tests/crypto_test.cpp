@@ -1,0 +1,164 @@
+// Digests, base64, RSA signatures and UUIDs.
+#include <gtest/gtest.h>
+#include <openssl/evp.h>
+#include <openssl/rsa.h>
+#include <openssl/x509.h>
+
+#include <memory>
+#include <set>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/crypto/Base64.h"
+#include "platform/crypto/Digest.h"
+#include "platform/crypto/RSAPublicKey.h"
+#include "platform/crypto/UUID.h"
+
+namespace vesk {
+namespace {
+
+struct FreeKey {
+  void operator()(EVP_PKEY* key) const { EVP_PKEY_free(key); }
+};
+using Key = std::unique_ptr<EVP_PKEY, FreeKey>;
+
+std::string derOf(EVP_PKEY* key, int (*encode)(const EVP_PKEY*, unsigned char**)) {
+  unsigned char* bytes = nullptr;
+  int size = encode(key, &bytes);
+  std::string der(reinterpret_cast<char*>(bytes), static_cast<std::size_t>(size));
+  OPENSSL_free(bytes);
+  return der;
+}
+
+int encodePKCS1(const EVP_PKEY* key, unsigned char** out) { return i2d_PublicKey(key, out); }
+
+std::string sign(EVP_PKEY* key, const EVP_MD* digest, std::string_view message) {
+  std::unique_ptr<EVP_MD_CTX, decltype(&EVP_MD_CTX_free)> context(EVP_MD_CTX_new(), EVP_MD_CTX_free);
+  EXPECT_EQ(EVP_DigestSignInit(context.get(), nullptr, digest, nullptr, key), 1);
+  std::string signature(512, '\0');
+  std::size_t size = signature.size();
+  EXPECT_EQ(EVP_DigestSign(context.get(), reinterpret_cast<unsigned char*>(signature.data()), &size,
+                           reinterpret_cast<const unsigned char*>(message.data()), message.size()),
+            1);
+  signature.resize(size);
+  return signature;
+}
+
+TEST(Digest, MatchesPublishedVectors) {
+  EXPECT_EQ(hexLower(sha1("abc")), "a9993e364706816aba3e25717850c26c9cd0d89d");
+  EXPECT_EQ(hexLower(sha256("")), "e3b0c44298fc1c149afbf4c8996fb92427ae41e4649b934ca495991b7852b855");
+  EXPECT_EQ(hexLower(sha256("abc")), "ba7816bf8f01cfea414140de5dae2223b00361a396177a9cb410ff61f20015ad");
+  EXPECT_EQ(hexLower(sha256(std::string(1'000'000, 'a'))),
+            "cdc76e5c9914fb9281a1c7e284d73e67f1809a48a497200e046d39ccc7112cd0");
+}
+
+TEST(Digest, ThreadsDoNotDisturbEachOther) {
+  std::vector<std::thread> threads;
+  for (char letter = 'a'; letter < 'e'; ++letter) {
+    threads.emplace_back([letter] {
+      std::string text(100, letter);
+      auto first = sha256(text);
+      for (int i = 0; i < 200; ++i) EXPECT_EQ(sha256(text), first);
+    });
+  }
+  for (auto& thread : threads) thread.join();
+}
+
+TEST(Base64, MatchesPublishedVectorsBothWays) {
+  const std::pair<const char*, const char*> cases[] = {{"", ""},
+                                                       {"f", "Zg=="},
+                                                       {"fo", "Zm8="},
+                                                       {"foo", "Zm9v"},
+                                                       {"foob", "Zm9vYg=="},
+                                                       {"fooba", "Zm9vYmE="},
+                                                       {"foobar", "Zm9vYmFy"}};
+  for (auto [plain, text] : cases) {
+    EXPECT_EQ(base64Encode(plain), text);
+    EXPECT_EQ(base64Decode(text), plain);
+  }
+}
+
+TEST(Base64, CarriesLongBinaryDataUnbroken) {
+  std::string bytes;
+  for (int i = 0; i < 4'000'001; ++i) bytes += static_cast<char>(i * 7 + i / 256);
+  auto text = base64Encode(bytes);
+  EXPECT_EQ(text.find('\n'), std::string::npos);
+  EXPECT_EQ(base64Decode(text), bytes);
+}
+
+TEST(Base64, SkipsWhatIsOutsideTheAlphabet) {
+  EXPECT_EQ(base64Decode("Zm9v\r\n\t Ym\xc3\xa4-_Fy!"), "foobar");
+  EXPECT_EQ(base64Decode(" Zg = = \n"), "f");
+  EXPECT_EQ(base64Decode("\n\n"), "");
+}
+
+TEST(Base64, TellsWhatIsNoBase64) {
+  for (const char* text : {"Z", "Zg", "Zg=", "Zm9", "Zg===", "====", "Zg==Zg==", "Z=g=", "=Zg="}) {
+    EXPECT_FALSE(base64Decode(text)) << text;
+  }
+}
+
+TEST(UUID, IsRandomVersionFour) {
+  std::set<std::string> seen;
+  for (int i = 0; i < 100; ++i) {
+    auto text = uuidText(makeUUID());
+    ASSERT_EQ(text.size(), 36u);
+    EXPECT_EQ(text[14], '4');
+    EXPECT_NE(std::string("89AB").find(text[19]), std::string::npos);
+    EXPECT_TRUE(seen.insert(text).second);
+  }
+  EXPECT_EQ(uuidText({0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 255}),
+            "00010203-0405-0607-0809-0A0B0C0D0EFF");
+}
+
+class RSA : public testing::Test {
+ protected:
+  static void SetUpTestSuite() { _key.reset(EVP_RSA_gen(2048)); }
+  static void TearDownTestSuite() { _key.reset(); }
+  static Key _key;
+};
+Key RSA::_key;
+
+TEST_F(RSA, VerifiesItsSignatureFromEitherForm) {
+  auto signature = sign(_key.get(), EVP_sha1(), "payload");
+  for (const auto& der : {derOf(_key.get(), i2d_PUBKEY), derOf(_key.get(), encodePKCS1)}) {
+    auto key = RSAPublicKey::fromDER(der);
+    ASSERT_TRUE(key);
+    EXPECT_TRUE(key->verifySHA1(sha1("payload"), signature));
+    const void* identity = key->identity();
+    RSAPublicKey moved = std::move(*key);
+    EXPECT_EQ(moved.identity(), identity);
+    EXPECT_TRUE(moved.verifySHA1(sha1("payload"), signature));
+  }
+}
+
+TEST_F(RSA, RefusesEverySignatureButItsOwn) {
+  auto key = RSAPublicKey::fromDER(derOf(_key.get(), i2d_PUBKEY));
+  ASSERT_TRUE(key);
+  auto signature = sign(_key.get(), EVP_sha1(), "payload");
+  EXPECT_FALSE(key->verifySHA1(sha1("payloaD"), signature));
+  for (std::size_t at : {std::size_t{0}, signature.size() / 2, signature.size() - 1}) {
+    auto broken = signature;
+    broken[at] = static_cast<char>(broken[at] ^ 1);
+    EXPECT_FALSE(key->verifySHA1(sha1("payload"), broken));
+  }
+  EXPECT_FALSE(key->verifySHA1(sha1("payload"), ""));
+  EXPECT_FALSE(key->verifySHA1(sha1("payload"), signature.substr(1)));
+  EXPECT_FALSE(key->verifySHA1(sha1("payload"), signature + "x"));
+  EXPECT_FALSE(key->verifySHA1(sha1("payload"), sign(_key.get(), EVP_sha256(), "payload")));
+  Key other(EVP_RSA_gen(2048));
+  EXPECT_FALSE(key->verifySHA1(sha1("payload"), sign(other.get(), EVP_sha1(), "payload")));
+}
+
+TEST_F(RSA, TakesNoOtherKeyAndNoRubbish) {
+  auto der = derOf(_key.get(), i2d_PUBKEY);
+  Key curve(EVP_EC_gen("P-256"));
+  for (const auto& bytes : {std::string(), std::string("rubbish"), der.substr(0, der.size() - 1), der + "x",
+                            derOf(curve.get(), i2d_PUBKEY)}) {
+    EXPECT_FALSE(RSAPublicKey::fromDER(bytes));
+  }
+}
+
+}  // namespace
+}  // namespace vesk
