@@ -1,0 +1,177 @@
+#include "client/common/PersistentIdentifiers.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/random.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cctype>
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <filesystem>
+#include <string_view>
+#include <system_error>
+
+#include "client/common/SmallFile.h"
+#include "platform/files/FileDescriptor.h"
+#include "platform/files/RootPrefix.h"
+#include "platform/log/SystemLog.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::size_t kMaximumFile = 4096;
+constexpr char kRespecting[] = "respects_consent";
+constexpr char kOverriding[] = "overrides_consent";
+
+// A random UUID (version 4).
+std::string makeIdentifier() {
+  unsigned char bytes[16];
+  if (::getrandom(bytes, sizeof bytes, 0) != static_cast<ssize_t>(sizeof bytes)) {
+    throw std::system_error(errno, std::generic_category(), "getrandom");
+  }
+  bytes[6] = static_cast<unsigned char>((bytes[6] & 0x0f) | 0x40);
+  bytes[8] = static_cast<unsigned char>((bytes[8] & 0x3f) | 0x80);
+  std::string text;
+  for (std::size_t i = 0; i < sizeof bytes; ++i) {
+    if (i == 4 || i == 6 || i == 8 || i == 10) text += '-';
+    char digits[3];
+    std::snprintf(digits, sizeof digits, "%02x", bytes[i]);
+    text += digits;
+  }
+  return text;
+}
+
+bool isIdentifier(std::string_view text) {
+  if (text.size() != 36) return false;
+  for (std::size_t i = 0; i < text.size(); ++i) {
+    bool isDash = i == 8 || i == 13 || i == 18 || i == 23;
+    if (isDash ? text[i] != '-' : std::isxdigit(static_cast<unsigned char>(text[i])) == 0) return false;
+  }
+  return true;
+}
+
+// Locks until it is destroyed, against other processes and other objects of this one.
+FileDescriptor lockFile(const std::string& path) {
+  FileDescriptor file(::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
+  if (!file) return file;
+  while (::flock(file.get(), LOCK_EX) != 0) {
+    if (errno != EINTR) return {};
+  }
+  return file;
+}
+
+bool writeAll(int file, std::string_view text) {
+  while (!text.empty()) {
+    ssize_t written = ::write(file, text.data(), text.size());
+    if (written < 0 && errno == EINTR) continue;
+    if (written < 0) return false;
+    text.remove_prefix(static_cast<std::size_t>(written));
+  }
+  return true;
+}
+
+}  // namespace
+
+std::string PersistentIdentifiers::identifier(bool respectsConsent) {
+  MutexLock lock(_mutex);
+  if (!_pair) _pair = load();
+  return respectsConsent ? _pair->respecting : _pair->overriding;
+}
+
+PersistentIdentifiers::Pair PersistentIdentifiers::load() const {
+  if (auto known = parse(readSmallFile(_path, kMaximumFile).bytes)) return *known;
+  std::error_code ignored;
+  std::filesystem::create_directories(std::filesystem::path(_path).parent_path(), ignored);
+  FileDescriptor lock = lockFile(_path + ".lock");
+  if (lock) {
+    if (auto known = readFile()) return *known;
+  }
+  int cause = errno;
+  Pair pair = fresh();
+  if (lock) cause = store(pair);
+  if (cause != 0) {
+    VESK_LOG_WARNING("VeskReporting: cannot keep identifiers in %s: %s; they last as long as this process",
+                     _path.c_str(), std::strerror(cause));
+  }
+  return pair;
+}
+
+// The file's identifiers; a file without them is moved out of the way.
+std::optional<PersistentIdentifiers::Pair> PersistentIdentifiers::readFile() const {
+  SmallFile file = readSmallFile(_path, kMaximumFile);
+  if (file.error == ENOENT) return std::nullopt;
+  if (file.error == 0) {
+    if (auto pair = parse(file.bytes)) return pair;
+    VESK_LOG_WARNING("VeskReporting: %s holds no identifiers; kept as %s.bad, new ones are made",
+                     _path.c_str(), _path.c_str());
+  } else {
+    VESK_LOG_WARNING("VeskReporting: cannot read %s: %s; kept as %s.bad, new identifiers are made",
+                     _path.c_str(), std::strerror(file.error), _path.c_str());
+  }
+  keepAside();
+  return std::nullopt;
+}
+
+void PersistentIdentifiers::keepAside() const {
+  if (std::rename(_path.c_str(), (_path + ".bad").c_str()) != 0) {
+    VESK_LOG_WARNING("VeskReporting: cannot rename %s: %s", _path.c_str(), std::strerror(errno));
+  }
+}
+
+int PersistentIdentifiers::store(const Pair& pair) const {
+  std::string text = "# Identifiers of this device, one for each consent mode. Made once; delete to renew.\n";
+  text += std::string(kRespecting) + " = \"" + pair.respecting + "\"\n";
+  text += std::string(kOverriding) + " = \"" + pair.overriding + "\"\n";
+
+  // The lock's holder is alone with this name; what a crashed one left is overwritten.
+  std::string temporary = _path + ".new";
+  ::unlink(temporary.c_str());
+  FileDescriptor file(::open(temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600));
+  if (!file) return errno;
+  if (writeAll(file.get(), text) && ::fsync(file.get()) == 0 &&
+      std::rename(temporary.c_str(), _path.c_str()) == 0) {
+    return 0;
+  }
+  int cause = errno;
+  ::unlink(temporary.c_str());
+  return cause;
+}
+
+// Reads what `store` writes: comments, blank lines and `key = "identifier"`.
+std::optional<PersistentIdentifiers::Pair> PersistentIdentifiers::parse(const std::string& text) {
+  Pair pair;
+  for (std::size_t at = 0; at < text.size();) {
+    std::size_t end = std::min(text.find('\n', at), text.size());
+    std::string_view line(text.data() + at, end - at);
+    at = end + 1;
+    if (line.empty() || line.front() == '#') continue;
+    std::size_t equals = line.find(" = \"");
+    if (equals == std::string_view::npos || line.back() != '"') return std::nullopt;
+    std::string_view value = line.substr(equals + 4);
+    value.remove_suffix(value.empty() ? 0 : 1);
+    if (!isIdentifier(value)) return std::nullopt;
+    if (line.substr(0, equals) == kRespecting) pair.respecting = value;
+    if (line.substr(0, equals) == kOverriding) pair.overriding = value;
+  }
+  if (pair.respecting.empty() || pair.overriding.empty()) return std::nullopt;
+  return pair;
+}
+
+PersistentIdentifiers::Pair PersistentIdentifiers::fresh() { return {makeIdentifier(), makeIdentifier()}; }
+
+std::string VeskReporting::getPersistentIdentifierForDNU(bool respectsConsent) noexcept {
+  try {
+    // Never destroyed: another thread may still report while the process exits.
+    static auto* identifiers =
+        new PersistentIdentifiers(pathUnderRoot("/var/lib/veskreportingd/identifiers.toml"));
+    return identifiers->identifier(respectsConsent);
+  } catch (...) {
+    return {};
+  }
+}
+
+}  // namespace vesk

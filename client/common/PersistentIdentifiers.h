@@ -1,0 +1,46 @@
+// The device's stable identifiers, one per consent mode.
+#pragma once
+
+#include <VeskReporting/VeskReporting.h>
+
+#include <optional>
+#include <string>
+
+#include "platform/sync/Mutex.h"
+
+namespace vesk {
+
+/// The identifiers kept in one file. Code that reports uses `VeskReporting::getPersistentIdentifierForDNU`,
+/// which stands on the one instance for /var/lib/veskreportingd/identifiers.toml.
+///
+/// The file is made on first use: complete or not at all (rename), mode 0600, and by one process when several
+/// race (lock file beside it). One that can't be read or understood is kept aside as "<path>.bad" and new
+/// identifiers are made, with a level-4 line. Identifiers that can't be stored live as long as this object.
+/// Thread-safe.
+class PersistentIdentifiers {
+ public:
+  explicit PersistentIdentifiers(std::string path) : _path(std::move(path)) {}
+
+  /// UUID text.
+  std::string identifier(bool respectsConsent);
+
+ private:
+  struct Pair {
+    std::string respecting;
+    std::string overriding;
+  };
+
+  Pair load() const;
+  std::optional<Pair> readFile() const;
+  void keepAside() const;
+  /// 0, or the errno of what failed.
+  int store(const Pair& pair) const;
+  static std::optional<Pair> parse(const std::string& text);
+  static Pair fresh();
+
+  const std::string _path;
+  Mutex _mutex;
+  std::optional<Pair> _pair VESK_GUARDED_BY(_mutex);
+};
+
+}  // namespace vesk

@@ -1,0 +1,83 @@
+#include "client/common/Resources.h"
+
+#include <VeskReporting/VeskReporting.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <string_view>
+
+#include "client/common/SmallFile.h"
+#include "platform/files/RootPrefix.h"
+#include "platform/log/SystemLog.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::size_t kMaximumVersionFile = 4096;
+constexpr std::size_t kMaximumVersion = 64;
+constexpr std::size_t kMaximumPublicKey = std::size_t{64} << 10;
+constexpr char kDefaultVersion[] = "7.0";
+
+SmallFile readResource(const char* name, std::size_t limit) {
+  std::string path = pathUnderRoot("/usr/share/veskreporting/") + name;
+  SmallFile file = readSmallFile(path, limit);
+  if (file.error != 0 && file.error != ENOENT) {
+    VESK_LOG_WARNING("VeskReporting: cannot read %s: %s", path.c_str(), std::strerror(file.error));
+  }
+  return file;
+}
+
+std::string_view trimmed(std::string_view text) {
+  constexpr char kBlank[] = " \t\r\n";
+  auto first = text.find_first_not_of(kBlank);
+  if (first == std::string_view::npos) return {};
+  return text.substr(first, text.find_last_not_of(kBlank) - first + 1);
+}
+
+// The version goes into a URL as it stands, so it has to be one printable word.
+bool isUsableVersion(std::string_view version) {
+  return !version.empty() && version.size() <= kMaximumVersion &&
+         std::all_of(version.begin(), version.end(), [](char c) { return c > ' ' && c < 0x7f; });
+}
+
+}  // namespace
+
+std::optional<std::string> bundleVersion() {
+  SmallFile file = readResource("version", kMaximumVersionFile);
+  if (file.error != 0) return std::nullopt;
+  std::string_view text = trimmed(file.bytes);
+  std::string_view version = trimmed(text.substr(0, text.find('\n')));
+  if (!isUsableVersion(version)) {
+    VESK_LOG_WARNING("VeskReporting: the file \"version\" holds no version");
+    return std::nullopt;
+  }
+  return std::string(version);
+}
+
+std::string clientLibraryVersion() { return bundleVersion().value_or(kDefaultVersion); }
+
+std::optional<std::string> publicKeyDER() {
+  SmallFile file = readResource("publicKey.der", kMaximumPublicKey);
+  if (file.error != 0 || file.bytes.empty()) return std::nullopt;
+  return std::move(file.bytes);
+}
+
+std::string VeskReporting::version() noexcept {
+  try {
+    return clientLibraryVersion();
+  } catch (...) {
+    return kDefaultVersion;  // short enough to need no memory
+  }
+}
+
+std::optional<std::string> VeskReporting::publicKey() noexcept {
+  try {
+    return publicKeyDER();
+  } catch (...) {
+    return std::nullopt;
+  }
+}
+
+}  // namespace vesk
