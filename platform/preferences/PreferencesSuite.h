@@ -1,0 +1,40 @@
+// Read-only settings of one domain.
+#pragma once
+
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/values/Value.h"
+
+namespace vesk {
+
+/// The preferences suite of one domain: /etc/veskreporting/preferences/<suite>.toml, and over it, key by key,
+/// $XDG_CONFIG_HOME/veskreporting/preferences/<suite>.toml ($HOME/.config when that variable is unset or not
+/// absolute; a service that has neither variable reads only the first). Both stand under the root prefix.
+///
+/// The files are read when a suite is constructed and never again; whoever wants what they say now opens a
+/// suite now. A file that is missing is empty, one that is unusable is empty and costs one level-4 line. Safe
+/// to read from any thread.
+class PreferencesSuite {
+ public:
+  /// A `suite` that is no plain file name (empty, more than 128 bytes, with a "/" or a leading ".") is empty.
+  explicit PreferencesSuite(std::string_view suite);
+
+  /// What the suite holds under `key`, a top-level key of the files.
+  std::optional<Value> valueForKey(std::string_view key) const;
+
+ private:
+  Dictionary _user;
+  Dictionary _system;
+};
+
+/// A setting as text: a text unchanged, a number as decimal text (booleans are 1 and 0), nothing for any
+/// other kind.
+std::optional<std::string> stringForm(const Value& value);
+
+/// A setting as integer: a number as such, a text by its leading integer (0 when there is none), 0 for any
+/// other kind. The result holds to the range of 64 bits.
+std::int64_t integerForm(const Value& value);
+
+}  // namespace vesk

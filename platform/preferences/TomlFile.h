@@ -1,0 +1,29 @@
+// TOML documents as values.
+#pragma once
+
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/values/Value.h"
+
+namespace vesk {
+
+/// A document, or what is wrong with it (with line and column).
+struct TomlOutcome {
+  std::optional<Dictionary> document;
+  std::string error;
+};
+
+/// Reads a TOML document of at most 1 MiB. Strings, integers, floats, booleans, arrays and tables become the
+/// values of those kinds. A date, or a date with time, becomes a date, taken as UTC when it names no offset;
+/// a time of day alone becomes its text. Arrays and inline tables may nest 32 deep, and a line may hold 256
+/// dots: what reads this may stand on a small stack.
+TomlOutcome parseToml(std::string_view text);
+
+/// The document of the file at `path` (no root prefix is added). A file that is not there is an empty
+/// document without a word; one that can't be read or is no TOML costs one level-4 line that names it, and is
+/// an empty document too.
+Dictionary readTomlFile(const std::string& path);
+
+}  // namespace vesk

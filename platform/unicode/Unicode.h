@@ -1,0 +1,23 @@
+// Caseless text, by the Unicode mappings of the root locale.
+#pragma once
+
+#include <string>
+#include <string_view>
+
+namespace vesk {
+
+/// Full lower-case mapping (one character may become several). Bytes that are no UTF-8 become U+FFFD.
+std::string lowercase(std::string_view text);
+
+/// Equal by full case folding ("STRASSE" equals "straße"). Texts that differ in their ASCII part are told
+/// apart without a look at the rest, so that this may be called for every key of every event.
+bool equalsIgnoringCase(std::string_view a, std::string_view b);
+
+/// `needle` occurs in `text`, both case-folded. An empty needle never occurs.
+bool containsIgnoringCase(std::string_view text, std::string_view needle);
+
+/// Well-formed UTF-8: no overlong forms, no surrogates, nothing above U+10FFFF. A NUL is well-formed, and
+/// refused when `allowNUL` is false.
+bool isValidUTF8(std::string_view text, bool allowNUL = true) noexcept;
+
+}  // namespace vesk
