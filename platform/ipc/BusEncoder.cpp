@@ -1,0 +1,180 @@
+#include <systemd/sd-bus.h>
+
+#include <cerrno>
+#include <cstring>
+
+#include "platform/ipc/BusCodec.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::size_t kNodeContent = 8;
+
+/// sd-bus does not look at the texts that it sends; the receiver would refuse the whole message.
+bool isSendable(std::string_view text) noexcept {
+  const auto* at = reinterpret_cast<const unsigned char*>(text.data());
+  const auto* end = at + text.size();
+  while (at < end) {
+    unsigned char lead = *at++;
+    if (lead == 0) return false;
+    if (lead < 0x80) continue;
+    int more = lead >= 0xF0 ? 3 : lead >= 0xE0 ? 2 : 1;
+    if (lead < 0xC2 || lead > 0xF4 || end - at < more) return false;
+    // Overlong forms, surrogates and what lies above U+10FFFF show in the second byte.
+    unsigned char low = lead == 0xE0 ? 0xA0 : lead == 0xF0 ? 0x90 : 0x80;
+    unsigned char high = lead == 0xED ? 0x9F : lead == 0xF4 ? 0x8F : 0xBF;
+    if (*at < low || *at > high) return false;
+    for (int i = 1; i < more; ++i) {
+      if ((at[i] & 0xC0) != 0x80) return false;
+    }
+    at += more;
+  }
+  return true;
+}
+
+}  // namespace
+
+bool BusEncoder::fail(CodecResult result) noexcept {
+  if (ok()) _result = result;
+  return false;
+}
+
+// The calls below name their types themselves, so what sd-bus refuses is what it has no room for: memory, or
+// a container too many.
+bool BusEncoder::failWith(int) noexcept { return fail(CodecResult::LimitExceeded); }
+
+bool BusEncoder::count(std::size_t content) {
+  if (!ok()) return false;
+  _content += content;
+  if (++_nodes > _limits.nodes || _content > _limits.content) return fail(CodecResult::LimitExceeded);
+  return true;
+}
+
+bool BusEncoder::open(char type, const char* contents) {
+  if (!ok()) return false;
+  int r = sd_bus_message_open_container(_message, type, contents);
+  return r >= 0 || failWith(r);
+}
+
+bool BusEncoder::close() {
+  if (!ok()) return false;
+  int r = sd_bus_message_close_container(_message);
+  return r >= 0 || failWith(r);
+}
+
+bool BusEncoder::basic(char type, const void* value) {
+  if (!ok()) return false;
+  int r = sd_bus_message_append_basic(_message, type, value);
+  return r >= 0 || failWith(r);
+}
+
+bool BusEncoder::variant(const char* contents, char type, const void* value) {
+  return open(SD_BUS_TYPE_VARIANT, contents) && basic(type, value) && close();
+}
+
+bool BusEncoder::append(const IPCArgument& argument) {
+  return std::visit([this](const auto& value) { return append(value); }, argument);
+}
+
+bool BusEncoder::append(bool value) {
+  int number = value ? 1 : 0;
+  return basic(SD_BUS_TYPE_BOOLEAN, &number);
+}
+
+bool BusEncoder::append(std::uint16_t value) { return basic(SD_BUS_TYPE_UINT16, &value); }
+
+bool BusEncoder::append(double value) { return basic(SD_BUS_TYPE_DOUBLE, &value); }
+
+bool BusEncoder::append(std::string_view value) {
+  if (!count(value.size())) return false;
+  if (!isSendable(value)) return fail(CodecResult::Malformed);
+  char* space = nullptr;
+  int r = sd_bus_message_append_string_space(_message, value.size(), &space);
+  if (r < 0) return failWith(r);
+  if (!value.empty()) std::memcpy(space, value.data(), value.size());
+  return true;
+}
+
+bool BusEncoder::append(const Dictionary& value) {
+  if (!count(kNodeContent) || !open(SD_BUS_TYPE_ARRAY, "{sv}")) return false;
+  if (++_depth > _limits.depth) return fail(CodecResult::LimitExceeded);
+  for (const auto& entry : value) {
+    if (!open(SD_BUS_TYPE_DICT_ENTRY, "sv") || !append(entry.key.view()) || !append(entry.value) ||
+        !close()) {
+      return false;
+    }
+  }
+  --_depth;
+  return close();
+}
+
+bool BusEncoder::append(const List& value) {
+  if (!count(kNodeContent) || !open(SD_BUS_TYPE_ARRAY, "v")) return false;
+  if (++_depth > _limits.depth) return fail(CodecResult::LimitExceeded);
+  for (const auto& item : value) {
+    if (!append(item)) return false;
+  }
+  --_depth;
+  return close();
+}
+
+template <class T>
+bool BusEncoder::optional(const std::optional<T>& value, const char* contents) {
+  return open(SD_BUS_TYPE_ARRAY, contents) && (!value || append(*value)) && close();
+}
+
+bool BusEncoder::append(const std::optional<Dictionary>& value) { return optional(value, "a{sv}"); }
+
+bool BusEncoder::append(const std::optional<std::string>& value) { return optional(value, "s"); }
+
+bool BusEncoder::append(const std::optional<std::vector<std::string>>& value) {
+  return optional(value, "as");
+}
+
+bool BusEncoder::append(const std::vector<std::string>& value) {
+  if (!open(SD_BUS_TYPE_ARRAY, "s")) return false;
+  for (const auto& text : value) {
+    if (!append(std::string_view(text))) return false;
+  }
+  return close();
+}
+
+bool BusEncoder::appendDescriptor(int descriptor) {
+  return open(SD_BUS_TYPE_ARRAY, "h") && (descriptor < 0 || basic(SD_BUS_TYPE_UNIX_FD, &descriptor)) &&
+         close();
+}
+
+bool BusEncoder::append(const Value& value) {
+  if (!count(kNodeContent)) return false;
+  switch (value.kind()) {
+    case Value::Kind::None:
+      return variant("g", SD_BUS_TYPE_SIGNATURE, "");
+    case Value::Kind::Boolean:
+      return open(SD_BUS_TYPE_VARIANT, "b") && append(*value.boolean()) && close();
+    case Value::Kind::Signed:
+      return variant("x", SD_BUS_TYPE_INT64, value.signedInteger());
+    case Value::Kind::Unsigned:
+      return variant("t", SD_BUS_TYPE_UINT64, value.unsignedInteger());
+    case Value::Kind::Double:
+      return variant("d", SD_BUS_TYPE_DOUBLE, value.real());
+    case Value::Kind::Text:
+      return open(SD_BUS_TYPE_VARIANT, "s") && append(value.text()->view()) && close();
+    case Value::Kind::Bytes: {
+      auto bytes = value.bytes()->view();
+      if (!count(bytes.size()) || !open(SD_BUS_TYPE_VARIANT, "ay")) return false;
+      int r = sd_bus_message_append_array(_message, SD_BUS_TYPE_BYTE, bytes.data(), bytes.size());
+      return r < 0 ? failWith(r) : close();
+    }
+    case Value::Kind::Date:
+      return open(SD_BUS_TYPE_VARIANT, "(d)") && open(SD_BUS_TYPE_STRUCT, "d") &&
+             append(value.date()->secondsSince1970) && close() && close();
+    case Value::Kind::List:
+      return open(SD_BUS_TYPE_VARIANT, "av") && append(*value.list()) && close();
+    case Value::Kind::Dictionary:
+      return open(SD_BUS_TYPE_VARIANT, "a{sv}") && append(*value.dictionary()) && close();
+  }
+  return fail(CodecResult::WrongType);
+}
+
+}  // namespace vesk
