@@ -14,9 +14,9 @@
 #include <string_view>
 #include <system_error>
 
-#include "client/common/SmallFile.h"
 #include "platform/files/FileDescriptor.h"
 #include "platform/files/RootPrefix.h"
+#include "platform/files/SmallFile.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
@@ -83,7 +83,10 @@ std::string PersistentIdentifiers::identifier(bool respectsConsent) {
 }
 
 PersistentIdentifiers::Pair PersistentIdentifiers::load() const {
-  if (auto known = parse(readSmallFile(_path, kMaximumFile).bytes)) return *known;
+  // The usual case takes no lock: the file is complete or not there.
+  if (SmallFile file = readSmallFile(_path, kMaximumFile); file.bytes) {
+    if (auto known = parse(*file.bytes)) return *known;
+  }
   std::error_code ignored;
   std::filesystem::create_directories(std::filesystem::path(_path).parent_path(), ignored);
   FileDescriptor lock = lockFile(_path + ".lock");
@@ -103,14 +106,14 @@ PersistentIdentifiers::Pair PersistentIdentifiers::load() const {
 // The file's identifiers; a file without them is moved out of the way.
 std::optional<PersistentIdentifiers::Pair> PersistentIdentifiers::readFile() const {
   SmallFile file = readSmallFile(_path, kMaximumFile);
-  if (file.error == ENOENT) return std::nullopt;
-  if (file.error == 0) {
-    if (auto pair = parse(file.bytes)) return pair;
+  if (file.missing) return std::nullopt;
+  if (file.bytes) {
+    if (auto pair = parse(*file.bytes)) return pair;
     VESK_LOG_WARNING("VeskReporting: %s holds no identifiers; kept as %s.bad, new ones are made",
                      _path.c_str(), _path.c_str());
   } else {
     VESK_LOG_WARNING("VeskReporting: cannot read %s: %s; kept as %s.bad, new identifiers are made",
-                     _path.c_str(), std::strerror(file.error), _path.c_str());
+                     _path.c_str(), file.error.c_str(), _path.c_str());
   }
   keepAside();
   return std::nullopt;

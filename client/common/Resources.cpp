@@ -3,12 +3,10 @@
 #include <VeskReporting/VeskReporting.h>
 
 #include <algorithm>
-#include <cerrno>
-#include <cstring>
 #include <string_view>
 
-#include "client/common/SmallFile.h"
 #include "platform/files/RootPrefix.h"
+#include "platform/files/SmallFile.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
@@ -20,13 +18,13 @@ constexpr std::size_t kMaximumVersion = 64;
 constexpr std::size_t kMaximumPublicKey = std::size_t{64} << 10;
 constexpr char kDefaultVersion[] = "7.0";
 
-SmallFile readResource(const char* name, std::size_t limit) {
+std::optional<std::string> readResource(const char* name, std::size_t limit) {
   std::string path = pathUnderRoot("/usr/share/veskreporting/") + name;
   SmallFile file = readSmallFile(path, limit);
-  if (file.error != 0 && file.error != ENOENT) {
-    VESK_LOG_WARNING("VeskReporting: cannot read %s: %s", path.c_str(), std::strerror(file.error));
+  if (!file.bytes && !file.missing) {
+    VESK_LOG_WARNING("VeskReporting: cannot read %s: %s", path.c_str(), file.error.c_str());
   }
-  return file;
+  return std::move(file.bytes);
 }
 
 std::string_view trimmed(std::string_view text) {
@@ -45,9 +43,9 @@ bool isUsableVersion(std::string_view version) {
 }  // namespace
 
 std::optional<std::string> bundleVersion() {
-  SmallFile file = readResource("version", kMaximumVersionFile);
-  if (file.error != 0) return std::nullopt;
-  std::string_view text = trimmed(file.bytes);
+  auto file = readResource("version", kMaximumVersionFile);
+  if (!file) return std::nullopt;
+  std::string_view text = trimmed(*file);
   std::string_view version = trimmed(text.substr(0, text.find('\n')));
   if (!isUsableVersion(version)) {
     VESK_LOG_WARNING("VeskReporting: the file \"version\" holds no version");
@@ -59,9 +57,9 @@ std::optional<std::string> bundleVersion() {
 std::string clientLibraryVersion() { return bundleVersion().value_or(kDefaultVersion); }
 
 std::optional<std::string> publicKeyDER() {
-  SmallFile file = readResource("publicKey.der", kMaximumPublicKey);
-  if (file.error != 0 || file.bytes.empty()) return std::nullopt;
-  return std::move(file.bytes);
+  auto key = readResource("publicKey.der", kMaximumPublicKey);
+  if (key && key->empty()) return std::nullopt;
+  return key;
 }
 
 std::string VeskReporting::version() noexcept {
