@@ -7,12 +7,14 @@
 #include <string>
 #include <string_view>
 
+#include "Export.h"
+
 namespace vesk {
 
 /// A piece of text that shares its bytes with its copies. Copying costs a reference count, or nothing at all
 /// for a literal. The bytes never change, so any thread may read any copy. They are valid UTF-8 wherever the
 /// text came through one of the decoders (wire, property list, TOML); the class itself does not check.
-class Text {
+class VESK_API Text {
  public:
   Text() noexcept = default;
 
@@ -49,7 +51,7 @@ class Text {
 
 /// Makes many texts out of few allocations: a decoder adds the texts of one message to one arena. A chunk
 /// lives as long as any text in it. Not thread-safe; the texts are.
-class TextArena {
+class VESK_API TextArena {
  public:
   /// `chunkSize`: bytes per allocation; a text longer than a quarter of it gets an allocation of its own.
   explicit TextArena(std::size_t chunkSize = 1024) noexcept : _chunkSize(chunkSize) {}

@@ -18,6 +18,15 @@ const Value* findIn(const std::vector<DictionaryEntry>& entries, std::string_vie
   return nullptr;
 }
 
+bool areUnique(const std::vector<DictionaryEntry>& entries) noexcept {
+  for (auto entry = entries.begin(); entry != entries.end(); ++entry) {
+    for (auto earlier = entries.begin(); earlier != entry; ++earlier) {
+      if (earlier->key == entry->key) return false;
+    }
+  }
+  return true;
+}
+
 }  // namespace
 
 // --- List
@@ -128,6 +137,7 @@ Dictionary MutableDictionary::share() {
 }
 
 Dictionary MutableDictionary::shareUnique() {
+  if (_entries.size() <= kLinearScanLimit && areUnique(_entries)) return share();
   std::vector<DictionaryEntry> unique;
   unique.reserve(_entries.size());
   if (_entries.size() <= kLinearScanLimit) {
@@ -226,25 +236,29 @@ std::optional<bool> booleanForKey(const Dictionary& dictionary, std::string_view
 
 namespace {
 
-std::size_t approximateMemory(const Value& value) noexcept {
+std::size_t memoryOf(const Value& value) noexcept {
   if (const Text* text = value.text()) return text->size();
   if (const Bytes* bytes = value.bytes()) return bytes->size();
   std::size_t size = 0;
   if (const List* list = value.list()) {
-    for (const Value& item : *list) size += sizeof(Value) + approximateMemory(item);
+    for (const Value& item : *list) size += sizeof(Value) + memoryOf(item);
   } else if (const Dictionary* dictionary = value.dictionary()) {
-    for (const auto& entry : *dictionary) {
-      size += sizeof(DictionaryEntry) + entry.key.size() + approximateMemory(entry.value);
-    }
+    size = approximateMemory(*dictionary);
   }
   return size;
 }
 
 }  // namespace
 
+std::size_t approximateMemory(const Dictionary& dictionary) noexcept {
+  std::size_t size = dictionary.size() * sizeof(DictionaryEntry);
+  for (const auto& entry : dictionary) size += entry.key.size() + memoryOf(entry.value);
+  return size;
+}
+
 std::size_t approximateMemory(const MutableDictionary& dictionary) noexcept {
   std::size_t size = dictionary.entries().capacity() * sizeof(DictionaryEntry);
-  for (const auto& entry : dictionary.entries()) size += entry.key.size() + approximateMemory(entry.value);
+  for (const auto& entry : dictionary.entries()) size += entry.key.size() + memoryOf(entry.value);
   return size;
 }
 

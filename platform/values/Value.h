@@ -11,6 +11,7 @@
 #include <variant>
 #include <vector>
 
+#include "Export.h"
 #include "Text.h"
 
 namespace vesk {
@@ -39,7 +40,7 @@ class Bytes {
 };
 
 /// Immutable sequence of values; copies share it.
-class List {
+class VESK_API List {
  public:
   List() noexcept = default;
   explicit List(std::vector<Value> values);
@@ -50,7 +51,7 @@ class List {
   const Value& operator[](std::size_t index) const noexcept;
   const Value* begin() const noexcept;
   const Value* end() const noexcept;
-  friend bool operator==(const List& a, const List& b) noexcept;
+  friend VESK_API bool operator==(const List& a, const List& b) noexcept;
 
  private:
   std::shared_ptr<const std::vector<Value>> _values;
@@ -60,7 +61,7 @@ class List {
 /// count, so this is what "a copy of the dictionary" means throughout the project. Looking a key up is a
 /// linear scan up to 32 entries, which is faster than hashing for the sizes that messages have, and indexed
 /// above.
-class Dictionary {
+class VESK_API Dictionary {
  public:
   Dictionary() noexcept = default;
   Dictionary(std::initializer_list<DictionaryEntry> entries);
@@ -79,7 +80,7 @@ class Dictionary {
   std::optional<Dictionary> dictionary(std::string_view key) const;
   std::optional<List> list(std::string_view key) const;
 
-  friend bool operator==(const Dictionary& a, const Dictionary& b) noexcept;
+  friend VESK_API bool operator==(const Dictionary& a, const Dictionary& b) noexcept;
 
  private:
   friend class MutableDictionary;
@@ -89,7 +90,7 @@ class Dictionary {
 };
 
 /// One value of any kind. A default-constructed value is the null marker.
-class Value {
+class VESK_API Value {
  public:
   /// In the order of the alternatives below.
   enum class Kind : std::uint8_t {
@@ -166,7 +167,7 @@ struct DictionaryEntry {
 };
 
 /// A dictionary under construction, owned by one thread.
-class MutableDictionary {
+class VESK_API MutableDictionary {
  public:
   MutableDictionary() noexcept = default;
   /// Starts as a copy of `source`, with room for `extra` more entries.
@@ -201,15 +202,17 @@ class MutableDictionary {
 };
 
 /// What a dictionary holds under a key, read as a number; what is absent or no number gives nothing.
-std::optional<std::int64_t> integerForKey(const Dictionary& dictionary, std::string_view key) noexcept;
-std::optional<double> doubleForKey(const Dictionary& dictionary, std::string_view key) noexcept;
-std::optional<bool> booleanForKey(const Dictionary& dictionary, std::string_view key) noexcept;
+VESK_API std::optional<std::int64_t> integerForKey(const Dictionary& dictionary,
+                                                   std::string_view key) noexcept;
+VESK_API std::optional<double> doubleForKey(const Dictionary& dictionary, std::string_view key) noexcept;
+VESK_API std::optional<bool> booleanForKey(const Dictionary& dictionary, std::string_view key) noexcept;
 
 /// One line that shows a value to a person, cut at about `limit` bytes (log lines, tools).
-std::string describe(const Value& value, std::size_t limit = 1024);
+VESK_API std::string describe(const Value& value, std::size_t limit = 1024);
 
 /// Memory that a dictionary holds, roughly, in bytes: its entries and texts. Texts shared with other
 /// dictionaries count in full.
-std::size_t approximateMemory(const MutableDictionary& dictionary) noexcept;
+VESK_API std::size_t approximateMemory(const Dictionary& dictionary) noexcept;
+VESK_API std::size_t approximateMemory(const MutableDictionary& dictionary) noexcept;
 
 }  // namespace vesk
