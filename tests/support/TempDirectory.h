@@ -1,0 +1,47 @@
+// A directory that goes away with the test.
+#pragma once
+
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <stdexcept>
+#include <string>
+#include <string_view>
+
+namespace vesk::test {
+
+class TempDirectory {
+ public:
+  TempDirectory() {
+    std::string pattern = (std::filesystem::temp_directory_path() / "vesk-test-XXXXXX").string();
+    if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no directory " + pattern);
+    _path = pattern;
+  }
+  ~TempDirectory() {
+    std::error_code ignored;
+    std::filesystem::remove_all(_path, ignored);
+  }
+  TempDirectory(const TempDirectory&) = delete;
+  TempDirectory& operator=(const TempDirectory&) = delete;
+
+  const std::filesystem::path& path() const { return _path; }
+  std::filesystem::path operator/(std::string_view name) const { return _path / name; }
+
+  /// Writes a file (and the directories above it) and returns its path.
+  std::filesystem::path write(std::string_view name, std::string_view contents) const {
+    auto file = _path / name;
+    std::filesystem::create_directories(file.parent_path());
+    std::ofstream(file, std::ios::binary) << contents;
+    return file;
+  }
+  /// The contents of a file, "" when there is none.
+  std::string read(std::string_view name) const {
+    std::ifstream in(_path / name, std::ios::binary);
+    return {std::istreambuf_iterator<char>(in), {}};
+  }
+
+ private:
+  std::filesystem::path _path;
+};
+
+}  // namespace vesk::test

@@ -1,0 +1,47 @@
+// HTTP requests for tests, made with a client that is none of the project's own.
+#pragma once
+
+#include <curl/curl.h>
+
+#include <map>
+#include <memory>
+#include <string>
+#include <vector>
+
+namespace vesk::test {
+
+struct WebAnswer {
+  CURLcode outcome = CURLE_OK;
+  long status = 0;
+  std::string body;
+  std::map<std::string, std::string> headers;  ///< names in lower case
+};
+
+/// A client that keeps its connection alive between requests, as curl does.
+class WebClient {
+ public:
+  /// `authorityFile`: PEM file to verify HTTPS servers against; empty: the system's.
+  explicit WebClient(std::string authorityFile = {})
+      : _authorityFile(std::move(authorityFile)), _curl(curl_easy_init()) {}
+
+  WebAnswer get(const std::string& url, const std::vector<std::string>& headers = {}) {
+    return perform("GET", url, headers, nullptr);
+  }
+  WebAnswer post(const std::string& url, const std::string& body,
+                 const std::vector<std::string>& headers = {}) {
+    return perform("POST", url, headers, &body);
+  }
+  /// `body` may be null.
+  WebAnswer perform(const std::string& method, const std::string& url,
+                    const std::vector<std::string>& headers, const std::string* body,
+                    long timeoutMilliseconds = 10'000);
+
+ private:
+  struct Cleanup {
+    void operator()(CURL* curl) const { curl_easy_cleanup(curl); }
+  };
+  const std::string _authorityFile;
+  std::unique_ptr<CURL, Cleanup> _curl;
+};
+
+}  // namespace vesk::test

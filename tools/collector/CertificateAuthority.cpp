@@ -1,0 +1,184 @@
+#include "tools/collector/CertificateAuthority.h"
+
+#include <arpa/inet.h>
+#include <openssl/bio.h>
+#include <openssl/err.h>
+#include <openssl/evp.h>
+#include <openssl/pem.h>
+#include <openssl/rand.h>
+#include <openssl/x509v3.h>
+
+#include <memory>
+#include <stdexcept>
+
+#include "tools/files/WholeFile.h"
+
+namespace vesk {
+
+namespace {
+
+template <auto free>
+struct Freeing {
+  template <class T>
+  void operator()(T* object) const {
+    free(object);
+  }
+};
+using Key = std::unique_ptr<EVP_PKEY, Freeing<&EVP_PKEY_free>>;
+using Certificate = std::unique_ptr<X509, Freeing<&X509_free>>;
+using Memory = std::unique_ptr<BIO, Freeing<&BIO_free_all>>;
+using Extension = std::unique_ptr<X509_EXTENSION, Freeing<&X509_EXTENSION_free>>;
+
+constexpr long kSecondsPerDay = 24L * 60 * 60;
+constexpr long kAuthorityDays = 3650;
+constexpr long kServerDays = 365;
+
+[[noreturn]] void fail(const std::string& step) {
+  char reason[160] = "unknown cause";
+  if (unsigned long code = ERR_get_error(); code != 0) ERR_error_string_n(code, reason, sizeof reason);
+  ERR_clear_error();
+  throw std::runtime_error("can't " + step + ": " + reason);
+}
+
+template <class Pointer>
+Pointer checked(Pointer pointer, const char* step) {
+  if (!pointer) fail(step);
+  return pointer;
+}
+
+void require(bool done, const char* step) {
+  if (!done) fail(step);
+}
+
+Key makeKey() { return checked(Key(EVP_EC_gen("P-256")), "make an EC key"); }
+
+template <class Write>
+std::string toPEM(Write write) {
+  Memory memory = checked(Memory(BIO_new(BIO_s_mem())), "allocate memory");
+  require(write(memory.get()) == 1, "write PEM");
+  char* data = nullptr;
+  long size = BIO_get_mem_data(memory.get(), &data);
+  return std::string(data, static_cast<std::size_t>(size));
+}
+
+std::string toPEM(X509* certificate) {
+  return toPEM([&](BIO* out) { return PEM_write_bio_X509(out, certificate); });
+}
+
+std::string toPEM(EVP_PKEY* key) {
+  return toPEM(
+      [&](BIO* out) { return PEM_write_bio_PrivateKey(out, key, nullptr, nullptr, 0, nullptr, nullptr); });
+}
+
+Certificate certificateFromPEM(const std::string& text) {
+  Memory memory(BIO_new_mem_buf(text.data(), static_cast<int>(text.size())));
+  return Certificate(PEM_read_bio_X509(memory.get(), nullptr, nullptr, nullptr));
+}
+
+Key keyFromPEM(const std::string& text) {
+  Memory memory(BIO_new_mem_buf(text.data(), static_cast<int>(text.size())));
+  return Key(PEM_read_bio_PrivateKey(memory.get(), nullptr, nullptr, nullptr));
+}
+
+void setSerial(X509* certificate) {
+  unsigned char bytes[16];
+  require(RAND_bytes(bytes, sizeof bytes) == 1, "draw a serial number");
+  bytes[0] &= 0x7f;  // serial numbers are positive
+  std::unique_ptr<BIGNUM, Freeing<&BN_free>> number(BN_bin2bn(bytes, sizeof bytes, nullptr));
+  require(BN_to_ASN1_INTEGER(number.get(), X509_get_serialNumber(certificate)) != nullptr,
+          "set a serial number");
+}
+
+/// A certificate for `key` with everything but issuer, extensions and signature. It starts an hour ago, for
+/// clients whose clock is a little behind.
+Certificate startCertificate(EVP_PKEY* key, const char* commonName, long days) {
+  Certificate certificate = checked(Certificate(X509_new()), "allocate a certificate");
+  X509_set_version(certificate.get(), X509_VERSION_3);
+  setSerial(certificate.get());
+  X509_gmtime_adj(X509_getm_notBefore(certificate.get()), -60L * 60);
+  X509_gmtime_adj(X509_getm_notAfter(certificate.get()), days * kSecondsPerDay);
+  X509_NAME* name = X509_get_subject_name(certificate.get());
+  const auto* text = reinterpret_cast<const unsigned char*>(commonName);
+  require(X509_NAME_add_entry_by_txt(name, "CN", MBSTRING_UTF8, text, -1, -1, 0) == 1, "name a certificate");
+  require(X509_set_pubkey(certificate.get(), key) == 1, "set a certificate's key");
+  return certificate;
+}
+
+void extend(X509* certificate, X509* issuer, int kind, const std::string& value) {
+  X509V3_CTX context;
+  X509V3_set_ctx(&context, issuer, certificate, nullptr, nullptr, 0);
+  Extension extension(X509V3_EXT_conf_nid(nullptr, &context, kind, value.c_str()));
+  require(extension && X509_add_ext(certificate, extension.get(), -1) == 1, "extend a certificate");
+}
+
+void sign(X509* certificate, X509* issuer, EVP_PKEY* key) {
+  require(X509_set_issuer_name(certificate, X509_get_subject_name(issuer)) == 1, "name an issuer");
+  require(X509_sign(certificate, key, EVP_sha256()) > 0, "sign a certificate");
+}
+
+bool isAddress(const std::string& name) {
+  unsigned char bytes[sizeof(in6_addr)];
+  return ::inet_pton(AF_INET, name.c_str(), bytes) == 1 || ::inet_pton(AF_INET6, name.c_str(), bytes) == 1;
+}
+
+std::string alternativeNames(const std::vector<std::string>& furtherNames) {
+  std::string names = "DNS:localhost,IP:127.0.0.1,IP:::1";
+  for (const auto& name : furtherNames) {
+    if (name.empty() || name.find_first_of(",\r\n ") != std::string::npos)
+      throw std::runtime_error("no certificate can be made for the name '" + name + "'");
+    names += (isAddress(name) ? ",IP:" : ",DNS:") + name;
+  }
+  return names;
+}
+
+}  // namespace
+
+CertificateAuthority CertificateAuthority::generate() {
+  Key key = makeKey();
+  Certificate certificate =
+      startCertificate(key.get(), "veskcollector development authority", kAuthorityDays);
+  X509* self = certificate.get();
+  extend(self, self, NID_basic_constraints, "critical,CA:TRUE,pathlen:0");
+  extend(self, self, NID_key_usage, "critical,keyCertSign,cRLSign");
+  extend(self, self, NID_subject_key_identifier, "hash");
+  sign(self, self, key.get());
+  return CertificateAuthority(toPEM(self), toPEM(key.get()));
+}
+
+CertificateAuthority CertificateAuthority::openOrCreate(const std::filesystem::path& directory) {
+  auto certificatePath = certificateFile(directory);
+  auto keyPath = keyFile(directory);
+  if (!std::filesystem::exists(certificatePath) && !std::filesystem::exists(keyPath)) {
+    CertificateAuthority fresh = generate();
+    writeWholeFile(keyPath, fresh._key, 0600);
+    writeWholeFile(certificatePath, fresh._certificate, 0644);
+    return fresh;
+  }
+  CertificateAuthority kept(readWholeFile(certificatePath), readWholeFile(keyPath));
+  Certificate certificate = certificateFromPEM(kept._certificate);
+  Key key = keyFromPEM(kept._key);
+  if (!certificate) fail("use the certificate in " + certificatePath.string());
+  if (!key) fail("use the key in " + keyPath.string());
+  if (X509_check_private_key(certificate.get(), key.get()) != 1)
+    throw std::runtime_error(keyPath.string() + " is not the key of " + certificatePath.string());
+  if (X509_cmp_current_time(X509_get0_notAfter(certificate.get())) <= 0)
+    throw std::runtime_error(certificatePath.string() + " has expired: remove it and " + keyPath.string());
+  return kept;
+}
+
+TLSIdentity CertificateAuthority::issueServerIdentity(const std::vector<std::string>& furtherNames) const {
+  Certificate authority = checked(certificateFromPEM(_certificate), "read the authority's certificate");
+  Key authorityKey = checked(keyFromPEM(_key), "read the authority's key");
+  Key key = makeKey();
+  Certificate certificate = startCertificate(key.get(), "localhost", kServerDays);
+  X509* leaf = certificate.get();
+  extend(leaf, authority.get(), NID_basic_constraints, "critical,CA:FALSE");
+  extend(leaf, authority.get(), NID_key_usage, "critical,digitalSignature");
+  extend(leaf, authority.get(), NID_ext_key_usage, "serverAuth");
+  extend(leaf, authority.get(), NID_subject_alt_name, alternativeNames(furtherNames));
+  extend(leaf, authority.get(), NID_authority_key_identifier, "keyid:always");
+  sign(leaf, authority.get(), authorityKey.get());
+  return {toPEM(leaf), toPEM(key.get())};
+}
+
+}  // namespace vesk

@@ -1,0 +1,191 @@
+#include "tools/collector/HTTPServer.h"
+
+#include <atomic>
+#include <boost/asio/io_context.hpp>
+#include <boost/asio/post.hpp>
+#include <boost/asio/steady_timer.hpp>
+#include <stdexcept>
+#include <thread>
+#include <unordered_set>
+
+#include "tools/collector/HTTPConnection.h"
+
+namespace vesk {
+
+namespace asio = boost::asio;
+using asio::ip::tcp;
+using ErrorCode = boost::system::error_code;
+
+namespace {
+
+std::unique_ptr<asio::ssl::context> makeContext(const TLSIdentity& identity) {
+  auto context = std::make_unique<asio::ssl::context>(asio::ssl::context::tls_server);
+  try {
+    context->set_options(asio::ssl::context::default_workarounds | asio::ssl::context::no_sslv3 |
+                         asio::ssl::context::no_tlsv1 | asio::ssl::context::no_tlsv1_1);
+    context->use_certificate_chain(asio::buffer(identity.certificateChain));
+    context->use_private_key(asio::buffer(identity.privateKey), asio::ssl::context::pem);
+  } catch (const std::exception& error) {
+    throw std::runtime_error(std::string("the TLS identity can't be used: ") + error.what());
+  }
+  return context;
+}
+
+}  // namespace
+
+class HTTPServer::Core : public HTTPConnection::Owner {
+ public:
+  Core(Options options, Handler handler)
+      : _options(std::move(options)),
+        _handler(std::move(handler)),
+        _tls(_options.tls ? makeContext(*_options.tls) : nullptr),
+        _acceptor(_context),
+        _again(_context) {
+    listen();
+    accept();
+    _thread = std::thread([this] { run(); });
+  }
+
+  ~Core() override { stop(); }
+
+  void stop() {
+    if (!_thread.joinable()) return;
+    asio::post(_context, [this] { closeAll(); });
+    _thread.join();
+  }
+
+  void releaseHeld() {
+    asio::post(_context, [this] {
+      for (const auto& connection : std::unordered_set(_connections)) connection->release();
+    });
+  }
+
+  const Options& options() const { return _options; }
+  std::uint16_t port() const { return _port; }
+  std::size_t accepted() const { return _accepted; }
+  std::size_t open() const { return _open; }
+
+  HTTPAnswer answerTo(const HTTPReceived& received) noexcept override {
+    try {
+      return _handler(received);
+    } catch (const std::exception& error) {
+      return HTTPAnswer::text(500, std::string("handler failed: ") + error.what());
+    }
+  }
+
+  void connectionRefused(const std::string& line) noexcept override {
+    try {
+      if (_options.onRefused) _options.onRefused(line);
+    } catch (const std::exception&) {
+      // Nobody is left to be told.
+    }
+  }
+
+  void connectionEnded(const std::shared_ptr<HTTPConnection>& connection) noexcept override {
+    _connections.erase(connection);
+    _open = _connections.size();
+  }
+
+ private:
+  void run() {
+    while (true) {
+      try {
+        _context.run();
+        return;
+      } catch (const std::exception& error) {
+        connectionRefused(std::string("a connection failed: ") + error.what());
+      }
+    }
+  }
+
+  void listen() {
+    try {
+      tcp::endpoint endpoint(asio::ip::make_address(_options.address), _options.port);
+      _acceptor.open(endpoint.protocol());
+      _acceptor.set_option(tcp::acceptor::reuse_address(true));
+      _acceptor.bind(endpoint);
+      _acceptor.listen();
+      _port = _acceptor.local_endpoint().port();
+    } catch (const std::exception& error) {
+      throw std::runtime_error("can't listen on " + _options.address + " port " +
+                               std::to_string(_options.port) + ": " + error.what());
+    }
+  }
+
+  void accept() {
+    _acceptor.async_accept([this](ErrorCode error, tcp::socket socket) {
+      if (error == asio::error::operation_aborted || !_acceptor.is_open()) return;
+      if (error) return acceptLater();
+      begin(std::move(socket));
+      accept();
+    });
+  }
+
+  /// Out of descriptors, most likely: the listening socket stays readable, so asking again at once would
+  /// spin.
+  void acceptLater() {
+    _again.expires_after(std::chrono::milliseconds(100));
+    _again.async_wait([this](ErrorCode error) {
+      if (!error && _acceptor.is_open()) accept();
+    });
+  }
+
+  void begin(tcp::socket socket) {
+    ++_accepted;
+    if (_connections.size() >= _options.maximumConnections)
+      return connectionRefused("a connection over the limit of " +
+                               std::to_string(_options.maximumConnections));
+    ErrorCode ignored;
+    socket.set_option(tcp::no_delay(true), ignored);
+    auto connection =
+        HTTPConnection::make(std::move(socket), {_accepted, _options.maximumBody, _tls.get()}, *this);
+    _connections.insert(connection);
+    _open = _connections.size();
+    connection->start();
+  }
+
+  void closeAll() {
+    ErrorCode ignored;
+    _acceptor.close(ignored);
+    _again.cancel();
+    for (const auto& connection : std::unordered_set(_connections)) connection->close();
+  }
+
+  const Options _options;
+  const Handler _handler;
+  const std::unique_ptr<asio::ssl::context> _tls;
+  std::uint16_t _port = 0;
+
+  std::atomic<std::size_t> _accepted = 0;
+  std::atomic<std::size_t> _open = 0;
+
+  // Only on `_thread`, once it runs.
+  asio::io_context _context{1};
+  tcp::acceptor _acceptor;
+  asio::steady_timer _again;
+  std::unordered_set<std::shared_ptr<HTTPConnection>> _connections;
+
+  std::thread _thread;
+};
+
+HTTPServer::HTTPServer(Options options, Handler handler)
+    : _core(std::make_unique<Core>(std::move(options), std::move(handler))) {}
+
+HTTPServer::~HTTPServer() = default;
+
+std::uint16_t HTTPServer::port() const { return _core->port(); }
+
+std::string HTTPServer::baseURL() const {
+  bool tls = _core->options().tls.has_value();
+  return (tls ? "https://localhost:" : "http://127.0.0.1:") + std::to_string(port());
+}
+
+void HTTPServer::releaseHeld() { _core->releaseHeld(); }
+
+void HTTPServer::stop() { _core->stop(); }
+
+std::size_t HTTPServer::connectionsAccepted() const { return _core->accepted(); }
+
+std::size_t HTTPServer::connectionsOpen() const { return _core->open(); }
+
+}  // namespace vesk
