@@ -1,56 +1,14 @@
 // The local message log: one file that tells a person at the device what was reported.
 #pragma once
 
-#include <cstdint>
-#include <optional>
 #include <span>
 #include <string>
 #include <string_view>
-#include <type_traits>
-#include <variant>
 
 #include "platform/time/Clock.h"
-#include "platform/values/Text.h"
+#include "util/LogFormat.h"
 
 namespace vesk {
-
-/// One value for a placeholder of a log format. It remembers its own type, so a format that does not fit it
-/// still prints the value.
-class LogArgument {
- public:
-  LogArgument(std::string_view text) noexcept : _value(text) {}                                 // NOLINT
-  LogArgument(const std::string& text) noexcept : _value(std::string_view(text)) {}             // NOLINT
-  LogArgument(const char* text) noexcept : _value(std::string_view(text ? text : "(null)")) {}  // NOLINT
-  LogArgument(const Text& text) noexcept : _value(text.view()) {}                               // NOLINT
-  LogArgument(double number) noexcept : _value(number) {}                                       // NOLINT
-  LogArgument(bool value) noexcept : _value(static_cast<std::int64_t>(value)) {}                // NOLINT
-  template <class Integer, std::enable_if_t<std::is_integral_v<Integer>, int> = 0>
-  LogArgument(Integer number) noexcept {  // NOLINT
-    if constexpr (std::is_signed_v<Integer>) {
-      _value = static_cast<std::int64_t>(number);
-    } else {
-      _value = static_cast<std::uint64_t>(number);
-    }
-  }
-  /// What is none prints "(null)".
-  template <class T>
-  LogArgument(const std::optional<T>& value) noexcept  // NOLINT
-      : LogArgument(value ? LogArgument(*value) : LogArgument(std::string_view("(null)"))) {}
-
-  const std::variant<std::string_view, std::int64_t, std::uint64_t, double>& value() const noexcept {
-    return _value;
-  }
-
- private:
-  std::variant<std::string_view, std::int64_t, std::uint64_t, double> _value;
-};
-
-/// Fills the placeholders of `format`: "%@" and "%s" show any value in its plain form; "%d", "%i", "%u",
-/// "%x",
-/// "%X", "%o", "%c", "%f", "%e", "%g" with flags, width and precision show numbers as printf does (length
-/// modifiers are skipped, since the value knows its own size) and a text as it is; "%%" is a percent sign. A
-/// placeholder without a value stays as it stands; values without a placeholder are left out.
-std::string formatLogMessage(std::string_view format, std::span<const LogArgument> arguments);
 
 /// Appends lines to the one log file of a directory, starts a new file each day and deletes the old one. All
 /// state is in the directory. Failures cost a system-log line, never an exception. Thread-safe: a whole write
@@ -66,7 +24,7 @@ class MessageLog {
   MessageLog(std::string directory, const WallClock& clock);
 
   /// Writes one line: "(date) message".
-  void write(std::string_view message);
+  void write(std::string_view message) const;
 
  private:
   const std::string _directory;

@@ -1,0 +1,14 @@
+// What the firmware says about the machine: DMI on PCs, the device tree on boards.
+#pragma once
+
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace vesk {
+
+/// The firmware's word for a fact of the device-information query, or nothing: "ProductType", "DeviceName",
+/// "HWModelStr", "SerialNumber". DMI gives serial numbers to root only.
+std::optional<std::string> firmwareFact(std::string_view key);
+
+}  // namespace vesk

@@ -1,0 +1,119 @@
+#include "platform/unicode/Unicode.h"
+
+#include <unicode/bytestream.h>
+#include <unicode/casemap.h>
+#include <unicode/stringpiece.h>
+
+#include <algorithm>
+#include <cstdint>
+#include <cstring>
+#include <limits>
+
+namespace vesk {
+
+namespace {
+
+bool isASCII(char c) noexcept { return static_cast<unsigned char>(c) < 0x80; }
+
+char lowerASCII(char c) noexcept { return c >= 'A' && c <= 'Z' ? static_cast<char>(c | 0x20) : c; }
+
+bool isASCII(std::string_view text) noexcept {
+  std::size_t i = 0;
+  for (; i + 8 <= text.size(); i += 8) {
+    std::uint64_t eight;
+    std::memcpy(&eight, text.data() + i, 8);
+    if (eight & 0x8080808080808080u) return false;
+  }
+  for (; i < text.size(); ++i) {
+    if (!isASCII(text[i])) return false;
+  }
+  return true;
+}
+
+std::string lowerASCII(std::string_view text) {
+  std::string out(text);
+  for (char& c : out) c = lowerASCII(c);
+  return out;
+}
+
+// ICU counts in 32 bits. What is longer than that does not occur, and is left as it is.
+bool isTooLongForICU(std::string_view text) {
+  return text.size() > static_cast<std::size_t>(std::numeric_limits<std::int32_t>::max() / 4);
+}
+
+template <class Map>
+std::string mapped(std::string_view text, Map map) {
+  if (isASCII(text)) return lowerASCII(text);
+  if (isTooLongForICU(text)) return std::string(text);
+  std::string out;
+  icu::StringByteSink<std::string> sink(&out, static_cast<std::int32_t>(text.size()));
+  UErrorCode status = U_ZERO_ERROR;
+  map(icu::StringPiece(text.data(), static_cast<std::int32_t>(text.size())), sink, status);
+  return U_FAILURE(status) ? std::string(text) : out;
+}
+
+std::string folded(std::string_view text) {
+  return mapped(text, [](icu::StringPiece piece, icu::ByteSink& sink, UErrorCode& status) {
+    icu::CaseMap::utf8Fold(0, piece, sink, nullptr, status);
+  });
+}
+
+/// Length of the well-formed sequence at the start of `text`, 0 when there is none.
+std::size_t sequenceLength(std::string_view text) noexcept {
+  auto byte = [&](std::size_t i) { return static_cast<unsigned char>(text[i]); };
+  auto isTail = [&](std::size_t i, unsigned low = 0x80, unsigned high = 0xBF) {
+    return i < text.size() && byte(i) >= low && byte(i) <= high;
+  };
+  const unsigned lead = byte(0);
+  if (lead < 0x80) return 1;
+  if (lead < 0xC2 || lead > 0xF4) return 0;
+  if (lead < 0xE0) return isTail(1) ? 2 : 0;
+  // The second byte's range shuts out overlong forms, surrogates and what is above U+10FFFF.
+  if (lead < 0xF0)
+    return isTail(1, lead == 0xE0 ? 0xA0 : 0x80, lead == 0xED ? 0x9F : 0xBF) && isTail(2) ? 3 : 0;
+  return isTail(1, lead == 0xF0 ? 0x90 : 0x80, lead == 0xF4 ? 0x8F : 0xBF) && isTail(2) && isTail(3) ? 4 : 0;
+}
+
+}  // namespace
+
+std::string lowercase(std::string_view text) {
+  return mapped(text, [](icu::StringPiece piece, icu::ByteSink& sink, UErrorCode& status) {
+    icu::CaseMap::utf8ToLower("", 0, piece, sink, nullptr, status);
+  });
+}
+
+bool equalsIgnoringCase(std::string_view a, std::string_view b) {
+  const std::size_t common = std::min(a.size(), b.size());
+  for (std::size_t i = 0; i < common; ++i) {
+    // Some characters outside ASCII fold to ASCII (U+212A to "k"), so from here on folding has to decide.
+    if (!isASCII(a[i]) || !isASCII(b[i])) return folded(a.substr(i)) == folded(b.substr(i));
+    if (a[i] != b[i] && lowerASCII(a[i]) != lowerASCII(b[i])) return false;
+  }
+  // Nothing folds to nothing.
+  return a.size() == b.size();
+}
+
+bool containsIgnoringCase(std::string_view text, std::string_view needle) {
+  if (needle.empty()) return false;
+  return folded(text).find(folded(needle)) != std::string::npos;
+}
+
+bool isValidUTF8(std::string_view text, bool allowNUL) noexcept {
+  if (!allowNUL && text.find('\0') != std::string_view::npos) return false;
+  while (!text.empty()) {
+    if (text.size() >= 8) {
+      std::uint64_t eight;
+      std::memcpy(&eight, text.data(), 8);
+      if (!(eight & 0x8080808080808080u)) {
+        text.remove_prefix(8);
+        continue;
+      }
+    }
+    std::size_t length = sequenceLength(text);
+    if (length == 0) return false;
+    text.remove_prefix(length);
+  }
+  return true;
+}
+
+}  // namespace vesk

@@ -1,0 +1,173 @@
+#include "util/MessageLog.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <ctime>
+#include <filesystem>
+#include <optional>
+#include <system_error>
+#include <vector>
+
+#include "platform/files/FileDescriptor.h"
+#include "platform/files/RootPrefix.h"
+#include "platform/log/SystemLog.h"
+#include "platform/sync/Mutex.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::string_view kNameStart = "veskreportingd";
+constexpr std::string_view kNameEnd = "messageLog.diag";
+constexpr std::chrono::seconds kExpiryAge{86400};
+
+struct LogFile {
+  std::string path;
+  std::optional<WallTime> created;
+};
+
+bool isLogFileName(std::string_view name) {
+  const std::size_t first = name.find('_');
+  if (first == std::string_view::npos) return false;
+  const std::size_t second = name.find('_', first + 1);
+  return second != std::string_view::npos && name.substr(0, first) == kNameStart &&
+         name.substr(second + 1) == kNameEnd;
+}
+
+std::string newLogFileName(WallTime now) {
+  auto seconds = std::chrono::duration_cast<std::chrono::seconds>(now.time_since_epoch()).count();
+  return std::string(kNameStart) + "_" + std::to_string(static_cast<std::int32_t>(seconds)) + "_" +
+         std::string(kNameEnd);
+}
+
+std::optional<WallTime> creationDate(const std::string& path) {
+  struct statx status {};
+  if (::statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BTIME | STATX_MTIME, &status) != 0) {
+    return std::nullopt;
+  }
+  if (!(status.stx_mask & (STATX_BTIME | STATX_MTIME))) return std::nullopt;
+  const auto& when = status.stx_mask & STATX_BTIME ? status.stx_btime : status.stx_mtime;
+  return WallTime(std::chrono::seconds(when.tv_sec) + std::chrono::microseconds(when.tv_nsec / 1000));
+}
+
+std::string dateText(const LogFile& file) { return file.created ? logDate(*file.created) : "unknown date"; }
+
+void deleteLogFile(const LogFile& file) {
+  ::unlink(file.path.c_str());
+  VESK_LOG_INFO("writeToLogFile: Deleted expired veskreportingd log file %s (%s)", file.path.c_str(),
+                dateText(file).c_str());
+}
+
+void createDirectoryWithParents(const std::string& directory) {
+  for (std::size_t end = directory.find('/', 1);; end = directory.find('/', end + 1)) {
+    ::mkdir(directory.substr(0, end).c_str(), 0750);
+    if (end == std::string::npos) return;
+  }
+}
+
+/// Paths of the log files in `directory`, which is created when it is missing.
+std::vector<std::string> listLogFiles(const std::string& directory) {
+  std::vector<std::string> paths;
+  std::error_code error;
+  std::filesystem::directory_iterator entry(directory, error);
+  for (; !error && entry != std::filesystem::directory_iterator(); entry.increment(error)) {
+    if (isLogFileName(entry->path().filename().native())) paths.push_back(entry->path().native());
+  }
+  if (!error) return paths;
+  if (error == std::errc::no_such_file_or_directory) {
+    VESK_LOG_INFO("writeToLogFile: Creating veskreportingd log directory at %s", directory.c_str());
+    createDirectoryWithParents(directory);
+  } else {
+    VESK_LOG_ERROR("writeToLogFile: Error reading from log directory: %s", error.message().c_str());
+  }
+  return {};
+}
+
+/// The newest file that has not expired; all others are deleted.
+std::optional<LogFile> chooseCurrentFile(const std::vector<std::string>& paths, WallTime now) {
+  std::optional<LogFile> best;
+  for (const auto& path : paths) {
+    LogFile file{path, creationDate(path)};
+    if (file.created && now - *file.created > kExpiryAge) {
+      deleteLogFile(file);
+    } else if (best && best->created) {
+      if (file.created && *file.created > *best->created) std::swap(file, *best);
+      deleteLogFile(file);
+    } else {
+      // A best of unknown date gives way without being deleted.
+      best = std::move(file);
+    }
+  }
+  return best;
+}
+
+std::optional<LogFile> createLogFile(const std::string& directory, WallTime now) {
+  const std::string path = directory + "/" + newLogFileName(now);
+  // An existing file is kept: it can be there when the directory can't be listed.
+  FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0640));
+  struct stat status {};
+  if (!file || ::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) {
+    VESK_LOG_ERROR("writeToLogFile: Failed to create new veskreportingd log file %s", path.c_str());
+    return std::nullopt;
+  }
+  LogFile created{path, creationDate(path)};
+  VESK_LOG_INFO("writeToLogFile: Created new veskreportingd log file %s (%s)", path.c_str(),
+                dateText(created).c_str());
+  return created;
+}
+
+bool append(const std::string& path, std::string_view line) {
+  FileDescriptor file(::open(path.c_str(), O_WRONLY | O_APPEND | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+  if (!file) return false;
+  while (!line.empty()) {
+    ssize_t count = ::write(file.get(), line.data(), line.size());
+    if (count < 0 && errno == EINTR) continue;
+    if (count <= 0) return false;
+    line.remove_prefix(static_cast<std::size_t>(count));
+  }
+  return true;
+}
+
+}  // namespace
+
+std::string logDate(WallTime time) {
+  const std::time_t seconds = std::chrono::floor<std::chrono::seconds>(time).time_since_epoch().count();
+  std::tm utc{};
+  char text[64];
+  if (!::gmtime_r(&seconds, &utc)) return std::to_string(seconds);
+  return {text, std::strftime(text, sizeof text, "%Y-%m-%d %H:%M:%S +0000", &utc)};
+}
+
+MessageLog::MessageLog(std::string directory, const WallClock& clock)
+    : _directory(std::move(directory)), _clock(clock) {}
+
+void MessageLog::write(std::string_view message) const try {
+  // One lock for all logs: two of them may stand on one directory.
+  static Mutex mutex;
+  MutexLock lock(mutex);
+  const WallTime now = _clock.now();
+  auto file = chooseCurrentFile(listLogFiles(_directory), now);
+  if (!file) file = createLogFile(_directory, now);
+  if (!file) return;
+
+  std::string line = "(" + logDate(now) + ") ";
+  line.append(message).append("\n");
+  if (append(file->path, line)) {
+    VESK_LOG_INFO("writeToLogFile: Saved log message to %s", file->path.c_str());
+  } else {
+    deleteLogFile(*file);
+  }
+} catch (const std::exception& error) {
+  VESK_LOG_ERROR("writeToLogFile: %s", error.what());
+}
+
+void writeToLogFile(std::string_view format, std::span<const LogArgument> arguments) {
+  static const auto* log =
+      new MessageLog(pathUnderRoot("/var/mobile/Library/Logs/Dunmore/Retired"), WallClock::system());
+  log->write(formatLogMessage(format, arguments));
+}
+
+}  // namespace vesk
