@@ -18,6 +18,7 @@
 #define VESK_ACQUIRE(...) VESK_THREAD_ANNOTATION(acquire_capability(__VA_ARGS__))
 #define VESK_RELEASE(...) VESK_THREAD_ANNOTATION(release_capability(__VA_ARGS__))
 #define VESK_ACQUIRED_AFTER(...) VESK_THREAD_ANNOTATION(acquired_after(__VA_ARGS__))
+#define VESK_RETURNS_CAPABILITY(x) VESK_THREAD_ANNOTATION(lock_returned(x))
 #define VESK_NO_THREAD_SAFETY_ANALYSIS VESK_THREAD_ANNOTATION(no_thread_safety_analysis)
 
 namespace vesk {

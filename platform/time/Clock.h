@@ -28,4 +28,9 @@ inline timeval timevalFrom(WallTime time) {
   return value;
 }
 
+/// And back.
+inline WallTime wallTimeFrom(const timeval& time) {
+  return WallTime(std::chrono::seconds(time.tv_sec) + std::chrono::microseconds(time.tv_usec));
+}
+
 }  // namespace vesk

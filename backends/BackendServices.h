@@ -1,0 +1,34 @@
+// What the backends of a process share, handed to each at construction.
+#pragma once
+
+#include <atomic>
+#include <cstddef>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "platform/http/HTTPClient.h"
+#include "platform/time/Clock.h"
+#include "util/Counters.h"
+
+namespace vesk {
+
+/// Built once, in daemon/main.cpp; everything in it outlives every backend.
+struct BackendServices {
+  HTTPClient& http;
+  const WallClock& clock;
+  Counters& counters;
+  /// A stable identifier of this installation: for true the one that respects the user's diagnostics consent,
+  /// for false the one that is used when a storebag overrides it.
+  std::function<std::string(bool respectsConsent)> persistentIdentifierForDNU;
+  /// Whether the user agreed to the submission of diagnostics.
+  std::function<bool()> diagnosticsSubmissionConsent;
+  /// The two-letter country code of the current locale, when it has one.
+  std::function<std::optional<std::string>()> regionCode;
+};
+
+/// Bytes of events that all backends of one session hold; shared by them.
+using HeldBytes = std::shared_ptr<std::atomic<std::size_t>>;
+
+}  // namespace vesk

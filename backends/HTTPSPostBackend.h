@@ -1,0 +1,127 @@
+// The main backend: events as JSON, posted singly or in batches over HTTPS.
+#pragma once
+
+#include <deque>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <unordered_map>
+#include <vector>
+
+#include "backends/EventFilters.h"
+#include "backends/VeskReportingBackend.h"
+
+namespace vesk {
+
+/// Turns each message into an event record, filters it, and posts it at once or holds it for a batch, as the
+/// client entry of its profile says. Sources: HTTPSPostBackend.cpp (messages, batches),
+/// HTTPSPostConfiguration.cpp (state and policy from the storebag), HTTPSPostEvent.cpp (event records),
+/// HTTPSPostRequest.cpp (JSON body and post).
+class HTTPSPostBackend final : public VeskReportingBackend {
+ public:
+  /// Bytes of events that the backends of one session may hold while reporting is not enabled. Above it the
+  /// oldest are dropped, and counted.
+  static constexpr std::size_t kMaximumHeldBytes = std::size_t{16} << 20;
+
+  /// Nothing when profile or product family are missing, or when the profile has no `clients`.
+  static std::shared_ptr<HTTPSPostBackend> create(const std::string& name,
+                                                  const std::optional<Dictionary>& profile,
+                                                  const std::optional<Text>& productFamily,
+                                                  const BackendServices& services);
+  ~HTTPSPostBackend() override;
+
+  std::optional<std::string> postURL() const;
+  void setPostURL(const std::optional<std::string>& url);
+
+  /// Decides the state from the profile and the user info, and with it URLs, filters, sampling and
+  /// thresholds.
+  std::int32_t updateBackendState();
+
+ protected:
+  void updateStateLocked() override VESK_REQUIRES(_mutex);
+  std::optional<std::string> sendMessageLocked(const std::optional<Dictionary>& payload,
+                                               const timeval& timestamp, std::uint16_t method,
+                                               std::uint16_t respCode, std::uint16_t eventID,
+                                               std::int32_t flag) override VESK_REQUIRES(_mutex);
+  std::optional<std::string> flushMessagesLocked() override VESK_REQUIRES(_mutex);
+  void setCorrelatedSessionIDLocked(const std::optional<Text>& sessionID) override VESK_REQUIRES(_mutex);
+
+ private:
+  /// An event waiting for the next flush.
+  struct HeldEvent {
+    MutableDictionary event;
+    std::size_t bytes = 0;
+  };
+  using Events = std::deque<HeldEvent>;
+
+  HTTPSPostBackend(const std::string& name, const Dictionary& profile, const Text& productFamily,
+                   const BackendServices& services);
+
+  // Configuration.
+  std::int32_t updateBackendStateLocked() VESK_REQUIRES(_mutex);
+  std::int32_t stateForEntry(const Dictionary& entry, const std::optional<Text>& clientName)
+      VESK_REQUIRES(_mutex);
+  std::int32_t stateWithoutUserInfo(const std::vector<Dictionary>& clients) VESK_REQUIRES(_mutex);
+  std::int32_t stateForSampling(const Dictionary& entry) VESK_REQUIRES(_mutex);
+  bool consentAllows(const Dictionary& entry) VESK_REQUIRES(_mutex);
+  bool placeAndDeviceAllow(const Dictionary& entry) VESK_REQUIRES(_mutex);
+  void updateEventThreshold(const Dictionary& entry) VESK_REQUIRES(_mutex);
+  void updateExtrasOnInternal(const Dictionary& entry) VESK_REQUIRES(_mutex);
+  void updateExpedite(const Dictionary& entry) VESK_REQUIRES(_mutex);
+  bool updatePostLink(const Dictionary& entry) VESK_REQUIRES(_mutex);
+  bool matchClientNameAndServiceID(const Dictionary& entry, const std::optional<Text>& clientName,
+                                   const std::optional<Text>& serviceName) const;
+  std::optional<std::vector<Dictionary>> clientEntries() const;
+
+  // Events.
+  MutableDictionary createEventDictfromPayload(const std::optional<Dictionary>& payload,
+                                               const timeval& timestamp, std::uint16_t method,
+                                               std::uint16_t respCode, std::uint16_t eventID) const
+      VESK_REQUIRES(_mutex);
+  std::optional<Dictionary> payloadWithStopEntries(const std::optional<Dictionary>& payload) const
+      VESK_REQUIRES(_mutex);
+  void prepareEventForMessage(MutableDictionary& event) const VESK_REQUIRES(_mutex);
+  void batchEvent(MutableDictionary event) VESK_REQUIRES(_mutex);
+  void hold(MutableDictionary event) VESK_REQUIRES(_mutex);
+  void boundHeldEvents() VESK_REQUIRES(_mutex);
+  void addUserInfoToHeldEvents() VESK_REQUIRES(_mutex);
+  Events takeBatch() VESK_REQUIRES(_mutex);
+  std::optional<std::string> postNow(MutableDictionary event, std::uint16_t method, std::uint16_t respCode,
+                                     std::int32_t flag) VESK_REQUIRES(_mutex);
+
+  // Body and post.
+  std::string clientIdentifier() const VESK_REQUIRES(_mutex);
+  std::optional<std::string> createMessageForPostAndLogging(
+      Events& events, std::optional<std::string>* prettyJsonString) const VESK_REQUIRES(_mutex);
+  void postJSONMessage(std::string json, std::int32_t flag, std::optional<std::uint16_t> method,
+                       std::optional<std::uint16_t> responseCode, std::size_t eventCount)
+      VESK_REQUIRES(_mutex);
+  std::vector<std::pair<std::string, std::string>> postHeaders(
+      std::optional<std::uint16_t> method, std::optional<std::uint16_t> responseCode) const
+      VESK_REQUIRES(_mutex);
+  void postCompleted(const HTTPResult& result, std::size_t eventCount);
+
+  // Constant after construction.
+  const bool _dnuEnabled;              // the user's consent
+  const std::string _uuidRespectDnu;   // client identifier where the consent is respected
+  const std::string _uuidOverrideDnu;  // client identifier where the storebag overrides it
+
+  // Guarded by _mutex.
+  std::optional<std::string> _postURL VESK_GUARDED_BY(_mutex);
+  bool _useDefaultPostURL VESK_GUARDED_BY(_mutex) = false;  // _postURL comes from the preferences
+  std::optional<std::string> _realtimePostURL VESK_GUARDED_BY(_mutex);
+  bool _useDefaultRealtimePostURL VESK_GUARDED_BY(_mutex) = false;
+  std::optional<Events> _batchedEvents VESK_GUARDED_BY(_mutex);
+  bool _droppingBurst VESK_GUARDED_BY(_mutex) =
+      false;  // the line about dropped events is written once a burst
+  EventFilters _filters VESK_GUARDED_BY(_mutex);
+  std::int32_t _dnuType VESK_GUARDED_BY(_mutex) =
+      0;  // 0 consent respected; overridden: 1 without it, 2 with it
+  std::int32_t _eventThreshold VESK_GUARDED_BY(_mutex);
+  std::int32_t _extrasOnInternal VESK_GUARDED_BY(_mutex) = 0;
+  std::optional<Value> _overrideSampling VESK_GUARDED_BY(_mutex);  // a number
+  std::unordered_map<std::int64_t, std::int32_t> _eventMethodCounts VESK_GUARDED_BY(_mutex);
+};
+
+}  // namespace vesk

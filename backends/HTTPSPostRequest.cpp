@@ -1,0 +1,143 @@
+// The JSON body of a post, the post itself, and what the server's answer does to the backend.
+#include <VeskReporting/VeskReportingKeys.h>
+
+#include <algorithm>
+
+#include "backends/HTTPSPostBackend.h"
+#include "backends/SenderCodes.h"
+#include "platform/json/JSONWriter.h"
+#include "platform/log/SystemLog.h"
+#include "util/Gzip.h"
+#include "util/ReportingdUtil.h"
+
+namespace vesk {
+
+namespace {
+
+bool fitsIntoBody(const Value& value) { return value.isNumber() || value.text() != nullptr; }
+
+// Dates become seconds; what JSON events can't carry is removed and reported.
+void sanitize(MutableDictionary& event) {
+  std::erase_if(event.entries(), [](DictionaryEntry& entry) {
+    if (fitsIntoBody(entry.value)) return false;
+    if (const Date* date = entry.value.date()) {
+      entry.value = finiteOrMinusOne(date->secondsSince1970);
+      return false;
+    }
+    VESK_LOG_WARNING(
+        "HTTPSPostBackend(createMessageForPostAndLogging): TreeWriter unable to handle key: %s, value: %s",
+        entry.key.string().c_str(), describe(entry.value).c_str());
+    return true;
+  });
+}
+
+// A line break in a name from a client must not become a header of its own.
+std::string headerValue(const Text& text) {
+  std::string value = text.string();
+  std::erase_if(value, [](char c) { return static_cast<unsigned char>(c) < 0x20 || c == 0x7f; });
+  return value;
+}
+
+}  // namespace
+
+std::string HTTPSPostBackend::clientIdentifier() const {
+  if (_extrasOnInternal != 0 && _isInternal) return _udid;
+  return _dnuType == 0 ? _uuidRespectDnu : _uuidOverrideDnu;
+}
+
+std::optional<std::string> HTTPSPostBackend::createMessageForPostAndLogging(
+    Events& events, std::optional<std::string>* prettyJsonString) const {
+  double postTime = finiteOrMinusOne(secondsFromTimeval(timevalFrom(_services.clock.now())));
+  for (HeldEvent& held : events) sanitize(held.event);
+  std::string clientId = clientIdentifier();
+
+  auto serialize = [&](JSONStyle style) {
+    constexpr std::size_t kExpectedEventSize = 768;
+    JSONWriter writer(style, 128 + events.size() * kExpectedEventSize);
+    writer.beginObject();
+    writer.key("postTime");
+    writer.number(postTime);
+    writer.key("clientId");
+    writer.text(clientId);
+    writer.key("events");
+    writer.beginArray();
+    for (const HeldEvent& held : events) {
+      writer.beginObject();
+      for (const auto& entry : held.event.entries()) {
+        writer.key(entry.key.view());
+        writer.value(entry.value);
+      }
+      writer.endObject();
+    }
+    writer.endArray();
+    writer.endObject();
+    return writer.finish();
+  };
+
+  auto body = serialize(JSONStyle::Compact);
+  if (body && prettyJsonString && _dnuType == 0 && _dnuEnabled)
+    *prettyJsonString = serialize(JSONStyle::Pretty);
+  return body;
+}
+
+std::vector<std::pair<std::string, std::string>> HTTPSPostBackend::postHeaders(
+    std::optional<std::uint16_t> method, std::optional<std::uint16_t> responseCode) const {
+  std::vector<std::pair<std::string, std::string>> headers;
+  headers.reserve(10);
+  if (_userInfoDict) {
+    if (auto name = _userInfoDict->text(kVeskReportingUserInfoClientName)) {
+      headers.emplace_back("X-Vesk-Client-Name", headerValue(*name));
+    }
+    if (auto name = _userInfoDict->text(kVeskReportingUserInfoServiceName)) {
+      headers.emplace_back("X-Vesk-Service-Name", headerValue(*name));
+    }
+  }
+  if (_isInternal) headers.emplace_back("X-Vesk-Internal-Build", "1");
+  if (auto sender = senderCodeForClientType(_compType)) headers.emplace_back("X-Vesk-Sender", *sender);
+  if (method && responseCode) {
+    headers.emplace_back("X-Vesk-Event-Map", std::to_string(*method) + " " + std::to_string(*responseCode));
+  }
+  headers.emplace_back("Accept", "application/json");
+  headers.emplace_back("Content-Type", "application/json");
+  return headers;
+}
+
+void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t flag,
+                                       std::optional<std::uint16_t> method,
+                                       std::optional<std::uint16_t> responseCode, std::size_t eventCount) {
+  const auto& url = flag == 1 || flag == 3 ? _realtimePostURL : _postURL;
+  if (!url) {
+    _services.counters.count(_name, DropReason::NoURL, eventCount);
+    return;
+  }
+  HTTPRequest request;
+  request.method = "POST";
+  request.url = *url;
+  request.retry = HTTPRequest::Retry::UntilSent;
+  request.headers = postHeaders(method, responseCode);
+  auto compressed = gzipDeflate(json);
+  bool sendCompressed = compressed && compressed->size() < json.size();
+  request.body = sendCompressed ? std::move(*compressed) : std::move(json);
+  request.headers.emplace_back("Content-Length", std::to_string(request.body.size()));
+  if (sendCompressed) request.headers.emplace_back("Content-Encoding", "gzip");
+
+  // The completion keeps the backend alive; at a session's end it may be its last holder.
+  auto self = std::static_pointer_cast<HTTPSPostBackend>(shared_from_this());
+  _services.http.start(std::move(request), [self, eventCount](const HTTPResult& result) {
+    self->postCompleted(result, eventCount);
+  });
+}
+
+void HTTPSPostBackend::postCompleted(const HTTPResult& result, std::size_t eventCount) {
+  if (result.error) {
+    VESK_LOG_ERROR("HTTPSPostBackend(postJsonMessage): post error: %s", result.error->description.c_str());
+    _services.counters.count(_name, DropReason::TransportError, eventCount);
+  }
+  long status = result.response ? result.response->status : 0;
+  if (status < 500 || status > 599) return;
+  VESK_LOG_INFO("postJSONMessage: backend %s disabled by server %ld return code", _name.c_str(), status);
+  setState(BackendStateDisabled);
+  _services.counters.count(_name, DropReason::ServerError5xx, eventCount);
+}
+
+}  // namespace vesk

@@ -1,0 +1,26 @@
+// How a client entry of a storebag is matched with names.
+#pragma once
+
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace vesk {
+
+/// Absent or not, a list of texts from a storebag.
+using NameList = std::optional<std::vector<std::string>>;
+
+/// True when an item equals the whole string, ignoring case. An absent or empty list gives `whitelist`, an
+/// absent string its negation.
+bool matchExactStringWithList(const NameList& list, std::optional<std::string_view> wholeString,
+                              bool whitelist);
+
+/// True when an item occurs anywhere in the string, ignoring case; an empty item never does. Special cases as
+/// above.
+bool matchStringWithList(const NameList& list, std::optional<std::string_view> wholeString, bool whitelist);
+
+/// The pieces of a text between commas, empty ones included.
+std::vector<std::string> componentsSeparatedByComma(std::string_view text);
+
+}  // namespace vesk

@@ -1,0 +1,163 @@
+// What a session knows of its reporting backends.
+#pragma once
+
+#include <sys/time.h>
+
+#include <atomic>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "backends/BackendServices.h"
+#include "platform/sync/Mutex.h"
+#include "platform/values/Value.h"
+
+namespace vesk {
+
+enum BackendState : std::int32_t {
+  BackendStatePending = 0,   ///< not yet decided; messages are held back
+  BackendStateDisabled = 1,  ///< reporting off; messages are dropped
+  BackendStateEnabled = 2,   ///< reporting on
+  BackendStateOverride = 3,  ///< sampled out, inside the override band: held back until a message lifts it
+};
+
+/// Bits of a message's flag.
+enum MessageFlag : std::uint32_t {
+  MessageFlagRealtime = 1,
+  MessageFlagOverrideSampling = 2,
+};
+
+/// One destination of a session's messages. Its operations may be called from any thread and do not overlap:
+/// each takes the backend's own mutex, which is a leaf (no other lock of the project is taken under it, and
+/// it is never held while a server is waited for). Subclasses override the `…Locked` forms, which run under
+/// that mutex. Kept alive by its session and by posts that are under way.
+class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBackend> {
+ public:
+  /// The backend that a storebag lists under `name`; nothing for a name that is not known, for a Wren backend
+  /// on a "Bramble" device, and when the backend finds `profile` unusable.
+  static std::shared_ptr<VeskReportingBackend> newBackendWithName(const std::string& name,
+                                                                  const std::optional<Dictionary>& profile,
+                                                                  const std::optional<Text>& productFamily,
+                                                                  std::int32_t clientType,
+                                                                  const BackendServices& services);
+
+  virtual ~VeskReportingBackend() = default;
+  VeskReportingBackend(const VeskReportingBackend&) = delete;
+  VeskReportingBackend& operator=(const VeskReportingBackend&) = delete;
+
+  /// Lower-case hexadecimal SHA-256 of the text's bytes, 64 characters.
+  static std::string convertIntoSHA256(std::string_view text);
+
+  // --- What a session asks of every backend ---------------------------------------------------------------
+
+  /// Ends the backend's activity; called once, when its session ends or replaces it.
+  virtual void cleanup() {}
+
+  /// Decides the state anew.
+  void updateState();
+
+  /// Numbers the message with the backend's next event ID (1 after construction, 0 after 65535) and sends it.
+  /// Gives the text for the local message log, or nothing.
+  std::optional<std::string> sendMessage(const std::optional<Dictionary>& payload, const timeval& timestamp,
+                                         std::uint16_t method, std::uint16_t respCode, std::int32_t flag);
+
+  /// Sends what is held back, where that is allowed; gives the text for the local message log, or nothing.
+  std::optional<std::string> flushMessages();
+
+  /// `extensionToken` names the descriptor that the client passed. May block for a server's answer.
+  virtual bool uploadFileAtPath(const std::string& path, const std::string& extensionToken);
+  /// May block for a server's answer.
+  virtual bool uploadLogData(const List& logData);
+
+  void setCorrelatedSessionID(const std::optional<std::string>& sessionID);
+
+  // --- Properties
+  // -------------------------------------------------------------------------------------------
+
+  /// Also written by the completion of a post.
+  std::int32_t state() const noexcept { return _state.load(); }
+  void setState(std::int32_t state) noexcept { _state.store(state); }
+  /// This backend's sampling draw, uniform in [0, 1).
+  double samplingFactor() const noexcept { return _samplingFactor.load(); }
+  void setSamplingFactor(double factor) noexcept { _samplingFactor.store(factor); }
+
+  const std::string& name() const noexcept { return _name; }
+  std::int32_t hierarchy() const noexcept { return _hierarchy.load(); }
+  void setHierarchy(std::int32_t hierarchy) noexcept { _hierarchy.store(hierarchy); }
+
+  std::optional<Value> samplingThreshold() const;
+  void setSamplingThreshold(const std::optional<Value>& threshold);
+  std::optional<std::string> displayURL() const;
+  std::optional<std::string> combinedSessionIDString() const;
+  void setCombinedSessionIDString(const std::optional<std::string>& sessionID);
+  void setUserInfoDict(const std::optional<Dictionary>& userInfo);
+
+  // Set once, by the session that creates the backend, before any message.
+  void setSessionID(std::uint32_t sessionID);
+  void setCompType(std::int32_t clientType);
+  void setClientVersion(std::uint16_t version);
+  void setUdid(std::string_view udid);
+  void setProductVersion(const std::optional<Text>& version);
+  void setBuildVersion(const std::optional<Text>& version);
+  void setHardwareType(const std::optional<Text>& type);
+  void setIsInternal(bool isInternal);
+  void setRequireUserInfo(bool require);
+  void setBatchEvents(bool batch);
+  /// "7.2.9" gives 7 and 2; what does not fit into 8 bits is cut.
+  void setSelfVersion(std::string_view version);
+  void setStartTimestamp(const timeval& timestamp);
+  /// Shares the account of held bytes with the session's other backends.
+  void setHeldBytes(HeldBytes heldBytes);
+
+ protected:
+  VeskReportingBackend(const std::string& name, const Dictionary& profile, const Text& productFamily,
+                       const BackendServices& services);
+
+  virtual void updateStateLocked() VESK_REQUIRES(_mutex) { setState(BackendStateEnabled); }
+  virtual std::optional<std::string> sendMessageLocked(const std::optional<Dictionary>& payload,
+                                                       const timeval& timestamp, std::uint16_t method,
+                                                       std::uint16_t respCode, std::uint16_t eventID,
+                                                       std::int32_t flag) VESK_REQUIRES(_mutex);
+  virtual std::optional<std::string> flushMessagesLocked() VESK_REQUIRES(_mutex) { return std::nullopt; }
+  virtual void setCorrelatedSessionIDLocked(const std::optional<Text>& sessionID) VESK_REQUIRES(_mutex) {
+    _combinedSessionIDString = sessionID;
+  }
+
+  // Constant after construction.
+  const Dictionary _profile;
+  const std::string _name;
+  const Text _productFamily;
+  const BackendServices& _services;
+
+  // Synchronised by themselves.
+  std::atomic<std::int32_t> _state{BackendStatePending};
+  std::atomic<std::int32_t> _hierarchy{0};
+  std::atomic<double> _samplingFactor;
+
+  // Guarded by _mutex.
+  mutable Mutex _mutex;
+  std::optional<Text> _productVersion VESK_GUARDED_BY(_mutex);
+  std::optional<Text> _buildVersion VESK_GUARDED_BY(_mutex);
+  std::optional<Text> _hardwareType VESK_GUARDED_BY(_mutex);
+  double _startTimeStamp VESK_GUARDED_BY(_mutex) = 0;  // seconds since 1970
+  std::uint32_t _sessionID VESK_GUARDED_BY(_mutex) = 0;
+  std::optional<Text> _combinedSessionIDString VESK_GUARDED_BY(_mutex);
+  std::int32_t _compType VESK_GUARDED_BY(_mutex) = 0;
+  std::uint16_t _clientVersion VESK_GUARDED_BY(_mutex) = 0;
+  std::uint16_t _eventID VESK_GUARDED_BY(_mutex) = 0;
+  std::uint8_t _selfVersionMajor VESK_GUARDED_BY(_mutex) = 0;
+  std::uint8_t _selfVersionMinor VESK_GUARDED_BY(_mutex) = 0;
+  bool _isInternal VESK_GUARDED_BY(_mutex) = false;
+  bool _requireUserInfo VESK_GUARDED_BY(_mutex) = false;
+  bool _batchEvents VESK_GUARDED_BY(_mutex) = false;
+  std::optional<Dictionary> _userInfoDict VESK_GUARDED_BY(_mutex);
+  // A copy: a post that is under way may outlive the session that owns the buffer it came from.
+  std::string _udid VESK_GUARDED_BY(_mutex);
+  std::optional<std::string> _displayURL VESK_GUARDED_BY(_mutex);
+  std::optional<Value> _samplingThreshold VESK_GUARDED_BY(_mutex);  // a number
+  HeldBytes _heldBytes VESK_GUARDED_BY(_mutex);
+};
+
+}  // namespace vesk

@@ -1,0 +1,84 @@
+#include "daemon/Daemon.h"
+
+#include <VeskReporting/VeskReporting.h>
+
+#include <utility>
+
+#include "client/common/Resources.h"
+#include "client/protocol/WireNames.h"
+#include "daemon/ReportingdAgent.h"
+#include "platform/device/DeviceInformation.h"
+#include "platform/files/RootPrefix.h"
+#include "platform/http/HTTPClient.h"
+#include "platform/ipc/IPCListener.h"
+#include "platform/log/SystemLog.h"
+
+namespace vesk {
+
+namespace {
+
+IPCListener::Options listenerOptions(ServiceManager& serviceManager) {
+  IPCListener::Options options;
+  options.socketPath = pathUnderRoot("/run/veskreportingd/com.corvane.veskreportingd");
+  options.objectPath = kSessionObjectPath;
+  options.inherited = serviceManager.takeListeningSocket();
+  return options;
+}
+
+HTTPClient::Options httpOptions() {
+  HTTPClient::Options options;
+  options.userAgent = "veskreportingd/" VESK_VERSION;
+  return options;
+}
+
+}  // namespace
+
+struct Daemon::Parts {
+  Parts(ServiceManager& serviceManager, BusyMarker& busyMarker)
+      : http(httpOptions()),
+        backendServices{http,
+                        WallClock::system(),
+                        Counters::shared(),
+                        [](bool respectsConsent) {
+                          return VeskReporting::getPersistentIdentifierForDNU(respectsConsent);
+                        },
+                        diagnosticsSubmissionConsent,
+                        regionCode},
+        sessionServices{backendServices, clientLibraryVersion()},
+        agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetch(), busyMarker)),
+        listener(listenerOptions(serviceManager)) {
+    listener.setDelegate(agent.get());
+  }
+
+  StorebagFetch storebagFetch() {
+    return [this, source = StorebagSource{sessionServices.libraryVersion, publicKeyDER}](
+               std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version,
+               bool& notModified, std::optional<std::string>& lastModified) {
+      return fetchStorebagForEnvironmentAndClientType(http, source, clientType, maxAge, version, notModified,
+                                                      &lastModified);
+    };
+  }
+
+  HTTPClient http;
+  BackendServices backendServices;
+  SessionServices sessionServices;
+  std::shared_ptr<ReportingdAgent> agent;
+  IPCListener listener;
+};
+
+Daemon::Daemon(ServiceManager& serviceManager, BusyMarker& busyMarker)
+    : _parts(std::make_unique<Parts>(serviceManager, busyMarker)) {}
+
+Daemon::~Daemon() { stop(); }
+
+void Daemon::resume() { _parts->listener.resume(); }
+
+void Daemon::stop() {
+  _parts->listener.stop();
+  if (!_parts->http.waitUntilIdle(kPostWait)) {
+    VESK_LOG_WARNING("main: Stopping although posts are still outstanding after %d seconds.",
+                     static_cast<int>(kPostWait.count()));
+  }
+}
+
+}  // namespace vesk

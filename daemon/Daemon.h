@@ -1,0 +1,35 @@
+// The daemon's object graph, built in one place.
+#pragma once
+
+#include <memory>
+
+#include "daemon/DaemonOptions.h"
+#include "platform/service/BusyMarker.h"
+#include "platform/service/ServiceManager.h"
+
+namespace vesk {
+
+/// Everything that serves clients: HTTP client, agent, listener. Members are destroyed from the clients
+/// inwards.
+class Daemon {
+ public:
+  /// Publishes nothing yet. Throws std::system_error when the socket can't be made.
+  Daemon(ServiceManager& serviceManager, BusyMarker& busyMarker);
+  /// As `stop`.
+  ~Daemon();
+
+  /// Begins to accept clients.
+  void resume();
+
+  /// Ends in order: no new connections, the sessions destroyed (they send their closing messages and flush),
+  /// then what is being posted waited for, at most `kPostWait`. Safe to call twice.
+  void stop();
+
+  static constexpr std::chrono::seconds kPostWait{10};
+
+ private:
+  struct Parts;
+  std::unique_ptr<Parts> _parts;
+};
+
+}  // namespace vesk

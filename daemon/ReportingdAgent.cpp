@@ -1,0 +1,107 @@
+#include "daemon/ReportingdAgent.h"
+
+#include <VeskReporting/VeskReportingKeys.h>
+
+#include <algorithm>
+#include <cstdio>
+
+#include "client/protocol/ClientSessionStub.h"
+#include "platform/log/SystemLog.h"
+#include "util/ReportingdUtil.h"
+
+namespace vesk {
+
+namespace {
+
+std::int32_t clientTypeOf(const ReportingdSession& session) {
+  auto info = session.sessionInfo();
+  if (!info) return 0;
+  return static_cast<std::int32_t>(integerForKey(*info, kVeskReportingSessionInfoClientType).value_or(0));
+}
+
+}  // namespace
+
+ReportingdAgent::ReportingdAgent(const SessionServices& services, StorebagFetch fetchStorebag,
+                                 BusyMarker& busyMarker)
+    : _services(services),
+      _busyMarker(busyMarker),
+      _cachedStorebags(std::move(fetchStorebag), services.backends.clock) {}
+
+std::string ReportingdAgent::description() const {
+  char text[48];
+  std::snprintf(text, sizeof text, "<ReportingdAgent: %p>", static_cast<const void*>(this));
+  return text;
+}
+
+// --- Connections
+// --------------------------------------------------------------------------------------------
+
+bool ReportingdAgent::shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) {
+  if (SystemLog::isOn(LogLevel::Debug)) {
+    std::size_t sessions = 0;
+    std::size_t correlated = 0;
+    {
+      MutexLock lock(_sessionListMutex);
+      sessions = _sessionList.size();
+    }
+    {
+      RecursiveMutexLock lock(_monitor);
+      correlated = _correlatedSessions.size();
+    }
+    VESK_LOG_DEBUG("listener: Accepting new Orvo connection %s, %d(%d) connections.",
+                   connection->description().c_str(), static_cast<int>(sessions),
+                   static_cast<int>(correlated));
+  }
+  auto session = std::make_shared<ReportingdSession>(shared_from_this(), connection, _services);
+  connection->setExportedObject(std::make_shared<ClientSessionStub>(session));
+  {
+    MutexLock lock(_sessionListMutex);
+    if (_sessionList.empty()) _busyMarker.begin();
+    _sessionList.push_back(session);
+  }
+  connection->setInterruptionHandler([session] {
+    VESK_LOG_DEBUG("listener: Orvo connection to %s was interrupted", session->description().c_str());
+  });
+  connection->setInvalidationHandler(
+      [session, agent = shared_from_this()] { agent->sessionInvalidated(session); });
+  connection->resume();
+  return true;
+}
+
+void ReportingdAgent::sessionInvalidated(const std::shared_ptr<ReportingdSession>& session) {
+  VESK_LOG_DEBUG("listener: Orvo connection to %s was invalidated", session->description().c_str());
+  removeFromSessionList(session);
+  removeFromCorrelation(session);
+}
+
+// The caller holds a reference of its own, so neither erasure can be the session's end under a lock.
+void ReportingdAgent::removeFromSessionList(const std::shared_ptr<ReportingdSession>& session) {
+  MutexLock lock(_sessionListMutex);
+  if (std::erase(_sessionList, session) > 0 && _sessionList.empty()) _busyMarker.end();
+}
+
+void ReportingdAgent::removeFromCorrelation(const std::shared_ptr<ReportingdSession>& session) {
+  RecursiveMutexLock lock(_monitor);
+  std::string key = correlationKeyForUserInfo(session->userInfo().value_or(Dictionary()));
+  auto list = _correlatedSessions.find(key);
+  if (list != _correlatedSessions.end()) std::erase(list->second, session);
+}
+
+// --- Storebags
+// ----------------------------------------------------------------------------------------------
+
+std::optional<Dictionary> ReportingdAgent::storebagForSession(ReportingdSession& session) {
+  std::int32_t clientType = clientTypeOf(session);
+  VESK_LOG_DEBUG("storebagForSession: Retrieving storebag for session %u with client type %d",
+                 session.sessionID(), clientType);
+  RecursiveMutexLock lock(_monitor);
+  return _cachedStorebags.storebagForClientType(clientType);
+}
+
+std::optional<std::string> ReportingdAgent::storebagVersionForSession(ReportingdSession& session) {
+  std::int32_t clientType = clientTypeOf(session);
+  RecursiveMutexLock lock(_monitor);
+  return _cachedStorebags.versionForClientType(clientType);
+}
+
+}  // namespace vesk

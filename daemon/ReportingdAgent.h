@@ -1,0 +1,79 @@
+// Accepts clients, keeps their sessions, and serves these as their delegate.
+#pragma once
+
+#include <cstddef>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <unordered_map>
+#include <vector>
+
+#include "daemon/StorebagCache.h"
+#include "platform/ipc/IPCListener.h"
+#include "platform/service/BusyMarker.h"
+#include "platform/sync/Mutex.h"
+#include "session/ReportingdSession.h"
+#include "session/ReportingdSessionDelegate.h"
+
+namespace vesk {
+
+/// Keeps the list of live sessions, and the storebag cache and the families of sessions under one recursive
+/// lock, its monitor. The list has a lock of its own; the two are never held one inside the other. A
+/// session's last reference is never given up under either.
+///
+/// Held by its sessions, so it outlives them. Sources: ReportingdAgent.cpp (connections, storebags),
+/// ReportingdAgentHierarchy.cpp (families).
+class ReportingdAgent final : public ReportingdSessionDelegate,
+                              public IPCListenerDelegate,
+                              public std::enable_shared_from_this<ReportingdAgent> {
+ public:
+  /// All three outlive the agent.
+  ReportingdAgent(const SessionServices& services, StorebagFetch fetchStorebag, BusyMarker& busyMarker);
+
+  // --- IPCListenerDelegate
+  // ----------------------------------------------------------------------------------
+  bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) override;
+
+  // --- ReportingdSessionDelegate
+  // ----------------------------------------------------------------------------
+  std::optional<Dictionary> storebagForSession(ReportingdSession& session) override;
+  std::optional<std::string> storebagVersionForSession(ReportingdSession& session) override;
+  std::optional<std::string> parentSessionIDStringForSession(ReportingdSession& session) override;
+  void userInfoUpdatedForSession(ReportingdSession& session) override;
+  std::shared_ptr<ReportingdSession> getAncestorWithAggregatorForSession(ReportingdSession& session) override
+      VESK_REQUIRES(_monitor);
+  void updateDownstreamSessions(ReportingdSession& session) override;
+  std::shared_ptr<ReportingdSession> parentSessionForChild(ReportingdSession& session) override
+      VESK_REQUIRES(_monitor);
+  RecursiveMutex& monitor() override VESK_RETURNS_CAPABILITY(_monitor) { return _monitor; }
+  std::string description() const override;
+
+ private:
+  using SessionList = std::vector<std::shared_ptr<ReportingdSession>>;
+
+  void sessionInvalidated(const std::shared_ptr<ReportingdSession>& session);
+  void removeFromSessionList(const std::shared_ptr<ReportingdSession>& session);
+  void removeFromCorrelation(const std::shared_ptr<ReportingdSession>& session);
+
+  /// The first session of exactly that level, in the order in which they joined.
+  static std::shared_ptr<ReportingdSession> getFirstSessionWithHierarchy(std::int32_t level,
+                                                                         const SessionList& list);
+  const SessionList* correlatedSessions(const std::string& key) const VESK_REQUIRES(_monitor);
+
+  // Constant after construction.
+  const SessionServices& _services;
+  BusyMarker& _busyMarker;
+
+  // Guarded by _sessionListMutex: every accepted session that is not yet invalidated, in order of acceptance.
+  Mutex _sessionListMutex;
+  SessionList _sessionList VESK_GUARDED_BY(_sessionListMutex);
+
+  // Guarded by _monitor.
+  RecursiveMutex _monitor;
+  StorebagCache _cachedStorebags VESK_GUARDED_BY(_monitor);
+  std::map<std::string, SessionList> _correlatedSessions
+      VESK_GUARDED_BY(_monitor);  // lists are never removed
+};
+
+}  // namespace vesk

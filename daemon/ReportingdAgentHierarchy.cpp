@@ -1,0 +1,156 @@
+// Families of sessions: those of the same client and service, by level.
+#include <algorithm>
+
+#include "daemon/ReportingdAgent.h"
+#include "platform/log/SystemLog.h"
+#include "util/ReportingdUtil.h"
+
+namespace vesk {
+
+namespace {
+
+std::string keyOf(const ReportingdSession& session) {
+  return correlationKeyForUserInfo(session.userInfo().value_or(Dictionary()));
+}
+
+template <class List>
+bool contains(const List& list, const ReportingdSession& session) {
+  return std::any_of(list.begin(), list.end(), [&](const auto& member) { return member.get() == &session; });
+}
+
+}  // namespace
+
+std::shared_ptr<ReportingdSession> ReportingdAgent::getFirstSessionWithHierarchy(std::int32_t level,
+                                                                                 const SessionList& list) {
+  auto found = std::find_if(list.begin(), list.end(),
+                            [&](const auto& session) { return session->getSessionHierarchy() == level; });
+  return found == list.end() ? nullptr : *found;
+}
+
+const ReportingdAgent::SessionList* ReportingdAgent::correlatedSessions(const std::string& key) const {
+  auto list = _correlatedSessions.find(key);
+  return list == _correlatedSessions.end() ? nullptr : &list->second;
+}
+
+void ReportingdAgent::userInfoUpdatedForSession(ReportingdSession& session) {
+  auto userInfo = session.userInfo();
+  if (!userInfo) {
+    VESK_LOG_INFO("userInfoUpdatedForSession: No user info found for session %u", session.sessionID());
+    return;
+  }
+  auto self = session.shared_from_this();
+  std::string key = correlationKeyForUserInfo(*userInfo);
+  RecursiveMutexLock lock(_monitor);
+  for (auto& [otherKey, list] : _correlatedSessions) std::erase(list, self);
+  VESK_LOG_DEBUG("userInfoUpdatedForSession: Adding session %u to list for userInfoKey %s",
+                 session.sessionID(), key.c_str());
+  _correlatedSessions[key].push_back(self);
+}
+
+std::shared_ptr<ReportingdSession> ReportingdAgent::parentSessionForChild(ReportingdSession& session) {
+  std::int32_t level = session.getSessionHierarchy();
+  if (level == 0) return nullptr;
+  std::string key = keyOf(session);
+  VESK_LOG_DEBUG("parentSessionForChild: Checking userInfoKey '%s' for session %u", key.c_str(),
+                 session.sessionID());
+  const SessionList* list = correlatedSessions(key);
+  if (!list || list->empty()) {
+    VESK_LOG_ERROR("parentSessionForChild: ERROR: No sessions found for user info key %s", key.c_str());
+    return nullptr;
+  }
+  if (!contains(*list, session)) {
+    VESK_LOG_ERROR("parentSessionForChild: ERROR: Session %u not found for user info key %s",
+                   session.sessionID(), key.c_str());
+    return nullptr;
+  }
+  auto parent = getFirstSessionWithHierarchy(level - 1, *list);
+  if (!parent) {
+    VESK_LOG_INFO("parentSessionForChild: Unable to find session with hierarchy of %d for userInfoKey '%s'",
+                  level - 1, key.c_str());
+  }
+  return parent;
+}
+
+std::optional<std::string> ReportingdAgent::parentSessionIDStringForSession(ReportingdSession& session) {
+  std::int32_t level = session.getSessionHierarchy();
+  if (level == 0) return std::nullopt;
+  std::string key = keyOf(session);
+  VESK_LOG_DEBUG("parentSessionIDStringForSession: Checking userInfoKey '%s' for session %u", key.c_str(),
+                 session.sessionID());
+  RecursiveMutexLock lock(_monitor);
+  const SessionList* list = correlatedSessions(key);
+  if (!list || list->empty()) {
+    VESK_LOG_ERROR("parentSessionIDStringForSession: ERROR: No sessions found for user info key %s",
+                   key.c_str());
+    return std::nullopt;
+  }
+  if (!contains(*list, session)) {
+    VESK_LOG_ERROR("parentSessionIDStringForSession: ERROR: Session %u not found for user info key %s",
+                   session.sessionID(), key.c_str());
+    return std::nullopt;
+  }
+  std::optional<std::string> chain;
+  for (std::int32_t above = level - 1; above >= 0; --above) {
+    auto ancestor = getFirstSessionWithHierarchy(above, *list);
+    if (!ancestor) {
+      VESK_LOG_INFO(
+          "parentSessionIDStringForSession: Found a gap in hierarchy (one of parents missing): incomplete "
+          "parentSessionID is '%s'",
+          chain.value_or("").c_str());
+      return chain;
+    }
+    chain = chain ? ancestor->sessionIDString() + "." + *chain : ancestor->sessionIDString();
+  }
+  return chain;
+}
+
+std::shared_ptr<ReportingdSession> ReportingdAgent::getAncestorWithAggregatorForSession(
+    ReportingdSession& session) {
+  auto userInfo = session.userInfo();
+  if (!userInfo) {
+    VESK_LOG_INFO("getAncestorWithAggregatorForSession: No user info found for session %u",
+                  session.sessionID());
+    return nullptr;
+  }
+  std::int32_t level = session.getSessionHierarchy();
+  if (level < 1) return nullptr;
+  const SessionList* list = correlatedSessions(correlationKeyForUserInfo(*userInfo));
+  if (!list) return nullptr;
+  for (std::int32_t above = 0; above < level; ++above) {
+    auto ancestor = getFirstSessionWithHierarchy(above, *list);
+    if (ancestor && ancestor->hasAggregator()) return ancestor;
+  }
+  return nullptr;
+}
+
+void ReportingdAgent::updateDownstreamSessions(ReportingdSession& session) {
+  if (!session.userInfo()) {
+    VESK_LOG_INFO("updateDownstreamSessions: No user info found for session %u", session.sessionID());
+    return;
+  }
+  std::string key = keyOf(session);
+  std::int32_t level = session.getSessionHierarchy();
+  RecursiveMutexLock lock(_monitor);
+  session.updateCombinedSessionID();
+  session.syncReportingStates();
+  bool aggregationShutDown = false;
+  if (level >= 1 && getAncestorWithAggregatorForSession(session)) {
+    session.shutdownSessionAggregation();
+    aggregationShutDown = true;
+  }
+  const SessionList* list = correlatedSessions(key);
+  if (!list) return;
+  for (const auto& below : *list) {
+    if (below->getSessionHierarchy() <= level) continue;
+    VESK_LOG_DEBUG(
+        "updateDownstreamSessions: Updating combined session ID and syncing reporting states for session %u",
+        below->sessionID());
+    below->updateCombinedSessionID();
+    below->syncReportingStates();
+    if ((session.hasAggregator() || aggregationShutDown) && below->hasAggregator()) {
+      below->shutdownSessionAggregation();
+    }
+  }
+}
+
+}  // namespace vesk

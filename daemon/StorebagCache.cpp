@@ -1,0 +1,68 @@
+#include "daemon/StorebagCache.h"
+
+#include "platform/log/SystemLog.h"
+#include "storebag/StorebagNaming.h"
+
+namespace vesk {
+
+std::optional<Dictionary> StorebagCache::storebagForClientType(std::int32_t clientType) {
+  auto name = storebagNameForClientType(clientType);
+  if (!name) return std::nullopt;
+  auto record = _records.find(std::string(*name));
+  if (record == _records.end() || !isFresh(record->second, clientType)) {
+    fetchAndCacheStorebag(clientType);
+    record = _records.find(std::string(*name));
+  }
+  return record->second.storebagData;
+}
+
+// The age is taken without a sign: a clock that was set back shortens or lengthens the wait, but never blocks
+// fetching for ever.
+bool StorebagCache::isFresh(const Record& record, std::int32_t clientType) const {
+  if (!record.storebagFetchTime) return false;
+  auto age = std::chrono::abs(_clock.now() - *record.storebagFetchTime);
+  bool successful = record.storebagFetchState == FetchState::Successful;
+  if (successful && age < std::chrono::seconds(record.storebagMaxAge)) {
+    VESK_LOG_DEBUG("storebagForSession: Cached storebag found for client type %d", clientType);
+    return true;
+  }
+  if (!successful && age < kMinimumWaitAfterFailure) {
+    VESK_LOG_INFO(
+        "storebagForSession: Not fetching storebag for client type %d - must wait %d seconds between "
+        "attempts",
+        clientType, static_cast<int>(kMinimumWaitAfterFailure.count()));
+    return true;
+  }
+  return false;
+}
+
+void StorebagCache::fetchAndCacheStorebag(std::int32_t clientType) {
+  VESK_LOG_DEBUG("fetchAndCacheStorebag: Fetching storebag for client type %d", clientType);
+  Record& record = _records[std::string(*storebagNameForClientType(clientType))];
+  std::int32_t maxAge = 0;  // what a fetch without any answer reports
+  std::optional<std::string> version;
+  bool notModified = false;
+  std::optional<std::string> lastModified = record.storebagLastModified;
+  auto section = _fetch(clientType, maxAge, version, notModified, lastModified);
+  VESK_LOG_DEBUG("fetchAndCacheStorebag: Storebag max age: %d seconds", maxAge);
+  bool successful = section || notModified;
+  if (section) {
+    record.storebagData = std::move(section);
+    record.storebagVersion = std::move(version);
+  } else if (!notModified) {
+    VESK_LOG_ERROR("fetchAndCacheStorebag: Unable to fetch storebag for client type %d", clientType);
+  }
+  record.storebagFetchTime = _clock.now();
+  record.storebagFetchState = successful ? FetchState::Successful : FetchState::Failure;
+  record.storebagMaxAge = maxAge;
+  if (lastModified) record.storebagLastModified = std::move(lastModified);
+}
+
+std::optional<std::string> StorebagCache::versionForClientType(std::int32_t clientType) const {
+  auto name = storebagNameForClientType(clientType);
+  if (!name) return std::nullopt;
+  auto record = _records.find(std::string(*name));
+  return record == _records.end() ? std::nullopt : record->second.storebagVersion;
+}
+
+}  // namespace vesk

@@ -1,0 +1,59 @@
+// The storebags that the daemon has fetched, and when it may fetch again.
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <map>
+#include <optional>
+#include <string>
+
+#include "platform/time/Clock.h"
+#include "platform/values/Value.h"
+#include "storebag/StorebagFetch.h"
+
+namespace vesk {
+
+/// Fetches the section of a client type's storebag that applies to this device. Blocks for the request.
+using StorebagFetch = std::function<std::optional<Dictionary>(
+    std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
+    std::optional<std::string>& lastModified)>;
+
+/// One record a storebag name, in memory only, for the life of the daemon. Not synchronised: the agent calls
+/// it with its monitor held, also across a fetch, so that two sessions never fetch the same storebag at once.
+class StorebagCache {
+ public:
+  /// After a failed attempt the server is left alone for this long.
+  static constexpr std::chrono::seconds kMinimumWaitAfterFailure{900};
+
+  StorebagCache(StorebagFetch fetch, const WallClock& clock) : _fetch(std::move(fetch)), _clock(clock) {}
+
+  /// The cached section where it is fresh enough or may not be fetched yet, else what a fetch brings (or,
+  /// when that fails, the last good section). Nothing for a client type without a storebag.
+  std::optional<Dictionary> storebagForClientType(std::int32_t clientType);
+
+  /// The version of the last good section; never fetches.
+  std::optional<std::string> versionForClientType(std::int32_t clientType) const;
+
+ private:
+  enum class FetchState { Successful, Failure };
+
+  struct Record {
+    std::optional<Dictionary> storebagData;
+    std::optional<std::string> storebagVersion;
+    std::optional<WallTime> storebagFetchTime;  // end of the last attempt
+    FetchState storebagFetchState = FetchState::Failure;
+    std::int32_t storebagMaxAge = 0;  // seconds, as the last attempt reported it
+    std::optional<std::string> storebagLastModified;
+  };
+
+  /// Whether the record may be served without a fetch; logs why.
+  bool isFresh(const Record& record, std::int32_t clientType) const;
+  void fetchAndCacheStorebag(std::int32_t clientType);
+
+  const StorebagFetch _fetch;
+  const WallClock& _clock;
+  std::map<std::string, Record> _records;
+};
+
+}  // namespace vesk

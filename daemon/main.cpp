@@ -1,0 +1,61 @@
+// veskreportingd: accepts reporting messages from local clients and delivers them.
+#include <cstdio>
+#include <exception>
+
+#include "client/common/Logging.h"
+#include "daemon/Daemon.h"
+#include "daemon/DaemonOptions.h"
+#include "daemon/RunLoop.h"
+#include "platform/files/RootPrefix.h"
+#include "platform/log/SystemLog.h"
+#include "platform/sandbox/Sandbox.h"
+#include "platform/service/SchedulingClass.h"
+
+namespace {
+
+constexpr char kServiceName[] = "com.corvane.veskreportingd";
+constexpr std::chrono::seconds kIdleExitWhenActivated{
+    300};  // the manager starts us again on the next connection
+
+int run(const vesk::DaemonOptions& options) {
+  vesk::enterSchedulingClass(vesk::SchedulingClass::Utility, 0);
+  vesk::VeskReportingLogging::startLogging("veskreportingd", "Daemon");
+  if (options.sandbox) {
+    if (auto error = vesk::enterSandbox(kServiceName)) {
+      VESK_LOG_ERROR("main: confine_enter() fails: %s\n", error->c_str());
+      return -1;
+    }
+  }
+  vesk::ServiceManager serviceManager;
+  vesk::BusyMarker busyMarker;
+  vesk::RunLoop::Options loopOptions{options.idleExit};
+  if (!options.idleExit && serviceManager.isSocketActivated()) loopOptions.idleExit = kIdleExitWhenActivated;
+  vesk::RunLoop loop(loopOptions, busyMarker, serviceManager);
+
+  vesk::Daemon daemon(serviceManager, busyMarker);
+  daemon.resume();
+  VESK_LOG_INFO("%s", options.sandbox ? "main: Listener resumes with sandbox, start loop."
+                                      : "main: Listener resumes without sandbox, start loop.");
+  serviceManager.notifyReady();
+  loop.run();
+  serviceManager.notifyStopping();
+  daemon.stop();
+  vesk::VeskReportingLogging::close();
+  return 0;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  auto parsed = vesk::parseDaemonOptions(argc, argv);
+  if (const int* status = std::get_if<int>(&parsed)) return *status;
+  const auto& options = std::get<vesk::DaemonOptions>(parsed);
+  if (options.root) vesk::setRootPrefix(*options.root);
+  vesk::SystemLog::setLevel(options.logLevel);
+  try {
+    return run(options);
+  } catch (const std::exception& error) {
+    VESK_LOG_ERROR("main: %s", error.what());
+    return 1;
+  }
+}

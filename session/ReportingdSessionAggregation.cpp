@@ -1,0 +1,92 @@
+// A session and its relatives: user info, aggregation, combined session IDs.
+#include <VeskReporting/VeskReportingKeys.h>
+
+#include "client/protocol/ClientSessionReplyProxy.h"
+#include "platform/log/SystemLog.h"
+#include "session/ReportingdSession.h"
+
+namespace vesk {
+
+namespace {
+
+// Both present as texts and the same.
+bool sameText(const std::optional<Dictionary>& a, const std::optional<Dictionary>& b, const char* key) {
+  auto first = a ? a->text(key) : std::nullopt;
+  auto second = b ? b->text(key) : std::nullopt;
+  return first && second && *first == *second;
+}
+
+}  // namespace
+
+void ReportingdSession::receivedUserInfo(const std::optional<Dictionary>& userInfo) {
+  auto stored = this->userInfo();
+  if (stored) {
+    if (sameText(userInfo, stored, kVeskReportingUserInfoClientName) &&
+        sameText(userInfo, stored, kVeskReportingUserInfoServiceName)) {
+      return;
+    }
+  } else if (!userInfo) {
+    return;
+  }
+  VESK_LOG_DEBUG("receivedUserInfo: Received new user info for session %u", sessionID());
+  {
+    MutexLock lock(_mutex);
+    _userInfo = userInfo;
+  }
+  updateSessionWithDefaultSessionInfo();
+}
+
+std::int32_t ReportingdSession::getSessionHierarchy() const {
+  auto set = backends();
+  auto backend = set ? findBackend(*set, kVeskReportingBackendHTTPPost) : nullptr;
+  return backend ? backend->hierarchy() : 0;
+}
+
+void ReportingdSession::aggregateMessage(const std::optional<Dictionary>& sessionInfo, double timestamp,
+                                         std::uint16_t category, std::uint16_t type,
+                                         const std::optional<Dictionary>& payload) {
+  {
+    // Declared outside the lock's scope: the last holder of a session destroys it, and must not do so under
+    // the lock.
+    std::shared_ptr<ReportingdSession> ancestor;
+    RecursiveMutexLock monitor(_sessionDelegate->monitor());
+    ancestor = _sessionDelegate->getAncestorWithAggregatorForSession(*this);
+    if (ancestor) {
+      ancestor->sendToAggregator(sessionInfo, timestamp, category, type, payload);
+      return;
+    }
+  }
+  if (hasAggregator()) sendToAggregator(this->sessionInfo(), timestamp, category, type, payload);
+}
+
+void ReportingdSession::sendToAggregator(const std::optional<Dictionary>& sessionInfo, double timestamp,
+                                         std::uint16_t category, std::uint16_t type,
+                                         const std::optional<Dictionary>& payload) {
+  ClientSessionReplyProxy proxy(*_connection, [](const std::string& error) {
+    VESK_LOG_ERROR("sendMessageWithDictionary: Failed to get remote object proxy: %s", error.c_str());
+  });
+  proxy.sendMessageToClient(sessionInfo, timestamp, category, type, payload);
+}
+
+void ReportingdSession::shutdownSessionAggregation() {
+  VESK_LOG_DEBUG("shutdownSessionAggregation: Disable aggregation module for session %u", sessionID());
+  bool wasOn;
+  {
+    MutexLock lock(_mutex);
+    wasOn = std::exchange(_hasAggregator, false);
+  }
+  if (wasOn) sendToAggregator(std::nullopt, 0, 0, 0, std::nullopt);
+}
+
+void ReportingdSession::updateCombinedSessionID() {
+  auto parentID = _sessionDelegate->parentSessionIDStringForSession(*this);
+  if (!parentID) return;
+  std::string combined = *parentID + "." + _sessionIDString;
+  VESK_LOG_DEBUG("updateCombinedSessionID: Updating combined session ID '%s' for session %u backends",
+                 combined.c_str(), sessionID());
+  auto set = backends();
+  if (!set) return;
+  for (const auto& [name, backend] : *set) backend->setCorrelatedSessionID(combined);
+}
+
+}  // namespace vesk
