@@ -23,11 +23,12 @@ struct HTTPRequest {
 
   std::string method = "GET";
   std::string url;  ///< only http and https are followed
-  /// Sent in this order. Names and values must not hold control characters (such a header is left out and
-  /// logged).
+  /// Sent in this order. Names must be tokens and values must not hold control characters (such a header is
+  /// left out and logged). Nothing is added but Host, User-Agent, Accept and Content-Length, unless given.
   std::vector<std::pair<std::string, std::string>> headers;
   std::string body;
-  std::chrono::milliseconds timeout{60'000};  ///< for each attempt, from start to the last byte
+  /// From `start` to the last byte; for a post that may be retried, from the start of each attempt.
+  std::chrono::milliseconds timeout{60'000};
   Retry retry = Retry::Never;
 };
 
@@ -75,11 +76,14 @@ class HTTPClient {
   struct Options {
     std::string userAgent = "veskreportingd";
     std::size_t maximumBody = std::size_t{4} << 20;     ///< bytes of a response body
-    std::size_t maximumWaiting = std::size_t{8} << 20;  ///< bytes of post bodies that wait for a retry
+    std::size_t maximumWaiting = std::size_t{8} << 20;  ///< bytes of post bodies that wait out an outage
+    std::size_t maximumQueued = std::size_t{64} << 20;  ///< bytes of memory for posts that wait their turn
     std::chrono::milliseconds retryFor{60'000};         ///< from the first attempt of a post
     std::chrono::milliseconds firstRetryAfter{200};     ///< doubled each time, up to 10 s, ±50 % jitter
     std::chrono::milliseconds connectTimeout{15'000};
-    std::size_t maximumConnectionsPerHost = 6;  ///< further requests wait in order
+    /// Further requests to that host wait in order. Posts leave one connection to the other requests, so that
+    /// a fetch does not wait behind them.
+    std::size_t maximumConnectionsPerHost = 6;
   };
 
   /// Starts the thread.

@@ -1,0 +1,237 @@
+#include "platform/http/HTTPWorker.h"
+
+#include <pthread.h>
+#include <signal.h>
+
+#include <algorithm>
+#include <chrono>
+#include <cstdlib>
+#include <exception>
+#include <limits>
+#include <new>
+#include <stdexcept>
+#include <utility>
+
+#include "platform/log/SystemLog.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr long kKeptConnections = 32;
+
+std::optional<std::string> authoritiesFromEnvironment() {
+  const char* file = std::getenv("SSL_CERT_FILE");
+  if (!file || !*file) return std::nullopt;
+  return file;
+}
+
+CURLM* makeMulti(std::size_t connectionsPerHost) {
+  // The library is never shut down: other parts of the process may use it too.
+  static const CURLcode initialised = curl_global_init(CURL_GLOBAL_DEFAULT);
+  CURLM* multi = initialised == CURLE_OK ? curl_multi_init() : nullptr;
+  if (!multi) throw std::runtime_error("HTTPClient: libcurl can not be initialised");
+  curl_multi_setopt(multi, CURLMOPT_MAX_HOST_CONNECTIONS, static_cast<long>(connectionsPerHost));
+  curl_multi_setopt(multi, CURLMOPT_MAXCONNECTS, kKeptConnections);
+  return multi;
+}
+
+// Signals are for the main thread; a broken pipe shows as an error where it happens.
+void blockSignals() {
+  sigset_t all;
+  sigfillset(&all);
+  pthread_sigmask(SIG_SETMASK, &all, nullptr);
+}
+
+int millisecondsUntil(HTTPSchedule::Instant time) {
+  auto left = std::chrono::ceil<std::chrono::milliseconds>(time - std::chrono::steady_clock::now());
+  return static_cast<int>(std::clamp<long long>(left.count(), 0, std::numeric_limits<int>::max()));
+}
+
+}  // namespace
+
+HTTPClient::Worker::Worker(Options options)
+    : _options(std::move(options)),
+      _authorities(authoritiesFromEnvironment()),
+      _multi(makeMulti(std::max<std::size_t>(_options.maximumConnectionsPerHost, 1))),
+      _schedule(_options),
+      _thread([this] { run(); }) {}
+
+HTTPClient::Worker::~Worker() {
+  {
+    MutexLock lock(_mutex);
+    _stopping = true;
+  }
+  curl_multi_wakeup(_multi.get());
+  _thread.join();
+}
+
+void HTTPClient::Worker::start(HTTPRequest request, Completion completion) {
+  auto exchange = std::make_unique<HTTPExchange>(std::move(request), std::move(completion),
+                                                 std::chrono::steady_clock::now());
+  bool mustWake;
+  {
+    MutexLock lock(_mutex);
+    // What lies in the inbox already has woken the thread.
+    mustWake = _inbox.empty();
+    _inbox.push_back(std::move(exchange));
+    ++_outstanding;
+  }
+  if (mustWake) curl_multi_wakeup(_multi.get());
+}
+
+bool HTTPClient::Worker::waitUntilIdle(std::chrono::milliseconds timeout) {
+  auto deadline = std::chrono::steady_clock::now() + timeout;
+  MutexLock lock(_mutex);
+  while (_outstanding > 0) {
+    if (_becameIdle.wait_until(_mutex, deadline) == std::cv_status::timeout) return _outstanding == 0;
+  }
+  return true;
+}
+
+void HTTPClient::Worker::run() noexcept {
+  blockSignals();
+  pthread_setname_np(pthread_self(), "http");
+  for (bool goOn = true; goOn;) {
+    try {
+      goOn = turn();
+    } catch (const std::exception& error) {
+      // Whatever exchange was in hand has completed itself.
+      VESK_LOG_ERROR("HTTPClient: %s", error.what());
+    }
+  }
+  stop();
+}
+
+bool HTTPClient::Worker::turn() {
+  if (!takeInbox()) return false;
+  _schedule.advance(std::chrono::steady_clock::now());
+  startReady();
+  int running = 0;
+  curl_multi_perform(_multi.get(), &running);
+  bool freed = collectFinished();
+  completeGivenUp();
+  // What ended made room: the next request starts before the thread sleeps.
+  if (!freed) sleep();
+  return true;
+}
+
+bool HTTPClient::Worker::takeInbox() {
+  {
+    MutexLock lock(_mutex);
+    if (_stopping) return false;
+    std::swap(_arrived, _inbox);
+  }
+  for (auto& exchange : _arrived) _schedule.add(std::move(exchange));
+  _arrived.clear();
+  return true;
+}
+
+void HTTPClient::Worker::startReady() {
+  while (auto exchange = _schedule.next(std::chrono::steady_clock::now())) begin(std::move(exchange));
+}
+
+void HTTPClient::Worker::begin(Exchange exchange) {
+  std::optional<HTTPError> error;
+  HTTPTransfer* transfer = nullptr;
+  try {
+    transfer = &idleTransfer();
+    error = transfer->prepare(exchange, std::chrono::steady_clock::now());
+  } catch (const std::bad_alloc&) {
+    error = HTTPError{HTTPError::Kind::Other, "out of memory"};
+  }
+  if (!error && curl_multi_add_handle(_multi.get(), transfer->handle()) != CURLM_OK) {
+    error = HTTPError{HTTPError::Kind::Other, "libcurl did not take the request"};
+  }
+  if (!error) return;
+  if (transfer) {
+    if (!exchange) exchange = transfer->release();
+    _idle.push_back(transfer);
+  }
+  _schedule.failed(std::move(exchange), std::move(*error), false, std::chrono::steady_clock::now());
+}
+
+bool HTTPClient::Worker::collectFinished() {
+  bool any = false;
+  int left = 0;
+  while (CURLMsg* message = curl_multi_info_read(_multi.get(), &left)) {
+    if (message->msg != CURLMSG_DONE) continue;
+    HTTPTransfer* transfer = nullptr;
+    curl_easy_getinfo(message->easy_handle, CURLINFO_PRIVATE, &transfer);
+    CURLcode code = message->data.result;
+    curl_multi_remove_handle(_multi.get(), message->easy_handle);
+    conclude(*transfer, code);
+    any = true;
+  }
+  return any;
+}
+
+void HTTPClient::Worker::conclude(HTTPTransfer& transfer, CURLcode code) {
+  auto outcome = transfer.finish(code);
+  auto exchange = transfer.release();
+  _idle.push_back(&transfer);
+  if (outcome.answered) {
+    _schedule.answered(*exchange);
+    complete(std::move(exchange), outcome.result);
+  } else {
+    _schedule.failed(std::move(exchange), std::move(*outcome.result.error), outcome.mayRetry,
+                     std::chrono::steady_clock::now());
+  }
+}
+
+void HTTPClient::Worker::completeGivenUp() {
+  for (auto& [exchange, error] : _schedule.takeGivenUp()) {
+    complete(std::move(exchange), HTTPResult{std::nullopt, std::move(error)});
+  }
+}
+
+void HTTPClient::Worker::complete(Exchange exchange, const HTTPResult& result) noexcept {
+  exchange->complete(result);
+  exchange.reset();
+  MutexLock lock(_mutex);
+  if (--_outstanding == 0) _becameIdle.notify_all();
+}
+
+void HTTPClient::Worker::sleep() {
+  auto next = _schedule.nextAdvance();
+  int timeout = next ? millisecondsUntil(*next) : std::numeric_limits<int>::max();
+  CURLMcode code = curl_multi_poll(_multi.get(), nullptr, 0, timeout, nullptr);
+  if (code != CURLM_OK) {
+    VESK_LOG_ERROR("HTTPClient: %s", curl_multi_strerror(code));
+    std::this_thread::sleep_for(std::chrono::milliseconds(100));  // it can't be waited for at present
+  }
+}
+
+HTTPTransfer& HTTPClient::Worker::idleTransfer() {
+  if (_idle.empty()) {
+    _transfers.push_back(std::make_unique<HTTPTransfer>(_options, _authorities));
+    _idle.reserve(_transfers.size());
+    _idle.push_back(_transfers.back().get());
+  }
+  HTTPTransfer* transfer = _idle.back();
+  _idle.pop_back();
+  return *transfer;
+}
+
+void HTTPClient::Worker::stop() noexcept {
+  const HTTPResult stopped{std::nullopt, HTTPError{HTTPError::Kind::Stopped, "the client was stopped"}};
+  for (auto& transfer : _transfers) {
+    if (!transfer->isBusy()) continue;
+    curl_multi_remove_handle(_multi.get(), transfer->handle());
+    complete(transfer->release(), stopped);
+  }
+  for (auto& exchange : _schedule.takeAll()) complete(std::move(exchange), stopped);
+  for (bool more = true; more;) {
+    // A completion may have asked for more.
+    {
+      MutexLock lock(_mutex);
+      std::swap(_arrived, _inbox);
+    }
+    more = !_arrived.empty();
+    for (auto& exchange : _arrived) complete(std::move(exchange), stopped);
+    _arrived.clear();
+  }
+  _transfers.clear();
+}
+
+}  // namespace vesk

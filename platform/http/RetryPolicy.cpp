@@ -1,0 +1,20 @@
+#include "platform/http/RetryPolicy.h"
+
+#include <algorithm>
+
+namespace vesk {
+
+std::optional<RetryPolicy::Duration> RetryPolicy::waitAfter(unsigned failures, Instant firstAttempt,
+                                                            Instant now, std::size_t waiting,
+                                                            double random) const {
+  Duration left = firstAttempt + retryFor - now;
+  if (left <= Duration::zero() || waiting > maximumWaiting) return std::nullopt;
+
+  Duration wait = std::min(firstWait, longestWait);
+  for (unsigned i = 1; i < failures && wait < longestWait; ++i) wait = std::min(wait * 2, longestWait);
+  auto spread = std::chrono::duration_cast<Duration>(wait * (0.5 + random));
+  // The last attempt is made when the time is up, not left out because a whole wait no longer fits.
+  return std::min(spread, left);
+}
+
+}  // namespace vesk
