@@ -106,8 +106,8 @@ class BusEncoder {
   bool append(const std::optional<std::vector<std::string>>& value);
   /// As a variant.
   bool append(const Value& value);
-  /// As an array of at most one descriptor, which the message duplicates; -1 for none.
-  bool appendDescriptor(int descriptor);
+  /// The message duplicates the descriptor.
+  bool append(IPCDescriptor value);
 
   bool ok() const noexcept { return _result == CodecResult::Ok; }
   CodecResult result() const noexcept { return _result; }

@@ -140,9 +140,10 @@ bool BusEncoder::append(const std::vector<std::string>& value) {
   return close();
 }
 
-bool BusEncoder::appendDescriptor(int descriptor) {
-  return open(SD_BUS_TYPE_ARRAY, "h") && (descriptor < 0 || basic(SD_BUS_TYPE_UNIX_FD, &descriptor)) &&
-         close();
+bool BusEncoder::append(IPCDescriptor value) {
+  if (!open(SD_BUS_TYPE_ARRAY, "h")) return false;
+  if (value.borrowed >= 0 && !basic(SD_BUS_TYPE_UNIX_FD, &value.borrowed)) return false;
+  return close();
 }
 
 bool BusEncoder::append(const Value& value) {

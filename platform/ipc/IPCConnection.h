@@ -34,13 +34,19 @@ class IPCExportedObject {
   virtual void handle(IPCIncomingCall& call) = 0;
 };
 
-/// An argument of a call to the remote object; its type decides its D-Bus type (docs/wire.md): b, q, d, s,
-/// a{sv}, av, aa{sv}, as (at most one), as (any number), aas (at most one).
-using IPCArgument = std::variant<bool, std::uint16_t, double, std::string, Dictionary, List,
-                                 std::optional<Dictionary>, std::optional<std::string>,
-                                 std::vector<std::string>, std::optional<std::vector<std::string>>>;
+/// A descriptor that goes along with a call; -1 for none. Borrowed: it stays open until the call was sent.
+struct IPCDescriptor {
+  int borrowed = -1;
+};
 
-/// A one-way call to the remote object.
+/// An argument of a call; its type decides its D-Bus type (docs/wire.md): b, q, d, s, a{sv}, av, aa{sv}, as
+/// (at most one), as (any number), aas (at most one), ah (at most one).
+using IPCArgument =
+    std::variant<bool, std::uint16_t, double, std::string, Dictionary, List, std::optional<Dictionary>,
+                 std::optional<std::string>, std::vector<std::string>,
+                 std::optional<std::vector<std::string>>, IPCDescriptor>;
+
+/// A call to the remote object.
 struct IPCOutgoingCall {
   const char* interfaceName;
   const char* member;
