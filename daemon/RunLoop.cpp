@@ -1,0 +1,87 @@
+#include "daemon/RunLoop.h"
+
+#include <poll.h>
+#include <sys/eventfd.h>
+#include <sys/signalfd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <climits>
+#include <system_error>
+
+namespace vesk {
+
+namespace {
+
+sigset_t stopSignals() {
+  sigset_t signals;
+  ::sigemptyset(&signals);
+  ::sigaddset(&signals, SIGTERM);
+  ::sigaddset(&signals, SIGINT);
+  return signals;
+}
+
+FileDescriptor checked(int descriptor, const char* what) {
+  if (descriptor < 0) throw std::system_error(errno, std::generic_category(), what);
+  return FileDescriptor(descriptor);
+}
+
+}  // namespace
+
+RunLoop::RunLoop(Options options, BusyMarker& busyMarker, ServiceManager& serviceManager)
+    : _options(options), _busyMarker(busyMarker), _serviceManager(serviceManager) {
+  sigset_t signals = stopSignals();
+  _signals = checked(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK), "signalfd");
+  _stopRequest = checked(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK), "eventfd");
+  ::pthread_sigmask(SIG_BLOCK, &signals, &_previousMask);
+  ::signal(SIGPIPE, SIG_IGN);
+}
+
+RunLoop::~RunLoop() { ::pthread_sigmask(SIG_SETMASK, &_previousMask, nullptr); }
+
+RunLoop::Outcome RunLoop::run() {
+  noteBusyMarker(Clock::now());
+  pingWatchdog(Clock::now());
+  for (;;) {
+    pollfd events[] = {
+        {_signals.get(), POLLIN, 0}, {_stopRequest.get(), POLLIN, 0}, {_busyMarker.descriptor(), POLLIN, 0}};
+    if (::poll(events, std::size(events), pollTimeout(Clock::now())) < 0) continue;
+    if (events[0].revents != 0) {
+      signalfd_siginfo signal{};
+      [[maybe_unused]] auto taken = ::read(_signals.get(), &signal, sizeof signal);
+      ::pthread_sigmask(SIG_SETMASK, &_previousMask, nullptr);
+      return Outcome::Signalled;
+    }
+    if (events[1].revents != 0) return Outcome::Stopped;
+    auto now = Clock::now();
+    if (events[2].revents != 0) noteBusyMarker(now);
+    pingWatchdog(now);
+    if (_idleDeadline && now >= *_idleDeadline && !_busyMarker.isBusy()) return Outcome::Idle;
+  }
+}
+
+void RunLoop::stop() noexcept { ::eventfd_write(_stopRequest.get(), 1); }
+
+void RunLoop::noteBusyMarker(Clock::time_point now) {
+  _busyMarker.acknowledge();
+  _idleDeadline.reset();
+  if (_options.idleExit && !_busyMarker.isBusy()) _idleDeadline = now + *_options.idleExit;
+}
+
+void RunLoop::pingWatchdog(Clock::time_point now) {
+  auto interval = _serviceManager.watchdogInterval();
+  if (!interval || (_nextPing && now < *_nextPing)) return;
+  _serviceManager.pingWatchdog();
+  _nextPing = now + *interval;
+}
+
+int RunLoop::pollTimeout(Clock::time_point now) const {
+  auto next = Clock::time_point::max();
+  if (_idleDeadline) next = std::min(next, *_idleDeadline);
+  if (_nextPing) next = std::min(next, *_nextPing);
+  if (next == Clock::time_point::max()) return -1;
+  auto wait = std::chrono::ceil<std::chrono::milliseconds>(next - now).count();
+  return static_cast<int>(std::clamp<decltype(wait)>(wait, 0, INT_MAX));
+}
+
+}  // namespace vesk

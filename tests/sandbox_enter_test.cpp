@@ -1,0 +1,240 @@
+// What a process may and may not do once it is inside the sandbox that is shipped for the daemon.
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <netdb.h>
+#include <netinet/in.h>
+#include <sys/ioctl.h>
+#include <sys/mman.h>
+#include <sys/mount.h>
+#include <sys/ptrace.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <sys/uio.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+
+#include <csignal>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/files/FileDescriptor.h"
+#include "platform/files/RootPrefix.h"
+#include "platform/sandbox/Sandbox.h"
+#include "tests/support/TempDirectory.h"
+
+namespace vesk {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr const char* kProfile = "com.corvane.veskreportingd";
+
+/// Runs `body` in a child process, for what it does to its process can't be undone. Returns its text.
+std::string inChild(const std::function<std::string()>& body) {
+  int ends[2];
+  if (::pipe(ends) != 0) return "no pipe";
+  FileDescriptor in(ends[0]);
+  FileDescriptor out(ends[1]);
+  pid_t child = ::fork();
+  if (child == 0) {
+    std::string text = body();
+    bool written = ::write(out.get(), text.data(), text.size()) == static_cast<ssize_t>(text.size());
+    ::_exit(written ? 0 : 1);
+  }
+  out.reset();
+  std::string text;
+  char piece[4096];
+  for (ssize_t size; (size = ::read(in.get(), piece, sizeof piece)) > 0;) {
+    text.append(piece, static_cast<std::size_t>(size));
+  }
+  int status = 0;
+  ::waitpid(child, &status, 0);
+  return status == 0 ? text : text + "child ended with status " + std::to_string(status);
+}
+
+class SandboxTest : public testing::Test {
+ protected:
+  SandboxTest() {
+    directory.write("outside/file", "outside");
+    fs::create_directories(profilePath().parent_path());
+    fs::copy_file(fs::path(VESK_SANDBOX_PROFILES) / profilePath().filename(), profilePath());
+  }
+
+  fs::path profilePath() const {
+    return root / "usr/share/veskreporting/sandbox/com.corvane.veskreportingd.toml";
+  }
+
+  /// Why the sandbox could not be entered, or else what `body` returned inside it, on a thread made later.
+  std::string inside(const std::function<std::string()>& body) const {
+    return inChild([&] {
+      setRootPrefix(root.string());
+      if (auto error = enterSandbox(kProfile)) return *error;
+      std::string text;
+      std::thread([&] { text = body(); }).join();
+      return text;
+    });
+  }
+
+  const test::TempDirectory directory;
+  const fs::path root = directory.path();
+};
+
+/// One thing to try; the result is that of a system call.
+struct Probe {
+  const char* name;
+  std::function<long()> call;
+};
+
+/// A line for each probe that `isWrong` finds fault with, given its error number (0: it succeeded).
+std::string faults(const std::vector<Probe>& probes, bool (*isWrong)(int error)) {
+  std::string text;
+  for (const Probe& probe : probes) {
+    errno = 0;
+    int error = probe.call() < 0 ? errno : 0;
+    if (isWrong(error)) text += std::string(probe.name) + ": " + std::strerror(error) + "\n";
+  }
+  return text;
+}
+
+long opens(const fs::path& path, int flags) {
+  return FileDescriptor(::open(path.c_str(), flags, 0600)).get();
+}
+
+FileDescriptor socketBoundTo(const fs::path& path) {
+  FileDescriptor descriptor(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  path.string().copy(address.sun_path, sizeof address.sun_path - 1);
+  if (::bind(descriptor.get(), reinterpret_cast<sockaddr*>(&address), sizeof address) != 0)
+    descriptor.reset();
+  return descriptor;
+}
+
+TEST_F(SandboxTest, DeniesWhatIsNotGranted) {
+  pid_t parent = ::getpid();
+  const std::string proc = "/proc/" + std::to_string(parent);
+  const fs::path outside = root / "outside" / "file";
+  char word[8] = {};
+  iovec local{word, sizeof word};
+  char noArgument[] = "true";
+  char* arguments[] = {noArgument, nullptr};
+  void* page = ::mmap(nullptr, 4096, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
+  const std::vector<Probe> probes = {
+      {"read /etc/shadow", [] { return opens("/etc/shadow", O_RDONLY); }},
+      {"list the root directory", [] { return opens("/", O_RDONLY | O_DIRECTORY); }},
+      {"read another file", [&] { return opens(outside, O_RDONLY); }},
+      {"write another file", [&] { return opens(outside, O_WRONLY); }},
+      {"make another file", [&] { return opens(root / "outside" / "new", O_WRONLY | O_CREAT); }},
+      {"write the profile", [&] { return opens(profilePath(), O_WRONLY); }},
+      {"truncate another file", [&] { return ::truncate(outside.c_str(), 0); }},
+      {"truncate a file by reading", [&] { return opens(profilePath(), O_RDONLY | O_TRUNC); }},
+      {"move a file in",
+       [&] { return ::rename(outside.c_str(), (root / "var/lib/veskreportingd/file").c_str()); }},
+      {"remove another file", [&] { return ::unlink(outside.c_str()); }},
+      {"own another file", [&] { return ::chown(outside.c_str(), 1, 1); }},
+      {"bind a socket elsewhere", [&] { return socketBoundTo(root / "outside" / "socket").get(); }},
+      {"read another process's environment", [&] { return opens(proc + "/environ", O_RDONLY); }},
+      {"run a program", [&] { return ::execv("/bin/true", arguments); }},
+      {"fork", [] { return ::fork(); }},
+      {"trace a process", [&] { return ::ptrace(PTRACE_ATTACH, parent, nullptr, nullptr); }},
+      {"read a process's memory", [&] { return ::process_vm_readv(parent, &local, 1, &local, 1, 0); }},
+      {"signal a process", [&] { return ::kill(parent, 0); }},
+      {"make a namespace", [] { return ::unshare(CLONE_NEWNET); }},
+      {"mount", [] { return ::mount("none", "/", "tmpfs", 0, nullptr); }},
+      {"change the root", [] { return ::chroot("/"); }},
+      {"become a user", [] { return ::setuid(::getuid()); }},
+      {"load a BPF program", [] { return ::syscall(SYS_bpf, 0, nullptr, 0); }},
+      {"load a module", [] { return ::syscall(SYS_init_module, nullptr, 0, ""); }},
+      {"use a key ring", [] { return ::syscall(SYS_keyctl, 0, 0, 0); }},
+      {"handle page faults", [] { return ::syscall(SYS_userfaultfd, 0); }},
+      {"use io_uring", [] { return ::syscall(SYS_io_uring_setup, 1, nullptr); }},
+      {"open a file by handle", [] { return ::syscall(SYS_open_by_handle_at, -1, nullptr, 0); }},
+      {"make a device", [&] { return ::mknod((root / "run/veskreportingd/x").c_str(), S_IFCHR, 0); }},
+      {"type into a terminal", [&] { return ::ioctl(0, TIOCSTI, word); }},
+      {"open a packet socket", [] { return ::socket(AF_PACKET, SOCK_DGRAM, 0); }},
+      {"open a raw socket", [] { return ::socket(AF_INET, SOCK_RAW, IPPROTO_ICMP); }},
+      {"make a page executable", [&] { return ::mprotect(page, 4096, PROT_READ | PROT_EXEC); }},
+      {"map writable code",
+       [] {
+         void* code = ::mmap(nullptr, 4096, PROT_WRITE | PROT_EXEC, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
+         return code == MAP_FAILED ? -1L : 0L;
+       }},
+  };
+  EXPECT_EQ(
+      inside([&] { return faults(probes, [](int e) { return e != EPERM && e != EACCES && e != EXDEV; }); }),
+      "");
+  ::munmap(page, 4096);
+}
+
+TEST_F(SandboxTest, AllowsWhatTheDaemonDoes) {
+  const fs::path certificates = directory.write("ca/certificates.pem", "authority");
+  const fs::path replacement = directory.write("ca/replacement.pem", "authority");
+  const fs::path settings = directory.write("etc/veskreporting/device.toml", "");
+  const fs::path state = root / "var/lib/veskreportingd";
+  const fs::path logs = root / "var/mobile/Library/Logs/Dunmore";
+  const fs::path socketPath = root / "run/veskreportingd/socket";
+  const std::vector<Probe> probes = {
+      {"read the profile", [&] { return opens(profilePath(), O_RDONLY); }},
+      {"read settings", [&] { return opens(settings, O_RDONLY); }},
+      {"read certificates", [] { return opens("/etc/ssl/certs", O_RDONLY); }},
+      {"read other certificates", [&] { return opens(certificates, O_RDONLY); }},
+      {"read what replaces them", [&] { return opens(replacement, O_RDONLY); }},
+      {"read about itself", [] { return opens("/proc/self/maps", O_RDONLY); }},
+      {"discard", [] { return opens("/dev/null", O_WRONLY); }},
+      {"make a file", [&] { return opens(state / "new", O_WRONLY | O_CREAT | O_EXCL); }},
+      {"rename a file", [&] { return ::rename((state / "new").c_str(), (state / "old").c_str()); }},
+      {"truncate a file", [&] { return opens(state / "old", O_WRONLY | O_TRUNC); }},
+      {"remove a file", [&] { return ::unlink((state / "old").c_str()); }},
+      {"make the log directory", [&] { return ::mkdir((logs / "Retired").c_str(), 0755); }},
+      {"write the log", [&] { return opens(logs / "Retired" / "log", O_WRONLY | O_CREAT | O_APPEND); }},
+      {"listen", [&] { return ::listen(socketBoundTo(socketPath).get(), 1); }},
+      {"open the socket to all", [&] { return ::chmod(socketPath.c_str(), 0666); }},
+      {"remove the socket", [&] { return ::unlink(socketPath.c_str()); }},
+      {"look a name up",
+       [] {
+         addrinfo* found = nullptr;
+         int result = ::getaddrinfo("localhost", "80", nullptr, &found);
+         if (found) ::freeaddrinfo(found);
+         return result == 0 ? 0L : -1L;
+       }},
+      {"open a TCP socket", [] { return FileDescriptor(::socket(AF_INET6, SOCK_STREAM, 0)).get(); }},
+      {"open a UDP socket", [] { return FileDescriptor(::socket(AF_INET, SOCK_DGRAM, 0)).get(); }},
+      {"signal itself", [] { return ::raise(SIGWINCH); }},
+  };
+  ::setenv("SSL_CERT_FILE", certificates.c_str(), 1);
+  EXPECT_EQ(inside([&] { return faults(probes, [](int error) { return error != 0; }); }), "");
+  ::unsetenv("SSL_CERT_FILE");
+  EXPECT_EQ(fs::status(socketPath.parent_path()).permissions(), fs::perms{0755});
+  EXPECT_EQ(fs::status(state).permissions(), fs::perms{0750});
+}
+
+TEST_F(SandboxTest, SaysWhyItCannotBeEntered) {
+  const auto why = [&] { return inside([] { return std::string("entered"); }); };
+  const std::string path = profilePath().string() + ": ";
+  struct {
+    const char* profile;
+    std::string error;
+  } cases[] = {
+      {"landlock = ", path + "line 1"},
+      {"landlock = \"perhaps\"", path + R"(landlock: must be "required" or "if-available")"},
+      {"[machine]\nread = [\"/no/such/file\"]", "/no/such/file: No such file or directory"},
+      {"[root]\nwrite = [\"/outside/file/below\"]",
+       (root / "outside/file/below").string() + ": Not a directory"},
+  };
+  for (const auto& [profile, error] : cases) {
+    std::ofstream(profilePath()) << profile;
+    EXPECT_EQ(why().substr(0, error.size()), error);
+  }
+  fs::remove(profilePath());
+  EXPECT_EQ(why(), path + "no such file");
+  EXPECT_EQ(enterSandbox("../etc/passwd"), "\"../etc/passwd\" is no name of a profile");
+}
+
+}  // namespace
+}  // namespace vesk

@@ -1,0 +1,171 @@
+// The run loop with its busy marker and a service manager that is a real socket of ours.
+#include <gtest/gtest.h>
+#include <sched.h>
+#include <sys/resource.h>
+#include <sys/socket.h>
+#include <sys/time.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <future>
+#include <string>
+#include <thread>
+
+#include "daemon/RunLoop.h"
+#include "platform/service/SchedulingClass.h"
+#include "tests/support/TempDirectory.h"
+
+namespace vesk {
+namespace {
+
+using namespace std::chrono_literals;
+using Outcome = RunLoop::Outcome;
+
+class RunLoopTest : public testing::Test {
+ protected:
+  void SetUp() override {
+    _manager = FileDescriptor(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+    bindTo(_manager, _directory / "notify");
+    timeval patience{20, 0};
+    ::setsockopt(_manager.get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
+    ::setenv("NOTIFY_SOCKET", (_directory / "notify").c_str(), 1);
+  }
+  void TearDown() override { ::unsetenv("NOTIFY_SOCKET"); }
+
+  static void bindTo(const FileDescriptor& descriptor, const std::filesystem::path& path) {
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    path.string().copy(address.sun_path, sizeof address.sun_path - 1);
+    ASSERT_EQ(::bind(descriptor.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+  }
+
+  /// What the manager is told next.
+  std::string notification() const {
+    char text[256];
+    ssize_t size = ::recv(_manager.get(), text, sizeof text, 0);
+    return size < 0 ? "nothing" : std::string(text, static_cast<std::size_t>(size));
+  }
+
+  const test::TempDirectory _directory;
+  FileDescriptor _manager;
+  BusyMarker _busy;
+};
+
+TEST_F(RunLoopTest, StopsFromAnyThreadAlsoBeforehand) {
+  ServiceManager service;
+  RunLoop loop({}, _busy, service);
+  std::thread stopper([&] { loop.stop(); });
+  EXPECT_EQ(loop.run(), Outcome::Stopped);
+  stopper.join();
+  EXPECT_EQ(loop.run(), Outcome::Stopped);
+}
+
+TEST_F(RunLoopTest, StopsOnEachStopSignal) {
+  ServiceManager service;
+  for (int signal : {SIGTERM, SIGINT}) {
+    RunLoop loop({}, _busy, service);
+    ::kill(::getpid(), signal);
+    EXPECT_EQ(loop.run(), Outcome::Signalled);
+  }
+}
+
+TEST_F(RunLoopTest, ASecondSignalEndsASlowStop) {
+  EXPECT_EXIT(
+      {
+        ServiceManager service;
+        RunLoop loop({}, _busy, service);
+        ::kill(::getpid(), SIGTERM);
+        if (loop.run() == Outcome::Signalled) ::kill(::getpid(), SIGTERM);
+        ::_exit(1);
+      },
+      testing::KilledBySignal(SIGTERM), "");
+}
+
+TEST_F(RunLoopTest, WritingToAClosedPipeIsAnErrorOnly) {
+  ServiceManager service;
+  RunLoop loop({}, _busy, service);
+  int ends[2];
+  ASSERT_EQ(::pipe(ends), 0);
+  ::close(ends[0]);
+  EXPECT_EQ(::write(ends[1], "x", 1), -1);
+  EXPECT_EQ(errno, EPIPE);
+  ::close(ends[1]);
+}
+
+TEST_F(RunLoopTest, EndsWhenIdleButNotWhileBusy) {
+  ServiceManager service;
+  _busy.begin();
+  _busy.begin();
+  RunLoop loop({.idleExit = 1ms}, _busy, service);
+  auto outcome = std::async(std::launch::async, [&] { return loop.run(); });
+  _busy.end();
+  EXPECT_EQ(outcome.wait_for(50ms), std::future_status::timeout);
+  EXPECT_TRUE(_busy.isBusy());
+  _busy.end();
+  EXPECT_EQ(outcome.get(), Outcome::Idle);
+}
+
+TEST_F(RunLoopTest, StaysWithoutAnIdleTime) {
+  ServiceManager service;
+  RunLoop loop({}, _busy, service);
+  auto outcome = std::async(std::launch::async, [&] { return loop.run(); });
+  _busy.begin();
+  _busy.end();
+  EXPECT_EQ(outcome.wait_for(50ms), std::future_status::timeout);
+  loop.stop();
+  EXPECT_EQ(outcome.get(), Outcome::Stopped);
+}
+
+TEST_F(RunLoopTest, TellsTheManagerHowItGoes) {
+  ::setenv("WATCHDOG_USEC", "20000", 1);
+  ServiceManager service;
+  EXPECT_EQ(service.watchdogInterval(), 10ms);
+  EXPECT_EQ(std::getenv("WATCHDOG_USEC"), nullptr);
+  service.notifyReady();
+  EXPECT_EQ(notification(), "READY=1");
+  service.notifyStatus("2 sessions");
+  EXPECT_EQ(notification(), "STATUS=2 sessions");
+  RunLoop loop({}, _busy, service);
+  auto outcome = std::async(std::launch::async, [&] { return loop.run(); });
+  for (int ping = 0; ping < 3; ++ping) EXPECT_EQ(notification(), "WATCHDOG=1");
+  loop.stop();
+  outcome.get();
+}
+
+TEST_F(RunLoopTest, TakesOverTheManagersSocket) {
+  FileDescriptor listening(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  bindTo(listening, _directory / "listen");
+  ASSERT_EQ(::listen(listening.get(), 1), 0);
+  const auto inherit = [&](int first, int second) {
+    ::dup2(first, 3);
+    ::dup2(second, 4);
+    ::setenv("LISTEN_FDS", "2", 1);
+    ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
+    ServiceManager service;
+    bool taken = service.isSocketActivated() && service.takeListeningSocket().get() >= 3;
+    bool again = static_cast<bool>(service.takeListeningSocket());
+    ::_exit(taken && !again && !std::getenv("LISTEN_FDS") ? 0 : 1);
+  };
+  EXPECT_EXIT(inherit(listening.get(), 2), testing::ExitedWithCode(0), "descriptor 4 is of no use");
+  EXPECT_EXIT(inherit(2, 2), testing::ExitedWithCode(1), "descriptor 3 is of no use");
+}
+
+TEST(SchedulingClassTest, UtilityYieldsToOthersInThreadsMadeLaterToo) {
+  EXPECT_EXIT(
+      {
+        enterSchedulingClass(SchedulingClass::Utility, 0);
+        int nice = 0;
+        int policy = -1;
+        std::thread([&] {
+          nice = ::getpriority(PRIO_PROCESS, 0);
+          policy = ::sched_getscheduler(0);
+        }).join();
+        ::_exit(nice >= 5 && policy == SCHED_BATCH ? 0 : 1);
+      },
+      testing::ExitedWithCode(0), "");
+}
+
+}  // namespace
+}  // namespace vesk
