@@ -1,0 +1,349 @@
+// What an HTTPS backend makes of messages: event records, filters, batches, posts.
+#include <gtest/gtest.h>
+
+#include "tests/support/BackendHarness.h"
+#include "tests/support/CapturedLog.h"
+#include "tests/support/TestRoot.h"
+
+namespace vesk::test {
+namespace {
+
+timeval at(double seconds) {
+  return timevalFrom(WallTime(std::chrono::microseconds(static_cast<std::int64_t>(seconds * 1e6))));
+}
+
+constexpr double kStart = 1'000'000'019.7;
+
+class BackendEvents : public ::testing::Test {
+ protected:
+  /// A backend whose one client entry is `entry` over a post URL and the things that reporting needs.
+  std::shared_ptr<VeskReportingBackend> make(Dictionary entry = {}) {
+    MutableDictionary whole(Dictionary{{"post_url", harness.url()},
+                                       {"realtime_post_url", harness.url("/realtime")},
+                                       {"locale_whitelist", List{"US"}},
+                                       {"filters", List{Dictionary{{"key", "unused"}}}},
+                                       {"sampling_threshold", 1.0}});
+    whole.setAll(entry);
+    auto backend = VeskReportingBackend::newBackendWithName(kVeskReportingBackendHTTPPost,
+                                                            Dictionary{{"clients", List{whole.share()}}},
+                                                            Text("Phone"), 5, harness.services);
+    backend->setCompType(5);
+    backend->setClientVersion(3);
+    backend->setHardwareType(Text("Phone7,2"));
+    backend->setProductVersion(Text("12.1"));
+    backend->setSelfVersion("7.2.9");
+    backend->setStartTimestamp(at(kStart));
+    backend->setCombinedSessionIDString("session-text");
+    backend->setUdid("0123456789");
+    return backend;
+  }
+  /// The same, told to wait for user info; it has it already when `userInfo` is given.
+  std::shared_ptr<VeskReportingBackend> makeRequiringUserInfo(Dictionary entry, std::optional<Dictionary> userInfo) {
+    auto backend = make(std::move(entry));
+    backend->setRequireUserInfo(true);
+    backend->setUserInfoDict(userInfo);
+    backend->updateState();
+    return backend;
+  }
+  void send(VeskReportingBackend& backend, Dictionary payload, std::uint16_t method = 3, std::int32_t flag = 0) {
+    backend.sendMessage(payload, at(kStart + 5.25), method, 2, flag);
+  }
+
+  BackendHarness harness;
+  const Dictionary userInfo{{kVeskReportingUserInfoClientName, "Camera"}, {kVeskReportingUserInfoServiceName, "Clips"}};
+};
+
+TEST_F(BackendEvents, RecordCarriesPayloadAndComputedFields) {
+  auto backend = make();
+  backend->updateState();
+  send(*backend, Dictionary{{"text", "häß"}, {"n", -7}, {"x", 2.5}, {"_method", "mine"}, {"eventTime", 0}});
+  auto posts = harness.posts();
+  ASSERT_EQ(posts.size(), 1u);
+  auto event = posts[0].event();
+  EXPECT_EQ(event.at("text"), "häß");
+  EXPECT_EQ(event.at("n"), -7);
+  EXPECT_EQ(event.at("x"), 2.5);
+  EXPECT_EQ(event.at("_startTS"), 999'999'960);
+  EXPECT_DOUBLE_EQ(event.at("_clientTS").as_double(), 999'999'965.25);
+  EXPECT_DOUBLE_EQ(event.at("eventTime").as_double(), 999'999'965.25);
+  EXPECT_EQ(event.at("_sender"), "HD");
+  EXPECT_EQ(event.at("_clientVersion"), 3);
+  EXPECT_EQ(event.at("_sessionID"), "session-text");
+  EXPECT_EQ(event.at("_eventNumber"), 1);
+  EXPECT_EQ(event.at("_method"), 3);
+  EXPECT_EQ(event.at("_status"), 2);
+  EXPECT_EQ(event.at("_productFamily"), "Phone");
+  EXPECT_EQ(event.at("_productModel"), "Phone7,2");
+  EXPECT_EQ(event.at("_osVersion"), "12.1");
+  EXPECT_FALSE(event.contains("_build")) << "a fact that is not known is left out";
+  EXPECT_EQ(event.at("_internal"), 2) << "no environment type is set: seed";
+  EXPECT_EQ(event.at("_reportVers"), "7.2");
+  EXPECT_TRUE(event.contains("_timezoneOffset"));
+
+  const auto& request = posts[0].request;
+  EXPECT_EQ(request.header("X-Vesk-Sender"), "HD");
+  EXPECT_EQ(request.header("X-Vesk-Event-Map"), "3 2");
+  EXPECT_EQ(request.header("Accept"), "application/json");
+  EXPECT_EQ(request.header("Content-Type"), "application/json");
+  EXPECT_FALSE(request.header("X-Vesk-Client-Name"));
+  EXPECT_EQ(posts[0].body.at("clientId"), "id-respecting");
+  EXPECT_DOUBLE_EQ(posts[0].body.at("postTime").as_double(), 1'700'000'000);
+}
+
+TEST_F(BackendEvents, EventNumbersWrap) {
+  auto backend = make();
+  backend->setState(BackendStateDisabled);
+  for (int i = 0; i < 65534; ++i) backend->sendMessage(std::nullopt, at(kStart), 1, 0, 0);
+  backend->updateState();
+  for (int i = 0; i < 3; ++i) send(*backend, {});
+  std::vector<std::int64_t> numbers;
+  for (const auto& post : harness.posts()) numbers.push_back(post.event().at("_eventNumber").as_int64());
+  std::sort(numbers.begin(), numbers.end());
+  EXPECT_EQ(numbers, (std::vector<std::int64_t>{0, 1, 65535}));
+  EXPECT_EQ(harness.dropped(DropReason::StateDisabled), 65534u);
+}
+
+TEST_F(BackendEvents, BodyLosesWhatJSONEventsCannotCarry) {
+  CapturedLog log;
+  auto backend = make();
+  backend->updateState();
+  send(*backend, Dictionary{{"when", Date{1.5}},
+                            {"never", Date{std::numeric_limits<double>::infinity()}},
+                            {"nested", Dictionary{{"a", 1}}},
+                            {"list", List{1}},
+                            {"nothing", Value()},
+                            {"raw", Bytes("ab")},
+                            {"flag", true}});
+  auto event = harness.posts().at(0).event();
+  EXPECT_EQ(event.at("when"), 1.5);
+  EXPECT_EQ(event.at("never"), -1.0);
+  EXPECT_EQ(event.at("flag"), true);
+  for (const char* gone : {"nested", "list", "nothing", "raw"}) EXPECT_FALSE(event.contains(gone)) << gone;
+  EXPECT_EQ(log.count(4,
+                      "HTTPSPostBackend(createMessageForPostAndLogging): TreeWriter unable to handle key: nested, "
+                      "value: {\"a\": 1}"),
+            1);
+  EXPECT_EQ(log.countContaining(4, "TreeWriter unable to handle key"), 4);
+}
+
+TEST_F(BackendEvents, StopMessageTellsHowItWasSampled) {
+  auto backend = makeRequiringUserInfo(Dictionary{{"sampling_threshold", 0.5}, {"override_sampling", 0.75}}, userInfo);
+  backend->setState(BackendStateEnabled);
+  backend->sendMessage(Dictionary{{"StorebagVersion", "1"}}, at(kStart), 0, 1, 0);
+  auto plain = make();
+  plain->updateState();
+  plain->sendMessage(Dictionary(), at(kStart), 0, 1, 0);
+  auto posts = harness.posts();
+  ASSERT_EQ(posts.size(), 2u);
+  for (const auto& post : posts) {
+    auto event = post.event();
+    bool sampled = event.contains("StorebagVersion");
+    EXPECT_EQ(event.at("Opt"), 0);
+    EXPECT_EQ(event.at("SamplingThreshold"), sampled ? boost::json::value(0.5) : boost::json::value(-1));
+    EXPECT_EQ(event.at("OverrideSampling"), boost::json::value(-1)) << "not reached while the draw is under 0.5";
+    EXPECT_EQ(event.at("Batch"), 0);
+  }
+}
+
+struct FilterCase {
+  const char* name;
+  List filters;
+  const char* key;
+  std::optional<std::string> expected;  // nothing: the key is gone
+};
+
+TEST_F(BackendEvents, FiltersDecideByTheFirstMatchingRecord) {
+  const std::string digest = VeskReportingBackend::convertIntoSHA256("Ann");
+  auto filter = [](const char* key, const char* action, int method = -1, int status = -1) {
+    return Dictionary{{"key", key}, {"action", action}, {"method", method}, {"status", status}};
+  };
+  const FilterCase cases[] = {
+      {"digest, any case", {filter("USERNAME", "sha256")}, "username", digest},
+      {"first wins", {filter("username", "sha256"), filter("username", "remove")}, "username", digest},
+      {"remove", {filter("userName", "remove")}, "username", std::nullopt},
+      {"leave shields", {filter("username", "keep"), filter("username", "remove")}, "username", "Ann"},
+      {"method matches", {filter("username", "remove", 3)}, "username", std::nullopt},
+      {"other method", {filter("username", "remove", 4)}, "username", "Ann"},
+      {"status matches", {filter("username", "remove", -1, 2)}, "username", std::nullopt},
+      {"other status", {filter("username", "remove", -1, 9)}, "username", "Ann"},
+      {"no key", {Dictionary{{"action", "remove"}}}, "username", "Ann"},
+      {"not a dictionary", {Value("remove"), filter("username", "remove")}, "username", std::nullopt},
+      {"longer key", {filter("user", "remove")}, "username", "Ann"},
+      {"folded beyond ASCII", {filter("ken", "remove")}, "\u212Aen", std::nullopt},
+      {"user info too", {filter("clientname", "sha256")}, "clientName", VeskReportingBackend::convertIntoSHA256("Camera")},
+  };
+  for (const auto& test : cases) {
+    SCOPED_TRACE(test.name);
+    auto backend = makeRequiringUserInfo(Dictionary{{"filters", test.filters}}, userInfo);
+    send(*backend, Dictionary{{"username", "Ann"}, {"\u212Aen", "x"}});
+    auto event = harness.posts().back().event();
+    EXPECT_EQ(event.contains(test.key), test.expected.has_value());
+    if (test.expected && event.contains(test.key)) EXPECT_EQ(event.at(test.key), *test.expected);
+  }
+}
+
+TEST_F(BackendEvents, NumbersAreDigestedAsDecimalText) {
+  auto backend = makeRequiringUserInfo(
+      Dictionary{{"filters", List{Dictionary{{"key", "n"}, {"action", "sha256"}},
+                                  Dictionary{{"key", "d"}, {"action", "sha256"}}}}}, userInfo);
+  send(*backend, Dictionary{{"n", 42}, {"d", Dictionary{{"secret", 1}}}});
+  auto event = harness.posts().at(0).event();
+  EXPECT_EQ(event.at("n"), VeskReportingBackend::convertIntoSHA256("42"));
+  EXPECT_FALSE(event.contains("d"));
+}
+
+struct RoadCase {
+  const char* name;
+  std::int32_t state;
+  bool batch;
+  std::int32_t flag;
+  std::optional<const char*> postedTo;  // nothing: held
+  std::int32_t stateAfter;
+};
+
+TEST_F(BackendEvents, FlagsStateAndBatchingChooseTheRoad) {
+  const RoadCase cases[] = {
+      {"enabled", 2, false, 0, "/post", 2},
+      {"enabled, batching", 2, true, 0, std::nullopt, 2},
+      {"realtime beats batching", 2, true, 1, "/realtime", 2},
+      {"pending holds", 0, false, 0, std::nullopt, 0},
+      {"realtime while pending", 0, false, 1, "/realtime", 0},
+      {"override band holds", 3, false, 0, std::nullopt, 3},
+      {"override flag lifts and posts", 3, false, 2, "/post", 2},
+      {"override flag lifts, batching holds", 3, true, 2, std::nullopt, 2},
+      {"both flags", 3, true, 3, "/realtime", 2},
+      {"unknown flag acts as 0", 3, false, 4, std::nullopt, 3},
+      {"disabled drops", 1, false, 1, std::nullopt, 1},
+  };
+  for (const auto& test : cases) {
+    SCOPED_TRACE(test.name);
+    auto backend = make();
+    backend->updateState();
+    backend->setBatchEvents(test.batch);
+    backend->setState(test.state);
+    std::size_t before = harness.posts().size();
+    send(*backend, Dictionary{{"a", 1}}, 3, test.flag);
+    auto posts = harness.posts();
+    EXPECT_EQ(posts.size() - before, test.postedTo ? 1u : 0u);
+    if (test.postedTo && posts.size() > before) EXPECT_EQ(posts.back().request.target, *test.postedTo);
+    EXPECT_EQ(backend->state(), test.stateAfter);
+  }
+}
+
+TEST_F(BackendEvents, HeldEventsGoFirstOnceEnabled) {
+  auto backend = make();
+  backend->updateState();
+  backend->setState(BackendStatePending);
+  send(*backend, Dictionary{{"n", 1}});
+  backend->setState(BackendStateEnabled);
+  send(*backend, Dictionary{{"n", 2}});
+  auto posts = harness.posts();
+  ASSERT_EQ(posts.size(), 2u);
+  EXPECT_FALSE(posts[0].request.header("X-Vesk-Event-Map") && posts[1].request.header("X-Vesk-Event-Map"))
+      << "a flush has no event map";
+}
+
+TEST_F(BackendEvents, ThresholdFlushesTheWholeBatch) {
+  auto backend = make();
+  backend->updateState();
+  backend->setBatchEvents(true);
+  send(*backend, Dictionary{{"other", 1}}, 9);
+  for (int i = 0; i < 50; ++i) send(*backend, Dictionary{{"n", i}});
+  EXPECT_TRUE(harness.posts().empty());
+  send(*backend, Dictionary{{"n", 50}});
+  auto posts = harness.posts();
+  ASSERT_EQ(posts.size(), 1u);
+  EXPECT_EQ(posts[0].events().size(), 51u);
+  EXPECT_EQ(posts[0].request.header("Content-Encoding"), "gzip");
+  EXPECT_EQ(posts[0].request.header("Content-Length"), std::to_string(posts[0].request.body.size()));
+  EXPECT_FALSE(posts[0].request.header("X-Vesk-Event-Map"));
+  auto printable = backend->flushMessages();
+  ASSERT_TRUE(printable);
+  EXPECT_NE(printable->find("\"n\": 50"), std::string::npos);
+  EXPECT_FALSE(backend->flushMessages()) << "nothing is left";
+}
+
+TEST_F(BackendEvents, EventsHeldBeforeTheUserInfoGetItFiltered) {
+  auto backend = makeRequiringUserInfo(
+      Dictionary{{"filters", List{Dictionary{{"key", "serviceName"}, {"action", "remove"}}}}, {"expedite", 0}},
+      std::nullopt);
+  EXPECT_EQ(backend->state(), BackendStatePending);
+  send(*backend, Dictionary{{"n", 1}});
+  EXPECT_FALSE(backend->flushMessages());
+  backend->setUserInfoDict(userInfo);
+  backend->updateState();
+  send(*backend, Dictionary{{"n", 2}});
+  backend->flushMessages();
+  auto posts = harness.posts();
+  ASSERT_EQ(posts.size(), 1u);
+  for (std::size_t i = 0; i < 2; ++i) {
+    EXPECT_EQ(posts[0].event(i).at("clientName"), "Camera");
+    EXPECT_FALSE(posts[0].event(i).contains("serviceName"));
+  }
+  EXPECT_EQ(posts[0].request.header("X-Vesk-Client-Name"), "Camera");
+  EXPECT_EQ(posts[0].request.header("X-Vesk-Service-Name"), "Clips");
+}
+
+TEST_F(BackendEvents, CorrelationRewritesHeldEvents) {
+  auto backend = make();
+  backend->updateState();
+  backend->setBatchEvents(true);
+  send(*backend, {});
+  backend->setCorrelatedSessionID("parent.child");
+  send(*backend, {});
+  backend->flushMessages();
+  auto post = harness.posts().at(0);
+  EXPECT_EQ(post.event(0).at("_sessionID"), "parent.child");
+  EXPECT_EQ(post.event(1).at("_sessionID"), "parent.child");
+}
+
+TEST_F(BackendEvents, ServerAnswersDecideTheState) {
+  CapturedLog log;
+  for (auto [status, stateAfter] : {std::pair{200u, 2}, {404u, 2}, {500u, 1}, {599u, 1}, {503u, 1}}) {
+    SCOPED_TRACE(status);
+    harness.answerWith(status);
+    auto backend = make();
+    backend->updateState();
+    send(*backend, {});
+    harness.posts();
+    EXPECT_EQ(backend->state(), stateAfter);
+  }
+  EXPECT_EQ(log.count(6, "postJSONMessage: backend httpPost disabled by server 503 return code"), 1);
+  EXPECT_EQ(harness.dropped(DropReason::ServerError5xx), 3u);
+}
+
+TEST_F(BackendEvents, NamesCannotInjectHeaders) {
+  auto backend = makeRequiringUserInfo({}, Dictionary{{kVeskReportingUserInfoClientName, "a\r\nX-Evil: 1"}});
+  send(*backend, {});
+  const auto request = harness.posts().at(0).request;
+  EXPECT_EQ(request.header("X-Vesk-Client-Name"), "aX-Evil: 1");
+  EXPECT_FALSE(request.header("X-Evil"));
+}
+
+TEST_F(BackendEvents, WithoutURLNothingIsSentAndItIsCounted) {
+  auto backend = VeskReportingBackend::newBackendWithName(
+      kVeskReportingBackendHTTPPost2, Dictionary{{"clients", List{Dictionary()}}}, Text("Phone"), 99, harness.services);
+  backend->updateState();
+  send(*backend, {}, 3, 1);
+  EXPECT_TRUE(harness.posts().empty());
+  EXPECT_EQ(harness.dropped(DropReason::NoURL), 1u);
+}
+
+TEST_F(BackendEvents, HeldEventsAreBoundedByDroppingTheOldest) {
+  CapturedLog log;
+  auto backend = make();
+  backend->setState(BackendStatePending);
+  const std::string mebibyte(std::size_t{1} << 20, 'x');
+  for (int i = 0; i < 40; ++i) send(*backend, Dictionary{{"n", i}, {"bulk", mebibyte}}, static_cast<std::uint16_t>(i));
+  EXPECT_EQ(log.countContaining(4, "dropping its oldest events"), 1);
+  std::uint64_t dropped = harness.dropped(DropReason::OverBound);
+  EXPECT_GE(dropped, 24u);
+  backend->updateState();
+  backend->flushMessages();
+  auto post = harness.posts().at(0);
+  EXPECT_EQ(post.events().size(), 40 - dropped);
+  EXPECT_EQ(post.event(post.events().size() - 1).at("n"), 39) << "the newest stay";
+}
+
+}  // namespace
+}  // namespace vesk::test

@@ -1,0 +1,126 @@
+// Families of sessions: parents, combined IDs, reporting states, aggregation.
+#include <gtest/gtest.h>
+
+#include "tests/support/AgentHarness.h"
+#include "tests/support/CapturedLog.h"
+#include "tests/support/TestRoot.h"
+
+namespace vesk::test {
+namespace {
+
+/// Client types 5, 6, 7 are levels 0, 1, 2 of one family.
+class Family : public ::testing::Test {
+ protected:
+  Family() {
+    testRoot().write("etc/veskreporting/device.toml", "DeviceName = \"Phone\"\n");
+    for (int level = 0; level < 3; ++level) {
+      harness.storebags[5 + level] = Dictionary{{"httpPost", profile(level, level == 0 ? 1.0 : 0.0)}};
+    }
+  }
+  Dictionary profile(int level, double threshold) {
+    return Dictionary{{"clients", List{Dictionary{{"post_url", harness.url()},
+                                                  {"hierarchy", level},
+                                                  {"locale_whitelist", List{"US"}},
+                                                  {"filters", List{Dictionary()}},
+                                                  {"override_sampling", 0.0},
+                                                  {"sampling_threshold", threshold}}}}};
+  }
+  DrivenSession join(int level, bool aggregates = false, const char* client = "MyApp") {
+    auto session = harness.newSession();
+    session->setSessionInfo(Dictionary{{kVeskReportingSessionInfoSessionID, 100 + level},
+                                       {kVeskReportingSessionInfoClientType, 5 + level},
+                                       {kVeskReportingSessionInfoRequireUserInfo, true}},
+                            userInfo(client), {}, aggregates);
+    names = session.start();
+    return session;
+  }
+  static Dictionary userInfo(const char* client) {
+    return Dictionary{{kVeskReportingUserInfoClientName, client}, {kVeskReportingUserInfoServiceName, "Calls"}};
+  }
+  static Dictionary message() {
+    return Dictionary{{"category", 3}, {"type", 2}, {"flag", 1}, {"payload", Dictionary{{"a", 1}}}};
+  }
+  std::string lastSessionID() {
+    return std::string(harness.posts().back().event().at("_sessionID").as_string());
+  }
+
+  AgentHarness harness;
+  std::optional<BackendNames> names;  // what the last start answered
+};
+
+TEST_F(Family, ChildrenCarryTheirAncestorsAndCopyTheirStates) {
+  CapturedLog log;
+  auto top = join(0);
+  auto child = join(1);
+  EXPECT_EQ(names, BackendNames{"httpPost"}) << "sampled out by itself, enabled by its parent";
+  auto grandchild = join(2, false, "MYAPP");
+  grandchild.send(message());
+  EXPECT_EQ(lastSessionID(),
+            top->sessionIDString() + "." + child->sessionIDString() + "." + grandchild->sessionIDString());
+  EXPECT_EQ(harness.agent->parentSessionIDStringForSession(*top.session), std::nullopt);
+  RecursiveMutexLock lock(harness.agent->monitor());
+  EXPECT_EQ(harness.agent->parentSessionForChild(*grandchild.session), child.session);
+  EXPECT_EQ(child->samplingThresholdWithBackendName("httpPost"), Value(1.0));
+}
+
+TEST_F(Family, AMissingParentLeavesAGap) {
+  CapturedLog log;
+  auto top = join(0);
+  auto grandchild = join(2);
+  EXPECT_EQ(names, BackendNames{});
+  EXPECT_EQ(harness.agent->parentSessionIDStringForSession(*grandchild.session), std::nullopt);
+  EXPECT_GE(log.count(6, "parentSessionIDStringForSession: Found a gap in hierarchy (one of parents missing): incomplete "
+                         "parentSessionID is ''"),
+            1);
+  EXPECT_GE(log.count(6, "parentSessionForChild: Unable to find session with hierarchy of 1 for userInfoKey 'myapp:calls'"),
+            1);
+  EXPECT_GE(log.count(6, "syncReportingStates: child session 102 (backend httpPost) is missing its parent"), 1);
+}
+
+TEST_F(Family, TheHighestAggregatorGetsTheMessages) {
+  auto child = join(1, true);
+  auto top = join(0, true);
+  EXPECT_FALSE(child->hasAggregator()) << "shut down by the arrival above it";
+  ASSERT_EQ(child.connection->calls.size(), 1u) << "its closing message";
+  auto grandchild = join(2);
+  grandchild.send(message());
+  ASSERT_FALSE(top.connection->calls.empty());
+  const auto& call = top.connection->calls.back();
+  EXPECT_STREQ(call.member, "sendMessageToClient");
+  auto info = std::get<std::optional<Dictionary>>(call.arguments.at(0));
+  EXPECT_EQ(info->find(kVeskReportingSessionInfoSessionID)->asInteger(), 102);
+  EXPECT_EQ(std::get<std::uint16_t>(call.arguments.at(2)), 3);
+  EXPECT_EQ(child.connection->calls.size(), 1u);
+
+  CapturedLog log;
+  top.connection->clientIsGone = true;
+  grandchild.send(message());
+  EXPECT_EQ(log.count(3, "sendMessageWithDictionary: Failed to get remote object proxy: gone"), 1);
+}
+
+TEST_F(Family, ASessionThatMovesTakesItsPlaceElsewhere) {
+  CapturedLog log;
+  auto top = join(0);
+  auto other = join(0, false, "Other");
+  auto child = join(1);
+  child->fetchStatesWithUserInfo(userInfo("Other"), {});
+  child.send(message());
+  EXPECT_EQ(lastSessionID(), other->sessionIDString() + "." + child->sessionIDString());
+  EXPECT_EQ(log.count(7, "userInfoUpdatedForSession: Adding session 101 to list for userInfoKey other:calls"), 1);
+}
+
+TEST_F(Family, ClosingAnAggregatingSessionTellsItsClientOnce) {
+  auto top = join(0, true);
+  auto connection = top.connection;
+  top->shutdownSessionAggregation();
+  top->shutdownSessionAggregation();
+  auto closing = [&] {
+    return std::count_if(connection->calls.begin(), connection->calls.end(), [](const auto& call) {
+      return !std::get<std::optional<Dictionary>>(call.arguments.at(0));
+    });
+  };
+  EXPECT_EQ(closing(), 1);
+}
+
+}  // namespace
+}  // namespace vesk::test

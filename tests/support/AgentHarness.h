@@ -1,0 +1,94 @@
+// An agent with real backends and a real collector behind it, whose sessions are driven by hand.
+#pragma once
+
+#include <functional>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "daemon/ReportingdAgent.h"
+#include "tests/support/BackendHarness.h"
+
+namespace vesk::test {
+
+/// A connection without a peer: keeps what it is given, and what is sent to its client.
+class RecordingConnection final : public IPCConnection {
+ public:
+  std::string description() const override { return "recording connection"; }
+  IPCPeer peer() const override { return {}; }
+  void setExportedObject(std::shared_ptr<IPCExportedObject> object) override { _object = std::move(object); }
+  void setInterruptionHandler(std::function<void()> handler) override { _interrupted = std::move(handler); }
+  void setInvalidationHandler(std::function<void()> handler) override { _invalidated = std::move(handler); }
+  void resume() override {}
+  void invalidate() override {
+    if (auto handler = std::exchange(_invalidated, nullptr)) handler();
+    _interrupted = nullptr;
+    _object.reset();
+  }
+  void interrupt() { _interrupted(); }
+  void callRemoteObject(IPCOutgoingCall call,
+                        const std::function<void(const std::string& error)>& errorHandler) override {
+    if (clientIsGone) return errorHandler("gone");
+    calls.push_back(std::move(call));
+  }
+
+  std::vector<IPCOutgoingCall> calls;
+  bool clientIsGone = false;
+
+ private:
+  std::shared_ptr<IPCExportedObject> _object;
+  std::function<void()> _interrupted;
+  std::function<void()> _invalidated;
+};
+
+/// A session and the connection that it believes to have.
+struct DrivenSession {
+  std::shared_ptr<RecordingConnection> connection = std::make_shared<RecordingConnection>();
+  std::shared_ptr<ReportingdSession> session;
+
+  ReportingdSession* operator->() const { return session.get(); }
+
+  std::optional<BackendNames> start() {
+    std::optional<BackendNames> names;
+    session->startConfigWithCompletionHandler(
+        {[&](const std::optional<BackendNames>& reply) { names = reply; }, nullptr});
+    return names;
+  }
+  std::optional<std::string> send(Dictionary parameters) {
+    std::optional<std::string> answer;
+    session->sendMessageWithDictionary(
+        parameters, {[&](const std::optional<std::string>& reply) { answer = reply; }, nullptr});
+    return answer;
+  }
+};
+
+class AgentHarness : public BackendHarness {
+ public:
+  AgentHarness()
+      : agent(std::make_shared<ReportingdAgent>(
+            sessionServices,
+            [this](std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool&,
+                   std::optional<std::string>&) -> std::optional<Dictionary> {
+              auto section = storebags.find(clientType);
+              if (section == storebags.end()) return std::nullopt;
+              maxAge = 3600;
+              version = "bag-1";
+              return section->second;
+            },
+            busyMarker)) {}
+
+  DrivenSession newSession() {
+    DrivenSession driven;
+    driven.session = std::make_shared<ReportingdSession>(agent, driven.connection, sessionServices);
+    return driven;
+  }
+
+  SessionServices sessionServices{services, "7.3"};
+  BusyMarker busyMarker;
+  std::map<std::int32_t, Dictionary> storebags;  ///< sections by client type
+  std::shared_ptr<ReportingdAgent> agent;
+};
+
+}  // namespace vesk::test

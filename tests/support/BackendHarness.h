@@ -1,0 +1,90 @@
+// What a backend needs to work in a test: a real HTTP client, a real server that keeps what it gets, a clock to turn.
+#pragma once
+
+#include <VeskReporting/VeskReportingKeys.h>
+
+#include <atomic>
+#include <boost/json.hpp>
+#include <chrono>
+#include <memory>
+#include <mutex>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+#include "backends/VeskReportingBackend.h"
+#include "tools/collector/HTTPServer.h"
+
+namespace vesk::test {
+
+/// A wall clock that stands still until it is set.
+class HandClock final : public WallClock {
+ public:
+  explicit HandClock(double seconds = 1'700'000'000) { set(seconds); }
+  WallTime now() const override { return WallTime(std::chrono::microseconds(_microseconds.load())); }
+  void set(double seconds) { _microseconds = static_cast<std::int64_t>(seconds * 1e6); }
+  void advance(std::chrono::seconds by) { _microseconds += std::chrono::microseconds(by).count(); }
+
+ private:
+  std::atomic<std::int64_t> _microseconds{0};
+};
+
+/// One post as the server got it.
+struct ReceivedPost {
+  HTTPReceived request;
+  boost::json::object body;
+
+  boost::json::array events() const { return body.at("events").as_array(); }
+  boost::json::object event(std::size_t index = 0) const { return events().at(index).as_object(); }
+};
+
+class BackendHarness {
+ public:
+  BackendHarness()
+      : _server({}, [this](const HTTPReceived& request) { return receive(request); }),
+        services{_http,
+                 clock,
+                 counters,
+                 [](bool respects) { return std::string(respects ? "id-respecting" : "id-overriding"); },
+                 [this] { return consent; },
+                 [this] { return region; }} {}
+
+  /// All posts that arrived, once nothing is under way any more.
+  std::vector<ReceivedPost> posts() {
+    if (!_http.waitUntilIdle(std::chrono::seconds(60))) throw std::runtime_error("posts do not end");
+    std::lock_guard lock(_mutex);
+    return _posts;
+  }
+  std::string url(const std::string& path = "/post") const { return _server.baseURL() + path; }
+  void answerWith(unsigned status) { _status = status; }
+
+  std::uint64_t dropped(DropReason reason) const {
+    std::uint64_t sum = 0;
+    for (const auto& count : counters.snapshot()) sum += count.reason == reason ? count.count : 0;
+    return sum;
+  }
+
+  HandClock clock;
+  Counters counters;
+  bool consent = true;
+  std::optional<std::string> region = "US";
+
+ private:
+  HTTPAnswer receive(const HTTPReceived& request) {
+    ReceivedPost post{request, boost::json::parse(request.decodedBody().body.value()).as_object()};
+    std::lock_guard lock(_mutex);
+    _posts.push_back(std::move(post));
+    return HTTPAnswer::text(_status, "received");
+  }
+
+  std::mutex _mutex;
+  std::vector<ReceivedPost> _posts;
+  std::atomic<unsigned> _status{200};
+  HTTPServer _server;
+  HTTPClient _http;
+
+ public:
+  BackendServices services;
+};
+
+}  // namespace vesk::test
