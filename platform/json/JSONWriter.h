@@ -67,8 +67,9 @@ class JSONWriter {
   /// The text when it is good and complete, else nothing. The writer is used up.
   std::optional<std::string> finish();
 
+  class Impl;  // one for each style, in the source
+
  private:
-  class Impl;
   std::unique_ptr<Impl> _impl;
 };
 

@@ -15,9 +15,10 @@ namespace vesk {
 struct PropertyListLimits {
   std::size_t bytes = 1 << 20;
   std::size_t depth = 64;  ///< containers within containers; the root is the first
-  /// Values visited. A part of a binary list that is referred to from many places counts each time, since it
-  /// is read, and later walked, each time.
+  /// Values and keys visited. A part of a binary list that is referred to from many places counts each time:
+  /// whoever walks the value will meet it each time.
   std::size_t nodes = 100'000;
+  std::size_t contentBytes = 16 << 20;  ///< bytes of texts and data visited, counted in the same way
 };
 
 enum class PropertyListFlavor {
@@ -42,12 +43,12 @@ PropertyListOutcome parsePropertyList(std::string_view bytes,
                                       const PropertyListLimits& limits = {});
 
 /// `value` as XML property list, indented for people. Nothing when it holds what XML can't carry: the null
-/// marker, a text that is not UTF-8 or has control characters, a date that is not finite or outside the years
-/// 1 to 9999, or values nested deeper than 64. Dates are cut to whole seconds, which is all the format has.
+/// marker, a text that is not UTF-8 or has control characters, a date outside the years 1 to 9999 (or not
+/// finite), or values nested deeper than 64. Dates are cut to whole seconds, which is all the format has.
 std::optional<std::string> writeXMLPropertyList(const Value& value);
 
-/// `value` as binary property list; equal texts, and equal numbers, are written once. Nothing for a text that
-/// is not UTF-8 or for values nested deeper than 64. The null marker is written as null.
+/// `value` as binary property list; equal texts are written once. Nothing for a text that is not UTF-8 or has
+/// a NUL, or for values nested deeper than 64. The null marker is written as null.
 std::optional<std::string> writeBinaryPropertyList(const Value& value,
                                                    PropertyListFlavor flavor = PropertyListFlavor::Plain);
 

@@ -3,6 +3,8 @@
 #include <unicode/bytestream.h>
 #include <unicode/casemap.h>
 #include <unicode/stringpiece.h>
+#include <unicode/utf16.h>
+#include <unicode/utf8.h>
 
 #include <algorithm>
 #include <cstdint>
@@ -114,6 +116,52 @@ bool isValidUTF8(std::string_view text, bool allowNUL) noexcept {
     text.remove_prefix(length);
   }
   return true;
+}
+
+std::optional<std::string> utf8FromUTF16BE(std::string_view bytes) {
+  if (bytes.size() % 2 != 0) return std::nullopt;
+  const std::size_t count = bytes.size() / 2;
+  auto unitAt = [&](std::size_t i) -> char16_t {
+    return static_cast<char16_t>(static_cast<unsigned char>(bytes[2 * i]) << 8 |
+                                 static_cast<unsigned char>(bytes[2 * i + 1]));
+  };
+  std::string text;
+  text.reserve(bytes.size());
+  for (std::size_t i = 0; i < count; ++i) {
+    UChar32 character = unitAt(i);
+    if (U16_IS_SURROGATE(character)) {
+      if (!U16_IS_LEAD(character) || i + 1 == count || !U16_IS_TRAIL(unitAt(i + 1))) return std::nullopt;
+      character = U16_GET_SUPPLEMENTARY(character, unitAt(++i));
+    }
+    char encoded[U8_MAX_LENGTH];
+    std::int32_t length = 0;
+    U8_APPEND_UNSAFE(encoded, length, character);
+    text.append(encoded, static_cast<std::size_t>(length));
+  }
+  return text;
+}
+
+std::optional<std::string> utf16BEFromUTF8(std::string_view text) {
+  if (isTooLongForICU(text)) return std::nullopt;
+  const auto size = static_cast<std::int32_t>(text.size());
+  std::string bytes;
+  bytes.reserve(2 * text.size());
+  auto addUnit = [&](unsigned unit) {
+    bytes += static_cast<char>(unit >> 8);
+    bytes += static_cast<char>(unit & 0xFF);
+  };
+  for (std::int32_t at = 0; at < size;) {
+    UChar32 character = 0;
+    U8_NEXT(text.data(), at, size, character);
+    if (character < 0) return std::nullopt;
+    if (U_IS_BMP(character)) {
+      addUnit(static_cast<unsigned>(character));
+    } else {
+      addUnit(static_cast<unsigned>(U16_LEAD(character)));
+      addUnit(static_cast<unsigned>(U16_TRAIL(character)));
+    }
+  }
+  return bytes;
 }
 
 }  // namespace vesk

@@ -1,6 +1,7 @@
 // Caseless text, by the Unicode mappings of the root locale.
 #pragma once
 
+#include <optional>
 #include <string>
 #include <string_view>
 
@@ -19,5 +20,9 @@ bool containsIgnoringCase(std::string_view text, std::string_view needle);
 /// Well-formed UTF-8: no overlong forms, no surrogates, nothing above U+10FFFF. A NUL is well-formed, and
 /// refused when `allowNUL` is false.
 bool isValidUTF8(std::string_view text, bool allowNUL = true) noexcept;
+
+/// Between UTF-8 and UTF-16 in big-endian bytes; nothing for what is not well-formed.
+std::optional<std::string> utf8FromUTF16BE(std::string_view bytes);
+std::optional<std::string> utf16BEFromUTF8(std::string_view text);
 
 }  // namespace vesk

@@ -1,0 +1,305 @@
+#include <algorithm>
+#include <bit>
+#include <cstring>
+#include <unordered_map>
+#include <vector>
+
+#include "platform/plist/PropertyListFormats.h"
+#include "platform/unicode/Unicode.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::size_t kTrailerSize = 32;
+
+std::uint64_t bigEndian(std::string_view bytes) {
+  std::uint64_t number = 0;
+  for (char c : bytes) number = number << 8 | static_cast<unsigned char>(c);
+  return number;
+}
+
+/// What the last 32 bytes say about the rest.
+struct Trailer {
+  std::size_t offsetSize = 0;
+  std::size_t referenceSize = 0;
+  std::size_t objectCount = 0;
+  std::size_t rootObject = 0;
+  std::size_t offsetTable = 0;
+};
+
+/// The trailer, when the table of offsets that it describes fills just the room before it.
+std::optional<Trailer> readTrailer(std::string_view bytes) {
+  if (bytes.size() < kBinaryPropertyListMagic.size() + kTrailerSize) return std::nullopt;
+  const std::string_view tail = bytes.substr(bytes.size() - kTrailerSize);
+  const Trailer trailer{bigEndian(tail.substr(6, 1)), bigEndian(tail.substr(7, 1)),
+                        bigEndian(tail.substr(8, 8)), bigEndian(tail.substr(16, 8)),
+                        bigEndian(tail.substr(24, 8))};
+  const std::size_t end = bytes.size() - kTrailerSize;
+  auto isSize = [](std::size_t size) { return size >= 1 && size <= 8; };
+  if (!isSize(trailer.offsetSize) || !isSize(trailer.referenceSize)) return std::nullopt;
+  if (trailer.offsetTable < kBinaryPropertyListMagic.size() || trailer.offsetTable > end) return std::nullopt;
+  if (trailer.rootObject >= trailer.objectCount) return std::nullopt;
+  const std::size_t tableSize = end - trailer.offsetTable;
+  if (tableSize % trailer.offsetSize != 0 || tableSize / trailer.offsetSize != trailer.objectCount) {
+    return std::nullopt;
+  }
+  return trailer;
+}
+
+/// Reads objects as they are reached from the root. Each is read once and shared from then on, but counts in
+/// full wherever it is referred to.
+class BinaryReader {
+ public:
+  BinaryReader(std::string_view bytes, const Trailer& trailer, PropertyListFlavor flavor,
+               const PropertyListLimits& limits)
+      : _objects(bytes.substr(0, trailer.offsetTable)),
+        _offsets(bytes.substr(trailer.offsetTable, trailer.objectCount * trailer.offsetSize)),
+        _trailer(trailer),
+        _flavor(flavor),
+        _budget(limits) {}
+
+  PropertyListOutcome read() {
+    const Object* root = object(_trailer.rootObject, 1);
+    if (!root) return {std::nullopt, _error};
+    return {root->value, {}};
+  }
+
+ private:
+  struct Object {
+    Value value;
+    bool isComplete = false;       // false while its own parts are being read
+    std::size_t height = 0;        // containers down from here, itself included
+    std::size_t nodes = 1;         // everything below and itself
+    std::size_t contentBytes = 0;  // of all texts and data in it
+  };
+
+  /// Where an object's payload starts, and what its marker says.
+  struct Marker {
+    unsigned kind;
+    std::uint64_t count;  // the marker's low half, or the length that follows it
+    std::size_t payload;
+  };
+
+  bool fail(std::string error) {
+    if (_error.empty()) _error = std::move(error);
+    return false;
+  }
+
+  const Object* failed(std::string error) {
+    fail(std::move(error));
+    return nullptr;
+  }
+
+  /// The object as it stands at `depth`, or null after a failure.
+  const Object* object(std::uint64_t index, std::size_t depth) {
+    if (index >= _trailer.objectCount) return failed("reference to no object");
+    auto [at, isNew] = _read.try_emplace(index);
+    Object& object = at->second;  // stays where it is when more are added
+    if (isNew) {
+      if (!readObject(index, depth, object)) return nullptr;
+      object.isComplete = true;
+      return &object;
+    }
+    if (!object.isComplete) return failed("a container holds itself");
+    if (!_budget.allowsDepth(depth + object.height - 1)) return failed(_budget.depthError());
+    if (!_budget.add(object.nodes, object.contentBytes)) return failed(_budget.sizeError());
+    return &object;
+  }
+
+  bool readObject(std::uint64_t index, std::size_t depth, Object& object) {
+    const std::uint64_t offset = bigEndian(_offsets.substr(index * _trailer.offsetSize, _trailer.offsetSize));
+    auto marker = readMarker(offset);
+    if (!marker) return false;
+    switch (marker->kind) {
+      case 0xA:
+        return readList(*marker, depth, object);
+      case 0xD:
+        return readDictionary(*marker, depth, object);
+      default:
+        break;
+    }
+    auto value = readLeaf(*marker);
+    if (!value) return fail("an object that can't be read");
+    object.value = *std::move(value);
+    return _budget.add(1, object.contentBytes = contentBytes(object.value)) || fail(_budget.sizeError());
+  }
+
+  static std::size_t contentBytes(const Value& value) {
+    if (const Text* text = value.text()) return text->size();
+    if (const Bytes* bytes = value.bytes()) return bytes->size();
+    return 0;
+  }
+
+  std::optional<Marker> readMarker(std::uint64_t offset) {
+    // An object before the first byte after the magic number, or in the table of offsets, is none.
+    if (offset < kBinaryPropertyListMagic.size() || offset >= _objects.size()) {
+      fail("an offset outside of the objects");
+      return std::nullopt;
+    }
+    const unsigned byte = static_cast<unsigned char>(_objects[offset]);
+    Marker marker{byte >> 4, byte & 0xF, offset + 1};
+    const bool hasLength = marker.kind == 0x4 || marker.kind == 0x5 || marker.kind == 0x6 ||
+                           marker.kind == 0xA || marker.kind == 0xD;
+    if (!hasLength || marker.count != 0xF) return marker;
+    auto sizeMarker = bytesAt(marker.payload, 1);
+    const unsigned exponent = sizeMarker ? static_cast<unsigned char>((*sizeMarker)[0]) ^ 0x10u : 4;
+    auto length = exponent <= 3 ? bytesAt(marker.payload + 1, std::size_t{1} << exponent) : std::nullopt;
+    if (!length) {
+      fail("a length that can't be read");
+      return std::nullopt;
+    }
+    marker.count = bigEndian(*length);
+    marker.payload += 1 + length->size();
+    return marker;
+  }
+
+  std::optional<std::string_view> bytesAt(std::size_t start, std::uint64_t count) const {
+    if (start > _objects.size() || count > _objects.size() - start) return std::nullopt;
+    return _objects.substr(start, count);
+  }
+
+  std::optional<Value> readLeaf(const Marker& marker) {
+    switch (marker.kind) {
+      case 0x0:
+        if (marker.count == 0x0) return Value();
+        if (marker.count == 0x8 || marker.count == 0x9) return Value(marker.count == 0x9);
+        return std::nullopt;
+      case 0x1:
+        return marker.count <= 4 ? readInteger(bytesAt(marker.payload, 1u << marker.count)) : std::nullopt;
+      case 0x2:
+        return marker.count == 2 || marker.count == 3 ? readReal(bytesAt(marker.payload, 1u << marker.count))
+                                                      : std::nullopt;
+      case 0x3:
+        return marker.count == 3 ? readDate(bytesAt(marker.payload, 8)) : std::nullopt;
+      case 0x4: {
+        auto data = bytesAt(marker.payload, marker.count);
+        return data ? std::optional<Value>(Bytes(std::string(*data))) : std::nullopt;
+      }
+      case 0x5:
+        return readASCII(bytesAt(marker.payload, marker.count));
+      case 0x6:
+        return marker.count <= _objects.size() ? readUTF16(bytesAt(marker.payload, 2 * marker.count))
+                                               : std::nullopt;
+      case 0x8:
+        return readUID(bytesAt(marker.payload, marker.count + 1));
+      default:
+        return std::nullopt;
+    }
+  }
+
+  static std::optional<Value> readInteger(std::optional<std::string_view> bytes) {
+    if (!bytes) return std::nullopt;
+    // Up to 4 bytes are unsigned, 8 are signed, and 16 are signed but hold no more than 64 bits' worth.
+    if (bytes->size() < 8) return Value(static_cast<std::int64_t>(bigEndian(*bytes)));
+    const auto low = static_cast<std::int64_t>(bigEndian(bytes->substr(bytes->size() - 8)));
+    if (bytes->size() == 8) return Value(low);
+    const std::uint64_t high = bigEndian(bytes->substr(0, 8));
+    if (high == 0) return low >= 0 ? Value(low) : Value(static_cast<std::uint64_t>(low));
+    if (high == ~std::uint64_t{0} && low < 0) return Value(low);
+    return std::nullopt;
+  }
+
+  static std::optional<Value> readReal(std::optional<std::string_view> bytes) {
+    if (!bytes) return std::nullopt;
+    const std::uint64_t bits = bigEndian(*bytes);
+    if (bytes->size() == 8) return Value(std::bit_cast<double>(bits));
+    return Value(static_cast<double>(std::bit_cast<float>(static_cast<std::uint32_t>(bits))));
+  }
+
+  static std::optional<Value> readDate(std::optional<std::string_view> bytes) {
+    if (!bytes) return std::nullopt;
+    return Value(Date{std::bit_cast<double>(bigEndian(*bytes)) + kBinaryPropertyListEpoch});
+  }
+
+  static std::optional<Value> readASCII(std::optional<std::string_view> bytes) {
+    const bool isText = bytes && std::all_of(bytes->begin(), bytes->end(), [](char c) {
+                          return static_cast<unsigned char>(c) - 1u < 0x7Fu;
+                        });
+    return isText ? std::optional<Value>(*bytes) : std::nullopt;
+  }
+
+  static std::optional<Value> readUTF16(std::optional<std::string_view> bytes) {
+    auto text = bytes ? utf8FromUTF16BE(*bytes) : std::nullopt;
+    if (!text || text->find('\0') != std::string::npos) return std::nullopt;
+    return Value(*text);
+  }
+
+  std::optional<Value> readUID(std::optional<std::string_view> bytes) const {
+    if (_flavor != PropertyListFlavor::KeyedArchive || !bytes || bytes->size() > 8) return std::nullopt;
+    return Value(Dictionary{{Text(kUIDKey), Value(bigEndian(*bytes))}});
+  }
+
+  /// Counts a container of `count` references on each of which at least a byte is spent.
+  bool beginContainer(const Marker& marker, std::uint64_t referencesPerEntry, std::size_t depth) {
+    if (!_budget.allowsDepth(depth)) return fail(_budget.depthError());
+    if (!_budget.add(1, 0)) return fail(_budget.sizeError());
+    const std::uint64_t room = (_objects.size() - std::min(marker.payload, _objects.size())) /
+                               (_trailer.referenceSize * referencesPerEntry);
+    return marker.count <= room || fail("a container that reaches over the end");
+  }
+
+  /// Containers may lie across each other, so that a small document could ask for a lot of room at once.
+  static std::size_t roomFor(const Marker& marker) { return std::min<std::uint64_t>(marker.count, 1024); }
+
+  /// The `index`th object that a container refers to; its cost becomes the container's as well.
+  const Object* part(const Marker& marker, std::uint64_t index, std::size_t depth, Object& container) {
+    const std::size_t start = marker.payload + index * _trailer.referenceSize;
+    const Object* found = object(bigEndian(_objects.substr(start, _trailer.referenceSize)), depth + 1);
+    if (!found) return nullptr;
+    container.nodes += found->nodes;
+    container.contentBytes += found->contentBytes;
+    container.height = std::max(container.height, found->height + 1);
+    return found;
+  }
+
+  bool readList(const Marker& marker, std::size_t depth, Object& list) {
+    if (!beginContainer(marker, 1, depth)) return false;
+    list.height = 1;
+    std::vector<Value> values;
+    values.reserve(roomFor(marker));
+    for (std::uint64_t i = 0; i < marker.count; ++i) {
+      const Object* value = part(marker, i, depth, list);
+      if (!value) return false;
+      values.push_back(value->value);
+    }
+    list.value = List(std::move(values));
+    return true;
+  }
+
+  bool readDictionary(const Marker& marker, std::size_t depth, Object& dictionary) {
+    if (!beginContainer(marker, 2, depth)) return false;
+    dictionary.height = 1;
+    MutableDictionary entries;
+    entries.reserve(roomFor(marker));
+    for (std::uint64_t i = 0; i < marker.count; ++i) {
+      const Object* key = part(marker, i, depth, dictionary);
+      if (!key) return false;
+      if (!key->value.text()) return fail("a key that is no text");
+      const Object* value = part(marker, marker.count + i, depth, dictionary);
+      if (!value) return false;
+      entries.append(*key->value.text(), value->value);
+    }
+    dictionary.value = entries.shareUnique();
+    return true;
+  }
+
+  const std::string_view _objects;  // the magic number and the objects
+  const std::string_view _offsets;
+  const Trailer _trailer;
+  const PropertyListFlavor _flavor;
+  PropertyListBudget _budget;
+  std::unordered_map<std::uint64_t, Object> _read;
+  std::string _error;
+};
+
+}  // namespace
+
+PropertyListOutcome parseBinaryPropertyList(std::string_view bytes, PropertyListFlavor flavor,
+                                            const PropertyListLimits& limits) {
+  auto trailer = readTrailer(bytes);
+  if (!trailer) return {std::nullopt, "no valid trailer"};
+  return BinaryReader(bytes, *trailer, flavor, limits).read();
+}
+
+}  // namespace vesk

@@ -1,0 +1,193 @@
+#include <algorithm>
+#include <bit>
+#include <unordered_map>
+#include <vector>
+
+#include "platform/plist/PropertyListFormats.h"
+#include "platform/unicode/Unicode.h"
+
+namespace vesk {
+
+namespace {
+
+void appendBigEndian(std::string& out, std::uint64_t number, std::size_t size) {
+  for (std::size_t i = size; i-- > 0;) out += static_cast<char>(number >> (8 * i) & 0xFF);
+}
+
+/// Bytes that `number` needs; of 1, 2, 4 and 8.
+std::size_t sizeFor(std::uint64_t number) {
+  if (number <= 0xFF) return 1;
+  if (number <= 0xFFFF) return 2;
+  return number <= 0xFFFF'FFFF ? 4 : 8;
+}
+
+std::string objectMarker(unsigned kind, unsigned low) { return {static_cast<char>(kind << 4 | low)}; }
+
+std::string unsignedObject(std::uint64_t number) {
+  const std::size_t size = sizeFor(number);
+  // Eight bytes are signed, so the upper half of the range takes sixteen.
+  const bool takesSixteen = number > static_cast<std::uint64_t>(INT64_MAX);
+  std::string object = objectMarker(0x1, takesSixteen ? 4 : static_cast<unsigned>(std::countr_zero(size)));
+  if (takesSixteen) appendBigEndian(object, 0, 8);
+  appendBigEndian(object, number, size);
+  return object;
+}
+
+std::string signedObject(std::int64_t number) {
+  if (number >= 0) return unsignedObject(static_cast<std::uint64_t>(number));
+  std::string object = objectMarker(0x1, 3);
+  appendBigEndian(object, static_cast<std::uint64_t>(number), 8);
+  return object;
+}
+
+std::string eightByteObject(unsigned kind, double number) {
+  std::string object = objectMarker(kind, 3);
+  appendBigEndian(object, std::bit_cast<std::uint64_t>(number), 8);
+  return object;
+}
+
+/// The start of an object with `count` bytes, characters or entries.
+std::string countedObject(unsigned kind, std::size_t count) {
+  if (count < 0xF) return objectMarker(kind, static_cast<unsigned>(count));
+  return objectMarker(kind, 0xF) + unsignedObject(count);
+}
+
+std::optional<std::string> textObject(std::string_view text) {
+  if (text.find('\0') != std::string_view::npos) return std::nullopt;
+  auto units = utf16BEFromUTF8(text);
+  if (!units) return std::nullopt;
+  const bool isASCII = std::all_of(text.begin(), text.end(), [](char c) { return (c & 0x80) == 0; });
+  return isASCII ? countedObject(0x5, text.size()).append(text)
+                 : countedObject(0x6, units->size() / 2).append(*units);
+}
+
+/// Lists all objects first: only their number tells how wide a reference has to be.
+class BinaryWriter {
+ public:
+  explicit BinaryWriter(PropertyListFlavor flavor) : _flavor(flavor) {}
+
+  std::optional<std::string> write(const Value& root) {
+    if (!add(root, 1)) return std::nullopt;
+    const std::size_t referenceSize = sizeFor(_objects.size() - 1);
+    std::string out(kBinaryPropertyListMagic);
+    std::vector<std::size_t> offsets;
+    offsets.reserve(_objects.size());
+    for (const Object& object : _objects) {
+      offsets.push_back(out.size());
+      out += object.bytes;
+      for (std::size_t reference : object.references) appendBigEndian(out, reference, referenceSize);
+    }
+    const std::size_t table = out.size();
+    const std::size_t offsetSize = sizeFor(table);
+    for (std::size_t offset : offsets) appendBigEndian(out, offset, offsetSize);
+    out.append(6, '\0');
+    appendBigEndian(out, offsetSize, 1);
+    appendBigEndian(out, referenceSize, 1);
+    for (std::size_t number : {_objects.size(), std::size_t{0}, table}) appendBigEndian(out, number, 8);
+    return out;
+  }
+
+ private:
+  struct Object {
+    std::string bytes;
+    std::vector<std::size_t> references = {};
+  };
+  using Index = std::optional<std::size_t>;  // nothing: it can't be written
+
+  Index addBytes(std::string bytes) {
+    _objects.push_back({std::move(bytes)});
+    return _objects.size() - 1;
+  }
+
+  Index add(const Value& value, std::size_t depth) {
+    switch (value.kind()) {
+      case Value::Kind::None:
+        return addBytes(objectMarker(0x0, 0x0));
+      case Value::Kind::Boolean:
+        return addBytes(objectMarker(0x0, *value.boolean() ? 0x9 : 0x8));
+      case Value::Kind::Signed:
+        return addBytes(signedObject(*value.signedInteger()));
+      case Value::Kind::Unsigned:
+        return addBytes(unsignedObject(*value.unsignedInteger()));
+      case Value::Kind::Double:
+        return addBytes(eightByteObject(0x2, *value.real()));
+      case Value::Kind::Date:
+        return addBytes(eightByteObject(0x3, value.date()->secondsSince1970 - kBinaryPropertyListEpoch));
+      case Value::Kind::Bytes:
+        return addBytes(countedObject(0x4, value.bytes()->size()).append(value.bytes()->view()));
+      case Value::Kind::Text:
+        return addText(*value.text());
+      case Value::Kind::List:
+        return addList(*value.list(), depth);
+      case Value::Kind::Dictionary:
+        return addDictionary(*value.dictionary(), depth);
+    }
+    return std::nullopt;
+  }
+
+  Index addText(const Text& text) {
+    if (auto known = _texts.find(text); known != _texts.end()) return known->second;
+    auto object = textObject(text.view());
+    if (!object) return std::nullopt;
+    Index index = addBytes(*std::move(object));
+    _texts.emplace(text, *index);
+    return index;
+  }
+
+  Index addList(const List& list, std::size_t depth) {
+    if (depth > kDeepest) return std::nullopt;
+    Index index = addBytes(countedObject(0xA, list.size()));
+    std::vector<std::size_t> references;
+    for (const Value& value : list) {
+      Index part = add(value, depth + 1);
+      if (!part) return std::nullopt;
+      references.push_back(*part);
+    }
+    _objects[*index].references = std::move(references);
+    return index;
+  }
+
+  Index addDictionary(const Dictionary& dictionary, std::size_t depth) {
+    if (auto uid = uidOf(dictionary)) return addBytes(*std::move(uid));
+    if (depth > kDeepest) return std::nullopt;
+    Index index = addBytes(countedObject(0xD, dictionary.size()));
+    std::vector<std::size_t> references;
+    for (const auto& entry : dictionary) {
+      Index key = addText(entry.key);
+      if (!key) return std::nullopt;
+      references.push_back(*key);
+    }
+    for (const auto& entry : dictionary) {
+      Index value = add(entry.value, depth + 1);
+      if (!value) return std::nullopt;
+      references.push_back(*value);
+    }
+    _objects[*index].references = std::move(references);
+    return index;
+  }
+
+  std::optional<std::string> uidOf(const Dictionary& dictionary) const {
+    if (_flavor != PropertyListFlavor::KeyedArchive || dictionary.size() != 1) return std::nullopt;
+    const Value* value = dictionary.find(kUIDKey);
+    if (!value || (!value->signedInteger() && !value->unsignedInteger())) return std::nullopt;
+    if (value->signedInteger() && *value->signedInteger() < 0) return std::nullopt;
+    const auto number = static_cast<std::uint64_t>(*value->asInteger());
+    const std::size_t size = sizeFor(number);
+    std::string object = objectMarker(0x8, static_cast<unsigned>(size - 1));
+    appendBigEndian(object, number, size);
+    return object;
+  }
+
+  static constexpr std::size_t kDeepest = PropertyListLimits{}.depth;
+  const PropertyListFlavor _flavor;
+  std::vector<Object> _objects;
+  std::unordered_map<Text, std::size_t> _texts;
+};
+
+}  // namespace
+
+std::optional<std::string> writeBinaryPropertyList(const Value& value, PropertyListFlavor flavor) {
+  return BinaryWriter(flavor).write(value);
+}
+
+}  // namespace vesk

@@ -1,0 +1,22 @@
+// The texts that XML property lists write numbers and dates as.
+#pragma once
+
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/values/Value.h"
+
+namespace vesk {
+
+/// Decimal or, after "0x", hexadecimal; white space around it is skipped. Signed when it fits, else unsigned;
+/// nothing outside -2^63 to 2^64-1.
+std::optional<Value> integerFromPropertyListText(std::string_view text);
+/// A decimal number, "nan" or an infinity.
+std::optional<double> realFromPropertyListText(std::string_view text);
+std::string propertyListTextFromReal(double number);
+/// "2026-11-24T20:31:29Z".
+std::optional<Date> dateFromPropertyListText(std::string_view text);
+std::optional<std::string> propertyListTextFromDate(Date date);
+
+}  // namespace vesk

@@ -1,0 +1,231 @@
+#include <expat.h>
+
+#include <array>
+#include <memory>
+#include <new>
+#include <optional>
+#include <vector>
+
+#include "platform/crypto/Base64.h"
+#include "platform/plist/PropertyListFormats.h"
+#include "platform/plist/PropertyListScalars.h"
+
+namespace vesk {
+
+namespace {
+
+enum class Element { Unknown, PList, Dict, Array, Key, String, Integer, Real, True, False, Date, Data };
+
+Element elementNamed(std::string_view name) {
+  struct Name {
+    std::string_view name;
+    Element element;
+  };
+  constexpr std::array<Name, 11> kNames = {{{"key", Element::Key},
+                                            {"string", Element::String},
+                                            {"dict", Element::Dict},
+                                            {"integer", Element::Integer},
+                                            {"true", Element::True},
+                                            {"false", Element::False},
+                                            {"array", Element::Array},
+                                            {"real", Element::Real},
+                                            {"date", Element::Date},
+                                            {"data", Element::Data},
+                                            {"plist", Element::PList}}};
+  for (const auto& known : kNames) {
+    if (known.name == name) return known.element;
+  }
+  return Element::Unknown;
+}
+
+bool isContainer(Element element) { return element <= Element::Array; }
+
+/// Builds the value from Expat's events. The first problem stops the parser and stays.
+class XMLReader {
+ public:
+  XMLReader(XML_Parser parser, const PropertyListLimits& limits) : _parser(parser), _budget(limits) {
+    XML_SetUserData(parser, this);
+    XML_SetElementHandler(parser, onStart, onEnd);
+    XML_SetCharacterDataHandler(parser, onText);
+    XML_SetStartDoctypeDeclHandler(parser, onDoctype);
+    XML_SetSkippedEntityHandler(parser, onSkippedEntity);
+  }
+
+  PropertyListOutcome read(std::string_view bytes) {
+    const XML_Status status = XML_Parse(_parser, bytes.data(), static_cast<int>(bytes.size()), XML_TRUE);
+    if (status != XML_STATUS_OK || !_error.empty()) return {std::nullopt, errorWithPlace()};
+    if (!_root) return {std::nullopt, "no value"};
+    return {std::move(_root), {}};
+  }
+
+ private:
+  /// An element that is open.
+  struct Frame {
+    Element element;
+    std::vector<Value> values;     // of an array
+    MutableDictionary entries;     // of a dictionary
+    std::optional<Text> key = {};  // of a dictionary: waits for its value
+    std::string text = {};         // of anything else
+  };
+
+  std::string errorWithPlace() const {
+    std::string error = _error.empty() ? XML_ErrorString(XML_GetErrorCode(_parser)) : _error;
+    return "line " + std::to_string(XML_GetCurrentLineNumber(_parser)) + ", column " +
+           std::to_string(XML_GetCurrentColumnNumber(_parser)) + ": " + error;
+  }
+
+  void fail(std::string error) {
+    if (!_error.empty()) return;
+    _error = std::move(error);
+    XML_StopParser(_parser, XML_FALSE);
+  }
+
+  void start(std::string_view name) {
+    const Element element = elementNamed(name);
+    if (element == Element::Unknown) return fail("unknown element <" + std::string(name.substr(0, 64)) + ">");
+    if (!mayStart(element)) return fail("element <" + std::string(name) + "> may not stand here");
+    // The plist element itself is no container of the value.
+    if (isContainer(element) && !_budget.allowsDepth(_frames.size())) return fail(_budget.depthError());
+    if (element != Element::PList && !_budget.add(1, 0)) return fail(_budget.sizeError());
+    _frames.push_back({element, {}, {}});
+  }
+
+  bool mayStart(Element element) const {
+    if (_frames.empty()) return element == Element::PList;
+    if (element == Element::PList) return false;
+    const Frame& parent = _frames.back();
+    switch (parent.element) {
+      case Element::PList:
+        return !_root && element != Element::Key;
+      case Element::Array:
+        return element != Element::Key;
+      case Element::Dict:
+        return (element == Element::Key) != parent.key.has_value();
+      default:
+        return false;
+    }
+  }
+
+  void text(std::string_view text) {
+    if (_frames.empty()) return;
+    Frame& frame = _frames.back();
+    if (!isContainer(frame.element)) {
+      frame.text += text;
+    } else if (text.find_first_not_of(" \t\r\n") != std::string_view::npos) {
+      fail("text outside of a value");
+    }
+  }
+
+  void end() {
+    Frame frame = std::move(_frames.back());
+    _frames.pop_back();
+    if (frame.element == Element::PList) return;
+    if (frame.element == Element::Key) {
+      _frames.back().key = Text(frame.text);
+      return;
+    }
+    if (frame.key) return fail("key without a value");
+    auto value = valueOf(frame);
+    if (value) {
+      place(*std::move(value));
+    } else {
+      fail("not a valid value: " + frame.text.substr(0, 64));
+    }
+  }
+
+  static std::optional<Value> valueOf(Frame& frame) {
+    switch (frame.element) {
+      case Element::Dict:
+        return frame.entries.shareUnique();
+      case Element::Array:
+        return List(std::move(frame.values));
+      case Element::String:
+        return Text(frame.text);
+      case Element::Integer:
+        return integerFromPropertyListText(frame.text);
+      case Element::Real:
+        return optionalValue(realFromPropertyListText(frame.text));
+      case Element::True:
+      case Element::False:
+        if (!frame.text.empty()) return std::nullopt;
+        return frame.element == Element::True;
+      case Element::Date:
+        return optionalValue(dateFromPropertyListText(frame.text));
+      case Element::Data: {
+        auto bytes = base64Decode(frame.text);
+        return bytes ? std::optional<Value>(Bytes(*std::move(bytes))) : std::nullopt;
+      }
+      default:
+        return std::nullopt;
+    }
+  }
+
+  template <class T>
+  static std::optional<Value> optionalValue(const std::optional<T>& value) {
+    return value ? std::optional<Value>(*value) : std::nullopt;
+  }
+
+  void place(Value value) {
+    Frame& parent = _frames.back();
+    if (parent.element == Element::Array) {
+      parent.values.push_back(std::move(value));
+    } else if (parent.element == Element::Dict) {
+      parent.entries.append(*std::move(parent.key), std::move(value));
+      parent.key.reset();
+    } else {
+      _root = std::move(value);
+    }
+  }
+
+  // --- Expat calls these; no exception may pass through it, and after a failure it may still call.
+
+  template <class Handle>
+  static void guarded(void* self, Handle handle) noexcept {
+    auto& reader = *static_cast<XMLReader*>(self);
+    if (!reader._error.empty()) return;
+    try {
+      handle(reader);
+    } catch (const std::bad_alloc&) {
+      reader.fail("out of memory");
+    }
+  }
+  static void onStart(void* self, const XML_Char* name, const XML_Char**) {
+    guarded(self, [&](XMLReader& reader) { reader.start(name); });
+  }
+  static void onEnd(void* self, const XML_Char*) {
+    guarded(self, [](XMLReader& reader) { reader.end(); });
+  }
+  static void onText(void* self, const XML_Char* text, int size) {
+    guarded(self, [&](XMLReader& reader) { reader.text({text, static_cast<std::size_t>(size)}); });
+  }
+  static void onDoctype(void* self, const XML_Char*, const XML_Char*, const XML_Char*,
+                        int hasInternalSubset) {
+    // Only declarations in the document itself could define entities: the one it refers to is never fetched.
+    guarded(self, [&](XMLReader& reader) {
+      if (hasInternalSubset) reader.fail("declarations are not allowed");
+    });
+  }
+  static void onSkippedEntity(void* self, const XML_Char*, int) {
+    guarded(self, [](XMLReader& reader) { reader.fail("unknown entity"); });
+  }
+
+  XML_Parser _parser;
+  PropertyListBudget _budget;
+  std::vector<Frame> _frames;
+  std::optional<Value> _root;
+  std::string _error;
+};
+
+struct ParserDeleter {
+  void operator()(XML_Parser parser) const { XML_ParserFree(parser); }
+};
+
+}  // namespace
+
+PropertyListOutcome parseXMLPropertyList(std::string_view bytes, const PropertyListLimits& limits) {
+  std::unique_ptr<XML_ParserStruct, ParserDeleter> parser(XML_ParserCreate(nullptr));
+  if (!parser) return {std::nullopt, "out of memory"};
+  return XMLReader(parser.get(), limits).read(bytes);
+}
+
+}  // namespace vesk

@@ -1,0 +1,121 @@
+#include "platform/crypto/Base64.h"
+#include "platform/plist/PropertyListFormats.h"
+#include "platform/plist/PropertyListScalars.h"
+#include "platform/unicode/Unicode.h"
+
+namespace vesk {
+
+namespace {
+
+/// Writes one value; every operation tells whether it could.
+class XMLWriter {
+ public:
+  bool write(const Value& value, std::size_t indent) {
+    switch (value.kind()) {
+      case Value::Kind::None:
+        return false;
+      case Value::Kind::Boolean:
+        return writeLine(*value.boolean() ? "<true/>" : "<false/>", indent);
+      case Value::Kind::Signed:
+        return writeElement("integer", std::to_string(*value.signedInteger()), indent);
+      case Value::Kind::Unsigned:
+        return writeElement("integer", std::to_string(*value.unsignedInteger()), indent);
+      case Value::Kind::Double:
+        return writeElement("real", propertyListTextFromReal(*value.real()), indent);
+      case Value::Kind::Text:
+        return writeText("string", value.text()->view(), indent);
+      case Value::Kind::Bytes:
+        return writeElement("data", base64Encode(value.bytes()->view()), indent);
+      case Value::Kind::Date: {
+        auto text = propertyListTextFromDate(*value.date());
+        return text && writeElement("date", *text, indent);
+      }
+      case Value::Kind::List:
+        return writeList(*value.list(), indent);
+      case Value::Kind::Dictionary:
+        return writeDictionary(*value.dictionary(), indent);
+    }
+    return false;
+  }
+
+  std::string take() { return std::move(_out); }
+
+ private:
+  static constexpr std::size_t kDeepest = PropertyListLimits{}.depth;
+
+  bool writeLine(std::string_view line, std::size_t indent) {
+    _out.append(indent, '\t').append(line).append("\n");
+    return true;
+  }
+
+  bool writeElement(std::string_view name, std::string_view content, std::size_t indent) {
+    _out.append(indent, '\t').append("<").append(name).append(">");
+    _out.append(content).append("</").append(name).append(">\n");
+    return true;
+  }
+
+  bool writeText(std::string_view name, std::string_view text, std::size_t indent) {
+    auto escaped = escape(text);
+    return escaped && writeElement(name, *escaped, indent);
+  }
+
+  bool writeList(const List& list, std::size_t indent) {
+    if (indent >= kDeepest) return false;
+    if (list.empty()) return writeLine("<array/>", indent);
+    writeLine("<array>", indent);
+    for (const Value& value : list) {
+      if (!write(value, indent + 1)) return false;
+    }
+    return writeLine("</array>", indent);
+  }
+
+  bool writeDictionary(const Dictionary& dictionary, std::size_t indent) {
+    if (indent >= kDeepest) return false;
+    if (dictionary.empty()) return writeLine("<dict/>", indent);
+    writeLine("<dict>", indent);
+    for (const auto& entry : dictionary) {
+      if (!writeText("key", entry.key.view(), indent + 1) || !write(entry.value, indent + 1)) return false;
+    }
+    return writeLine("</dict>", indent);
+  }
+
+  static std::optional<std::string> escape(std::string_view text) {
+    // The two last characters of the plane are none of XML's, and no reader would take them.
+    if (!isValidUTF8(text) || text.find("\xEF\xBF\xBE") != std::string_view::npos ||
+        text.find("\xEF\xBF\xBF") != std::string_view::npos) {
+      return std::nullopt;
+    }
+    std::string escaped;
+    escaped.reserve(text.size());
+    for (char c : text) {
+      if (c == '&') {
+        escaped += "&amp;";
+      } else if (c == '<') {
+        escaped += "&lt;";
+      } else if (c == '>') {
+        escaped += "&gt;";
+      } else if (c == '\r') {
+        // Written plainly it would be read as a line feed.
+        escaped += "&#13;";
+      } else if (static_cast<unsigned char>(c) < 0x20 && c != '\t' && c != '\n') {
+        return std::nullopt;
+      } else {
+        escaped += c;
+      }
+    }
+    return escaped;
+  }
+
+  std::string _out;
+};
+
+}  // namespace
+
+std::optional<std::string> writeXMLPropertyList(const Value& value) {
+  XMLWriter writer;
+  if (!writer.write(value, 0)) return std::nullopt;
+  return "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<plist version=\"1.0\">\n" + writer.take() +
+         "</plist>\n";
+}
+
+}  // namespace vesk
