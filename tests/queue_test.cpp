@@ -1,0 +1,236 @@
+// Serial queues, timers and read sources, on real threads.
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <future>
+#include <memory>
+#include <stdexcept>
+#include <string>
+#include <system_error>
+#include <thread>
+#include <vector>
+
+#include "platform/log/SystemLog.h"
+#include "platform/queue/WorkQueue.h"
+
+namespace vesk {
+namespace {
+
+using std::chrono::milliseconds;
+
+/// Waits until everything submitted to the queue before has run.
+void drain(WorkQueue queue) {
+  std::promise<void> done;
+  queue.submit([&done] { done.set_value(); });
+  done.get_future().wait();
+}
+
+struct Pipe {
+  Pipe() {
+    if (::pipe(ends) != 0) throw std::system_error(errno, std::generic_category());
+  }
+  ~Pipe() {
+    ::close(ends[0]);
+    ::close(ends[1]);
+  }
+  void write(std::string_view text) const {
+    EXPECT_EQ(::write(ends[1], text.data(), text.size()), static_cast<ssize_t>(text.size()));
+  }
+  int ends[2] = {-1, -1};
+};
+
+TEST(WorkQueue, RunsItsWorkOneAtATimeInOrder) {
+  WorkQueuePool pool(3);
+  WorkQueue queue(pool);
+  std::vector<int> order;  // guarded by the queue itself
+  std::atomic<int> inside{0};
+  for (int i = 0; i < 500; ++i) {
+    queue.submit([&, i] {
+      EXPECT_EQ(inside.fetch_add(1), 0);
+      order.push_back(i);
+      inside.fetch_sub(1);
+    });
+  }
+  drain(queue);
+  ASSERT_EQ(order.size(), 500u);
+  EXPECT_TRUE(std::is_sorted(order.begin(), order.end()));
+}
+
+TEST(WorkQueue, ABlockedQueueDoesNotHoldUpAnother) {
+  WorkQueuePool pool(2);
+  WorkQueue blocked(pool);
+  WorkQueue other(pool);
+  std::promise<void> gate;
+  blocked.submit([future = gate.get_future().share()] { future.wait(); });
+  drain(other);
+  gate.set_value();
+  drain(blocked);
+}
+
+TEST(WorkQueue, GoesOnAfterWorkThatThrows) {
+  std::atomic<int> lines{0};
+  SystemLog::setSink([&](LogLevel level, std::string_view) { lines += level == LogLevel::Error; });
+  {
+    WorkQueuePool pool(1);
+    WorkQueue queue(pool);
+    queue.submit([] { throw std::runtime_error("broken"); });
+    queue.submit([] { throw 7; });
+    drain(queue);
+  }
+  SystemLog::setSink(nullptr);
+  EXPECT_EQ(lines, 2);
+}
+
+TEST(WorkQueue, DelayedWorkRunsOnceAndInTheOrderOfItsDelays) {
+  WorkQueuePool pool(2);
+  WorkQueue queue(pool);
+  std::vector<int> order;
+  std::promise<void> done;
+  queue.submitAfter(milliseconds(60), [&] {
+    order.push_back(2);
+    done.set_value();
+  });
+  queue.submitAfter(milliseconds(1), [&] { order.push_back(1); });
+  done.get_future().wait();
+  EXPECT_EQ(order, (std::vector<int>{1, 2}));
+}
+
+TEST(WorkTimer, RepeatsUntilItCancelsItself) {
+  WorkQueuePool pool(2);
+  WorkQueue queue(pool);
+  std::promise<void> done;
+  int fired = 0;
+  WorkTimer timer;
+  queue.submit([&] {
+    timer = WorkTimer(queue, milliseconds(0), milliseconds(1), [&] {
+      if (++fired < 3) return;
+      timer.cancel();
+      timer.cancel();
+      done.set_value();
+    });
+  });
+  done.get_future().wait();
+  std::promise<void> later;
+  queue.submitAfter(milliseconds(20), [&] { later.set_value(); });
+  later.get_future().wait();
+  EXPECT_EQ(fired, 3);
+}
+
+TEST(WorkTimer, CancelledOnItsQueueItNeverFiresAndLetsItsCapturesGo) {
+  WorkQueuePool pool(2);
+  WorkQueue queue(pool);
+  auto token = std::make_shared<int>(1);
+  std::promise<void> checked;
+  queue.submit([&, kept = token] {
+    WorkTimer timer(queue, milliseconds(0), milliseconds(1), [token] { ADD_FAILURE() << "fired"; });
+    EXPECT_EQ(token.use_count(), 3);
+    timer.cancel();
+    EXPECT_EQ(token.use_count(), 2);
+    checked.set_value();
+  });
+  checked.get_future().wait();
+  drain(queue);
+}
+
+TEST(WorkTimer, ManyComeAndGoFromSeveralThreads) {
+  WorkQueuePool pool(2);
+  WorkQueue queue(pool);
+  std::vector<std::thread> threads;
+  for (int t = 0; t < 3; ++t) {
+    threads.emplace_back([&queue] {
+      for (int i = 0; i < 200; ++i) {
+        WorkTimer timer(queue, milliseconds(i % 2), milliseconds(1), [] {});
+        WorkTimer moved = std::move(timer);
+        timer.cancel();
+        if (i % 3 == 0) moved = WorkTimer(queue, milliseconds(0), milliseconds(0), [] {});
+      }
+    });
+  }
+  for (auto& thread : threads) thread.join();
+  drain(queue);
+}
+
+TEST(ReadSource, IsCalledAgainWhileAnythingIsLeft) {
+  WorkQueuePool pool(2);
+  WorkQueue queue(pool);
+  Pipe pipe;
+  std::promise<void> done;
+  std::string read;
+  ReadSource source(queue, pipe.ends[0], [&] {
+    char byte = 0;
+    ASSERT_EQ(::read(pipe.ends[0], &byte, 1), 1);
+    read += byte;
+    if (read.size() == 6) done.set_value();
+  });
+  pipe.write("abc");
+  pipe.write("def");
+  done.get_future().wait();
+  EXPECT_EQ(read, "abcdef");
+}
+
+TEST(ReadSource, CancelsItselfAtTheEndOfItsStream) {
+  WorkQueuePool pool(1);
+  WorkQueue queue(pool);
+  auto pipe = std::make_unique<Pipe>();
+  std::promise<void> done;
+  int calls = 0;
+  ReadSource source;
+  queue.submit([&] {
+    source = ReadSource(queue, pipe->ends[0], [&] {
+      ++calls;
+      source.cancel();
+      source.cancel();
+      done.set_value();
+    });
+    pipe->write("x");
+  });
+  done.get_future().wait();
+  drain(queue);
+  EXPECT_EQ(calls, 1);
+  pipe.reset();
+  EXPECT_THROW(ReadSource(queue, -1, [] {}), std::system_error);
+}
+
+TEST(WorkQueuePool, StopDestroysWhatHasNotRunAndEverythingMayOutliveIt) {
+  auto token = std::make_shared<int>(1);
+  auto pool = std::make_unique<WorkQueuePool>(1);
+  WorkQueue queue(*pool);
+  Pipe pipe;
+  WorkTimer timer(queue, std::chrono::hours(1), milliseconds(0), [token, queue] {});
+  ReadSource source(queue, pipe.ends[0], [token, queue] {});
+  queue.submitAfter(std::chrono::hours(1), [token, queue] {});
+
+  std::promise<void> running;
+  std::promise<void> gate;
+  queue.submit([&] {
+    running.set_value();
+    gate.get_future().wait();
+  });
+  running.get_future().wait();
+  queue.submit([token, queue] { ADD_FAILURE() << "ran after the stop"; });
+  std::thread stopper([&] { pool->stop(); });
+  // Once the pool is being stopped, it takes no more work.
+  for (bool taken = true; taken; std::this_thread::yield()) {
+    auto probe = std::make_shared<int>(0);
+    queue.submit([probe] {});
+    taken = probe.use_count() > 1;
+  }
+  gate.set_value();
+  stopper.join();
+  pool->stop();
+  pool.reset();
+  EXPECT_EQ(token.use_count(), 1);
+
+  queue.submit([token] { ADD_FAILURE(); });
+  queue.submitAfter(milliseconds(0), [token] { ADD_FAILURE(); });
+  WorkTimer late(queue, milliseconds(0), milliseconds(1), [token] { ADD_FAILURE(); });
+  timer.cancel();
+  timer.cancel();
+  source.cancel();
+  late.cancel();
+  EXPECT_EQ(token.use_count(), 1);
+}
+
+}  // namespace
+}  // namespace vesk
