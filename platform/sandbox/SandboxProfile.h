@@ -45,7 +45,7 @@ struct SandboxProfileOutcome {
 ///     [calls]
 ///     deny = […]
 ///
-/// A path may begin with an environment variable ("$SSL_CERT_DIR/extra"); the entry is left out when that is
+/// A path may begin with an environment variable ("$HOME/.config"); the entry is left out when that is
 /// unset or no absolute path. A path is taken by its text: "$SSL_CERT_FILE/.." is the directory of that file.
 SandboxProfileOutcome parseSandboxProfile(std::string_view toml);
 
