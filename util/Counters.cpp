@@ -31,6 +31,8 @@ std::string_view nameOfDropReason(DropReason reason) noexcept {
       return "no-backend";
     case DropReason::UploadFailed:
       return "upload-failed";
+    case DropReason::NeverEnabled:
+      return "never-enabled";
   }
   return "unknown";
 }

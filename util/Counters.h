@@ -24,8 +24,9 @@ enum class DropReason : std::uint8_t {
   InvalidMessage,  ///< the message itself was refused
   NoBackend,       ///< no backend was there to take it
   UploadFailed,    ///< a file was not uploaded
+  NeverEnabled,    ///< still held when the session ended: reporting had never been enabled
 };
-inline constexpr std::size_t kDropReasonCount = 9;
+inline constexpr std::size_t kDropReasonCount = 10;
 
 /// A word for it, for tools and logs: "state-disabled".
 std::string_view nameOfDropReason(DropReason reason) noexcept;
