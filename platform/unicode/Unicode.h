@@ -7,7 +7,7 @@
 
 namespace vesk {
 
-/// Full lower-case mapping (one character may become several). Bytes that are no UTF-8 become U+FFFD.
+/// Full lower-case mapping (one character may become several). Bytes that are no UTF-8 stay as they are.
 std::string lowercase(std::string_view text);
 
 /// Equal by full case folding ("STRASSE" equals "straße"). Texts that differ in their ASCII part are told

@@ -1,0 +1,80 @@
+#include "platform/unicode/Unicode.h"
+
+#include <gtest/gtest.h>
+
+namespace vesk {
+namespace {
+
+TEST(Unicode, LowercasesByTheFullMapping) {
+  EXPECT_EQ(lowercase("MyApp 42"), "myapp 42");
+  EXPECT_EQ(lowercase("ÄÖÜ ÇA"), "äöü ça");
+  EXPECT_EQ(lowercase("ΟΔΟΣ"), "οδος");        // a final sigma has a form of its own
+  EXPECT_EQ(lowercase("İ"), "i\xCC\x87");      // becomes two characters
+  EXPECT_EQ(lowercase("I"), "i");              // in every locale
+  EXPECT_EQ(lowercase("AÄ\xFFZ"), "aä\xFFz");  // not UTF-8
+  EXPECT_EQ(lowercase(""), "");
+}
+
+TEST(Unicode, ComparesWithoutCase) {
+  const struct {
+    const char* a;
+    const char* b;
+    bool isEqual;
+  } cases[] = {
+      {"USERNAME", "username", true},
+      {"username", "usernames", false},
+      {"", "", true},
+      {"", "a", false},
+      {"@", "`", false},
+      {"[", "{", false},
+      {"straße", "STRASSE", true},
+      {"Kelvin", "\u212Aelvin", true},
+      {"s", "ſ", true},
+      {"É", "é", true},
+      {"é", "e", false},
+      {"user é", "USER É ", false},
+  };
+  for (const auto& c : cases) {
+    EXPECT_EQ(equalsIgnoringCase(c.a, c.b), c.isEqual) << c.a << " " << c.b;
+    EXPECT_EQ(equalsIgnoringCase(c.b, c.a), c.isEqual) << c.b << " " << c.a;
+  }
+}
+
+TEST(Unicode, FindsFragmentsWithoutCase) {
+  EXPECT_TRUE(containsIgnoringCase("MyCallService", "call"));
+  EXPECT_TRUE(containsIgnoringCase("DE", "de"));
+  EXPECT_TRUE(containsIgnoringCase("Große Straße", "STRASSE"));
+  EXPECT_FALSE(containsIgnoringCase("call", "calls"));
+  EXPECT_FALSE(containsIgnoringCase("anything", ""));
+  EXPECT_FALSE(containsIgnoringCase("", ""));
+}
+
+TEST(Unicode, TellsWellFormedUTF8) {
+  for (const char* text : {"", "ASCII only, longer than eight", "\u00E9", "\uFFFF", "\U00010000",
+                           "\U0010FFFF", "eight bytes and then \U0001F389"}) {
+    EXPECT_TRUE(isValidUTF8(text)) << text;
+  }
+  for (const char* text : {"\x80", "\xC0\x80", "\xC1\xBF", "\xC3", "\xE0\x80\x80", "\xE0\x9F\xBF", "\xE2\x82",
+                           "\xED\xA0\x80", "\xF0\x80\x80\x80", "\xF0\x8F\xBF\xBF", "\xF4\x90\x80\x80",
+                           "\xF5\x80\x80\x80", "\xFF", "long enough for eight\xC3", "\xE2\x82 \x82"}) {
+    EXPECT_FALSE(isValidUTF8(text)) << text;
+  }
+  const std::string_view withNUL("a\0b", 3);
+  EXPECT_TRUE(isValidUTF8(withNUL));
+  EXPECT_FALSE(isValidUTF8(withNUL, false));
+}
+
+TEST(Unicode, ConvertsBetweenUTF8AndUTF16) {
+  const std::string text = "aé→\U0001F389";
+  const std::string bytes("\0a\0\xE9\x21\x92\xD8\x3C\xDF\x89", 10);
+  EXPECT_EQ(utf16BEFromUTF8(text), bytes);
+  EXPECT_EQ(utf8FromUTF16BE(bytes), text);
+  EXPECT_EQ(utf16BEFromUTF8("\xC3"), std::nullopt);
+  for (std::string_view broken : {std::string_view("\0", 1), std::string_view("\xD8\x3C", 2),
+                                  std::string_view("\xDF\x89", 2), std::string_view("\xD8\x3C\0a", 4)}) {
+    EXPECT_EQ(utf8FromUTF16BE(broken), std::nullopt);
+  }
+}
+
+}  // namespace
+}  // namespace vesk
