@@ -31,6 +31,8 @@ class IPCExportedObject {
   virtual ~IPCExportedObject() = default;
   /// The D-Bus interface whose members `handle` knows.
   virtual const char* interfaceName() const = 0;
+  /// Its `<interface>` element, for callers that ask what there is.
+  virtual const char* introspection() const { return ""; }
   virtual void handle(IPCIncomingCall& call) = 0;
 };
 

@@ -1,0 +1,36 @@
+// The D-Bus names and signatures of the protocol, for both ends. What they mean: docs/wire.md.
+#pragma once
+
+namespace vesk::wire {
+
+inline constexpr const char* kServiceName = "com.corvane.veskreportingd";
+/// The socket, as on a device.
+inline constexpr const char* kSocketPath = "/run/veskreportingd/com.corvane.veskreportingd";
+/// Of the daemon's object and of the client's.
+inline constexpr const char* kObjectPath = "/com/corvane/veskreportingd/session";
+
+/// A member with the signatures of its arguments and of its answer.
+struct Member {
+  const char* name;
+  const char* arguments;
+  const char* answer;
+};
+
+/// The daemon's object.
+inline constexpr const char* kSessionInterface = "com.corvane.veskreportingd.ClientSessionInterface";
+inline constexpr Member kSetSessionInfo{"setSessionInfo", "a{sv}aa{sv}asb", ""};
+inline constexpr Member kStartConfig{"startConfigWithCompletionHandler", "", "aas"};
+inline constexpr Member kFetchStates{"fetchStatesWithUserInfo", "aa{sv}", "aas"};
+inline constexpr Member kFetchDisplayURL{"fetchDisplayURL", "", "s"};
+inline constexpr Member kSendMessageWithCategory{"sendMessageWithCategory", "qqaa{sv}", "as"};
+inline constexpr Member kSendMessageWithDictionary{"sendMessageWithDictionary", "a{sv}", "as"};
+inline constexpr Member kFlushMessages{"flushMessagesWithReply", "", "as"};
+inline constexpr Member kUploadFile{"uploadFileAtPath", "sah", "b"};
+inline constexpr Member kUploadLogData{"uploadLogData", "av", "bas"};
+inline constexpr Member kSendMessageWithSessionInfo{"sendMessageWithSessionInfo", "a{sv}aa{sv}qqaa{sv}", "s"};
+
+/// The client's object; one-way.
+inline constexpr const char* kReplyInterface = "com.corvane.veskreportingd.ClientSessionReplyInterface";
+inline constexpr Member kSendMessageToClient{"sendMessageToClient", "aa{sv}dqqaa{sv}", ""};
+
+}  // namespace vesk::wire

@@ -1,0 +1,133 @@
+#include "platform/ipc/BusConnection.h"
+
+#include "platform/ipc/ExtensionTokens.h"
+#include "platform/log/SystemLog.h"
+
+namespace vesk {
+
+namespace {
+
+std::uint64_t nextSerial() {
+  static std::atomic<std::uint64_t> last{0};
+  return ++last;
+}
+
+std::string nameFor(std::uint64_t serial, const IPCPeer& peer) {
+  return "connection " + std::to_string(serial) + " (user " + std::to_string(peer.user) + ", process " +
+         std::to_string(peer.process) + ")";
+}
+
+}  // namespace
+
+BusConnection::BusConnection(FileDescriptor socket, const IPCPeer& peer, const ConnectionSettings& settings,
+                             std::shared_ptr<ConnectionRegistry> registry)
+    : _serial(nextSerial()),
+      _peer(peer),
+      _settings(settings),
+      _name(nameFor(_serial, peer)),
+      _registry(std::move(registry)),
+      _wakeup(std::make_shared<Wakeup>()),
+      _replies(std::make_shared<BusReplies>([wakeup = _wakeup] { wakeup->signal(); })),
+      _outbox(settings.maximumOutbox),
+      _socket(std::move(socket)),
+      _router(settings.objectPath, _name, _replies, _serial) {}
+
+BusConnection::~BusConnection() { leave(); }
+
+void BusConnection::setExportedObject(std::shared_ptr<IPCExportedObject> object) {
+  _router.setExportedObject(std::move(object));
+}
+
+void BusConnection::setInterruptionHandler(std::function<void()> handler) {
+  _interruptionHandler = std::move(handler);
+}
+
+void BusConnection::setInvalidationHandler(std::function<void()> handler) {
+  _invalidationHandler = std::move(handler);
+}
+
+void BusConnection::resume() {
+  {
+    MutexLock lock(_mutex);
+    if (std::exchange(_started, true)) return;
+  }
+  try {
+    _registry->launch([self = shared_from_this()] { self->run(); });
+  } catch (const std::exception& error) {
+    VESK_LOG_ERROR("ipc: %s: Closed: %s", _name.c_str(), error.what());
+    end(ConnectionLoop::End::NotAuthenticated, nullptr);
+  }
+}
+
+void BusConnection::invalidate() {
+  _invalidated.store(true);
+  _wakeup->signal();
+}
+
+void BusConnection::discard() {
+  {
+    MutexLock lock(_mutex);
+    if (std::exchange(_started, true)) return;
+  }
+  _outbox.close();
+  dropHandlers();
+  _socket.reset();
+  leave();
+}
+
+void BusConnection::callRemoteObject(IPCOutgoingCall call,
+                                     const std::function<void(const std::string& error)>& errorHandler) {
+  if (const char* error = _outbox.put(std::move(call))) {
+    if (errorHandler) errorHandler(error);
+    return;
+  }
+  _wakeup->signal();
+}
+
+void BusConnection::run() noexcept {
+  try {
+    ConnectionLoop loop(_socket.get(), _peer, _name, _settings, _outbox, *_wakeup, *_replies, _router);
+    end(loop.serve(_invalidated), &loop);
+  } catch (const std::exception& error) {
+    VESK_LOG_ERROR("ipc: %s: Closed: %s", _name.c_str(), error.what());
+    end(ConnectionLoop::End::BrokenOff, nullptr);
+  }
+}
+
+void BusConnection::end(ConnectionLoop::End how, ConnectionLoop* loop) noexcept {
+  // A client that has gone takes no call; one that is sent away still gets what its session says in the end.
+  if (how != ConnectionLoop::End::Invalidated) _outbox.close();
+  if (how == ConnectionLoop::End::BrokenOff) callHandler(_interruptionHandler);
+  callHandler(_invalidationHandler);
+  dropHandlers();
+  if (loop && how == ConnectionLoop::End::Invalidated) loop->flush(kFlushTime);
+  if (std::size_t lost = _outbox.close()) {
+    VESK_LOG_WARNING("ipc: %s: Ended before %zu calls to the client were sent", _name.c_str(), lost);
+  }
+  ExtensionTokens::shared().drop(_serial);
+  leave();
+}
+
+void BusConnection::callHandler(const std::function<void()>& handler) noexcept {
+  if (!handler) return;
+  try {
+    handler();
+  } catch (const std::exception& error) {
+    VESK_LOG_ERROR("ipc: %s: A handler failed: %s", _name.c_str(), error.what());
+  }
+}
+
+void BusConnection::dropHandlers() noexcept {
+  // Moved out first: what goes with them may call this connection.
+  auto interruption = std::exchange(_interruptionHandler, nullptr);
+  auto invalidation = std::exchange(_invalidationHandler, nullptr);
+  auto object = _router.takeExportedObject();
+}
+
+void BusConnection::leave() noexcept {
+  if (!_counted.exchange(false)) return;
+  _registry->remove(_serial);
+  _registry->release(_peer.user);
+}
+
+}  // namespace vesk

@@ -1,0 +1,153 @@
+#include "platform/ipc/BusFeed.h"
+
+#include <sys/socket.h>
+
+#include <cerrno>
+#include <cstring>
+#include <system_error>
+
+namespace vesk {
+
+namespace {
+
+constexpr std::size_t kControlSize = CMSG_SPACE(sizeof(int) * BusFeed::kMaximumDescriptors);
+
+/// Takes every descriptor out of a received message, so that none is left open unseen.
+std::vector<FileDescriptor> takeDescriptors(msghdr& header) {
+  std::vector<FileDescriptor> descriptors;
+  for (cmsghdr* control = CMSG_FIRSTHDR(&header); control; control = CMSG_NXTHDR(&header, control)) {
+    if (control->cmsg_level != SOL_SOCKET || control->cmsg_type != SCM_RIGHTS) continue;
+    std::size_t count = (control->cmsg_len - CMSG_LEN(0)) / sizeof(int);
+    for (std::size_t i = 0; i < count; ++i) {
+      int descriptor = -1;
+      std::memcpy(&descriptor, CMSG_DATA(control) + i * sizeof(int), sizeof descriptor);
+      descriptors.emplace_back(descriptor);
+    }
+  }
+  return descriptors;
+}
+
+}  // namespace
+
+BusFeed::BusFeed(int socket, uid_t peer, std::size_t maximumMessage)
+    : _socket(socket), _authentication(peer), _messages(maximumMessage) {
+  int ends[2];
+  if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends) != 0) {
+    throw std::system_error(errno, std::generic_category(), "socketpair");
+  }
+  _inner = FileDescriptor(ends[0]);
+  _outer = FileDescriptor(ends[1]);
+  // Whatever the machine's default: a whole piece must fit, bookkeeping included.
+  int size = 4 * kPiece;
+  ::setsockopt(ends[1], SOL_SOCKET, SO_SNDBUF, &size, sizeof size);
+}
+
+BusFeed::Outcome BusFeed::refuse(const char* complaint) {
+  _complaint = complaint;
+  return Outcome::BrokenOff;
+}
+
+BusFeed::Outcome BusFeed::receive(Received& received) {
+  alignas(cmsghdr) char control[kControlSize];
+  iovec space{_buffer.data() + _held, _buffer.size() - _held};
+  msghdr header{};
+  header.msg_iov = &space;
+  header.msg_iovlen = 1;
+  header.msg_control = control;
+  header.msg_controllen = sizeof control;
+  ssize_t size = ::recvmsg(_socket, &header, MSG_DONTWAIT | MSG_CMSG_CLOEXEC);
+  if (size < 0) return errno == EAGAIN || errno == EINTR ? Outcome::Nothing : Outcome::BrokenOff;
+  if (header.msg_controllen > 0) received.descriptors = takeDescriptors(header);
+  // The kernel has closed what found no room, be it in the control data or in this process's table.
+  if (header.msg_flags & MSG_CTRUNC) return refuse("too many descriptors");
+  if (size == 0) return insideMessage() ? Outcome::BrokenOff : Outcome::HungUp;
+  received.bytes = static_cast<std::size_t>(size);
+  return Outcome::Fed;
+}
+
+BusFeed::Outcome BusFeed::pump() {
+  // What was held back behind BEGIN is looked at before more is read.
+  Received received;
+  if (!hasHeldMessages()) {
+    auto outcome = receive(received);
+    if (outcome != Outcome::Fed) return outcome;
+  }
+  _held += received.bytes;
+  _received += received.bytes;
+  if (_hasBegun) return passMessages(std::move(received.descriptors));
+  if (!received.descriptors.empty()) return refuse("a descriptor before authentication");
+  return authenticate();
+}
+
+BusFeed::Outcome BusFeed::authenticate() {
+  auto result = _authentication.pass(held());
+  if (result.verdict == AuthenticationGate::Verdict::Refused) return refuse("no D-Bus authentication");
+  if (!write(result.passedOn)) return refuse("internal failure");
+  keepFrom(result.taken);
+  _hasBegun = result.verdict == AuthenticationGate::Verdict::Begun;
+  return result.passedOn.empty() ? Outcome::Nothing : Outcome::Fed;
+}
+
+BusFeed::Outcome BusFeed::passMessages(std::vector<FileDescriptor> descriptors) {
+  auto result = _messages.pass(held());
+  std::size_t split = result.passed;
+  auto now = std::exchange(_descriptors, {});
+  if (!now.empty()) {
+    // They belong to the message whose header was held until now, at the front.
+    if (!descriptors.empty()) return refuse("descriptors within a message");
+    if (!result.lastStart) {
+      _descriptors.swap(now);
+    } else {
+      split = 0;
+    }
+  } else if (!descriptors.empty()) {
+    // A read ends with the piece that descriptors came with, and every D-Bus library sends them along with
+    // the first byte of their message: so it is the last message that has begun.
+    if (result.passed < _held) {
+      _descriptors = std::move(descriptors);
+    } else if (result.lastStart) {
+      split = *result.lastStart;
+      now = std::move(descriptors);
+    } else {
+      return refuse("descriptors within a message");
+    }
+  }
+  auto passed = held().substr(0, result.passed);
+  if (!write(passed.substr(0, split)) || !write(passed.substr(split), std::move(now))) {
+    return refuse("internal failure");
+  }
+  keepFrom(result.passed);
+  if (result.verdict == MessageGate::Verdict::TooLarge) return refuse("a message over the size limit");
+  if (result.verdict == MessageGate::Verdict::Malformed) return refuse("no D-Bus message");
+  return result.passed == 0 ? Outcome::Nothing : Outcome::Fed;
+}
+
+bool BusFeed::write(std::string_view data, std::vector<FileDescriptor> descriptors) {
+  if (data.empty()) return true;
+  iovec piece{const_cast<char*>(data.data()), data.size()};
+  msghdr header{};
+  header.msg_iov = &piece;
+  header.msg_iovlen = 1;
+  alignas(cmsghdr) char control[kControlSize] = {};
+  if (!descriptors.empty()) {
+    header.msg_control = control;
+    header.msg_controllen = CMSG_SPACE(sizeof(int) * descriptors.size());
+    cmsghdr* rights = CMSG_FIRSTHDR(&header);
+    rights->cmsg_level = SOL_SOCKET;
+    rights->cmsg_type = SCM_RIGHTS;
+    rights->cmsg_len = CMSG_LEN(sizeof(int) * descriptors.size());
+    for (std::size_t i = 0; i < descriptors.size(); ++i) {
+      int descriptor = descriptors[i].get();
+      std::memcpy(CMSG_DATA(rights) + i * sizeof(int), &descriptor, sizeof descriptor);
+    }
+  }
+  ssize_t written = ::sendmsg(_outer.get(), &header, MSG_DONTWAIT | MSG_NOSIGNAL);
+  return written == static_cast<ssize_t>(data.size());
+}
+
+void BusFeed::keepFrom(std::size_t offset) {
+  _held -= offset;
+  if (_held > 0) std::memmove(_buffer.data(), _buffer.data() + offset, _held);
+}
+
+}  // namespace vesk

@@ -1,0 +1,79 @@
+// The road of a client's bytes from its socket to sd-bus. Private to platform/ipc.
+#pragma once
+
+#include <array>
+#include <cstddef>
+#include <string_view>
+#include <vector>
+
+#include "platform/files/FileDescriptor.h"
+#include "platform/ipc/AuthenticationGate.h"
+#include "platform/ipc/MessageGate.h"
+
+namespace vesk {
+
+/// sd-bus takes messages of up to 128 MiB, any number of descriptors along with each, and drops a broken
+/// message without a word to read on at once, all of that within one call. So it does not read a client's
+/// socket but the inner end of a socket pair, into which this writes what has passed the gates. Many small
+/// messages cross in one read and one write. For the connection's thread; what is written must be processed
+/// before the next `pump`.
+class BusFeed {
+ public:
+  /// One read's worth. Small, because each connection has it on its stack.
+  static constexpr std::size_t kPiece = 16 * 1024;
+  /// Descriptors that may come with one message; no member takes more than one.
+  static constexpr std::size_t kMaximumDescriptors = 4;
+
+  enum class Outcome {
+    Fed,       ///< something went on to sd-bus
+    Nothing,   ///< nothing to read now, or not enough
+    HungUp,    ///< the peer has closed its end, between two messages
+    BrokenOff  ///< it broke off, or was refused: see `complaint`
+  };
+
+  /// Borrows `socket` (not blocking). Throws std::system_error.
+  BusFeed(int socket, uid_t peer, std::size_t maximumMessage);
+
+  /// The end for sd-bus; to be taken once.
+  FileDescriptor takeInnerEnd() { return std::move(_inner); }
+
+  Outcome pump();
+
+  /// Whether the client has said BEGIN: all that follows are messages.
+  bool hasBegun() const noexcept { return _hasBegun; }
+  /// Whether `pump` has work although the socket may have nothing to read.
+  bool hasHeldMessages() const noexcept { return _hasBegun && _held >= MessageGate::kFixedHeader; }
+  bool insideMessage() const noexcept { return _held > 0 || _messages.insideMessage(); }
+  /// Bytes read from the socket so far.
+  std::size_t received() const noexcept { return _received; }
+  /// What was refused, or null when the peer just went away.
+  const char* complaint() const noexcept { return _complaint; }
+
+ private:
+  struct Received {
+    std::size_t bytes = 0;
+    std::vector<FileDescriptor> descriptors{};
+  };
+
+  Outcome receive(Received& received);
+  Outcome authenticate();
+  Outcome passMessages(std::vector<FileDescriptor> descriptors);
+  Outcome refuse(const char* complaint);
+  bool write(std::string_view data, std::vector<FileDescriptor> descriptors = {});
+  void keepFrom(std::size_t offset);
+  std::string_view held() const { return {_buffer.data(), _held}; }
+
+  const int _socket;
+  FileDescriptor _inner;
+  FileDescriptor _outer;
+  AuthenticationGate _authentication;
+  MessageGate _messages;
+  bool _hasBegun = false;
+  const char* _complaint = nullptr;
+  std::vector<FileDescriptor> _descriptors;  // of the message whose header is held
+  std::size_t _received = 0;
+  std::size_t _held = 0;  // bytes at the front of the buffer that wait for more
+  std::array<char, kPiece> _buffer;
+};
+
+}  // namespace vesk

@@ -1,0 +1,73 @@
+#include "platform/ipc/ExtensionTokens.h"
+
+#include <sys/random.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <system_error>
+#include <vector>
+
+namespace vesk {
+
+namespace {
+
+std::string freshToken() {
+  unsigned char random[16];
+  // Asked for no more than 256 bytes, the kernel gives all of them.
+  if (::getrandom(random, sizeof random, 0) != sizeof random) {
+    throw std::system_error(errno, std::generic_category(), "getrandom");
+  }
+  constexpr char kDigits[] = "0123456789abcdef";
+  std::string token;
+  for (unsigned char byte : random) {
+    token += kDigits[byte >> 4];
+    token += kDigits[byte & 15];
+  }
+  return token;
+}
+
+}  // namespace
+
+ExtensionTokens& ExtensionTokens::shared() {
+  static ExtensionTokens tokens;
+  return tokens;
+}
+
+std::string ExtensionTokens::add(std::uint64_t owner, FileDescriptor descriptor) {
+  std::string token = freshToken();
+  FileDescriptor displaced;
+  MutexLock lock(_mutex);
+  auto isOwners = [owner](const Entry& entry) { return entry.owner == owner; };
+  if (std::count_if(_entries.begin(), _entries.end(), isOwners) >= std::ptrdiff_t{kMaximumPerOwner}) {
+    auto oldest = std::find_if(_entries.begin(), _entries.end(), isOwners);
+    displaced = std::move(oldest->descriptor);
+    _entries.erase(oldest);
+  }
+  _entries.push_back({owner, token, std::move(descriptor)});
+  return token;
+}
+
+FileDescriptor ExtensionTokens::consume(std::string_view token) {
+  MutexLock lock(_mutex);
+  auto entry =
+      std::find_if(_entries.begin(), _entries.end(), [&](const Entry& e) { return e.token == token; });
+  if (entry == _entries.end()) return {};
+  FileDescriptor descriptor = std::move(entry->descriptor);
+  _entries.erase(entry);
+  return descriptor;
+}
+
+void ExtensionTokens::drop(std::uint64_t owner) {
+  std::vector<Entry> dropped;  // closed after the lock: closing may wait for a file system
+  MutexLock lock(_mutex);
+  for (auto entry = _entries.begin(); entry != _entries.end();) {
+    if (entry->owner == owner) {
+      dropped.push_back(std::move(*entry));
+      entry = _entries.erase(entry);
+    } else {
+      ++entry;
+    }
+  }
+}
+
+}  // namespace vesk

@@ -1,0 +1,207 @@
+#include "platform/ipc/IPCListener.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/stat.h>
+
+#include <atomic>
+#include <cerrno>
+#include <system_error>
+
+#include "platform/ipc/BusConnection.h"
+#include "platform/ipc/ConnectionRegistry.h"
+#include "platform/ipc/SmallThread.h"
+#include "platform/ipc/UnixSocket.h"
+#include "platform/ipc/Wakeup.h"
+#include "platform/ipc/WarningBurst.h"
+#include "platform/log/SystemLog.h"
+
+namespace vesk {
+
+namespace {
+
+// For memory that the kernel may have again soon: accept() fails at once as long as it has not.
+constexpr int kPauseMilliseconds = 100;
+
+FileDescriptor anyDescriptor() { return FileDescriptor(::open("/dev/null", O_RDONLY | O_CLOEXEC)); }
+
+/// A listening socket that the service manager has opened.
+FileDescriptor checkedInherited(FileDescriptor socket) {
+  int domain = 0;
+  int listens = 0;
+  socklen_t size = sizeof domain;
+  bool known = ::getsockopt(socket.get(), SOL_SOCKET, SO_DOMAIN, &domain, &size) == 0 &&
+               ::getsockopt(socket.get(), SOL_SOCKET, SO_ACCEPTCONN, &listens, &size) == 0;
+  if (!known || domain != AF_UNIX || !listens) {
+    throw std::system_error(EINVAL, std::generic_category(),
+                            "The inherited socket is no listening Unix socket");
+  }
+  ::fcntl(socket.get(), F_SETFD, FD_CLOEXEC);
+  ::fcntl(socket.get(), F_SETFL, ::fcntl(socket.get(), F_GETFL) | O_NONBLOCK);
+  return socket;
+}
+
+}  // namespace
+
+class IPCListener::Implementation {
+ public:
+  explicit Implementation(Options options);
+  ~Implementation() { stop(); }
+
+  void setDelegate(IPCListenerDelegate* delegate) { _delegate = delegate; }
+  void resume();
+  void stop();
+  std::size_t connectionCount() const { return _registry->count(); }
+
+ private:
+  enum class Accepted { Yes, NoneWaiting, NoRoom };
+
+  void run();
+  Accepted acceptOne();
+  Accepted refuseForWantOfDescriptors();
+  void admit(FileDescriptor socket);
+  void introduce(FileDescriptor socket, const IPCPeer& peer);
+  void removeSocket();
+
+  const ConnectionSettings _settings;
+  const std::string _madePath;  // empty for an inherited socket
+  const std::shared_ptr<ConnectionRegistry> _registry;
+  FileDescriptor _listening;
+  FileDescriptor _reserve =
+      anyDescriptor();  // given up to accept, and close, a connection without any to spare
+  struct stat _madeSocket {};
+  Wakeup _wakeup;
+  std::atomic<bool> _stopping{false};
+  IPCListenerDelegate* _delegate = nullptr;
+  WarningBurst _refusals;
+  SmallThread _thread;
+};
+
+IPCListener::Implementation::Implementation(Options options)
+    : _settings{options.objectPath, options.maximumMessage, options.maximumOutbox,
+                options.authenticationTimeout},
+      _madePath(options.inherited ? std::string() : options.socketPath),
+      _registry(std::make_shared<ConnectionRegistry>(options.maximumConnections,
+                                                     options.maximumConnectionsPerUser)),
+      _listening(options.inherited ? checkedInherited(std::move(options.inherited))
+                                   : listenOnUnixSocket(options.socketPath)) {
+  if (!_madePath.empty()) ::stat(_madePath.c_str(), &_madeSocket);
+}
+
+void IPCListener::Implementation::resume() {
+  if (_stopping || _thread.isJoinable()) return;
+  _thread = SmallThread("vesk-listener", [this] { run(); });
+}
+
+void IPCListener::Implementation::stop() {
+  _stopping = true;
+  _wakeup.signal();
+  _thread.join();
+  removeSocket();
+  _listening.reset();
+  for (const auto& connection : _registry->connections()) {
+    connection->invalidate();
+    connection->discard();
+  }
+  _registry->waitForThreads();
+}
+
+/// Only the socket that this listener has made: another daemon may have taken the path over.
+void IPCListener::Implementation::removeSocket() {
+  struct stat now {};
+  if (!_listening || _madePath.empty() || ::lstat(_madePath.c_str(), &now) != 0) return;
+  if (now.st_dev == _madeSocket.st_dev && now.st_ino == _madeSocket.st_ino) ::unlink(_madePath.c_str());
+}
+
+void IPCListener::Implementation::run() {
+  bool pause = false;
+  while (!_stopping) {
+    pollfd polls[] = {
+        {_listening.get(), static_cast<short>(pause ? 0 : POLLIN), 0},
+        {_wakeup.fd(), POLLIN, 0},
+        {_registry->threadEnded().fd(), POLLIN, 0},
+    };
+    ::poll(polls, 3, pause ? kPauseMilliseconds : -1);
+    if (polls[2].revents) _registry->reap();
+    auto accepted = Accepted::Yes;
+    while (!_stopping && accepted == Accepted::Yes) accepted = acceptOne();
+    pause = accepted == Accepted::NoRoom;
+  }
+}
+
+IPCListener::Implementation::Accepted IPCListener::Implementation::acceptOne() {
+  FileDescriptor socket(::accept4(_listening.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
+  if (socket) {
+    admit(std::move(socket));
+    return Accepted::Yes;
+  }
+  switch (errno) {
+    case EAGAIN:
+      return Accepted::NoneWaiting;
+    case EMFILE:
+    case ENFILE:
+      return refuseForWantOfDescriptors();
+    case ENOMEM:
+    case ENOBUFS:
+      return Accepted::NoRoom;
+    default:
+      return Accepted::Yes;  // that connection was given up by its client
+  }
+}
+
+IPCListener::Implementation::Accepted IPCListener::Implementation::refuseForWantOfDescriptors() {
+  _reserve.reset();
+  FileDescriptor socket(::accept4(_listening.get(), nullptr, nullptr, SOCK_CLOEXEC));
+  bool refused = static_cast<bool>(socket);
+  socket.reset();
+  _reserve = anyDescriptor();
+  if (_refusals.begins()) VESK_LOG_WARNING("ipc: Refused a connection: no descriptor is left");
+  return refused ? Accepted::Yes : Accepted::NoRoom;
+}
+
+void IPCListener::Implementation::admit(FileDescriptor socket) {
+  IPCPeer peer;
+  try {
+    peer = peerOfSocket(socket.get());
+  } catch (const std::system_error& error) {
+    VESK_LOG_WARNING("ipc: Refused a connection: %s", error.what());
+    return;
+  }
+  auto admission = _registry->admit(peer.user);
+  if (admission == ConnectionRegistry::Admission::Admitted) return introduce(std::move(socket), peer);
+  if (_refusals.begins()) {
+    VESK_LOG_WARNING("ipc: Refused a connection of user %u: too many are open%s", peer.user,
+                     admission == ConnectionRegistry::Admission::TooManyOfUser ? " for that user" : "");
+  }
+}
+
+void IPCListener::Implementation::introduce(FileDescriptor socket, const IPCPeer& peer) {
+  std::shared_ptr<BusConnection> connection;
+  try {
+    connection = std::make_shared<BusConnection>(std::move(socket), peer, _settings, _registry);
+    _registry->add(connection->serial(), connection);
+    if (!_delegate || !_delegate->shouldAcceptNewConnection(connection)) connection->discard();
+  } catch (const std::exception& error) {
+    VESK_LOG_ERROR("ipc: Refused a connection: %s", error.what());
+    if (connection) {
+      connection->discard();
+    } else {
+      _registry->release(peer.user);
+    }
+  }
+}
+
+IPCListener::IPCListener(Options options)
+    : _implementation(std::make_unique<Implementation>(std::move(options))) {}
+
+IPCListener::~IPCListener() = default;
+
+void IPCListener::setDelegate(IPCListenerDelegate* delegate) { _implementation->setDelegate(delegate); }
+
+void IPCListener::resume() { _implementation->resume(); }
+
+void IPCListener::stop() { _implementation->stop(); }
+
+std::size_t IPCListener::connectionCount() const { return _implementation->connectionCount(); }
+
+}  // namespace vesk

@@ -1,0 +1,50 @@
+#include "platform/ipc/MessageGate.h"
+
+#include <algorithm>
+
+namespace vesk {
+
+namespace {
+
+std::uint32_t numberAt(std::string_view header, std::size_t at, bool bigEndian) {
+  std::uint32_t number = 0;
+  for (std::size_t i = 0; i < 4; ++i) {
+    auto byte = static_cast<unsigned char>(header[at + (bigEndian ? i : 3 - i)]);
+    number = number << 8 | byte;
+  }
+  return number;
+}
+
+/// Size of the message with this header, or nothing when it is no header: byte order, type, flags, version 1,
+/// size of the body, serial number (never 0), size of the array of header fields.
+std::optional<std::uint64_t> messageSize(std::string_view header) {
+  bool bigEndian = header[0] == 'B';
+  if (!bigEndian && header[0] != 'l') return std::nullopt;
+  if (header[1] == 0 || header[3] != 1) return std::nullopt;
+  if (numberAt(header, 8, bigEndian) == 0) return std::nullopt;
+  std::uint64_t fields = numberAt(header, 12, bigEndian);
+  std::uint64_t body = numberAt(header, 4, bigEndian);
+  return MessageGate::kFixedHeader + (fields + 7) / 8 * 8 + body;
+}
+
+}  // namespace
+
+MessageGate::Result MessageGate::pass(std::string_view data) {
+  Result result;
+  for (;;) {
+    auto step = static_cast<std::size_t>(std::min<std::uint64_t>(_remaining, data.size() - result.passed));
+    result.passed += step;
+    _remaining -= step;
+    auto rest = data.substr(result.passed);
+    if (rest.size() < kFixedHeader) return result;
+    auto size = messageSize(rest);
+    if (!size || *size > _maximumMessage) {
+      result.verdict = size ? Verdict::TooLarge : Verdict::Malformed;
+      return result;
+    }
+    result.lastStart = result.passed;
+    _remaining = *size;
+  }
+}
+
+}  // namespace vesk

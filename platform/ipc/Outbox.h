@@ -1,0 +1,42 @@
+// Calls to one client that wait for its connection's thread. Private to platform/ipc.
+#pragma once
+
+#include <cstddef>
+#include <deque>
+#include <optional>
+
+#include "platform/ipc/IPCConnection.h"
+#include "platform/sync/Mutex.h"
+
+namespace vesk {
+
+/// Bounded by number and by content, because a client that does not read must cost its session's memory only
+/// so much. Thread-safe; its lock is a leaf.
+class Outbox {
+ public:
+  /// Content of all waiting calls together; a single one may have `CodecLimits::content`.
+  static constexpr std::size_t kMaximumContent = std::size_t{4} << 20;
+
+  explicit Outbox(std::size_t maximumCalls) : _maximumCalls(maximumCalls) {}
+
+  /// Null when the call was taken, else why it was not.
+  const char* put(IPCOutgoingCall call);
+  std::optional<IPCOutgoingCall> take();
+  bool empty() const;
+  /// Refuses calls from now on and forgets those that wait; returns how many did.
+  std::size_t close();
+
+ private:
+  struct Entry {
+    IPCOutgoingCall call;
+    std::size_t content;
+  };
+
+  const std::size_t _maximumCalls;
+  mutable Mutex _mutex;
+  bool _closed VESK_GUARDED_BY(_mutex) = false;
+  std::size_t _content VESK_GUARDED_BY(_mutex) = 0;
+  std::deque<Entry> _entries VESK_GUARDED_BY(_mutex);
+};
+
+}  // namespace vesk
