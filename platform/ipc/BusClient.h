@@ -63,7 +63,8 @@ class BusClient {
   enum class Progress { Connected, Disconnected };
 
   /// Called exactly once, from `process` or, when the connection ends with answers owed, from `process`,
-  /// `flush` or the destructor. May send; must not destroy the client; must not throw.
+  /// `flush` or the destructor. May send; must
+  /// not call `process` or `flush`, destroy the client, or throw.
   using AnswerHandler = std::function<void(BusAnswer& answer)>;
 
   /// Connects. Throws std::system_error: ENOENT or ECONNREFUSED when no daemon is there, EAGAIN when too many

@@ -1,0 +1,277 @@
+#include "platform/ipc/BusClient.h"
+
+#include <poll.h>
+
+#include <algorithm>
+#include <climits>
+#include <deque>
+#include <list>
+#include <system_error>
+
+#include "platform/ipc/BusCodec.h"
+#include "platform/ipc/BusHandles.h"
+#include "platform/ipc/BusReplies.h"
+#include "platform/ipc/CallRouter.h"
+#include "platform/ipc/UnixSocket.h"
+#include "platform/log/SystemLog.h"
+
+namespace vesk {
+
+namespace {
+
+using namespace std::chrono_literals;
+
+// Steps of the bus in one `process`, so that a daemon that sends without end leaves the owner's loop its
+// turn.
+constexpr int kMaximumSteps = 64;
+
+void check(int result, const char* what) {
+  if (result < 0) throw std::system_error(-result, std::generic_category(), what);
+}
+
+struct SlotReleaser {
+  void operator()(sd_bus_slot* slot) const noexcept { sd_bus_slot_unref(slot); }
+};
+
+}  // namespace
+
+bool BusAnswer::read(bool& out) { return _arguments && _arguments->read(out); }
+bool BusAnswer::read(std::string& out) { return _arguments && _arguments->read(out); }
+bool BusAnswer::read(std::optional<std::string>& out) { return _arguments && _arguments->read(out); }
+bool BusAnswer::read(std::optional<Dictionary>& out) { return _arguments && _arguments->read(out); }
+bool BusAnswer::read(std::optional<std::vector<std::string>>& out) {
+  return _arguments && _arguments->read(out);
+}
+
+class BusClient::Implementation {
+ public:
+  explicit Implementation(Options options);
+  ~Implementation() { end(); }
+
+  void setExportedObject(std::shared_ptr<IPCExportedObject> object) {
+    _router.setExportedObject(std::move(object));
+  }
+  SendResult send(const IPCOutgoingCall& call, AnswerHandler handler, std::chrono::milliseconds timeout);
+  std::size_t queuedMessages() const;
+  bool isReady() const { return _bus && sd_bus_is_ready(_bus.get()) > 0; }
+  int fd() const { return _bus ? sd_bus_get_fd(_bus.get()) : -1; }
+  short events() const { return _bus ? static_cast<short>(sd_bus_get_events(_bus.get())) : short{0}; }
+  int timeout() const;
+  Progress process();
+  bool flush(std::chrono::milliseconds limit);
+
+ private:
+  struct Pending {
+    Implementation* client;
+    AnswerHandler handler;
+    std::unique_ptr<sd_bus_slot, SlotReleaser> slot{};
+  };
+  using PendingList = std::list<Pending>;
+
+  /// A call made before authentication was done. sd-bus would queue it too, but for one with a descriptor it
+  /// would wait.
+  struct Deferred {
+    BusMessageHandle message;
+    PendingList::iterator pending;
+    std::chrono::milliseconds timeout;
+  };
+
+  BusMessageHandle encode(const IPCOutgoingCall& call, bool expectReply, CodecResult& result) const;
+  bool write(sd_bus_message* message, PendingList::iterator pending, std::chrono::milliseconds timeout);
+  void sendDeferred();
+  static int answered(sd_bus_message* message, void* pending, sd_bus_error* error) noexcept;
+  static void call(AnswerHandler& handler, BusAnswer answer) noexcept;
+  void end() noexcept;
+
+  const std::string _objectPath;
+  const std::shared_ptr<BusReplies> _replies;
+  CallRouter _router;
+  BusHandle _bus;  // none once the connection has ended
+  PendingList _pending;
+  std::deque<Deferred> _deferred;
+  bool _hasMore = false;
+};
+
+BusClient::Implementation::Implementation(Options options)
+    : _objectPath(std::move(options.objectPath)),
+      _replies(std::make_shared<BusReplies>(nullptr)),
+      _router(_objectPath, "client", _replies, 0) {
+  FileDescriptor socket =
+      options.connected ? std::move(options.connected) : connectUnixSocket(options.socketPath);
+  sd_bus* raw = nullptr;
+  check(sd_bus_new(&raw), "sd_bus_new");
+  _bus.reset(raw);
+  check(sd_bus_set_fd(raw, socket.get(), socket.get()), "sd_bus_set_fd");
+  _replies->open(raw, socket.release());
+  check(sd_bus_negotiate_fds(raw, 1), "sd_bus_negotiate_fds");
+  check(sd_bus_start(raw), "sd_bus_start");
+}
+
+BusMessageHandle BusClient::Implementation::encode(const IPCOutgoingCall& call, bool expectReply,
+                                                   CodecResult& result) const {
+  sd_bus_message* raw = nullptr;
+  if (sd_bus_message_new_method_call(_bus.get(), &raw, nullptr, _objectPath.c_str(), call.interfaceName,
+                                     call.member) < 0) {
+    return {};
+  }
+  BusMessageHandle message(raw);
+  if (!expectReply) sd_bus_message_set_expect_reply(raw, 0);
+  BusEncoder encoder(raw);
+  for (const auto& argument : call.arguments) encoder.append(argument);
+  result = encoder.result();
+  return message;
+}
+
+BusClient::SendResult BusClient::Implementation::send(const IPCOutgoingCall& call, AnswerHandler handler,
+                                                      std::chrono::milliseconds timeout) {
+  if (!_bus || sd_bus_is_open(_bus.get()) <= 0) return SendResult::Disconnected;
+  CodecResult result = CodecResult::Ok;
+  BusMessageHandle message = encode(call, static_cast<bool>(handler), result);
+  if (!message) return SendResult::Disconnected;
+  if (result != CodecResult::Ok) return SendResult::Refused;
+
+  auto pending = _pending.end();
+  if (handler) pending = _pending.insert(_pending.end(), {this, std::move(handler)});
+  if (!isReady()) {
+    _deferred.push_back({std::move(message), pending, timeout});
+    return SendResult::Sent;
+  }
+  sendDeferred();
+  if (write(message.get(), pending, timeout)) return SendResult::Sent;
+  if (pending != _pending.end()) _pending.erase(pending);
+  return SendResult::Disconnected;
+}
+
+bool BusClient::Implementation::write(sd_bus_message* message, PendingList::iterator pending,
+                                      std::chrono::milliseconds timeout) {
+  if (pending == _pending.end()) return sd_bus_send(_bus.get(), message, nullptr) >= 0;
+  sd_bus_slot* slot = nullptr;
+  std::uint64_t limit = static_cast<std::uint64_t>(std::max(timeout, 1ms).count()) * 1000;
+  if (sd_bus_call_async(_bus.get(), &slot, message, answered, &*pending, limit) < 0) return false;
+  pending->slot.reset(slot);
+  return true;
+}
+
+/// A failure is that of the connection; its end tells the handlers.
+void BusClient::Implementation::sendDeferred() {
+  while (!_deferred.empty()) {
+    Deferred deferred = std::move(_deferred.front());
+    _deferred.pop_front();
+    write(deferred.message.get(), deferred.pending, deferred.timeout);
+  }
+}
+
+void BusClient::Implementation::call(AnswerHandler& handler, BusAnswer answer) noexcept {
+  try {
+    handler(answer);
+  } catch (const std::exception& error) {
+    VESK_LOG_ERROR("ipc: The handler of an answer failed: %s", error.what());
+  }
+}
+
+int BusClient::Implementation::answered(sd_bus_message* message, void* data, sd_bus_error*) noexcept {
+  Implementation* self = static_cast<Pending*>(data)->client;
+  auto pending = std::find_if(self->_pending.begin(), self->_pending.end(),
+                              [data](const Pending& entry) { return &entry == data; });
+  if (pending == self->_pending.end()) return 1;
+  PendingList taken;
+  taken.splice(taken.end(), self->_pending, pending);
+  const sd_bus_error* error = sd_bus_message_get_error(message);
+  if (!error) {
+    BusDecoder decoder(message);
+    call(taken.front().handler, BusAnswer(decoder));
+  } else if (sd_bus_is_open(self->_bus.get()) <= 0) {
+    call(taken.front().handler, BusAnswer(SD_BUS_ERROR_DISCONNECTED, "The connection has ended"));
+  } else {
+    call(taken.front().handler, BusAnswer(error->name, error->message ? error->message : ""));
+  }
+  return 1;
+}
+
+std::size_t BusClient::Implementation::queuedMessages() const {
+  std::uint64_t queued = 0;
+  if (_bus) sd_bus_get_n_queued_write(_bus.get(), &queued);
+  return queued + _deferred.size();
+}
+
+int BusClient::Implementation::timeout() const {
+  std::uint64_t deadline = 0;
+  if (_hasMore) return 0;
+  if (!_bus || sd_bus_get_timeout(_bus.get(), &deadline) <= 0 || deadline == UINT64_MAX) return -1;
+  // sd-bus counts on the clock that steady_clock reads.
+  auto at = std::chrono::steady_clock::time_point(std::chrono::microseconds(deadline));
+  auto left = std::chrono::ceil<std::chrono::milliseconds>(at - std::chrono::steady_clock::now()).count();
+  return static_cast<int>(std::clamp<long long>(left, 0, INT_MAX));
+}
+
+BusClient::Progress BusClient::Implementation::process() {
+  if (!_bus) return Progress::Disconnected;
+  _hasMore = false;
+  _replies->sendWaiting();
+  for (int step = 0; step < kMaximumSteps; ++step) {
+    sd_bus_message* raw = nullptr;
+    int result = sd_bus_process(_bus.get(), &raw);
+    BusMessageHandle message(raw);
+    if (message) _router.route(raw);
+    if (result < 0 || sd_bus_is_open(_bus.get()) <= 0) {
+      end();
+      return Progress::Disconnected;
+    }
+    if (isReady()) sendDeferred();
+    if (result == 0) return Progress::Connected;
+  }
+  _hasMore = true;
+  return Progress::Connected;
+}
+
+void BusClient::Implementation::end() noexcept {
+  _replies->close();
+  _deferred.clear();
+  PendingList owed;
+  owed.swap(_pending);
+  for (auto& pending : owed) pending.slot.reset();
+  _bus.reset();
+  for (auto& pending : owed) {
+    call(pending.handler, BusAnswer(SD_BUS_ERROR_DISCONNECTED, "The connection has ended"));
+  }
+}
+
+bool BusClient::Implementation::flush(std::chrono::milliseconds limit) {
+  const auto deadline = std::chrono::steady_clock::now() + limit;
+  while (_bus && queuedMessages() > 0) {
+    auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
+    if (left <= 0ms) return false;
+    pollfd poll{fd(), events(), 0};
+    ::poll(&poll, 1, static_cast<int>(std::min<long long>(left.count(), INT_MAX)));
+    if (process() == Progress::Disconnected) return false;
+  }
+  return _bus != nullptr;
+}
+
+BusClient::BusClient(Options options)
+    : _implementation(std::make_unique<Implementation>(std::move(options))) {}
+
+BusClient::~BusClient() = default;
+
+void BusClient::setExportedObject(std::shared_ptr<IPCExportedObject> object) {
+  _implementation->setExportedObject(std::move(object));
+}
+
+BusClient::SendResult BusClient::send(const IPCOutgoingCall& call) {
+  return _implementation->send(call, nullptr, 0ms);
+}
+
+BusClient::SendResult BusClient::send(const IPCOutgoingCall& call, AnswerHandler handler,
+                                      std::chrono::milliseconds timeout) {
+  return _implementation->send(call, std::move(handler), timeout);
+}
+
+std::size_t BusClient::queuedMessages() const { return _implementation->queuedMessages(); }
+bool BusClient::isReady() const { return _implementation->isReady(); }
+int BusClient::fd() const { return _implementation->fd(); }
+short BusClient::events() const { return _implementation->events(); }
+int BusClient::timeout() const { return _implementation->timeout(); }
+BusClient::Progress BusClient::process() { return _implementation->process(); }
+bool BusClient::flush(std::chrono::milliseconds limit) { return _implementation->flush(limit); }
+
+}  // namespace vesk
