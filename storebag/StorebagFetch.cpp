@@ -1,0 +1,188 @@
+#include "storebag/StorebagFetch.h"
+
+#include <algorithm>
+#include <chrono>
+#include <limits>
+#include <utility>
+
+#include "platform/crypto/Base64.h"
+#include "platform/crypto/RSAPublicKey.h"
+#include "platform/log/SystemLog.h"
+#include "platform/plist/PropertyList.h"
+#include "storebag/StorebagFallback.h"
+#include "storebag/StorebagNaming.h"
+#include "storebag/StorebagProfile.h"
+#include "storebag/StorebagSignature.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::chrono::seconds kTimeout{15};
+constexpr std::int32_t kLongestAge = 86400;  // seconds
+constexpr std::string_view kFallbackName = "palvo";
+constexpr std::string_view kStorebag = "storebag";  // stands for the backend in lines about its own entries
+
+/// The integer at the start of `text`, behind white space; held inside 32 bits.
+std::int32_t leadingInteger(std::string_view text) {
+  text.remove_prefix(std::min(text.find_first_not_of(" \t\n\v\f\r"), text.size()));
+  bool negative = text.starts_with('-');
+  if (negative || text.starts_with('+')) text.remove_prefix(1);
+  std::int64_t value = 0;
+  for (char c : text) {
+    if (c < '0' || c > '9') break;
+    value = std::min<std::int64_t>(value * 10 + (c - '0'), std::int64_t{1} << 31);
+  }
+  if (negative) value = -value;
+  return static_cast<std::int32_t>(std::min<std::int64_t>(value, std::numeric_limits<std::int32_t>::max()));
+}
+
+HTTPRequest requestFor(const std::string& url, const std::optional<std::string>* lastModified) {
+  HTTPRequest request;
+  request.url = url;
+  request.timeout = kTimeout;
+  if (lastModified && *lastModified) {
+    VESK_LOG_DEBUG("fetchStorebagWithName: Adding 'Last-Modified: %s' to the header",
+                   (*lastModified)->c_str());
+    request.headers.emplace_back("If-Modified-Since", **lastModified);
+  }
+  return request;
+}
+
+/// Whether the answer says that the caller's storebag is still the current one; else notes what it says about
+/// its own age.
+bool hasNotChanged(const HTTPResponse& response, std::optional<std::string>* lastModified) {
+  auto received = response.header("Last-Modified");
+  if (!lastModified || !received) return false;
+  if (response.body.empty() && *lastModified) {
+    VESK_LOG_DEBUG("fetchStorebagWithName: storebag content has not changed. using its cached version");
+    return true;
+  }
+  *lastModified = std::string(*received);
+  VESK_LOG_DEBUG("fetchStorebagWithName: New 'Last-Modified: %s' received", (*lastModified)->c_str());
+  return false;
+}
+
+/// The signed document around a storebag; empty when `body` is none.
+Dictionary documentIn(const std::string& body) {
+  auto outcome = parsePropertyList(body);
+  if (!outcome.value) {
+    VESK_LOG_ERROR("fetchStorebagWithName: propertyListWithData error %s", outcome.error.c_str());
+    return {};
+  }
+  const Dictionary* document = outcome.value->dictionary();
+  return document ? *document : Dictionary();
+}
+
+std::optional<Dictionary> verifiedPayload(const Dictionary& document, const StorebagSource& source) {
+  auto signatureText = document.text("signature");
+  if (!signatureText) {
+    VESK_LOG_ERROR("fetchStorebagWithName: Signature is missing");
+    return std::nullopt;
+  }
+  auto der = source.publicKey ? source.publicKey() : std::nullopt;
+  auto publicKey = der ? RSAPublicKey::fromDER(*der) : std::nullopt;
+  if (!publicKey) return std::nullopt;
+
+  auto signature = base64Decode(signatureText->view());
+  if (!signature) return std::nullopt;
+  auto bagText = document.text("bag");
+  auto bag = bagText ? base64Decode(bagText->view()) : std::nullopt;
+  if (!bag) return std::nullopt;
+
+  if (!verifyStorebagSignature(*publicKey, *bag, *signature)) {
+    VESK_LOG_ERROR("fetchStorebagWithName: Signature can not be verified, %p", publicKey->identity());
+    return std::nullopt;
+  }
+  auto payload = parsePropertyList(*bag);
+  if (!payload.value || !payload.value->dictionary()) return std::nullopt;
+  return *payload.value->dictionary();
+}
+
+}  // namespace
+
+std::int32_t maxAgeFromCacheControl(std::optional<std::string_view> cacheControl) {
+  std::string_view rest = cacheControl.value_or("");
+  for (bool found = false;;) {
+    auto end = rest.find_first_of("= ");
+    auto token = rest.substr(0, end);
+    if (found) return leadingInteger(token);
+    found = token == "max-age";
+    if (end == std::string_view::npos) return kLongestAge;
+    rest.remove_prefix(end + 1);
+  }
+}
+
+std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const StorebagSource& source,
+                                                std::string_view name, std::int32_t& maxAge,
+                                                bool& notModified, std::optional<std::string>* lastModified) {
+  std::string url = storebagServerBaseURL();
+  ((url += '/') += name) += "?version=";
+  url += source.libraryVersion;
+  VESK_LOG_DEBUG("fetchStorebagWithName: Storebag Server URL: %s", url.c_str());
+
+  HTTPResult result = http.perform(requestFor(url, lastModified));
+  if (result.error) {
+    VESK_LOG_INFO(
+        "fetchStorebagWithName: Error resolving with lookup server %s, sendSynchronousRequest error %s",
+        url.c_str(), result.error->description.c_str());
+    if (name != kFallbackName) return std::nullopt;
+    VESK_LOG_INFO("fetchStorebagWithName: Loading default storebag '%s'", std::string(name).c_str());
+    return fallbackStorebag();
+  }
+  maxAge = maxAgeFromCacheControl(result.response->header("Cache-Control"));
+  if (hasNotChanged(*result.response, lastModified)) {
+    notModified = true;
+    return std::nullopt;
+  }
+  return verifiedPayload(documentIn(result.response->body), source);
+}
+
+std::optional<Dictionary> storebagSectionForEnvironment(const Dictionary& payload,
+                                                        std::int32_t environmentType,
+                                                        std::int32_t clientType) {
+  auto name = environmentNameForType(environmentType);
+  auto section = name ? profileDictionary(kStorebag, payload, *name) : std::nullopt;
+  if (!section && environmentType == kSeedEnvironment) {
+    VESK_LOG_WARNING("fetchStorebagForEnvironmentAndClientType: Seed section is missing in the storebag.");
+    name = "release";
+    section = profileDictionary(kStorebag, payload, *name);
+  }
+  if (!section) {
+    VESK_LOG_ERROR(
+        "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type %d with %s "
+        "environment",
+        clientType, std::string(name.value_or("(none)")).c_str());
+  }
+  return section;
+}
+
+std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
+    HTTPClient& http, const StorebagSource& source, std::int32_t clientType, std::int32_t& maxAge,
+    std::optional<std::string>& version, bool& notModified, std::optional<std::string>* lastModified) {
+  auto name = storebagNameForClientType(clientType);
+  if (!name) {
+    VESK_LOG_ERROR(
+        "fetchStorebagForEnvironmentAndClientType: Could not find storebag name for client type %d",
+        clientType);
+    return std::nullopt;
+  }
+  auto payload = fetchStorebagWithName(http, source, *name, maxAge, notModified, lastModified);
+  if (!payload) {
+    if (notModified) return std::nullopt;
+    VESK_LOG_ERROR("fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type %d",
+                   clientType);
+    return std::nullopt;
+  }
+  auto section = storebagSectionForEnvironment(*payload, currentEnvironmentType(), clientType);
+  if (!section) return std::nullopt;
+  version = profileText(kStorebag, *payload, "version");
+  if (auto cycle = profileInteger(kStorebag, *payload, "refresh_cycle")) {
+    maxAge = static_cast<std::int32_t>(
+        std::clamp<std::int64_t>(*cycle, std::numeric_limits<std::int32_t>::min(), kLongestAge));
+    VESK_LOG_INFO("fetchStorebagForEnvironmentAndClientType: Store bag override MaxAge=%d", maxAge);
+  }
+  return section;
+}
+
+}  // namespace vesk

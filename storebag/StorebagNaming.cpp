@@ -1,0 +1,95 @@
+#include "storebag/StorebagNaming.h"
+
+#include <atomic>
+#include <mutex>
+
+#include "platform/log/SystemLog.h"
+#include "platform/preferences/PreferencesSuite.h"
+#include "util/ReportingdUtil.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::string_view kSuite = "com.corvane.veskreporting";
+constexpr std::int32_t kDefaultEnvironment = kSeedEnvironment;
+constexpr std::int64_t kEnvironmentTypes = 5;  // 0, which names no section, included
+
+std::atomic<std::int32_t> processEnvironmentType{0};
+
+}  // namespace
+
+std::optional<std::string_view> storebagNameForClientType(std::int32_t clientType) {
+  switch (clientType) {
+    case 5:
+      return "zelko";
+    case 6:
+      return "brannic";
+    case 7:
+    case 11:
+      return "palvo";
+    case 8:
+      return "tessin";
+    case 9:
+      return "quimby";
+    case 10:
+      return "dorvel";
+    default:
+      return std::nullopt;
+  }
+}
+
+std::optional<std::string_view> environmentNameForType(std::int32_t environmentType) {
+  switch (environmentType) {
+    case 1:
+      return "development";
+    case kInternalEnvironment:
+      return "corvane_internal";
+    case kSeedEnvironment:
+      return "seed";
+    case 4:
+      return "release";
+    default:
+      return std::nullopt;
+  }
+}
+
+std::int32_t environmentTypeForPreference(const std::optional<Value>& preference) {
+  if (!preference) return kDefaultEnvironment;
+  std::int64_t value = integerForm(*preference);
+  if (value >= 0 && value < kEnvironmentTypes) return static_cast<std::int32_t>(value);
+  VESK_LOG_ERROR("userDefaultsEnvironment: Invalid environment type %u", static_cast<unsigned>(value));
+  return kInternalEnvironment;
+}
+
+void userDefaultsEnvironment() {
+  std::int32_t type = environmentTypeForPreference(PreferencesSuite(kSuite).valueForKey("environmentType"));
+  processEnvironmentType = type;
+  VESK_LOG_INFO("userDefaultsEnvironment: Environment type %u", static_cast<unsigned>(type));
+}
+
+std::int32_t currentEnvironmentType() {
+  static std::once_flag once;
+  std::call_once(once, userDefaultsEnvironment);
+  return processEnvironmentType;
+}
+
+std::optional<std::string> preferenceStringForKey(std::string_view key) {
+  auto value = PreferencesSuite(kSuite).valueForKey(key);
+  if (!value) return std::nullopt;
+  return stringForm(*value);
+}
+
+std::string storebagServerBaseURLFor(const std::optional<std::string>& override, bool internalBuild) {
+  if (override) return *override;
+  return internalBuild ? "https://" VESK_PARTNER_STOREBAG_HOST "/storebags/sorrel"
+                       : "https://" VESK_STOREBAG_HOST "/bags/sorrel";
+}
+
+std::string storebagServerBaseURL() {
+  static const std::optional<std::string> override = preferenceStringForKey("veskreporting_storebag_url");
+  // The kind of build is only asked for where it decides.
+  return storebagServerBaseURLFor(override, !override && isInternalBuild());
+}
+
+}  // namespace vesk

@@ -1,0 +1,83 @@
+#include "storebag/StorebagProfile.h"
+
+#include "platform/log/SystemLog.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::size_t kShown = 64;  // bytes of a value in a log line
+
+/// The value under `key` when `accepts` it.
+template <class Accepts>
+const Value* find(std::string_view backendName, const Dictionary& profile, std::string_view key,
+                  Accepts accepts) {
+  const Value* value = profile.find(key);
+  if (!value || accepts(*value)) return value;
+  reportWrongType(backendName, key, *value);
+  return nullptr;
+}
+
+}  // namespace
+
+void reportWrongType(std::string_view backendName, std::string_view key, const Value& value) {
+  if (!SystemLog::isOn(LogLevel::Warning)) return;
+  SystemLog::write(LogLevel::Warning,
+                   "%.*s: The storebag's value for '%.*s' has the wrong type and counts as absent: %s",
+                   static_cast<int>(backendName.size()), backendName.data(), static_cast<int>(key.size()),
+                   key.data(), describe(value, kShown).c_str());
+}
+
+std::optional<std::string> profileText(std::string_view backendName, const Dictionary& profile,
+                                       std::string_view key) {
+  auto* value = find(backendName, profile, key, [](const Value& v) { return v.text() != nullptr; });
+  if (!value) return std::nullopt;
+  return value->text()->string();
+}
+
+std::optional<Value> profileNumber(std::string_view backendName, const Dictionary& profile,
+                                   std::string_view key) {
+  auto* value = find(backendName, profile, key, [](const Value& v) { return v.isNumber(); });
+  if (!value) return std::nullopt;
+  return *value;
+}
+
+std::optional<std::int64_t> profileInteger(std::string_view backendName, const Dictionary& profile,
+                                           std::string_view key) {
+  auto number = profileNumber(backendName, profile, key);
+  if (!number) return std::nullopt;
+  return number->asInteger();
+}
+
+std::optional<List> profileList(std::string_view backendName, const Dictionary& profile,
+                                std::string_view key) {
+  auto* value = find(backendName, profile, key, [](const Value& v) { return v.list() != nullptr; });
+  if (!value) return std::nullopt;
+  return *value->list();
+}
+
+std::optional<std::vector<std::string>> profileTextList(std::string_view backendName,
+                                                        const Dictionary& profile, std::string_view key) {
+  auto list = profileList(backendName, profile, key);
+  if (!list) return std::nullopt;
+  std::vector<std::string> texts;
+  const Value* wrong = nullptr;
+  for (const Value& element : *list) {
+    if (const Text* text = element.text()) {
+      texts.push_back(text->string());
+    } else if (!wrong) {
+      wrong = &element;
+    }
+  }
+  if (wrong) reportWrongType(backendName, key, *wrong);
+  return texts;
+}
+
+std::optional<Dictionary> profileDictionary(std::string_view backendName, const Dictionary& profile,
+                                            std::string_view key) {
+  auto* value = find(backendName, profile, key, [](const Value& v) { return v.dictionary() != nullptr; });
+  if (!value) return std::nullopt;
+  return *value->dictionary();
+}
+
+}  // namespace vesk
