@@ -1,0 +1,30 @@
+// The daemon's view of the client's object.
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <string>
+
+#include "client/protocol/ClientSessionInterface.h"
+#include "platform/ipc/IPCConnection.h"
+
+namespace vesk {
+
+/// Sends each call through the connection's outbox. Never blocks; for any thread.
+class ClientSessionReplyProxy final : public ClientSessionReplyInterface {
+ public:
+  /// `errorHandler` is called, on the calling thread, when a call can't be sent.
+  ClientSessionReplyProxy(std::shared_ptr<IPCConnection> connection,
+                          std::function<void(const std::string& error)> errorHandler)
+      : _connection(std::move(connection)), _errorHandler(std::move(errorHandler)) {}
+
+  void sendMessageToClient(const std::optional<Dictionary>& sessionInfo, double timestamp,
+                           std::uint16_t category, std::uint16_t type,
+                           const std::optional<Dictionary>& payload) override;
+
+ private:
+  const std::shared_ptr<IPCConnection> _connection;
+  const std::function<void(const std::string& error)> _errorHandler;
+};
+
+}  // namespace vesk

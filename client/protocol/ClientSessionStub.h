@@ -1,0 +1,40 @@
+// The daemon's end of the protocol: calls as they come over the wire become calls of a session.
+#pragma once
+
+#include <memory>
+
+#include "client/protocol/ClientSessionInterface.h"
+#include "platform/ipc/IPCConnection.h"
+#include "platform/ipc/IPCIncomingCall.h"
+
+namespace vesk {
+
+/// Exported under wire::kObjectPath; holds its session, so the connection that exports it does.
+class ClientSessionStub final : public IPCExportedObject {
+ public:
+  explicit ClientSessionStub(std::shared_ptr<ClientSessionInterface> session)
+      : _session(std::move(session)) {}
+
+  const char* interfaceName() const override;
+  const char* introspection() const override;
+  void handle(IPCIncomingCall& call) override;
+
+ private:
+  void setSessionInfo(IPCIncomingCall& call);
+  void startConfigWithCompletionHandler(IPCIncomingCall& call);
+  void fetchStatesWithUserInfo(IPCIncomingCall& call);
+  void fetchDisplayURL(IPCIncomingCall& call);
+  void sendMessageWithCategory(IPCIncomingCall& call);
+  void sendMessageWithDictionary(IPCIncomingCall& call);
+  void flushMessagesWithReply(IPCIncomingCall& call);
+  void uploadFileAtPath(IPCIncomingCall& call);
+  void uploadLogData(IPCIncomingCall& call);
+  void sendMessageWithSessionInfo(IPCIncomingCall& call);
+
+  struct Handler;
+  static const Handler kHandlers[];
+
+  const std::shared_ptr<ClientSessionInterface> _session;
+};
+
+}  // namespace vesk
