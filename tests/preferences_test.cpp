@@ -1,0 +1,160 @@
+#include "platform/preferences/PreferencesSuite.h"
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <cstdlib>
+
+#include "platform/preferences/TomlFile.h"
+#include "tests/support/CapturedLog.h"
+#include "tests/support/TestRoot.h"
+
+namespace vesk::test {
+namespace {
+
+constexpr char kSystemFile[] = "etc/veskreporting/preferences/com.example.suite.toml";
+constexpr char kUserFile[] = "conf/veskreporting/preferences/com.example.suite.toml";
+
+class Preferences : public testing::Test {
+ protected:
+  void SetUp() override {
+    for (const char* directory : {"etc", "conf", "home"}) std::filesystem::remove_all(testRoot() / directory);
+    ::setenv("XDG_CONFIG_HOME", "/conf", 1);
+    ::setenv("HOME", "/home/user", 1);
+  }
+  static std::optional<Value> valueForKey(std::string_view key) {
+    return PreferencesSuite("com.example.suite").valueForKey(key);
+  }
+};
+
+TEST_F(Preferences, HaveEveryKindOfValue) {
+  testRoot().write(kSystemFile, R"(
+text = "é"
+integer = -7
+real = 2.5
+boolean = true
+date = 2026-11-24
+"date with time" = 2026-11-24T20:31:29.5+01:00
+"local date" = 2026-11-24T20:31:29
+time = 07:32:00
+list = [1, "two"]
+[table]
+key = "value"
+)");
+  const struct {
+    const char* key;
+    Value value;
+  } cases[] = {
+      {"text", "é"},
+      {"integer", -7},
+      {"real", 2.5},
+      {"boolean", true},
+      {"date", Date{1795478400}},
+      {"date with time", Date{1795548689.5}},
+      {"local date", Date{1795552289}},
+      {"time", "07:32:00"},
+      {"list", List{1, "two"}},
+      {"table", Dictionary{{"key", "value"}}},
+  };
+  for (const auto& c : cases) EXPECT_EQ(valueForKey(c.key), c.value) << c.key;
+  EXPECT_EQ(valueForKey("key"), std::nullopt);
+}
+
+TEST_F(Preferences, OfTheUserWinKeyByKey) {
+  testRoot().write(kSystemFile, "a = 1\nb = 2\n");
+  testRoot().write(kUserFile, "b = 3\n");
+  EXPECT_EQ(valueForKey("a"), Value(1));
+  EXPECT_EQ(valueForKey("b"), Value(3));
+}
+
+TEST_F(Preferences, OfTheUserStandInTheHomeWithoutAConfigurationDirectory) {
+  testRoot().write("home/user/.config/veskreporting/preferences/com.example.suite.toml", "a = 1\n");
+  EXPECT_EQ(valueForKey("a"), std::nullopt);
+  ::setenv("XDG_CONFIG_HOME", "relative", 1);
+  EXPECT_EQ(valueForKey("a"), Value(1));
+  ::unsetenv("XDG_CONFIG_HOME");
+  EXPECT_EQ(valueForKey("a"), Value(1));
+  ::unsetenv("HOME");
+  EXPECT_EQ(valueForKey("a"), std::nullopt);
+}
+
+TEST_F(Preferences, AreReadAtEachOpening) {
+  testRoot().write(kSystemFile, "a = 1\n");
+  const PreferencesSuite before("com.example.suite");
+  testRoot().write(kSystemFile, "a = 2\n");
+  EXPECT_EQ(before.valueForKey("a"), Value(1));
+  EXPECT_EQ(valueForKey("a"), Value(2));
+}
+
+TEST_F(Preferences, ThatAreUnusableCountAsEmptyWithOneLine) {
+  const auto path = testRoot() / kUserFile;
+  testRoot().write(kSystemFile, "a = 1\n");
+  std::string dots = "a";
+  for (int i = 0; i < 300'000; ++i) dots += ".a";
+  const std::string contents[] = {"a = ",
+                                  "a = \"\xFF\"",
+                                  "a = 1\na = 2\n",
+                                  std::string("a = \"\0\"", 7),
+                                  dots + " = 1",
+                                  "a = " + std::string(100'000, '['),
+                                  "a = \"" + std::string(1 << 20, 'x') + "\""};
+  for (const auto& content : contents) {
+    CapturedLog log;
+    testRoot().write(kUserFile, content);
+    EXPECT_EQ(valueForKey("a"), Value(1)) << content.substr(0, 50);
+    EXPECT_EQ(log.lines().size(), 1u) << content.substr(0, 50);
+    EXPECT_EQ(log.countContaining(4, path.string() + " is ignored: "), 1);
+  }
+  const auto makers = {+[](const char* name) { return ::mkdir(name, 0755); },
+                       +[](const char* name) { return ::mkfifo(name, 0644); }};
+  for (auto make : makers) {
+    std::filesystem::remove(path);
+    ASSERT_EQ(make(path.c_str()), 0);
+    CapturedLog log;
+    EXPECT_EQ(valueForKey("a"), Value(1));
+    EXPECT_EQ(log.count(4, path.string() + " is ignored: not a regular file"), 1);
+  }
+}
+
+TEST_F(Preferences, ThatAreMissingCostNoLine) {
+  CapturedLog log;
+  EXPECT_EQ(valueForKey("a"), std::nullopt);
+  EXPECT_TRUE(log.lines().empty());
+}
+
+TEST_F(Preferences, AreNotReadFromElsewhere) {
+  testRoot().write("etc/veskreporting/secret.toml", "a = 1\n");
+  for (std::string_view suite : {"../secret", "", ".", "..", "/etc/veskreporting/secret"}) {
+    EXPECT_EQ(PreferencesSuite(suite).valueForKey("a"), std::nullopt) << suite;
+  }
+}
+
+TEST(PreferenceForms, AreTextAndInteger) {
+  const struct {
+    Value value;
+    std::optional<std::string> text;
+    std::int64_t integer;
+  } cases[] = {
+      {"text", "text", 0},
+      {"12abc", "12abc", 12},
+      {" -3", " -3", -3},
+      {"+4", "+4", 4},
+      {"+-4", "+-4", 0},
+      {"", "", 0},
+      {"99999999999999999999", "99999999999999999999", INT64_MAX},
+      {"-99999999999999999999", "-99999999999999999999", INT64_MIN},
+      {7, "7", 7},
+      {UINT64_MAX, "18446744073709551615", -1},
+      {2.5, "2.5", 2},
+      {true, "1", 1},
+      {List{1}, std::nullopt, 0},
+      {Dictionary{}, std::nullopt, 0},
+  };
+  for (const auto& c : cases) {
+    EXPECT_EQ(stringForm(c.value), c.text) << describe(c.value);
+    EXPECT_EQ(integerForm(c.value), c.integer) << describe(c.value);
+  }
+}
+
+}  // namespace
+}  // namespace vesk::test

@@ -1,0 +1,66 @@
+#include <gtest/gtest.h>
+
+#include <thread>
+#include <vector>
+
+#include "util/Counters.h"
+#include "util/SamplingDraw.h"
+
+namespace vesk {
+namespace {
+
+std::vector<std::tuple<std::string, DropReason, std::uint64_t>> counts(const Counters& counters) {
+  std::vector<std::tuple<std::string, DropReason, std::uint64_t>> out;
+  for (const auto& count : counters.snapshot()) out.emplace_back(count.backend, count.reason, count.count);
+  return out;
+}
+
+TEST(Counters, CountByBackendAndReason) {
+  Counters counters;
+  EXPECT_TRUE(counters.snapshot().empty());
+  counters.count("wren", DropReason::NoURL, 5);
+  counters.count("httpPost", DropReason::TransportError);
+  counters.count("httpPost", DropReason::StateDisabled, 2);
+  counters.count("httpPost", DropReason::TransportError);
+  EXPECT_EQ(counts(counters), (std::vector<std::tuple<std::string, DropReason, std::uint64_t>>{
+                                  {"httpPost", DropReason::StateDisabled, 2},
+                                  {"httpPost", DropReason::TransportError, 2},
+                                  {"wren", DropReason::NoURL, 5}}));
+}
+
+TEST(Counters, PutNamesBeyondTheBoundTogether) {
+  Counters counters;
+  for (int i = 0; i < 100; ++i) counters.count(std::to_string(i), DropReason::OverBound);
+  EXPECT_EQ(counters.snapshot().size(), 65u);
+  EXPECT_EQ(counts(counters).back(),
+            std::make_tuple(std::string("other"), DropReason::OverBound, std::uint64_t{36}));
+  counters.count("63", DropReason::OverBound);
+  EXPECT_EQ(counters.snapshot().size(), 65u);
+}
+
+TEST(Counters, LoseNothingBetweenThreads) {
+  Counters counters;
+  std::vector<std::thread> threads;
+  for (int i = 0; i < 4; ++i) {
+    threads.emplace_back([&] {
+      for (int k = 0; k < 1000; ++k) counters.count(k % 2 ? "a" : "b", DropReason::ServerError5xx);
+    });
+  }
+  for (auto& thread : threads) thread.join();
+  for (const auto& count : counters.snapshot()) EXPECT_EQ(count.count, 2000u);
+}
+
+TEST(Counters, HaveANameForEveryReason) {
+  for (std::size_t i = 0; i < kDropReasonCount; ++i)
+    EXPECT_NE(nameOfDropReason(static_cast<DropReason>(i)), "unknown");
+}
+
+TEST(SamplingDraw, FollowsTheDefaultSequence) {
+  // What drand48 gives to a program that never seeds it.
+  EXPECT_NEAR(nextSamplingDraw(), 0.0, 1e-9);
+  EXPECT_NEAR(nextSamplingDraw(), 0.000985394675650, 1e-12);
+  EXPECT_NEAR(nextSamplingDraw(), 0.041631001594613, 1e-12);
+}
+
+}  // namespace
+}  // namespace vesk
