@@ -29,7 +29,8 @@ class VESK_API VeskReporting {
 
   /// Starts the session's thread; the daemon is reached for with the first operation.
   explicit VeskReporting(ReportingOptions options = {}) noexcept;
-  /// Waits until what is queued has been sent and answered, at most `ReportingOptions::drainTime`.
+  /// Waits until the daemon has taken and answered what is queued, at most for `ReportingOptions::drainTime`;
+  /// when no daemon was ever there, makes one attempt. Not from a callback.
   ~VeskReporting();
   VeskReporting(const VeskReporting&) = delete;
   VeskReporting& operator=(const VeskReporting&) = delete;
@@ -41,7 +42,7 @@ class VESK_API VeskReporting {
   /// 1. Says who reports, on whose behalf and, with an aggregation handler, that this client wants the
   /// messages of the sessions below its own. Replaces what an earlier call said.
   ReportingStatus setSessionInfo(Dictionary sessionInfo, std::optional<Dictionary> userInfo = std::nullopt,
-                                 List frameworksToCheck = {},
+                                 std::vector<std::string> frameworksToCheck = {},
                                  AggregationHandler aggregationHandler = nullptr) noexcept;
 
   /// 2. Starts the session: the daemon fetches the storebag of the client type and makes its backends.
@@ -133,7 +134,7 @@ class VESK_API VeskReporting {
 
  private:
   class Implementation;
-  std::shared_ptr<Implementation> _implementation;
+  std::unique_ptr<Implementation> _implementation;
 };
 
 }  // namespace vesk

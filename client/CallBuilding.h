@@ -1,0 +1,37 @@
+// Makes calls out of what callers give.
+#pragma once
+
+#include <string>
+#include <utility>
+
+#include "client/ClientCall.h"
+#include "client/protocol/WireNames.h"
+
+namespace vesk {
+
+/// Roughly the memory that `call` holds.
+std::size_t memoryOf(const ClientCall& call) noexcept;
+
+/// A one-way call of the daemon's object. Throws std::bad_alloc.
+template <class... Arguments>
+ClientCall makeCall(const wire::Member& member, Arguments&&... arguments) {
+  ClientCall call;
+  call.call.interfaceName = wire::kSessionInterface;
+  call.call.member = member.name;
+  call.call.arguments.reserve(sizeof...(arguments));
+  (call.call.arguments.emplace_back(std::forward<Arguments>(arguments)), ...);
+  call.memory = memoryOf(call);
+  return call;
+}
+
+/// A file opened for the daemon.
+struct FileToUpload {
+  FileDescriptor descriptor;  ///< none: `error` says why
+  std::string url;            ///< of its absolute path
+  int error = 0;              ///< errno; EINVAL for what is no regular file
+};
+
+/// Never waits, whatever stands under that name.
+FileToUpload openToUpload(const std::string& path);
+
+}  // namespace vesk

@@ -1,0 +1,87 @@
+#include "client/DaemonLink.h"
+
+#include <cerrno>
+#include <system_error>
+#include <utility>
+
+#include "client/protocol/WireNames.h"
+
+namespace vesk {
+
+namespace {
+
+// A daemon that accepts and then says nothing is as good as none.
+constexpr std::chrono::seconds kLongestKnock{10};
+
+// A connection that ends sooner is a failed attempt: a daemon that turns us away must not be asked in a loop.
+constexpr std::chrono::seconds kShortestVisit{1};
+
+}  // namespace
+
+DaemonLink::DaemonLink(std::string socketPath, ReconnectPolicy policy,
+                       std::shared_ptr<IPCExportedObject> receiver)
+    : _socketPath(std::move(socketPath)),
+      _receiver(std::move(receiver)),
+      _policy(policy),
+      _problem(_socketPath + ": not connected") {}
+
+DaemonLink::Change DaemonLink::reach(Time now, Urgency urgency) {
+  if (_bus) return Change::None;
+  bool isEarly = now < _policy.due();
+  if (isEarly && urgency == Urgency::WhenDue) return Change::None;
+  if (isEarly && urgency == Urgency::Early && !_policy.mayTryEarly()) return Change::None;
+  if (isEarly) _policy.triedEarly();
+  try {
+    BusClient::Options options;
+    options.socketPath = _socketPath;
+    options.objectPath = wire::kObjectPath;
+    auto bus = std::make_unique<BusClient>(std::move(options));
+    bus->setExportedObject(_receiver);
+    _bus = std::move(bus);
+    _since = now;
+    return Change::None;
+  } catch (const std::system_error& error) {
+    lose(now, error.code().message());
+    return Change::Lost;
+  }
+}
+
+DaemonLink::Change DaemonLink::process(Time now) {
+  if (!_bus) return Change::None;
+  if (_bus->process() == BusClient::Progress::Disconnected) {
+    lose(now, _isReady ? "the daemon has closed the connection" : "the daemon does not let us in");
+    return Change::Lost;
+  }
+  if (_isReady) return Change::None;
+  if (_bus->isReady()) {
+    _isReady = _wasEverReady = true;
+    _since = now;
+    return Change::Ready;
+  }
+  if (now - _since < kLongestKnock) return Change::None;
+  lose(now, "the daemon does not answer");
+  return Change::Lost;
+}
+
+void DaemonLink::lose(Time now, const std::string& cause) {
+  _problem = _socketPath + ": " + cause;
+  if (_isReady && now - _since >= kShortestVisit) {
+    _policy.succeeded();
+  } else {
+    _policy.failed(now);
+  }
+  _isReady = false;
+  // Out of the way first: the handlers that its end calls may ask about this link.
+  auto bus = std::move(_bus);
+}
+
+std::optional<DaemonLink::Time> DaemonLink::nextDue(Time now) const {
+  if (!_bus) return _policy.due();
+  int milliseconds = _bus->timeout();
+  auto knock = _isReady ? std::nullopt : std::optional<Time>(_since + kLongestKnock);
+  if (milliseconds < 0) return knock;
+  Time bus = now + std::chrono::milliseconds(milliseconds);
+  return knock && *knock < bus ? knock : bus;
+}
+
+}  // namespace vesk

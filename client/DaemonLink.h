@@ -1,0 +1,67 @@
+// The connection to the daemon, made again whenever it is lost.
+#pragma once
+
+#include <chrono>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "client/ReconnectPolicy.h"
+#include "platform/ipc/BusClient.h"
+
+namespace vesk {
+
+/// Away (no socket), knocking (connected, not let in yet) or ready. For one thread.
+class DaemonLink {
+ public:
+  using Time = ReconnectPolicy::Time;
+
+  enum class Urgency {
+    WhenDue,  ///< attempt when the wait between attempts is over
+    Early,    ///< also before, once a wait
+    AtOnce    ///< attempt now
+  };
+  enum class Change {
+    None,
+    Ready,  ///< the daemon has let us in: it knows nothing about us yet
+    Lost    ///< no daemon, or no longer: `problem` says why
+  };
+
+  /// `receiver` gets the daemon's calls.
+  DaemonLink(std::string socketPath, ReconnectPolicy policy, std::shared_ptr<IPCExportedObject> receiver);
+
+  bool isReady() const noexcept { return _isReady; }
+  bool wasEverReady() const noexcept { return _wasEverReady; }
+  /// For a person: the socket's path and what is wrong with it.
+  const std::string& problem() const noexcept { return _problem; }
+
+  /// Only when ready. After SendResult::Disconnected call `lose`.
+  BusClient& bus() noexcept { return *_bus; }
+
+  /// Makes an attempt if the link is away and it is time.
+  [[nodiscard]] Change reach(Time now, Urgency urgency);
+  /// Does what the socket is ready for.
+  [[nodiscard]] Change process(Time now);
+  /// Gives the connection up. Handlers of answers still owed run before this returns.
+  void lose(Time now, const std::string& cause);
+
+  /// For poll(); -1 when away.
+  int descriptor() const { return _bus ? _bus->fd() : -1; }
+  short events() const { return _bus ? _bus->events() : short{0}; }
+  /// When `reach` or `process` has to be called without the socket being ready; nothing for "need not".
+  std::optional<Time> nextDue(Time now) const;
+  /// Whether `Urgency::Early` would make a difference.
+  bool mayReachEarly() const noexcept { return !_bus && _policy.mayTryEarly(); }
+
+ private:
+  const std::string _socketPath;
+  const std::shared_ptr<IPCExportedObject> _receiver;
+  ReconnectPolicy _policy;
+  std::unique_ptr<BusClient> _bus;
+  std::string _problem;
+  Time _since{};  ///< of knocking, then of being ready
+  bool _isReady = false;
+  bool _wasEverReady = false;
+};
+
+}  // namespace vesk

@@ -1,0 +1,51 @@
+// When to try to reach the daemon again.
+#pragma once
+
+#include <algorithm>
+#include <chrono>
+
+namespace vesk {
+
+/// Waits grow from the first to the last, doubling with each failure. While one runs, a message that is
+/// queued allows one attempt ahead of time, because it may well be the daemon's return that caused it; one
+/// only, so that a busy client does not hammer on a socket that nobody serves. A function of `now` alone; for
+/// one thread.
+class ReconnectPolicy {
+ public:
+  using Time = std::chrono::steady_clock::time_point;
+  using Wait = std::chrono::milliseconds;
+
+  ReconnectPolicy(Wait first, Wait last)
+      : _first(std::max(first, Wait{1})), _last(std::max(last, _first)), _wait(_first) {}
+
+  /// When the next attempt is due; the past before the first failure.
+  Time due() const noexcept { return _due; }
+  bool mayTryEarly() const noexcept { return _mayTryEarly; }
+
+  /// An attempt ahead of time begins.
+  void triedEarly() noexcept { _mayTryEarly = false; }
+
+  /// An attempt failed at `now`. One that was made ahead of time changes nothing about the wait that runs.
+  void failed(Time now) noexcept {
+    if (now < _due) return;
+    _due = now + _wait;
+    _wait = std::min(_wait * 2, _last);
+    _mayTryEarly = true;
+  }
+
+  /// The daemon was reached.
+  void succeeded() noexcept {
+    _wait = _first;
+    _due = Time{};
+    _mayTryEarly = false;
+  }
+
+ private:
+  const Wait _first;
+  const Wait _last;
+  Wait _wait;
+  Time _due{};
+  bool _mayTryEarly = false;
+};
+
+}  // namespace vesk

@@ -1,0 +1,62 @@
+#include "client/SessionThread.h"
+
+#include <pthread.h>
+
+#include <cerrno>
+#include <csignal>
+#include <system_error>
+
+#include "client/ProcessMark.h"
+#include "platform/log/SystemLog.h"
+
+namespace vesk {
+
+namespace {
+
+// While it lives, threads that are started take no signals: those are the host's business.
+class NoSignals {
+ public:
+  NoSignals() noexcept {
+    sigset_t all;
+    ::sigfillset(&all);
+    ::pthread_sigmask(SIG_SETMASK, &all, &_before);
+  }
+  ~NoSignals() { ::pthread_sigmask(SIG_SETMASK, &_before, nullptr); }
+  NoSignals(const NoSignals&) = delete;
+  NoSignals& operator=(const NoSignals&) = delete;
+
+ private:
+  sigset_t _before{};
+};
+
+std::thread startThread(const std::shared_ptr<SessionWorker>& worker) {
+  NoSignals block;
+  std::thread thread([worker] { worker->run(); });
+  ::pthread_setname_np(thread.native_handle(), "vesk-reporting");
+  return thread;
+}
+
+std::shared_ptr<SessionWorker> makeWorker(const ReportingOptions& options) {
+  auto worker = std::make_shared<SessionWorker>(options);
+  if (!worker->queue().isUsable()) throw std::system_error(errno, std::generic_category(), "eventfd");
+  return worker;
+}
+
+}  // namespace
+
+SessionThread::SessionThread(const ReportingOptions& options)
+    : _mark(processMark()), _worker(makeWorker(options)), _thread(startThread(_worker)) {}
+
+SessionThread::~SessionThread() {
+  _worker->stop();
+  if (isCurrent()) {
+    VESK_LOG_ERROR("VeskReporting: a session was destroyed by one of its callbacks");
+    _thread.detach();
+  } else {
+    _thread.join();
+  }
+}
+
+bool SessionThread::isOurs() const noexcept { return _mark == processMark(); }
+
+}  // namespace vesk

@@ -1,0 +1,337 @@
+#include "client/SessionWorker.h"
+
+#include <poll.h>
+
+#include <algorithm>
+#include <exception>
+#include <utility>
+
+#include "client/AggregationReceiver.h"
+#include "client/protocol/WireNames.h"
+#include "platform/files/RootPrefix.h"
+#include "platform/log/SystemLog.h"
+
+namespace vesk {
+
+namespace {
+
+// So that answers and aggregated messages are received also while much is sent.
+constexpr std::size_t kCallsPerStep = 256;
+
+// Answers that the daemon may owe us; further calls that want one wait in the queue.
+constexpr std::size_t kMaximumAnswersOwed = 512;
+
+// After sending, the thread looks again after this time before it asks to be woken: a steady stream of
+// messages then costs its senders no system call.
+constexpr std::chrono::milliseconds kNap{1};
+
+std::string socketOf(const ReportingOptions& options) {
+  return options.socketPath.empty() ? pathUnderRoot(wire::kSocketPath) : options.socketPath;
+}
+
+}  // namespace
+
+SessionWorker::SessionWorker(const ReportingOptions& options)
+    : _drainTime(options.drainTime),
+      _queue(options.maximumQueuedMessages, options.maximumQueuedBytes),
+      _link(socketOf(options), ReconnectPolicy(options.firstReconnectWait, options.lastReconnectWait),
+            std::make_shared<AggregationReceiver>(static_cast<ClientSessionReplyInterface&>(*this))) {}
+
+void SessionWorker::requestConnection(std::shared_ptr<CallEnd> end, ClientCall::Time deadline) {
+  {
+    MutexLock lock(_mutex);
+    _newRequests.push_back({std::move(end), deadline});
+  }
+  _queue.wake();
+}
+
+void SessionWorker::stop() noexcept {
+  // Closed first: once the thread knows that it has to end, nothing can get in behind its last look.
+  _queue.close();
+  {
+    MutexLock lock(_mutex);
+    _newDrainDeadline = Clock::now() + _drainTime;
+  }
+  _queue.wake();
+}
+
+void SessionWorker::run() noexcept {
+  while (!isFinished(Clock::now())) {
+    try {
+      step();
+    } catch (const std::exception& error) {
+      // Out of memory, most likely: what waits goes on waiting.
+      VESK_LOG_ERROR("VeskReporting: %s", error.what());
+      ::poll(nullptr, 0, 100);
+    }
+  }
+  endEverything();
+}
+
+void SessionWorker::step() {
+  Time now = Clock::now();
+  takeRequests();
+  takeCalls();
+  endOverdue(now);
+  reachDaemon(now);
+  sendWaiting(now);
+  sayFarewell(now);
+  giveRoomBack();
+  if (!isFinished(now)) sleep(now);
+}
+
+bool SessionWorker::isFinished(Time now) const noexcept {
+  if (!_drainDeadline) return false;
+  if (now >= *_drainDeadline || _farewell == Farewell::Answered) return true;
+  return !_link.isReady() && (_waiting.empty() || _isHopeless);
+}
+
+void SessionWorker::endEverything() noexcept {
+  _isClosed = true;
+  _isConnected.store(false, std::memory_order_relaxed);
+  _link.lose(Clock::now(), "the session was closed");
+  if (_isFrontInBus && _waiting.front().wantsAnswer()) frontHasLeft();
+  do {
+    for (; !_waiting.empty(); frontHasLeft()) {
+      _drops.unsent();
+      end(_waiting.front().end, ReportingStatus::Closed, nullptr, "");
+    }
+    _queue.takeAll(_taken);
+    _waiting.append(_taken);
+  } while (!_waiting.empty());
+  endRequests(ReportingStatus::Closed, "");
+}
+
+// --- What comes in
+
+void SessionWorker::takeCalls() {
+  _queue.takeAll(_taken);
+  _isNapping = !_taken.empty();
+  if (!_taken.empty() && _urgency == DaemonLink::Urgency::WhenDue) _urgency = DaemonLink::Urgency::Early;
+  _waiting.append(_taken);
+}
+
+void SessionWorker::takeRequests() {
+  MutexLock lock(_mutex);
+  if (!_newRequests.empty() || _newDrainDeadline) _urgency = DaemonLink::Urgency::AtOnce;
+  for (auto& request : std::exchange(_newRequests, {})) _requests.push_back(std::move(request));
+  if (_newDrainDeadline) _drainDeadline = std::exchange(_newDrainDeadline, std::nullopt);
+}
+
+void SessionWorker::endOverdue(Time now) {
+  std::erase_if(_requests, [&](const ConnectionRequest& request) {
+    if (request.deadline > now) return false;
+    end(request.end, ReportingStatus::NotConnected, nullptr, _link.problem());
+    return true;
+  });
+
+  auto first = _waiting.firstDeadline();
+  if (!first || *first > now) return;
+  const ClientCall* inBus = _isFrontInBus ? &_waiting.front() : nullptr;
+  std::vector<ClientCall> overdue;
+  _waiting.moveDue(overdue, [&](const ClientCall& call) {
+    return call.wantsAnswer() && call.deadline <= now && &call != inBus;
+  });
+  auto status = _link.isReady() ? ReportingStatus::TimedOut : ReportingStatus::NotConnected;
+  for (const ClientCall& call : overdue) {
+    ++_callsGone;
+    _memoryGone += call.memory;
+    _drops.unsent();
+    end(call.end, status, nullptr, _link.isReady() ? "" : _link.problem());
+  }
+}
+
+void SessionWorker::endRequests(ReportingStatus status, std::string_view detail) {
+  for (const auto& request : std::exchange(_requests, {})) end(request.end, status, nullptr, detail);
+}
+
+void SessionWorker::sendMessageToClient(const std::optional<Dictionary>& sessionInfo, double timestamp,
+                                        std::uint16_t category, std::uint16_t type,
+                                        const std::optional<Dictionary>& payload) {
+  auto handler = _memory.aggregation();
+  if (!handler) return;
+  try {
+    (*handler)(AggregatedMessage{sessionInfo, timestamp, category, type, payload});
+  } catch (...) {
+    VESK_LOG_ERROR("VeskReporting: an aggregation handler threw an exception");
+  }
+}
+
+// --- The link
+
+bool SessionWorker::wantsDaemon() const noexcept {
+  if (!_waiting.empty() || !_requests.empty()) return true;
+  return !_drainDeadline && !_memory.isEmpty();
+}
+
+void SessionWorker::reachDaemon(Time now) {
+  auto urgency = std::exchange(_urgency, DaemonLink::Urgency::WhenDue);
+  if (_link.isReady()) return endRequests(ReportingStatus::Done, "");
+  if (wantsDaemon()) linkHasChanged(_link.reach(now, urgency));
+}
+
+void SessionWorker::linkHasChanged(DaemonLink::Change change) {
+  if (change == DaemonLink::Change::None) return;
+  _isConnected.store(_link.isReady(), std::memory_order_relaxed);
+  if (change == DaemonLink::Change::Ready) {
+    VESK_LOG_DEBUG("VeskReporting: connected");
+    endRequests(ReportingStatus::Done, "");
+    return introduceAgain();
+  }
+  VESK_LOG_DEBUG("VeskReporting: %s", _link.problem().c_str());
+  // What the socket had not taken whole, the daemon has not seen: a one-way call is sent again. A call that
+  // wants an answer has learnt of the loss already.
+  if (std::exchange(_isFrontInBus, false) && _waiting.front().wantsAnswer()) frontHasLeft();
+  _isHopeless = _drainDeadline && !_link.wasEverReady();
+  endRequests(ReportingStatus::NotConnected, _link.problem());
+}
+
+void SessionWorker::introduceAgain() {
+  for (const IPCOutgoingCall& call : _memory.replay()) {
+    if (_link.bus().send(call) != BusClient::SendResult::Disconnected) continue;
+    _link.lose(Clock::now(), "the daemon has closed the connection");
+    return linkHasChanged(DaemonLink::Change::Lost);
+  }
+}
+
+// --- Sending
+
+bool SessionWorker::canSend() {
+  if (!_link.isReady() || _waiting.empty() || _link.bus().queuedMessages() > 0) return false;
+  return !_waiting.front().wantsAnswer() || _answersOwed < kMaximumAnswersOwed;
+}
+
+// Only one call at a time is left to the bus when the socket is full: what the bus holds is lost with the
+// connection, what waits here is not.
+void SessionWorker::sendWaiting(Time now) {
+  for (std::size_t i = 0; i < kCallsPerStep; ++i) {
+    if (_isFrontInBus && _link.bus().queuedMessages() == 0) frontHasLeft();
+    if (!canSend()) return;
+    sendFront(now);
+    if (_callsGone >= kCallsPerStep / 4) giveRoomBack();
+  }
+}
+
+void SessionWorker::sendFront(Time now) {
+  ClientCall& front = _waiting.front();
+  BusClient::SendResult result;
+  if (front.wantsAnswer()) {
+    auto left = std::chrono::ceil<std::chrono::milliseconds>(front.deadline - now);
+    auto handler = [this, end = front.end, deadline = front.deadline](BusAnswer& answer) {
+      --_answersOwed;
+      endWithAnswer(end, deadline, answer);
+    };
+    result = _link.bus().send(front.call, std::move(handler), left);
+    if (result == BusClient::SendResult::Sent) ++_answersOwed;
+  } else {
+    result = _link.bus().send(front.call);
+  }
+
+  switch (result) {
+    case BusClient::SendResult::Sent:
+      _memory.note(front);
+      _isFrontInBus = _link.bus().queuedMessages() > 0;
+      if (!_isFrontInBus) frontHasLeft();
+      break;
+    case BusClient::SendResult::Refused:
+      _drops.invalid();
+      end(front.end, ReportingStatus::InvalidArgument, nullptr, "");
+      frontHasLeft();
+      break;
+    case BusClient::SendResult::Disconnected:
+      _link.lose(now, "the daemon has closed the connection");
+      linkHasChanged(DaemonLink::Change::Lost);
+      break;
+  }
+}
+
+void SessionWorker::frontHasLeft() noexcept {
+  ++_callsGone;
+  _memoryGone += _waiting.front().memory;
+  _isFrontInBus = false;
+  _waiting.popFront();
+}
+
+void SessionWorker::giveRoomBack() noexcept {
+  if (_callsGone == 0) return;
+  _queue.leave(std::exchange(_callsGone, 0), std::exchange(_memoryGone, 0));
+  if (_waiting.empty()) _drops.burstIsOver();
+}
+
+// The daemon serves calls in order: its answer to this one shows that it has taken all before. A connection
+// closed sooner could fail under a daemon that still answers, and what it had not read yet would be lost.
+void SessionWorker::sayFarewell(Time now) {
+  bool isTime = _drainDeadline && _farewell == Farewell::NotYet && _link.isReady() && _waiting.empty() &&
+                _answersOwed == 0;
+  if (!isTime) return;
+  _farewell = Farewell::Asked;
+  auto result = _link.bus().send(
+      {"org.freedesktop.DBus.Peer", "Ping", {}}, [this](BusAnswer&) { _farewell = Farewell::Answered; },
+      std::chrono::ceil<std::chrono::milliseconds>(*_drainDeadline - now));
+  if (result != BusClient::SendResult::Sent) _farewell = Farewell::Answered;
+}
+
+void SessionWorker::end(const std::shared_ptr<CallEnd>& end, ReportingStatus status, BusAnswer* answer,
+                        std::string_view detail) noexcept {
+  if (!end) return;
+  try {
+    (*end)(status, answer, detail);
+  } catch (...) {
+    VESK_LOG_ERROR("VeskReporting: a callback threw an exception");
+  }
+}
+
+void SessionWorker::endWithAnswer(const std::shared_ptr<CallEnd>& end, Time deadline,
+                                  BusAnswer& answer) noexcept {
+  if (!answer.isError()) return this->end(end, ReportingStatus::Done, &answer, "");
+  if (answer.errorName() == "org.freedesktop.DBus.Error.Disconnected") {
+    auto status = _isClosed ? ReportingStatus::Closed : ReportingStatus::NotConnected;
+    return this->end(end, status, nullptr, _isClosed ? "" : "the daemon has closed the connection");
+  }
+  // The same name stands for a time that ran out and for a daemon that gave no answer.
+  bool isOverdue = answer.errorName() == "org.freedesktop.DBus.Error.NoReply" && Clock::now() >= deadline;
+  this->end(end, isOverdue ? ReportingStatus::TimedOut : ReportingStatus::Refused, nullptr,
+            answer.errorText());
+}
+
+// --- Sleeping
+
+void SessionWorker::sleep(Time now) {
+  pollfd descriptors[] = {{_queue.descriptor(), POLLIN, 0}, {_link.descriptor(), _link.events(), 0}};
+  Time due = nextDue(now);
+  if (!_queue.prepareToSleep(wakeFor())) due = now;
+  auto wait = std::chrono::ceil<std::chrono::milliseconds>(due - now).count();
+  int ready = ::poll(descriptors, 2, static_cast<int>(std::clamp<long>(wait, 0, 3'600'000)));
+  _queue.awake(ready > 0 && descriptors[0].revents != 0);
+
+  now = Clock::now();
+  auto linkDue = _link.nextDue(now);
+  if ((ready > 0 && descriptors[1].revents != 0) || (linkDue && *linkDue <= now)) {
+    linkHasChanged(_link.process(now));
+  }
+}
+
+SessionWorker::Time SessionWorker::nextDue(Time now) {
+  if (canSend()) return now;
+  Time due = now + std::chrono::hours(1);
+  auto consider = [&](std::optional<Time> time) {
+    if (time && *time < due) due = *time;
+  };
+  if (_link.descriptor() >= 0 || wantsDaemon()) consider(_link.nextDue(now));
+  for (const auto& request : _requests) consider(request.deadline);
+  consider(_waiting.firstDeadline());
+  consider(_drainDeadline);
+  if (_isNapping && _waiting.empty()) consider(now + kNap);
+  return due;
+}
+
+CallQueue::WakeFor SessionWorker::wakeFor() const noexcept {
+  if (_link.isReady()) {
+    return _waiting.empty() && !_isNapping ? CallQueue::WakeFor::EveryCall
+                                           : CallQueue::WakeFor::AnsweredCalls;
+  }
+  bool isIdle = !wantsDaemon();
+  return isIdle || _link.mayReachEarly() ? CallQueue::WakeFor::EveryCall : CallQueue::WakeFor::AnsweredCalls;
+}
+
+}  // namespace vesk

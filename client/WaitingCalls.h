@@ -1,0 +1,76 @@
+// The calls that the session's thread has taken and not sent yet.
+#pragma once
+
+#include <algorithm>
+#include <iterator>
+#include <optional>
+#include <vector>
+
+#include "client/ClientCall.h"
+
+namespace vesk {
+
+/// A queue that reuses its memory. For one thread.
+class WaitingCalls {
+ public:
+  bool empty() const noexcept { return _next == _calls.size(); }
+  std::size_t size() const noexcept { return _calls.size() - _next; }
+  ClientCall& front() noexcept { return _calls[_next]; }
+  void popFront() noexcept {
+    _calls[_next++] = ClientCall{};
+    if (empty()) clear();
+  }
+
+  /// Appends `calls` and leaves them empty. When it throws std::bad_alloc, nothing has changed.
+  void append(std::vector<ClientCall>& calls) {
+    if (empty()) {
+      _calls.swap(calls);
+      _next = 0;
+    } else {
+      if (_next > _calls.size() / 2) removeGone();
+      std::size_t needed = _calls.size() + calls.size();
+      if (needed > _calls.capacity()) _calls.reserve(std::max(needed, 2 * _calls.capacity()));
+      for (ClientCall& call : calls) _calls.push_back(std::move(call));
+    }
+    calls.clear();
+  }
+
+  /// Moves those that `isDue` names to `due`, in order.
+  template <class Predicate>
+  void moveDue(std::vector<ClientCall>& due, Predicate isDue) {
+    removeGone();
+    auto kept = _calls.begin();
+    for (auto call = _calls.begin(); call != _calls.end(); ++call) {
+      if (isDue(*call)) {
+        due.push_back(std::move(*call));
+      } else if (kept++ != call) {
+        *std::prev(kept) = std::move(*call);
+      }
+    }
+    _calls.erase(kept, _calls.end());
+  }
+
+  /// When the first of the answers owed is due.
+  std::optional<ClientCall::Time> firstDeadline() const noexcept {
+    std::optional<ClientCall::Time> first;
+    for (std::size_t i = _next; i < _calls.size(); ++i) {
+      if (_calls[i].wantsAnswer() && (!first || _calls[i].deadline < *first)) first = _calls[i].deadline;
+    }
+    return first;
+  }
+
+ private:
+  void clear() noexcept {
+    _calls.clear();
+    _next = 0;
+  }
+  void removeGone() {
+    _calls.erase(_calls.begin(), _calls.begin() + static_cast<std::ptrdiff_t>(_next));
+    _next = 0;
+  }
+
+  std::vector<ClientCall> _calls;
+  std::size_t _next = 0;
+};
+
+}  // namespace vesk
