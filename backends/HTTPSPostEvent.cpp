@@ -13,7 +13,6 @@ namespace {
 
 constexpr std::size_t kFixedFields = 17;
 constexpr std::int32_t kClientTypeWithNumericSessionID = 7;
-constexpr std::int32_t kSeedEnvironment = 3;
 
 // Of all sessions that start within a minute the records show the same start.
 std::int32_t startOfMinute(double seconds) {

@@ -19,8 +19,8 @@ namespace {
 
 IPCListener::Options listenerOptions(ServiceManager& serviceManager) {
   IPCListener::Options options;
-  options.socketPath = pathUnderRoot("/run/veskreportingd/com.corvane.veskreportingd");
-  options.objectPath = kSessionObjectPath;
+  options.socketPath = pathUnderRoot(wire::kSocketPath);
+  options.objectPath = wire::kObjectPath;
   options.inherited = serviceManager.takeListeningSocket();
   return options;
 }

@@ -39,8 +39,9 @@ TEST(ListMatching, SpecialCasesAndCase) {
 class BackendState : public ::testing::Test {
  protected:
   std::shared_ptr<VeskReportingBackend> make(List clients, bool requireUserInfo = true) {
-    auto backend = VeskReportingBackend::newBackendWithName(
-        kVeskReportingBackendHTTPPost, Dictionary{{"clients", std::move(clients)}}, Text("Phone"), 5, harness.services);
+    auto backend = VeskReportingBackend::newBackendWithName(kVeskReportingBackendHTTPPost,
+                                                            Dictionary{{"clients", std::move(clients)}},
+                                                            Text("Phone"), 5, harness.services);
     backend->setRequireUserInfo(requireUserInfo);
     backend->setUserInfoDict(Dictionary{{kVeskReportingUserInfoClientName, "Camera"},
                                         {kVeskReportingUserInfoServiceName, "MyCallService"}});
@@ -72,15 +73,22 @@ TEST_F(BackendState, FollowsTheMatchingEntry) {
       {"client is no fragment", entry({{"client", "Cam"}}), 1},
       {"service by fragment", entry({{"service", "mail,call"}}), 2},
       {"other service", entry({{"service", "mail"}}), 1},
-      {"other region", entry({{"locale_whitelist", List{"DE", "FR"}}}), 1,
+      {"other region",
+       entry({{"locale_whitelist", List{"DE", "FR"}}}),
+       1,
        {7, "HTTPSPostBackend(updateBackendState): (US) isn't in locale list (DE, FR)"}},
       {"empty region list", entry({{"locale_whitelist", List{}}}), 1},
       {"no region list", entry({}, "locale_whitelist"), 1},
       {"device by fragment", entry({{"device_whitelist", List{"pho"}}}), 2},
-      {"other device", entry({{"device_whitelist", List{"Pad"}}}), 1,
+      {"other device",
+       entry({{"device_whitelist", List{"Pad"}}}),
+       1,
        {7, "HTTPSPostBackend(updateBackendState): (Phone) isn't in device list (Pad)"}},
       {"empty device list", entry({{"device_whitelist", List{}}}), 2},
-      {"no filters", entry({}, "filters"), 1, {4, "HTTPSPostBackend(updateBackendState): filters are required."}},
+      {"no filters",
+       entry({}, "filters"),
+       1,
+       {4, "HTTPSPostBackend(updateBackendState): filters are required."}},
       {"no sampling", entry({}, "sampling_threshold"), 1},
       {"draw at the threshold", entry({{"sampling_threshold", 0.30}}), 2},
       {"draw above, no override", entry({{"sampling_threshold", 0.29}}), 3},
@@ -88,13 +96,23 @@ TEST_F(BackendState, FollowsTheMatchingEntry) {
       {"draw outside override", entry({{"sampling_threshold", 0.1}, {"override_sampling", 0.20}}), 1},
       {"threshold of a wrong type", entry({{"sampling_threshold", "high"}}), 1},
       {"filters of a wrong type", entry({{"filters", 7}}), 1},
-      {"threshold", entry({{"event_threshold", 7}}), 2,
+      {"threshold",
+       entry({{"event_threshold", 7}}),
+       2,
        {7, "HTTPSPostBackend(updateBackendState): event_threshold set to 7"}},
-      {"no threshold", entry(), 2,
-       {7, "HTTPSPostBackend(updateBackendState): event_threshold value not found in storebag - defaulting to 49"}},
-      {"expedite", entry({{"expedite", 1}}), 2,
+      {"no threshold",
+       entry(),
+       2,
+       {7,
+        "HTTPSPostBackend(updateBackendState): event_threshold value not found in storebag - defaulting to "
+        "49"}},
+      {"expedite",
+       entry({{"expedite", 1}}),
+       2,
        {7, "HTTPSPostBackend(updateBackendState): Store bag override  _batchEvent=0"}},
-      {"summary", entry(), 2,
+      {"summary",
+       entry(),
+       2,
        {7, "HTTPSPostBackend(updateBackendState): httpPost: client found Camera, state? 2, 0.300000"}},
   };
   for (const auto& test : cases) {
@@ -103,7 +121,9 @@ TEST_F(BackendState, FollowsTheMatchingEntry) {
     auto backend = make(List{test.entry});
     backend->updateState();
     EXPECT_EQ(backend->state(), test.state);
-    if (test.line.first != 0) EXPECT_EQ(log.count(test.line.first, test.line.second), 1);
+    if (test.line.first != 0) {
+      EXPECT_EQ(log.count(test.line.first, test.line.second), 1);
+    }
   }
 }
 
@@ -154,7 +174,9 @@ TEST_F(BackendState, ConsentIsRespectedUnlessTheStorebagOverridesIt) {
     EXPECT_EQ(backend->state(), test.state);
     auto printable = backend->sendMessage(Dictionary{{"a", 1}}, timeval{}, 1, 0, 0);
     EXPECT_EQ(printable.has_value(), test.printable);
-    if (test.state == 2) EXPECT_EQ(harness.posts().back().body.at("clientId"), test.clientId);
+    if (test.state == 2) {
+      EXPECT_EQ(harness.posts().back().body.at("clientId"), test.clientId);
+    }
     if (test.state == 1) {
       EXPECT_EQ(log.count(7, "HTTPSPostBackend(updateBackendState): reporting disabled by DNU: " +
                                  std::to_string(test.override.value_or(0)) + "."),
@@ -196,8 +218,10 @@ TEST_F(BackendState, UnusableProfilesGiveNoBackend) {
 }
 
 TEST_F(BackendState, PreferencesOverrideTheStorebagsURLs) {
-  testRoot().write("etc/veskreporting/preferences/com.corvane.veskreporting.toml", "httpsPostURL = \"http://mine/\"\n");
-  auto backend = std::static_pointer_cast<HTTPSPostBackend>(make(List{entry({{"post_url", "http://theirs/"}})}));
+  testRoot().write("etc/veskreporting/preferences/com.corvane.veskreporting.toml",
+                   "httpsPostURL = \"http://mine/\"\n");
+  auto backend =
+      std::static_pointer_cast<HTTPSPostBackend>(make(List{entry({{"post_url", "http://theirs/"}})}));
   testRoot().write("etc/veskreporting/preferences/com.corvane.veskreporting.toml", "");
   backend->updateState();
   EXPECT_EQ(backend->postURL(), "http://mine/");

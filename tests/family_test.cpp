@@ -35,7 +35,8 @@ class Family : public ::testing::Test {
     return session;
   }
   static Dictionary userInfo(const char* client) {
-    return Dictionary{{kVeskReportingUserInfoClientName, client}, {kVeskReportingUserInfoServiceName, "Calls"}};
+    return Dictionary{{kVeskReportingUserInfoClientName, client},
+                      {kVeskReportingUserInfoServiceName, "Calls"}};
   }
   static Dictionary message() {
     return Dictionary{{"category", 3}, {"type", 2}, {"flag", 1}, {"payload", Dictionary{{"a", 1}}}};
@@ -69,12 +70,19 @@ TEST_F(Family, AMissingParentLeavesAGap) {
   auto grandchild = join(2);
   EXPECT_EQ(names, BackendNames{});
   EXPECT_EQ(harness.agent->parentSessionIDStringForSession(*grandchild.session), std::nullopt);
-  EXPECT_GE(log.count(6, "parentSessionIDStringForSession: Found a gap in hierarchy (one of parents missing): incomplete "
-                         "parentSessionID is ''"),
+  EXPECT_GE(
+      log.count(
+          6,
+          "parentSessionIDStringForSession: Found a gap in hierarchy (one of parents missing): incomplete "
+          "parentSessionID is ''"),
+      1);
+  EXPECT_GE(
+      log.count(
+          6,
+          "parentSessionForChild: Unable to find session with hierarchy of 1 for userInfoKey 'myapp:calls'"),
+      1);
+  EXPECT_GE(log.count(6, "syncReportingStates: child session 102 (backend httpPost) is missing its parent"),
             1);
-  EXPECT_GE(log.count(6, "parentSessionForChild: Unable to find session with hierarchy of 1 for userInfoKey 'myapp:calls'"),
-            1);
-  EXPECT_GE(log.count(6, "syncReportingStates: child session 102 (backend httpPost) is missing its parent"), 1);
 }
 
 TEST_F(Family, TheHighestAggregatorGetsTheMessages) {
@@ -106,7 +114,8 @@ TEST_F(Family, ASessionThatMovesTakesItsPlaceElsewhere) {
   child->fetchStatesWithUserInfo(userInfo("Other"), {});
   child.send(message());
   EXPECT_EQ(lastSessionID(), other->sessionIDString() + "." + child->sessionIDString());
-  EXPECT_EQ(log.count(7, "userInfoUpdatedForSession: Adding session 101 to list for userInfoKey other:calls"), 1);
+  EXPECT_EQ(log.count(7, "userInfoUpdatedForSession: Adding session 101 to list for userInfoKey other:calls"),
+            1);
 }
 
 TEST_F(Family, ClosingAnAggregatingSessionTellsItsClientOnce) {

@@ -80,7 +80,9 @@ TEST_F(Session, StartTellsTheBackendsAndAnswersTheEnabledOnes) {
     EXPECT_EQ(post.event().at("_method"), 0);
     EXPECT_EQ(post.event().contains("AutomaticTimeSet"), isStart);
     EXPECT_EQ(post.event().contains("SerialNum"), false) << "no internal build";
-    if (!isStart) EXPECT_EQ(post.event().at("StorebagVersion"), "bag-1");
+    if (!isStart) {
+      EXPECT_EQ(post.event().at("StorebagVersion"), "bag-1");
+    }
   }
 }
 
@@ -99,8 +101,9 @@ TEST_F(Session, ParametersAreCheckedAndCut) {
     Value category;
     int expected;
   };
-  for (const auto& test : {Case{65537, 1}, Case{-1, 65535}, Case{2.9, 2}, Case{true, 1},
-                           Case{std::numeric_limits<double>::quiet_NaN(), 0}, Case{Value(~std::uint64_t{0}), 65535}}) {
+  for (const auto& test :
+       {Case{65537, 1}, Case{-1, 65535}, Case{2.9, 2}, Case{true, 1},
+        Case{std::numeric_limits<double>::quiet_NaN(), 0}, Case{Value(~std::uint64_t{0}), 65535}}) {
     session.send(message(test.category, 8));
     EXPECT_EQ(harness.posts().back().event().at("_method"), test.expected);
   }
@@ -146,7 +149,8 @@ TEST_F(Session, DisplayURLComesFromTheFirstBackendThatHasOne) {
       {Dictionary{{"httpPost", profile("/")}}, "URL not available"},
       {Dictionary{{"httpPost2", with("http://b")}, {"httpPost", with("http://a")}},
        "http://a?sequences=77&override=yes"},
-      {Dictionary{{"httpPost2", with("http://b")}, {"httpPost", profile("/")}}, "http://b?sequences=77&override=yes"},
+      {Dictionary{{"httpPost2", with("http://b")}, {"httpPost", profile("/")}},
+       "http://b?sequences=77&override=yes"},
   };
   for (const auto& test : cases) {
     harness.storebags[5] = test.storebag;
@@ -159,8 +163,9 @@ TEST_F(Session, DisplayURLComesFromTheFirstBackendThatHasOne) {
 
 TEST_F(Session, ASecondStartReplacesTheBackendsWithoutLosingWhatTheyHeld) {
   auto session = configured();
-  session->setSessionInfo(Dictionary{{kVeskReportingSessionInfoClientType, 5}, {kVeskReportingSessionInfoBatchEvent, true}},
-                          std::nullopt, {}, false);
+  session->setSessionInfo(
+      Dictionary{{kVeskReportingSessionInfoClientType, 5}, {kVeskReportingSessionInfoBatchEvent, true}},
+      std::nullopt, {}, false);
   session.start();
   session.send(message(3, 2, Dictionary{{"word", "held"}}));
   EXPECT_TRUE(harness.posts().empty());
@@ -172,26 +177,30 @@ TEST_F(Session, ASecondStartReplacesTheBackendsWithoutLosingWhatTheyHeld) {
 
 TEST_F(Session, UserInfoDecidesPendingBackends) {
   CapturedLog log;
-  MutableDictionary entry(Dictionary{{"post_url", harness.url()}, {"locale_whitelist", List{"US"}},
-                                     {"filters", List{Dictionary()}}, {"sampling_threshold", 1.0}});
+  MutableDictionary entry(Dictionary{{"post_url", harness.url()},
+                                     {"locale_whitelist", List{"US"}},
+                                     {"filters", List{Dictionary()}},
+                                     {"sampling_threshold", 1.0}});
   harness.storebags[5] = Dictionary{{"httpPost", Dictionary{{"clients", List{entry.share()}}}}};
   auto session = harness.newSession();
-  session->setSessionInfo(Dictionary{{kVeskReportingSessionInfoClientType, 5},
-                                     {kVeskReportingSessionInfoRequireUserInfo, true}},
-                          std::nullopt, {}, false);
+  session->setSessionInfo(
+      Dictionary{{kVeskReportingSessionInfoClientType, 5}, {kVeskReportingSessionInfoRequireUserInfo, true}},
+      std::nullopt, {}, false);
   EXPECT_EQ(session.start(), BackendNames{});
   auto states = [&](std::optional<Dictionary> userInfo) {
     std::optional<BackendNames> names;
     session->fetchStatesWithUserInfo(userInfo, {[&](const auto& reply) { names = reply; }, nullptr});
     return names;
   };
-  const Dictionary camera{{kVeskReportingUserInfoClientName, "Camera"}, {kVeskReportingUserInfoServiceName, "s"}};
+  const Dictionary camera{{kVeskReportingUserInfoClientName, "Camera"},
+                          {kVeskReportingUserInfoServiceName, "s"}};
   EXPECT_EQ(states(std::nullopt), BackendNames{});
   EXPECT_EQ(states(camera), BackendNames{"httpPost"});
   MutableDictionary extra(camera);
   extra.set("more", 1);
   states(extra.share());
-  EXPECT_EQ(log.count(7, "receivedUserInfo: Received new user info for session 0"), 1) << "same names: no change";
+  EXPECT_EQ(log.count(7, "receivedUserInfo: Received new user info for session 0"), 1)
+      << "same names: no change";
   EXPECT_EQ(states(std::nullopt), BackendNames{}) << "nothing replaces what was known";
 }
 
@@ -200,13 +209,14 @@ TEST_F(Session, ASingleMessageNeedsItsIdentifiersAndAStorebag) {
   auto session = harness.newSession();
   auto sendOnce = [&](Dictionary info) {
     std::string answer = "no reply";
-    session->sendMessageWithSessionInfo(info, Dictionary{{kVeskReportingUserInfoClientName, "Camera"}}, 4, 5,
-                                        Dictionary{{"a", 1}},
-                                        {[&](const std::string& reply) { answer = reply; }, [&] { answer = "error"; }});
+    session->sendMessageWithSessionInfo(
+        info, Dictionary{{kVeskReportingUserInfoClientName, "Camera"}}, 4, 5, Dictionary{{"a", 1}},
+        {[&](const std::string& reply) { answer = reply; }, [&] { answer = "error"; }});
     return answer;
   };
   const auto id = [](int clientType) {
-    return Dictionary{{kVeskReportingSessionInfoSessionID, 9}, {kVeskReportingSessionInfoClientType, clientType}};
+    return Dictionary{{kVeskReportingSessionInfoSessionID, 9},
+                      {kVeskReportingSessionInfoClientType, clientType}};
   };
   EXPECT_EQ(sendOnce(Dictionary{{kVeskReportingSessionInfoSessionID, 9}}), "error");
   EXPECT_EQ(log.count(3, "sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo"), 1);
@@ -251,9 +261,11 @@ TEST(StorebagCache, FetchesByAgeAndWaitsAfterFailures) {
   expect(1, false, nullptr);
   clock.advance(std::chrono::seconds(899));
   expect(1, false, nullptr);
-  EXPECT_EQ(log.count(6, "storebagForSession: Not fetching storebag for client type 7 - must wait 900 seconds between "
-                         "attempts"),
-            1);
+  EXPECT_EQ(
+      log.count(6,
+                "storebagForSession: Not fetching storebag for client type 7 - must wait 900 seconds between "
+                "attempts"),
+      1);
   clock.advance(std::chrono::seconds(2));
   answer = Dictionary{{"wren", 1}};
   expect(2, true, "v2");
@@ -281,7 +293,8 @@ TEST(Agent, TheBusyMarkerIsHeldWhileThereAreSessions) {
   auto first = std::make_shared<RecordingConnection>();
   auto second = std::make_shared<RecordingConnection>();
   harness.agent->shouldAcceptNewConnection(first);
-  EXPECT_EQ(log.count(7, "listener: Accepting new Orvo connection recording connection, 0(0) connections."), 1);
+  EXPECT_EQ(log.count(7, "listener: Accepting new Orvo connection recording connection, 0(0) connections."),
+            1);
   harness.agent->shouldAcceptNewConnection(second);
   first->interrupt();
   EXPECT_EQ(log.countContaining(7, "was interrupted"), 1);

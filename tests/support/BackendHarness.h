@@ -1,4 +1,5 @@
-// What a backend needs to work in a test: a real HTTP client, a real server that keeps what it gets, a clock to turn.
+// What a backend needs to work in a test: a real HTTP client, a real server that keeps what it gets, a clock
+// to turn.
 #pragma once
 
 #include <VeskReporting/VeskReportingKeys.h>
