@@ -1,90 +1,30 @@
 #include "tools/collector/CertificateAuthority.h"
 
 #include <arpa/inet.h>
-#include <openssl/bio.h>
-#include <openssl/err.h>
-#include <openssl/evp.h>
-#include <openssl/pem.h>
 #include <openssl/rand.h>
-#include <openssl/x509v3.h>
 
-#include <memory>
 #include <stdexcept>
 
+#include "tools/crypto/OpenSSLObjects.h"
 #include "tools/files/WholeFile.h"
 
 namespace vesk {
 
-namespace {
+using namespace openssl;
 
-template <auto free>
-struct Freeing {
-  template <class T>
-  void operator()(T* object) const {
-    free(object);
-  }
-};
-using Key = std::unique_ptr<EVP_PKEY, Freeing<&EVP_PKEY_free>>;
-using Certificate = std::unique_ptr<X509, Freeing<&X509_free>>;
-using Memory = std::unique_ptr<BIO, Freeing<&BIO_free_all>>;
-using Extension = std::unique_ptr<X509_EXTENSION, Freeing<&X509_EXTENSION_free>>;
+namespace {
 
 constexpr long kSecondsPerDay = 24L * 60 * 60;
 constexpr long kAuthorityDays = 3650;
 constexpr long kServerDays = 365;
 
-[[noreturn]] void fail(const std::string& step) {
-  char reason[160] = "unknown cause";
-  if (unsigned long code = ERR_get_error(); code != 0) ERR_error_string_n(code, reason, sizeof reason);
-  ERR_clear_error();
-  throw std::runtime_error("can't " + step + ": " + reason);
-}
-
-template <class Pointer>
-Pointer checked(Pointer pointer, const char* step) {
-  if (!pointer) fail(step);
-  return pointer;
-}
-
-void require(bool done, const char* step) {
-  if (!done) fail(step);
-}
-
 Key makeKey() { return checked(Key(EVP_EC_gen("P-256")), "make an EC key"); }
-
-template <class Write>
-std::string toPEM(Write write) {
-  Memory memory = checked(Memory(BIO_new(BIO_s_mem())), "allocate memory");
-  require(write(memory.get()) == 1, "write PEM");
-  char* data = nullptr;
-  long size = BIO_get_mem_data(memory.get(), &data);
-  return std::string(data, static_cast<std::size_t>(size));
-}
-
-std::string toPEM(X509* certificate) {
-  return toPEM([&](BIO* out) { return PEM_write_bio_X509(out, certificate); });
-}
-
-std::string toPEM(EVP_PKEY* key) {
-  return toPEM(
-      [&](BIO* out) { return PEM_write_bio_PrivateKey(out, key, nullptr, nullptr, 0, nullptr, nullptr); });
-}
-
-Certificate certificateFromPEM(const std::string& text) {
-  Memory memory(BIO_new_mem_buf(text.data(), static_cast<int>(text.size())));
-  return Certificate(PEM_read_bio_X509(memory.get(), nullptr, nullptr, nullptr));
-}
-
-Key keyFromPEM(const std::string& text) {
-  Memory memory(BIO_new_mem_buf(text.data(), static_cast<int>(text.size())));
-  return Key(PEM_read_bio_PrivateKey(memory.get(), nullptr, nullptr, nullptr));
-}
 
 void setSerial(X509* certificate) {
   unsigned char bytes[16];
   require(RAND_bytes(bytes, sizeof bytes) == 1, "draw a serial number");
   bytes[0] &= 0x7f;  // serial numbers are positive
-  std::unique_ptr<BIGNUM, Freeing<&BN_free>> number(BN_bin2bn(bytes, sizeof bytes, nullptr));
+  Number number(BN_bin2bn(bytes, sizeof bytes, nullptr));
   require(BN_to_ASN1_INTEGER(number.get(), X509_get_serialNumber(certificate)) != nullptr,
           "set a serial number");
 }
@@ -156,7 +96,7 @@ CertificateAuthority CertificateAuthority::openOrCreate(const std::filesystem::p
   }
   CertificateAuthority kept(readWholeFile(certificatePath), readWholeFile(keyPath));
   Certificate certificate = certificateFromPEM(kept._certificate);
-  Key key = keyFromPEM(kept._key);
+  Key key = privateKeyFromPEM(kept._key);
   if (!certificate) fail("use the certificate in " + certificatePath.string());
   if (!key) fail("use the key in " + keyPath.string());
   if (X509_check_private_key(certificate.get(), key.get()) != 1)
@@ -168,7 +108,7 @@ CertificateAuthority CertificateAuthority::openOrCreate(const std::filesystem::p
 
 TLSIdentity CertificateAuthority::issueServerIdentity(const std::vector<std::string>& furtherNames) const {
   Certificate authority = checked(certificateFromPEM(_certificate), "read the authority's certificate");
-  Key authorityKey = checked(keyFromPEM(_key), "read the authority's key");
+  Key authorityKey = checked(privateKeyFromPEM(_key), "read the authority's key");
   Key key = makeKey();
   Certificate certificate = startCertificate(key.get(), "localhost", kServerDays);
   X509* leaf = certificate.get();

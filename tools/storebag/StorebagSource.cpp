@@ -1,0 +1,66 @@
+#include "tools/storebag/StorebagSource.h"
+
+#include <stdexcept>
+
+#include "platform/preferences/TomlFile.h"
+#include "tools/files/WholeFile.h"
+#include "tools/json/JSONReader.h"
+#include "tools/storebag/StorebagRules.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::size_t kMaximumSize = std::size_t{1} << 20;  // what the daemon accepts of a storebag
+
+Dictionary fromJSON(const std::string& text) {
+  JSONOutcome outcome = parseJSON(text);
+  if (!outcome.value) throw std::runtime_error(outcome.error);
+  const Dictionary* dictionary = outcome.value->dictionary();
+  if (dictionary == nullptr) throw std::runtime_error("the storebag must be an object");
+  return *dictionary;
+}
+
+Dictionary fromTOML(const std::string& text) {
+  TomlOutcome outcome = parseToml(text);
+  if (!outcome.document) throw std::runtime_error(outcome.error);
+  return *outcome.document;
+}
+
+Dictionary parse(const std::filesystem::path& file) {
+  std::string text = readWholeFile(file, kMaximumSize);
+  try {
+    if (file.extension() == ".json") return fromJSON(text);
+    if (file.extension() == ".toml") return fromTOML(text);
+    throw std::runtime_error("the name must end in .toml or .json");
+  } catch (const std::runtime_error& error) {
+    throw std::runtime_error(file.string() + ": " + error.what());
+  }
+}
+
+std::vector<std::string> prefixed(const std::filesystem::path& file, const std::vector<std::string>& lines) {
+  std::vector<std::string> all;
+  for (const auto& line : lines) all.push_back(file.string() + ": " + line);
+  return all;
+}
+
+std::string joined(const std::vector<std::string>& lines) {
+  std::string all;
+  for (const auto& line : lines) all.append(all.empty() ? "" : "\n").append(line);
+  return all;
+}
+
+}  // namespace
+
+StorebagSource readStorebagSource(const std::filesystem::path& file, StorebagChecks checks) {
+  StorebagSource source;
+  source.payload = parse(file);
+  StorebagFindings findings = checkStorebag(source.payload);
+  auto errors = prefixed(file, findings.errors);
+  if (!errors.empty() && checks == StorebagChecks::Strict) throw std::runtime_error(joined(errors));
+  source.warnings = prefixed(file, findings.warnings);
+  source.warnings.insert(source.warnings.begin(), errors.begin(), errors.end());
+  return source;
+}
+
+}  // namespace vesk
