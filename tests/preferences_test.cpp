@@ -29,7 +29,10 @@ class Preferences : public testing::Test {
 
 TEST_F(Preferences, HaveEveryKindOfValue) {
   testRoot().write(kSystemFile, R"(
-text = "é"
+# Dots do not make a deep key where there is none. "..........
+text = "é .......... \" .........."
+lines = """.........." .......... """"
+literal = '..........'
 integer = -7
 real = 2.5
 boolean = true
@@ -45,7 +48,9 @@ key = "value"
     const char* key;
     Value value;
   } cases[] = {
-      {"text", "é"},
+      {"text", "é .......... \" .........."},
+      {"lines", "..........\" .......... \""},
+      {"literal", ".........."},
       {"integer", -7},
       {"real", 2.5},
       {"boolean", true},
@@ -96,6 +101,7 @@ TEST_F(Preferences, ThatAreUnusableCountAsEmptyWithOneLine) {
                                   "a = 1\na = 2\n",
                                   std::string("a = \"\0\"", 7),
                                   dots + " = 1",
+                                  "a = { a.b.c.d.e.f.g.h = 1 }",
                                   "a = " + std::string(100'000, '['),
                                   "a = \"" + std::string(1 << 20, 'x') + "\""};
   for (const auto& content : contents) {

@@ -17,7 +17,7 @@ namespace vesk {
 namespace {
 
 constexpr std::size_t kLargestDocument = 1 << 20;
-constexpr std::ptrdiff_t kMostDotsInALine = 256;
+constexpr std::size_t kMostDotsInAKey = 6;
 
 Value valueFromNode(const toml::node& node);
 
@@ -79,12 +79,44 @@ Value valueFromNode(const toml::node& node) {
   return {};
 }
 
-// A dotted key makes one table within another for each dot, and those are released recursively.
-bool hasLineOfManyDots(std::string_view text) {
-  while (!text.empty()) {
-    std::string_view line = text.substr(0, text.find('\n'));
-    if (std::count(line.begin(), line.end(), '.') > kMostDotsInALine) return true;
-    text.remove_prefix(std::min(text.size(), line.size() + 1));
+/// The index behind the string that starts at `start`.
+std::size_t endOfString(std::string_view text, std::size_t start) {
+  const char quote = text[start];
+  const std::string triple(3, quote);
+  const bool isMultiline = text.substr(start, 3) == triple;
+  std::size_t at = start + (isMultiline ? 3 : 1);
+  while (at < text.size()) {
+    if (text[at] == '\\' && quote == '"') {
+      at += 2;
+    } else if (isMultiline && text.substr(at, 3) == triple) {
+      // Up to two more quotes belong to the contents.
+      const std::size_t end = text.find_first_not_of(quote, at + 3);
+      return std::min({end, at + 5, text.size()});
+    } else if (!isMultiline && (text[at] == quote || text[at] == '\n')) {
+      return at + 1;
+    } else {
+      ++at;
+    }
+  }
+  return text.size();
+}
+
+// A dotted key makes one table within another for each dot, and the parser releases those recursively.
+bool hasKeyOfManyParts(std::string_view text) {
+  std::size_t dots = 0;
+  for (std::size_t at = 0; at < text.size();) {
+    const char c = text[at];
+    if (c == '"' || c == '\'') {
+      at = endOfString(text, at);
+      continue;
+    }
+    if (c == '#') {
+      at = std::min(text.find('\n', at), text.size());
+      continue;
+    }
+    if (c == '.' && ++dots > kMostDotsInAKey) return true;
+    if (std::string_view("\n=,[]{}").find(c) != std::string_view::npos) dots = 0;
+    ++at;
   }
   return false;
 }
@@ -93,7 +125,7 @@ bool hasLineOfManyDots(std::string_view text) {
 
 TomlOutcome parseToml(std::string_view text) {
   if (text.size() > kLargestDocument) return {std::nullopt, "larger than 1 MiB"};
-  if (hasLineOfManyDots(text)) return {std::nullopt, "a line with more than 256 dots"};
+  if (hasKeyOfManyParts(text)) return {std::nullopt, "a key with more than 7 parts"};
   toml::parse_result result = toml::parse(text);
   if (result) return {dictionaryFromTable(result.table()), {}};
   const toml::parse_error& error = result.error();

@@ -17,8 +17,8 @@ struct TomlOutcome {
 
 /// Reads a TOML document of at most 1 MiB. Strings, integers, floats, booleans, arrays and tables become the
 /// values of those kinds. A date, or a date with time, becomes a date, taken as UTC when it names no offset;
-/// a time of day alone becomes its text. Arrays and inline tables may nest 32 deep, and a line may hold 256
-/// dots: what reads this may stand on a small stack.
+/// a time of day alone becomes its text. Arrays and inline tables may nest 32 deep, and a key may have 7
+/// parts: what reads this may stand on a small stack.
 TomlOutcome parseToml(std::string_view text);
 
 /// The document of the file at `path` (no root prefix is added). A file that is not there is an empty
