@@ -1,0 +1,318 @@
+// The HTTP client against a real server: what goes over the wire, TLS, limits, and its end.
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <cstdlib>
+#include <future>
+#include <memory>
+#include <optional>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/http/HTTPClient.h"
+#include "tests/support/CapturedLog.h"
+#include "tests/support/RecordingServer.h"
+#include "tests/support/TempDirectory.h"
+
+namespace vesk::test {
+namespace {
+
+using namespace std::chrono_literals;
+using Fault = HTTPAnswer::Fault;
+using Kind = HTTPError::Kind;
+
+HTTPRequest postTo(const std::string& url, std::string body = "{}") {
+  HTTPRequest request;
+  request.method = "POST";
+  request.url = url;
+  request.body = std::move(body);
+  request.retry = HTTPRequest::Retry::UntilSent;
+  return request;
+}
+
+HTTPRequest fetchFrom(const std::string& url) {
+  HTTPRequest request;
+  request.url = url;
+  return request;
+}
+
+template <class Condition>
+void waitFor(Condition condition) {
+  while (!condition()) std::this_thread::yield();
+}
+
+TEST(HTTPClient, SendsWhatItIsGivenAndLittleElse) {
+  RecordingServer server([](const HTTPReceived&, std::size_t) {
+    auto answer = HTTPAnswer::text(201, "made");
+    answer.headers.emplace_back("Cache-Control", "max-age=600");
+    return answer;
+  });
+  HTTPClient client;
+  auto request = postTo(server.url("/a?b=c"), std::string("zero\0byte", 9));
+  request.headers = {{"X-Vesk-Second", "2"},
+                     {"X-Vesk-Empty", ""},
+                     {"Accept", "application/json"},
+                     {"Content-Type", "application/json"},
+                     {"Content-Length", "9"}};
+  auto result = client.perform(request);
+
+  ASSERT_TRUE(result.response);
+  EXPECT_FALSE(result.error);
+  EXPECT_EQ(result.response->status, 201);
+  EXPECT_EQ(result.response->header("cache-CONTROL"), "max-age=600");
+  EXPECT_FALSE(result.response->header("cache"));
+  EXPECT_NE(result.response->body.find("made"), std::string::npos);
+  ASSERT_EQ(server.count(), 1u);
+  auto received = server.requests().front();
+  EXPECT_EQ(received.method, "POST");
+  EXPECT_EQ(received.target, "/a?b=c");
+  EXPECT_EQ(received.body, request.body);
+  HTTPHeaderList own;
+  for (const auto& header : received.headers) {
+    if (header.first != "Host") own.push_back(header);
+  }
+  HTTPHeaderList expected = request.headers;
+  expected.insert(expected.begin(), {"User-Agent", "veskreportingd"});
+  EXPECT_EQ(own, expected);
+}
+
+TEST(HTTPClient, KnowsTheUsualMethodsOnOneHandle) {
+  RecordingServer server;
+  HTTPClient client;
+  struct Case {
+    const char* method;
+    const char* body;
+  };
+  const Case cases[] = {{"HEAD", ""},   {"POST", "x"}, {"GET", ""},  {"PUT", "y"},
+                        {"DELETE", ""}, {"HEAD", ""},  {"POST", ""}, {"GET", ""}};
+  for (const auto& test : cases) {
+    HTTPRequest request = fetchFrom(server.url());
+    request.method = test.method;
+    request.body = test.body;
+    auto result = client.perform(request);
+    ASSERT_TRUE(result.response) << test.method << ": " << result.error->description;
+    auto received = server.requests().back();
+    EXPECT_EQ(received.method, test.method);
+    EXPECT_EQ(received.body, test.body);
+    EXPECT_FALSE(received.header("Content-Type")) << test.method;
+  }
+}
+
+TEST(HTTPClient, LargeBodiesNeedNoAskingFirst) {
+  RecordingServer server;
+  HTTPClient client;
+  std::string body(5u << 20, 'b');
+  ASSERT_TRUE(client.perform(postTo(server.url(), body)).response);
+  auto received = server.requests().front();
+  EXPECT_EQ(received.body, body);
+  EXPECT_FALSE(received.header("Expect"));
+}
+
+TEST(HTTPClient, LeavesOutHeadersThatWouldBreakTheRequestApart) {
+  CapturedLog log;
+  RecordingServer server;
+  HTTPClient client;
+  auto request = postTo(server.url());
+  request.headers = {{"X-Good", "fine: äöü"}, {"X-Line", "a\r\nX-Injected: 1"},
+                     {"X-Feed", "a\nb"},      {"X-Nul", std::string("a\0b", 3)},
+                     {"X-Tab", "a\tb"},       {"X Blank", "a"},
+                     {"X-Colon: b", "a"},     {"", "a"},
+                     {"X-Delete", "\x7f"}};
+  ASSERT_TRUE(client.perform(request).response);
+  auto received = server.requests().front();
+  EXPECT_EQ(received.header("X-Good"), "fine: äöü");
+  for (const auto& [name, value] : received.headers) {
+    EXPECT_TRUE(!name.starts_with("X-") || name == "X-Good") << name;
+  }
+  EXPECT_EQ(log.countContaining(4, "left out"), 8);
+}
+
+TEST(HTTPClient, PostsKeepTheirConnection) {
+  RecordingServer server;
+  HTTPClient client;
+  for (int i = 0; i < 20; ++i) ASSERT_TRUE(client.perform(postTo(server.url())).response);
+  EXPECT_EQ(server.server().connectionsAccepted(), 1u);
+}
+
+TEST(HTTPClient, HeldPostsNeitherOpenMoreConnectionsThanAllowedNorHoldUpAFetch) {
+  RecordingServer server([](const HTTPReceived& request, std::size_t) {
+    return request.path() == "/post" ? faulty(Fault::Hold) : HTTPAnswer::text(200, "ok");
+  });
+  HTTPClient client(HTTPClient::Options{.maximumConnectionsPerHost = 3});
+  std::atomic<int> done{0};
+  for (int i = 0; i < 10; ++i) {
+    client.start(postTo(server.url()), [&](const HTTPResult& result) { done += result.response ? 1 : 0; });
+  }
+  waitFor([&] { return server.count() == 2; });
+  EXPECT_TRUE(client.perform(fetchFrom(server.url("/fetch"))).response);
+  EXPECT_EQ(server.count(), 3u);
+  EXPECT_LE(server.server().connectionsOpen(), 3u);
+  EXPECT_FALSE(client.waitUntilIdle(1ms));
+  waitFor([&] {
+    server.server().releaseHeld();
+    return done == 10;
+  });
+  EXPECT_TRUE(client.waitUntilIdle(60s));
+  EXPECT_LE(server.server().connectionsAccepted(), 3u);
+}
+
+TEST(HTTPClient, OneConnectionKeepsTheOrderOfTheCalls) {
+  RecordingServer server;
+  std::vector<std::string> sent;
+  HTTPClient client(HTTPClient::Options{.maximumConnectionsPerHost = 1});
+  for (int i = 0; i < 50; ++i) {
+    sent.push_back(std::to_string(i));
+    client.start(postTo(server.url(), sent.back()), [](const HTTPResult&) {});
+  }
+  ASSERT_TRUE(client.waitUntilIdle(60s));
+  EXPECT_EQ(server.bodies(), sent);
+}
+
+TEST(HTTPClient, ManyThreadsShareIt) {
+  RecordingServer server;
+  HTTPClient client;
+  std::vector<std::thread> threads;
+  for (int t = 0; t < 4; ++t) {
+    threads.emplace_back([&] {
+      for (int i = 0; i < 25; ++i) {
+        client.start(postTo(server.url()), [](const HTTPResult& result) { EXPECT_TRUE(result.response); });
+        EXPECT_TRUE(client.perform(fetchFrom(server.url())).response);
+      }
+    });
+  }
+  for (auto& thread : threads) thread.join();
+  ASSERT_TRUE(client.waitUntilIdle(60s));
+  EXPECT_EQ(server.count(), 200u);
+}
+
+TEST(HTTPClient, VerifiesTheServerAgainstTheGivenAuthorities) {
+  TempDirectory directory;
+  auto authority = CertificateAuthority::generate();
+  auto file = directory.write("ca.pem", authority.certificate());
+  RecordingServer good({}, {.tls = authority.issueServerIdentity()});
+  RecordingServer otherName({}, {.address = "127.0.0.2", .tls = authority.issueServerIdentity()});
+  RecordingServer otherAuthority({}, {.tls = CertificateAuthority::generate().issueServerIdentity()});
+  std::string otherNameURL = "https://127.0.0.2:" + std::to_string(otherName.server().port());
+
+  ::setenv("SSL_CERT_FILE", file.c_str(), 1);
+  HTTPClient client;
+  ::unsetenv("SSL_CERT_FILE");
+  HTTPClient systemClient;
+
+  EXPECT_TRUE(client.perform(postTo(good.url())).response);
+  EXPECT_TRUE(client.perform(postTo(good.url())).response);
+  EXPECT_EQ(good.server().connectionsAccepted(), 1u);
+  for (auto [which, url] :
+       {std::pair(&client, otherNameURL), {&client, otherAuthority.url()}, {&systemClient, good.url()}}) {
+    // A post too: a bad certificate is no outage.
+    auto result = which->perform(postTo(url));
+    ASSERT_TRUE(result.error) << url;
+    EXPECT_EQ(result.error->kind, Kind::TLS) << result.error->description;
+  }
+  EXPECT_EQ(good.count(), 2u);
+  EXPECT_EQ(otherName.count() + otherAuthority.count(), 0u);
+}
+
+TEST(HTTPClient, FollowsOnlyHTTPAndNoRedirect) {
+  RecordingServer server([](const HTTPReceived&, std::size_t) {
+    HTTPAnswer answer;
+    answer.status = 302;
+    answer.headers.emplace_back("Location", "/elsewhere");
+    return answer;
+  });
+  HTTPClient client;
+  EXPECT_EQ(client.perform(fetchFrom(server.url())).response->status, 302);
+  EXPECT_EQ(server.count(), 1u);
+  for (const char* url : {"", "localhost", "ftp://localhost/x", "file:///etc/passwd", "http://", "https://",
+                          "http://a b/", "http://[::1", "http://h:99999/", "http://a\r\nb/"}) {
+    auto result = client.perform(postTo(url));
+    ASSERT_TRUE(result.error) << url;
+    EXPECT_EQ(result.error->kind, Kind::BadURL) << url << ": " << result.error->description;
+    EXPECT_FALSE(result.response);
+  }
+}
+
+TEST(HTTPClient, BadAnswersAreErrorsOfTheirKind) {
+  struct Case {
+    Fault fault;
+    Kind kind;
+  };
+  for (auto [fault, kind] :
+       {Case{Fault::Stall, Kind::Timeout}, Case{Fault::ResetBeforeAnswer, Kind::Interrupted},
+        Case{Fault::ResetMidAnswer, Kind::Interrupted}, Case{Fault::CloseWithoutAnswer, Kind::Interrupted},
+        Case{Fault::CloseMidAnswer, Kind::Interrupted}, Case{Fault::Garbage, Kind::Other},
+        Case{Fault::HugeBody, Kind::TooLarge}}) {
+    RecordingServer server([f = fault](const HTTPReceived&, std::size_t) { return faulty(f); });
+    HTTPClient client(HTTPClient::Options{.maximumBody = 1000});
+    auto request = fetchFrom(server.url());
+    if (fault == Fault::Stall) request.timeout = 100ms;
+    auto result = client.perform(request);
+    ASSERT_TRUE(result.error) << static_cast<int>(fault);
+    EXPECT_EQ(result.error->kind, kind) << static_cast<int>(fault) << ": " << result.error->description;
+    EXPECT_FALSE(result.error->description.empty());
+    EXPECT_EQ(server.count(), 1u);
+  }
+}
+
+TEST(HTTPClient, TakesABodyUpToTheLimitAndNoEndOfHeaders) {
+  RecordingServer server([](const HTTPReceived& request, std::size_t) {
+    HTTPAnswer answer;
+    answer.body = std::string(1000, 'b');
+    if (request.path() == "/headers") {
+      answer.headers.assign(300, {"X-Header", std::string(1000, 'h')});
+    }
+    return answer;
+  });
+  HTTPClient exact(HTTPClient::Options{.maximumBody = 1000});
+  EXPECT_EQ(exact.perform(fetchFrom(server.url())).response->body.size(), 1000u);
+  EXPECT_EQ(exact.perform(fetchFrom(server.url("/headers"))).error->kind, Kind::TooLarge);
+  HTTPClient less(HTTPClient::Options{.maximumBody = 999});
+  EXPECT_EQ(less.perform(fetchFrom(server.url())).error->kind, Kind::TooLarge);
+}
+
+TEST(HTTPClient, SurvivesACompletionThatThrowsAndOneThatGoesOn) {
+  CapturedLog log;
+  RecordingServer server;
+  HTTPClient client;
+  client.start(fetchFrom(server.url()), [](const HTTPResult&) { throw std::runtime_error("broken"); });
+  client.start(fetchFrom(server.url()), [](const HTTPResult&) { throw 7; });
+  client.start(fetchFrom(server.url()), [&](const HTTPResult&) {
+    client.start(fetchFrom(server.url("/again")),
+                 [](const HTTPResult& result) { EXPECT_TRUE(result.response); });
+  });
+  ASSERT_TRUE(client.waitUntilIdle(60s));
+  EXPECT_EQ(server.count(), 4u);
+  EXPECT_EQ(log.countContaining(3, "a completion failed"), 2);
+}
+
+TEST(HTTPClient, LetsGoOfItsCapturesAsSoonAsACompletionRan) {
+  RecordingServer server;
+  HTTPClient client;
+  auto token = std::make_shared<int>(1);
+  client.start(fetchFrom(server.url()), [token](const HTTPResult&) {});
+  ASSERT_TRUE(client.waitUntilIdle(60s));
+  EXPECT_EQ(token.use_count(), 1);
+}
+
+TEST(HTTPClient, ItsEndFailsWhatIsOutstandingAtOnce) {
+  RecordingServer server([](const HTTPReceived&, std::size_t) { return faulty(Fault::Stall); });
+  auto client = std::make_unique<HTTPClient>();
+  std::vector<Kind> kinds;
+  auto note = [&](const HTTPResult& result) { kinds.push_back(result.error->kind); };
+  for (int i = 0; i < 20; ++i) client->start(postTo(server.url()), note);
+  client->start(fetchFrom(server.url()), [&, again = client.get()](const HTTPResult& result) {
+    note(result);
+    again->start(fetchFrom(server.url()), note);
+  });
+  waitFor([&] { return server.count() == 6; });
+  // Two that wait for another attempt: nothing listens on the port of a server that is gone.
+  std::string gone = [] { return RecordingServer().url(); }();
+  client->start(postTo(gone), note);
+  client->start(postTo(gone), note);
+  client.reset();
+  EXPECT_EQ(kinds, std::vector<Kind>(24, Kind::Stopped));
+}
+
+}  // namespace
+}  // namespace vesk::test

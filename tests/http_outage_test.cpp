@@ -1,0 +1,157 @@
+// Posts and servers that go away: what is tried again, what is not, and what is lost.
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <atomic>
+#include <chrono>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/http/HTTPClient.h"
+#include "tests/support/CapturedLog.h"
+#include "tests/support/RecordingServer.h"
+
+namespace vesk::test {
+namespace {
+
+using namespace std::chrono_literals;
+using Fault = HTTPAnswer::Fault;
+using Kind = HTTPError::Kind;
+using Bodies = std::vector<std::string>;
+
+HTTPRequest request(const std::string& url, HTTPRequest::Retry retry, std::string body = "event") {
+  HTTPRequest made;
+  made.method = "POST";
+  made.url = url;
+  made.body = std::move(body);
+  made.retry = retry;
+  return made;
+}
+HTTPRequest post(const std::string& url, std::string body = "event") {
+  return request(url, HTTPRequest::Retry::UntilSent, std::move(body));
+}
+
+/// Impatient, so that tests do not wait.
+HTTPClient::Options quick() { return {.retryFor = 60s, .firstRetryAfter = 5ms}; }
+
+TEST(HTTPOutage, APostThatWasCutOffIsSentAgainUntilItIsAnswered) {
+  for (Fault fault : {Fault::ResetBeforeAnswer, Fault::CloseWithoutAnswer}) {
+    RecordingServer server([fault](const HTTPReceived&, std::size_t count) {
+      return count < 3 ? faulty(fault) : HTTPAnswer::text(200, "ok");
+    });
+    HTTPClient client(quick());
+    auto result = client.perform(post(server.url()));
+    ASSERT_TRUE(result.response) << result.error->description;
+    EXPECT_EQ(server.bodies(), Bodies(4, "event"));
+  }
+}
+
+TEST(HTTPOutage, AKeptConnectionThatTheServerClosedCostsNothing) {
+  RecordingServer server([](const HTTPReceived&, std::size_t) { return faulty(Fault::CloseAfterAnswer); });
+  HTTPClient client(quick());
+  for (int i = 0; i < 10; ++i) {
+    auto result = client.perform(post(server.url(), std::to_string(i)));
+    ASSERT_TRUE(result.response) << result.error->description;
+  }
+  EXPECT_EQ(server.bodies(), (Bodies{"0", "1", "2", "3", "4", "5", "6", "7", "8", "9"}));
+}
+
+TEST(HTTPOutage, NothingIsLostWhileTheServerIsDown) {
+  CapturedLog log;
+  RecordingServer server;
+  HTTPClient client(quick());
+  ASSERT_TRUE(client.perform(post(server.url(), "before")).response);
+  server.stop();
+  std::atomic<int> answered{0};
+  Bodies expected{"before"};
+  for (int i = 0; i < 40; ++i) {
+    expected.push_back("event " + std::to_string(i));
+    client.start(post(server.url(), expected.back()),
+                 [&](const HTTPResult& result) { answered += result.response ? 1 : 0; });
+  }
+  while (log.countContaining(6, "no answer from " + server.server().baseURL()) == 0) {
+    std::this_thread::yield();
+  }
+  EXPECT_FALSE(client.waitUntilIdle(50ms));
+  server.start();
+  ASSERT_TRUE(client.waitUntilIdle(60s));
+  EXPECT_EQ(answered, 40);
+  auto bodies = server.bodies();
+  std::sort(bodies.begin(), bodies.end());
+  std::sort(expected.begin(), expected.end());
+  EXPECT_EQ(bodies, expected);
+  EXPECT_EQ(log.countContaining(6, server.server().baseURL() + " answers again"), 1);
+}
+
+TEST(HTTPOutage, AnUploadOrFetchIsSentOnceEvenOnAKeptConnection) {
+  RecordingServer server([](const HTTPReceived& received, std::size_t) {
+    return received.body == "event" ? HTTPAnswer::text(200, "ok") : faulty(Fault::ResetBeforeAnswer);
+  });
+  HTTPClient client(quick());
+  ASSERT_TRUE(client.perform(post(server.url())).response);
+  auto result = client.perform(request(server.url(), HTTPRequest::Retry::Never, "upload"));
+  ASSERT_TRUE(result.error);
+  EXPECT_EQ(result.error->kind, Kind::Interrupted);
+  EXPECT_EQ(server.bodies(), (Bodies{"event", "upload"}));
+
+  server.stop();
+  EXPECT_EQ(client.perform(request(server.url(), HTTPRequest::Retry::Never)).error->kind, Kind::Connect);
+}
+
+TEST(HTTPOutage, WhatWasAnsweredIsNeverSentAgain) {
+  for (auto answer :
+       {HTTPAnswer::text(503, "busy"), HTTPAnswer::text(404, "where?"), HTTPAnswer::text(429, "slow"),
+        faulty(Fault::CloseMidAnswer), faulty(Fault::ResetMidAnswer), faulty(Fault::Garbage)}) {
+    RecordingServer server([&](const HTTPReceived&, std::size_t) { return answer; });
+    HTTPClient client(quick());
+    auto result = client.perform(post(server.url()));
+    EXPECT_EQ(result.response.has_value(), answer.fault == Fault::None);
+    EXPECT_NE(result.response.has_value(), result.error.has_value());
+    EXPECT_EQ(server.count(), 1u);
+  }
+}
+
+TEST(HTTPOutage, AServerThatHasThePostAndStallsDoesNotGetItTwice) {
+  RecordingServer server([](const HTTPReceived&, std::size_t) { return faulty(Fault::Stall); });
+  HTTPClient client(quick());
+  auto stalled = post(server.url());
+  stalled.timeout = 100ms;
+  EXPECT_EQ(client.perform(stalled).error->kind, Kind::Timeout);
+  EXPECT_EQ(server.count(), 1u);
+}
+
+TEST(HTTPOutage, PostsAreGivenUpWhenTheTimeIsOver) {
+  RecordingServer server;
+  server.stop();
+  HTTPClient client(HTTPClient::Options{.retryFor = 60ms, .firstRetryAfter = 5ms});
+  auto result = client.perform(post(server.url()));
+  ASSERT_TRUE(result.error);
+  EXPECT_EQ(result.error->kind, Kind::Connect);
+}
+
+TEST(HTTPOutage, PostsAreGivenUpWhenTooMuchWaits) {
+  CapturedLog log;
+  RecordingServer server;
+  server.stop();
+  HTTPClient client(HTTPClient::Options{.firstRetryAfter = 5ms});  // 8 MiB may wait
+  std::atomic<int> refused{0};
+  std::atomic<int> answered{0};
+  constexpr int kPosts = 30;
+  for (int i = 0; i < kPosts; ++i) {
+    client.start(post(server.url(), std::string(1u << 20, 'x')), [&](const HTTPResult& result) {
+      if (result.response) ++answered;
+      if (result.error && result.error->kind == Kind::Connect) ++refused;
+    });
+  }
+  // Beyond the eight that may wait, five may be under way at any moment.
+  while (refused < kPosts - 13) std::this_thread::yield();
+  server.start();
+  ASSERT_TRUE(client.waitUntilIdle(60s));
+  EXPECT_EQ(refused + answered, kPosts);
+  EXPECT_GE(answered, 8);
+  EXPECT_EQ(server.count(), static_cast<std::size_t>(answered));
+}
+
+}  // namespace
+}  // namespace vesk::test

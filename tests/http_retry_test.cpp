@@ -1,0 +1,208 @@
+// When posts are tried again, and in what order requests go out: decided without waiting.
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "platform/http/HTTPSchedule.h"
+#include "platform/http/RetryPolicy.h"
+
+namespace vesk {
+namespace {
+
+using namespace std::chrono_literals;
+using Instant = RetryPolicy::Instant;
+
+TEST(RetryPolicy, WaitsGrowAreSpreadAndEnd) {
+  const RetryPolicy policy{60s, 200ms, 10s, 1000};
+  const Instant first{};
+  struct Case {
+    unsigned failures;
+    std::chrono::milliseconds since;
+    std::size_t waiting;
+    double random;
+    std::optional<std::chrono::milliseconds> wait;
+  };
+  const Case cases[] = {
+      {1, 0ms, 10, 0.5, 200ms},        {2, 200ms, 10, 0.5, 400ms}, {3, 1s, 10, 0.5, 800ms},
+      {6, 10s, 10, 0.5, 6400ms},       {7, 20s, 10, 0.5, 10s},     {1000, 20s, 10, 0.5, 10s},
+      {1, 0ms, 10, 0.0, 100ms},        {7, 20s, 10, 0.0, 5s},      {7, 20s, 10, 0.75, 12500ms},
+      {7, 55s, 10, 0.5, 5s},           {7, 59999ms, 10, 0.5, 1ms}, {7, 60s, 10, 0.5, std::nullopt},
+      {1, 61s, 10, 0.5, std::nullopt}, {1, 0ms, 1000, 0.5, 200ms}, {1, 0ms, 1001, 0.5, std::nullopt},
+  };
+  for (const auto& test : cases) {
+    auto wait = policy.waitAfter(test.failures, first, first + test.since, test.waiting, test.random);
+    EXPECT_EQ(wait, test.wait) << test.failures << " failures, " << test.since.count() << " ms";
+  }
+}
+
+class Schedule : public testing::Test {
+ protected:
+  Schedule() {
+    options.maximumWaiting = 100;
+    options.maximumConnectionsPerHost = 3;
+  }
+
+  HTTPSchedule::Exchange exchange(const std::string& name, HTTPRequest::Retry retry, std::size_t size = 10,
+                                  const std::string& host = "https://a") {
+    HTTPRequest request;
+    request.url = host + "/" + name;
+    request.body = std::string(size, 'x');
+    request.retry = retry;
+    return std::make_unique<HTTPExchange>(
+        std::move(request), [](const HTTPResult&) {}, now);
+  }
+  HTTPSchedule::Exchange post(const std::string& name, std::size_t size = 10,
+                              const std::string& host = "https://a") {
+    return exchange(name, HTTPRequest::Retry::UntilSent, size, host);
+  }
+  HTTPSchedule::Exchange fetch(const std::string& name) {
+    return exchange(name, HTTPRequest::Retry::Never, 0);
+  }
+  /// Takes all that may go out now; the names in order.
+  std::string takeReady() {
+    std::string names;
+    while (auto next = schedule().next(now)) {
+      names += next->request.url.substr(next->request.url.rfind('/') + 1);
+      active.push_back(std::move(next));
+    }
+    return names;
+  }
+  std::string givenUp() {
+    std::string names;
+    for (auto& [exchange, error] : schedule().takeGivenUp()) {
+      names += exchange->request.url.substr(exchange->request.url.rfind('/') + 1);
+    }
+    return names;
+  }
+  void failFirst(HTTPError::Kind kind = HTTPError::Kind::Connect, bool mayRetry = true) {
+    schedule().failed(std::move(active.front()), {kind, "down"}, mayRetry, now);
+    active.erase(active.begin());
+  }
+  void answerFirst() {
+    schedule().answered(*active.front());
+    active.erase(active.begin());
+  }
+  HTTPSchedule& schedule() {
+    if (!_schedule) _schedule.emplace(options);
+    return *_schedule;
+  }
+
+  HTTPClient::Options options;
+  Instant now{Instant{} + 1h};
+  std::vector<HTTPSchedule::Exchange> active;
+
+ private:
+  std::optional<HTTPSchedule> _schedule;
+};
+
+TEST_F(Schedule, KeepsTheOrderOfAHostAndOneConnectionForFetches) {
+  for (const char* name : {"1", "2", "3", "4"}) schedule().add(post(name));
+  schedule().add(post("b", 10, "https://b"));
+  EXPECT_EQ(takeReady(), "12b");
+  schedule().add(fetch("f"));
+  schedule().add(fetch("g"));
+  EXPECT_EQ(takeReady(), "f");
+  answerFirst();
+  EXPECT_EQ(takeReady(), "g") << "a fetch goes before posts";
+  answerFirst();
+  EXPECT_EQ(takeReady(), "3");
+}
+
+TEST_F(Schedule, AFailedPostComesBackBeforeThoseBehindIt) {
+  for (const char* name : {"1", "2", "3", "4"}) schedule().add(post(name));
+  EXPECT_EQ(takeReady(), "12");
+  failFirst();
+  EXPECT_EQ(takeReady(), "3") << "others do not wait for it";
+  auto due = schedule().nextAdvance();
+  ASSERT_TRUE(due);
+  EXPECT_GE(*due - now, 100ms);
+  EXPECT_LE(*due - now, 300ms);
+  now = *due;
+  schedule().advance(now);
+  answerFirst();
+  EXPECT_EQ(takeReady(), "1");
+  EXPECT_EQ(givenUp(), "");
+}
+
+TEST_F(Schedule, GivesUpWhatMayNotBeRetried) {
+  schedule().add(fetch("f"));
+  schedule().add(post("p"));
+  EXPECT_EQ(takeReady(), "fp");
+  failFirst();
+  failFirst(HTTPError::Kind::Timeout, false);
+  EXPECT_EQ(givenUp(), "fp");
+  EXPECT_FALSE(schedule().nextAdvance());
+}
+
+TEST_F(Schedule, InAnOutageAtMostSoManyBytesWait) {
+  schedule().add(post("1", 60));
+  schedule().add(post("2", 60));
+  EXPECT_EQ(takeReady(), "12");
+  failFirst();
+  failFirst();
+  EXPECT_EQ(givenUp(), "2");
+  schedule().add(post("3", 40));
+  schedule().add(post("4", 1));
+  EXPECT_EQ(givenUp(), "4") << "what the queue holds counts too";
+  schedule().add(post("5", 1, "https://b"));
+  EXPECT_EQ(givenUp(), "") << "another host is not down";
+}
+
+TEST_F(Schedule, PostsQueuedBehindAnOutageShareItsEnd) {
+  for (const char* name : {"1", "2", "3"}) schedule().add(post(name));
+  EXPECT_EQ(takeReady(), "12");
+  now += 61s;
+  schedule().add(post("4"));
+  failFirst();
+  EXPECT_EQ(givenUp(), "31");
+}
+
+TEST_F(Schedule, TheMemoryOfWaitingPostsIsBounded) {
+  options.maximumQueued = 10'000;
+  for (int i = 0; i < 4; ++i) schedule().add(post("1", 4000));
+  EXPECT_EQ(givenUp(), "111");
+  EXPECT_EQ(takeReady(), "1");
+  schedule().add(post("2", 4000));
+  EXPECT_EQ(givenUp(), "");
+}
+
+TEST_F(Schedule, AFetchThatFindsNoConnectionInTimeIsGivenUp) {
+  for (const char* name : {"f", "g", "h", "i"}) schedule().add(fetch(name));
+  EXPECT_EQ(takeReady(), "fgh");
+  EXPECT_EQ(schedule().nextAdvance(), now + 60s);
+  schedule().advance(now + 59s);
+  EXPECT_EQ(givenUp(), "");
+  schedule().advance(now + 60s);
+  EXPECT_EQ(givenUp(), "i");
+}
+
+TEST_F(Schedule, HandsOutEverythingAtTheEnd) {
+  for (const char* name : {"1", "2", "3"}) schedule().add(post(name));
+  schedule().add(fetch("f"));
+  EXPECT_EQ(takeReady(), "f12");
+  failFirst(HTTPError::Kind::Connect);
+  failFirst(HTTPError::Kind::Connect);
+  EXPECT_EQ(schedule().takeAll().size(), 3u);
+  EXPECT_FALSE(schedule().nextAdvance());
+}
+
+TEST(HTTPExchange, ItsCompletionRunsExactlyOnce) {
+  int runs = 0;
+  HTTPError::Kind kind{};
+  auto count = [&](const HTTPResult& result) {
+    ++runs;
+    kind = result.error->kind;
+  };
+  std::make_unique<HTTPExchange>(HTTPRequest{}, count, Instant{})->fail({HTTPError::Kind::Stopped, "x"});
+  EXPECT_EQ(runs, 1);
+  EXPECT_EQ(kind, HTTPError::Kind::Stopped);
+  std::make_unique<HTTPExchange>(HTTPRequest{}, count, Instant{}).reset();
+  EXPECT_EQ(runs, 2);
+  EXPECT_EQ(kind, HTTPError::Kind::Other);
+}
+
+}  // namespace
+}  // namespace vesk

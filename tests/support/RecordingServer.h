@@ -1,0 +1,75 @@
+// A server that keeps what it gets and answers as a test wants.
+#pragma once
+
+#include <cstddef>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "tools/collector/CertificateAuthority.h"
+#include "tools/collector/HTTPServer.h"
+
+namespace vesk::test {
+
+class RecordingServer {
+ public:
+  /// `count`: requests before this one.
+  using Answer = std::function<HTTPAnswer(const HTTPReceived& request, std::size_t count)>;
+
+  explicit RecordingServer(Answer answer = {}, HTTPServer::Options options = {})
+      : _answer(std::move(answer)), _options(std::move(options)) {
+    start();
+  }
+
+  /// Goes down; its port refuses connections.
+  void stop() { _server->stop(); }
+  /// Comes back on the same port.
+  void start() {
+    if (_server) _options.port = _server->port();
+    _server = std::make_unique<HTTPServer>(_options,
+                                           [this](const HTTPReceived& request) { return receive(request); });
+  }
+  HTTPServer& server() { return *_server; }
+  std::string url(const std::string& path = "/post") const { return _server->baseURL() + path; }
+
+  std::vector<HTTPReceived> requests() const {
+    std::lock_guard lock(_mutex);
+    return _requests;
+  }
+  std::vector<std::string> bodies() const {
+    std::vector<std::string> all;
+    for (const auto& request : requests()) all.push_back(request.body);
+    return all;
+  }
+  std::size_t count() const { return requests().size(); }
+
+ private:
+  HTTPAnswer receive(const HTTPReceived& request) {
+    std::size_t before = 0;
+    {
+      std::lock_guard lock(_mutex);
+      before = _requests.size();
+      _requests.push_back(request);
+    }
+    return _answer ? _answer(request, before) : HTTPAnswer::text(200, "ok");
+  }
+
+  const Answer _answer;
+  HTTPServer::Options _options;
+  mutable std::mutex _mutex;
+  std::vector<HTTPReceived> _requests;
+  std::unique_ptr<HTTPServer> _server;
+};
+
+/// An answer that is badly delivered.
+inline HTTPAnswer faulty(HTTPAnswer::Fault fault, std::string body = "some text") {
+  HTTPAnswer answer;
+  answer.fault = fault;
+  answer.body = std::move(body);
+  return answer;
+}
+
+}  // namespace vesk::test
