@@ -62,7 +62,7 @@ void ReportingdSession::aggregateMessage(const std::optional<Dictionary>& sessio
 void ReportingdSession::sendToAggregator(const std::optional<Dictionary>& sessionInfo, double timestamp,
                                          std::uint16_t category, std::uint16_t type,
                                          const std::optional<Dictionary>& payload) {
-  ClientSessionReplyProxy proxy(*_connection, [](const std::string& error) {
+  ClientSessionReplyProxy proxy(_connection, [](const std::string& error) {
     VESK_LOG_ERROR("sendMessageWithDictionary: Failed to get remote object proxy: %s", error.c_str());
   });
   proxy.sendMessageToClient(sessionInfo, timestamp, category, type, payload);

@@ -90,7 +90,7 @@ TEST_F(Session, ParametersAreCheckedAndCut) {
   CapturedLog log;
   auto session = configured();
   session.start();
-  harness.posts();
+  session->flushMessagesWithReply({});
   EXPECT_EQ(session.send(Dictionary{{"payload", Dictionary()}}), std::nullopt);
   EXPECT_EQ(session.send(Dictionary{{"category", 1}}), std::nullopt);
   EXPECT_EQ(session.send(message("one", 2)), std::nullopt) << "a text is no category";
