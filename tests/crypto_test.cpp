@@ -1,10 +1,6 @@
 // Digests, base64, RSA signatures and UUIDs.
 #include <gtest/gtest.h>
-#include <openssl/evp.h>
-#include <openssl/rsa.h>
-#include <openssl/x509.h>
 
-#include <memory>
 #include <set>
 #include <string>
 #include <thread>
@@ -14,36 +10,10 @@
 #include "platform/crypto/Digest.h"
 #include "platform/crypto/RSAPublicKey.h"
 #include "platform/crypto/UUID.h"
+#include "tests/support/TestSigningKey.h"
 
-namespace vesk {
+namespace vesk::test {
 namespace {
-
-struct FreeKey {
-  void operator()(EVP_PKEY* key) const { EVP_PKEY_free(key); }
-};
-using Key = std::unique_ptr<EVP_PKEY, FreeKey>;
-
-std::string derOf(EVP_PKEY* key, int (*encode)(const EVP_PKEY*, unsigned char**)) {
-  unsigned char* bytes = nullptr;
-  int size = encode(key, &bytes);
-  std::string der(reinterpret_cast<char*>(bytes), static_cast<std::size_t>(size));
-  OPENSSL_free(bytes);
-  return der;
-}
-
-int encodePKCS1(const EVP_PKEY* key, unsigned char** out) { return i2d_PublicKey(key, out); }
-
-std::string sign(EVP_PKEY* key, const EVP_MD* digest, std::string_view message) {
-  std::unique_ptr<EVP_MD_CTX, decltype(&EVP_MD_CTX_free)> context(EVP_MD_CTX_new(), EVP_MD_CTX_free);
-  EXPECT_EQ(EVP_DigestSignInit(context.get(), nullptr, digest, nullptr, key), 1);
-  std::string signature(512, '\0');
-  std::size_t size = signature.size();
-  EXPECT_EQ(EVP_DigestSign(context.get(), reinterpret_cast<unsigned char*>(signature.data()), &size,
-                           reinterpret_cast<const unsigned char*>(message.data()), message.size()),
-            1);
-  signature.resize(size);
-  return signature;
-}
 
 TEST(Digest, MatchesPublishedVectors) {
   EXPECT_EQ(hexLower(sha1("abc")), "a9993e364706816aba3e25717850c26c9cd0d89d");
@@ -112,17 +82,10 @@ TEST(UUID, IsRandomVersionFour) {
             "00010203-0405-0607-0809-0A0B0C0D0EFF");
 }
 
-class RSA : public testing::Test {
- protected:
-  static void SetUpTestSuite() { _key.reset(EVP_RSA_gen(2048)); }
-  static void TearDownTestSuite() { _key.reset(); }
-  static Key _key;
-};
-Key RSA::_key;
-
-TEST_F(RSA, VerifiesItsSignatureFromEitherForm) {
-  auto signature = sign(_key.get(), EVP_sha1(), "payload");
-  for (const auto& der : {derOf(_key.get(), i2d_PUBKEY), derOf(_key.get(), encodePKCS1)}) {
+TEST(RSAPublicKey, VerifiesItsSignatureFromEitherForm) {
+  TestSigningKey signer;
+  auto signature = signer.sign("payload");
+  for (const auto& der : {signer.publicKeyInfo(), signer.bareKey()}) {
     auto key = RSAPublicKey::fromDER(der);
     ASSERT_TRUE(key);
     EXPECT_TRUE(key->verifySHA1(sha1("payload"), signature));
@@ -133,32 +96,31 @@ TEST_F(RSA, VerifiesItsSignatureFromEitherForm) {
   }
 }
 
-TEST_F(RSA, RefusesEverySignatureButItsOwn) {
-  auto key = RSAPublicKey::fromDER(derOf(_key.get(), i2d_PUBKEY));
+TEST(RSAPublicKey, RefusesEverySignatureButItsOwn) {
+  TestSigningKey signer;
+  auto key = RSAPublicKey::fromDER(signer.publicKeyInfo());
   ASSERT_TRUE(key);
-  auto signature = sign(_key.get(), EVP_sha1(), "payload");
+  auto signature = signer.sign("payload");
   EXPECT_FALSE(key->verifySHA1(sha1("payloaD"), signature));
   for (std::size_t at : {std::size_t{0}, signature.size() / 2, signature.size() - 1}) {
     auto broken = signature;
     broken[at] = static_cast<char>(broken[at] ^ 1);
     EXPECT_FALSE(key->verifySHA1(sha1("payload"), broken));
   }
-  EXPECT_FALSE(key->verifySHA1(sha1("payload"), ""));
-  EXPECT_FALSE(key->verifySHA1(sha1("payload"), signature.substr(1)));
-  EXPECT_FALSE(key->verifySHA1(sha1("payload"), signature + "x"));
-  EXPECT_FALSE(key->verifySHA1(sha1("payload"), sign(_key.get(), EVP_sha256(), "payload")));
-  Key other(EVP_RSA_gen(2048));
-  EXPECT_FALSE(key->verifySHA1(sha1("payload"), sign(other.get(), EVP_sha1(), "payload")));
+  for (const auto& other : {std::string(), signature.substr(1), signature + "x",
+                            signer.sign("payload", EVP_sha256()), TestSigningKey().sign("payload")}) {
+    EXPECT_FALSE(key->verifySHA1(sha1("payload"), other));
+  }
 }
 
-TEST_F(RSA, TakesNoOtherKeyAndNoRubbish) {
-  auto der = derOf(_key.get(), i2d_PUBKEY);
-  Key curve(EVP_EC_gen("P-256"));
+TEST(RSAPublicKey, TakesNoOtherKeyAndNoRubbish) {
+  auto der = TestSigningKey().publicKeyInfo();
+  TestSigningKey curve(EVP_EC_gen("P-256"));
   for (const auto& bytes : {std::string(), std::string("rubbish"), der.substr(0, der.size() - 1), der + "x",
-                            derOf(curve.get(), i2d_PUBKEY)}) {
+                            curve.publicKeyInfo()}) {
     EXPECT_FALSE(RSAPublicKey::fromDER(bytes));
   }
 }
 
 }  // namespace
-}  // namespace vesk
+}  // namespace vesk::test

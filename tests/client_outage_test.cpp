@@ -1,0 +1,206 @@
+#include <VeskReporting/VeskReporting.h>
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <future>
+#include <optional>
+
+#include "client/ReconnectPolicy.h"
+#include "tests/support/RecordingDaemon.h"
+#include "tests/support/TempDirectory.h"
+
+namespace vesk::test {
+namespace {
+
+using namespace std::chrono_literals;
+
+const Dictionary kSessionInfo{{kVeskReportingSessionInfoSessionID, 7U},
+                              {kVeskReportingSessionInfoClientType, 3}};
+
+class ClientOutage : public testing::Test {
+ protected:
+  ReportingOptions options() const {
+    ReportingOptions options;
+    options.socketPath = socket;
+    options.firstReconnectWait = 5ms;
+    options.lastReconnectWait = 20ms;
+    return options;
+  }
+
+  TempDirectory directory;
+  std::string socket = directory / "run/socket";
+  Record record;
+  std::optional<RecordingDaemon> daemon;
+};
+
+TEST_F(ClientOutage, SaysThatNoDaemonIsThere) {
+  auto noDrain = options();
+  noDrain.drainTime = 1min;  // the end of the session must not take it: there never was a daemon
+  VeskReporting session(noDrain);
+  auto connected = session.connect();
+  EXPECT_EQ(connected.status, ReportingStatus::NotConnected);
+  EXPECT_EQ(connected.detail, socket + ": No such file or directory");
+  EXPECT_EQ(session.fetchDisplayURL(10ms).status, ReportingStatus::NotConnected);
+  EXPECT_FALSE(session.isConnected());
+  EXPECT_EQ(session.sendMessage(1, 1), ReportingStatus::Queued);
+}
+
+TEST_F(ClientOutage, SendsInOrderWhatWasQueuedBeforeTheDaemonWasThere) {
+  VeskReporting session(options());
+  EXPECT_FALSE(session.connect());
+  EXPECT_EQ(session.setSessionInfo(kSessionInfo), ReportingStatus::Queued);
+  for (std::uint16_t i = 0; i < 100; ++i) EXPECT_EQ(session.sendMessage(1, i), ReportingStatus::Queued);
+  daemon.emplace(socket, record);
+  EXPECT_TRUE(session.flushMessagesAndWait());
+  auto lines = record.lines();
+  ASSERT_EQ(lines.size(), 102U);
+  EXPECT_TRUE(lines[0].starts_with("setSessionInfo"));
+  for (int i = 0; i < 100; ++i) {
+    EXPECT_EQ(lines[static_cast<std::size_t>(i) + 1], "message 1 " + std::to_string(i) + " none");
+  }
+}
+
+TEST_F(ClientOutage, ConfiguresAndStartsAgainBeforeItSendsWhatIsQueued) {
+  const Dictionary user{{kVeskReportingUserInfoClientName, "second"}};
+  daemon.emplace(socket, record);
+  VeskReporting session(options());
+  EXPECT_EQ(session.setSessionInfo(kSessionInfo, Dictionary{{kVeskReportingUserInfoClientName, "first"}}),
+            ReportingStatus::Queued);
+  EXPECT_TRUE(session.startConfig());
+  EXPECT_TRUE(session.fetchStates(user));
+
+  for (int restart = 1; restart <= 3; ++restart) {
+    daemon.reset();
+    std::size_t before = record.lines().size();
+    EXPECT_EQ(session.sendMessage(9, static_cast<std::uint16_t>(restart)), ReportingStatus::Queued);
+    daemon.emplace(socket, record);
+    ASSERT_TRUE(record.waitForLine("message 9 " + std::to_string(restart)));
+    auto lines = record.lines();
+    ASSERT_EQ(lines.size(), before + 3);
+    EXPECT_EQ(lines[before], "setSessionInfo " + describe(kSessionInfo) + " " + describe(user) + " []");
+    EXPECT_EQ(lines[before + 1], "startConfig");
+  }
+}
+
+TEST_F(ClientOutage, ReturnsToTheDaemonWithoutBeingAsked) {
+  daemon.emplace(socket, record);
+  VeskReporting session(options());
+  EXPECT_EQ(session.setSessionInfo(kSessionInfo), ReportingStatus::Queued);
+  EXPECT_TRUE(session.startConfig());
+  daemon.reset();
+  daemon.emplace(socket, record);
+  EXPECT_TRUE(record.waitForCount("startConfig", 2));
+}
+
+TEST_F(ClientOutage, EndsTheCallsThatALostDaemonOwes) {
+  record.holdsAnswers = true;
+  daemon.emplace(socket, record);
+  VeskReporting session(options());
+  auto answer = std::async(std::launch::async, [&] { return session.fetchDisplayURL(); });
+  ASSERT_TRUE(record.waitForLine("fetchDisplayURL"));
+  daemon.reset();
+  EXPECT_EQ(answer.get().status, ReportingStatus::NotConnected);
+}
+
+TEST_F(ClientOutage, DropsAndCountsWhatDoesNotFit) {
+  struct Case {
+    const char* what;
+    std::size_t messages, bytes, fitting;
+  };
+  const Dictionary payload{{"k", std::string(1000, 'x')}};
+  for (const Case& c :
+       {Case{"count", 10, 1'000'000, 10}, Case{"memory", 1000, 5'000, 3}, Case{"one always", 10, 1, 1}}) {
+    SCOPED_TRACE(c.what);
+    auto bounded = options();
+    bounded.maximumQueuedMessages = c.messages;
+    bounded.maximumQueuedBytes = c.bytes;
+    VeskReporting session(bounded);
+    std::size_t queued = 0;
+    for (int i = 0; i < 20; ++i)
+      queued += session.sendMessage(1, 1, payload) == ReportingStatus::Queued ? 1 : 0;
+    EXPECT_EQ(queued, c.fitting);
+    EXPECT_EQ(session.droppedMessages(), 20 - c.fitting);
+    EXPECT_EQ(session.drops().queueFull, 20 - c.fitting);
+  }
+}
+
+TEST_F(ClientOutage, HasRoomAgainOnceTheDaemonTookWhatWaited) {
+  auto bounded = options();
+  bounded.maximumQueuedMessages = 2;
+  VeskReporting session(bounded);
+  EXPECT_EQ(session.sendMessage(1, 1), ReportingStatus::Queued);
+  EXPECT_EQ(session.sendMessage(1, 2), ReportingStatus::Queued);
+  EXPECT_EQ(session.sendMessage(1, 3), ReportingStatus::QueueFull);
+  daemon.emplace(socket, record);
+  ASSERT_TRUE(record.waitForCount("message", 2));
+  auto sent = session.flushMessagesAndWait();
+  for (int i = 0; i < 100 && sent.status == ReportingStatus::QueueFull; ++i) {
+    ASSERT_TRUE(session.connect());  // a round through the session's thread
+    sent = session.flushMessagesAndWait();
+  }
+  EXPECT_EQ(sent.answer, "posted all");
+}
+
+TEST_F(ClientOutage, WaitsAtItsEndForADaemonThatItKnew) {
+  daemon.emplace(socket, record);
+  auto patient = options();
+  patient.drainTime = 1min;
+  std::future<void> back;
+  {
+    VeskReporting session(patient);
+    ASSERT_TRUE(session.connect());
+    daemon.reset();
+    EXPECT_EQ(session.sendMessage(4, 2), ReportingStatus::Queued);
+    back = std::async(std::launch::async, [&] { daemon.emplace(socket, record); });
+  }
+  back.get();
+  EXPECT_EQ(record.count("message 4 2"), 1U);
+}
+
+TEST_F(ClientOutage, AForkedProcessIsRefusedAndHarmsNothing) {
+  daemon.emplace(socket, record);
+  auto session = std::make_unique<VeskReporting>(options());
+  ASSERT_TRUE(session->connect());
+  pid_t child = ::fork();
+  if (child == 0) {
+    bool isRefused = session->sendMessage(6, 6) == ReportingStatus::ForkedProcess &&
+                     session->fetchDisplayURL().status == ReportingStatus::ForkedProcess &&
+                     session->connect().status == ReportingStatus::ForkedProcess;
+    session.reset();
+    // A session of its own is none of the parent's business.
+    VeskReporting own(options());
+    bool isServed = own.sendMessageAndWait(8, 8).status == ReportingStatus::Done;
+    ::_exit(isRefused && isServed ? 0 : 1);
+  }
+  int status = -1;
+  ASSERT_EQ(::waitpid(child, &status, 0), child);
+  EXPECT_EQ(status, 0);
+  EXPECT_EQ(session->sendMessageAndWait(7, 7).answer, "posted");
+  EXPECT_EQ(record.count("message 6 6"), 0U);
+  EXPECT_EQ(record.count("message 8 8"), 1U);
+}
+
+TEST(ReconnectPolicy, WaitsTwiceAsLongAfterEachFailureAndAllowsOneEarlyAttemptAWait) {
+  using Time = ReconnectPolicy::Time;
+  ReconnectPolicy policy(50ms, 150ms);
+  Time now{1h};
+  EXPECT_LE(policy.due(), now);
+  for (auto wait : {50ms, 100ms, 150ms, 150ms}) {
+    policy.failed(now);
+    EXPECT_EQ(policy.due(), now + wait);
+    EXPECT_TRUE(policy.mayTryEarly());
+    policy.triedEarly();
+    policy.failed(now + 1ms);
+    EXPECT_EQ(policy.due(), now + wait) << "an early attempt must not prolong the wait";
+    EXPECT_FALSE(policy.mayTryEarly());
+    now = policy.due();
+  }
+  policy.succeeded();
+  EXPECT_LE(policy.due(), now);
+  policy.failed(now);
+  EXPECT_EQ(policy.due(), now + 50ms);
+}
+
+}  // namespace
+}  // namespace vesk::test

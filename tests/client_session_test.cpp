@@ -1,0 +1,227 @@
+#include <VeskReporting/VeskReporting.h>
+#include <gtest/gtest.h>
+
+#include <future>
+
+#include "tests/support/RecordingDaemon.h"
+#include "tests/support/TempDirectory.h"
+
+namespace vesk::test {
+namespace {
+
+using namespace std::chrono_literals;
+
+const Dictionary kSessionInfo{{kVeskReportingSessionInfoSessionID, 7U},
+                              {kVeskReportingSessionInfoClientType, 3}};
+const Dictionary kUserInfo{{kVeskReportingUserInfoClientName, "tester"}};
+
+class ClientSession : public testing::Test {
+ protected:
+  ReportingOptions options() const {
+    ReportingOptions options;
+    options.socketPath = socket;
+    options.firstReconnectWait = 5ms;
+    options.lastReconnectWait = 20ms;
+    return options;
+  }
+
+  TempDirectory directory;
+  std::string socket = directory / "run/socket";
+  Record record;
+  RecordingDaemon daemon{socket, record};
+};
+
+/// A callback that fulfils a future.
+template <class Answer>
+struct Caught {
+  std::promise<ReportingResult<Answer>> promise;
+  std::future<ReportingResult<Answer>> future = promise.get_future();
+
+  ReportingCallback<Answer> callback() {
+    return [this](ReportingResult<Answer> result) { promise.set_value(std::move(result)); };
+  }
+  ReportingResult<Answer> get() {
+    if (future.wait_for(1min) != std::future_status::ready)
+      return {ReportingStatus::OutOfResources, {}, "never called"};
+    return future.get();
+  }
+};
+
+TEST_F(ClientSession, TellsTheDaemonEveryOperationAndGetsItsAnswers) {
+  auto file = directory.write("some file.txt", "contents");
+  VeskReporting session(options());
+  EXPECT_EQ(session.setSessionInfo(kSessionInfo, kUserInfo, {"Calls", "Media"}), ReportingStatus::Queued);
+  EXPECT_EQ(session.startConfig().answer, (BackendNames{"httpPost", "wren"}));
+  EXPECT_EQ(session.fetchStates(kUserInfo).answer, (BackendNames{"httpPost", "wren"}));
+  EXPECT_EQ(session.fetchDisplayURL().answer, "https://display.example/");
+  EXPECT_EQ(session.sendMessageAndWait(1, 2, Dictionary{{"k", "v"}}).answer, "posted");
+  auto silent = session.sendMessageAndWait(Dictionary{{"category", 5}});
+  EXPECT_EQ(silent.status, ReportingStatus::Done);
+  EXPECT_EQ(silent.answer, std::nullopt);
+  EXPECT_EQ(session.flushMessagesAndWait().answer, "posted all");
+  EXPECT_TRUE(session.uploadFile(file).answer);
+  EXPECT_TRUE(session.uploadLogData({"line", 2}).answer);
+  EXPECT_EQ(session.sendMessageOnceAndWait(kSessionInfo, std::nullopt, 3, 4).answer, "finished");
+
+  const std::string info = describe(kSessionInfo), user = describe(kUserInfo);
+  EXPECT_EQ(record.lines(),
+            (std::vector<std::string>{
+                "setSessionInfo " + info + " " + user + " [\"Calls\", \"Media\"]", "startConfig",
+                "fetchStates " + user, "fetchDisplayURL", "message 1 2 {\"k\": \"v\"}",
+                "parameters {\"category\": 5}", "flush",
+                "uploadFile file://" + directory.path().string() + "/some%20file.txt contents",
+                "uploadLogData [\"line\", 2]", "messageOnce " + info + " none 3 4 none"}));
+}
+
+TEST_F(ClientSession, AnswersThroughCallbacksInTheOrderOfTheCalls) {
+  auto file = directory.write("file", "contents");
+  Caught<BackendNamesAnswer> started, states;
+  Caught<std::string> url, once;
+  Caught<MessageAnswer> message, parameters, flushed;
+  Caught<bool> uploaded, logged;
+  VeskReporting session(options());
+  for (auto status :
+       {session.startConfig(started.callback()), session.fetchStates(std::nullopt, states.callback()),
+        session.fetchDisplayURL(url.callback()), session.sendMessage(1, 2, std::nullopt, message.callback()),
+        session.sendMessage(Dictionary{{"type", 1}}, parameters.callback()),
+        session.flushMessages(flushed.callback()), session.uploadFile(file, uploaded.callback()),
+        session.uploadLogData({}, logged.callback()),
+        session.sendMessageOnce(kSessionInfo, kUserInfo, 1, 2, std::nullopt, once.callback())}) {
+    EXPECT_EQ(status, ReportingStatus::Queued);
+  }
+  EXPECT_EQ(once.get().answer, "finished");
+  EXPECT_EQ(started.get().answer, record.backends);
+  EXPECT_EQ(states.get().answer, record.backends);
+  EXPECT_EQ(url.get().answer, "https://display.example/");
+  EXPECT_EQ(message.get().answer, "posted");
+  EXPECT_EQ(parameters.get().answer, std::nullopt);
+  EXPECT_EQ(flushed.get().answer, "posted all");
+  EXPECT_TRUE(uploaded.get().answer);
+  EXPECT_TRUE(logged.get().answer);
+}
+
+TEST_F(ClientSession, TellsNoStorebagFromNoEnabledBackend) {
+  VeskReporting session(options());
+  record.backends = std::nullopt;
+  EXPECT_EQ(session.startConfig().answer, std::nullopt);
+  record.backends = BackendNames{};
+  EXPECT_EQ(session.startConfig().answer, BackendNames{});
+}
+
+TEST_F(ClientSession, HandsAggregatedMessagesToTheHandler) {
+  std::promise<AggregatedMessage> first, closing;
+  VeskReporting session(options());
+  auto handler = [&](const AggregatedMessage& message) {
+    (message.isClosing() ? closing : first).set_value(message);
+    if (message.isClosing()) throw std::runtime_error("handlers should not");
+  };
+  EXPECT_EQ(session.setSessionInfo(kSessionInfo, std::nullopt, {}, handler), ReportingStatus::Queued);
+  EXPECT_TRUE(session.startConfig());
+  EXPECT_TRUE(record.lines().front().ends_with(" aggregating"));
+
+  daemon.sendToClient(kSessionInfo, 12.5, 3, 4, Dictionary{{"k", 1}});
+  daemon.sendToClient(std::nullopt, 0, 0, 0, std::nullopt);
+  auto message = first.get_future().get();
+  EXPECT_EQ(message.sessionInfo, kSessionInfo);
+  EXPECT_EQ(message.timestamp, 12.5);
+  EXPECT_EQ(message.category, 3);
+  EXPECT_EQ(message.type, 4);
+  EXPECT_EQ(message.payload, (Dictionary{{"k", 1}}));
+  EXPECT_FALSE(closing.get_future().get().sessionInfo);
+  EXPECT_TRUE(session.startConfig()) << "an exception ended the session";
+}
+
+TEST_F(ClientSession, CallbacksMayUseTheSessionButNotWait) {
+  Caught<ReportingStatus> inner;
+  VeskReporting session(options());
+  EXPECT_EQ(session.startConfig([&](const auto&) {
+    auto sent = session.sendMessage(1, 1);
+    auto waited = session.fetchDisplayURL().status;
+    inner.promise.set_value({sent, waited, {}});
+  }),
+            ReportingStatus::Queued);
+  auto result = inner.get();
+  EXPECT_EQ(result.status, ReportingStatus::Queued);
+  EXPECT_EQ(result.answer, ReportingStatus::OnSessionThread);
+  EXPECT_TRUE(record.waitForLine("message 1 1"));
+}
+
+TEST_F(ClientSession, TellsWhyThereIsNoAnswer) {
+  VeskReporting session(options());
+  record.abandonsAnswers = true;
+  EXPECT_EQ(session.fetchDisplayURL().status, ReportingStatus::Refused);
+  record.abandonsAnswers = false;
+  record.holdsAnswers = true;
+  EXPECT_EQ(session.fetchDisplayURL(20ms).status, ReportingStatus::TimedOut);
+  Caught<std::string> late;
+  EXPECT_EQ(session.fetchDisplayURL(late.callback(), 20ms), ReportingStatus::Queued);
+  EXPECT_EQ(late.get().status, ReportingStatus::TimedOut);
+  record.release();
+  EXPECT_EQ(session.drops().total(), 0U);
+}
+
+TEST_F(ClientSession, RefusesWhatCannotBeSentAndGoesOn) {
+  VeskReporting session(options());
+  EXPECT_EQ(session.sendMessageAndWait(1, 1, Dictionary{{"k", std::string(2'000'000, 'x')}}).status,
+            ReportingStatus::InvalidArgument);
+  EXPECT_EQ(session.sendMessage(1, 1, Dictionary{{"k", "\xff"}}), ReportingStatus::Queued);
+  EXPECT_EQ(session.sendMessageAndWait(1, 2).answer, "posted");
+  EXPECT_EQ(session.drops().invalid, 2U);
+  EXPECT_EQ(session.uploadFile(directory / "missing").status, ReportingStatus::FileUnavailable);
+  EXPECT_EQ(session.uploadFile(directory.path()).detail, "Is a directory");
+}
+
+TEST_F(ClientSession, ManyThreadsSendThroughOneSession) {
+  constexpr int kThreads = 8, kMessages = 200;
+  {
+    VeskReporting session(options());
+    std::vector<std::thread> threads;
+    for (int thread = 0; thread < kThreads; ++thread) {
+      threads.emplace_back([&session, thread] {
+        for (int i = 0; i < kMessages; ++i) {
+          EXPECT_EQ(session.sendMessage(static_cast<std::uint16_t>(thread), static_cast<std::uint16_t>(i)),
+                    ReportingStatus::Queued);
+        }
+      });
+    }
+    for (auto& thread : threads) thread.join();
+  }
+  std::vector<int> next(kThreads);
+  for (const std::string& line : record.lines()) {
+    int thread = 0, number = 0;
+    ASSERT_EQ(std::sscanf(line.c_str(), "message %d %d", &thread, &number), 2) << line;
+    EXPECT_EQ(number, next[static_cast<std::size_t>(thread)]++);
+  }
+  EXPECT_EQ(next, std::vector<int>(kThreads, kMessages));
+}
+
+TEST_F(ClientSession, TheEndOfASessionSendsWhatIsQueuedAndCollectsItsAnswers) {
+  constexpr std::uint16_t kMessages = 1000;
+  int answers = 0;
+  {
+    VeskReporting session(options());
+    for (std::uint16_t i = 0; i < kMessages; ++i) {
+      EXPECT_EQ(session.sendMessage(i, 0), ReportingStatus::Queued);
+      EXPECT_EQ(session.sendMessage(i, 1, std::nullopt, [&](auto result) { answers += result ? 1 : 0; }),
+                ReportingStatus::Queued);
+    }
+  }
+  EXPECT_EQ(answers, kMessages);
+  EXPECT_EQ(record.lines().size(), 2U * kMessages);
+}
+
+TEST_F(ClientSession, TheEndOfASessionDoesNotWaitForAnAnswerLongerThanItsTime) {
+  record.holdsAnswers = true;
+  Caught<std::string> owed;
+  {
+    auto shortDrain = options();
+    shortDrain.drainTime = 20ms;
+    VeskReporting session(shortDrain);
+    EXPECT_EQ(session.fetchDisplayURL(owed.callback()), ReportingStatus::Queued);
+    ASSERT_TRUE(record.waitForLine("fetchDisplayURL"));
+  }
+  EXPECT_EQ(owed.get().status, ReportingStatus::Closed);
+}
+
+}  // namespace
+}  // namespace vesk::test

@@ -1,0 +1,273 @@
+#include <gtest/gtest.h>
+#include <utime.h>
+#include <zlib.h>
+
+#include "tests/support/TempDirectory.h"
+#include "tools/collector/ControlEndpoint.h"
+#include "tools/collector/EventsEndpoint.h"
+#include "tools/collector/HTTPDate.h"
+#include "tools/collector/StorebagEndpoint.h"
+#include "tools/json/JSONReader.h"
+#include "tools/storebag/StorebagDocument.h"
+
+namespace vesk {
+namespace {
+
+using test::TempDirectory;
+
+std::string gzip(const std::string& text) {
+  z_stream stream{};
+  deflateInit2(&stream, Z_DEFAULT_COMPRESSION, Z_DEFLATED, 16 + MAX_WBITS, 8, Z_DEFAULT_STRATEGY);
+  std::string out(deflateBound(&stream, text.size()), '\0');
+  stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(text.data()));
+  stream.avail_in = static_cast<uInt>(text.size());
+  stream.next_out = reinterpret_cast<Bytef*>(out.data());
+  stream.avail_out = static_cast<uInt>(out.size());
+  EXPECT_EQ(deflate(&stream, Z_FINISH), Z_STREAM_END);
+  out.resize(stream.total_out);
+  deflateEnd(&stream);
+  return out;
+}
+
+HTTPReceived request(std::string method, std::string target, HTTPHeaderList headers = {},
+                     std::string body = {}) {
+  return {std::move(method), std::move(target), std::move(headers), std::move(body), "127.0.0.1:1", 1};
+}
+
+constexpr char kGoodBody[] =
+    R"({"postTime":1795555743.25,"clientId":"c","events":[{"_method":3,"_status":2,"user":"a\nb","n":1.5}]})";
+
+HTTPReceived post(std::string body = kGoodBody, const HTTPHeaderList& replaced = {}) {
+  HTTPHeaderList headers{{"X-Vesk-Sender", "HD"},
+                         {"Accept", "application/json"},
+                         {"Content-Type", "application/json"},
+                         {"Content-Length", std::to_string(body.size())}};
+  for (const auto& [name, value] : replaced) {
+    std::erase_if(headers, [&, &header = name](const auto& entry) { return entry.first == header; });
+    if (value != "absent") headers.emplace_back(name, value);
+  }
+  return request("POST", "/events/realtime", std::move(headers), std::move(body));
+}
+
+class CollectorEndpoints : public ::testing::Test {
+ protected:
+  std::vector<Value> savedLines() const {
+    std::vector<Value> lines;
+    std::istringstream in(_files.read("events.jsonl"));
+    for (std::string line; std::getline(in, line);) lines.push_back(parseJSON(line).value.value());
+    return lines;
+  }
+
+  TempDirectory _files;
+  Console _console{Console::Style::Readable};
+  CollectorStats _stats;
+  FaultPlan _faults;
+  EventsEndpoint _events{{_console, _stats, _faults}, _files / "events.jsonl"};
+};
+
+TEST_F(CollectorEndpoints, TakeAGoodPostAndSaveEachEventWithItsHeaders) {
+  std::string two = R"({"postTime":1,"clientId":"c","events":[{"a":"1"},{"b":true,"c":-2}]})";
+  EXPECT_EQ(_events.answer(post(kGoodBody, {{"X-Vesk-Event-Map", "3 2"}})).status, 200U);
+  EXPECT_EQ(
+      _events.answer(post(gzip(two), {{"Content-Encoding", "gzip"}, {"X-Vesk-Client-Name", "\xff"}})).status,
+      200U);
+  auto lines = savedLines();
+  ASSERT_EQ(lines.size(), 3U);
+  auto event = lines[0].dictionary()->dictionary("event");
+  EXPECT_EQ(event->text("user"), "a\nb");
+  EXPECT_EQ(doubleForKey(*lines[0].dictionary(), "postTime"), 1795555743.25);
+  EXPECT_EQ(lines[0].dictionary()->dictionary("headers")->text("X-Vesk-Event-Map"), "3 2");
+  EXPECT_EQ(lines[2].dictionary()->dictionary("headers")->text("X-Vesk-Client-Name"), "?");
+  EXPECT_EQ(integerForKey(*lines[2].dictionary()->dictionary("event"), "c"), -2);
+  EXPECT_EQ(_stats.posts, 2U);
+  EXPECT_EQ(_stats.events, 3U);
+}
+
+TEST_F(CollectorEndpoints, RefuseWhatIsNoPostAndSaveNothing) {
+  const struct {
+    const char* name;
+    HTTPReceived received;
+    unsigned status;
+    const char* reason;
+  } cases[] = {
+      {"method", request("GET", "/events"), 405, "must be POST"},
+      {"no media type", post(kGoodBody, {{"Content-Type", "absent"}}), 400, "Content-Type is missing"},
+      {"media type", post(kGoodBody, {{"Content-Type", "text/plain"}}), 400, "not 'text/plain'"},
+      {"accept", post(kGoodBody, {{"Accept", "*/*"}}), 400, "Accept must be application/json"},
+      {"length", post(kGoodBody, {{"Content-Length", "absent"}}), 400, "Content-Length is missing"},
+      {"encoding", post(kGoodBody, {{"Content-Encoding", "br"}}), 400, "neither gzip"},
+      {"no gzip", post(kGoodBody, {{"Content-Encoding", "gzip"}}), 400, "no whole gzip stream"},
+      {"gzip cut", post(gzip(kGoodBody).substr(0, 40), {{"Content-Encoding", "gzip"}}), 400, "no whole gzip"},
+      {"gzip and more", post(gzip(kGoodBody) + "x", {{"Content-Encoding", "gzip"}}), 400, "bytes follow"},
+      {"gzip bomb",
+       post(gzip(std::string(65'000'000, ' ')) + gzip(std::string(65'000'000, ' ')),
+            {{"Content-Encoding", "gzip"}}),
+       400, "bytes follow"},
+      {"bomb", post(gzip(std::string(70'000'000, ' ')), {{"Content-Encoding", "gzip"}}), 400, "more than"},
+      {"sender", post(kGoodBody, {{"X-Vesk-Sender", "hd"}}), 400, "X-Vesk-Sender"},
+      {"build", post(kGoodBody, {{"X-Vesk-Internal-Build", "0"}}), 400, "X-Vesk-Internal-Build must be 1"},
+      {"map", post(kGoodBody, {{"X-Vesk-Event-Map", "3,2"}}), 400, "X-Vesk-Event-Map must be two numbers"},
+      {"map of many",
+       post(R"({"postTime":1,"clientId":"c","events":[{},{}]})", {{"X-Vesk-Event-Map", "3 2"}}), 400,
+       "a post of 2 events"},
+      {"empty", post(""), 400, "no JSON"},
+      {"JSON cut", post(std::string(kGoodBody).substr(0, 60)), 400, "no JSON"},
+      {"more than JSON", post(std::string(kGoodBody) + "{}"), 400, "no JSON"},
+      {"deep", post(std::string(100, '[')), 400, "no JSON"},
+      {"array", post("[]"), 400, "must be a JSON object"},
+      {"no time", post(R"({"clientId":"c","events":[{}]})"), 400, "number postTime"},
+      {"time", post(R"({"postTime":"1","clientId":"c","events":[{}]})"), 400, "number postTime"},
+      {"client", post(R"({"postTime":1,"clientId":7,"events":[{}]})"), 400, "text clientId"},
+      {"no events", post(R"({"postTime":1,"clientId":"c"})"), 400, "array events"},
+      {"empty events", post(R"({"postTime":1,"clientId":"c","events":[]})"), 400, "one event at least"},
+      {"event", post(R"({"postTime":1,"clientId":"c","events":[{},3]})"), 400, "events[1] must be an object"},
+      {"nested", post(R"({"postTime":1,"clientId":"c","events":[{"a":{}}]})"), 400, "events[0].a must be"},
+      {"null", post(R"({"postTime":1,"clientId":"c","events":[{"a":null}]})"), 400, "events[0].a must be"},
+      {"further key", post(R"({"postTime":1,"clientId":"c","events":[{}],"x":1})"), 400, "unknown key 'x'"},
+  };
+  for (const auto& test : cases) {
+    HTTPAnswer answer = _events.answer(test.received);
+    EXPECT_EQ(answer.status, test.status) << test.name;
+    EXPECT_NE(answer.body.find(test.reason), std::string::npos) << test.name << ": " << answer.body;
+  }
+  EXPECT_EQ(_stats.refused, std::size(cases));
+  EXPECT_EQ(_files.read("events.jsonl"), "");
+}
+
+TEST_F(CollectorEndpoints, CountEventsThatCanNotBeSaved) {
+  EventsEndpoint events({_console, _stats, _faults}, _files / "no/such/directory");
+  EXPECT_EQ(events.answer(post()).status, 200U);
+  EXPECT_EQ(_stats.eventsNotSaved, 1U);
+}
+
+TEST_F(CollectorEndpoints, GiveFaultsInTheirOrderAndAsOftenAsAsked) {
+  for (const char* bad : {"", "post", "post=", "past=500", "post=700", "post=500*0", "post=500*x",
+                          "post=bad-signature", "post=answer="})
+    EXPECT_TRUE(_faults.add(bad)) << bad;
+  for (const char* good : {"post=503*2", "post=answer=204*1", "post=slow*1", "post=reset"})
+    EXPECT_FALSE(_faults.add(good)) << good;
+  const std::tuple<unsigned, HTTPAnswer::Fault, std::size_t> expected[] = {
+      {503, HTTPAnswer::Fault::None, 0},
+      {503, HTTPAnswer::Fault::None, 0},
+      {204, HTTPAnswer::Fault::None, 1},
+      {200, HTTPAnswer::Fault::SlowBody, 2},
+      {200, HTTPAnswer::Fault::ResetBeforeAnswer, 2},
+      {200, HTTPAnswer::Fault::ResetBeforeAnswer, 2},
+  };
+  for (const auto& [status, fault, taken] : expected) {
+    HTTPAnswer answer = _events.answer(post());
+    EXPECT_EQ(answer.status, status);
+    EXPECT_EQ(answer.fault, fault);
+    EXPECT_EQ(_stats.posts, taken);
+  }
+  EXPECT_FALSE(_faults.add("post=none"));
+  EXPECT_EQ(_events.answer(post()).fault, HTTPAnswer::Fault::None);
+  EXPECT_EQ(_stats.faults, 6U);
+}
+
+TEST_F(CollectorEndpoints, AreSteeredAndCountedOverTheControlPath) {
+  ControlEndpoint control(_console, _stats, _faults);
+  EXPECT_EQ(control.answer(request("POST", "/_control/fault", {}, "post=500*1\r\n\nstorebag=stall\n")).body,
+            "[\"post=500*1\",\"storebag=stall\"]\n");
+  EXPECT_EQ(control.answer(request("POST", "/_control/fault", {}, "nonsense")).status, 400U);
+  EXPECT_EQ(_events.answer(post()).status, 500U);
+  EXPECT_EQ(control.answer(request("GET", "/_control/fault")).body, "[\"storebag=stall\"]\n");
+  EXPECT_EQ(control.answer(request("DELETE", "/_control/fault")).body, "[]\n");
+  EXPECT_EQ(control.answer(request("PUT", "/_control/fault")).status, 405U);
+  EXPECT_EQ(control.answer(request("GET", "/_control/other")).status, 404U);
+  auto counters = parseJSON(control.answer(request("GET", "/_control/stats")).body).value.value();
+  EXPECT_EQ(integerForKey(*counters.dictionary(), "faults"), 1);
+  EXPECT_EQ(integerForKey(*counters.dictionary(), "posts"), 0);
+}
+
+class StorebagServing : public CollectorEndpoints {
+ protected:
+  HTTPAnswer get(const std::string& path, const std::string& since = {}) {
+    HTTPHeaderList headers;
+    if (!since.empty()) headers.emplace_back("If-Modified-Since", since);
+    return _endpoint.answer(request("GET", path, headers));
+  }
+  StorebagVerdict verdictOn(const HTTPAnswer& answer) const {
+    return inspectStorebag(answer.body, _key.publicKeyDER()).verdict;
+  }
+  void writeVersion(const std::string& version, std::time_t modified) {
+    auto file = _files.write("zelko.toml", "version = '" + version + "'\n[release.wren]\nactive = true\n");
+    utimbuf times{modified, modified};
+    ASSERT_EQ(::utime(file.c_str(), &times), 0);
+  }
+
+  const SigningKey _key = SigningKey::generate();
+  StorebagFolder _folder{_files.path(), StorebagChecks::Strict};
+  StorebagEndpoint _endpoint{{_console, _stats, _faults, _folder, _key}, std::chrono::seconds(60)};
+};
+
+TEST_F(StorebagServing, SignsOnTheFlyAndAnswersConditionally) {
+  writeVersion("1", 1'795'552'289);
+  HTTPAnswer answer = get("/bags/sorrel/zelko?version=7.0");
+  EXPECT_EQ(answer.status, 200U);
+  EXPECT_EQ(verdictOn(answer), StorebagVerdict::Valid);
+  EXPECT_EQ(findHeader(answer.headers, "Last-Modified"), "Tue, 24 Nov 2026 20:31:29 GMT");
+  EXPECT_EQ(findHeader(answer.headers, "Cache-Control"), "max-age=60");
+
+  HTTPAnswer unchanged = get("/bags/sorrel/zelko", "Tue, 24 Nov 2026 20:31:29 GMT");
+  EXPECT_EQ(unchanged.status, 304U);
+  EXPECT_EQ(unchanged.body, "");
+  EXPECT_EQ(findHeader(unchanged.headers, "Last-Modified"), "Tue, 24 Nov 2026 20:31:29 GMT");
+  EXPECT_EQ(get("/bags/sorrel/zelko", "Tue, 24 Nov 2026 20:31:28 GMT").status, 200U);
+  EXPECT_EQ(get("/bags/sorrel/zelko", "yesterday").status, 200U);
+}
+
+TEST_F(StorebagServing, NeverGivesTwoVersionsOneDate) {
+  writeVersion("1", 1'795'552'289);
+  get("/bags/zelko");
+  writeVersion("1.1", 1'795'552'289);
+  EXPECT_EQ(findHeader(get("/bags/zelko").headers, "Last-Modified"), httpDate(1'795'552'290));
+  writeVersion("1", 1'795'550'000);
+  EXPECT_EQ(get("/bags/zelko", httpDate(1'795'552'290)).status, 200U);
+  EXPECT_EQ(findHeader(get("/bags/zelko").headers, "Last-Modified"), httpDate(1'795'552'291));
+}
+
+TEST_F(StorebagServing, RefusesNamesItDoesNotHaveAndSourcesWithMistakes) {
+  _files.write("../outside.toml", "version = '1'");
+  _files.write("bad.json", R"({"version": 1})");
+  _files.write("good.json", R"({"version": "1", "release": {}})");
+  for (const char* path :
+       {"/bags/zelko", "/bags/", "/bags/..%2foutside", "/bags/../outside", "/bags/good.json"})
+    EXPECT_EQ(get(path).status, 404U) << path;
+  std::filesystem::remove(_files / "../outside.toml");
+  HTTPAnswer bad = get("/bags/bad");
+  EXPECT_EQ(bad.status, 500U);
+  EXPECT_NE(bad.body.find("bad.json: version: must be a text"), std::string::npos);
+  EXPECT_EQ(verdictOn(get("/bags/good")), StorebagVerdict::Valid);
+  EXPECT_EQ(_endpoint.answer(request("POST", "/bags/good")).status, 405U);
+}
+
+TEST_F(StorebagServing, GivesItsFaults) {
+  writeVersion("1", 1'795'552'289);
+  for (const char* fault : {"storebag=bad-signature*1", "storebag=404*1", "storebag=empty-body*1"})
+    ASSERT_FALSE(_faults.add(fault));
+  EXPECT_EQ(verdictOn(get("/bags/zelko")), StorebagVerdict::SignatureMismatch);
+  EXPECT_EQ(get("/bags/zelko").status, 404U);
+  HTTPAnswer empty = get("/bags/zelko");
+  EXPECT_EQ(empty.status, 200U);
+  EXPECT_EQ(empty.body, "");
+  EXPECT_TRUE(findHeader(empty.headers, "Last-Modified"));
+  EXPECT_EQ(verdictOn(get("/bags/zelko")), StorebagVerdict::Valid);
+}
+
+TEST(HTTPDate, ReadsWhatItWritesAndNothingElse) {
+  EXPECT_EQ(timeFromHTTPDate(httpDate(1'795'552'289)), 1'795'552'289);
+  for (const char* text : {"", "Tue, 24 Nov 2026", "Tue, 24 Nov 2026 20:31:29 GMT x", "2026-11-24"})
+    EXPECT_FALSE(timeFromHTTPDate(text)) << text;
+}
+
+TEST(HTTPReceived, FindsPathAndQuery) {
+  auto received = request("GET", "/a/b?x=1&version=7.0&version=8&flag");
+  EXPECT_EQ(received.path(), "/a/b");
+  EXPECT_EQ(received.query("version"), "7.0");
+  EXPECT_EQ(received.query("flag"), "");
+  EXPECT_FALSE(received.query("b"));
+}
+
+}  // namespace
+}  // namespace vesk

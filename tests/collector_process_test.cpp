@@ -1,0 +1,130 @@
+#include <gtest/gtest.h>
+#include <signal.h>
+
+#include "tests/support/ChildProcess.h"
+#include "tests/support/TempDirectory.h"
+#include "tests/support/WebRequest.h"
+#include "tools/json/JSONReader.h"
+#include "tools/storebag/StorebagDocument.h"
+
+namespace vesk {
+namespace {
+
+using test::ChildProcess;
+using test::TempDirectory;
+using test::WebClient;
+
+const std::vector<std::string> kPostHeaders{"Accept: application/json", "Content-Type: application/json",
+                                            "X-Vesk-Sender: HD"};
+constexpr char kPost[] = R"({"postTime":1,"clientId":"c","events":[{"_method":3,"user":"mail"}]})";
+
+class CollectorProcess : public ::testing::Test {
+ protected:
+  ChildProcess::Options options(std::vector<std::string> further = {}) const {
+    ChildProcess::Options options;
+    options.command = {VESK_COLLECTOR,
+                       "--directory",
+                       (_files / "collector").string(),
+                       "--https-port",
+                       "0",
+                       "--http-port",
+                       "0",
+                       "--ready-file",
+                       (_files / "ready.json").string()};
+    options.command.insert(options.command.end(), further.begin(), further.end());
+    return options;
+  }
+  /// Waits until it listens and reads where.
+  void waitUntilReady() {
+    ASSERT_TRUE(test::waitForFile((_files / "ready.json").string()));
+    _facts = *parseJSON(_files.read("ready.json")).value.value().dictionary();
+  }
+  std::string fact(const char* key) const { return _facts.text(key).value().string(); }
+
+  TempDirectory _files;
+  Dictionary _facts;
+};
+
+TEST_F(CollectorProcess, ServesStorebagsTakesPostsAndEndsCleanly) {
+  _files.write("collector/storebags/zelko.toml", "version = '7'\n[release.wren]\nactive = true\n");
+  ChildProcess collector(options());
+  waitUntilReady();
+  WebClient client(fact("authorityFile"));
+
+  auto storebag = client.get(fact("storebagURL") + "/zelko?version=7.0");
+  EXPECT_EQ(storebag.status, 200);
+  auto inspection = inspectStorebag(storebag.body, _files.read("collector/publicKey.der"));
+  EXPECT_TRUE(inspection.isValid()) << explain(inspection.verdict);
+  auto again = client.get(fact("storebagURL") + "/zelko?version=7.0",
+                          {"If-Modified-Since: " + storebag.headers["last-modified"]});
+  EXPECT_EQ(again.status, 304);
+
+  EXPECT_EQ(client.post(fact("eventsURL"), kPost, kPostHeaders).status, 200);
+  EXPECT_EQ(client.post(fact("controlURL") + "/fault", "post=503*1").status, 200);
+  EXPECT_EQ(client.post(fact("eventsURL"), kPost, kPostHeaders).status, 503);
+  EXPECT_EQ(client.post(fact("eventsURL"), "{}").status, 400);
+  EXPECT_NE(client.get(fact("controlURL") + "/stats").body.find("\"events\":1,"), std::string::npos);
+
+  EXPECT_TRUE(collector.waitForText("user = \"mail\""));
+  EXPECT_TRUE(collector.waitForText("(400): the header Content-Type"));
+  collector.signal(SIGTERM);
+  EXPECT_EQ(collector.wait(), 0);
+  auto line = parseJSON(_files.read("collector/events.jsonl"));
+  ASSERT_TRUE(line.value) << line.error;
+  EXPECT_EQ(line.value->dictionary()->dictionary("event")->text("user"), "mail");
+}
+
+TEST_F(CollectorProcess, WritesOneJSONLineAnEventAndNothingElseOnItsOutput) {
+  ChildProcess collector(options({"--json", "--fault", "post=empty-body"}));
+  waitUntilReady();
+  EXPECT_EQ(WebClient(fact("authorityFile")).post(fact("eventsURL"), kPost, kPostHeaders).body, "");
+  EXPECT_TRUE(collector.waitForText("\"user\":\"mail\""));
+  collector.signal(SIGINT);
+  EXPECT_EQ(collector.wait(), 0);
+  auto line = parseJSON(collector.output());
+  ASSERT_TRUE(line.value) << line.error;
+  EXPECT_EQ(line.value->dictionary()->dictionary("headers")->text("X-Vesk-Sender"), "HD");
+}
+
+TEST_F(CollectorProcess, GoesOnWithoutAnOutputAndKeepsItsKeys) {
+  auto command = options();
+  command.outputClosed = true;
+  std::string authority;
+  for (int start = 0; start < 2; ++start) {
+    ChildProcess collector(command);
+    waitUntilReady();
+    EXPECT_EQ(WebClient(fact("authorityFile")).post(fact("eventsURL"), kPost, kPostHeaders).status, 200);
+    collector.signal(SIGTERM);
+    EXPECT_EQ(collector.wait(), 0) << collector.errors();
+    if (start == 1) EXPECT_EQ(_files.read("collector/ca.pem"), authority);
+    authority = _files.read("collector/ca.pem");
+    std::filesystem::remove(_files / "ready.json");
+  }
+}
+
+TEST_F(CollectorProcess, TellsUsageFromFailure) {
+  const struct {
+    std::vector<std::string> arguments;
+    int status;
+    const char* text;
+  } cases[] = {
+      {{"--help"}, 0, "--fault"},
+      {{"--version"}, 0, "veskcollector "},
+      {{"--no-such-option"}, 2, "--no-such-option"},
+      {{"--http-port", "70000"}, 2, "70000"},
+      {{"--fault", "post=often"}, 2, "unknown fault 'often'"},
+      {{"--address", "192.0.2.1"}, 1, "can't listen on 192.0.2.1"},
+      {{"--directory", "/proc/none"}, 1, "/proc/none"},
+  };
+  for (const auto& test : cases) {
+    auto command = options();
+    command.command.resize(3);
+    command.command.insert(command.command.end(), test.arguments.begin(), test.arguments.end());
+    ChildProcess collector(command);
+    EXPECT_EQ(collector.wait(), test.status) << test.text;
+    EXPECT_NE((collector.output() + collector.errors()).find(test.text), std::string::npos) << test.text;
+  }
+}
+
+}  // namespace
+}  // namespace vesk

@@ -1,0 +1,309 @@
+// The daemon's and the client's end of the IPC layer over real sockets: calls, answers, life cycle.
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <thread>
+
+#include "client/protocol/ClientSessionReplyProxy.h"
+#include "platform/ipc/ExtensionTokens.h"
+#include "platform/ipc/UnixSocket.h"
+#include "tests/support/IPCHarness.h"
+
+namespace vesk::test {
+namespace {
+
+using namespace std::chrono_literals;
+
+const std::optional<Dictionary> kAbsent;
+
+std::vector<IPCArgument> message(int number, const char* action = "") {
+  return {Dictionary{{"n", number}, {"do", action}}};
+}
+
+TEST(IPCConnection, ServesEveryMember) {
+  TestService service;
+  TestClient client(service);
+  const Dictionary info{{"id", 1}};
+  const std::optional<Dictionary> user = Dictionary{{"name", "x"}};
+  struct Case {
+    const char* member;
+    std::vector<IPCArgument> arguments;
+    const char* answer;
+    const char* journalled;
+  };
+  const Case cases[] = {
+      {"setSessionInfo",
+       {info, user, std::vector<std::string>{"f"}, true},
+       "done",
+       R"(setSessionInfo {"id": 1} {"name": "x"} ["f"] true)"},
+      {"startConfigWithCompletionHandler", {}, "one,two", "start"},
+      {"fetchStatesWithUserInfo", {kAbsent}, "absent", "fetchStates absent"},
+      {"fetchDisplayURL", {}, "https://display", "fetchDisplayURL"},
+      {"sendMessageWithCategory",
+       {std::uint16_t{5}, std::uint16_t{6}, user},
+       "absent",
+       R"(category 5 6 {"name": "x"})"},
+      {"sendMessageWithDictionary", message(7), "7", "message 7"},
+      {"flushMessagesWithReply", {}, "flushed", "flush"},
+      {"uploadFileAtPath", {std::string("file:///f"), IPCDescriptor{}}, "true", "upload file:///f "},
+      {"uploadLogData", {List{1, "two"}}, "false", R"(log [1, "two"])"},
+      {"sendMessageWithSessionInfo",
+       {info, kAbsent, std::uint16_t{1}, std::uint16_t{2}, kAbsent},
+       "finished",
+       R"(single {"id": 1} absent 1 2 absent)"},
+  };
+  for (const auto& test : cases) {
+    EXPECT_EQ(client.call(test.member, test.arguments), test.answer) << test.member;
+    EXPECT_EQ(service.journal.lines().back(), test.journalled);
+  }
+}
+
+TEST(IPCConnection, ServesPipelinedCallsInOrder) {
+  TestService service;
+  TestClient client(service);
+  for (int i = 0; i < 2000; ++i) client.post("sendMessageWithDictionary", message(i));
+  EXPECT_EQ(client.call("flushMessagesWithReply"), "flushed");
+  auto lines = service.journal.lines();
+  ASSERT_EQ(lines.size(), 2002u);
+  for (int i = 0; i < 2000; ++i)
+    ASSERT_EQ(lines[static_cast<std::size_t>(i) + 1], "message " + std::to_string(i));
+}
+
+TEST(IPCConnection, CallsTheClientInOrderFromAnyThread) {
+  TestService service;
+  TestClient client(service);
+  ASSERT_EQ(client.call("flushMessagesWithReply"), "flushed");
+  std::thread other([&] {
+    ClientSessionReplyProxy proxy(service.connection(),
+                                  [](const std::string& error) { ADD_FAILURE() << error; });
+    for (std::uint16_t i = 0; i < 100; ++i)
+      proxy.sendMessageToClient(Dictionary{{"i", i}}, 0.5, i, 9, std::nullopt);
+  });
+  EXPECT_TRUE(client.runUntil([&] { return client.received.size() == 100; }));
+  other.join();
+  EXPECT_EQ(client.received[0], R"(sendMessageToClient {"i": 0} 0.5 0 9 absent)");
+  EXPECT_EQ(client.received[99], R"(sendMessageToClient {"i": 99} 0.5 99 9 absent)");
+}
+
+TEST(IPCConnection, AnswersWhatCannotBeServedWithAnError) {
+  LogCapture log;
+  TestService service;
+  TestClient client(service);
+  EXPECT_EQ(client.call("sendMessageWithDictionary", message(1, "abandon")), "NoReply");
+  EXPECT_EQ(client.call("sendMessageWithDictionary", message(1, "throw")), "NoReply");
+  EXPECT_EQ(client.call("noSuchMember"), "UnknownMethod");
+  EXPECT_EQ(client.call("fetchDisplayURL", {true}), "InvalidArgs");
+  EXPECT_EQ(client.call("sendMessageWithDictionary", {List{}}), "InvalidArgs");
+  EXPECT_EQ(client.call("flushMessagesWithReply", {}, "com.corvane.Other"), "UnknownInterface");
+  EXPECT_EQ(client.call("flushMessagesWithReply"), "flushed") << "the connection goes on";
+  EXPECT_EQ(log.lines().count("3 ipc: connection"), 1u) << "the exception";
+}
+
+TEST(IPCConnection, DropsWrongOneWayCallsWithOneLineABurst) {
+  LogCapture log;
+  TestService service;
+  TestClient client(service);
+  for (int i = 0; i < 10; ++i) client.post("sendMessageWithDictionary", {true});
+  client.post("noSuchMember");
+  EXPECT_EQ(client.call("flushMessagesWithReply"), "flushed");
+  EXPECT_EQ(log.lines().count("4 "), 1u);
+  EXPECT_EQ(service.journal.count("message"), 0u);
+}
+
+TEST(IPCConnection, TakesAnAnswerFromAnotherThread) {
+  TestService service;
+  TestClient client(service);
+  std::thread other([&] {
+    ASSERT_TRUE(service.journal.waitFor("message 4"));
+    service.session()->kept(std::string("later"));
+  });
+  EXPECT_EQ(client.call("sendMessageWithDictionary", message(4, "keep")), "later");
+  other.join();
+}
+
+TEST(IPCConnection, TellsWhatThereIs) {
+  TestService service;
+  TestClient client(service);
+  EXPECT_EQ(client.call("Ping", {}, "org.freedesktop.DBus.Peer"), "done");
+  auto xml = client.call("Introspect", {}, "org.freedesktop.DBus.Introspectable");
+  for (const auto* member :
+       {&wire::kSetSessionInfo, &wire::kUploadFile, &wire::kSendMessageWithSessionInfo}) {
+    EXPECT_NE(xml.find(std::string("<method name=\"") + member->name + "\">"), std::string::npos) << xml;
+  }
+}
+
+TEST(IPCConnection, KeepsADescriptorUnderATokenThatIsGoodOnce) {
+  TestService service;
+  int pipe[2];
+  ASSERT_EQ(::pipe(pipe), 0);
+  FileDescriptor readEnd(pipe[0]);
+  FileDescriptor writeEnd(pipe[1]);
+  TestClient client(service);
+  client.post("sendMessageWithDictionary", message(1));
+  for (int i = 0; i < 2; ++i) {
+    EXPECT_EQ(client.call("uploadFileAtPath", {std::string("u"), IPCDescriptor{writeEnd.get()}}), "true");
+  }
+  auto lines = service.journal.lines();
+  auto tokenOf = [](const std::string& line) { return line.substr(line.rfind(' ') + 1); };
+  std::string first = tokenOf(lines[lines.size() - 2]);
+  std::string second = tokenOf(lines.back());
+  EXPECT_EQ(first.size(), 32u);
+  EXPECT_NE(first, second);
+
+  FileDescriptor consumed = ExtensionTokens::shared().consume(first);
+  ASSERT_TRUE(consumed);
+  EXPECT_EQ(::write(consumed.get(), "x", 1), 1);
+  char byte = 0;
+  EXPECT_EQ(::read(readEnd.get(), &byte, 1), 1);
+  EXPECT_FALSE(ExtensionTokens::shared().consume(first));
+
+  service.listener().stop();
+  EXPECT_FALSE(ExtensionTokens::shared().consume(second)) << "it went with the connection";
+}
+
+TEST(IPCConnection, HangingUpInvalidatesThenDestroys) {
+  TestService service;
+  {
+    TestClient client(service);
+    client.post("sendMessageWithDictionary", message(1));
+    EXPECT_TRUE(client.bus().flush(10s));
+  }
+  EXPECT_TRUE(service.journal.waitFor("destroyed"));
+  EXPECT_EQ(service.journal.lines(),
+            (std::vector<std::string>{"accepted", "message 1", "invalidated", "destroyed"}));
+}
+
+TEST(IPCConnection, ServesWhatAClientSentBeforeItLeftItsAnswersUnread) {
+  TestService service;
+  {
+    TestClient client(service);
+    ASSERT_EQ(client.call("flushMessagesWithReply"), "flushed");
+    for (int i = 0; i < 300; ++i) {
+      ASSERT_EQ(
+          client.bus().send(
+              {wire::kSessionInterface, "sendMessageWithDictionary", message(i)}, [](BusAnswer&) {}, 25s),
+          BusClient::SendResult::Sent);
+    }
+  }
+  EXPECT_TRUE(service.journal.waitFor("destroyed"));
+  EXPECT_EQ(service.journal.count("message"), 300u);
+}
+
+TEST(IPCConnection, MayBeInvalidatedFromItsOwnHandlerAndTwice) {
+  TestService service;
+  TestClient client(service);
+  auto connection = service.connection();
+  service.onInvalidation = [&] { connection->invalidate(); };
+  connection->invalidate();
+  connection->invalidate();
+  EXPECT_TRUE(client.runToEnd());
+  EXPECT_TRUE(service.journal.waitFor("destroyed"));
+  EXPECT_EQ(service.journal.count("invalidated"), 1u);
+  std::string error;
+  connection->callRemoteObject({"i.f", "m", {}}, [&](const std::string& text) { error = text; });
+  EXPECT_FALSE(error.empty());
+}
+
+TEST(IPCConnection, GivesTheClientTheLastWordOfASessionThatIsSentAway) {
+  TestService service;
+  TestClient client(service);
+  EXPECT_EQ(client.call("sendMessageWithDictionary", message(1, "farewell")), "1");
+  std::thread stopping([&] { service.listener().stop(); });
+  EXPECT_TRUE(client.runToEnd());
+  stopping.join();
+  EXPECT_EQ(client.received, (std::vector<std::string>{"sendMessageToClient absent 0 0 0 absent"}));
+  EXPECT_EQ(service.journal.lines().back(), "destroyed");
+}
+
+TEST(IPCConnection, TellsTheCallerOfACallThatCannotReachItsClient) {
+  TestService service;
+  {
+    TestClient client(service);
+    EXPECT_EQ(client.call("sendMessageWithDictionary", message(1, "farewell")), "1");
+  }
+  EXPECT_TRUE(service.journal.waitFor("lost: the connection has ended"));
+}
+
+TEST(IPCConnection, RunsNoHandlerWhenItIsNeverResumed) {
+  for (auto accept : {TestService::Accept::Refuse, TestService::Accept::NotResume}) {
+    TestService service;
+    service.accept = accept;
+    RawClient client(service);
+    EXPECT_TRUE(service.journal.waitFor("accepted"));
+    service.listener().stop();
+    EXPECT_TRUE(client.isClosed());
+    EXPECT_EQ(service.journal.count("destroyed"), 1u);
+    EXPECT_EQ(service.journal.count("invalidated"), 0u);
+    EXPECT_EQ(service.listener().connectionCount(), 0u);
+  }
+}
+
+std::size_t entriesOf(const char* directory) {
+  auto entries = std::filesystem::directory_iterator(directory);
+  return static_cast<std::size_t>(std::distance(begin(entries), end(entries)));
+}
+
+TEST(IPCListener, LeavesNeitherThreadNorDescriptorBehind) {
+  const std::size_t descriptors = entriesOf("/proc/self/fd");
+  const std::size_t threads = entriesOf("/proc/self/task");
+  {
+    TestService service;
+    std::vector<std::unique_ptr<TestClient>> clients;
+    for (int i = 0; i < 20; ++i) {
+      clients.push_back(std::make_unique<TestClient>(service));
+      EXPECT_EQ(clients.back()->call("uploadFileAtPath", {std::string("u"), IPCDescriptor{0}}), "true");
+    }
+    clients.resize(10);
+    EXPECT_TRUE(service.journal.waitFor("destroyed", 10));
+    service.listener().stop();
+    EXPECT_EQ(service.journal.count("destroyed"), 20u);
+    service.listener().stop();
+    for (auto& client : clients) EXPECT_TRUE(client->runToEnd());
+  }
+  EXPECT_EQ(entriesOf("/proc/self/fd"), descriptors);
+  EXPECT_EQ(entriesOf("/proc/self/task"), threads);
+}
+
+TEST(IPCListener, TakesOverAStaleSocketButNoLiveOne) {
+  TestService first;
+  auto samePath = [&](IPCListener::Options& options) { options.socketPath = first.path(); };
+  EXPECT_THROW(TestService second(samePath), std::system_error);
+  TestClient client(first);
+  EXPECT_EQ(client.call("flushMessagesWithReply"), "flushed");
+
+  // What a daemon that was killed leaves behind: a socket that nobody listens on.
+  const std::string stale = first.path() + ".stale";
+  {
+    UnixSocketAddress address(stale);
+    FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    ASSERT_EQ(::bind(socket.get(), address.get(), address.size()), 0);
+  }
+  {
+    TestService third([&](IPCListener::Options& options) { options.socketPath = stale; });
+    TestClient other(third);
+    EXPECT_EQ(other.call("flushMessagesWithReply"), "flushed");
+    EXPECT_EQ(std::filesystem::status(stale).permissions(), static_cast<std::filesystem::perms>(0666));
+  }
+  EXPECT_FALSE(std::filesystem::exists(stale));
+}
+
+TEST(IPCListener, ServesAnInheritedSocketAndAPathLongerThanAnAddress) {
+  char directory[] = "/tmp/vesk-ipc-XXXXXX";
+  ASSERT_TRUE(::mkdtemp(directory));
+  const std::string path = directory + std::string("/") + std::string(120, 'd') + "/socket";
+  {
+    TestService service([&](IPCListener::Options& options) {
+      options.socketPath = path;
+      options.inherited = listenOnUnixSocket(path);
+    });
+    TestClient client(service);
+    EXPECT_EQ(client.call("flushMessagesWithReply"), "flushed");
+  }
+  EXPECT_TRUE(std::filesystem::exists(path)) << "it is the service manager's";
+  std::filesystem::remove_all(directory);
+}
+
+}  // namespace
+}  // namespace vesk::test

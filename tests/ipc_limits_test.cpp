@@ -1,0 +1,309 @@
+// What clients that break the rules, or break, can do to the daemon and to others.
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <sys/socket.h>
+
+#include <cstring>
+#include <thread>
+
+#include "platform/ipc/BusReplies.h"
+#include "platform/ipc/ConnectionLoop.h"
+#include "platform/ipc/UnixSocket.h"
+#include "tests/support/IPCHarness.h"
+
+namespace vesk::test {
+namespace {
+
+using namespace std::chrono_literals;
+using namespace std::string_literals;
+
+std::vector<IPCArgument> message(int number) { return {Dictionary{{"n", number}}}; }
+
+std::string hexOf(const std::string& text) {
+  std::string hex;
+  for (unsigned char c : text) {
+    hex += "0123456789abcdef"[c >> 4];
+    hex += "0123456789abcdef"[c & 15];
+  }
+  return hex;
+}
+
+TEST(IPCLimits, ClosesWhatIsNoAuthentication) {
+  const std::string cases[] = {"GET / HTTP/1.1\r\n\r\n",
+                               "\0"s + std::string(100'000, 'x'),
+                               "\0"s + std::string(2000, 'x') + "\r\n",
+                               "\0BEGIN\r\n"s,
+                               "\0AUTH ANONYMOUS\r\nBEGIN\r\n"s,
+                               "\0"s + []() {
+                                 std::string lines;
+                                 for (int i = 0; i < 100; ++i) lines += "AUTH\r\n";
+                                 return lines;
+                               }()};
+  LogCapture log;
+  TestService service;
+  for (const auto& bytes : cases) {
+    RawClient client(service);
+    client.send(bytes);
+    EXPECT_TRUE(client.isClosed());
+  }
+  EXPECT_TRUE(service.journal.waitFor("destroyed", std::size(cases)));
+  EXPECT_EQ(service.journal.count("interrupted"), 0u);
+  EXPECT_EQ(log.lines().count("4 ipc: connection"), std::size(cases));
+}
+
+TEST(IPCLimits, LetsInOnlyWhoClaimsToBeHimself) {
+  TestService service;
+  const std::string me = std::to_string(::getuid());
+  RawClient liar(service);
+  liar.send("\0AUTH EXTERNAL "s + hexOf(std::to_string(::getuid() + 1)) + "\r\n");
+  EXPECT_EQ(liar.line(), "REJECTED");
+  liar.send("AUTH EXTERNAL\r\n");
+  EXPECT_EQ(liar.line(), "DATA");
+  liar.send("DATA " + hexOf("4294967295") + "\r\n");
+  EXPECT_EQ(liar.line(), "REJECTED");
+
+  RawClient honest(service);
+  honest.send("\0AUTH EXTERNAL "s + hexOf(me) + "\r\n");
+  EXPECT_EQ(honest.line().substr(0, 3), "OK ");
+}
+
+TEST(IPCLimits, ClosesWhoDoesNotAuthenticateInTime) {
+  LogCapture log;
+  TestService service([](IPCListener::Options& options) { options.authenticationTimeout = 50ms; });
+  RawClient silent(service);
+  RawClient slow(service);
+  slow.send("\0AUTH EXTERNAL\r\n"s);
+  EXPECT_TRUE(silent.isClosed());
+  EXPECT_TRUE(slow.isClosed());
+  EXPECT_TRUE(service.journal.waitFor("destroyed", 2));
+  EXPECT_EQ(log.lines().count("4 ipc: connection"), 2u);
+}
+
+TEST(IPCLimits, ClosesConnectionsInExcessWithOneLineABurst) {
+  struct Case {
+    std::size_t all;
+    std::size_t perUser;
+    const char* line;
+  };
+  for (const auto& test :
+       {Case{2, 256, "4 ipc: Refused a connection of user"}, Case{4096, 2, "4 ipc: Refused"}}) {
+    LogCapture log;
+    TestService service([&](IPCListener::Options& options) {
+      options.maximumConnections = test.all;
+      options.maximumConnectionsPerUser = test.perUser;
+    });
+    TestClient first(service);
+    auto second = std::make_unique<TestClient>(service);
+    EXPECT_EQ(second->call("flushMessagesWithReply"), "flushed");
+    for (int i = 0; i < 3; ++i) EXPECT_TRUE(RawClient(service).isClosed());
+    EXPECT_EQ(log.lines().count(test.line), 1u);
+    EXPECT_EQ(service.journal.count("accepted"), 2u);
+    EXPECT_EQ(first.call("flushMessagesWithReply"), "flushed");
+
+    second.reset();
+    EXPECT_TRUE(service.journal.waitFor("destroyed"));
+    while (service.listener().connectionCount() > 1) std::this_thread::yield();
+    TestClient third(service);
+    EXPECT_EQ(third.call("flushMessagesWithReply"), "flushed") << "room again";
+  }
+}
+
+constexpr std::size_t kMessage = std::size_t{1} << 20;
+
+TEST(IPCLimits, TakesMessagesUpToTheLimit) {
+  TestService service;
+  RawClient client(service);
+  client.authenticate();
+  // Content: dictionary and value at 8 bytes each, a key of one letter.
+  client.send(
+      RawClient::message("sendMessageWithDictionary", "a{sv}", RawClient::bytesDictionary(kMessage - 17)));
+  EXPECT_TRUE(service.journal.waitFor("message"));
+  client.send(
+      RawClient::message("sendMessageWithDictionary", "a{sv}", RawClient::bytesDictionary(kMessage - 16)));
+  client.send(RawClient::message("flushMessagesWithReply", "", "", {.bigEndian = true}));
+  EXPECT_TRUE(service.journal.waitFor("flush")) << "the connection goes on";
+  EXPECT_EQ(service.journal.count("message"), 1u);
+}
+
+TEST(IPCLimits, ClosesWhoSendsAMessageOverTheLimit) {
+  LogCapture log;
+  TestService service;
+  RawClient client(service);
+  client.authenticate();
+  client.send(
+      RawClient::message("flushMessagesWithReply", "", "") +
+      RawClient::message("sendMessageWithDictionary", "a{sv}", RawClient::bytesDictionary(2 * kMessage)));
+  EXPECT_TRUE(client.isClosed());
+  EXPECT_TRUE(service.journal.waitFor("destroyed"));
+  EXPECT_EQ(service.journal.lines(),
+            (std::vector<std::string>{"accepted", "flush", "interrupted", "invalidated", "destroyed"}));
+  EXPECT_EQ(log.lines().count("4 ipc: connection"), 1u);
+}
+
+TEST(IPCLimits, ClosesWhoSendsNoMessages) {
+  std::string noVersion = RawClient::message("flushMessagesWithReply", "", "");
+  noVersion[3] = 2;
+  const std::string cases[] = {"this is no D-Bus message", std::string(64, '\0'), noVersion};
+  TestService service;
+  for (const auto& bytes : cases) {
+    RawClient client(service);
+    client.authenticate();
+    client.send(bytes);
+    EXPECT_TRUE(client.isClosed());
+  }
+  EXPECT_TRUE(service.journal.waitFor("destroyed", std::size(cases)));
+  EXPECT_EQ(service.journal.count("interrupted"), std::size(cases));
+}
+
+TEST(IPCLimits, RefusesTextThatIsNotUTF8AndGoesOn) {
+  LogCapture log;
+  TestService service;
+  RawClient client(service);
+  client.authenticate();
+  auto broken = RawClient::message("uploadFileAtPath", "sah", std::string("\1\0\0\0\xff\0\0\0\0\0\0\0", 12));
+  client.send(broken + RawClient::message("flushMessagesWithReply", "", ""));
+  EXPECT_TRUE(service.journal.waitFor("flush"));
+  EXPECT_EQ(service.journal.count("upload"), 0u);
+  EXPECT_EQ(log.lines().count("4 ipc: connection"), 1u);
+}
+
+TEST(IPCLimits, AClientThatDiesInMidMessageDisturbsNobody) {
+  TestService service;
+  TestClient other(service);
+  EXPECT_EQ(other.call("sendMessageWithDictionary", message(1)), "1");
+  RawClient dying(service);
+  dying.authenticate();
+  auto bytes = RawClient::message("sendMessageWithDictionary", "a{sv}", RawClient::bytesDictionary(1000));
+  dying.send(bytes + bytes.substr(0, 500));
+  EXPECT_TRUE(service.journal.waitFor("message", 2));
+  dying.close();
+  EXPECT_TRUE(service.journal.waitFor("destroyed"));
+  EXPECT_EQ(service.journal.count("interrupted"), 1u);
+  EXPECT_EQ(service.journal.count("message"), 2u) << "no half message";
+  EXPECT_EQ(other.call("sendMessageWithDictionary", message(2)), "2");
+}
+
+TEST(IPCLimits, TakesMessagesInPiecesOfAnySize) {
+  TestService service;
+  RawClient client(service);
+  client.send("\0AUTH EXTERNAL\r\nDATA\r\nBEGIN\r\n"s);
+  EXPECT_EQ(client.line(), "DATA");
+  EXPECT_EQ(client.line().substr(0, 3), "OK ");
+  const std::string bytes =
+      RawClient::message("sendMessageWithDictionary", "a{sv}", RawClient::bytesDictionary(40'000)) +
+      RawClient::message("flushMessagesWithReply", "", "");
+  for (std::size_t at = 0, size = 1; at < bytes.size(); at += size, size = size * 7 % 4099) {
+    client.send(std::string_view(bytes).substr(at, size));
+  }
+  EXPECT_TRUE(service.journal.waitFor("flush"));
+  EXPECT_EQ(service.journal.count("message"), 1u);
+}
+
+TEST(IPCLimits, StopsReadingFromAClientThatDoesNotReadItsAnswers) {
+  TestService service;
+  TestClient client(service);
+  TestClient other(service);
+  ASSERT_EQ(client.call("flushMessagesWithReply"), "flushed");
+  std::size_t answered = 0;
+  std::size_t sent = 0;
+  auto count = [&](BusAnswer& answer) { answered += answer.isError() ? 0 : 1; };
+  const IPCOutgoingCall ask{wire::kSessionInterface, "flushMessagesWithReply", {}};
+  // Until the daemon takes no more: the client's own messages pile up in its queue.
+  while (client.bus().queuedMessages() < 500 && sent < 200'000) {
+    ASSERT_EQ(client.bus().send(ask, count, 60s), BusClient::SendResult::Sent);
+    ++sent;
+  }
+  EXPECT_EQ(client.bus().queuedMessages(), 500u);
+  EXPECT_EQ(other.call("fetchDisplayURL"), "https://display") << "others do not notice";
+  const std::size_t served = service.journal.count("flush");
+  EXPECT_LT(served, sent);
+  EXPECT_TRUE(client.runUntil([&] { return answered == sent; })) << "nothing is lost";
+}
+
+TEST(IPCLimits, TellsTheCallerWhenAClientsOutboxIsFull) {
+  TestService service([](IPCListener::Options& options) { options.maximumOutbox = 10; });
+  TestClient client(service);
+  ASSERT_EQ(client.call("flushMessagesWithReply"), "flushed");
+  auto connection = service.connection();
+  const IPCOutgoingCall call{wire::kReplyInterface, "sendMessageToClient", {std::string(200'000, 'x')}};
+  std::string error;
+  // The client reads nothing: the socket fills, then the bus's queue, then the outbox.
+  for (int i = 0; i < 10'000 && error.empty(); ++i) {
+    connection->callRemoteObject(call, [&](const std::string& text) { error = text; });
+  }
+  EXPECT_EQ(error, "too many calls wait for the client");
+  error.clear();
+  connection->callRemoteObject({wire::kReplyInterface, "m", {std::string(kMessage, 'x')}},
+                               [&](const std::string& text) { error = text; });
+  EXPECT_EQ(error, "the call is too large");
+}
+
+void sendWithDescriptors(int socket, const std::string& bytes, std::size_t count) {
+  alignas(cmsghdr) char control[CMSG_SPACE(sizeof(int) * 16)] = {};
+  iovec piece{const_cast<char*>(bytes.data()), bytes.size()};
+  msghdr header{};
+  header.msg_iov = &piece;
+  header.msg_iovlen = 1;
+  header.msg_control = control;
+  header.msg_controllen = CMSG_SPACE(sizeof(int) * count);
+  cmsghdr* rights = CMSG_FIRSTHDR(&header);
+  rights->cmsg_level = SOL_SOCKET;
+  rights->cmsg_type = SCM_RIGHTS;
+  rights->cmsg_len = CMSG_LEN(sizeof(int) * count);
+  for (std::size_t i = 0; i < count; ++i) {
+    int zero = 0;
+    std::memcpy(CMSG_DATA(rights) + i * sizeof(int), &zero, sizeof zero);
+  }
+  ASSERT_EQ(::sendmsg(socket, &header, MSG_NOSIGNAL), static_cast<ssize_t>(bytes.size()));
+}
+
+TEST(IPCLimits, ClosesWhoSendsDescriptorsOutOfPlace) {
+  const std::string flush = RawClient::message("flushMessagesWithReply", "", "");
+  TestService service;
+  RawClient many(service);
+  many.authenticate();
+  sendWithDescriptors(many.fd(), flush, 5);
+  EXPECT_TRUE(many.isClosed());
+
+  RawClient early(service);
+  sendWithDescriptors(early.fd(), "\0AUTH EXTERNAL\r\n"s, 1);
+  EXPECT_TRUE(early.isClosed());
+
+  RawClient within(service);
+  within.authenticate();
+  within.send(flush + flush.substr(0, 40));
+  EXPECT_TRUE(service.journal.waitFor("flush"));
+  sendWithDescriptors(within.fd(), flush.substr(40), 1);
+  EXPECT_TRUE(within.isClosed());
+  EXPECT_TRUE(service.journal.waitFor("destroyed", 3));
+  EXPECT_EQ(service.journal.count("flush"), 1u);
+}
+
+TEST(IPCLimits, GivesADescriptorToTheMessageThatItCameWith) {
+  // "file", and an array of descriptor 0.
+  const std::string body("\4\0\0\0file\0\0\0\0\4\0\0\0\0\0\0\0", 20);
+  const std::string upload = RawClient::message("uploadFileAtPath", "sah", body, {.descriptors = 1});
+  const std::string plain = RawClient::message("flushMessagesWithReply", "", "");
+  TestService service;
+  RawClient client(service);
+  client.send("\0AUTH EXTERNAL\r\nDATA\r\nNEGOTIATE_UNIX_FD\r\n"s);
+  for (int i = 0; i < 3; ++i) client.line();
+  // Whether or not the daemon reads them together.
+  client.send("BEGIN\r\n" + plain);
+  for (int i = 0; i < 20; ++i) {
+    sendWithDescriptors(client.fd(), upload, 1);
+    client.send(plain);
+  }
+  // In two pieces, of which the first is less than a header.
+  sendWithDescriptors(client.fd(), upload.substr(0, 10), 1);
+  EXPECT_TRUE(service.journal.waitFor("flush", 21));
+  client.send(upload.substr(10));
+  EXPECT_TRUE(service.journal.waitFor("upload", 21));
+  for (const auto& line : service.journal.lines()) {
+    if (!line.starts_with("upload")) continue;
+    EXPECT_EQ(line.size(), std::string("upload file ").size() + 32) << line;
+  }
+}
+
+}  // namespace
+}  // namespace vesk::test

@@ -1,0 +1,407 @@
+// Fetching storebags over real TLS, with real keys and signatures.
+#include <gtest/gtest.h>
+
+#include <cstdlib>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/crypto/Base64.h"
+#include "platform/crypto/RSAPublicKey.h"
+#include "platform/plist/PropertyList.h"
+#include "storebag/StorebagFallback.h"
+#include "storebag/StorebagFetch.h"
+#include "storebag/StorebagSignature.h"
+#include "tests/support/CapturedLog.h"
+#include "tests/support/RecordingServer.h"
+#include "tests/support/TestRoot.h"
+#include "tests/support/TestSigningKey.h"
+
+namespace vesk::test {
+namespace {
+
+using Lines = std::vector<std::pair<int, std::string>>;
+
+const Dictionary kSeed{{"https", Dictionary{{"from", "seed"}}}};
+const Dictionary kRelease{{"https", Dictionary{{"from", "release"}}}};
+
+Dictionary payload(const Dictionary& changes = {}, std::string_view without = "") {
+  MutableDictionary whole(Dictionary{{"version", "2.5"}, {"seed", kSeed}, {"release", kRelease}});
+  whole.setAll(changes);
+  whole.remove(without);
+  return whole.share();
+}
+
+std::string withName(const std::string& text) { return "fetchStorebagWithName: " + text; }
+std::string forClientType(const std::string& text) {
+  return "fetchStorebagForEnvironmentAndClientType: " + text;
+}
+
+/// The server, its certificate and the settings are the process's: the daemon reads where the server is once.
+/// The environment is the one without a setting, "seed".
+class StorebagFetch : public testing::Test {
+ protected:
+  static void SetUpTestSuite() {
+    auto authority = CertificateAuthority::generate();
+    ::setenv("SSL_CERT_FILE", testRoot().write("ca.pem", authority.certificate()).c_str(), 1);
+    _server = new RecordingServer([](const HTTPReceived&, std::size_t) { return answer(); },
+                                  {.tls = authority.issueServerIdentity()});
+    testRoot().write("etc/veskreporting/preferences/com.corvane.veskreporting.toml",
+                     "veskreporting_storebag_url = '" + base() + "'\n");
+    _key = new TestSigningKey;
+  }
+  static void TearDownTestSuite() {
+    delete _server;
+    delete _key;
+  }
+
+  static std::string base() { return _server->url("/bags/sorrel"); }
+  static std::string url(const std::string& name) { return base() + "/" + name + "?version=7.3"; }
+  static RecordingServer& server() { return *_server; }
+
+  /// The document that the server sends for a payload.
+  static Dictionary document(const std::string& bag, const std::string& signedBytes) {
+    return {{"signature", base64Encode(_key->sign(signedBytes))}, {"bag", base64Encode(bag)}};
+  }
+  static std::string serialized(const Dictionary& dictionary) { return *writeXMLPropertyList(dictionary); }
+  static std::string signedStorebag(const Dictionary& content) {
+    auto bag = serialized(content);
+    return serialized(document(bag, bag));
+  }
+  static void serve(std::string body, HTTPHeaderList headers = {}, unsigned status = 200) {
+    HTTPAnswer next;
+    next.status = status;
+    next.headers = std::move(headers);
+    next.body = std::move(body);
+    setAnswer(std::move(next));
+  }
+
+  static void cutOff() { setAnswer(faulty(HTTPAnswer::Fault::ResetBeforeAnswer)); }
+
+  std::optional<Dictionary> fetch(std::int32_t clientType = 5) {
+    maxAge = -1;
+    version.reset();
+    notModified = false;
+    log.clear();
+    return fetchStorebagForEnvironmentAndClientType(http, source, clientType, maxAge, version, notModified,
+                                                    &lastModified);
+  }
+  /// What the fetch logged, without the line of the URL.
+  Lines lines() const {
+    Lines all;
+    for (auto& line : log.lines()) {
+      bool isURL = line.second.find("Storebag Server URL") != std::string::npos;
+      if (line.second.starts_with("fetchStorebag") && !isURL) all.push_back(line);
+    }
+    return all;
+  }
+
+  CapturedLog log;
+  HTTPClient http;
+  StorebagSource source{"7.3", [] { return std::optional(_key->publicKeyInfo()); }};
+  std::int32_t maxAge = -1;
+  std::optional<std::string> version;
+  bool notModified = false;
+  std::optional<std::string> lastModified;
+
+ private:
+  static HTTPAnswer answer() {
+    std::lock_guard lock(_mutex);
+    return _answer;
+  }
+  static void setAnswer(HTTPAnswer next) {
+    std::lock_guard lock(_mutex);
+    _answer = std::move(next);
+  }
+
+  static inline RecordingServer* _server = nullptr;
+  static inline TestSigningKey* _key = nullptr;
+  static inline std::mutex _mutex;
+  static inline HTTPAnswer _answer;
+};
+
+TEST_F(StorebagFetch, ReturnsTheSectionOfTheEnvironment) {
+  serve(signedStorebag(payload()), {{"Cache-Control", "public, max-age=600"}});
+  EXPECT_EQ(fetch(), kSeed);
+  EXPECT_EQ(version, "2.5");
+  EXPECT_EQ(maxAge, 600);
+  EXPECT_FALSE(notModified);
+  EXPECT_FALSE(lastModified);
+  EXPECT_EQ(lines(), Lines());
+  EXPECT_EQ(log.count(7, withName("Storebag Server URL: " + url("zelko"))), 1);
+  auto request = server().requests().back();
+  EXPECT_EQ(request.method, "GET");
+  EXPECT_EQ(request.target, "/bags/sorrel/zelko?version=7.3");
+  EXPECT_FALSE(request.header("If-Modified-Since"));
+}
+
+TEST_F(StorebagFetch, TakesEveryEncodingOfPropertyLists) {
+  auto xml = serialized(payload());
+  auto binary = *writeBinaryPropertyList(payload());
+  auto broken = document(xml, xml);
+  auto withBreaks = base64Encode(xml);
+  for (std::size_t at = 60; at < withBreaks.size(); at += 62) withBreaks.insert(at, "\n\t");
+  MutableDictionary changed(broken);
+  changed.set("bag", withBreaks);
+  changed.set("other", List{1, 2});
+  for (const auto& body : {serialized(document(binary, binary)), *writeBinaryPropertyList(document(xml, xml)),
+                           *writeBinaryPropertyList(document(binary, binary)), serialized(changed.share())}) {
+    serve(body);
+    EXPECT_EQ(fetch(), kSeed);
+    EXPECT_EQ(maxAge, 86400);
+  }
+}
+
+TEST_F(StorebagFetch, NeverLooksAtTheStatus) {
+  serve(signedStorebag(payload()), {}, 500);
+  EXPECT_EQ(fetch(), kSeed);
+  serve("not here", {}, 404);
+  EXPECT_FALSE(fetch());
+  EXPECT_EQ(log.countContaining(3, withName("propertyListWithData error ")), 1);
+}
+
+TEST_F(StorebagFetch, EveryFailureSaysWhatItIs) {
+  const auto xml = serialized(payload());
+  const auto good = document(xml, xml);
+  auto changed = [&](std::string_view key, std::optional<Value> value) {
+    MutableDictionary copy(good);
+    copy.remove(key);
+    if (value) copy.set(key, *value);
+    return serialized(copy.share());
+  };
+  const std::pair<int, std::string> unfetched{3, forClientType("Could not fetch storebag for client type 5")};
+  const std::pair<int, std::string> unsigned_{3, withName("Signature is missing")};
+  const std::pair<int, std::string> invalid{3, withName("Signature can not be verified, 0x")};
+  const std::pair<int, std::string> unreadable{3, withName("propertyListWithData error ")};
+  struct Case {
+    const char* name;
+    std::string body;
+    Lines lines;
+  };
+  const Case cases[] = {
+      {"no property list", "junk", {unreadable, unsigned_, unfetched}},
+      {"nothing", "", {unreadable, unsigned_, unfetched}},
+      {"a list", *writeXMLPropertyList(List{1}), {unsigned_, unfetched}},
+      {"no signature", changed("signature", std::nullopt), {unsigned_, unfetched}},
+      {"a number as signature", changed("signature", 1), {unsigned_, unfetched}},
+      {"a signature that is no base64", changed("signature", "abc"), {unfetched}},
+      {"no bag", changed("bag", std::nullopt), {unfetched}},
+      {"bytes as bag", changed("bag", Bytes("abcd")), {unfetched}},
+      {"a bag that is no base64", changed("bag", "abcde"), {unfetched}},
+      {"a signature over other bytes", serialized(document(xml, xml + " ")), {invalid, unfetched}},
+      {"an empty signature", changed("signature", ""), {invalid, unfetched}},
+      {"a payload that is no property list", serialized(document("junk", "junk")), {unfetched}},
+      {"a payload that is a list",
+       serialized(document(*writeXMLPropertyList(List{}), *writeXMLPropertyList(List{}))),
+       {unfetched}},
+  };
+  for (const auto& test : cases) {
+    SCOPED_TRACE(test.name);
+    serve(test.body, {{"Cache-Control", "max-age=77"}});
+    EXPECT_FALSE(fetch());
+    EXPECT_FALSE(version);
+    EXPECT_FALSE(notModified);
+    EXPECT_EQ(maxAge, 77) << "written before anything fails";
+    auto logged = lines();
+    ASSERT_EQ(logged.size(), test.lines.size());
+    for (std::size_t i = 0; i < logged.size(); ++i) {
+      EXPECT_EQ(logged[i].first, test.lines[i].first);
+      EXPECT_TRUE(logged[i].second.starts_with(test.lines[i].second)) << logged[i].second;
+    }
+  }
+}
+
+TEST_F(StorebagFetch, WithoutAUsableKeyNothingIsTrusted) {
+  serve(signedStorebag(payload()));
+  for (auto key : {std::optional<std::string>(), std::optional<std::string>("rubbish")}) {
+    source.publicKey = [key] { return key; };
+    EXPECT_FALSE(fetch());
+    EXPECT_EQ(lines(), (Lines{{3, forClientType("Could not fetch storebag for client type 5")}}));
+  }
+}
+
+TEST_F(StorebagFetch, AClientTypeWithoutStorebagFetchesNothing) {
+  auto before = server().count();
+  EXPECT_FALSE(fetch(4));
+  EXPECT_EQ(lines(), (Lines{{3, forClientType("Could not find storebag name for client type 4")}}));
+  EXPECT_EQ(server().count(), before);
+  EXPECT_EQ(maxAge, -1);
+}
+
+TEST_F(StorebagFetch, AnUnreachableServerMeansTheBuiltInStorebagForOneNameOnly) {
+  server().stop();
+  lastModified = "Mon";
+  EXPECT_FALSE(fetch(5));
+  auto logged = lines();
+  ASSERT_EQ(logged.size(), 3u);
+  EXPECT_EQ(logged[0], std::pair(7, withName("Adding 'Last-Modified: Mon' to the header")));
+  EXPECT_EQ(logged[1].first, 6);
+  EXPECT_TRUE(logged[1].second.starts_with(
+      withName("Error resolving with lookup server " + url("zelko") + ", sendSynchronousRequest error ")));
+  EXPECT_EQ(logged[2], std::pair(3, forClientType("Could not fetch storebag for client type 5")));
+  EXPECT_EQ(maxAge, -1);
+
+  for (std::int32_t clientType : {7, 11}) {
+    EXPECT_EQ(fetch(clientType), fallbackStorebag().dictionary("release"));
+    EXPECT_EQ(version, "1.0.0-Palvo-Fallback");
+    EXPECT_EQ(maxAge, 3600);
+    EXPECT_FALSE(notModified);
+    EXPECT_EQ(lastModified, "Mon");
+    auto rest = lines();
+    rest.erase(rest.begin(), rest.begin() + 2);
+    EXPECT_EQ(rest, (Lines{{6, withName("Loading default storebag 'palvo'")},
+                           {4, forClientType("Seed section is missing in the storebag.")},
+                           {6, forClientType("Store bag override MaxAge=3600")}}));
+  }
+  server().start();
+}
+
+TEST_F(StorebagFetch, ACutOffFetchIsNotRepeated) {
+  auto before = server().count();
+  cutOff();
+  EXPECT_FALSE(fetch());
+  EXPECT_EQ(server().count(), before + 1);
+  EXPECT_EQ(log.countContaining(6, withName("Error resolving with lookup server ")), 1);
+}
+
+TEST_F(StorebagFetch, AsksOnlyForWhatIsNewer) {
+  const std::string first = "Tue, 24 Nov 2026 20:00:00 GMT";
+  const std::string second = "Wed, 25 Nov 2026 20:00:00 GMT";
+  const std::string adding = withName("Adding 'Last-Modified: " + first + "' to the header");
+  const std::string unchanged = withName("storebag content has not changed. using its cached version");
+
+  // The first answer has no content: its age counts all the same.
+  serve("", {{"Last-Modified", first}});
+  EXPECT_FALSE(fetch());
+  EXPECT_FALSE(notModified);
+  EXPECT_EQ(lastModified, first);
+  EXPECT_EQ(log.count(7, withName("New 'Last-Modified: " + first + "' received")), 1);
+  EXPECT_EQ(log.countContaining(3, withName("propertyListWithData error ")), 1);
+
+  serve("", {{"Last-Modified", second}, {"Cache-Control", "max-age=60"}}, 304);
+  EXPECT_FALSE(fetch());
+  EXPECT_TRUE(notModified);
+  EXPECT_EQ(lastModified, first);
+  EXPECT_EQ(maxAge, 60);
+  EXPECT_EQ(lines(), (Lines{{7, adding}, {7, unchanged}}));
+  EXPECT_EQ(server().requests().back().header("If-Modified-Since"), first);
+
+  // Without the header an empty answer is a failure.
+  serve("", {}, 304);
+  EXPECT_FALSE(fetch());
+  EXPECT_FALSE(notModified);
+  EXPECT_EQ(lastModified, first);
+
+  serve(signedStorebag(payload()), {{"last-modified", second}});
+  EXPECT_EQ(fetch(), kSeed);
+  EXPECT_EQ(lastModified, second);
+  EXPECT_EQ(lines(), (Lines{{7, adding}, {7, withName("New 'Last-Modified: " + second + "' received")}}));
+
+  // Without a slot nothing is conditional.
+  serve(signedStorebag(payload()), {{"Last-Modified", first}});
+  EXPECT_TRUE(fetchStorebagWithName(http, source, "zelko", maxAge, notModified, nullptr));
+  EXPECT_FALSE(server().requests().back().header("If-Modified-Since"));
+}
+
+TEST_F(StorebagFetch, TheStorebagsOwnAgeGoesBeforeTheServers) {
+  struct Case {
+    Value cycle;
+    std::int32_t age;
+  };
+  for (const auto& [cycle, age] :
+       {Case{172800, 86400}, Case{86401, 86400}, Case{300, 300}, Case{0, 0}, Case{-5, -5}, Case{12.9, 12},
+        Case{std::int64_t{1} << 40, 86400}, Case{-(std::int64_t{1} << 40), -2147483647 - 1}}) {
+    serve(signedStorebag(payload({{"refresh_cycle", cycle}})), {{"Cache-Control", "max-age=600"}});
+    EXPECT_TRUE(fetch());
+    EXPECT_EQ(maxAge, age);
+    EXPECT_EQ(lines(), (Lines{{6, forClientType("Store bag override MaxAge=" + std::to_string(age))}}));
+  }
+  serve(signedStorebag(payload({{"refresh_cycle", "300"}, {"version", 3}})),
+        {{"Cache-Control", "max-age=600"}});
+  EXPECT_TRUE(fetch());
+  EXPECT_EQ(maxAge, 600);
+  EXPECT_FALSE(version);
+  EXPECT_EQ(log.countContaining(4, "'refresh_cycle'"), 1);
+  EXPECT_EQ(log.countContaining(4, "'version'"), 1);
+}
+
+TEST_F(StorebagFetch, ASeedDeviceTakesTheReleaseSectionWhenThereIsNoOther) {
+  serve(signedStorebag(payload({}, "seed")));
+  EXPECT_EQ(fetch(), kRelease);
+  EXPECT_EQ(lines(), (Lines{{4, forClientType("Seed section is missing in the storebag.")}}));
+  serve(signedStorebag({{"version", "1"}, {"refresh_cycle", 5}}), {{"Cache-Control", "max-age=600"}});
+  EXPECT_FALSE(fetch());
+  EXPECT_EQ(
+      lines(),
+      (Lines{{4, forClientType("Seed section is missing in the storebag.")},
+             {3, forClientType("Could not find storebag for client type 5 with release environment")}}));
+  EXPECT_FALSE(version);
+  EXPECT_EQ(maxAge, 600);
+}
+
+TEST(StorebagSection, BelongsToItsEnvironment) {
+  const Dictionary one{{"a", Dictionary{}}};
+  const Dictionary all{{"development", one}, {"corvane_internal", one}, {"seed", one}, {"release", one}};
+  const char* names[] = {"(none)", "development", "corvane_internal", "release", "release", "(none)"};
+  for (std::int32_t type = 0; type < 6; ++type) {
+    EXPECT_EQ(storebagSectionForEnvironment(all, type, 5).has_value(), type >= 1 && type <= 4) << type;
+    CapturedLog log;
+    EXPECT_FALSE(storebagSectionForEnvironment({}, type, 9));
+    EXPECT_EQ(log.count(3, forClientType("Could not find storebag for client type 9 with ") + names[type] +
+                               " environment"),
+              1);
+    EXPECT_EQ(log.count(4, forClientType("Seed section is missing in the storebag.")), type == 3);
+  }
+  CapturedLog log;
+  EXPECT_FALSE(storebagSectionForEnvironment({{"development", "text"}}, 1, 9));
+  EXPECT_EQ(log.countContaining(4, "'development'"), 1);
+}
+
+TEST(StorebagAge, IsWhatCacheControlGrants) {
+  struct Case {
+    std::optional<std::string_view> header;
+    std::int32_t age;
+  };
+  const Case cases[] = {
+      {std::nullopt, 86400},
+      {"", 86400},
+      {"no-cache", 86400},
+      {"max-age=600", 600},
+      {"public, max-age=600", 600},
+      {"max-age=600, private", 600},
+      {"max-age", 86400},
+      {"public, max-age", 86400},
+      {"max-age=", 0},
+      {"max-age=x", 0},
+      {"max-age=-5", -5},
+      {"max-age=+7", 7},
+      {"max-age= 600", 0},
+      {"max-age=\t600", 600},
+      {"Max-Age=600", 86400},
+      {"max-age=1 max-age=2", 1},
+      {"public,max-age=600", 86400},
+      {"max-age 30", 30},
+      {"max-age=99999999999", 2147483647},
+      {"max-age=-99999999999", -2147483647 - 1},
+  };
+  for (const auto& test : cases) {
+    EXPECT_EQ(maxAgeFromCacheControl(test.header), test.age) << test.header.value_or("(none)");
+  }
+}
+
+TEST(StorebagSignature, CoversEveryByteOfThePayload) {
+  TestSigningKey key;
+  auto publicKey = RSAPublicKey::fromDER(key.bareKey());
+  ASSERT_TRUE(publicKey);
+  const std::string bytes("pay\0load", 8);
+  auto signature = key.sign(bytes);
+  EXPECT_TRUE(verifyStorebagSignature(*publicKey, bytes, signature));
+  EXPECT_FALSE(verifyStorebagSignature(*publicKey, "pay", signature));
+  EXPECT_FALSE(verifyStorebagSignature(*publicKey, bytes, bytes));
+}
+
+}  // namespace
+}  // namespace vesk::test

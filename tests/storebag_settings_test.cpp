@@ -1,0 +1,170 @@
+// Names, settings and typed reading of storebags.
+#include <gtest/gtest.h>
+
+#include <limits>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "storebag/StorebagFallback.h"
+#include "storebag/StorebagNaming.h"
+#include "storebag/StorebagProfile.h"
+#include "tests/support/CapturedLog.h"
+#include "tests/support/TestRoot.h"
+
+namespace vesk::test {
+namespace {
+
+void writePreferences(std::string_view toml) {
+  testRoot().write("etc/veskreporting/preferences/com.corvane.veskreporting.toml", toml);
+}
+
+TEST(StorebagNaming, NamesTheStorebagOfAClientType) {
+  const std::optional<std::string_view> names[] = {
+      std::nullopt, std::nullopt, std::nullopt, std::nullopt, std::nullopt, "zelko",     "brannic",
+      "palvo",      "tessin",     "quimby",     "dorvel",     "palvo",      std::nullopt};
+  for (int type = 0; type < 13; ++type) EXPECT_EQ(storebagNameForClientType(type), names[type]) << type;
+  for (int type : {-1, 1000, std::numeric_limits<int>::min(), std::numeric_limits<int>::max()}) {
+    EXPECT_FALSE(storebagNameForClientType(type)) << type;
+  }
+}
+
+TEST(StorebagNaming, NamesTheSectionOfAnEnvironment) {
+  const std::optional<std::string_view> names[] = {std::nullopt, "development", "corvane_internal",
+                                                   "seed",       "release",     std::nullopt};
+  for (int type = 0; type < 6; ++type) EXPECT_EQ(environmentNameForType(type), names[type]) << type;
+  EXPECT_FALSE(environmentNameForType(-1));
+}
+
+TEST(StorebagNaming, ReadsTheEnvironmentTypeFromASetting) {
+  struct Case {
+    std::optional<Value> setting;
+    int type;
+    const char* invalid = nullptr;
+  };
+  const Case cases[] = {
+      {std::nullopt, 3},
+      {Value(0), 0},
+      {Value(1), 1},
+      {Value(4), 4},
+      {Value(5), 2, "5"},
+      {Value(7), 2, "7"},
+      {Value(-1), 2, "4294967295"},
+      {Value("4 or so"), 4},
+      {Value("x"), 0},
+      {Value("-3"), 2, "4294967293"},
+      {Value(List{}), 0},
+      {Value(2.9), 2},
+      {Value(true), 1},
+      {Value(std::int64_t{1} << 33), 2, "0"},
+  };
+  for (const auto& test : cases) {
+    CapturedLog log;
+    EXPECT_EQ(environmentTypeForPreference(test.setting), test.type);
+    std::vector<std::pair<int, std::string>> expected;
+    if (test.invalid) {
+      expected.emplace_back(3,
+                            std::string("userDefaultsEnvironment: Invalid environment type ") + test.invalid);
+    }
+    EXPECT_EQ(log.lines(), expected);
+  }
+}
+
+TEST(StorebagNaming, TheEnvironmentTypeIsReadOnceForTheProcess) {
+  CapturedLog log;
+  writePreferences("environmentType = 7\n");
+  EXPECT_EQ(currentEnvironmentType(), 2);
+  EXPECT_EQ(log.count(3, "userDefaultsEnvironment: Invalid environment type 7"), 1);
+  EXPECT_EQ(log.count(6, "userDefaultsEnvironment: Environment type 2"), 1);
+  writePreferences("environmentType = 1\n");
+  EXPECT_EQ(currentEnvironmentType(), 2);
+  EXPECT_EQ(log.countContaining(6, "userDefaultsEnvironment"), 1);
+}
+
+TEST(StorebagNaming, OtherSettingsAreReadAfreshAsText) {
+  writePreferences("httpsPostURL = 'https://a/'\nnumber = 12\nreal = 0.5\nlist = [1]\n");
+  EXPECT_EQ(preferenceStringForKey("httpsPostURL"), "https://a/");
+  EXPECT_EQ(preferenceStringForKey("number"), "12");
+  EXPECT_EQ(preferenceStringForKey("real"), "0.5");
+  EXPECT_FALSE(preferenceStringForKey("list"));
+  EXPECT_FALSE(preferenceStringForKey("absent"));
+  writePreferences("httpsPostURL = 'https://b/'\n");
+  EXPECT_EQ(preferenceStringForKey("httpsPostURL"), "https://b/");
+}
+
+TEST(StorebagNaming, TheServerIsTheOverrideOrThatOfTheBuild) {
+  EXPECT_EQ(storebagServerBaseURLFor("http://here:1/x", true), "http://here:1/x");
+  EXPECT_EQ(storebagServerBaseURLFor("", false), "");
+  std::string partners = storebagServerBaseURLFor(std::nullopt, true);
+  std::string general = storebagServerBaseURLFor(std::nullopt, false);
+  EXPECT_TRUE(partners.starts_with("https://") && partners.ends_with("/storebags/sorrel")) << partners;
+  EXPECT_TRUE(general.starts_with("https://") && general.ends_with("/bags/sorrel")) << general;
+
+  writePreferences("veskreporting_storebag_url = 'http://first'\n");
+  EXPECT_EQ(storebagServerBaseURL(), "http://first");
+  writePreferences("veskreporting_storebag_url = 'http://second'\n");
+  EXPECT_EQ(storebagServerBaseURL(), "http://first");
+}
+
+TEST(StorebagFallback, HoldsOneBackendForEveryEnvironmentButSeed) {
+  const Dictionary section{{"wren", Dictionary{{"active", true}}}};
+  EXPECT_EQ(fallbackStorebag(), (Dictionary{{"corvane_internal", section},
+                                            {"development", section},
+                                            {"release", section},
+                                            {"version", "1.0.0-Palvo-Fallback"},
+                                            {"refresh_cycle", 3600}}));
+}
+
+TEST(StorebagProfile, ReadsValuesOfTheirTypeAndReportsTheRest) {
+  const Dictionary inner{{"a", 1}};
+  const Dictionary profile{{"text", "t"},
+                           {"whole", 3},
+                           {"real", 2.75},
+                           {"flag", true},
+                           {"list", List{"a", "b"}},
+                           {"inner", inner},
+                           {"mixed", List{"a", 1, "b", inner}},
+                           {"bytes", Bytes("x")},
+                           {"infinite", std::numeric_limits<double>::infinity()}};
+  CapturedLog log;
+  EXPECT_EQ(profileText("b", profile, "text"), "t");
+  EXPECT_EQ(profileNumber("b", profile, "real"), Value(2.75));
+  EXPECT_EQ(profileNumber("b", profile, "flag"), Value(true));
+  EXPECT_EQ(profileInteger("b", profile, "real"), 2);
+  EXPECT_EQ(profileInteger("b", profile, "infinite"), std::numeric_limits<std::int64_t>::max());
+  EXPECT_EQ(profileList("b", profile, "list"), (List{"a", "b"}));
+  EXPECT_EQ(profileTextList("b", profile, "list"), (std::vector<std::string>{"a", "b"}));
+  EXPECT_EQ(profileDictionary("b", profile, "inner"), inner);
+  EXPECT_FALSE(profileText("b", profile, "absent"));
+  EXPECT_FALSE(profileTextList("b", profile, "absent"));
+  EXPECT_TRUE(log.lines().empty());
+
+  EXPECT_EQ(profileTextList("backend", profile, "mixed"), (std::vector<std::string>{"a", "b"}));
+  EXPECT_EQ(log.countContaining(4, "backend: "), 1);
+  EXPECT_EQ(log.countContaining(4, "'mixed'"), 1);
+}
+
+TEST(StorebagProfile, AWrongTypeCountsAsAbsentAndCostsOneLine) {
+  const Value values[] = {Value(), "text", 1, 1.5, true, Bytes("x"), Date{1}, List{}, Dictionary{}};
+  for (const Value& value : values) {
+    const Dictionary profile{{"the key", value}};
+    CapturedLog log;
+    bool text = profileText("the backend", profile, "the key").has_value();
+    bool number = profileNumber("the backend", profile, "the key").has_value();
+    bool integer = profileInteger("the backend", profile, "the key").has_value();
+    bool list = profileList("the backend", profile, "the key").has_value();
+    bool texts = profileTextList("the backend", profile, "the key").has_value();
+    bool dictionary = profileDictionary("the backend", profile, "the key").has_value();
+    EXPECT_EQ(text, value.text() != nullptr);
+    EXPECT_EQ(number, value.isNumber());
+    EXPECT_EQ(integer, value.isNumber());
+    EXPECT_EQ(list, value.list() != nullptr);
+    EXPECT_EQ(texts, value.list() != nullptr);
+    EXPECT_EQ(dictionary, value.dictionary() != nullptr);
+    EXPECT_EQ(log.countContaining(4, "the backend: The storebag's value for 'the key'"),
+              6 - text - number - integer - list - texts - dictionary);
+  }
+}
+
+}  // namespace
+}  // namespace vesk::test

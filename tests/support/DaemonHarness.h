@@ -1,0 +1,78 @@
+// The real daemon and the real collector, as processes under a root of their own.
+#pragma once
+
+#include <VeskReporting/VeskReporting.h>
+#include <VeskReporting/VeskReportingKeys.h>
+
+#include <boost/json.hpp>
+#include <filesystem>
+#include <functional>
+#include <map>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "tests/support/ChildProcess.h"
+#include "tests/support/TempDirectory.h"
+#include "tests/support/WebRequest.h"
+
+namespace vesk::test {
+
+/// A collector and a daemon that trusts it, with a release-environment storebag for client type 5 ("zelko").
+class DaemonHarness {
+ public:
+  /// The daemon is started by `startDaemon`, so that a test can lay out the root first.
+  /// `collectorArguments` are added to those of the first start.
+  explicit DaemonHarness(std::vector<std::string> collectorArguments = {});
+
+  /// Again on the same ports, after `stopCollector`.
+  void startCollector(std::vector<std::string> arguments = {});
+  void stopCollector() { _collector.reset(); }
+  /// Waits until clients are accepted.
+  void startDaemon(std::vector<std::string> arguments = {});
+  /// Ends it by SIGTERM and gives its exit status.
+  int stopDaemon();
+  ChildProcess& daemon() { return *_daemon; }
+  ChildProcess& collector() { return *_collector; }
+
+  /// Writes a storebag source; the text may say @EVENTS@ for the collector's HTTPS event URL.
+  void writeStorebag(const std::string& name, std::string source);
+  /// A line of the daemon's preferences or of the device's facts; `value` as TOML writes it.
+  void setPreference(const std::string& key, const std::string& value) { _preferences[key] = value; }
+  void setDeviceFact(const std::string& key, const std::string& value) { _deviceFacts[key] = value; }
+
+  std::string socketPath() const;
+  ReportingOptions clientOptions() const;
+
+  /// The lines of the collector's event file, once `enough` says so; throws after ChildProcess::kPatience.
+  std::vector<boost::json::object> waitForEvents(
+      const std::function<bool(const std::vector<boost::json::object>&)>& enough);
+  /// Until that many events of method `method` are there; gives those.
+  std::vector<boost::json::object> waitForEventsOfMethod(int method, std::size_t count);
+
+  void setFault(const std::string& fault);
+  std::int64_t collectorCount(const std::string& counter);
+  std::string messageLog() const;
+  std::string fact(const char* name) const { return std::string(_facts.at(name).as_string()); }
+
+  TempDirectory root;
+
+ private:
+  std::vector<boost::json::object> events() const;
+
+  std::unique_ptr<ChildProcess> _collector;
+  std::unique_ptr<ChildProcess> _daemon;
+  boost::json::object _facts;
+  std::map<std::string, std::string> _preferences;
+  std::map<std::string, std::string> _deviceFacts;
+};
+
+/// A session of client type 5, configured and started.
+struct RoadClient {
+  explicit RoadClient(const DaemonHarness& harness, Dictionary moreSessionInfo = {},
+                      std::optional<Dictionary> userInfo = std::nullopt);
+  VeskReporting reporting;
+  BackendNamesAnswer enabled;
+};
+
+}  // namespace vesk::test

@@ -1,0 +1,395 @@
+#include "tests/support/IPCHarness.h"
+
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <sys/socket.h>
+
+#include <algorithm>
+#include <chrono>
+#include <filesystem>
+
+#include "client/protocol/ClientSessionReplyProxy.h"
+#include "client/protocol/ClientSessionStub.h"
+#include "platform/ipc/IPCIncomingCall.h"
+#include "platform/ipc/UnixSocket.h"
+#include "platform/log/SystemLog.h"
+
+namespace vesk::test {
+
+using namespace std::chrono_literals;
+using namespace std::string_view_literals;
+
+namespace {
+
+constexpr auto kPatience = 30s;
+
+template <class T>
+std::string shown(const std::optional<T>& value) {
+  return value ? describe(Value(*value)) : "absent";
+}
+
+std::string shown(bool value) { return value ? "true" : "false"; }
+
+}  // namespace
+
+// --- Journal
+
+void Journal::add(std::string line) {
+  std::lock_guard lock(_mutex);
+  _lines.push_back(std::move(line));
+  _changed.notify_all();
+}
+
+std::size_t Journal::countLocked(std::string_view beginning) const {
+  return static_cast<std::size_t>(std::count_if(
+      _lines.begin(), _lines.end(), [&](const auto& line) { return line.starts_with(beginning); }));
+}
+
+bool Journal::waitFor(std::string_view beginning, std::size_t count) {
+  std::unique_lock lock(_mutex);
+  return _changed.wait_for(lock, kPatience, [&] { return countLocked(beginning) >= count; });
+}
+
+std::size_t Journal::count(std::string_view beginning) {
+  std::lock_guard lock(_mutex);
+  return countLocked(beginning);
+}
+
+std::vector<std::string> Journal::lines() {
+  std::lock_guard lock(_mutex);
+  return _lines;
+}
+
+// --- RecordingSession
+
+RecordingSession::~RecordingSession() {
+  if (_saysFarewell) {
+    ClientSessionReplyProxy proxy(_connection,
+                                  [this](const std::string& error) { _journal.add("lost: " + error); });
+    proxy.sendMessageToClient(std::nullopt, 0, 0, 0, std::nullopt);
+  }
+  _journal.add("destroyed");
+}
+
+void RecordingSession::setSessionInfo(const Dictionary& sessionInfo,
+                                      const std::optional<Dictionary>& userInfo,
+                                      const List& frameworksToCheck, bool hasAggregationBlock) {
+  _journal.add("setSessionInfo " + describe(sessionInfo) + " " + shown(userInfo) + " " +
+               describe(frameworksToCheck) + " " + shown(hasAggregationBlock));
+}
+
+void RecordingSession::startConfigWithCompletionHandler(Reply<std::optional<BackendNames>> reply) {
+  _journal.add("start");
+  reply(BackendNames{"one", "two"});
+}
+
+void RecordingSession::fetchStatesWithUserInfo(const std::optional<Dictionary>& userInfo,
+                                               Reply<std::optional<BackendNames>> completionHandler) {
+  _journal.add("fetchStates " + shown(userInfo));
+  completionHandler(std::nullopt);
+}
+
+void RecordingSession::fetchDisplayURL(Reply<std::string> reply) {
+  _journal.add("fetchDisplayURL");
+  reply("https://display");
+}
+
+void RecordingSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
+                                               const std::optional<Dictionary>& payload,
+                                               Reply<std::optional<std::string>> reply) {
+  _journal.add("category " + std::to_string(category) + " " + std::to_string(type) + " " + shown(payload));
+  reply(std::nullopt);
+}
+
+void RecordingSession::sendMessageWithDictionary(const Dictionary& parameters,
+                                                 Reply<std::optional<std::string>> reply) {
+  const std::string action = parameters.text("do").value_or(Text()).string();
+  const std::string number = std::to_string(integerForKey(parameters, "n").value_or(0));
+  if (action == "farewell") _saysFarewell = true;
+  if (action == "keep") kept = std::move(reply);
+  _journal.add("message " + number);
+  if (action == "throw") throw std::runtime_error("thrown");
+  if (action != "abandon" && reply) reply(number);
+}
+
+void RecordingSession::flushMessagesWithReply(Reply<std::optional<std::string>> reply) {
+  _journal.add("flush");
+  reply("flushed");
+}
+
+void RecordingSession::uploadFileAtPath(const std::string& fileURL, const std::string& extensionToken,
+                                        Reply<bool> completionHandler) {
+  _journal.add("upload " + fileURL + " " + extensionToken);
+  completionHandler(true);
+}
+
+void RecordingSession::uploadLogData(const List& logData,
+                                     Reply<bool, std::optional<std::string>> completionHandler) {
+  _journal.add("log " + describe(logData));
+  completionHandler(false, std::nullopt);
+}
+
+void RecordingSession::sendMessageWithSessionInfo(const Dictionary& sessionInfo,
+                                                  const std::optional<Dictionary>& userInfo,
+                                                  std::uint16_t category, std::uint16_t type,
+                                                  const std::optional<Dictionary>& payload,
+                                                  Reply<std::string> reply) {
+  _journal.add("single " + describe(sessionInfo) + " " + shown(userInfo) + " " + std::to_string(category) +
+               " " + std::to_string(type) + " " + shown(payload));
+  reply("finished");
+}
+
+// --- TestService
+
+TestService::TestService(const std::function<void(IPCListener::Options&)>& adjust) {
+  char pattern[] = "/tmp/vesk-ipc-XXXXXX";
+  _directory = ::mkdtemp(pattern);
+  _path = _directory + "/run/socket";
+  IPCListener::Options options;
+  options.socketPath = _path;
+  options.objectPath = wire::kObjectPath;
+  if (adjust) adjust(options);
+  _path = options.socketPath;
+  _listener = std::make_unique<IPCListener>(std::move(options));
+  _listener->setDelegate(this);
+  _listener->resume();
+}
+
+TestService::~TestService() {
+  _listener.reset();
+  std::filesystem::remove_all(_directory);
+}
+
+bool TestService::shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) {
+  auto session = std::make_shared<RecordingSession>(journal, connection);
+  connection->setExportedObject(std::make_shared<ClientSessionStub>(session));
+  connection->setInterruptionHandler([this, session] { journal.add("interrupted"); });
+  connection->setInvalidationHandler([this, session] {
+    journal.add("invalidated");
+    if (onInvalidation) onInvalidation();
+  });
+  {
+    std::lock_guard lock(_mutex);
+    _connections.push_back(connection);
+    _sessions.push_back(session);
+  }
+  if (accept == Accept::Resume) connection->resume();
+  journal.add("accepted");
+  return accept != Accept::Refuse;
+}
+
+std::shared_ptr<IPCConnection> TestService::connection(std::size_t index) {
+  EXPECT_TRUE(journal.waitFor("accepted", index + 1));
+  std::lock_guard lock(_mutex);
+  return _connections.at(index).lock();
+}
+
+std::shared_ptr<RecordingSession> TestService::session(std::size_t index) {
+  EXPECT_TRUE(journal.waitFor("accepted", index + 1));
+  std::lock_guard lock(_mutex);
+  return _sessions.at(index).lock();
+}
+
+// --- TestClient
+
+TestClient::TestClient(const TestService& service) {
+  BusClient::Options options;
+  options.socketPath = service.path();
+  options.objectPath = wire::kObjectPath;
+  _bus = std::make_unique<BusClient>(std::move(options));
+  _bus->setExportedObject(_self);
+}
+
+void TestClient::handle(IPCIncomingCall& call) {
+  std::optional<Dictionary> sessionInfo;
+  std::optional<Dictionary> payload;
+  double timestamp = 0;
+  std::uint16_t category = 0;
+  std::uint16_t type = 0;
+  if (!call.read(wire::kSendMessageToClient.arguments, sessionInfo, timestamp, category, type, payload))
+    return;
+  received.push_back(std::string(call.member()) + " " + shown(sessionInfo) + " " + describe(timestamp) + " " +
+                     std::to_string(category) + " " + std::to_string(type) + " " + shown(payload));
+  call.answer();
+}
+
+bool TestClient::runUntil(const std::function<bool()>& predicate) {
+  const auto deadline = std::chrono::steady_clock::now() + kPatience;
+  while (!predicate()) {
+    if (std::chrono::steady_clock::now() > deadline) return false;
+    pollfd poll{_bus->fd(), _bus->events(), 0};
+    int timeout = _bus->timeout();
+    ::poll(&poll, 1, timeout < 0 ? 20 : std::min(timeout, 20));
+    if (_bus->process() == BusClient::Progress::Disconnected) return predicate();
+  }
+  return true;
+}
+
+bool TestClient::runToEnd() {
+  runUntil([] { return false; });
+  return _bus->process() == BusClient::Progress::Disconnected;
+}
+
+std::string TestClient::call(const char* member, std::vector<IPCArgument> arguments,
+                             const char* interfaceName) {
+  std::string result;
+  auto handler = [&result, member](BusAnswer& answer) {
+    bool flag = false;
+    std::string text;
+    std::optional<std::string> perhaps;
+    std::optional<std::vector<std::string>> names;
+    std::string_view name(member);
+    if (answer.isError()) {
+      result = answer.errorName().substr(answer.errorName().rfind('.') + 1);
+    } else if (name.starts_with("upload")) {
+      result = answer.read(flag) ? shown(flag) : "unreadable";
+    } else if (name.starts_with("start") || name == "fetchStatesWithUserInfo") {
+      result = !answer.read(names) ? "unreadable" : names ? names->at(0) + "," + names->at(1) : "absent";
+    } else if (name == "fetchDisplayURL" || name == "sendMessageWithSessionInfo" || name == "Introspect") {
+      result = answer.read(text) ? text : "unreadable";
+    } else if (name == "setSessionInfo" || name == "Ping") {
+      result = "done";
+    } else {
+      result = answer.read(perhaps) ? perhaps.value_or("absent") : "unreadable";
+    }
+  };
+  auto sent = _bus->send({interfaceName, member, std::move(arguments)}, handler, 25s);
+  if (sent != BusClient::SendResult::Sent) return "not sent";
+  EXPECT_TRUE(runUntil([&] { return !result.empty(); })) << member;
+  return result;
+}
+
+void TestClient::post(const char* member, std::vector<IPCArgument> arguments) {
+  EXPECT_EQ(_bus->send({wire::kSessionInterface, member, std::move(arguments)}), BusClient::SendResult::Sent);
+}
+
+// --- RawClient
+
+RawClient::RawClient(const TestService& service) : _socket(connectUnixSocket(service.path())) {}
+
+void RawClient::send(std::string_view bytes) {
+  while (!bytes.empty()) {
+    ssize_t sent = ::send(_socket.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
+    if (sent >= 0) {
+      bytes.remove_prefix(static_cast<std::size_t>(sent));
+      continue;
+    }
+    pollfd poll{_socket.get(), POLLOUT, 0};
+    if (errno != EAGAIN || ::poll(&poll, 1, 30'000) <= 0) return;  // refused in the midst of it
+  }
+}
+
+std::string RawClient::line() {
+  std::string text;
+  for (;;) {
+    char next = 0;
+    pollfd poll{_socket.get(), POLLIN, 0};
+    if (::poll(&poll, 1, 30'000) <= 0 || ::recv(_socket.get(), &next, 1, 0) != 1) return {};
+    if (next == '\n') return text.substr(0, text.size() - 1);
+    text += next;
+  }
+}
+
+void RawClient::authenticate() {
+  send("\0AUTH EXTERNAL\r\nDATA\r\nNEGOTIATE_UNIX_FD\r\n"sv);
+  EXPECT_EQ(line(), "DATA");
+  EXPECT_EQ(line().substr(0, 3), "OK ");
+  EXPECT_EQ(line(), "AGREE_UNIX_FD");
+  send("BEGIN\r\n");
+}
+
+bool RawClient::isClosed() {
+  char buffer[4096];
+  for (;;) {
+    pollfd poll{_socket.get(), POLLIN, 0};
+    if (::poll(&poll, 1, 30'000) <= 0) return false;
+    if (::recv(_socket.get(), buffer, sizeof buffer, 0) <= 0) return true;
+  }
+}
+
+namespace {
+
+/// Bytes of a message in either byte order.
+class Marshalled {
+ public:
+  explicit Marshalled(bool bigEndian) : _bigEndian(bigEndian) {}
+
+  void number(std::uint32_t value) {
+    align(4);
+    for (int i = 0; i < 4; ++i) _bytes += static_cast<char>(value >> (_bigEndian ? 24 - 8 * i : 8 * i));
+  }
+  void text(std::string_view value) {
+    number(static_cast<std::uint32_t>(value.size()));
+    _bytes.append(value).append(1, '\0');
+  }
+  void signature(std::string_view value) {
+    _bytes.append(1, static_cast<char>(value.size())).append(value).append(1, '\0');
+  }
+  void raw(std::string_view value) { _bytes += value; }
+  void align(std::size_t to) { _bytes.resize((_bytes.size() + to - 1) / to * to); }
+  void field(char code, const char* type, std::string_view value) {
+    align(8);
+    _bytes += code;
+    signature(type);
+    *type == 'g' ? signature(value) : text(value);
+  }
+  std::string take() { return std::move(_bytes); }
+
+ private:
+  const bool _bigEndian;
+  std::string _bytes;
+};
+
+}  // namespace
+
+std::string RawClient::message(const char* member, const char* signature, const std::string& body,
+                               Header header) {
+  Marshalled fields(header.bigEndian);
+  fields.field(1, "o", wire::kObjectPath);
+  fields.field(2, "s", wire::kSessionInterface);
+  fields.field(3, "s", member);
+  fields.field(8, "g", signature);
+  if (header.descriptors > 0) {
+    fields.align(8);
+    fields.raw("\x09\1u\0"sv);
+    fields.number(header.descriptors);
+  }
+  const std::string fieldBytes = fields.take();
+
+  Marshalled whole(header.bigEndian);
+  // One-way; version 1.
+  whole.raw(header.bigEndian ? "B\1\1\1"sv : "l\1\1\1"sv);
+  whole.number(static_cast<std::uint32_t>(body.size()));
+  whole.number(1);
+  whole.number(static_cast<std::uint32_t>(fieldBytes.size()));
+  whole.raw(fieldBytes);
+  whole.align(8);
+  whole.raw(body);
+  return whole.take();
+}
+
+std::string RawClient::bytesDictionary(std::size_t size) {
+  Marshalled entry(false);  // stands at a multiple of 8
+  entry.text("k");
+  entry.signature("ay");
+  entry.number(static_cast<std::uint32_t>(size));
+  entry.raw(std::string(size, 'x'));
+  const std::string bytes = entry.take();
+  Marshalled body(false);
+  body.number(static_cast<std::uint32_t>(bytes.size()));
+  body.align(8);
+  body.raw(bytes);
+  return body.take();
+}
+
+// --- LogCapture
+
+LogCapture::LogCapture() {
+  SystemLog::setSink([lines = _lines](LogLevel level, std::string_view line) {
+    lines->add(std::to_string(static_cast<int>(level)) + " " + std::string(line));
+  });
+}
+
+LogCapture::~LogCapture() { SystemLog::setSink({}); }
+
+}  // namespace vesk::test

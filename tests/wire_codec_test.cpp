@@ -1,0 +1,265 @@
+// Values as D-Bus messages, in both directions and at their limits.
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+
+#include <limits>
+
+#include "platform/files/FileDescriptor.h"
+#include "platform/ipc/BusCodec.h"
+#include "platform/ipc/BusHandles.h"
+
+namespace vesk {
+namespace {
+
+/// Makes messages; a bus is needed for that, a peer is not.
+class WireCodec : public testing::Test {
+ protected:
+  void SetUp() override {
+    int ends[2];
+    ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends), 0);
+    sd_bus* bus = nullptr;
+    ASSERT_GE(sd_bus_new(&bus), 0);
+    _bus.reset(bus);
+    ASSERT_GE(sd_bus_set_fd(bus, ends[0], ends[0]), 0);
+    _peer = FileDescriptor(ends[1]);
+    ASSERT_GE(sd_bus_start(bus), 0);
+    fresh();
+  }
+
+  void fresh() {
+    sd_bus_message* raw = nullptr;
+    ASSERT_GE(sd_bus_message_new_method_call(_bus.get(), &raw, nullptr, "/o", "i.f", "m"), 0);
+    _message.reset(raw);
+  }
+
+  sd_bus_message* message() { return _message.get(); }
+  void seal() { ASSERT_GE(sd_bus_message_seal(message(), 1, 0), 0); }
+
+  template <class... Arguments>
+  Value decoded(const char* types, Arguments... arguments) {
+    fresh();
+    EXPECT_GE(sd_bus_message_append(message(), types, arguments...), 0) << types;
+    seal();
+    BusDecoder decoder(message());
+    Value value;
+    EXPECT_TRUE(decoder.read(value)) << types << ": " << describe(decoder.result());
+    return value;
+  }
+
+  BusHandle _bus;
+  FileDescriptor _peer;
+  BusMessageHandle _message;
+};
+
+TEST_F(WireCodec, ReadsEveryBasicTypeAsTheValueItMeans) {
+  EXPECT_EQ(decoded("v", "b", 1), Value(true));
+  EXPECT_EQ(decoded("v", "y", 200), Value(200u));
+  EXPECT_EQ(decoded("v", "q", 65535), Value(65535u));
+  EXPECT_EQ(decoded("v", "u", 4294967295u), Value(4294967295u));
+  EXPECT_EQ(decoded("v", "t", std::numeric_limits<std::uint64_t>::max()),
+            Value(std::numeric_limits<std::uint64_t>::max()));
+  EXPECT_EQ(decoded("v", "n", -32768), Value(-32768));
+  EXPECT_EQ(decoded("v", "i", -5), Value(-5));
+  EXPECT_EQ(decoded("v", "x", std::numeric_limits<std::int64_t>::min()),
+            Value(std::numeric_limits<std::int64_t>::min()));
+  EXPECT_EQ(decoded("v", "d", 1.5), Value(1.5));
+  EXPECT_EQ(decoded("v", "s", "héllo"), Value("héllo"));
+  EXPECT_EQ(decoded("v", "o", "/a/b"), Value("/a/b"));
+  EXPECT_EQ(decoded("v", "g", "a{sv}"), Value("a{sv}"));
+  EXPECT_EQ(decoded("v", "g", ""), Value());
+  EXPECT_EQ(decoded("v", "(d)", 12.25), Value(Date{12.25}));
+  EXPECT_EQ(decoded("s", "bare"), Value("bare"));
+}
+
+TEST_F(WireCodec, ReadsEveryContainerAsListDictionaryOrBytes) {
+  EXPECT_EQ(decoded("v", "ay", 3, 0, 255, 7), Value(Bytes(std::string("\x00\xff\x07", 3))));
+  EXPECT_EQ(decoded("v", "as", 2, "a", "b"), Value(List{"a", "b"}));
+  EXPECT_EQ(decoded("v", "an", 2, 1, -1), Value(List{1, -1}));
+  EXPECT_EQ(decoded("v", "aay", 2, 1, 65, 0), Value(List{Bytes("A"), Bytes()}));
+  EXPECT_EQ(decoded("v", "(is)", 4, "x"), Value(List{4, "x"}));
+  EXPECT_EQ(decoded("v", "a(ii)", 1, 3, 4), Value(List{List{3, 4}}));
+  EXPECT_EQ(decoded("v", "a{ss}", 1, "k", "v"), Value(Dictionary{{"k", "v"}}));
+  EXPECT_EQ(decoded("v", "a{is}", 1, 9, "v"), Value(List{List{9, "v"}}));
+  EXPECT_EQ(decoded("v", "v", "v", "u", 1), Value(1u));
+  EXPECT_EQ(decoded("av", 0), Value(List{}));
+  EXPECT_EQ(decoded("a{sv}", 2, "k", "i", 1, "k", "i", 2), Value(Dictionary{{"k", 2}}))
+      << "the last value of a key wins";
+}
+
+TEST_F(WireCodec, WritesEveryKindSoThatItReadsBackTheSame) {
+  const Dictionary inner{{"text", "ünï"}, {"", ""}};
+  const Dictionary all{{"none", Value()},
+                       {"true", true},
+                       {"false", false},
+                       {"signed", std::numeric_limits<std::int64_t>::min()},
+                       {"unsigned", std::numeric_limits<std::uint64_t>::max()},
+                       {"double", -0.1},
+                       {"infinite", std::numeric_limits<double>::infinity()},
+                       {"bytes", Bytes(std::string("\0x", 2))},
+                       {"no bytes", Bytes()},
+                       {"date", Date{-1.5}},
+                       {"list", List{1, "two", List{}, inner}},
+                       {"dictionary", inner},
+                       {"empty", Dictionary()}};
+  BusEncoder encoder(message());
+  encoder.append(all);
+  encoder.append(List{all});
+  encoder.append(true);
+  encoder.append(std::uint16_t{65535});
+  encoder.append(2.5);
+  encoder.append(std::string("s"));
+  encoder.append(std::optional<Dictionary>());
+  encoder.append(std::optional<Dictionary>(inner));
+  encoder.append(std::optional<std::string>("one"));
+  encoder.append(std::optional<std::vector<std::string>>({"a", "b"}));
+  encoder.append(std::vector<std::string>{"f"});
+  encoder.append(IPCDescriptor{});
+  ASSERT_TRUE(encoder.ok()) << describe(encoder.result());
+  seal();
+  EXPECT_STREQ(sd_bus_message_get_signature(message(), true), "a{sv}avbqdsaa{sv}aa{sv}asaasasah");
+
+  BusDecoder decoder(message());
+  Dictionary dictionary;
+  List list;
+  List frameworks;
+  bool flag = false;
+  std::uint16_t number = 0;
+  double real = 0;
+  std::string text;
+  std::optional<Dictionary> absent = inner;
+  std::optional<Dictionary> present;
+  std::optional<std::string> one;
+  std::optional<std::vector<std::string>> names;
+  int descriptor = 0;
+  EXPECT_TRUE(decoder.read(dictionary) && decoder.read(list) && decoder.read(flag) && decoder.read(number) &&
+              decoder.read(real) && decoder.read(text) && decoder.read(absent) && decoder.read(present) &&
+              decoder.read(one) && decoder.read(names) && decoder.read(frameworks) &&
+              decoder.readDescriptor(descriptor))
+      << describe(decoder.result());
+  EXPECT_EQ(dictionary, all);
+  EXPECT_EQ(list, List{all});
+  EXPECT_TRUE(flag);
+  EXPECT_EQ(number, 65535);
+  EXPECT_EQ(real, 2.5);
+  EXPECT_EQ(text, "s");
+  EXPECT_EQ(absent, std::nullopt);
+  EXPECT_EQ(present, inner);
+  EXPECT_EQ(one, "one");
+  EXPECT_EQ(names, (std::vector<std::string>{"a", "b"}));
+  EXPECT_EQ(frameworks, List{"f"});
+  EXPECT_EQ(descriptor, -1);
+}
+
+TEST_F(WireCodec, RefusesWhatHasNoValue) {
+  const int descriptor = _peer.get();
+  ASSERT_GE(sd_bus_message_append(message(), "v", "h", descriptor), 0);
+  seal();
+  BusDecoder decoder(message());
+  Value value;
+  EXPECT_FALSE(decoder.read(value));
+  EXPECT_EQ(decoder.result(), CodecResult::WrongType);
+  bool more = false;
+  EXPECT_FALSE(decoder.read(more)) << "a failure sticks";
+}
+
+TEST_F(WireCodec, RefusesMoreThanOneOfWhatMayBeAbsent) {
+  ASSERT_GE(sd_bus_message_append(message(), "asaa{sv}", 2, "a", "b", 2, 0, 0), 0);
+  seal();
+  std::optional<std::string> text;
+  BusDecoder texts(message());
+  EXPECT_FALSE(texts.read(text));
+  EXPECT_EQ(texts.result(), CodecResult::WrongType);
+}
+
+/// `depth` lists around a number.
+Value nested(std::size_t depth) {
+  Value value = 1;
+  for (std::size_t i = 0; i < depth; ++i) value = List{value};
+  return value;
+}
+
+TEST_F(WireCodec, TakesWhatIsAsDeepAsTheLimitAndNoDeeper) {
+  auto decode = [&](std::size_t depth, CodecLimits limits) {
+    fresh();
+    BusEncoder encoder(message());
+    encoder.append(*nested(depth).list());
+    if (!encoder.ok()) return encoder.result();
+    seal();
+    BusDecoder decoder(message(), limits);
+    List list;
+    if (decoder.read(list)) {
+      EXPECT_EQ(Value(list), nested(depth));
+    }
+    return decoder.result();
+  };
+  EXPECT_EQ(decode(20, {.depth = 20}), CodecResult::Ok);
+  EXPECT_EQ(decode(21, {.depth = 20}), CodecResult::LimitExceeded);
+  // sd-bus has room for 63 lists (each an array and a variant), which is less than the limit.
+  EXPECT_EQ(decode(63, {}), CodecResult::Ok);
+  EXPECT_EQ(decode(65, {}), CodecResult::LimitExceeded);
+  EXPECT_EQ(decode(100, {}), CodecResult::LimitExceeded);
+}
+
+TEST_F(WireCodec, UnwrapsVariantsInVariants) {
+  for (int i = 0; i < 100; ++i)
+    ASSERT_GE(sd_bus_message_open_container(message(), 'v', i < 99 ? "v" : "b"), 0);
+  int one = 1;
+  ASSERT_GE(sd_bus_message_append_basic(message(), 'b', &one), 0);
+  for (int i = 0; i < 100; ++i) ASSERT_GE(sd_bus_message_close_container(message()), 0);
+  seal();
+  BusDecoder decoder(message());
+  Value value;
+  EXPECT_TRUE(decoder.read(value));
+  EXPECT_EQ(value, Value(true));
+}
+
+TEST_F(WireCodec, CountsValuesAndContentOverAllArguments) {
+  const std::string text(100, 'x');
+  auto decode = [&](CodecLimits limits) {
+    BusDecoder decoder(message(), limits);
+    Dictionary first;
+    Dictionary second;
+    sd_bus_message_rewind(message(), true);
+    static_cast<void>(decoder.read(first) && decoder.read(second));
+    return decoder.result();
+  };
+  BusEncoder encoder(message());
+  encoder.append(Dictionary{{"a", text}});
+  encoder.append(Dictionary{{"b", text}});
+  seal();
+  // Two dictionaries of one value: 4 values at 8 bytes, 2 keys and 2 texts.
+  EXPECT_EQ(decode({.content = 234}), CodecResult::Ok);
+  EXPECT_EQ(decode({.content = 233}), CodecResult::LimitExceeded);
+  EXPECT_EQ(decode({.nodes = 4}), CodecResult::Ok);
+  EXPECT_EQ(decode({.nodes = 3}), CodecResult::LimitExceeded);
+}
+
+TEST_F(WireCodec, WritesNothingThatItsReaderWouldRefuse) {
+  struct Case {
+    const char* what;
+    Dictionary value;
+    CodecResult expected;
+  };
+  const Case cases[] = {
+      {"overlong", {{"k", "\xC0\xAF"}}, CodecResult::Malformed},
+      {"surrogate", {{"k", "\xED\xA0\x80"}}, CodecResult::Malformed},
+      {"above the last character", {{"k", "\xF4\x90\x80\x80"}}, CodecResult::Malformed},
+      {"cut off", {{"k", "\xE2\x82"}}, CodecResult::Malformed},
+      {"lone continuation", {{"\x80", 1}}, CodecResult::Malformed},
+      {"NUL", {{"k", std::string_view("a\0b", 3)}}, CodecResult::Malformed},
+      {"first and last of each length",
+       {{"k", "\x01\x7F\xC2\x80\xDF\xBF\xE0\xA0\x80\xEF\xBF\xBF\xF0\x90\x80\x80\xF4\x8F\xBF\xBF"}},
+       CodecResult::Ok},
+      {"1 MiB", {{"k", std::string(std::size_t{1} << 20, 'x')}}, CodecResult::LimitExceeded},
+      {"100,000 values", {{"k", List(std::vector<Value>(100'000))}}, CodecResult::LimitExceeded},
+  };
+  for (const auto& test : cases) {
+    fresh();
+    BusEncoder encoder(message());
+    EXPECT_EQ(encoder.append(test.value), test.expected == CodecResult::Ok) << test.what;
+    EXPECT_EQ(encoder.result(), test.expected) << test.what;
+  }
+}
+
+}  // namespace
+}  // namespace vesk
