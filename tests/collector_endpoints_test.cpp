@@ -99,11 +99,6 @@ TEST_F(CollectorEndpoints, RefuseWhatIsNoPostAndSaveNothing) {
       {"no gzip", post(kGoodBody, {{"Content-Encoding", "gzip"}}), 400, "no whole gzip stream"},
       {"gzip cut", post(gzip(kGoodBody).substr(0, 40), {{"Content-Encoding", "gzip"}}), 400, "no whole gzip"},
       {"gzip and more", post(gzip(kGoodBody) + "x", {{"Content-Encoding", "gzip"}}), 400, "bytes follow"},
-      {"gzip bomb",
-       post(gzip(std::string(65'000'000, ' ')) + gzip(std::string(65'000'000, ' ')),
-            {{"Content-Encoding", "gzip"}}),
-       400, "bytes follow"},
-      {"bomb", post(gzip(std::string(70'000'000, ' ')), {{"Content-Encoding", "gzip"}}), 400, "more than"},
       {"sender", post(kGoodBody, {{"X-Vesk-Sender", "hd"}}), 400, "X-Vesk-Sender"},
       {"build", post(kGoodBody, {{"X-Vesk-Internal-Build", "0"}}), 400, "X-Vesk-Internal-Build must be 1"},
       {"map", post(kGoodBody, {{"X-Vesk-Event-Map", "3,2"}}), 400, "X-Vesk-Event-Map must be two numbers"},
@@ -255,10 +250,25 @@ TEST_F(StorebagServing, GivesItsFaults) {
   EXPECT_EQ(verdictOn(get("/bags/zelko")), StorebagVerdict::Valid);
 }
 
+TEST(Console, ShowsNothingThatSteersATerminal) {
+  EXPECT_EQ(printable("a\x1b[2J\n\x7f"), "a\\x1b[2J\\x0a\\x7f");
+  EXPECT_EQ(printable("gr\u00fc\u00dfe \u0090"), "gr\u00fc\u00dfe \\xc2\\x90");
+  EXPECT_EQ(printable("\xff\xc3\xbc"), "\\xff\\xc3\\xbc");
+}
+
 TEST(HTTPDate, ReadsWhatItWritesAndNothingElse) {
   EXPECT_EQ(timeFromHTTPDate(httpDate(1'795'552'289)), 1'795'552'289);
   for (const char* text : {"", "Tue, 24 Nov 2026", "Tue, 24 Nov 2026 20:31:29 GMT x", "2026-11-24"})
     EXPECT_FALSE(timeFromHTTPDate(text)) << text;
+}
+
+TEST(HTTPReceived, UnpacksNoMoreThanItsLimit) {
+  for (std::size_t size : {1000, 1001}) {
+    auto packed = request("POST", "/", {{"Content-Encoding", "gzip"}}, gzip(std::string(size, 'x')));
+    auto plain = request("POST", "/", {}, std::string(size, 'x'));
+    EXPECT_EQ(packed.decodedBody(1000).body.has_value(), size == 1000);
+    EXPECT_EQ(plain.decodedBody(1000).body.has_value(), size == 1000);
+  }
 }
 
 TEST(HTTPReceived, FindsPathAndQuery) {

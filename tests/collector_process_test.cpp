@@ -96,7 +96,9 @@ TEST_F(CollectorProcess, GoesOnWithoutAnOutputAndKeepsItsKeys) {
     EXPECT_EQ(WebClient(fact("authorityFile")).post(fact("eventsURL"), kPost, kPostHeaders).status, 200);
     collector.signal(SIGTERM);
     EXPECT_EQ(collector.wait(), 0) << collector.errors();
-    if (start == 1) EXPECT_EQ(_files.read("collector/ca.pem"), authority);
+    if (start == 1) {
+      EXPECT_EQ(_files.read("collector/ca.pem"), authority);
+    }
     authority = _files.read("collector/ca.pem");
     std::filesystem::remove(_files / "ready.json");
   }
@@ -114,7 +116,7 @@ TEST_F(CollectorProcess, TellsUsageFromFailure) {
       {{"--http-port", "70000"}, 2, "70000"},
       {{"--fault", "post=often"}, 2, "unknown fault 'often'"},
       {{"--address", "192.0.2.1"}, 1, "can't listen on 192.0.2.1"},
-      {{"--directory", "/proc/none"}, 1, "/proc/none"},
+      {{"--storebags", "/proc/none"}, 1, "/proc/none"},
   };
   for (const auto& test : cases) {
     auto command = options();

@@ -52,6 +52,7 @@ SigningKey SigningKey::openOrCreate(const std::filesystem::path& directory) {
 void SigningKey::save(const std::filesystem::path& directory) const {
   for (const auto& path : {privateKeyFile(directory), publicKeyFile(directory)})
     if (std::filesystem::exists(path)) throw std::runtime_error(path.string() + " exists already");
+  if (!directory.empty()) std::filesystem::create_directories(directory);
   writeWholeFile(privateKeyFile(directory), privateKeyPEM(), 0600);
   writeWholeFile(publicKeyFile(directory), publicKeyDER(), 0644);
 }

@@ -27,7 +27,8 @@ class SigningKey {
     return directory / "publicKey.der";
   }
 
-  /// Writes the two files (the private one with mode 0600). Refuses to replace either.
+  /// Writes the two files (the private one with mode 0600), and makes the directory when it is missing.
+  /// Refuses to replace either file.
   void save(const std::filesystem::path& directory) const;
 
   std::string privateKeyPEM() const;

@@ -1,0 +1,128 @@
+#include "tools/collector/Collector.h"
+
+#include <stdexcept>
+
+#include "tools/collector/CertificateAuthority.h"
+#include "tools/collector/ControlEndpoint.h"
+#include "tools/collector/EventsEndpoint.h"
+#include "tools/collector/StorebagEndpoint.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr char kEventsPath[] = "/events";
+constexpr char kGeneralStorebagsPath[] = "/bags";
+constexpr char kPartnersStorebagsPath[] = "/storebags";
+constexpr char kStorebagBase[] = "/bags/sorrel";
+constexpr char kControlPath[] = "/_control";
+
+CollectorOptions completed(CollectorOptions options) {
+  namespace fs = std::filesystem;
+  options.directory = fs::absolute(options.directory);
+  if (options.storebags.empty()) options.storebags = options.directory / "storebags";
+  if (options.events.empty()) options.events = options.directory / "events.jsonl";
+  options.storebags = fs::absolute(options.storebags);
+  options.events = fs::absolute(options.events);
+  fs::create_directories(options.directory);
+  fs::create_directories(options.storebags);
+  fs::create_directories(options.events.parent_path());
+  return options;
+}
+
+}  // namespace
+
+struct Collector::Parts {
+  Parts(CollectorOptions given, Console& theConsole)
+      : options(completed(std::move(given))),
+        console(theConsole),
+        authority(CertificateAuthority::openOrCreate(options.directory)),
+        key(SigningKey::openOrCreate(options.directory)),
+        folder(options.storebags, options.checks),
+        events({console, stats, faults}, options.events),
+        storebags({console, stats, faults, folder, key}, options.maximumAge),
+        control(console, stats, faults),
+        securePaths(Refusals(console, stats)),
+        plainPaths(Refusals(console, stats)) {
+    for (const auto& fault : options.faults)
+      if (auto problem = faults.add(fault)) throw std::runtime_error(*problem);
+    // What else is to be taken over HTTP gets its endpoint above and its path here.
+    for (EndpointTable* paths : {&securePaths, &plainPaths}) {
+      paths->add(kEventsPath, events);
+      paths->add(kGeneralStorebagsPath, storebags);
+      paths->add(kPartnersStorebagsPath, storebags);
+    }
+    plainPaths.add(kControlPath, control);
+    secure = serve(securePaths, options.httpsPort, authority.issueServerIdentity(options.names));
+    plain = serve(plainPaths, options.httpPort, std::nullopt);
+  }
+
+  std::unique_ptr<HTTPServer> serve(const EndpointTable& paths, std::uint16_t port,
+                                    std::optional<TLSIdentity> identity) {
+    HTTPServer::Options server;
+    server.address = options.address;
+    server.port = port;
+    server.tls = std::move(identity);
+    server.onRefused = [this](const std::string& line) {
+      ++stats.notHTTP;
+      console.problem("refused " + line);
+    };
+    return std::make_unique<HTTPServer>(
+        server, [&paths](const HTTPReceived& received) { return paths.answer(received); });
+  }
+
+  const CollectorOptions options;
+  Console& console;
+  CollectorStats stats;
+  FaultPlan faults;
+  const CertificateAuthority authority;
+  const SigningKey key;
+  StorebagFolder folder;
+  EventsEndpoint events;
+  StorebagEndpoint storebags;
+  ControlEndpoint control;
+  EndpointTable securePaths;
+  EndpointTable plainPaths;
+
+  // Last, since their threads use all of the above.
+  std::unique_ptr<HTTPServer> secure;
+  std::unique_ptr<HTTPServer> plain;
+};
+
+Collector::Collector(CollectorOptions options, Console& console)
+    : _parts(std::make_unique<Parts>(std::move(options), console)) {}
+
+Collector::~Collector() = default;
+
+Dictionary Collector::facts() const {
+  const auto& directory = _parts->options.directory;
+  std::string https = _parts->secure->baseURL();
+  std::string http = _parts->plain->baseURL();
+  return Dictionary{
+      {"httpsPort", static_cast<int>(_parts->secure->port())},
+      {"httpPort", static_cast<int>(_parts->plain->port())},
+      {"eventsURL", https + kEventsPath},
+      {"storebagURL", https + kStorebagBase},
+      {"controlURL", http + kControlPath},
+      {"authorityFile", CertificateAuthority::certificateFile(directory).string()},
+      {"publicKeyFile", SigningKey::publicKeyFile(directory).string()},
+      {"signingKeyFile", SigningKey::privateKeyFile(directory).string()},
+      {"storebags", _parts->options.storebags.string()},
+      {"events", _parts->options.events.string()},
+  };
+}
+
+std::string Collector::introduction() const {
+  Dictionary all = facts();
+  auto fact = [&](const char* key) { return all.text(key)->string(); };
+  std::string http = _parts->plain->baseURL();
+  return "veskcollector takes events at " + fact("eventsURL") + " and " + http + kEventsPath +
+         "\n  and saves them to " + fact("events") + "\nIt serves storebags at " + fact("storebagURL") +
+         " and " + http + kStorebagBase + "\n  from NAME.toml and NAME.json in " + fact("storebags") +
+         "\nClients trust it with    SSL_CERT_FILE=" + fact("authorityFile") +
+         "\nStorebags are verified with publicKey.der from " + fact("publicKeyFile") +
+         "\nThe daemon finds it with the preference    veskreporting_storebag_url = \"" +
+         fact("storebagURL") + "\"\nFaults are set and counters read at " + fact("controlURL");
+}
+
+}  // namespace vesk

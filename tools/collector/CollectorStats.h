@@ -1,0 +1,23 @@
+// What the collector has counted since it started.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+
+namespace vesk {
+
+/// Each counter is synchronised by itself.
+struct CollectorStats {
+  using Counter = std::atomic<std::uint64_t>;
+
+  Counter posts = 0;               ///< taken
+  Counter events = 0;              ///< in the posts taken
+  Counter eventsNotSaved = 0;      ///< taken, but the file could not be written
+  Counter storebagsSent = 0;       ///< whole, also those with a bad signature on demand
+  Counter storebagsUnchanged = 0;  ///< answered with 304
+  Counter refused = 0;             ///< requests that were not the protocol
+  Counter notHTTP = 0;             ///< connections that did not get as far as a request
+  Counter faults = 0;              ///< faults on demand
+};
+
+}  // namespace vesk

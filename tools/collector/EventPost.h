@@ -1,0 +1,28 @@
+// One post of events, as the daemon sends it.
+#pragma once
+
+#include <optional>
+#include <string>
+
+#include "platform/values/Value.h"
+#include "tools/collector/HTTPMessage.h"
+
+namespace vesk {
+
+struct EventPost {
+  double postTime = 0;  ///< seconds since 1970
+  std::string clientId;
+  List events;               ///< at least one; each a flat dictionary of texts, numbers and booleans
+  std::size_t jsonSize = 0;  ///< bytes of the body once unpacked
+};
+
+/// The post, or why the request is none.
+struct EventPostOutcome {
+  std::optional<EventPost> post;
+  std::string problem;
+};
+
+/// Checks everything that the protocol says of a post: headers, encoding and the shape of the JSON body.
+EventPostOutcome readEventPost(const HTTPReceived& received);
+
+}  // namespace vesk

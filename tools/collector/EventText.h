@@ -1,0 +1,19 @@
+// Events as text: for a person, and as JSON lines.
+#pragma once
+
+#include <string>
+
+#include "platform/time/Clock.h"
+#include "tools/collector/EventPost.h"
+
+namespace vesk {
+
+/// The post on one line, its X-Vesk headers, then each event with its entries; without the last line feed and
+/// with no control character but line feeds.
+std::string readableText(const EventPost& post, const HTTPReceived& received, WallTime now);
+
+/// One line an event, each with its line feed: a JSON object of "received" (seconds since 1970), "peer",
+/// "path", "headers", "postTime", "clientId" and "event".
+std::string jsonLines(const EventPost& post, const HTTPReceived& received, WallTime now);
+
+}  // namespace vesk

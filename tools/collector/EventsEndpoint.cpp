@@ -1,0 +1,68 @@
+#include "tools/collector/EventsEndpoint.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+
+#include "platform/files/FileDescriptor.h"
+#include "tools/collector/EventText.h"
+
+namespace vesk {
+
+EventsEndpoint::EventsEndpoint(Parts parts, std::filesystem::path file)
+    : _parts(parts), _refuse(parts.console, parts.stats), _file(std::move(file)) {}
+
+HTTPAnswer EventsEndpoint::answer(const HTTPReceived& received) {
+  auto fault = _parts.faults.take(FaultTarget::Post);
+  HTTPAnswer answer;
+  if (!fault || fault->isOnlyInTheAnswer()) answer = take(received);
+  if (fault) {
+    ++_parts.stats.faults;
+    _parts.console.note("fault on demand for " + received.method + " " + received.target + " from " +
+                        received.peer);
+    fault->applyTo(answer);
+  }
+  return answer;
+}
+
+HTTPAnswer EventsEndpoint::take(const HTTPReceived& received) {
+  if (received.method != "POST") return _refuse.wrongMethod(received, "POST");
+  EventPostOutcome outcome = readEventPost(received);
+  if (!outcome.post) return _refuse(received, 400, outcome.problem);
+  record(*outcome.post, received);
+  HTTPAnswer answer;
+  answer.headers = {{"Content-Type", "application/json"}};
+  answer.body = "{\"accepted\":" + std::to_string(outcome.post->events.size()) + "}\n";
+  return answer;
+}
+
+void EventsEndpoint::record(const EventPost& post, const HTTPReceived& received) {
+  WallTime now = _parts.clock.now();
+  std::string lines = jsonLines(post, received, now);
+  save(lines, post.events.size());
+  if (_parts.console.style() == Console::Style::JSON) {
+    lines.pop_back();
+    _parts.console.event(lines);
+  } else {
+    _parts.console.event(readableText(post, received, now));
+  }
+  ++_parts.stats.posts;
+  _parts.stats.events += post.events.size();
+}
+
+void EventsEndpoint::save(const std::string& lines, std::size_t events) {
+  FileDescriptor file(::open(_file.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0644));
+  if (file) {
+    // One write, so that the lines of posts which arrive on two ports at once do not mix.
+    ssize_t written = ::write(file.get(), lines.data(), lines.size());
+    if (written == static_cast<ssize_t>(lines.size())) return;
+    if (written >= 0) errno = ENOSPC;
+  }
+  _parts.stats.eventsNotSaved += events;
+  _parts.console.problem("can't save " + std::to_string(events) + " events to " + _file.string() + ": " +
+                         std::strerror(errno));
+}
+
+}  // namespace vesk
