@@ -1,6 +1,5 @@
 #include "platform/service/SchedulingClass.h"
 
-#include <linux/ioprio.h>
 #include <sched.h>
 #include <sys/resource.h>
 #include <sys/syscall.h>
@@ -20,6 +19,12 @@ constexpr int kUtilityNice = 5;
 constexpr int kLowestNice = 19;
 constexpr int kUtilityDiskLevel = 6;
 
+// The kernel's numbers for ioprio_set. Its own header is C in some versions: it has a parameter named "class".
+constexpr int kPriorityOfProcess = 1;
+constexpr int kDiskClassShift = 13;
+constexpr int kDiskClassBestEffort = 2;
+constexpr int kDiskClassIdle = 3;
+
 void warn(const char* what) {
   VESK_LOG_WARNING("enterSchedulingClass: %s: %s", what, std::generic_category().message(errno).c_str());
 }
@@ -38,10 +43,10 @@ void chooseBatchPolicy() {
 }
 
 void lowerDiskPriority() {
-  long current = ::syscall(SYS_ioprio_get, IOPRIO_WHO_PROCESS, 0);
-  if (current >= 0 && IOPRIO_PRIO_CLASS(current) == IOPRIO_CLASS_IDLE) return;
-  int priority = IOPRIO_PRIO_VALUE(IOPRIO_CLASS_BE, kUtilityDiskLevel);
-  if (::syscall(SYS_ioprio_set, IOPRIO_WHO_PROCESS, 0, priority) != 0) warn("disk priority");
+  long current = ::syscall(SYS_ioprio_get, kPriorityOfProcess, 0);
+  if (current >= 0 && (current >> kDiskClassShift & 7) == kDiskClassIdle) return;
+  int priority = kDiskClassBestEffort << kDiskClassShift | kUtilityDiskLevel;
+  if (::syscall(SYS_ioprio_set, kPriorityOfProcess, 0, priority) != 0) warn("disk priority");
 }
 
 }  // namespace
