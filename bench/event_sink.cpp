@@ -1,0 +1,65 @@
+// Where the end-to-end bench's events end: counts each message id.
+//
+// Usage: event_sink FIRST-FILE [tls]
+// Writes its port (and with tls the authority's certificate beside it) to FIRST-FILE, then serves until standard input
+// ends; then prints "events E distinct D".
+#include <cstdio>
+#include <cstring>
+#include <fstream>
+#include <iostream>
+#include <mutex>
+#include <unordered_set>
+
+#include "tools/collector/CertificateAuthority.h"
+#include "tools/collector/HTTPServer.h"
+
+namespace {
+
+class IdCounter {
+ public:
+  // Each event holds "msgid":N once; nothing else of the body is looked at, to leave the cores to the others.
+  void count(const std::string& body) {
+    static constexpr char kKey[] = "\"msgid\":";
+    std::lock_guard lock(_mutex);
+    for (const char* at = body.c_str(); (at = std::strstr(at, kKey)) != nullptr;) {
+      at += sizeof kKey - 1;
+      if (*at == '"') ++at;
+      ++_events;
+      _distinct.insert(std::strtol(at, nullptr, 10));
+    }
+  }
+  void print() {
+    std::lock_guard lock(_mutex);
+    std::printf("events %zu distinct %zu\n", _events, _distinct.size());
+  }
+
+ private:
+  std::mutex _mutex;
+  std::size_t _events = 0;
+  std::unordered_set<long> _distinct;
+};
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  if (argc < 2) return 2;
+  const std::string file = argv[1];
+  vesk::HTTPServer::Options options;
+  if (argc > 2) {
+    auto authority = vesk::CertificateAuthority::generate();
+    options.tls = authority.issueServerIdentity();
+    std::ofstream(file + ".ca") << authority.certificate();
+  }
+  IdCounter ids;
+  vesk::HTTPServer server(options, [&](const vesk::HTTPReceived& request) {
+    if (auto decoded = request.decodedBody(); decoded.body) ids.count(*decoded.body);
+    return vesk::HTTPAnswer::text(200, "ok");
+  });
+  std::ofstream(file + ".new") << server.baseURL() << "\n";
+  std::rename((file + ".new").c_str(), file.c_str());
+  for (std::string line; std::getline(std::cin, line);) {
+    ids.print();
+    std::fflush(stdout);
+  }
+  return 0;
+}

@@ -1,0 +1,146 @@
+// What each piece of a message's road costs by itself.
+#include <VeskReporting/VeskReportingKeys.h>
+#include <benchmark/benchmark.h>
+#include <sys/socket.h>
+
+#include <cstdlib>
+#include <filesystem>
+
+#include "backends/VeskReportingBackend.h"
+#include "platform/files/FileDescriptor.h"
+#include "platform/files/RootPrefix.h"
+#include "platform/ipc/BusCodec.h"
+#include "platform/ipc/BusHandles.h"
+#include "platform/json/JSONWriter.h"
+#include "util/Gzip.h"
+
+namespace vesk {
+namespace {
+
+/// Eight mixed fields, as the end-to-end bench sends them.
+Dictionary payload() {
+  return Dictionary{{"msgid", 123456},          {"view", "Preferences/Network"}, {"username", "someone@example"},
+                    {"secret", "do-not-send"},  {"duration", 12.75},             {"count", 42},
+                    {"result", "completed-ok"}, {"ratio", 0.3333}};
+}
+
+const Dictionary kUserInfo{{kVeskReportingUserInfoClientName, "Bench"},
+                           {kVeskReportingUserInfoServiceName, "EndToEnd"}};
+
+/// A backend that makes, filters and holds records as in service, with nowhere to post them.
+std::shared_ptr<VeskReportingBackend> makeBackend(BackendServices& services) {
+  Dictionary entry{{"locale_whitelist", List{"US"}},
+                   {"sampling_threshold", 1.0},
+                   {"expedite", 0},
+                   {"filters", List{Dictionary{{"key", "username"}, {"action", "sha256"}},
+                                    Dictionary{{"key", "secret"}, {"action", "remove"}}}}};
+  auto backend = VeskReportingBackend::newBackendWithName(
+      kVeskReportingBackendHTTPPost, Dictionary{{"clients", List{entry}}}, Text("Phone"), 5, services);
+  backend->setRequireUserInfo(true);
+  backend->setUserInfoDict(kUserInfo);
+  backend->setCompType(5);
+  backend->setProductVersion(Text("12.1"));
+  backend->setBuildVersion(Text("21B91"));
+  backend->setHardwareType(Text("Phone7,2"));
+  backend->setSelfVersion("7.0");
+  backend->setCombinedSessionIDString("q2hyb25vbWV0ZXIgdGVzdA==");
+  backend->updateState();
+  return backend;
+}
+
+class Services {
+ public:
+  BackendServices services{_http,
+                           WallClock::system(),
+                           _counters,
+                           [](bool) { return std::string("3E8B9C50-6E5C-4B0E-9D43-0F6B8E5C7A11"); },
+                           [] { return false; },
+                           [] { return std::optional<std::string>("US"); }};
+
+ private:
+  HTTPClient _http;
+  Counters _counters;
+};
+
+void decode(benchmark::State& state) {
+  int ends[2];
+  if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) std::abort();
+  FileDescriptor peer(ends[1]);
+  sd_bus* raw = nullptr;
+  if (sd_bus_new(&raw) < 0 || sd_bus_set_fd(raw, ends[0], ends[0]) < 0 || sd_bus_start(raw) < 0) std::abort();
+  BusHandle bus(raw);
+  sd_bus_message* rawMessage = nullptr;
+  if (sd_bus_message_new_method_call(raw, &rawMessage, nullptr, "/o", "i.f", "m") < 0) std::abort();
+  BusMessageHandle message(rawMessage);
+  BusEncoder encoder(rawMessage);
+  if (!encoder.append(payload()) || sd_bus_message_seal(rawMessage, 1, 0) < 0) std::abort();
+  for (auto _ : state) {
+    sd_bus_message_rewind(rawMessage, 1);
+    BusDecoder decoder(rawMessage);
+    Dictionary dictionary;
+    if (!decoder.read(dictionary)) std::abort();
+    benchmark::DoNotOptimize(dictionary);
+  }
+}
+BENCHMARK(decode);
+
+/// Record, user info, filters and the place in the batch; the batch is given up every 50 events.
+void recordAndFilter(benchmark::State& state) {
+  Services shared;
+  auto backend = makeBackend(shared.services);
+  const Dictionary message = payload();
+  timeval now{1'700'000'000, 250'000};
+  int held = 0;
+  for (auto _ : state) {
+    benchmark::DoNotOptimize(backend->sendMessage(message, now, 3, 1, 0));
+    if (++held == 50) {
+      state.PauseTiming();
+      backend->flushMessages();
+      held = 0;
+      state.ResumeTiming();
+    }
+  }
+}
+BENCHMARK(recordAndFilter);
+
+std::string batchOf50() {
+  MutableDictionary event(payload());
+  for (const char* key : {"_startTS", "_clientVersion", "_eventNumber", "_method", "_status", "_internal"}) event.set(key, 1700000000);
+  for (const char* key : {"_clientTS", "eventTime"}) event.set(key, 1700000000.25);
+  for (const char* key : {"_sender", "_sessionID", "_productFamily", "_productModel", "_osVersion", "_build"}) {
+    event.set(key, "q2hyb25vbWV0");
+  }
+  JSONWriter writer(JSONStyle::Compact, 1 << 16);
+  writer.beginArray();
+  for (int i = 0; i < 50; ++i) {
+    event.set("msgid", i);
+    writer.value(event);
+  }
+  writer.endArray();
+  return writer.finish().value();
+}
+
+void jsonOfABatch(benchmark::State& state) {
+  for (auto _ : state) benchmark::DoNotOptimize(batchOf50());
+  state.SetItemsProcessed(state.iterations() * 50);
+}
+BENCHMARK(jsonOfABatch);
+
+void gzipOfABatch(benchmark::State& state) {
+  const std::string body = batchOf50();
+  for (auto _ : state) benchmark::DoNotOptimize(gzipDeflate(body));
+  state.SetItemsProcessed(state.iterations() * 50);
+}
+BENCHMARK(gzipOfABatch);
+
+}  // namespace
+}  // namespace vesk
+
+int main(int argc, char** argv) {
+  std::string root = std::filesystem::temp_directory_path() / "vesk-bench-XXXXXX";
+  if (!::mkdtemp(root.data())) return 1;
+  vesk::setRootPrefix(root);
+  benchmark::Initialize(&argc, argv);
+  benchmark::RunSpecifiedBenchmarks();
+  std::filesystem::remove_all(root);
+}
