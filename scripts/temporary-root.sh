@@ -1,5 +1,6 @@
-# Sourced by scripts that run the daemon and its company under a temporary root: starts programs, waits until they
-# are ready, and ends them and removes everything when the script ends, however it does.
+# Sourced by scripts that run the daemon and a collector under a temporary root: starts them, waits until they are
+# ready, and ends them and removes everything when the script ends, however it does. Run from the project's
+# directory.
 # shellcheck shell=bash
 
 # make_root: sets `root`, laid out as the daemon expects, without a key and without preferences.
@@ -9,9 +10,9 @@ make_root() {
   trap clean_up EXIT
   trap 'exit 130' INT
   trap 'exit 143' TERM
-  mkdir -p "$root"/{etc/veskreporting/preferences,usr/share/veskreporting,run,log}
-  cp -r packaging/share/. "$root/usr/share/veskreporting/"
   chmod 0755 "$root"
+  mkdir -p "$root"/{etc/veskreporting/preferences,usr/share,run,log}
+  cp -r packaging/share "$root/usr/share/veskreporting"
 }
 
 # start NAME COMMAND…: runs it in the background with its output in $root/log/NAME.
@@ -22,10 +23,11 @@ start() {
   processes[$name]=$!
 }
 
-# wait_for_line NAME TEXT: until the program has written TEXT; fails, with its output, when it ends before that.
-wait_for_line() {
-  local name=$1 text=$2
-  if ! timeout 60 grep -q -m1 -F -- "$text" < <(tail -n +1 -f --pid="${processes[$name]}" "$root/log/$name" 2>/dev/null); then
+# wait_for NAME TEXT [FILE]: until there is TEXT in FILE (the program's output); fails, with that output, when the
+# program ends before, or takes a minute.
+wait_for() {
+  local name=$1 text=$2 file=${3:-$root/log/$1}
+  if ! timeout 60 grep -q -m1 -F -- "$text" < <(tail -n +1 -F --pid="${processes[$name]}" "$file" 2>/dev/null); then
     echo "$name did not get as far as \"$text\":" >&2
     cat "$root/log/$name" >&2
     return 1
@@ -49,4 +51,36 @@ clean_up() {
   wait
   rm -rf "$root"
   exit "$status"
+}
+
+# fact NAME: what the collector's ready file says.
+fact() { python3 -c 'import json, sys; print(json.load(open(sys.argv[1]))[sys.argv[2]])' "$root/ready.json" "$1"; }
+
+# start_collector BIN: on free ports, with the example storebag; the daemon under this root will trust it.
+start_collector() {
+  start collector "$1/veskcollector" --directory "$root/collector" --https-port 0 --http-port 0 \
+    --ready-file "$root/ready.json"
+  wait_for collector '}' "$root/ready.json"
+  local events
+  events=$(fact eventsURL)
+  sed "s|@EVENTS@|$events|" examples/zelko.toml >"$(fact storebags)/zelko.toml"
+  cp "$(fact publicKeyFile)" "$root/usr/share/veskreporting/publicKey.der"
+  cat >"$root/etc/veskreporting/preferences/com.corvane.veskreporting.toml" <<EOF
+environmentType = 4
+diagnosticsSubmission = true
+veskreporting_storebag_url = "$(fact storebagURL)"
+EOF
+  cat >"$root/etc/veskreporting/device.toml" <<EOF
+DeviceName = "Demonstrator"
+ProductType = "Board1,1"
+RegionCode = "DE"
+EOF
+}
+
+# start_daemon BIN [OPTION…]: until it accepts clients.
+start_daemon() {
+  local bin=$1
+  shift
+  start daemon env SSL_CERT_FILE="$(fact authorityFile)" "$bin/veskreportingd" --root "$root" "$@"
+  wait_for daemon "start loop."
 }
