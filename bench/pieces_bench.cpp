@@ -54,7 +54,7 @@ class Services {
                            WallClock::system(),
                            _counters,
                            [](bool) { return std::string("3E8B9C50-6E5C-4B0E-9D43-0F6B8E5C7A11"); },
-                           [] { return false; },
+                           [] { return true; },
                            [] { return std::optional<std::string>("US"); }};
 
  private:
