@@ -166,7 +166,7 @@ const Value& smallSample() {
                  {"d", Date{1e9}},
                  {"b", Bytes("\0\x01"s)},
                  {"f", false},
-                 {"n", Dictionary{{"t", "text é"}, {"a fairly long key", List{List{}}}}}};
+                 {"n", Dictionary{{"t", "text é"}, {"a fairly long key", List{Value(List{})}}}}};
   return value;
 }
 

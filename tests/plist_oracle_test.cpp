@@ -28,7 +28,7 @@ Value sample() {
       {"data", List{Bytes(""), Bytes(std::string("\0\x01\xff", 3)), Bytes(allBytes)}},
       {"empty", List{List{}, Dictionary{}}},
       {"shared", List{"same", "same", Dictionary{{"same", "same"}}}},
-      {"ключ", Dictionary{{"deep", List{List{List{List{Dictionary{{"er", "!"}}}}}}}}},
+      {"ключ", Dictionary{{"deep", List{Value(List{Value(List{Value(List{Dictionary{{"er", "!"}}})})})}}}},
       {"many", many.share()},
   };
 }
