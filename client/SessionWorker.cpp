@@ -63,6 +63,8 @@ void SessionWorker::run() noexcept {
       // Out of memory, most likely: what waits goes on waiting.
       VESK_LOG_ERROR("VeskReporting: %s", error.what());
       ::poll(nullptr, 0, 100);
+    } catch (...) {
+      VESK_LOG_ERROR("VeskReporting: an unknown exception");
     }
   }
   endEverything();
@@ -91,14 +93,15 @@ void SessionWorker::endEverything() noexcept {
   _isConnected.store(false, std::memory_order_relaxed);
   _link.lose(Clock::now(), "the session was closed");
   if (_isFrontInBus && _waiting.front().wantsAnswer()) frontHasLeft();
-  do {
-    for (; !_waiting.empty(); frontHasLeft()) {
-      _drops.unsent();
-      end(_waiting.front().end, ReportingStatus::Closed, nullptr, "");
-    }
-    _queue.takeAll(_taken);
-    _waiting.append(_taken);
-  } while (!_waiting.empty());
+  auto close = [this](const ClientCall& call) {
+    _drops.unsent();
+    end(call.end, ReportingStatus::Closed, nullptr, "");
+  };
+  for (; !_waiting.empty(); frontHasLeft()) close(_waiting.front());
+  for (const ClientCall& call : _taken) close(call);
+  std::vector<ClientCall> last;
+  _queue.takeAll(last);
+  for (const ClientCall& call : last) close(call);
   endRequests(ReportingStatus::Closed, "");
 }
 
@@ -127,11 +130,8 @@ void SessionWorker::endOverdue(Time now) {
 
   auto first = _waiting.firstDeadline();
   if (!first || *first > now) return;
-  const ClientCall* inBus = _isFrontInBus ? &_waiting.front() : nullptr;
   std::vector<ClientCall> overdue;
-  _waiting.moveDue(overdue, [&](const ClientCall& call) {
-    return call.wantsAnswer() && call.deadline <= now && &call != inBus;
-  });
+  _waiting.moveOverdue(overdue, now);
   auto status = _link.isReady() ? ReportingStatus::TimedOut : ReportingStatus::NotConnected;
   for (const ClientCall& call : overdue) {
     ++_callsGone;
@@ -231,7 +231,8 @@ void SessionWorker::sendFront(Time now) {
     case BusClient::SendResult::Sent:
       _memory.note(front);
       _isFrontInBus = _link.bus().queuedMessages() > 0;
-      if (!_isFrontInBus) frontHasLeft();
+      if (!_isFrontInBus) return frontHasLeft();
+      front.deadline = Time::max();  // the bus minds it
       break;
     case BusClient::SendResult::Refused:
       _drops.invalid();

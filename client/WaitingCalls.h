@@ -17,12 +17,15 @@ class WaitingCalls {
   std::size_t size() const noexcept { return _calls.size() - _next; }
   ClientCall& front() noexcept { return _calls[_next]; }
   void popFront() noexcept {
+    if (_calls[_next].wantsAnswer()) --_answered;
     _calls[_next++] = ClientCall{};
     if (empty()) clear();
   }
 
   /// Appends `calls` and leaves them empty. When it throws std::bad_alloc, nothing has changed.
   void append(std::vector<ClientCall>& calls) {
+    std::size_t answered = 0;
+    for (const ClientCall& call : calls) answered += call.wantsAnswer() ? 1 : 0;
     if (empty()) {
       _calls.swap(calls);
       _next = 0;
@@ -33,16 +36,17 @@ class WaitingCalls {
       for (ClientCall& call : calls) _calls.push_back(std::move(call));
     }
     calls.clear();
+    _answered += answered;
   }
 
-  /// Moves those that `isDue` names to `due`, in order.
-  template <class Predicate>
-  void moveDue(std::vector<ClientCall>& due, Predicate isDue) {
+  /// Moves those whose answer is overdue to `overdue`, in order.
+  void moveOverdue(std::vector<ClientCall>& overdue, ClientCall::Time now) {
     removeGone();
     auto kept = _calls.begin();
     for (auto call = _calls.begin(); call != _calls.end(); ++call) {
-      if (isDue(*call)) {
-        due.push_back(std::move(*call));
+      if (call->wantsAnswer() && call->deadline <= now) {
+        --_answered;
+        overdue.push_back(std::move(*call));
       } else if (kept++ != call) {
         *std::prev(kept) = std::move(*call);
       }
@@ -53,6 +57,7 @@ class WaitingCalls {
   /// When the first of the answers owed is due.
   std::optional<ClientCall::Time> firstDeadline() const noexcept {
     std::optional<ClientCall::Time> first;
+    if (_answered == 0) return first;
     for (std::size_t i = _next; i < _calls.size(); ++i) {
       if (_calls[i].wantsAnswer() && (!first || _calls[i].deadline < *first)) first = _calls[i].deadline;
     }
@@ -71,6 +76,7 @@ class WaitingCalls {
 
   std::vector<ClientCall> _calls;
   std::size_t _next = 0;
+  std::size_t _answered = 0;  ///< calls that want an answer
 };
 
 }  // namespace vesk

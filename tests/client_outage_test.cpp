@@ -18,6 +18,13 @@ using namespace std::chrono_literals;
 const Dictionary kSessionInfo{{kVeskReportingSessionInfoSessionID, 7U},
                               {kVeskReportingSessionInfoClientType, 3}};
 
+// ThreadSanitizer ends a process that does.
+#if defined(__SANITIZE_THREAD__)
+constexpr bool kMayStartThreadsAfterFork = false;
+#else
+constexpr bool kMayStartThreadsAfterFork = true;
+#endif
+
 class ClientOutage : public testing::Test {
  protected:
   ReportingOptions options() const {
@@ -168,9 +175,11 @@ TEST_F(ClientOutage, AForkedProcessIsRefusedAndHarmsNothing) {
                      session->fetchDisplayURL().status == ReportingStatus::ForkedProcess &&
                      session->connect().status == ReportingStatus::ForkedProcess;
     session.reset();
-    // A session of its own is none of the parent's business.
-    VeskReporting own(options());
-    bool isServed = own.sendMessageAndWait(8, 8).status == ReportingStatus::Done;
+    bool isServed = true;
+    if (kMayStartThreadsAfterFork) {
+      VeskReporting own(options());
+      isServed = own.sendMessageAndWait(8, 8).status == ReportingStatus::Done;
+    }
     ::_exit(isRefused && isServed ? 0 : 1);
   }
   int status = -1;
@@ -178,7 +187,7 @@ TEST_F(ClientOutage, AForkedProcessIsRefusedAndHarmsNothing) {
   EXPECT_EQ(status, 0);
   EXPECT_EQ(session->sendMessageAndWait(7, 7).answer, "posted");
   EXPECT_EQ(record.count("message 6 6"), 0U);
-  EXPECT_EQ(record.count("message 8 8"), 1U);
+  EXPECT_EQ(record.count("message 8 8"), kMayStartThreadsAfterFork ? 1U : 0U);
 }
 
 TEST(ReconnectPolicy, WaitsTwiceAsLongAfterEachFailureAndAllowsOneEarlyAttemptAWait) {

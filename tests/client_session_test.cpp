@@ -90,8 +90,8 @@ TEST_F(ClientSession, AnswersThroughCallbacksInTheOrderOfTheCalls) {
     EXPECT_EQ(status, ReportingStatus::Queued);
   }
   EXPECT_EQ(once.get().answer, "finished");
-  EXPECT_EQ(started.get().answer, record.backends);
-  EXPECT_EQ(states.get().answer, record.backends);
+  EXPECT_EQ(started.get().answer, record.backends());
+  EXPECT_EQ(states.get().answer, record.backends());
   EXPECT_EQ(url.get().answer, "https://display.example/");
   EXPECT_EQ(message.get().answer, "posted");
   EXPECT_EQ(parameters.get().answer, std::nullopt);
@@ -102,9 +102,9 @@ TEST_F(ClientSession, AnswersThroughCallbacksInTheOrderOfTheCalls) {
 
 TEST_F(ClientSession, TellsNoStorebagFromNoEnabledBackend) {
   VeskReporting session(options());
-  record.backends = std::nullopt;
+  record.setBackends(std::nullopt);
   EXPECT_EQ(session.startConfig().answer, std::nullopt);
-  record.backends = BackendNames{};
+  record.setBackends(BackendNames{});
   EXPECT_EQ(session.startConfig().answer, BackendNames{});
 }
 

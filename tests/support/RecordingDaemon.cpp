@@ -31,12 +31,12 @@ class RecordingSession final : public ClientSessionInterface {
   }
   void startConfigWithCompletionHandler(Reply<std::optional<BackendNames>> reply) override {
     _record.add("startConfig");
-    answer(std::move(reply), _record.backends);
+    answer(std::move(reply), _record.backends());
   }
   void fetchStatesWithUserInfo(const std::optional<Dictionary>& userInfo,
                                Reply<std::optional<BackendNames>> reply) override {
     _record.add("fetchStates " + shown(userInfo));
-    answer(std::move(reply), _record.backends);
+    answer(std::move(reply), _record.backends());
   }
   void fetchDisplayURL(Reply<std::string> reply) override {
     _record.add("fetchDisplayURL");
@@ -92,6 +92,16 @@ class RecordingSession final : public ClientSessionInterface {
 };
 
 }  // namespace
+
+void Record::setBackends(std::optional<BackendNames> names) {
+  std::lock_guard lock(_mutex);
+  _backends = std::move(names);
+}
+
+std::optional<BackendNames> Record::backends() const {
+  std::lock_guard lock(_mutex);
+  return _backends;
+}
 
 void Record::add(std::string line) {
   std::lock_guard lock(_mutex);

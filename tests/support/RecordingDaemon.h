@@ -1,11 +1,14 @@
 // The daemon's end of the protocol, on real sockets, with sessions that only keep a record.
 #pragma once
 
+#include <atomic>
 #include <condition_variable>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "client/protocol/ClientSessionInterface.h"
@@ -17,12 +20,14 @@ namespace vesk::test {
 /// another one on the same socket. For any thread.
 class Record {
  public:
-  /// What startConfig and fetchStates answer.
-  std::optional<BackendNames> backends = BackendNames{"httpPost", "wren"};
   /// Answers are kept back until `release`.
-  bool holdsAnswers = false;
+  std::atomic<bool> holdsAnswers{false};
   /// Answers are never given: their callers get an error.
-  bool abandonsAnswers = false;
+  std::atomic<bool> abandonsAnswers{false};
+
+  /// What startConfig and fetchStates answer.
+  void setBackends(std::optional<BackendNames> names);
+  std::optional<BackendNames> backends() const;
 
   void add(std::string line);
   void hold(std::function<void()> answer);
@@ -39,6 +44,7 @@ class Record {
 
   mutable std::mutex _mutex;
   mutable std::condition_variable _changed;
+  std::optional<BackendNames> _backends = BackendNames{"httpPost", "wren"};
   std::vector<std::string> _lines;
   std::vector<std::function<void()>> _held;
 };
