@@ -1,0 +1,146 @@
+#include "tools/veskreport/CommandLine.h"
+
+#include <CLI/CLI.hpp>
+
+#include "tools/veskreport/Output.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr double kLongestTimeout = 86'400;
+
+class Reader {
+ public:
+  Reader() : _app("Talks to veskreportingd as a client, and makes storebags.", "veskreport") {
+    _app.set_version_flag("--version", "veskreport " VESK_VERSION);
+    _app.require_subcommand(1);
+    _app.footer("Exit status: 0 done, 1 failed, 2 wrong usage. See veskreport(1).");
+    addSessionCommands();
+    addMessageCommands();
+    addUploadCommands();
+    addStorebagCommands();
+  }
+
+  CommandLine read(int argc, char** argv) {
+    try {
+      _app.parse(argc, argv);
+    } catch (const CLI::ParseError& error) {
+      return {std::nullopt, _app.exit(error) == 0 ? kExitDone : kExitUsage};
+    }
+    _invocation.identity.timeout = std::chrono::milliseconds(static_cast<long>(_timeout * 1000));
+    _invocation.message.flag = (_realtime ? 1U : 0U) | (_overrideSampling ? 2U : 0U);
+    return {std::move(_invocation), kExitDone};
+  }
+
+ private:
+  CLI::App* add(CLI::App& parent, const char* name, const char* description, Command command) {
+    CLI::App* sub = parent.add_subcommand(name, description);
+    sub->callback([this, command] { _invocation.command = command; });
+    sub->add_flag("--json", _invocation.json, "Print one JSON object a line");
+    return sub;
+  }
+
+  CLI::App* addClient(const char* name, const char* description, Command command) {
+    CLI::App* sub = add(_app, name, description, command);
+    ClientIdentity& identity = _invocation.identity;
+    sub->add_option("--root", identity.root, "Directory that stands for / (default: $VESKREPORTINGD_ROOT)");
+    sub->add_option("--socket", identity.socket, "The daemon's socket")->excludes("--root");
+    sub->add_option("--client-type", identity.clientType, "Client type; selects the storebag")->required();
+    sub->add_option("--client-version", identity.clientVersion, "Client version")->capture_default_str();
+    sub->add_option("--session-id", identity.sessionID, "Session ID (default: a random one)");
+    sub->add_option("--client-name", identity.clientName, "Client name of the user info");
+    sub->add_option("--service-name", identity.serviceName, "Service name of the user info");
+    sub->add_option("--user-info", identity.userInfo, "Further user info, key=text or key:=json")
+        ->take_all()
+        ->allow_extra_args(false);
+    sub->add_flag("--require-user-info", identity.requireUserInfo,
+                  "Have backends wait for user info and heed it");
+    sub->add_flag("--batch", identity.batch, "Have backends gather messages before they post them");
+    sub->add_option("--timeout", _timeout, "Seconds to wait for each answer")
+        ->check(CLI::Range(0.001, kLongestTimeout))
+        ->capture_default_str();
+    return sub;
+  }
+
+  void addSessionCommands() {
+    addClient("states", "Show the names of the enabled backends", Command::States);
+    addClient("display-url", "Show where the session's messages can be looked at", Command::DisplayURL);
+    addClient("flush", "Have the backends send what they hold back", Command::Flush);
+  }
+
+  void addMessageCommands() {
+    MessageArguments& message = _invocation.message;
+    for (bool isOnce : {false, true}) {
+      CLI::App* sub = isOnce ? addClient("send-once", "Send one message without a session", Command::SendOnce)
+                             : addClient("send", "Send messages in a session", Command::Send);
+      auto* category = sub->add_option("-c,--category", message.category, "Category, 0 to 65535");
+      auto* type = sub->add_option("-t,--type", message.type, "Type, 0 to 65535");
+      auto* payload = sub->add_option("payload", message.payload, "key=text and key:=json");
+      if (isOnce) {
+        category->required();
+        type->required();
+        continue;
+      }
+      sub->add_flag("--realtime", _realtime, "Post at once, past the batch");
+      sub->add_flag("--override-sampling", _overrideSampling,
+                    "Send although sampling leaves this device out");
+      sub->add_flag("--no-wait", message.noWait, "Send one way, without waiting for answers");
+      sub->add_flag(
+             "--stdin", message.fromStandardInput,
+             "Send a message for each line of standard input: a JSON object, which is the payload when\n"
+             "category and type are given, else {\"category\":…,\"type\":…,\"payload\":{…},\"flag\":…}")
+          ->excludes(payload);
+      category->needs(type);
+      type->needs(category);
+      sub->callback([this] {
+        _invocation.command = Command::Send;
+        if (!_invocation.message.category && !_invocation.message.fromStandardInput) {
+          throw CLI::RequiredError("--category and --type");
+        }
+      });
+    }
+  }
+
+  void addUploadCommands() {
+    UploadArguments& upload = _invocation.upload;
+    CLI::App* file = addClient("upload-file", "Upload a file", Command::UploadFile);
+    file->add_option("path", upload.path, "The file")->required();
+    CLI::App* log = addClient("upload-log", "Upload log data", Command::UploadLog);
+    auto* texts = log->add_option("text", upload.logData, "Entries of the log data");
+    log->add_flag("--stdin", upload.fromStandardInput, "Take a JSON value from each line of standard input")
+        ->excludes(texts);
+  }
+
+  void addStorebagCommands() {
+    StorebagArguments& arguments = _invocation.storebag;
+    CLI::App* storebag = _app.add_subcommand("storebag", "Make and examine storebags");
+    storebag->require_subcommand(1);
+    CLI::App* keygen = add(*storebag, "keygen", "Make a key pair", Command::StorebagKeygen);
+    keygen
+        ->add_option("directory", arguments.directory, "Where to put storebag-signing.key and publicKey.der")
+        ->capture_default_str();
+    CLI::App* sign = add(*storebag, "sign", "Sign a readable storebag", Command::StorebagSign);
+    sign->add_option("source", arguments.source, "Storebag as TOML or JSON")->required();
+    sign->add_option("--key", arguments.privateKey, "Private key (PEM)")->required();
+    sign->add_option("-o,--output", arguments.output, "Where to write it (default: standard output)");
+    sign->add_flag("--lenient", arguments.lenient, "Sign although values are of a wrong type");
+    CLI::App* verify = add(*storebag, "verify", "Check a signed storebag", Command::StorebagVerify);
+    verify->add_option("storebag", arguments.source, "Signed storebag")->required();
+    verify->add_option("--key", arguments.publicKey, "Public key (DER; default: the installed one)");
+    CLI::App* show = add(*storebag, "show", "Show what a signed storebag holds", Command::StorebagShow);
+    show->add_option("storebag", arguments.source, "Signed storebag")->required();
+  }
+
+  CLI::App _app;
+  Invocation _invocation;
+  double _timeout = 30;
+  bool _realtime = false;
+  bool _overrideSampling = false;
+};
+
+}  // namespace
+
+CommandLine parseCommandLine(int argc, char** argv) { return Reader().read(argc, argv); }
+
+}  // namespace vesk

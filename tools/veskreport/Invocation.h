@@ -1,0 +1,74 @@
+// What the command line asks for.
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace vesk {
+
+/// How the tool introduces itself to the daemon; for every command that talks to it.
+struct ClientIdentity {
+  std::string root;
+  std::string socket;
+  std::int32_t clientType = 0;
+  std::uint16_t clientVersion = 1;
+  std::uint32_t sessionID = 0;
+  std::string clientName;
+  std::string serviceName;
+  std::vector<std::string> userInfo;  ///< further key=text and key:=json pairs
+  bool requireUserInfo = false;
+  bool batch = false;
+  std::chrono::milliseconds timeout{30'000};
+};
+
+struct MessageArguments {
+  std::optional<std::uint16_t> category;
+  std::optional<std::uint16_t> type;
+  std::uint32_t flag = 0;
+  std::vector<std::string> payload;  ///< key=text and key:=json pairs
+  bool fromStandardInput = false;
+  bool noWait = false;
+};
+
+struct UploadArguments {
+  std::string path;
+  std::vector<std::string> logData;  ///< one text each
+  bool fromStandardInput = false;    ///< one JSON value a line
+};
+
+struct StorebagArguments {
+  std::string directory = ".";  ///< of a new key pair
+  std::string privateKey;
+  std::string publicKey;
+  std::string source;  ///< readable or signed, as the command needs it
+  std::string output;
+  bool lenient = false;
+};
+
+enum class Command {
+  States,
+  DisplayURL,
+  Send,
+  SendOnce,
+  Flush,
+  UploadFile,
+  UploadLog,
+  StorebagKeygen,
+  StorebagSign,
+  StorebagVerify,
+  StorebagShow
+};
+
+struct Invocation {
+  Command command = Command::States;
+  bool json = false;
+  ClientIdentity identity;
+  MessageArguments message;
+  UploadArguments upload;
+  StorebagArguments storebag;
+};
+
+}  // namespace vesk

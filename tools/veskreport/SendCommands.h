@@ -1,0 +1,13 @@
+// The commands that send messages given on the command line.
+#pragma once
+
+#include "tools/veskreport/Invocation.h"
+#include "tools/veskreport/Output.h"
+
+namespace vesk {
+
+/// Each returns the exit status.
+int runSend(const Invocation& invocation, const Output& output);
+int runSendOnce(const Invocation& invocation, const Output& output);
+
+}  // namespace vesk
