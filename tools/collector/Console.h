@@ -28,7 +28,7 @@ class Console {
   void problem(std::string_view line);
 
  private:
-  void writeOutput(std::string_view line);
+  void writeOutput(std::string_view line) VESK_REQUIRES(_mutex);
 
   const Style _style;
   Mutex _mutex;

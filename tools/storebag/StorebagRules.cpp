@@ -127,6 +127,16 @@ bool hasShape(const Value& value, Shape shape) {
   return false;
 }
 
+const BackendRule* ruleNamed(std::string_view backend) {
+  const auto* found = std::find_if(kBackends.begin(), kBackends.end(),
+                                   [&](const BackendRule& rule) { return rule.name == backend; });
+  return found == kBackends.end() ? nullptr : found;
+}
+
+bool isAmong(std::span<const KeyRule> rules, std::string_view key) {
+  return std::any_of(rules.begin(), rules.end(), [&](const KeyRule& rule) { return rule.key == key; });
+}
+
 class Checker {
  public:
   StorebagFindings run(const Dictionary& payload) {
@@ -173,9 +183,8 @@ class Checker {
 
   void checkSection(const std::string& place, const Dictionary& section) {
     for (const auto& [name, value] : section) {
-      auto known = std::find_if(kBackends.begin(), kBackends.end(),
-                                [&](const BackendRule& rule) { return name == rule.name; });
-      if (known == kBackends.end()) {
+      const BackendRule* known = ruleNamed(name.view());
+      if (known == nullptr) {
         warn(join(place, name.view()) + ": no backend has this name");
         continue;
       }
@@ -195,9 +204,7 @@ class Checker {
   void checkKeys(const std::string& place, const Dictionary& dictionary, std::span<const KeyRule> rules) {
     for (const auto& rule : rules) checkKey(place, dictionary, rule);
     for (const auto& [key, value] : dictionary) {
-      bool known =
-          std::any_of(rules.begin(), rules.end(), [&](const KeyRule& rule) { return key == rule.key; });
-      if (!known) warn(join(place, key.view()) + ": unknown key");
+      if (!isAmong(rules, key.view())) warn(join(place, key.view()) + ": unknown key");
     }
   }
 
