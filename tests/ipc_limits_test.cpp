@@ -108,10 +108,12 @@ TEST(IPCLimits, ClosesConnectionsInExcessWithOneLineABurst) {
   }
 }
 
-constexpr std::size_t kMessage = std::size_t{1} << 20;
+constexpr std::size_t kMessage = std::size_t{1} << 16;
+
+void limitMessages(IPCListener::Options& options) { options.maximumMessage = kMessage; }
 
 TEST(IPCLimits, TakesMessagesUpToTheLimit) {
-  TestService service;
+  TestService service(limitMessages);
   RawClient client(service);
   client.authenticate();
   // Content: dictionary and value at 8 bytes each, a key of one letter.
@@ -127,12 +129,12 @@ TEST(IPCLimits, TakesMessagesUpToTheLimit) {
 
 TEST(IPCLimits, ClosesWhoSendsAMessageOverTheLimit) {
   LogCapture log;
-  TestService service;
+  TestService service(limitMessages);
   RawClient client(service);
   client.authenticate();
   client.send(
       RawClient::message("flushMessagesWithReply", "", "") +
-      RawClient::message("sendMessageWithDictionary", "a{sv}", RawClient::bytesDictionary(2 * kMessage)));
+      RawClient::message("sendMessageWithDictionary", "a{sv}", RawClient::bytesDictionary(3 * kMessage)));
   EXPECT_TRUE(client.isClosed());
   EXPECT_TRUE(service.journal.waitFor("destroyed"));
   EXPECT_EQ(service.journal.lines(),
@@ -207,15 +209,17 @@ TEST(IPCLimits, StopsReadingFromAClientThatDoesNotReadItsAnswers) {
   std::size_t answered = 0;
   std::size_t sent = 0;
   auto count = [&](BusAnswer& answer) { answered += answer.isError() ? 0 : 1; };
-  const IPCOutgoingCall ask{wire::kSessionInterface, "flushMessagesWithReply", {}};
+  const IPCOutgoingCall ask{wire::kSessionInterface,
+                            "sendMessageWithDictionary",
+                            {Dictionary{{"pad", 300'000}, {"x", std::string(100'000, 'x')}}}};
   // Until the daemon takes no more: the client's own messages pile up in its queue.
-  while (client.bus().queuedMessages() < 500 && sent < 200'000) {
+  while (client.bus().queuedMessages() < 20 && sent < 20'000) {
     ASSERT_EQ(client.bus().send(ask, count, 60s), BusClient::SendResult::Sent);
     ++sent;
   }
-  EXPECT_EQ(client.bus().queuedMessages(), 500u);
+  EXPECT_EQ(client.bus().queuedMessages(), 20u);
   EXPECT_EQ(other.call("fetchDisplayURL"), "https://display") << "others do not notice";
-  const std::size_t served = service.journal.count("flush");
+  const std::size_t served = service.journal.count("message");
   EXPECT_LT(served, sent);
   EXPECT_TRUE(client.runUntil([&] { return answered == sent; })) << "nothing is lost";
 }
@@ -233,7 +237,7 @@ TEST(IPCLimits, TellsTheCallerWhenAClientsOutboxIsFull) {
   }
   EXPECT_EQ(error, "too many calls wait for the client");
   error.clear();
-  connection->callRemoteObject({wire::kReplyInterface, "m", {std::string(kMessage, 'x')}},
+  connection->callRemoteObject({wire::kReplyInterface, "m", {std::string(std::size_t{1} << 20, 'x')}},
                                [&](const std::string& text) { error = text; });
   EXPECT_EQ(error, "the call is too large");
 }

@@ -30,9 +30,9 @@ BusConnection::BusConnection(FileDescriptor socket, const IPCPeer& peer, const C
       _replies(std::make_shared<BusReplies>([wakeup = _wakeup] { wakeup->signal(); })),
       _outbox(settings.maximumOutbox),
       _socket(std::move(socket)),
-      _router(settings.objectPath, _name, _replies, _serial) {}
+      _router(settings.objectPath, _name, _replies, _serial, {.content = settings.maximumMessage}) {}
 
-BusConnection::~BusConnection() { leave(); }
+BusConnection::~BusConnection() { close(); }
 
 void BusConnection::setExportedObject(std::shared_ptr<IPCExportedObject> object) {
   _router.setExportedObject(std::move(object));
@@ -56,6 +56,7 @@ void BusConnection::resume() {
   } catch (const std::exception& error) {
     VESK_LOG_ERROR("ipc: %s: Closed: %s", _name.c_str(), error.what());
     end(ConnectionLoop::End::NotAuthenticated, nullptr);
+    close();
   }
 }
 
@@ -71,8 +72,7 @@ void BusConnection::discard() {
   }
   _outbox.close();
   dropHandlers();
-  _socket.reset();
-  leave();
+  close();
 }
 
 void BusConnection::callRemoteObject(IPCOutgoingCall call,
@@ -92,6 +92,8 @@ void BusConnection::run() noexcept {
     VESK_LOG_ERROR("ipc: %s: Closed: %s", _name.c_str(), error.what());
     end(ConnectionLoop::End::BrokenOff, nullptr);
   }
+  // After the bus; whoever still holds this connection does not hold its socket open.
+  close();
 }
 
 void BusConnection::end(ConnectionLoop::End how, ConnectionLoop* loop) noexcept {
@@ -104,8 +106,6 @@ void BusConnection::end(ConnectionLoop::End how, ConnectionLoop* loop) noexcept 
   if (std::size_t lost = _outbox.close()) {
     VESK_LOG_WARNING("ipc: %s: Ended before %zu calls to the client were sent", _name.c_str(), lost);
   }
-  ExtensionTokens::shared().drop(_serial);
-  leave();
 }
 
 void BusConnection::callHandler(const std::function<void()>& handler) noexcept {
@@ -124,8 +124,10 @@ void BusConnection::dropHandlers() noexcept {
   auto object = _router.takeExportedObject();
 }
 
-void BusConnection::leave() noexcept {
+void BusConnection::close() noexcept {
   if (!_counted.exchange(false)) return;
+  _socket.reset();
+  ExtensionTokens::shared().drop(_serial);
   _registry->remove(_serial);
   _registry->release(_peer.user);
 }

@@ -53,7 +53,7 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   void end(ConnectionLoop::End how, ConnectionLoop* loop) noexcept;
   void callHandler(const std::function<void()>& handler) noexcept;
   void dropHandlers() noexcept;
-  void leave() noexcept;
+  void close() noexcept;
 
   // Constant after construction.
   const std::uint64_t _serial;

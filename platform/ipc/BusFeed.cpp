@@ -66,25 +66,28 @@ BusFeed::Outcome BusFeed::receive(Received& received) {
 }
 
 BusFeed::Outcome BusFeed::pump() {
-  // What was held back behind BEGIN is looked at before more is read.
+  // What came together with BEGIN is looked at before more is read.
+  if (hasHeldMessages()) return passMessages(std::exchange(_early, {}));
   Received received;
-  if (!hasHeldMessages()) {
-    auto outcome = receive(received);
-    if (outcome != Outcome::Fed) return outcome;
-  }
+  auto outcome = receive(received);
+  if (outcome != Outcome::Fed) return outcome;
   _held += received.bytes;
   _received += received.bytes;
-  if (_hasBegun) return passMessages(std::move(received.descriptors));
-  if (!received.descriptors.empty()) return refuse("a descriptor before authentication");
-  return authenticate();
+  return _hasBegun ? passMessages(std::move(received.descriptors))
+                   : authenticate(std::move(received.descriptors));
 }
 
-BusFeed::Outcome BusFeed::authenticate() {
+BusFeed::Outcome BusFeed::authenticate(std::vector<FileDescriptor> descriptors) {
   auto result = _authentication.pass(held());
   if (result.verdict == AuthenticationGate::Verdict::Refused) return refuse("no D-Bus authentication");
   if (!write(result.passedOn)) return refuse("internal failure");
   keepFrom(result.taken);
   _hasBegun = result.verdict == AuthenticationGate::Verdict::Begun;
+  if (!descriptors.empty()) {
+    // They may belong to a message that was read together with BEGIN.
+    if (!_hasBegun || _held == 0) return refuse("a descriptor before authentication");
+    (hasHeldMessages() ? _early : _descriptors) = std::move(descriptors);
+  }
   return result.passedOn.empty() ? Outcome::Nothing : Outcome::Fed;
 }
 

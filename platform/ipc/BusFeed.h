@@ -56,7 +56,7 @@ class BusFeed {
   };
 
   Outcome receive(Received& received);
-  Outcome authenticate();
+  Outcome authenticate(std::vector<FileDescriptor> descriptors);
   Outcome passMessages(std::vector<FileDescriptor> descriptors);
   Outcome refuse(const char* complaint);
   bool write(std::string_view data, std::vector<FileDescriptor> descriptors = {});
@@ -70,6 +70,7 @@ class BusFeed {
   MessageGate _messages;
   bool _hasBegun = false;
   const char* _complaint = nullptr;
+  std::vector<FileDescriptor> _early;        // came with the messages that are held behind BEGIN
   std::vector<FileDescriptor> _descriptors;  // of the message whose header is held
   std::size_t _received = 0;
   std::size_t _held = 0;  // bytes at the front of the buffer that wait for more

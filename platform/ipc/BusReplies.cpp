@@ -43,7 +43,7 @@ void BusReplies::send(sd_bus_message* call, const std::vector<IPCArgument>& argu
 
 void BusReplies::sendError(sd_bus_message* call, const char* errorName, const char* text) noexcept {
   if (!_bus || sd_bus_message_get_expect_reply(call) <= 0 || !peerIsThere()) return;
-  sd_bus_error error = SD_BUS_ERROR_MAKE_CONST(errorName, text);
+  const sd_bus_error error{errorName, text, 0};
   sd_bus_reply_method_error(call, &error);
 }
 

@@ -35,11 +35,12 @@ std::string_view childTowards(std::string_view path, std::string_view target) {
 }  // namespace
 
 CallRouter::CallRouter(std::string objectPath, std::string connectionName,
-                       std::shared_ptr<BusReplies> replies, std::uint64_t owner)
+                       std::shared_ptr<BusReplies> replies, std::uint64_t owner, CodecLimits limits)
     : _objectPath(std::move(objectPath)),
       _connectionName(std::move(connectionName)),
       _replies(std::move(replies)),
-      _owner(owner) {}
+      _owner(owner),
+      _limits(limits) {}
 
 void CallRouter::warn(const char* member, const char* what) {
   if (_warnings.begins()) {
@@ -69,7 +70,7 @@ void CallRouter::route(sd_bus_message* message) {
 }
 
 void CallRouter::call(sd_bus_message* message) {
-  IPCIncomingCall call(message, _replies, _owner);
+  IPCIncomingCall call(message, _replies, _owner, _limits);
   // The object stays alive during its call, also when the call makes the connection drop it.
   auto object = _object;
   try {

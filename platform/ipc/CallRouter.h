@@ -6,6 +6,7 @@
 #include <string>
 #include <string_view>
 
+#include "platform/ipc/BusCodec.h"
 #include "platform/ipc/BusHandles.h"
 #include "platform/ipc/BusReplies.h"
 #include "platform/ipc/IPCConnection.h"
@@ -17,8 +18,9 @@ namespace vesk {
 /// else with the errors that D-Bus has for it. Signals and stray answers are dropped. On the bus's thread.
 class CallRouter {
  public:
+  /// `owner`: as IPCIncomingCall's. `limits`: of the arguments of one call.
   CallRouter(std::string objectPath, std::string connectionName, std::shared_ptr<BusReplies> replies,
-             std::uint64_t owner);
+             std::uint64_t owner, CodecLimits limits = {});
 
   void setExportedObject(std::shared_ptr<IPCExportedObject> object) { _object = std::move(object); }
   /// No call reaches the object any more; the caller lets go of it.
@@ -36,6 +38,7 @@ class CallRouter {
   const std::string _connectionName;
   const std::shared_ptr<BusReplies> _replies;
   const std::uint64_t _owner;
+  const CodecLimits _limits;
   std::shared_ptr<IPCExportedObject> _object;
   WarningBurst _warnings;
 };

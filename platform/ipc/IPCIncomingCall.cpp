@@ -9,10 +9,11 @@
 namespace vesk {
 
 IPCIncomingCall::IPCIncomingCall(sd_bus_message* message, const std::shared_ptr<BusReplies>& replies,
-                                 std::uint64_t owner)
+                                 std::uint64_t owner, const CodecLimits& limits)
     : _message(message),
       _replies(replies),
       _owner(owner),
+      _limits(limits),
       _member(sd_bus_message_get_member(message)),
       _expectsReply(sd_bus_message_get_expect_reply(message) > 0) {}
 

@@ -23,7 +23,8 @@ class BusReplies;
 class IPCIncomingCall {
  public:
   /// `owner`: whose the descriptors are that `grant` keeps.
-  IPCIncomingCall(sd_bus_message* message, const std::shared_ptr<BusReplies>& replies, std::uint64_t owner);
+  IPCIncomingCall(sd_bus_message* message, const std::shared_ptr<BusReplies>& replies, std::uint64_t owner,
+                  const CodecLimits& limits);
 
   std::string_view member() const noexcept { return _member; }
   /// False for a one-way call: nothing that is answered goes anywhere.
@@ -35,7 +36,7 @@ class IPCIncomingCall {
   template <class... Arguments>
   [[nodiscard]] bool read(const char* signature, Arguments&... arguments) {
     if (!checkSignature(signature)) return false;
-    BusDecoder decoder(_message);
+    BusDecoder decoder(_message, _limits);
     return (readOne(decoder, arguments) && ...) || refuseArguments(decoder.result());
   }
 
@@ -84,6 +85,7 @@ class IPCIncomingCall {
   sd_bus_message* const _message;
   const std::shared_ptr<BusReplies>& _replies;
   const std::uint64_t _owner;
+  const CodecLimits& _limits;
   const std::string_view _member;
   const bool _expectsReply;
   bool _settled = false;

@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <poll.h>
+#include <sys/eventfd.h>
 #include <sys/stat.h>
 
 #include <atomic>
@@ -23,7 +24,7 @@ namespace {
 // For memory that the kernel may have again soon: accept() fails at once as long as it has not.
 constexpr int kPauseMilliseconds = 100;
 
-FileDescriptor anyDescriptor() { return FileDescriptor(::open("/dev/null", O_RDONLY | O_CLOEXEC)); }
+FileDescriptor anyDescriptor() { return FileDescriptor(::eventfd(0, EFD_CLOEXEC)); }
 
 /// A listening socket that the service manager has opened.
 FileDescriptor checkedInherited(FileDescriptor socket) {

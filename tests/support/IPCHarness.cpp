@@ -109,7 +109,8 @@ void RecordingSession::sendMessageWithDictionary(const Dictionary& parameters,
   if (action == "keep") kept = std::move(reply);
   _journal.add("message " + number);
   if (action == "throw") throw std::runtime_error("thrown");
-  if (action != "abandon" && reply) reply(number);
+  const auto padding = static_cast<std::size_t>(integerForKey(parameters, "pad").value_or(0));
+  if (action != "abandon" && reply) reply(number + std::string(padding, '.'));
 }
 
 void RecordingSession::flushMessagesWithReply(Reply<std::optional<std::string>> reply) {
@@ -173,8 +174,8 @@ bool TestService::shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>
     _connections.push_back(connection);
     _sessions.push_back(session);
   }
-  if (accept == Accept::Resume) connection->resume();
   journal.add("accepted");
+  if (accept == Accept::Resume) connection->resume();
   return accept != Accept::Refuse;
 }
 

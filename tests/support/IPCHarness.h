@@ -33,7 +33,8 @@ class Journal {
 };
 
 /// Journals each call. A message's "do" decides what becomes of it: "throw", "abandon", "keep" (answered
-/// later, by the test), "farewell" (the destruction calls the client); else it is answered with its "n".
+/// later, by the test), "farewell" (the destruction calls the client); else it is answered with its "n" and
+/// as many dots as its "pad" says.
 class RecordingSession final : public ClientSessionInterface {
  public:
   RecordingSession(Journal& journal, std::shared_ptr<IPCConnection> connection)
