@@ -96,7 +96,7 @@ class Reader {
       sub->callback([this] {
         _invocation.command = Command::Send;
         if (!_invocation.message.category && !_invocation.message.fromStandardInput) {
-          throw CLI::RequiredError("--category and --type");
+          throw CLI::ValidationError("send", "--category and --type are required");
         }
       });
     }

@@ -35,7 +35,10 @@ DaemonSession::DaemonSession(const ClientIdentity& identity, const Output& outpu
 
 int DaemonSession::makeUserInfo() {
   auto further = parsePairs(_identity.userInfo);
-  if (!further.value) return _output.failed("user info " + further.error);
+  if (!further.value) {
+    _output.failed("user info " + further.error);
+    return kExitUsage;
+  }
   MutableDictionary userInfo;
   if (!_identity.clientName.empty()) userInfo.set(kVeskReportingUserInfoClientName, _identity.clientName);
   if (!_identity.serviceName.empty()) userInfo.set(kVeskReportingUserInfoServiceName, _identity.serviceName);
@@ -53,7 +56,9 @@ int DaemonSession::connect() {
   auto connected = _reporting->connect(_identity.timeout);
   if (connected) return kExitDone;
   if (connected.status != ReportingStatus::NotConnected) return failed(connected);
-  return _output.failed("no daemon at " + connected.detail + ": is veskreportingd running?");
+  std::string cause = connected.detail;
+  if (cause.starts_with(_socketPath + ": ")) cause.erase(0, _socketPath.size() + 2);
+  return _output.failed("no daemon at " + _socketPath + ": is veskreportingd running? (" + cause + ")");
 }
 
 int DaemonSession::start() {

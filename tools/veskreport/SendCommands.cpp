@@ -17,11 +17,14 @@ Dictionary parametersOf(const MessageArguments& message, const std::optional<Dic
   return parameters.share();
 }
 
-// Nothing and kExitFailed after telling why when the arguments are no payload.
+// Tells why when the arguments are no payload, and returns kExitUsage.
 int payloadOf(const MessageArguments& message, const Output& output, std::optional<Dictionary>& payload) {
   if (message.payload.empty()) return kExitDone;
   auto pairs = parsePairs(message.payload);
-  if (!pairs.value) return output.failed(pairs.error);
+  if (!pairs.value) {
+    output.failed(pairs.error);
+    return kExitUsage;
+  }
   payload = std::move(pairs.value);
   return kExitDone;
 }

@@ -1,0 +1,200 @@
+// Runs the veskreport program against a daemon's end that keeps a record, and against none.
+#include <gtest/gtest.h>
+
+#include <optional>
+
+#include "tests/support/ChildProcess.h"
+#include "tests/support/RecordingDaemon.h"
+#include "tests/support/TempDirectory.h"
+
+namespace vesk::test {
+namespace {
+
+struct Outcome {
+  int status = -1;
+  std::string output;
+  std::string errors;
+};
+
+class VeskreportCommand : public testing::Test {
+ protected:
+  Outcome run(std::vector<std::string> arguments, std::string input = {}) const {
+    arguments.insert(arguments.begin(), VESK_BIN_DIRECTORY "/veskreport");
+    ChildProcess process(ChildProcess::Options{.command = std::move(arguments), .input = std::move(input)});
+    return {process.wait().value_or(-1), process.output(), process.errors()};
+  }
+  /// With the options of a client of the recording daemon.
+  Outcome runClient(std::vector<std::string> arguments, std::string input = {}) const {
+    for (const char* more : {"--root", root.c_str(), "--client-type", "5", "--session-id", "7"})
+      arguments.emplace_back(more);
+    return run(std::move(arguments), std::move(input));
+  }
+
+  TempDirectory directory;
+  std::string root = directory.path().string();
+  Record record;
+  std::optional<RecordingDaemon> daemon{std::in_place,
+                                        root + "/run/veskreportingd/com.corvane.veskreportingd", record};
+};
+
+TEST_F(VeskreportCommand, EachCommandPrintsItsAnswer) {
+  auto file = directory.write("log.txt", "contents").string();
+  struct Case {
+    std::vector<std::string> arguments;
+    std::string output;
+    std::string call;
+  };
+  for (const Case& c : {
+           Case{{"states"}, "httpPost\nwren\n", "fetchStates none"},
+           Case{{"states", "--json"},
+                R"({"status":"done","backends":["httpPost","wren"]})"
+                "\n",
+                "fetchStates none"},
+           Case{{"display-url"}, "https://display.example/\n", "fetchDisplayURL"},
+           Case{{"flush"}, "posted all\n", "flush"},
+           Case{{"send", "-c", "1", "-t", "2", "k=v", "n:=3"},
+                "accepted\n",
+                R"(parameters {"category": 1, "type": 2, "payload": {"k": "v", "n": 3}, "flag": 0})"},
+           Case{{"send", "-c", "1", "-t", "2", "--realtime", "--override-sampling", "--json"},
+                R"({"status":"done","answer":null})"
+                "\n",
+                R"(parameters {"category": 1, "type": 2, "flag": 3})"},
+           Case{{"send", "-c", "4", "-t", "2", "--no-wait"},
+                "sent\n",
+                R"(parameters {"category": 4, "type": 2, "flag": 0})"},
+           Case{{"send-once", "-c", "1", "-t", "2", "k=v"}, "finished\n", "messageOnce "},
+           Case{{"upload-file", file}, "uploaded " + file + "\n", "uploadFile file://" + file + " contents"},
+           Case{{"upload-log", "one", "two"},
+                "uploaded log data of 2 entries\n",
+                R"(uploadLogData ["one", "two"])"},
+       }) {
+    SCOPED_TRACE(c.arguments.front());
+    auto outcome = runClient(c.arguments);
+    EXPECT_EQ(outcome.status, 0);
+    EXPECT_EQ(outcome.output, c.output);
+    EXPECT_EQ(outcome.errors, "");
+    EXPECT_TRUE(record.waitForLine(c.call));
+  }
+}
+
+TEST_F(VeskreportCommand, IntroducesItselfAsTheOptionsSay) {
+  runClient({"states", "--client-version", "3", "--client-name", "Camera", "--service-name", "Demo",
+             "--user-info", "region=north", "--user-info", "floor:=2", "--require-user-info", "--batch"});
+  EXPECT_EQ(
+      record.lines().front(),
+      R"(setSessionInfo {"sessionID": 7, "clientType": 5, "clientVersion": 3, "requireUserInfo": true, )"
+      R"("batchEvent": true} {"clientName": "Camera", "serviceName": "Demo", "region": "north", "floor": 2} [])");
+}
+
+TEST_F(VeskreportCommand, SendsEachLineOfStandardInput) {
+  auto outcome = runClient({"send", "--stdin"},
+                           "{\"category\":1,\"type\":2,\"payload\":{\"n\":1}}\n\n"
+                           "nonsense\n{\"category\":1}\n{\"category\":9,\"type\":1,\"flag\":1}");
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.output, "2 messages sent, 2 failed\n");
+  EXPECT_NE(outcome.errors.find("veskreport: line 3: no valid JSON"), std::string::npos) << outcome.errors;
+  EXPECT_NE(outcome.errors.find("veskreport: line 4: \"type\" is no number from 0 to 65535"),
+            std::string::npos);
+  EXPECT_EQ(record.count(R"(parameters {"category": 1, "type": 2, "payload": {"n": 1}, "flag": 0})"), 1U);
+  EXPECT_EQ(record.count(R"(parameters {"category": 9, "type": 1, "flag": 1})"), 1U);
+
+  outcome =
+      runClient({"send", "--stdin", "-c", "4", "-t", "5", "--json"}, "{\"category\":\"a payload's own\"}\n");
+  EXPECT_EQ(
+      outcome.output,
+      "{\"status\":\"done\",\"line\":1,\"answer\":null}\n{\"status\":\"done\",\"sent\":1,\"failed\":0}\n");
+  EXPECT_EQ(
+      record.count(
+          R"(parameters {"category": 4, "type": 5, "payload": {"category": "a payload's own"}, "flag": 0})"),
+      1U);
+}
+
+TEST_F(VeskreportCommand, SendsManyLinesInOrder) {
+  constexpr int kLines = 3000;
+  std::string input;
+  for (int i = 0; i < kLines; ++i) input += "{\"n\":" + std::to_string(i) + "}\n";
+  auto outcome = runClient({"send", "--stdin", "-c", "1", "-t", "2"}, input);
+  EXPECT_EQ(outcome.output, "3000 messages sent\n");
+  auto lines = record.lines();
+  ASSERT_EQ(lines.size(), 2U + kLines);
+  EXPECT_NE(lines.back().find("\"n\": 2999}"), std::string::npos);
+}
+
+TEST_F(VeskreportCommand, SaysWhatFailed) {
+  record.setBackends(std::nullopt);
+  auto outcome = runClient({"send", "-c", "1", "-t", "2", "--json"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.errors, "veskreport: the daemon has no storebag for client type 5 (its log says why)\n");
+  EXPECT_EQ(outcome.output,
+            "{\"status\":\"failed\",\"error\":"
+            "\"the daemon has no storebag for client type 5 (its log says why)\"}\n");
+
+  record.setBackends(BackendNames{});
+  outcome = runClient({"states"});
+  EXPECT_EQ(outcome.status, 0);
+  EXPECT_EQ(outcome.errors, "veskreport: no backend is enabled\n");
+  EXPECT_EQ(runClient({"upload-file", root + "/missing"}).errors,
+            "veskreport: the file can't be opened: No such file or directory\n");
+
+  record.abandonsAnswers = true;
+  EXPECT_EQ(runClient({"flush"}).status, 1);
+}
+
+TEST_F(VeskreportCommand, SaysThatNoDaemonIsThere) {
+  daemon.reset();
+  auto outcome = runClient({"states"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.errors, "veskreport: no daemon at " + root +
+                                "/run/veskreportingd/com.corvane.veskreportingd: is veskreportingd running? "
+                                "(No such file or directory)\n");
+}
+
+TEST_F(VeskreportCommand, WrongUsageIsStatusTwo) {
+  for (const auto& arguments : std::vector<std::vector<std::string>>{
+           {},
+           {"states"},
+           {"nonsense"},
+           {"send", "--client-type", "5", "k=v"},
+           {"send", "--client-type", "5", "-c", "1"},
+           {"send", "--client-type", "5", "-c", "65536", "-t", "1"},
+           {"send", "--client-type", "5", "-c", "1", "-t", "1", "no pair"},
+           {"send", "--client-type", "5", "-c", "1", "-t", "1", "--stdin", "k=v"},
+           {"states", "--client-type", "5", "--timeout", "0"},
+           {"storebag", "sign"},
+       }) {
+    auto outcome = run(arguments);
+    EXPECT_EQ(outcome.status, 2) << testing::PrintToString(arguments);
+    EXPECT_NE(outcome.errors, "");
+  }
+  EXPECT_EQ(run({"--help"}).status, 0);
+  EXPECT_EQ(run({"send", "--help"}).status, 0);
+  EXPECT_EQ(run({"--version"}).output, "veskreport " VESK_VERSION "\n");
+}
+
+TEST_F(VeskreportCommand, MakesAndExaminesStorebags) {
+  auto source = directory.write(
+      "zelko.toml",
+      "version = \"1.2\"\n[release.httpPost]\nclients = [{ post_url = \"https://a.example/\" }]\n");
+  std::string keys = root + "/keys", bag = root + "/zelko.storebag";
+  EXPECT_EQ(run({"storebag", "keygen", keys}).status, 0);
+  EXPECT_EQ(run({"storebag", "keygen", keys}).status, 1) << "must not replace a key";
+  EXPECT_EQ(
+      run({"storebag", "sign", source.string(), "--key", keys + "/storebag-signing.key", "-o", bag}).errors,
+      "");
+  EXPECT_EQ(run({"storebag", "verify", bag, "--key", keys + "/publicKey.der"}).output,
+            bag + ": valid, version 1.2\n");
+  EXPECT_NE(run({"storebag", "show", bag}).output.find("post_url = \"https://a.example/\""),
+            std::string::npos);
+  EXPECT_NE(run({"storebag", "show", bag, "--json"}).output.find("\"version\""), std::string::npos);
+
+  auto other = root + "/other";
+  run({"storebag", "keygen", other});
+  auto outcome = run({"storebag", "verify", bag, "--key", other + "/publicKey.der"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_NE(outcome.errors.find("the signature does not fit"), std::string::npos);
+  EXPECT_EQ(run({"storebag", "show", source.string()}).errors,
+            "veskreport: " + source.string() + ": no storebag that can be read\n");
+}
+
+}  // namespace
+}  // namespace vesk::test
