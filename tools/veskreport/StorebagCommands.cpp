@@ -57,7 +57,7 @@ int runStorebagSign(const StorebagArguments& arguments, const Output& output) {
   return reporting(output, [&] {
     auto checks = arguments.lenient ? StorebagChecks::Lenient : StorebagChecks::Strict;
     StorebagSource source = readStorebagSource(arguments.source, checks);
-    for (const std::string& warning : source.warnings) output.note(warning);
+    for (const std::string& warning : source.warnings) output.note("warning: " + warning);
     std::string document = signStorebag(source.payload, SigningKey::fromFile(arguments.privateKey));
     if (arguments.output.empty()) return output.raw(document);
     writeWholeFile(arguments.output, document, kReadableByAll);
