@@ -11,7 +11,8 @@ namespace vesk {
 namespace {
 
 std::uint32_t randomSessionID() {
-  std::uniform_int_distribution<std::uint32_t> anyButNone(1);
+  // Below 2^31: display URLs show it as a signed number.
+  std::uniform_int_distribution<std::uint32_t> anyButNone(1, 0x7fffffff);
   std::random_device device;
   return anyButNone(device);
 }
