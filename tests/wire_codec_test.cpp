@@ -171,33 +171,40 @@ TEST_F(WireCodec, RefusesMoreThanOneOfWhatMayBeAbsent) {
   EXPECT_EQ(texts.result(), CodecResult::WrongType);
 }
 
-/// `depth` lists around a number.
-Value nested(std::size_t depth) {
+/// `depth` lists, or dictionaries, around a number.
+Value nested(std::size_t depth, bool dictionaries) {
   Value value = 1;
-  for (std::size_t i = 0; i < depth; ++i) value = List{value};
+  for (std::size_t i = 0; i < depth; ++i) {
+    value = dictionaries ? Value(Dictionary{{"k", value}}) : Value(List{value});
+  }
   return value;
 }
 
 TEST_F(WireCodec, TakesWhatIsAsDeepAsTheLimitAndNoDeeper) {
-  auto decode = [&](std::size_t depth, CodecLimits limits) {
+  auto decode = [&](std::size_t depth, bool dictionaries, CodecLimits limits) {
     fresh();
     BusEncoder encoder(message());
-    encoder.append(*nested(depth).list());
-    if (!encoder.ok()) return encoder.result();
+    const Value written = nested(depth, dictionaries);
+    if (!(dictionaries ? encoder.append(*written.dictionary()) : encoder.append(*written.list()))) {
+      return encoder.result();
+    }
     seal();
     BusDecoder decoder(message(), limits);
-    List list;
-    if (decoder.read(list)) {
-      EXPECT_EQ(Value(list), nested(depth));
+    Value value;
+    if (decoder.read(value)) {
+      EXPECT_EQ(value, written);
     }
     return decoder.result();
   };
-  EXPECT_EQ(decode(20, {.depth = 20}), CodecResult::Ok);
-  EXPECT_EQ(decode(21, {.depth = 20}), CodecResult::LimitExceeded);
-  // sd-bus has room for 63 lists (each an array and a variant), which is less than the limit.
-  EXPECT_EQ(decode(63, {}), CodecResult::Ok);
-  EXPECT_EQ(decode(65, {}), CodecResult::LimitExceeded);
-  EXPECT_EQ(decode(100, {}), CodecResult::LimitExceeded);
+  for (bool dictionaries : {false, true}) {
+    EXPECT_EQ(decode(20, dictionaries, {.depth = 20}), CodecResult::Ok);
+    EXPECT_EQ(decode(21, dictionaries, {.depth = 20}), CodecResult::LimitExceeded);
+    // sd-bus has room for fewer than the limit: a list takes two containers, a dictionary three.
+    const std::size_t room = dictionaries ? 42 : 63;
+    EXPECT_EQ(decode(room, dictionaries, {}), CodecResult::Ok);
+    EXPECT_EQ(decode(room + 1, dictionaries, {}), CodecResult::LimitExceeded);
+    EXPECT_EQ(decode(100, dictionaries, {}), CodecResult::LimitExceeded);
+  }
 }
 
 TEST_F(WireCodec, UnwrapsVariantsInVariants) {
