@@ -5,7 +5,6 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <ctime>
 #include <filesystem>
 #include <optional>
 #include <system_error>
@@ -15,6 +14,7 @@
 #include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
 #include "platform/sync/Mutex.h"
+#include "platform/time/CivilTime.h"
 
 namespace vesk {
 
@@ -133,13 +133,7 @@ bool append(const std::string& path, std::string_view line) {
 
 }  // namespace
 
-std::string logDate(WallTime time) {
-  const std::time_t seconds = std::chrono::floor<std::chrono::seconds>(time).time_since_epoch().count();
-  std::tm utc{};
-  char text[64];
-  if (!::gmtime_r(&seconds, &utc)) return std::to_string(seconds);
-  return {text, std::strftime(text, sizeof text, "%Y-%m-%d %H:%M:%S +0000", &utc)};
-}
+std::string logDate(WallTime time) { return civilTime(time) + " +0000"; }
 
 MessageLog::MessageLog(std::string directory, const WallClock& clock)
     : _directory(std::move(directory)), _clock(clock) {}

@@ -11,12 +11,12 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <ctime>
 #include <memory>
 #include <string>
 #include <vector>
 
 #include "platform/sync/Mutex.h"
+#include "platform/time/CivilTime.h"
 
 namespace vesk {
 
@@ -77,14 +77,11 @@ std::string printable(std::string_view text) {
 }
 
 void writeToStderr(const LogState& log, LogLevel level, const std::string& line) {
-  timespec now{};
-  ::clock_gettime(CLOCK_REALTIME, &now);
-  tm local{};
-  ::localtime_r(&now.tv_sec, &local);
-  char date[32];
-  std::strftime(date, sizeof date, "%Y-%m-%d %H:%M:%S", &local);
-  char head[128];
-  int size = std::snprintf(head, sizeof head, "%s.%03ld %s[%d] <%d> ", date, now.tv_nsec / 1'000'000,
+  WallTime now = WallClock::system().now();
+  auto fraction = now - std::chrono::floor<std::chrono::seconds>(now);
+  char head[160];
+  int size = std::snprintf(head, sizeof head, "%s.%03d %.64s[%d] <%d> ", civilTime(now).c_str(),
+                           static_cast<int>(fraction.count() / 1000),
                            log.processName.empty() ? "vesk" : log.processName.c_str(), ::getpid(),
                            static_cast<int>(level));
   iovec parts[] = {{head, static_cast<std::size_t>(size)},

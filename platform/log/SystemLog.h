@@ -11,9 +11,9 @@ namespace vesk {
 enum class LogLevel : int { Error = 3, Warning = 4, Info = 6, Debug = 7 };
 
 /// Writes the process's log lines. Lines go to the journal when stderr is connected to it, else to stderr as
-/// "2026-11-24 20:31:29.123 name[pid] <level> text". Safe from any thread; takes no lock of the project's
-/// own; never throws. Control characters in a line are shown as \xNN, so that text from outside can't forge a
-/// line.
+/// "2026-11-24 20:31:29.123 name[pid] <level> text", in UTC. Safe from any thread; takes no lock of the
+/// project's own; never throws. Control characters in a line are shown as \xNN, so that text from outside
+/// can't forge a line.
 class SystemLog {
  public:
   using Sink = std::function<void(LogLevel, std::string_view line)>;

@@ -1,6 +1,7 @@
 #include "tests/support/DaemonHarness.h"
 
 #include <csignal>
+#include <cstdio>
 #include <sstream>
 #include <stdexcept>
 #include <thread>
@@ -87,7 +88,9 @@ void DaemonHarness::startDaemon(std::vector<std::string> arguments) {
 
 int DaemonHarness::stopDaemon() {
   _daemon->signal(SIGTERM);
-  return _daemon->wait().value_or(-1);
+  int status = _daemon->wait().value_or(-1);
+  if (status != 0) std::fprintf(stderr, "%s\n", _daemon->errors().c_str());
+  return status;
 }
 
 void DaemonHarness::writeStorebag(const std::string& name, std::string source) {
@@ -170,7 +173,9 @@ RoadClient::RoadClient(const DaemonHarness& harness, Dictionary moreSessionInfo,
     throw std::runtime_error("the session can't be configured");
   }
   auto started = reporting.startConfig(ChildProcess::kPatience);
-  if (!started) throw std::runtime_error("the session does not start: " + started.detail);
+  if (!started)
+    throw std::runtime_error("the session does not start: " + started.detail + "; daemon:\n" +
+                             harness.daemon().errors());
   enabled = started.answer;
 }
 

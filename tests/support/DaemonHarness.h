@@ -32,7 +32,7 @@ class DaemonHarness {
   void startDaemon(std::vector<std::string> arguments = {});
   /// Ends it by SIGTERM and gives its exit status.
   int stopDaemon();
-  ChildProcess& daemon() { return *_daemon; }
+  ChildProcess& daemon() const { return *_daemon; }
   ChildProcess& collector() { return *_collector; }
 
   /// Writes a storebag source; the text may say @EVENTS@ for the collector's HTTPS event URL.
