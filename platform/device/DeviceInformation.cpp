@@ -14,6 +14,7 @@
 #include "platform/files/SmallFile.h"
 #include "platform/preferences/PreferencesSuite.h"
 #include "platform/preferences/TomlFile.h"
+#include "platform/sync/Mutex.h"
 #include "platform/unicode/Unicode.h"
 
 namespace vesk {
@@ -115,7 +116,10 @@ std::optional<std::string> countryOfLocale(std::string_view locale) {
 }
 
 int localOffset(std::time_t seconds) {
-  // localtime_r alone would keep the zone that the process started in.
+  // localtime_r alone would keep the zone that the process started in. The C library replaces what it knows
+  // of the zone each time.
+  static Mutex mutex;
+  MutexLock lock(mutex);
   ::tzset();
   std::tm local{};
   return ::localtime_r(&seconds, &local) ? static_cast<int>(local.tm_gmtoff) : 0;
