@@ -1,5 +1,7 @@
 // Posts and servers that go away: what is tried again, what is not, and what is lost.
+#include <arpa/inet.h>
 #include <gtest/gtest.h>
+#include <sys/socket.h>
 
 #include <algorithm>
 #include <atomic>
@@ -8,6 +10,7 @@
 #include <thread>
 #include <vector>
 
+#include "platform/files/FileDescriptor.h"
 #include "platform/http/HTTPClient.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/RecordingServer.h"
@@ -119,6 +122,28 @@ TEST(HTTPOutage, AServerThatHasThePostAndStallsDoesNotGetItTwice) {
   stalled.timeout = 100ms;
   EXPECT_EQ(client.perform(stalled).error->kind, Kind::Timeout);
   EXPECT_EQ(server.count(), 1u);
+}
+
+TEST(HTTPOutage, AConnectionThatTakesTooLongIsTriedAgain) {
+  // Connections come to be, but nobody greets them.
+  FileDescriptor listener(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  sockaddr_in address{};
+  address.sin_family = AF_INET;
+  address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+  socklen_t size = sizeof address;
+  auto* name = reinterpret_cast<sockaddr*>(&address);
+  ASSERT_EQ(::bind(listener.get(), name, size), 0);
+  ASSERT_EQ(::listen(listener.get(), 8), 0);
+  ASSERT_EQ(::getsockname(listener.get(), name, &size), 0);
+
+  auto options = quick();
+  options.connectTimeout = 20ms;
+  HTTPClient client(options);
+  client.start(post("https://127.0.0.1:" + std::to_string(ntohs(address.sin_port))),
+               [](const HTTPResult& result) { EXPECT_EQ(result.error->kind, Kind::Stopped); });
+  FileDescriptor first(::accept(listener.get(), nullptr, nullptr));
+  FileDescriptor second(::accept(listener.get(), nullptr, nullptr));
+  EXPECT_TRUE(first && second);
 }
 
 TEST(HTTPOutage, PostsAreGivenUpWhenTheTimeIsOver) {
