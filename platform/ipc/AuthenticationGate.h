@@ -12,7 +12,7 @@ namespace vesk {
 /// Stands in front of sd-bus's own authentication, which sees whole lines only and nothing behind BEGIN.
 ///
 /// EXTERNAL means that a client is who the kernel says it is. sd-bus would compare the claim with the process
-/// at the other end of its input, which is this one (see BusFeed), so the claim is compared here, and sd-bus
+/// at the other end of its input, which is this one (see BusRelay), so the claim is compared here, and sd-bus
 /// is shown a claim to this process's user when it is true and a claim to no user when it is not.
 class AuthenticationGate {
  public:

@@ -102,7 +102,8 @@ BusClient::Implementation::Implementation(Options options)
   check(sd_bus_new(&raw), "sd_bus_new");
   _bus.reset(raw);
   check(sd_bus_set_fd(raw, socket.get(), socket.get()), "sd_bus_set_fd");
-  _replies->open(raw, socket.release());
+  static_cast<void>(socket.release());
+  _replies->open(raw);
   check(sd_bus_negotiate_fds(raw, 1), "sd_bus_negotiate_fds");
   check(sd_bus_start(raw), "sd_bus_start");
 }

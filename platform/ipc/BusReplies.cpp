@@ -1,16 +1,13 @@
 #include "platform/ipc/BusReplies.h"
 
-#include <poll.h>
-
 #include "platform/ipc/BusCodec.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
 
-void BusReplies::open(sd_bus* bus, int socket) {
+void BusReplies::open(sd_bus* bus) {
   _thread = std::this_thread::get_id();
   _bus = bus;
-  _socket = socket;
 }
 
 std::optional<BusReplies::Ticket> BusReplies::keep(sd_bus_message* call) {
@@ -19,13 +16,8 @@ std::optional<BusReplies::Ticket> BusReplies::keep(sd_bus_message* call) {
   return _lastTicket;
 }
 
-bool BusReplies::peerIsThere() const noexcept {
-  pollfd poll{_socket, 0, 0};
-  return ::poll(&poll, 1, 0) == 0 || !(poll.revents & (POLLHUP | POLLERR));
-}
-
 void BusReplies::send(sd_bus_message* call, const std::vector<IPCArgument>& arguments) noexcept {
-  if (!_bus || sd_bus_message_get_expect_reply(call) <= 0 || !peerIsThere()) return;
+  if (!_bus || sd_bus_message_get_expect_reply(call) <= 0) return;
   sd_bus_message* raw = nullptr;
   if (sd_bus_message_new_method_return(call, &raw) < 0) return;
   BusMessageHandle reply(raw);
@@ -42,7 +34,7 @@ void BusReplies::send(sd_bus_message* call, const std::vector<IPCArgument>& argu
 }
 
 void BusReplies::sendError(sd_bus_message* call, const char* errorName, const char* text) noexcept {
-  if (!_bus || sd_bus_message_get_expect_reply(call) <= 0 || !peerIsThere()) return;
+  if (!_bus || sd_bus_message_get_expect_reply(call) <= 0) return;
   const sd_bus_error error{errorName, text, 0};
   sd_bus_reply_method_error(call, &error);
 }

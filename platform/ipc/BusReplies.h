@@ -32,9 +32,7 @@ class BusReplies {
 
   // On the bus's thread.
 
-  /// `socket` is asked, before an answer is written, whether the peer is still there: writing to one that has
-  /// gone would end the bus, and with it what the peer had sent before it went.
-  void open(sd_bus* bus, int socket);
+  void open(sd_bus* bus);
   /// Nothing when too many answers are owed.
   std::optional<Ticket> keep(sd_bus_message* call);
   void send(sd_bus_message* call, const std::vector<IPCArgument>& arguments) noexcept;
@@ -59,14 +57,12 @@ class BusReplies {
 
   void settle(Answer answer) noexcept;
   void sendNow(const Answer& answer) noexcept;
-  bool peerIsThere() const noexcept;
 
   const std::function<void()> _wake;
 
   // Touched by the bus's thread only.
   std::thread::id _thread;
   sd_bus* _bus = nullptr;
-  int _socket = -1;
   Ticket _lastTicket = 0;
   std::unordered_map<Ticket, BusMessageHandle> _owed;
 

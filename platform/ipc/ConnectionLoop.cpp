@@ -1,8 +1,8 @@
 #include "platform/ipc/ConnectionLoop.h"
 
-#include <fcntl.h>
 #include <poll.h>
 #include <sys/ioctl.h>
+#include <sys/socket.h>
 
 #include <algorithm>
 #include <system_error>
@@ -13,6 +13,9 @@
 namespace vesk {
 
 namespace {
+
+// Of answers and calls, inside the relay; the client's socket holds as much again.
+constexpr int kUnreadBytes = 128 * 1024;
 
 void check(int result, const char* what) {
   if (result < 0) throw std::system_error(-result, std::generic_category(), what);
@@ -25,21 +28,20 @@ int untilDeadline(std::chrono::steady_clock::time_point deadline) {
   return static_cast<int>(std::clamp<long long>(left, 0, 1'000'000));
 }
 
-/// A server's bus that reads from `input` and writes to a duplicate of `socket`.
-BusHandle openBus(FileDescriptor input, int socket) {
-  FileDescriptor output(::fcntl(socket, F_DUPFD_CLOEXEC, 3));
-  if (!output) throw std::system_error(errno, std::generic_category(), "F_DUPFD_CLOEXEC");
+/// A server's bus on the inner end of a relay.
+BusHandle openBus(FileDescriptor socket) {
   sd_bus* raw = nullptr;
   check(sd_bus_new(&raw), "sd_bus_new");
   BusHandle bus(raw);
-  check(sd_bus_set_fd(raw, input.get(), output.get()), "sd_bus_set_fd");
-  static_cast<void>(input.release());
-  static_cast<void>(output.release());
+  check(sd_bus_set_fd(raw, socket.get(), socket.get()), "sd_bus_set_fd");
+  int inner = socket.release();
   sd_id128_t identity{};
   check(sd_id128_randomize(&identity), "sd_id128_randomize");
   check(sd_bus_set_server(raw, 1, identity), "sd_bus_set_server");
   check(sd_bus_negotiate_fds(raw, 1), "sd_bus_negotiate_fds");
   check(sd_bus_start(raw), "sd_bus_start");
+  // sd-bus has asked for 8 MiB, which a client that reads nothing would fill.
+  ::setsockopt(inner, SOL_SOCKET, SO_SNDBUF, &kUnreadBytes, sizeof kUnreadBytes);
   return bus;
 }
 
@@ -55,9 +57,9 @@ ConnectionLoop::ConnectionLoop(int socket, const IPCPeer& peer, const std::strin
       _wakeup(wakeup),
       _replies(replies),
       _router(router),
-      _feed(socket, peer.user, settings.maximumMessage + kMessageOverhead),
-      _bus(openBus(_feed.takeInnerEnd(), socket)) {
-  _replies.open(_bus.get(), socket);
+      _relay(socket, peer.user, settings.maximumMessage + kMessageOverhead),
+      _bus(openBus(_relay.takeInnerEnd())) {
+  _replies.open(_bus.get());
 }
 
 ConnectionLoop::~ConnectionLoop() { _replies.close(); }
@@ -73,7 +75,7 @@ std::size_t ConnectionLoop::unread() const {
 ConnectionLoop::End ConnectionLoop::serve(const std::atomic<bool>& invalidated) {
   const Time deadline = std::chrono::steady_clock::now() + _settings.authenticationTimeout;
   for (;;) {
-    sendOutgoing();
+    if (!sendOutgoing()) return endOfBus();
     if (invalidated.load()) return drain();
     if (!isReady() && std::chrono::steady_clock::now() >= deadline) {
       VESK_LOG_WARNING("ipc: %s: Closed: not authenticated in time", _name.c_str());
@@ -84,12 +86,17 @@ ConnectionLoop::End ConnectionLoop::serve(const std::atomic<bool>& invalidated) 
   }
 }
 
-void ConnectionLoop::sendOutgoing() {
+/// What other threads have answered and called. False when the bus has ended.
+bool ConnectionLoop::sendOutgoing() {
   _replies.sendWaiting();
-  while (isReady() && unread() <= kMaximumUnread) {
-    auto call = _outbox.take();
-    if (!call) return;
-    sendCall(*call);
+  for (;;) {
+    while (isReady() && unread() <= kMaximumUnread) {
+      auto call = _outbox.take();
+      if (!call) break;
+      sendCall(*call);
+    }
+    if (!_relay.passOut() || (unread() == 0 && _outbox.empty())) return true;
+    if (!processWaiting()) return false;
   }
 }
 
@@ -112,12 +119,11 @@ void ConnectionLoop::sendCall(const IPCOutgoingCall& call) {
 }
 
 void ConnectionLoop::wait(Time deadline) {
-  int wanted = sd_bus_get_events(_bus.get());
   pollfd polls[] = {{_socket, 0, 0}, {_wakeup.fd(), POLLIN, 0}};
   if (mayRead()) polls[0].events |= POLLIN;
-  if (wanted > 0 && (wanted & POLLOUT)) polls[0].events |= POLLOUT;
+  if (_relay.isBlocked()) polls[0].events |= POLLOUT;
   int timeout = isReady() ? -1 : untilDeadline(deadline);
-  if (_feed.hasHeldMessages() && mayRead()) timeout = 0;
+  if (_relay.hasHeldMessages() && mayRead()) timeout = 0;
   if (::poll(polls, 2, timeout) <= 0) return;
   // What a client sent before it went away is read even when its answers have nowhere to go.
   if (polls[0].revents & (POLLHUP | POLLERR)) _peerGone = true;
@@ -126,21 +132,20 @@ void ConnectionLoop::wait(Time deadline) {
 
 bool ConnectionLoop::mayRead() const {
   // sd-bus must have taken BEGIN before it sees a message.
-  if (_feed.hasBegun() && !isReady()) return false;
+  if (_relay.hasBegun() && !isReady()) return false;
   return _peerGone || unread() <= kMaximumUnread;
 }
 
-/// One step: what can be read is handed to the bus, and the bus does what it can.
+/// One step: what can be read is handed to the bus, the bus does what it can, what it answers goes out.
 std::optional<ConnectionLoop::End> ConnectionLoop::advance() {
-  auto outcome = mayRead() ? _feed.pump() : BusFeed::Outcome::Nothing;
+  auto outcome = mayRead() ? _relay.takeIn() : BusRelay::Outcome::Nothing;
   if (!process()) return endOfBus();
-  if (_feed.complaint()) VESK_LOG_WARNING("ipc: %s: Closed: %s", _name.c_str(), _feed.complaint());
-  if (outcome == BusFeed::Outcome::HungUp || outcome == BusFeed::Outcome::BrokenOff) {
+  if (_relay.complaint()) VESK_LOG_WARNING("ipc: %s: Closed: %s", _name.c_str(), _relay.complaint());
+  if (outcome == BusRelay::Outcome::HungUp || outcome == BusRelay::Outcome::BrokenOff) {
     if (!isReady()) return End::NotAuthenticated;
-    return outcome == BusFeed::Outcome::HungUp ? End::HungUp : End::BrokenOff;
+    return outcome == BusRelay::Outcome::HungUp ? End::HungUp : End::BrokenOff;
   }
-  bool wantsToWrite = sd_bus_get_events(_bus.get()) & POLLOUT;
-  if (_feed.hasBegun() && !isReady() && (_peerGone || !wantsToWrite)) {
+  if (_relay.hasBegun() && !isReady()) {
     VESK_LOG_WARNING("ipc: %s: Closed: not authenticated", _name.c_str());
     return End::NotAuthenticated;
   }
@@ -149,6 +154,14 @@ std::optional<ConnectionLoop::End> ConnectionLoop::advance() {
 
 /// False when the bus has ended.
 bool ConnectionLoop::process() {
+  do {
+    if (!processWaiting()) return false;
+    // Once there is room again the bus writes what it has queued.
+  } while (_relay.passOut() && unread() > 0);
+  return true;
+}
+
+bool ConnectionLoop::processWaiting() {
   for (;;) {
     sd_bus_message* raw = nullptr;
     int result = sd_bus_process(_bus.get(), &raw);
@@ -161,28 +174,27 @@ bool ConnectionLoop::process() {
 }
 
 ConnectionLoop::End ConnectionLoop::endOfBus() const {
-  if (!_feed.hasBegun()) return End::NotAuthenticated;
-  return _feed.insideMessage() ? End::BrokenOff : End::HungUp;
+  return _relay.hasBegun() ? End::BrokenOff : End::NotAuthenticated;
 }
 
 ConnectionLoop::End ConnectionLoop::drain() {
   int waiting = 0;
   if (!isReady() || ::ioctl(_socket, FIONREAD, &waiting) != 0) return End::Invalidated;
-  const std::size_t target = _feed.received() + static_cast<std::size_t>(waiting);
+  const std::size_t target = _relay.received() + static_cast<std::size_t>(waiting);
   const Time deadline = std::chrono::steady_clock::now() + kDrainTime;
-  while (_feed.received() < target && std::chrono::steady_clock::now() < deadline && !advance()) {
+  while (_relay.received() < target && mayRead() && std::chrono::steady_clock::now() < deadline) {
+    if (advance()) break;
   }
   return End::Invalidated;
 }
 
 void ConnectionLoop::flush(std::chrono::milliseconds limit) {
   const Time deadline = std::chrono::steady_clock::now() + limit;
-  while (sd_bus_is_open(_bus.get()) > 0 && isReady()) {
-    sendOutgoing();
-    if (unread() == 0 && _outbox.empty()) return;
+  while (isReady() && !_peerGone && std::chrono::steady_clock::now() < deadline) {
+    if (!sendOutgoing() || !process()) return;
+    if (unread() == 0 && _outbox.empty() && !_relay.isBlocked()) return;
     pollfd poll{_socket, POLLOUT, 0};
     if (::poll(&poll, 1, untilDeadline(deadline)) <= 0 || (poll.revents & (POLLHUP | POLLERR))) return;
-    if (!process() || std::chrono::steady_clock::now() >= deadline) return;
   }
 }
 

@@ -7,8 +7,8 @@
 #include <optional>
 #include <string>
 
-#include "platform/ipc/BusFeed.h"
 #include "platform/ipc/BusHandles.h"
+#include "platform/ipc/BusRelay.h"
 #include "platform/ipc/BusReplies.h"
 #include "platform/ipc/CallRouter.h"
 #include "platform/ipc/IPCConnection.h"
@@ -60,12 +60,13 @@ class ConnectionLoop {
 
   bool isReady() const;
   std::size_t unread() const;
-  void sendOutgoing();
+  bool sendOutgoing();
   void sendCall(const IPCOutgoingCall& call);
   void wait(Time deadline);
   bool mayRead() const;
   std::optional<End> advance();
   bool process();
+  bool processWaiting();
   End drain();
   End endOfBus() const;
 
@@ -76,7 +77,7 @@ class ConnectionLoop {
   const Wakeup& _wakeup;
   BusReplies& _replies;
   CallRouter& _router;
-  BusFeed _feed;
+  BusRelay _relay;
   BusHandle _bus;
   bool _peerGone = false;
 };

@@ -1,4 +1,4 @@
-#include "platform/ipc/BusFeed.h"
+#include "platform/ipc/BusRelay.h"
 
 #include <sys/socket.h>
 
@@ -10,7 +10,7 @@ namespace vesk {
 
 namespace {
 
-constexpr std::size_t kControlSize = CMSG_SPACE(sizeof(int) * BusFeed::kMaximumDescriptors);
+constexpr std::size_t kControlSize = CMSG_SPACE(sizeof(int) * BusRelay::kMaximumDescriptors);
 
 /// Takes every descriptor out of a received message, so that none is left open unseen.
 std::vector<FileDescriptor> takeDescriptors(msghdr& header) {
@@ -29,7 +29,7 @@ std::vector<FileDescriptor> takeDescriptors(msghdr& header) {
 
 }  // namespace
 
-BusFeed::BusFeed(int socket, uid_t peer, std::size_t maximumMessage)
+BusRelay::BusRelay(int socket, uid_t peer, std::size_t maximumMessage)
     : _socket(socket), _authentication(peer), _messages(maximumMessage) {
   int ends[2];
   if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends) != 0) {
@@ -42,12 +42,12 @@ BusFeed::BusFeed(int socket, uid_t peer, std::size_t maximumMessage)
   ::setsockopt(ends[1], SOL_SOCKET, SO_SNDBUF, &size, sizeof size);
 }
 
-BusFeed::Outcome BusFeed::refuse(const char* complaint) {
+BusRelay::Outcome BusRelay::refuse(const char* complaint) {
   _complaint = complaint;
   return Outcome::BrokenOff;
 }
 
-BusFeed::Outcome BusFeed::receive(Received& received) {
+BusRelay::Outcome BusRelay::receive(Received& received) {
   alignas(cmsghdr) char control[kControlSize];
   iovec space{_buffer.data() + _held, _buffer.size() - _held};
   msghdr header{};
@@ -65,7 +65,7 @@ BusFeed::Outcome BusFeed::receive(Received& received) {
   return Outcome::Fed;
 }
 
-BusFeed::Outcome BusFeed::pump() {
+BusRelay::Outcome BusRelay::takeIn() {
   // What came together with BEGIN is looked at before more is read.
   if (hasHeldMessages()) return passMessages(std::exchange(_early, {}));
   Received received;
@@ -77,7 +77,7 @@ BusFeed::Outcome BusFeed::pump() {
                    : authenticate(std::move(received.descriptors));
 }
 
-BusFeed::Outcome BusFeed::authenticate(std::vector<FileDescriptor> descriptors) {
+BusRelay::Outcome BusRelay::authenticate(std::vector<FileDescriptor> descriptors) {
   auto result = _authentication.pass(held());
   if (result.verdict == AuthenticationGate::Verdict::Refused) return refuse("no D-Bus authentication");
   if (!write(result.passedOn)) return refuse("internal failure");
@@ -91,7 +91,7 @@ BusFeed::Outcome BusFeed::authenticate(std::vector<FileDescriptor> descriptors) 
   return result.passedOn.empty() ? Outcome::Nothing : Outcome::Fed;
 }
 
-BusFeed::Outcome BusFeed::passMessages(std::vector<FileDescriptor> descriptors) {
+BusRelay::Outcome BusRelay::passMessages(std::vector<FileDescriptor> descriptors) {
   auto result = _messages.pass(held());
   std::size_t split = result.passed;
   auto now = std::exchange(_descriptors, {});
@@ -125,7 +125,7 @@ BusFeed::Outcome BusFeed::passMessages(std::vector<FileDescriptor> descriptors) 
   return result.passed == 0 ? Outcome::Nothing : Outcome::Fed;
 }
 
-bool BusFeed::write(std::string_view data, std::vector<FileDescriptor> descriptors) {
+bool BusRelay::write(std::string_view data, std::vector<FileDescriptor> descriptors) {
   if (data.empty()) return true;
   iovec piece{const_cast<char*>(data.data()), data.size()};
   msghdr header{};
@@ -148,7 +148,30 @@ bool BusFeed::write(std::string_view data, std::vector<FileDescriptor> descripto
   return written == static_cast<ssize_t>(data.size());
 }
 
-void BusFeed::keepFrom(std::size_t offset) {
+/// An answer for a client that has gone is dropped: what it had sent before it went is served all the same.
+bool BusRelay::passOut() {
+  bool moved = false;
+  for (;;) {
+    if (_outgoing.empty()) {
+      ssize_t size = ::recv(_outer.get(), _outgoingBuffer.data(), _outgoingBuffer.size(), MSG_DONTWAIT);
+      if (size <= 0) return moved;
+      _outgoing = {_outgoingBuffer.data(), static_cast<std::size_t>(size)};
+      moved = true;
+    }
+    ssize_t sent = _clientGone
+                       ? static_cast<ssize_t>(_outgoing.size())
+                       : ::send(_socket, _outgoing.data(), _outgoing.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
+    if (sent >= 0) {
+      _outgoing.remove_prefix(static_cast<std::size_t>(sent));
+    } else if (errno == EAGAIN) {
+      return moved;
+    } else if (errno != EINTR) {
+      _clientGone = true;
+    }
+  }
+}
+
+void BusRelay::keepFrom(std::size_t offset) {
   _held -= offset;
   if (_held > 0) std::memmove(_buffer.data(), _buffer.data() + offset, _held);
 }

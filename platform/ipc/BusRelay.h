@@ -1,4 +1,4 @@
-// The road of a client's bytes from its socket to sd-bus. Private to platform/ipc.
+// Between a client's socket and sd-bus. Private to platform/ipc.
 #pragma once
 
 #include <array>
@@ -13,14 +13,16 @@
 namespace vesk {
 
 /// sd-bus takes messages of up to 128 MiB, any number of descriptors along with each, and drops a broken
-/// message without a word to read on at once, all of that within one call. So it does not read a client's
-/// socket but the inner end of a socket pair, into which this writes what has passed the gates. Many small
-/// messages cross in one read and one write. For the connection's thread; what is written must be processed
-/// before the next `pump`.
-class BusFeed {
+/// message without a word to read on at once, all of that within one call; and an answer that finds its
+/// client gone takes the messages with it that the client had sent before it went. So sd-bus does not have a
+/// client's socket but the inner end of a socket pair. What has passed the gates is written into it, and what
+/// sd-bus answers is taken out of it. Many small messages cross in one read and one write. For the
+/// connection's thread.
+class BusRelay {
  public:
-  /// One read's worth. Small, because each connection has it on its stack.
+  /// One read's worth, each way. Small, because each connection has them on its stack.
   static constexpr std::size_t kPiece = 16 * 1024;
+  static constexpr std::size_t kOutgoingPiece = 4 * 1024;
   /// Descriptors that may come with one message; no member takes more than one.
   static constexpr std::size_t kMaximumDescriptors = 4;
 
@@ -32,16 +34,22 @@ class BusFeed {
   };
 
   /// Borrows `socket` (not blocking). Throws std::system_error.
-  BusFeed(int socket, uid_t peer, std::size_t maximumMessage);
+  BusRelay(int socket, uid_t peer, std::size_t maximumMessage);
 
   /// The end for sd-bus; to be taken once.
   FileDescriptor takeInnerEnd() { return std::move(_inner); }
 
-  Outcome pump();
+  /// Reads from the client. What it has fed must be processed by sd-bus before the next call.
+  Outcome takeIn();
+
+  /// Takes what sd-bus has written and gives the client what it has room for. True when something moved.
+  bool passOut();
+  /// Whether the client has to read before more can go out.
+  bool isBlocked() const noexcept { return !_outgoing.empty(); }
 
   /// Whether the client has said BEGIN: all that follows are messages.
   bool hasBegun() const noexcept { return _hasBegun; }
-  /// Whether `pump` has work although the socket may have nothing to read.
+  /// Whether `takeIn` has work although the socket may have nothing to read.
   bool hasHeldMessages() const noexcept { return _hasBegun && _held >= MessageGate::kFixedHeader; }
   bool insideMessage() const noexcept { return _held > 0 || _messages.insideMessage(); }
   /// Bytes read from the socket so far.
@@ -75,6 +83,9 @@ class BusFeed {
   std::size_t _received = 0;
   std::size_t _held = 0;  // bytes at the front of the buffer that wait for more
   std::array<char, kPiece> _buffer;
+  bool _clientGone = false;
+  std::string_view _outgoing;  // the part of the buffer that the client has not taken
+  std::array<char, kOutgoingPiece> _outgoingBuffer;
 };
 
 }  // namespace vesk
