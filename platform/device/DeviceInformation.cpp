@@ -85,7 +85,9 @@ std::optional<std::string> factFromSystem(std::string_view key) {
     return build ? build : osReleaseValue("VERSION");
   }
   if (key == "UniqueDeviceID") return deviceIdentifier();
-  return firmwareFact(key);
+  auto fact = firmwareFact(key);
+  // A virtual machine or a container has no firmware to ask; without a name of any kind it could not report.
+  return !fact && key == "DeviceName" ? osReleaseValue("NAME") : fact;
 }
 
 bool isUsable(const std::string& fact) {

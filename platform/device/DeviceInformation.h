@@ -15,7 +15,7 @@ namespace vesk {
 /// A fact comes from /etc/veskreporting/device.toml when that file has the key, else:
 /// - "ProductVersion", "BuildVersion": VERSION_ID and BUILD_ID (or VERSION) of /etc/os-release;
 /// - "ProductType", "DeviceName", "HWModelStr", "SerialNumber": DMI (/sys/class/dmi/id), else the device tree
-///   (/proc/device-tree);
+///   (/proc/device-tree); "DeviceName" at last NAME of /etc/os-release;
 /// - "UniqueDeviceID": 40 hexadecimal digits, derived one-way from /etc/machine-id;
 /// - any other key, for example "ReleaseType" or "RegionCode": nothing.
 ///
