@@ -60,7 +60,7 @@ class Inflater {
     _stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(compressed.data()));  // zlib only reads it
     _stream.avail_in = static_cast<uInt>(compressed.size());
     std::string out;
-    std::array<char, 64 * 1024> piece;
+    std::array<char, 65536> piece;
     while (true) {
       _stream.next_out = reinterpret_cast<Bytef*>(piece.data());
       _stream.avail_out = piece.size();
