@@ -35,8 +35,7 @@ HTTPClient::Options httpOptions() {
 
 struct Daemon::Parts {
   Parts(ServiceManager& serviceManager, BusyMarker& busyMarker)
-      : http(httpOptions()),
-        backendServices{http,
+      : backendServices{http,
                         WallClock::system(),
                         Counters::shared(),
                         [](bool respectsConsent) {
@@ -45,6 +44,7 @@ struct Daemon::Parts {
                         diagnosticsSubmissionConsent,
                         regionCode},
         sessionServices{backendServices, clientLibraryVersion()},
+        http(httpOptions()),
         agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetch(), busyMarker)),
         listener(listenerOptions(serviceManager)) {
     listener.setDelegate(agent.get());
@@ -59,9 +59,10 @@ struct Daemon::Parts {
     };
   }
 
-  HTTPClient http;
+  // Before the client: what is still being posted when the client ends completes with the services' help.
   BackendServices backendServices;
   SessionServices sessionServices;
+  HTTPClient http;
   std::shared_ptr<ReportingdAgent> agent;
   IPCListener listener;
 };
@@ -74,6 +75,7 @@ Daemon::~Daemon() { stop(); }
 void Daemon::resume() { _parts->listener.resume(); }
 
 void Daemon::stop() {
+  if (std::exchange(_stopped, true)) return;
   _parts->listener.stop();
   if (!_parts->http.waitUntilIdle(kPostWait)) {
     VESK_LOG_WARNING("main: Stopping although posts are still outstanding after %d seconds.",

@@ -30,6 +30,7 @@ class Daemon {
  private:
   struct Parts;
   std::unique_ptr<Parts> _parts;
+  bool _stopped = false;
 };
 
 }  // namespace vesk

@@ -234,6 +234,18 @@ TEST(Road, TerminationSendsWhatIsHeld) {
   EXPECT_EQ(harness.waitForEventsOfMethod(0, 2).size(), 2u) << "start and end of the session";
 }
 
+TEST(Road, AStalledCollectorDoesNotHoldUpTheEndForEver) {
+  DaemonHarness harness;
+  harness.startDaemon();
+  RoadClient client(harness);
+  harness.setFault("post=stall");
+  auto handedOver = client.reporting.sendMessageAndWait(message(3, {}, 1));
+  ASSERT_TRUE(handedOver) << handedOver.detail;
+  EXPECT_EQ(harness.stopDaemon(), 0);
+  EXPECT_TRUE(
+      harness.daemon().waitForText("main: Stopping although posts are still outstanding after 10 seconds."));
+}
+
 TEST(Road, TheSandboxHolds) {
   DaemonHarness harness;
   // A preferences file that leads out of the sandbox: the daemon is root here, and still can't read it.

@@ -42,13 +42,13 @@ struct ReceivedPost {
 class BackendHarness {
  public:
   BackendHarness()
-      : _server({}, [this](const HTTPReceived& request) { return receive(request); }),
-        services{_http,
+      : services{_http,
                  clock,
                  counters,
                  [](bool respects) { return std::string(respects ? "id-respecting" : "id-overriding"); },
                  [this] { return consent; },
-                 [this] { return region; }} {}
+                 [this] { return region; }},
+        _server({}, [this](const HTTPReceived& request) { return receive(request); }) {}
 
   /// All posts that arrived, once nothing is under way any more.
   std::vector<ReceivedPost> posts() {
@@ -81,11 +81,13 @@ class BackendHarness {
   std::mutex _mutex;
   std::vector<ReceivedPost> _posts;
   std::atomic<unsigned> _status{200};
-  HTTPServer _server;
-  HTTPClient _http;
 
  public:
-  BackendServices services;
+  BackendServices services;  ///< outlives the client, whose last completions use it
+
+ private:
+  HTTPServer _server;
+  HTTPClient _http;
 };
 
 }  // namespace vesk::test
