@@ -80,11 +80,11 @@ void ReportingdAgent::removeFromSessionList(const std::shared_ptr<ReportingdSess
   if (std::erase(_sessionList, session) > 0 && _sessionList.empty()) _busyMarker.end();
 }
 
+// Its family is looked for in every list: the key of its present user info may not be the one that it joined
+// under, since a client may take its user info back, or configure its session anew.
 void ReportingdAgent::removeFromCorrelation(const std::shared_ptr<ReportingdSession>& session) {
   RecursiveMutexLock lock(_monitor);
-  std::string key = correlationKeyForUserInfo(session->userInfo().value_or(Dictionary()));
-  auto list = _correlatedSessions.find(key);
-  if (list != _correlatedSessions.end()) std::erase(list->second, session);
+  for (auto& [key, list] : _correlatedSessions) std::erase(list, session);
 }
 
 // --- Storebags

@@ -34,6 +34,8 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
   // --- IPCListenerDelegate
   // ----------------------------------------------------------------------------------
   bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) override;
+  /// What the end of a session's connection does: the session leaves the list and its family.
+  void sessionInvalidated(const std::shared_ptr<ReportingdSession>& session);
 
   // --- ReportingdSessionDelegate
   // ----------------------------------------------------------------------------
@@ -52,7 +54,6 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
  private:
   using SessionList = std::vector<std::shared_ptr<ReportingdSession>>;
 
-  void sessionInvalidated(const std::shared_ptr<ReportingdSession>& session);
   void removeFromSessionList(const std::shared_ptr<ReportingdSession>& session);
   void removeFromCorrelation(const std::shared_ptr<ReportingdSession>& session);
 

@@ -119,6 +119,21 @@ TEST_F(Family, ASessionThatMovesTakesItsPlaceElsewhere) {
             1);
 }
 
+TEST_F(Family, ASessionLeavesItsFamilyUnderWhateverNameItJoined) {
+  std::weak_ptr<ReportingdSession> tookItBack;
+  std::weak_ptr<ReportingdSession> configuredAnew;
+  {
+    auto first = join(0);
+    first->fetchStatesWithUserInfo(std::nullopt, {});
+    tookItBack = first.session;
+    auto second = join(0);
+    second->setSessionInfo(Dictionary(), userInfo("Other"), {}, false);
+    configuredAnew = second.session;
+  }
+  EXPECT_TRUE(tookItBack.expired());
+  EXPECT_TRUE(configuredAnew.expired());
+}
+
 TEST_F(Family, ClosingAnAggregatingSessionTellsItsClientOnce) {
   auto top = join(0, true);
   auto connection = top.connection;

@@ -43,8 +43,17 @@ class RecordingConnection final : public IPCConnection {
   std::function<void()> _invalidated;
 };
 
-/// A session and the connection that it believes to have.
+class AgentHarness;
+
+/// A session and the connection that it believes to have; that ends with it.
 struct DrivenSession {
+  explicit DrivenSession(AgentHarness& harness);
+  ~DrivenSession() {
+    if (session) agent->sessionInvalidated(session);
+  }
+  DrivenSession(DrivenSession&&) = default;
+
+  std::shared_ptr<ReportingdAgent> agent;
   std::shared_ptr<RecordingConnection> connection = std::make_shared<RecordingConnection>();
   std::shared_ptr<ReportingdSession> session;
 
@@ -79,16 +88,16 @@ class AgentHarness : public BackendHarness {
             },
             busyMarker)) {}
 
-  DrivenSession newSession() {
-    DrivenSession driven;
-    driven.session = std::make_shared<ReportingdSession>(agent, driven.connection, sessionServices);
-    return driven;
-  }
+  DrivenSession newSession() { return DrivenSession(*this); }
 
   SessionServices sessionServices{services, "7.3"};
   BusyMarker busyMarker;
   std::map<std::int32_t, Dictionary> storebags;  ///< sections by client type
   std::shared_ptr<ReportingdAgent> agent;
 };
+
+inline DrivenSession::DrivenSession(AgentHarness& harness)
+    : agent(harness.agent),
+      session(std::make_shared<ReportingdSession>(harness.agent, connection, harness.sessionServices)) {}
 
 }  // namespace vesk::test
