@@ -211,7 +211,7 @@ TEST(IPCLimits, StopsReadingFromAClientThatDoesNotReadItsAnswers) {
   auto count = [&](BusAnswer& answer) { answered += answer.isError() ? 0 : 1; };
   const IPCOutgoingCall ask{wire::kSessionInterface,
                             "sendMessageWithDictionary",
-                            {Dictionary{{"pad", 300'000}, {"x", std::string(100'000, 'x')}}}};
+                            {Dictionary{{"pad", 20'000}, {"x", std::string(20'000, 'x')}}}};
   // Until the daemon takes no more: the client's own messages pile up in its queue.
   while (client.bus().queuedMessages() < 20 && sent < 20'000) {
     ASSERT_EQ(client.bus().send(ask, count, 60s), BusClient::SendResult::Sent);
@@ -229,7 +229,7 @@ TEST(IPCLimits, TellsTheCallerWhenAClientsOutboxIsFull) {
   TestClient client(service);
   ASSERT_EQ(client.call("flushMessagesWithReply"), "flushed");
   auto connection = service.connection();
-  const IPCOutgoingCall call{wire::kReplyInterface, "sendMessageToClient", {std::string(200'000, 'x')}};
+  const IPCOutgoingCall call{wire::kReplyInterface, "sendMessageToClient", {std::string(30'000, 'x')}};
   std::string error;
   // The client reads nothing: the socket fills, then the bus's queue, then the outbox.
   for (int i = 0; i < 10'000 && error.empty(); ++i) {
