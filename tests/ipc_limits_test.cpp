@@ -1,6 +1,7 @@
 // What clients that break the rules, or break, can do to the daemon and to others.
 #include <gtest/gtest.h>
 #include <poll.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 
 #include <cstring>
@@ -106,6 +107,29 @@ TEST(IPCLimits, ClosesConnectionsInExcessWithOneLineABurst) {
     TestClient third(service);
     EXPECT_EQ(third.call("flushMessagesWithReply"), "flushed") << "room again";
   }
+}
+
+TEST(IPCLimits, GoesOnAfterItHadNoDescriptorLeft) {
+  LogCapture log;
+  TestService service;
+  rlimit before{};
+  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &before), 0);
+  std::vector<FileDescriptor> waiting;
+  for (int i = 0; i < 3; ++i) waiting.emplace_back(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  // The sockets are there before the limit, which then leaves nothing for the other end of any.
+  const rlim_t used = static_cast<rlim_t>(waiting.back().get()) + 1;
+  rlimit tight{used, before.rlim_max};
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &tight), 0);
+  UnixSocketAddress address(service.path());
+  for (auto& socket : waiting) EXPECT_EQ(::connect(socket.get(), address.get(), address.size()), 0);
+  EXPECT_TRUE(log.lines().waitFor("4 ipc: Refused a connection: no descriptor is left"));
+  for (auto& socket : waiting) {
+    char byte = 0;
+    EXPECT_LE(::recv(socket.get(), &byte, 1, 0), 0) << "closed, not left waiting";
+  }
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &before), 0);
+  TestClient client(service);
+  EXPECT_EQ(client.call("flushMessagesWithReply"), "flushed");
 }
 
 constexpr std::size_t kMessage = std::size_t{1} << 16;

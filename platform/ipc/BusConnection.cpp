@@ -55,7 +55,7 @@ void BusConnection::resume() {
     _registry->launch([self = shared_from_this()] { self->run(); });
   } catch (const std::exception& error) {
     VESK_LOG_ERROR("ipc: %s: Closed: %s", _name.c_str(), error.what());
-    end(ConnectionLoop::End::NotAuthenticated, nullptr);
+    finish(ConnectionLoop::End::NotAuthenticated, nullptr);
     close();
   }
 }
@@ -65,7 +65,8 @@ void BusConnection::invalidate() {
   _wakeup->signal();
 }
 
-void BusConnection::discard() {
+void BusConnection::end() {
+  invalidate();
   {
     MutexLock lock(_mutex);
     if (std::exchange(_started, true)) return;
@@ -87,16 +88,16 @@ void BusConnection::callRemoteObject(IPCOutgoingCall call,
 void BusConnection::run() noexcept {
   try {
     ConnectionLoop loop(_socket.get(), _peer, _name, _settings, _outbox, *_wakeup, *_replies, _router);
-    end(loop.serve(_invalidated), &loop);
+    finish(loop.serve(_invalidated), &loop);
   } catch (const std::exception& error) {
     VESK_LOG_ERROR("ipc: %s: Closed: %s", _name.c_str(), error.what());
-    end(ConnectionLoop::End::BrokenOff, nullptr);
+    finish(ConnectionLoop::End::BrokenOff, nullptr);
   }
   // After the bus; whoever still holds this connection does not hold its socket open.
   close();
 }
 
-void BusConnection::end(ConnectionLoop::End how, ConnectionLoop* loop) noexcept {
+void BusConnection::finish(ConnectionLoop::End how, ConnectionLoop* loop) noexcept {
   // A client that has gone takes no call; one that is sent away still gets what its session says in the end.
   if (how != ConnectionLoop::End::Invalidated) _outbox.close();
   if (how == ConnectionLoop::End::BrokenOff) callHandler(_interruptionHandler);

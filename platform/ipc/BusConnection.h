@@ -35,8 +35,8 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   ~BusConnection() override;
 
   std::uint64_t serial() const noexcept { return _serial; }
-  /// Lets go of handlers and exported object when there is no thread that would; else does nothing.
-  void discard();
+  /// For the listener: as `invalidate`, and when there is no thread lets go of handlers and exported object.
+  void end();
 
   std::string description() const override { return _name; }
   IPCPeer peer() const override { return _peer; }
@@ -50,7 +50,7 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
 
  private:
   void run() noexcept;
-  void end(ConnectionLoop::End how, ConnectionLoop* loop) noexcept;
+  void finish(ConnectionLoop::End how, ConnectionLoop* loop) noexcept;
   void callHandler(const std::function<void()>& handler) noexcept;
   void dropHandlers() noexcept;
   void close() noexcept;

@@ -20,7 +20,7 @@ namespace vesk {
 class BusConnection;
 
 /// Shared by the listener and its connections, of which some may outlive it. Thread-safe. A connection counts
-/// from `admit` until its thread has ended, or until it is released when it never had one.
+/// from `admit` until its thread has let it go, or until it is released when it never had one.
 class ConnectionRegistry {
  public:
   ConnectionRegistry(std::size_t maximum, std::size_t maximumPerUser)

@@ -21,7 +21,7 @@ namespace vesk {
 
 namespace {
 
-// For memory that the kernel may have again soon: accept() fails at once as long as it has not.
+// For what the kernel lacks and may have again soon: accept() fails at once as long as it has not.
 constexpr int kPauseMilliseconds = 100;
 
 FileDescriptor anyDescriptor() { return FileDescriptor(::eventfd(0, EFD_CLOEXEC)); }
@@ -100,10 +100,7 @@ void IPCListener::Implementation::stop() {
   _thread.join();
   removeSocket();
   _listening.reset();
-  for (const auto& connection : _registry->connections()) {
-    connection->invalidate();
-    connection->discard();
-  }
+  for (const auto& connection : _registry->connections()) connection->end();
   _registry->waitForThreads();
 }
 
@@ -142,11 +139,11 @@ IPCListener::Implementation::Accepted IPCListener::Implementation::acceptOne() {
     case EMFILE:
     case ENFILE:
       return refuseForWantOfDescriptors();
-    case ENOMEM:
-    case ENOBUFS:
-      return Accepted::NoRoom;
+    case EINTR:
+    case ECONNABORTED:  // given up by its client
+      return Accepted::Yes;
     default:
-      return Accepted::Yes;  // that connection was given up by its client
+      return Accepted::NoRoom;
   }
 }
 
@@ -181,11 +178,11 @@ void IPCListener::Implementation::introduce(FileDescriptor socket, const IPCPeer
   try {
     connection = std::make_shared<BusConnection>(std::move(socket), peer, _settings, _registry);
     _registry->add(connection->serial(), connection);
-    if (!_delegate || !_delegate->shouldAcceptNewConnection(connection)) connection->discard();
+    if (!_delegate || !_delegate->shouldAcceptNewConnection(connection)) connection->end();
   } catch (const std::exception& error) {
     VESK_LOG_ERROR("ipc: Refused a connection: %s", error.what());
     if (connection) {
-      connection->discard();
+      connection->end();
     } else {
       _registry->release(peer.user);
     }
