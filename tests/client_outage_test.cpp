@@ -32,6 +32,7 @@ class ClientOutage : public testing::Test {
     options.socketPath = socket;
     options.firstReconnectWait = 5ms;
     options.lastReconnectWait = 20ms;
+    options.drainTime = 1min;
     return options;
   }
 
@@ -42,9 +43,8 @@ class ClientOutage : public testing::Test {
 };
 
 TEST_F(ClientOutage, SaysThatNoDaemonIsThere) {
-  auto noDrain = options();
-  noDrain.drainTime = 1min;  // the end of the session must not take it: there never was a daemon
-  VeskReporting session(noDrain);
+  // Its end must not take the drain time: there never was a daemon.
+  VeskReporting session(options());
   auto connected = session.connect();
   EXPECT_EQ(connected.status, ReportingStatus::NotConnected);
   EXPECT_EQ(connected.detail, socket + ": No such file or directory");
@@ -151,11 +151,9 @@ TEST_F(ClientOutage, HasRoomAgainOnceTheDaemonTookWhatWaited) {
 
 TEST_F(ClientOutage, WaitsAtItsEndForADaemonThatItKnew) {
   daemon.emplace(socket, record);
-  auto patient = options();
-  patient.drainTime = 1min;
   std::future<void> back;
   {
-    VeskReporting session(patient);
+    VeskReporting session(options());
     ASSERT_TRUE(session.connect());
     daemon.reset();
     EXPECT_EQ(session.sendMessage(4, 2), ReportingStatus::Queued);

@@ -22,6 +22,7 @@ class ClientSession : public testing::Test {
     options.socketPath = socket;
     options.firstReconnectWait = 5ms;
     options.lastReconnectWait = 20ms;
+    options.drainTime = 1min;
     return options;
   }
 
@@ -157,7 +158,6 @@ TEST_F(ClientSession, TellsWhyThereIsNoAnswer) {
   EXPECT_EQ(session.fetchDisplayURL(late.callback(), 20ms), ReportingStatus::Queued);
   EXPECT_EQ(late.get().status, ReportingStatus::TimedOut);
   record.release();
-  EXPECT_EQ(session.drops().total(), 0U);
 }
 
 TEST_F(ClientSession, RefusesWhatCannotBeSentAndGoesOn) {
