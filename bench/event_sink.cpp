@@ -1,8 +1,8 @@
 // Where the end-to-end bench's events end: counts each message id.
 //
 // Usage: event_sink FIRST-FILE [tls]
-// Writes its port (and with tls the authority's certificate beside it) to FIRST-FILE, then serves until standard input
-// ends; then prints "events E distinct D".
+// Writes its port (and with tls the authority's certificate beside it) to FIRST-FILE, then serves until
+// standard input ends; then prints "events E distinct D".
 #include <cstdio>
 #include <cstring>
 #include <fstream>

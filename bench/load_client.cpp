@@ -17,22 +17,24 @@ constexpr long kIdsPerClient = 10'000'000;
 double cpuMicroseconds() {
   rusage usage{};
   ::getrusage(RUSAGE_SELF, &usage);
-  return (usage.ru_utime.tv_sec + usage.ru_stime.tv_sec) * 1e6 + usage.ru_utime.tv_usec + usage.ru_stime.tv_usec;
+  return (usage.ru_utime.tv_sec + usage.ru_stime.tv_sec) * 1e6 + usage.ru_utime.tv_usec +
+         usage.ru_stime.tv_usec;
 }
 
 vesk::Dictionary message(long id, int flag) {
   using vesk::Text;
-  return vesk::Dictionary{{Text::literal("category"), 3},
-                          {Text::literal("type"), 2},
-                          {Text::literal("flag"), flag},
-                          {Text::literal("payload"), vesk::Dictionary{{Text::literal("msgid"), id},
-                                                                     {Text::literal("view"), "Preferences/Network"},
-                                                                     {Text::literal("username"), "someone@example"},
-                                                                     {Text::literal("secret"), "do-not-send"},
-                                                                     {Text::literal("duration"), 12.75},
-                                                                     {Text::literal("count"), 42},
-                                                                     {Text::literal("result"), "completed-ok"},
-                                                                     {Text::literal("ratio"), 0.3333}}}};
+  return vesk::Dictionary{
+      {Text::literal("category"), 3},
+      {Text::literal("type"), 2},
+      {Text::literal("flag"), flag},
+      {Text::literal("payload"), vesk::Dictionary{{Text::literal("msgid"), id},
+                                                  {Text::literal("view"), "Preferences/Network"},
+                                                  {Text::literal("username"), "someone@example"},
+                                                  {Text::literal("secret"), "do-not-send"},
+                                                  {Text::literal("duration"), 12.75},
+                                                  {Text::literal("count"), 42},
+                                                  {Text::literal("result"), "completed-ok"},
+                                                  {Text::literal("ratio"), 0.3333}}}};
 }
 
 }  // namespace
@@ -74,7 +76,8 @@ int main(int argc, char** argv) {
   auto flushed = reporting.flushMessagesAndWait(std::chrono::seconds(120));
   double cpu = cpuMicroseconds() - before;
   if (!flushed) {
-    std::fprintf(stderr, "load_client: flush: %s %s\n", vesk::describe(flushed.status), flushed.detail.c_str());
+    std::fprintf(stderr, "load_client: flush: %s %s\n", vesk::describe(flushed.status),
+                 flushed.detail.c_str());
     return 1;
   }
   std::printf("%.3f\n", cpu / static_cast<double>(count));

@@ -19,9 +19,14 @@ namespace {
 
 /// Eight mixed fields, as the end-to-end bench sends them.
 Dictionary payload() {
-  return Dictionary{{"msgid", 123456},          {"view", "Preferences/Network"}, {"username", "someone@example"},
-                    {"secret", "do-not-send"},  {"duration", 12.75},             {"count", 42},
-                    {"result", "completed-ok"}, {"ratio", 0.3333}};
+  return Dictionary{{"msgid", 123456},
+                    {"view", "Preferences/Network"},
+                    {"username", "someone@example"},
+                    {"secret", "do-not-send"},
+                    {"duration", 12.75},
+                    {"count", 42},
+                    {"result", "completed-ok"},
+                    {"ratio", 0.3333}};
 }
 
 const Dictionary kUserInfo{{kVeskReportingUserInfoClientName, "Bench"},
@@ -105,9 +110,11 @@ BENCHMARK(recordAndFilter);
 
 std::string batchOf50() {
   MutableDictionary event(payload());
-  for (const char* key : {"_startTS", "_clientVersion", "_eventNumber", "_method", "_status", "_internal"}) event.set(key, 1700000000);
+  for (const char* key : {"_startTS", "_clientVersion", "_eventNumber", "_method", "_status", "_internal"})
+    event.set(key, 1700000000);
   for (const char* key : {"_clientTS", "eventTime"}) event.set(key, 1700000000.25);
-  for (const char* key : {"_sender", "_sessionID", "_productFamily", "_productModel", "_osVersion", "_build"}) {
+  for (const char* key :
+       {"_sender", "_sessionID", "_productFamily", "_productModel", "_osVersion", "_build"}) {
     event.set(key, "q2hyb25vbWV0");
   }
   JSONWriter writer(JSONStyle::Compact, 1 << 16);
