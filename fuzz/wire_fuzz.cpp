@@ -15,6 +15,7 @@
 namespace {
 
 using namespace vesk;
+using namespace std::string_literals;
 
 void require(bool condition) {
   if (!condition) std::abort();
@@ -29,9 +30,9 @@ struct Server {
     sd_bus* raw = nullptr;
     require(sd_bus_new(&raw) >= 0 && sd_bus_set_fd(raw, ends[0], ends[0]) >= 0);
     bus.reset(raw);
-    require(sd_bus_set_server(raw, 1, SD_ID128_MAKE(1, 1, 1, 1, 1, 1, 1, 1, 1, 1, 1, 1, 1, 1, 1, 1)) >= 0);
+    require(sd_bus_set_server(raw, 1, sd_id128_t{{1}}) >= 0);
     require(sd_bus_start(raw) >= 0);
-    write(std::string("\0AUTH EXTERNAL\r\nDATA\r\nBEGIN\r\n", 30));
+    write("\0AUTH EXTERNAL\r\nDATA\r\nBEGIN\r\n"s);
     while (sd_bus_process(raw, nullptr) > 0) {
     }
     require(sd_bus_is_ready(raw) > 0);

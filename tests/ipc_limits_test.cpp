@@ -193,6 +193,21 @@ TEST(IPCLimits, RefusesTextThatIsNotUTF8AndGoesOn) {
   EXPECT_EQ(log.lines().count("4 ipc: connection"), 1u);
 }
 
+TEST(IPCLimits, DropsMessagesThatAreBrokenInsideWithOneLineABurst) {
+  LogCapture log;
+  TestService service;
+  RawClient client(service);
+  client.authenticate();
+  client.send(RawClient::message("no member", "", "") +
+              RawClient::message("flushMessagesWithReply", "", "", {.descriptors = 1}) +
+              RawClient::message("fetchDisplayURL", "", ""));
+  EXPECT_TRUE(service.journal.waitFor("fetchDisplayURL"));
+  client.close();
+  EXPECT_TRUE(service.journal.waitFor("destroyed"));
+  EXPECT_EQ(service.journal.count("flush"), 0u);
+  EXPECT_EQ(log.lines().count("4 ipc: connection"), 1u);
+}
+
 TEST(IPCLimits, AClientThatDiesInMidMessageDisturbsNobody) {
   TestService service;
   TestClient other(service);

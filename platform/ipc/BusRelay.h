@@ -52,6 +52,8 @@ class BusRelay {
   /// Whether `takeIn` has work although the socket may have nothing to read.
   bool hasHeldMessages() const noexcept { return _hasBegun && _held >= MessageGate::kFixedHeader; }
   bool insideMessage() const noexcept { return _held > 0 || _messages.insideMessage(); }
+  /// Messages handed to sd-bus so far, whole.
+  std::uint64_t finishedMessages() const noexcept { return _messages.finished(); }
   /// Bytes read from the socket so far.
   std::size_t received() const noexcept { return _received; }
   /// What was refused, or null when the peer just went away.

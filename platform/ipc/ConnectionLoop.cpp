@@ -28,6 +28,11 @@ int untilDeadline(std::chrono::steady_clock::time_point deadline) {
   return static_cast<int>(std::clamp<long long>(left, 0, 1'000'000));
 }
 
+int countMessage(sd_bus_message*, void* count, sd_bus_error*) {
+  ++*static_cast<std::uint64_t*>(count);
+  return 0;  // others look at it too
+}
+
 /// A server's bus on the inner end of a relay.
 BusHandle openBus(FileDescriptor socket) {
   sd_bus* raw = nullptr;
@@ -59,6 +64,7 @@ ConnectionLoop::ConnectionLoop(int socket, const IPCPeer& peer, const std::strin
       _router(router),
       _relay(socket, peer.user, settings.maximumMessage + kMessageOverhead),
       _bus(openBus(_relay.takeInnerEnd())) {
+  check(sd_bus_add_filter(_bus.get(), nullptr, countMessage, &_messagesSeen), "sd_bus_add_filter");
   _replies.open(_bus.get());
 }
 
@@ -169,8 +175,18 @@ bool ConnectionLoop::processWaiting() {
     if (result < 0) return false;
     if (message) _router.route(raw);
     if (sd_bus_is_open(_bus.get()) <= 0) return false;
-    if (result == 0) return true;
+    if (result == 0) break;
   }
+  noteBrokenMessages();
+  return true;
+}
+
+/// sd-bus drops without a word what has the frame of a message and breaks the rules inside: its sender waits
+/// for an answer in vain.
+void ConnectionLoop::noteBrokenMessages() {
+  if (_messagesSeen == _relay.finishedMessages() || _relay.complaint()) return;
+  _messagesSeen = _relay.finishedMessages();
+  if (_brokenMessages.begins()) VESK_LOG_WARNING("ipc: %s: Dropped a broken message", _name.c_str());
 }
 
 ConnectionLoop::End ConnectionLoop::endOfBus() const {

@@ -14,6 +14,7 @@
 #include "platform/ipc/IPCConnection.h"
 #include "platform/ipc/Outbox.h"
 #include "platform/ipc/Wakeup.h"
+#include "platform/ipc/WarningBurst.h"
 
 namespace vesk {
 
@@ -67,6 +68,7 @@ class ConnectionLoop {
   std::optional<End> advance();
   bool process();
   bool processWaiting();
+  void noteBrokenMessages();
   End drain();
   End endOfBus() const;
 
@@ -80,6 +82,8 @@ class ConnectionLoop {
   BusRelay _relay;
   BusHandle _bus;
   bool _peerGone = false;
+  std::uint64_t _messagesSeen = 0;
+  WarningBurst _brokenMessages;
 };
 
 }  // namespace vesk

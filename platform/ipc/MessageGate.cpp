@@ -35,6 +35,7 @@ MessageGate::Result MessageGate::pass(std::string_view data) {
     auto step = static_cast<std::size_t>(std::min<std::uint64_t>(_remaining, data.size() - result.passed));
     result.passed += step;
     _remaining -= step;
+    if (step > 0 && _remaining == 0) ++_finished;
     auto rest = data.substr(result.passed);
     if (rest.size() < kFixedHeader) return result;
     auto size = messageSize(rest);

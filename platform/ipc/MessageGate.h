@@ -30,9 +30,12 @@ class MessageGate {
   Result pass(std::string_view data);
 
   bool insideMessage() const noexcept { return _remaining > 0; }
+  /// Messages that have been passed whole.
+  std::uint64_t finished() const noexcept { return _finished; }
 
  private:
   const std::size_t _maximumMessage;
+  std::uint64_t _finished = 0;
   std::uint64_t _remaining = 0;  // of the message whose start has been passed
 };
 
