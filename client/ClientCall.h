@@ -35,6 +35,8 @@ struct ClientCall {
   CallEffect effect = CallEffect::None;
 
   bool wantsAnswer() const noexcept { return end != nullptr; }
+  /// Nothing but arguments, and nobody waits for an answer.
+  bool isPlain() const noexcept { return !end && !descriptor; }
 };
 
 }  // namespace vesk

@@ -15,8 +15,13 @@ namespace vesk {
 
 namespace {
 
-// So that answers and aggregated messages are received also while much is sent.
-constexpr std::size_t kCallsPerStep = 256;
+// Writes in a row, so that answers and aggregated messages are received also while much is sent.
+constexpr int kWritesPerStep = 16;
+
+// One-way calls that are written together: enough to make the system call cheap, few enough to keep what has
+// to be sent again after a loss small.
+constexpr std::size_t kCallsPerWrite = 64;
+constexpr std::size_t kBytesPerWrite = std::size_t{32} << 10;
 
 // Answers that the daemon may owe us; further calls that want one wait in the queue.
 constexpr std::size_t kMaximumAnswersOwed = 512;
@@ -92,7 +97,7 @@ void SessionWorker::endEverything() noexcept {
   _isClosed = true;
   _isConnected.store(false, std::memory_order_relaxed);
   _link.lose(Clock::now(), "the session was closed");
-  if (_isFrontInBus && _waiting.front().wantsAnswer()) frontHasLeft();
+  if (_callsInBus > 0 && _waiting.front().wantsAnswer()) frontHasLeft();
   auto close = [this](const ClientCall& call) {
     _drops.unsent();
     end(call.end, ReportingStatus::Closed, nullptr, "");
@@ -181,16 +186,15 @@ void SessionWorker::linkHasChanged(DaemonLink::Change change) {
   VESK_LOG_DEBUG("VeskReporting: %s", _link.problem().c_str());
   // What the socket had not taken whole, the daemon has not seen: a one-way call is sent again. A call that
   // wants an answer has learnt of the loss already.
-  if (std::exchange(_isFrontInBus, false) && _waiting.front().wantsAnswer()) frontHasLeft();
+  if (_callsInBus > 0 && _waiting.front().wantsAnswer()) frontHasLeft();
+  _callsInBus = 0;
   _isHopeless = _drainDeadline && !_link.wasEverReady();
   endRequests(ReportingStatus::NotConnected, _link.problem());
 }
 
 void SessionWorker::introduceAgain() {
   for (const IPCOutgoingCall& call : _memory.replay()) {
-    if (_link.bus().send(call) != BusClient::SendResult::Disconnected) continue;
-    _link.lose(Clock::now(), "the daemon has closed the connection");
-    return linkHasChanged(DaemonLink::Change::Lost);
+    if (_link.bus().send(call) == BusClient::SendResult::Disconnected) return connectionBroke(Clock::now());
   }
 }
 
@@ -201,15 +205,38 @@ bool SessionWorker::canSend() {
   return !_waiting.front().wantsAnswer() || _answersOwed < kMaximumAnswersOwed;
 }
 
-// Only one call at a time is left to the bus when the socket is full: what the bus holds is lost with the
-// connection, what waits here is not.
+// Calls stay here until the socket has taken them: what only the bus held would be lost with the connection.
 void SessionWorker::sendWaiting(Time now) {
-  for (std::size_t i = 0; i < kCallsPerStep; ++i) {
-    if (_isFrontInBus && _link.bus().queuedMessages() == 0) frontHasLeft();
+  for (int i = 0; i < kWritesPerStep; ++i) {
+    callsHaveLeft();
     if (!canSend()) return;
-    sendFront(now);
-    if (_callsGone >= kCallsPerStep / 4) giveRoomBack();
+    if (_waiting.front().isPlain()) {
+      sendTogether(now);
+    } else {
+      sendFront(now);
+    }
   }
+}
+
+void SessionWorker::sendTogether(Time now) {
+  BusClient& bus = _link.bus();
+  const std::size_t most = std::min(_waiting.size(), kCallsPerWrite);
+  while (_callsInBus < most && bus.addedBytes() < kBytesPerWrite) {
+    ClientCall& call = _waiting.at(_callsInBus);
+    if (!call.isPlain()) break;
+    auto result = bus.add(call.call);
+    if (result == BusClient::SendResult::Disconnected) return connectionBroke(now);
+    if (result == BusClient::SendResult::Sent) {
+      handedOver(call);
+    } else if (_callsInBus > 0) {
+      break;  // once it is the front
+    } else {
+      _drops.invalid();
+      return frontHasLeft();
+    }
+  }
+  if (bus.write() == BusClient::Progress::Disconnected) return connectionBroke(now);
+  callsHaveLeft();
 }
 
 void SessionWorker::sendFront(Time now) {
@@ -229,27 +256,38 @@ void SessionWorker::sendFront(Time now) {
 
   switch (result) {
     case BusClient::SendResult::Sent:
-      _memory.note(front);
-      _isFrontInBus = _link.bus().queuedMessages() > 0;
-      if (!_isFrontInBus) return frontHasLeft();
       front.deadline = Time::max();  // the bus minds it
-      break;
+      handedOver(front);
+      return callsHaveLeft();
     case BusClient::SendResult::Refused:
       _drops.invalid();
       end(front.end, ReportingStatus::InvalidArgument, nullptr, "");
-      frontHasLeft();
-      break;
+      return frontHasLeft();
     case BusClient::SendResult::Disconnected:
-      _link.lose(now, "the daemon has closed the connection");
-      linkHasChanged(DaemonLink::Change::Lost);
-      break;
+      return connectionBroke(now);
   }
+}
+
+void SessionWorker::handedOver(ClientCall& call) {
+  _memory.note(call);
+  ++_callsInBus;
+}
+
+void SessionWorker::connectionBroke(Time now) {
+  _link.lose(now, "the daemon has closed the connection");
+  linkHasChanged(DaemonLink::Change::Lost);
+}
+
+void SessionWorker::callsHaveLeft() {
+  if (_callsInBus == 0) return;
+  std::size_t held = std::min(_callsInBus, _link.bus().queuedMessages());
+  for (std::size_t left = std::exchange(_callsInBus, held) - held; left > 0; --left) frontHasLeft();
+  if (_callsGone >= kCallsPerWrite) giveRoomBack();
 }
 
 void SessionWorker::frontHasLeft() noexcept {
   ++_callsGone;
   _memoryGone += _waiting.front().memory;
-  _isFrontInBus = false;
   _waiting.popFront();
 }
 

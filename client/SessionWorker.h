@@ -67,7 +67,11 @@ class SessionWorker final : private ClientSessionReplyInterface {
 
   bool canSend();
   void sendWaiting(Time now);
+  void sendTogether(Time now);
   void sendFront(Time now);
+  void handedOver(ClientCall& call);
+  void connectionBroke(Time now);
+  void callsHaveLeft();
   void frontHasLeft() noexcept;
   void giveRoomBack() noexcept;
   void sayFarewell(Time now);
@@ -105,7 +109,8 @@ class SessionWorker final : private ClientSessionReplyInterface {
   std::size_t _answersOwed = 0;
   std::size_t _callsGone = 0;  ///< whose room in the queue is not given back yet
   std::size_t _memoryGone = 0;
-  bool _isFrontInBus = false;  ///< the front was sent, but the socket has not taken all of it yet
+  std::size_t _callsInBus =
+      0;  ///< the first of those that wait: sent, but the socket has not taken all of them yet
   bool _isNapping = false;
   bool _isHopeless = false;  ///< closing, and there never was a daemon
   bool _isClosed = false;

@@ -16,6 +16,8 @@ class WaitingCalls {
   bool empty() const noexcept { return _next == _calls.size(); }
   std::size_t size() const noexcept { return _calls.size() - _next; }
   ClientCall& front() noexcept { return _calls[_next]; }
+  /// 0 is the front.
+  ClientCall& at(std::size_t index) noexcept { return _calls[_next + index]; }
   void popFront() noexcept {
     if (_calls[_next].wantsAnswer()) --_answered;
     _calls[_next++] = ClientCall{};

@@ -164,9 +164,12 @@ TEST_F(ClientSession, RefusesWhatCannotBeSentAndGoesOn) {
   VeskReporting session(options());
   EXPECT_EQ(session.sendMessageAndWait(1, 1, Dictionary{{"k", std::string(2'000'000, 'x')}}).status,
             ReportingStatus::InvalidArgument);
+  EXPECT_EQ(session.uploadLogData(List(std::vector<Value>(90'000, Date{}))).status,
+            ReportingStatus::InvalidArgument)
+      << "too long on the wire only";
   EXPECT_EQ(session.sendMessage(1, 1, Dictionary{{"k", "\xff"}}), ReportingStatus::Queued);
   EXPECT_EQ(session.sendMessageAndWait(1, 2).answer, "posted");
-  EXPECT_EQ(session.drops().invalid, 2U);
+  EXPECT_EQ(session.drops().invalid, 3U);
   EXPECT_EQ(session.uploadFile(directory / "missing").status, ReportingStatus::FileUnavailable);
   EXPECT_EQ(session.uploadFile(directory.path()).detail, "Is a directory");
 }
@@ -197,17 +200,23 @@ TEST_F(ClientSession, ManyThreadsSendThroughOneSession) {
 
 TEST_F(ClientSession, TheEndOfASessionSendsWhatIsQueuedAndCollectsItsAnswers) {
   constexpr std::uint16_t kMessages = 1000;
+  const Dictionary payload{{"k", std::string(2000, 'x')}};  // more in all than the socket takes at once
   int answers = 0;
   {
     VeskReporting session(options());
     for (std::uint16_t i = 0; i < kMessages; ++i) {
-      EXPECT_EQ(session.sendMessage(i, 0), ReportingStatus::Queued);
-      EXPECT_EQ(session.sendMessage(i, 1, std::nullopt, [&](auto result) { answers += result ? 1 : 0; }),
+      EXPECT_EQ(session.sendMessage(i, 0, payload), ReportingStatus::Queued);
+      EXPECT_EQ(session.sendMessage(i, 1, payload, [&](auto result) { answers += result ? 1 : 0; }),
                 ReportingStatus::Queued);
     }
   }
   EXPECT_EQ(answers, kMessages);
-  EXPECT_EQ(record.lines().size(), 2U * kMessages);
+  auto lines = record.lines();
+  ASSERT_EQ(lines.size(), 2U * kMessages);
+  for (std::size_t i = 0; i < lines.size(); ++i) {
+    std::string beginning = "message " + std::to_string(i / 2) + " " + std::to_string(i % 2) + " ";
+    EXPECT_TRUE(lines[i].starts_with(beginning)) << lines[i];
+  }
 }
 
 TEST_F(ClientSession, TheEndOfASessionDoesNotWaitForAnAnswerLongerThanItsTime) {

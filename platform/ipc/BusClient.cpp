@@ -12,6 +12,7 @@
 #include "platform/ipc/BusHandles.h"
 #include "platform/ipc/BusReplies.h"
 #include "platform/ipc/CallRouter.h"
+#include "platform/ipc/OneWayOutbox.h"
 #include "platform/ipc/UnixSocket.h"
 #include "platform/log/SystemLog.h"
 
@@ -24,6 +25,9 @@ using namespace std::chrono_literals;
 // Steps of the bus in one `process`, so that a daemon that sends without end leaves the owner's loop its
 // turn.
 constexpr int kMaximumSteps = 64;
+
+// The wire adds less than three times as much to what counts as content.
+constexpr std::size_t kSurelyShort = OneWayEncoder::kMaximumMessage / 4;
 
 void check(int result, const char* what) {
   if (result < 0) throw std::system_error(-result, std::generic_category(), what);
@@ -52,10 +56,13 @@ class BusClient::Implementation {
     _router.setExportedObject(std::move(object));
   }
   SendResult send(const IPCOutgoingCall& call, AnswerHandler handler, std::chrono::milliseconds timeout);
+  SendResult add(const IPCOutgoingCall& call);
+  Progress writeAdded();
+  std::size_t addedBytes() const { return _outbox.bytes(); }
   std::size_t queuedMessages() const;
   bool isReady() const { return _bus && sd_bus_is_ready(_bus.get()) > 0; }
   int fd() const { return _bus ? sd_bus_get_fd(_bus.get()) : -1; }
-  short events() const { return _bus ? static_cast<short>(sd_bus_get_events(_bus.get())) : short{0}; }
+  short events() const;
   int timeout() const;
   Progress process();
   bool flush(std::chrono::milliseconds limit);
@@ -68,8 +75,8 @@ class BusClient::Implementation {
   };
   using PendingList = std::list<Pending>;
 
-  /// A call made before authentication was done. sd-bus would queue it too, but for one with a descriptor it
-  /// would wait.
+  /// A call made before authentication was done, or while the socket still owes room to calls added before.
+  /// sd-bus would queue it too in the first case, but for one with a descriptor it would wait.
   struct Deferred {
     BusMessageHandle message;
     PendingList::iterator pending;
@@ -79,6 +86,7 @@ class BusClient::Implementation {
   BusMessageHandle encode(const IPCOutgoingCall& call, bool expectReply, CodecResult& result) const;
   bool write(sd_bus_message* message, PendingList::iterator pending, std::chrono::milliseconds timeout);
   void sendDeferred();
+  std::size_t queuedByBus() const;
   static int answered(sd_bus_message* message, void* pending, sd_bus_error* error) noexcept;
   static void call(AnswerHandler& handler, BusAnswer answer) noexcept;
   void end() noexcept;
@@ -89,13 +97,15 @@ class BusClient::Implementation {
   BusHandle _bus;  // none once the connection has ended
   PendingList _pending;
   std::deque<Deferred> _deferred;
+  OneWayOutbox _outbox;
   bool _hasMore = false;
 };
 
 BusClient::Implementation::Implementation(Options options)
     : _objectPath(std::move(options.objectPath)),
       _replies(std::make_shared<BusReplies>(nullptr)),
-      _router(_objectPath, "client", _replies, 0) {
+      _router(_objectPath, "client", _replies, 0),
+      _outbox(_objectPath) {
   FileDescriptor socket =
       options.connected ? std::move(options.connected) : connectUnixSocket(options.socketPath);
   sd_bus* raw = nullptr;
@@ -120,6 +130,10 @@ BusMessageHandle BusClient::Implementation::encode(const IPCOutgoingCall& call, 
   BusEncoder encoder(raw);
   for (const auto& argument : call.arguments) encoder.append(argument);
   result = encoder.result();
+  // The daemon ends the connection of whoever sends it a message that is too long.
+  if (encoder.content() > kSurelyShort && OneWayEncoder(_objectPath).isTooLong(call)) {
+    result = CodecResult::LimitExceeded;
+  }
   return message;
 }
 
@@ -133,11 +147,10 @@ BusClient::SendResult BusClient::Implementation::send(const IPCOutgoingCall& cal
 
   auto pending = _pending.end();
   if (handler) pending = _pending.insert(_pending.end(), {this, std::move(handler)});
-  if (!isReady()) {
+  if (!isReady() || !_outbox.empty() || !_deferred.empty()) {
     _deferred.push_back({std::move(message), pending, timeout});
     return SendResult::Sent;
   }
-  sendDeferred();
   if (write(message.get(), pending, timeout)) return SendResult::Sent;
   if (pending != _pending.end()) _pending.erase(pending);
   return SendResult::Disconnected;
@@ -153,9 +166,26 @@ bool BusClient::Implementation::write(sd_bus_message* message, PendingList::iter
   return true;
 }
 
+BusClient::SendResult BusClient::Implementation::add(const IPCOutgoingCall& call) {
+  // Behind what sd-bus holds only sd-bus may write.
+  if (!isReady() || !_deferred.empty() || queuedByBus() > 0) return send(call, nullptr, 0ms);
+  return _outbox.add(call) == CodecResult::Ok ? SendResult::Sent : SendResult::Refused;
+}
+
+BusClient::Progress BusClient::Implementation::writeAdded() {
+  if (!_bus) return Progress::Disconnected;
+  if (_outbox.empty() || queuedByBus() > 0) return Progress::Connected;
+  if (!_outbox.write(fd())) {
+    end();
+    return Progress::Disconnected;
+  }
+  sendDeferred();
+  return Progress::Connected;
+}
+
 /// A failure is that of the connection; its end tells the handlers.
 void BusClient::Implementation::sendDeferred() {
-  while (!_deferred.empty()) {
+  while (!_deferred.empty() && _outbox.empty()) {
     Deferred deferred = std::move(_deferred.front());
     _deferred.pop_front();
     write(deferred.message.get(), deferred.pending, deferred.timeout);
@@ -189,10 +219,20 @@ int BusClient::Implementation::answered(sd_bus_message* message, void* data, sd_
   return 1;
 }
 
-std::size_t BusClient::Implementation::queuedMessages() const {
+std::size_t BusClient::Implementation::queuedByBus() const {
   std::uint64_t queued = 0;
   if (_bus) sd_bus_get_n_queued_write(_bus.get(), &queued);
-  return queued + _deferred.size();
+  return queued;
+}
+
+std::size_t BusClient::Implementation::queuedMessages() const {
+  return queuedByBus() + _deferred.size() + _outbox.messages();
+}
+
+short BusClient::Implementation::events() const {
+  if (!_bus) return 0;
+  int events = sd_bus_get_events(_bus.get());
+  return static_cast<short>(_outbox.empty() ? events : events | POLLOUT);
 }
 
 int BusClient::Implementation::timeout() const {
@@ -208,7 +248,10 @@ int BusClient::Implementation::timeout() const {
 BusClient::Progress BusClient::Implementation::process() {
   if (!_bus) return Progress::Disconnected;
   _hasMore = false;
-  _replies->sendWaiting();
+  if (writeAdded() == Progress::Disconnected) return Progress::Disconnected;
+  // In the middle of a message nothing else may be written. sd-bus itself writes only what we ask for and
+  // answers to calls that want one, which the daemon does not make.
+  if (!_outbox.insideMessage()) _replies->sendWaiting();
   for (int step = 0; step < kMaximumSteps; ++step) {
     sd_bus_message* raw = nullptr;
     int result = sd_bus_process(_bus.get(), &raw);
@@ -266,6 +309,10 @@ BusClient::SendResult BusClient::send(const IPCOutgoingCall& call, AnswerHandler
                                       std::chrono::milliseconds timeout) {
   return _implementation->send(call, std::move(handler), timeout);
 }
+
+BusClient::SendResult BusClient::add(const IPCOutgoingCall& call) { return _implementation->add(call); }
+BusClient::Progress BusClient::write() { return _implementation->writeAdded(); }
+std::size_t BusClient::addedBytes() const { return _implementation->addedBytes(); }
 
 std::size_t BusClient::queuedMessages() const { return _implementation->queuedMessages(); }
 bool BusClient::isReady() const { return _implementation->isReady(); }

@@ -77,6 +77,13 @@ class BusClient {
 
   /// One-way.
   [[nodiscard]] SendResult send(const IPCOutgoingCall& call);
+  /// A one-way call without a descriptor, put with those that `write` writes together: the cheap way to send
+  /// many. Once the socket is full they wait here; a sender that must not lose them with the connection keeps
+  /// its own until `queuedMessages` says that they have left.
+  [[nodiscard]] SendResult add(const IPCOutgoingCall& call);
+  [[nodiscard]] Progress write();
+  /// Bytes added that the socket has not taken.
+  std::size_t addedBytes() const;
   /// With an answer, or an error after `timeout`. The handler is dropped unless the call was sent.
   [[nodiscard]] SendResult send(const IPCOutgoingCall& call, AnswerHandler handler,
                                 std::chrono::milliseconds timeout);

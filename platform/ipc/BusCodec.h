@@ -111,6 +111,8 @@ class BusEncoder {
 
   bool ok() const noexcept { return _result == CodecResult::Ok; }
   CodecResult result() const noexcept { return _result; }
+  /// Bytes appended so far, as the limits count them.
+  std::size_t content() const noexcept { return _content; }
 
  private:
   template <class T>

@@ -4,34 +4,13 @@
 #include <cstring>
 
 #include "platform/ipc/BusCodec.h"
+#include "platform/ipc/SendableText.h"
 
 namespace vesk {
 
 namespace {
 
 constexpr std::size_t kNodeContent = 8;
-
-/// sd-bus does not look at the texts that it sends; the receiver would refuse the whole message.
-bool isSendable(std::string_view text) noexcept {
-  const auto* at = reinterpret_cast<const unsigned char*>(text.data());
-  const auto* end = at + text.size();
-  while (at < end) {
-    unsigned char lead = *at++;
-    if (lead == 0) return false;
-    if (lead < 0x80) continue;
-    int more = lead >= 0xF0 ? 3 : lead >= 0xE0 ? 2 : 1;
-    if (lead < 0xC2 || lead > 0xF4 || end - at < more) return false;
-    // Overlong forms, surrogates and what lies above U+10FFFF show in the second byte.
-    unsigned char low = lead == 0xE0 ? 0xA0 : lead == 0xF0 ? 0x90 : 0x80;
-    unsigned char high = lead == 0xED ? 0x9F : lead == 0xF4 ? 0x8F : 0xBF;
-    if (*at < low || *at > high) return false;
-    for (int i = 1; i < more; ++i) {
-      if ((at[i] & 0xC0) != 0x80) return false;
-    }
-    at += more;
-  }
-  return true;
-}
 
 }  // namespace
 
@@ -88,6 +67,7 @@ bool BusEncoder::append(double value) { return basic(SD_BUS_TYPE_DOUBLE, &value)
 
 bool BusEncoder::append(std::string_view value) {
   if (!count(value.size())) return false;
+  // sd-bus does not look at the texts that it sends.
   if (!isSendable(value)) return fail(CodecResult::Malformed);
   char* space = nullptr;
   int r = sd_bus_message_append_string_space(_message, value.size(), &space);

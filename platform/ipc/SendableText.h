@@ -1,0 +1,41 @@
+// What D-Bus takes as text.
+#pragma once
+
+#include <cstdint>
+#include <cstring>
+#include <string_view>
+
+namespace vesk {
+
+/// UTF-8 without NUL. The receiver of any other text would refuse the whole message.
+inline bool isSendable(std::string_view text) noexcept {
+  const auto* at = reinterpret_cast<const unsigned char*>(text.data());
+  const auto* end = at + text.size();
+  while (at < end) {
+    if (end - at >= 8) {
+      std::uint64_t eight;
+      std::memcpy(&eight, at, sizeof eight);
+      // Neither a NUL nor anything beyond ASCII among them.
+      if (((eight | (eight - 0x0101010101010101U)) & 0x8080808080808080U) == 0) {
+        at += 8;
+        continue;
+      }
+    }
+    unsigned char lead = *at++;
+    if (lead == 0) return false;
+    if (lead < 0x80) continue;
+    int more = lead >= 0xF0 ? 3 : lead >= 0xE0 ? 2 : 1;
+    if (lead < 0xC2 || lead > 0xF4 || end - at < more) return false;
+    // Overlong forms, surrogates and what lies above U+10FFFF show in the second byte.
+    unsigned char low = lead == 0xE0 ? 0xA0 : lead == 0xF0 ? 0x90 : 0x80;
+    unsigned char high = lead == 0xED ? 0x9F : lead == 0xF4 ? 0x8F : 0xBF;
+    if (*at < low || *at > high) return false;
+    for (int i = 1; i < more; ++i) {
+      if ((at[i] & 0xC0) != 0x80) return false;
+    }
+    at += more;
+  }
+  return true;
+}
+
+}  // namespace vesk
