@@ -77,9 +77,9 @@ TEST_F(WireCodec, ReadsEveryContainerAsListDictionaryOrBytes) {
   EXPECT_EQ(decoded("v", "an", 2, 1, -1), Value(List{1, -1}));
   EXPECT_EQ(decoded("v", "aay", 2, 1, 65, 0), Value(List{Bytes("A"), Bytes()}));
   EXPECT_EQ(decoded("v", "(is)", 4, "x"), Value(List{4, "x"}));
-  EXPECT_EQ(decoded("v", "a(ii)", 1, 3, 4), Value(List{List{3, 4}}));
+  EXPECT_EQ(decoded("v", "a(ii)", 1, 3, 4), Value(List{Value(List{3, 4})}));
   EXPECT_EQ(decoded("v", "a{ss}", 1, "k", "v"), Value(Dictionary{{"k", "v"}}));
-  EXPECT_EQ(decoded("v", "a{is}", 1, 9, "v"), Value(List{List{9, "v"}}));
+  EXPECT_EQ(decoded("v", "a{is}", 1, 9, "v"), Value(List{Value(List{9, "v"})}));
   EXPECT_EQ(decoded("v", "v", "v", "u", 1), Value(1u));
   EXPECT_EQ(decoded("av", 0), Value(List{}));
   EXPECT_EQ(decoded("a{sv}", 2, "k", "i", 1, "k", "i", 2), Value(Dictionary{{"k", 2}}))

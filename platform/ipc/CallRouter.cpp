@@ -75,7 +75,8 @@ void CallRouter::call(sd_bus_message* message) {
   auto object = _object;
   try {
     object->handle(call);
-    if (!call.isSettled()) call.refuse(SD_BUS_ERROR_FAILED, "The call was not answered");
+    if (call.expectsReply() && !call.isSettled())
+      call.refuse(SD_BUS_ERROR_FAILED, "The call was not answered");
   } catch (const std::exception& error) {
     VESK_LOG_ERROR("ipc: %s: %s failed: %s", _connectionName.c_str(), sd_bus_message_get_member(message),
                    error.what());

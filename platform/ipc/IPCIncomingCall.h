@@ -19,7 +19,7 @@ class BusReplies;
 
 /// Given to IPCExportedObject::handle and gone when that returns; used on the connection's thread. A call
 /// ends in one of four ways: `answer`, `takeReply`, a failed `read` (which has told the caller) or `refuse`;
-/// a call left in none of them is answered with an error.
+/// a call that expects an answer and is left in none of them gets an error.
 class IPCIncomingCall {
  public:
   /// `owner`: whose the descriptors are that `grant` keeps.
