@@ -9,6 +9,7 @@
 #include <string>
 
 #include "platform/http/HTTPClient.h"
+#include "platform/queue/TimedQueue.h"
 #include "platform/time/Clock.h"
 #include "util/Counters.h"
 
@@ -19,6 +20,8 @@ struct BackendServices {
   HTTPClient& http;
   const WallClock& clock;
   Counters& counters;
+  /// Where datagrams are sent and acknowledgements read.
+  TimedQueueMaker& networkQueues;
   /// A stable identifier of this installation: for true the one that respects the user's diagnostics consent,
   /// for false the one that is used when a storebag overrides it.
   std::function<std::string(bool respectsConsent)> persistentIdentifierForDNU;

@@ -4,6 +4,7 @@
 
 #include <cstdlib>
 
+#include "backends/DashboardBackend.h"
 #include "backends/HTTPSPostBackend.h"
 #include "platform/crypto/Digest.h"
 #include "platform/log/SystemLog.h"
@@ -29,6 +30,9 @@ std::shared_ptr<VeskReportingBackend> VeskReportingBackend::newBackendWithName(
     const std::string& name, const std::optional<Dictionary>& profile,
     const std::optional<Text>& productFamily, [[maybe_unused]] std::int32_t clientType,
     const BackendServices& services) {
+  if (name == kVeskReportingBackendDashboard) {
+    return DashboardBackend::create(name, profile, productFamily, services);
+  }
   if (name == kVeskReportingBackendHTTPPost || name == kVeskReportingBackendHTTPPost2) {
     return HTTPSPostBackend::create(name, profile, productFamily, services);
   }

@@ -12,6 +12,7 @@
 #include "platform/ipc/BusCodec.h"
 #include "platform/ipc/BusHandles.h"
 #include "platform/json/JSONWriter.h"
+#include "platform/queue/TimedQueuePool.h"
 #include "util/Gzip.h"
 
 namespace vesk {
@@ -58,6 +59,7 @@ class Services {
   BackendServices services{_http,
                            WallClock::system(),
                            _counters,
+                           _queues,
                            [](bool) { return std::string("3E8B9C50-6E5C-4B0E-9D43-0F6B8E5C7A11"); },
                            [] { return true; },
                            [] { return std::optional<std::string>("US"); }};
@@ -65,6 +67,7 @@ class Services {
  private:
   HTTPClient _http;
   Counters _counters;
+  TimedQueuePool _queues{1};
 };
 
 void decode(benchmark::State& state) {

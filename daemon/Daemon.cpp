@@ -2,6 +2,8 @@
 
 #include <VeskReporting/VeskReporting.h>
 
+#include <algorithm>
+#include <chrono>
 #include <utility>
 
 #include "client/common/Resources.h"
@@ -12,6 +14,7 @@
 #include "platform/http/HTTPClient.h"
 #include "platform/ipc/IPCListener.h"
 #include "platform/log/SystemLog.h"
+#include "platform/queue/TimedQueuePool.h"
 
 namespace vesk {
 
@@ -38,6 +41,7 @@ struct Daemon::Parts {
       : backendServices{http,
                         WallClock::system(),
                         Counters::shared(),
+                        networkQueues,
                         [](bool respectsConsent) {
                           return VeskReporting::getPersistentIdentifierForDNU(respectsConsent);
                         },
@@ -59,6 +63,8 @@ struct Daemon::Parts {
     };
   }
 
+  // Datagrams take no time to send: one thread does it for all backends.
+  TimedQueuePool networkQueues{1};
   // Before the client: what is still being posted when the client ends completes with the services' help.
   BackendServices backendServices;
   SessionServices sessionServices;
@@ -77,9 +83,16 @@ void Daemon::resume() { _parts->listener.resume(); }
 void Daemon::stop() {
   if (std::exchange(_stopped, true)) return;
   _parts->listener.stop();
+  const auto begun = std::chrono::steady_clock::now();
   if (!_parts->http.waitUntilIdle(kPostWait)) {
     VESK_LOG_WARNING("main: Stopping although posts are still outstanding after %d seconds.",
                      static_cast<int>(kPostWait.count()));
+  }
+  const auto waited =
+      std::chrono::duration_cast<std::chrono::milliseconds>(std::chrono::steady_clock::now() - begun);
+  if (!_parts->networkQueues.waitUntilUnused(kDatagramWait - std::min(waited, kDatagramWait))) {
+    VESK_LOG_WARNING("main: Stopping although datagrams are still unacknowledged after %d ms.",
+                     static_cast<int>(kDatagramWait.count()));
   }
 }
 

@@ -22,10 +22,13 @@ class Daemon {
   void resume();
 
   /// Ends in order: no new connections, the sessions destroyed (they send their closing messages and flush),
-  /// then what is being posted waited for, at most `kPostWait`. Safe to call twice.
+  /// then what is being posted waited for, at most `kPostWait`, and datagrams, at most `kDatagramWait`. Safe
+  /// to call twice.
   void stop();
 
   static constexpr std::chrono::seconds kPostWait{10};
+  /// From the same moment: a dashboard that is not answered gives up 9.5 s after its next tick.
+  static constexpr std::chrono::milliseconds kDatagramWait{10'500};
 
  private:
   struct Parts;

@@ -1,6 +1,7 @@
 #include "storebag/StorebagProfile.h"
 
 #include "platform/log/SystemLog.h"
+#include "platform/preferences/PreferencesSuite.h"
 
 namespace vesk {
 
@@ -47,6 +48,14 @@ std::optional<std::int64_t> profileInteger(std::string_view backendName, const D
   auto number = profileNumber(backendName, profile, key);
   if (!number) return std::nullopt;
   return number->asInteger();
+}
+
+std::optional<std::int64_t> profileIntegerOrNumericText(std::string_view backendName,
+                                                        const Dictionary& profile, std::string_view key) {
+  auto* value =
+      find(backendName, profile, key, [](const Value& v) { return v.isNumber() || v.text() != nullptr; });
+  if (!value) return std::nullopt;
+  return integerForm(*value);
 }
 
 std::optional<List> profileList(std::string_view backendName, const Dictionary& profile,

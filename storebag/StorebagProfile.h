@@ -24,6 +24,9 @@ std::optional<Value> profileNumber(std::string_view backendName, const Dictionar
 /// A number, cut to an integer as `Value::asInteger` does.
 std::optional<std::int64_t> profileInteger(std::string_view backendName, const Dictionary& profile,
                                            std::string_view key);
+/// A number as above, or a text by its leading integer (0 when there is none).
+std::optional<std::int64_t> profileIntegerOrNumericText(std::string_view backendName,
+                                                        const Dictionary& profile, std::string_view key);
 std::optional<List> profileList(std::string_view backendName, const Dictionary& profile,
                                 std::string_view key);
 /// An element that is no text is left out, with one line for the list.

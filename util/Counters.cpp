@@ -33,6 +33,8 @@ std::string_view nameOfDropReason(DropReason reason) noexcept {
       return "upload-failed";
     case DropReason::NeverEnabled:
       return "never-enabled";
+    case DropReason::Unacknowledged:
+      return "unacknowledged";
   }
   return "unknown";
 }

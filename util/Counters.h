@@ -25,8 +25,9 @@ enum class DropReason : std::uint8_t {
   NoBackend,       ///< no backend was there to take it
   UploadFailed,    ///< a file was not uploaded
   NeverEnabled,    ///< still held when the session ended: reporting had never been enabled
+  Unacknowledged,  ///< a datagram that was not sent whole or never acknowledged, and given up
 };
-inline constexpr std::size_t kDropReasonCount = 10;
+inline constexpr std::size_t kDropReasonCount = 11;
 
 /// A word for it, for tools and logs: "state-disabled".
 std::string_view nameOfDropReason(DropReason reason) noexcept;

@@ -31,13 +31,13 @@ namespace {
 namespace asio = boost::asio;
 using Strand = asio::strand<asio::io_context::executor_type>;
 
-void run(const Work& work) noexcept {
+void run(const Work& work, const char* label) noexcept {
   try {
     work();
   } catch (const std::exception& error) {
-    VESK_LOG_ERROR("WorkQueue: work failed: %s", error.what());
+    VESK_LOG_ERROR("%s: work failed: %s", label, error.what());
   } catch (...) {
-    VESK_LOG_ERROR("WorkQueue: work failed");
+    VESK_LOG_ERROR("%s: work failed", label);
   }
 }
 
@@ -52,15 +52,15 @@ int duplicate(int descriptor) {
 /// What a timer and a read source have in common: a handler that can be taken away at any time.
 class WorkQueuePool::Source {
  public:
-  Source(Core& core, Work handler)
-      : _core(core), _handler(std::make_shared<const Work>(std::move(handler))) {}
+  Source(Core& core, const char* label, Work handler)
+      : _core(core), _label(label), _handler(std::make_shared<const Work>(std::move(handler))) {}
   virtual ~Source() = default;
   Source(const Source&) = delete;
   Source& operator=(const Source&) = delete;
 
   /// Runs the handler unless it was taken away; whether it is still there afterwards.
   bool call() noexcept {
-    if (auto handler = current()) run(*handler);
+    if (auto handler = current()) run(*handler, _label);
     return current() != nullptr;
   }
   void dropHandler() noexcept {
@@ -73,6 +73,7 @@ class WorkQueuePool::Source {
 
  protected:
   Core& _core;
+  const char* const _label;
 
  private:
   std::shared_ptr<const Work> current() {
@@ -162,9 +163,10 @@ void WorkQueuePool::Core::stop() noexcept {
 }
 
 struct WorkQueue::State {
-  explicit State(std::shared_ptr<WorkQueuePool::Core> pool)
-      : core(std::move(pool)), strand(asio::make_strand(core->context())) {}
+  State(std::shared_ptr<WorkQueuePool::Core> pool, const char* queueLabel)
+      : core(std::move(pool)), label(queueLabel), strand(asio::make_strand(core->context())) {}
   std::shared_ptr<WorkQueuePool::Core> core;
+  const char* const label;
   Strand strand;
 };
 
@@ -173,10 +175,11 @@ WorkQueuePool::WorkQueuePool(std::size_t threads)
 WorkQueuePool::~WorkQueuePool() { stop(); }
 void WorkQueuePool::stop() { _core->stop(); }
 
-WorkQueue::WorkQueue(WorkQueuePool& pool) : _state(std::make_shared<State>(pool._core)) {}
+WorkQueue::WorkQueue(WorkQueuePool& pool, const char* label)
+    : _state(std::make_shared<State>(pool._core, label)) {}
 
 void WorkQueue::submit(Work work) {
-  _state->core->post(_state->strand, [work = std::move(work)] { run(work); });
+  _state->core->post(_state->strand, [work = std::move(work), label = _state->label] { run(work, label); });
 }
 
 /// Only its queue touches the timer of the context.
@@ -184,8 +187,8 @@ class WorkQueuePool::Timer : public Source, public std::enable_shared_from_this<
  public:
   using Clock = std::chrono::steady_clock;
 
-  Timer(Core& core, Strand strand, std::chrono::milliseconds interval, Work handler)
-      : Source(core, std::move(handler)),
+  Timer(Core& core, const char* label, Strand strand, std::chrono::milliseconds interval, Work handler)
+      : Source(core, label, std::move(handler)),
         _interval(interval),
         _strand(std::move(strand)),
         _timer(core.context()) {}
@@ -218,8 +221,8 @@ class WorkQueuePool::Timer : public Source, public std::enable_shared_from_this<
 /// Only its queue touches the descriptor of the context.
 class WorkQueuePool::Watch : public Source, public std::enable_shared_from_this<Watch> {
  public:
-  Watch(Core& core, Strand strand, FileDescriptor descriptor, Work handler)
-      : Source(core, std::move(handler)),
+  Watch(Core& core, const char* label, Strand strand, FileDescriptor descriptor, Work handler)
+      : Source(core, label, std::move(handler)),
         _strand(std::move(strand)),
         _descriptor(core.context(), descriptor.get()) {
     [[maybe_unused]] int owned = descriptor.release();
@@ -251,8 +254,8 @@ class WorkQueuePool::Watch : public Source, public std::enable_shared_from_this<
 
 void WorkQueue::submitAfter(std::chrono::milliseconds delay, Work work) {
   // The context holds it until it has fired.
-  std::make_shared<WorkQueuePool::Timer>(*_state->core, _state->strand, std::chrono::milliseconds::zero(),
-                                         std::move(work))
+  std::make_shared<WorkQueuePool::Timer>(*_state->core, _state->label, _state->strand,
+                                         std::chrono::milliseconds::zero(), std::move(work))
       ->start(delay);
 }
 
@@ -281,15 +284,16 @@ void WorkSource::cancel() noexcept {
 WorkTimer::WorkTimer(const WorkQueue& queue, std::chrono::milliseconds first,
                      std::chrono::milliseconds interval, Work handler)
     : WorkSource(queue) {
-  auto timer = std::make_shared<WorkQueuePool::Timer>(*queue._state->core, queue._state->strand, interval,
-                                                      std::move(handler));
+  auto timer = std::make_shared<WorkQueuePool::Timer>(*queue._state->core, queue._state->label,
+                                                      queue._state->strand, interval, std::move(handler));
   _source = timer;
   timer->start(first);
 }
 
 ReadSource::ReadSource(const WorkQueue& queue, int descriptor, Work handler) : WorkSource(queue) {
-  auto watch = std::make_shared<WorkQueuePool::Watch>(
-      *queue._state->core, queue._state->strand, FileDescriptor(duplicate(descriptor)), std::move(handler));
+  auto watch =
+      std::make_shared<WorkQueuePool::Watch>(*queue._state->core, queue._state->label, queue._state->strand,
+                                             FileDescriptor(duplicate(descriptor)), std::move(handler));
   _source = watch;
   watch->start();
 }

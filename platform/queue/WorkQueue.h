@@ -42,7 +42,8 @@ class WorkQueuePool {
 /// Runs its work one at a time, in the order of submission. Copies are the same queue. Thread-safe.
 class WorkQueue {
  public:
-  explicit WorkQueue(WorkQueuePool& pool);
+  /// `label` names the queue in log lines; a literal.
+  explicit WorkQueue(WorkQueuePool& pool, const char* label = "WorkQueue");
 
   void submit(Work work);
   /// Once, not before `delay` is over. Can't be taken back; use a WorkTimer for that.

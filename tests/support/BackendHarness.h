@@ -14,6 +14,7 @@
 #include <vector>
 
 #include "backends/VeskReportingBackend.h"
+#include "platform/queue/TimedQueuePool.h"
 #include "tools/collector/HTTPServer.h"
 
 namespace vesk::test {
@@ -45,6 +46,7 @@ class BackendHarness {
       : services{_http,
                  clock,
                  counters,
+                 networkQueues,
                  [](bool respects) { return std::string(respects ? "id-respecting" : "id-overriding"); },
                  [this] { return consent; },
                  [this] { return region; }},
@@ -67,6 +69,7 @@ class BackendHarness {
 
   HandClock clock;
   Counters counters;
+  TimedQueuePool networkQueues{1};
   bool consent = true;
   std::optional<std::string> region = "US";
 

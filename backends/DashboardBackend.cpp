@@ -1,0 +1,160 @@
+#include "backends/DashboardBackend.h"
+
+#include <algorithm>
+#include <new>
+#include <utility>
+
+#include "backends/DashboardText.h"
+#include "platform/log/SystemLog.h"
+#include "storebag/StorebagProfile.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr char kQueueLabel[] = "com.corvane.VeskReporting.networkProc";
+constexpr std::int64_t kLongestTick = 3'600'000;  // ms
+constexpr std::int64_t kMicrosecondsPerStep = 4000;
+
+/// What a profile says of the server and the delivery.
+struct Settings {
+  IPv4Endpoint server;
+  bool isReliable = true;
+  std::chrono::milliseconds tick = DashboardDelivery::kDefaultTick;
+};
+
+std::chrono::milliseconds tickFrom(std::int64_t reliable) {
+  if (reliable > 0 && reliable <= kLongestTick) return std::chrono::milliseconds(reliable);
+  VESK_LOG_WARNING("DashboardBackend(initWithName): 'reliable' can't be %lld ms, using %d ms",
+                   static_cast<long long>(reliable),
+                   static_cast<int>(DashboardDelivery::kDefaultTick.count()));
+  return DashboardDelivery::kDefaultTick;
+}
+
+/// Nothing, and a line, when the server can't be told.
+std::optional<Settings> settingsFrom(const std::string& name, const Dictionary& profile) {
+  auto ip = profileText(name, profile, "ip");
+  auto server = ip ? IPv4Endpoint::parse(*ip, 0) : std::nullopt;
+  if (!server) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): can't resolve server IP");
+    return std::nullopt;
+  }
+  auto port = profileIntegerOrNumericText(name, profile, "port");
+  if (!port) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): can't resolve server port");
+    return std::nullopt;
+  }
+  server->port = static_cast<std::uint16_t>(*port);
+  auto reliable = profileIntegerOrNumericText(name, profile, "reliable");
+  return Settings{*server, reliable.has_value(),
+                  reliable ? tickFrom(*reliable) : DashboardDelivery::kDefaultTick};
+}
+
+std::optional<Settings> settingsFrom(const std::optional<std::string>& serverIP, std::uint16_t serverPort) {
+  if (!serverIP) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): initWitName with all null params.");
+    return std::nullopt;
+  }
+  auto server = IPv4Endpoint::parse(*serverIP, serverPort);
+  if (!server) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): can't resolve server IP");
+    return std::nullopt;
+  }
+  return Settings{*server};
+}
+
+}  // namespace
+
+std::shared_ptr<DashboardBackend> DashboardBackend::create(const std::string& name,
+                                                           const std::optional<Dictionary>& profile,
+                                                           const std::optional<Text>& productFamily,
+                                                           const BackendServices& services) {
+  return createConnected(name, profile, std::nullopt, 0, productFamily, services);
+}
+
+std::shared_ptr<DashboardBackend> DashboardBackend::create(const std::string& name,
+                                                           const std::optional<std::string>& serverIP,
+                                                           std::uint16_t serverPort,
+                                                           const std::optional<Text>& productFamily,
+                                                           const BackendServices& services) {
+  if (!serverIP) return nullptr;
+  return createConnected(name, std::nullopt, serverIP, serverPort, productFamily, services);
+}
+
+std::shared_ptr<DashboardBackend> DashboardBackend::createConnected(
+    const std::string& name, const std::optional<Dictionary>& profile,
+    const std::optional<std::string>& serverIP, std::uint16_t serverPort,
+    const std::optional<Text>& productFamily, const BackendServices& services) {
+  auto settings = profile ? settingsFrom(name, *profile) : std::nullopt;
+  if (profile && !settings) return nullptr;
+  UDPSocket socket;
+  if (int error = socket.open()) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): socket() failed (%d)", error);
+    return nullptr;
+  }
+  auto delivery = std::make_shared<DashboardDelivery>(
+      std::move(socket), services.networkQueues.makeQueue(kQueueLabel), services.counters, name);
+  std::shared_ptr<DashboardBackend> backend(
+      new DashboardBackend(name, profile, productFamily.value_or(Text()), delivery, services));
+  if (!profile) settings = settingsFrom(serverIP, serverPort);
+  if (!settings) return nullptr;  // the backend's end gives everything back, here and below
+  if (settings->isReliable) delivery->useReliableUDP();
+  if (!delivery->connect(settings->server)) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): socket connect() failed.");
+    return nullptr;
+  }
+  if (!delivery->start(settings->tick)) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): can't create timer source.");
+    return nullptr;
+  }
+  return backend;
+}
+
+DashboardBackend::DashboardBackend(const std::string& name, const std::optional<Dictionary>& profile,
+                                   const Text& productFamily, std::shared_ptr<DashboardDelivery> delivery,
+                                   const BackendServices& services)
+    : VeskReportingBackend(name, profile.value_or(Dictionary()), productFamily, services),
+      _usingProfile(profile.has_value()),
+      _postURL(profileText(name, _profile, "post_url")),
+      _delivery(std::move(delivery)) {
+  MutexLock lock(_mutex);
+  _displayURL = profileText(name, _profile, "display_url");
+}
+
+// For a backend that its session never came to clean up.
+DashboardBackend::~DashboardBackend() { cleanup(); }
+
+void DashboardBackend::cleanup() { _delivery->cleanup(); }
+
+std::optional<std::string> DashboardBackend::sendMessageLocked(const std::optional<Dictionary>& payload,
+                                                               const timeval& timestamp, std::uint16_t method,
+                                                               std::uint16_t respCode, std::uint16_t eventID,
+                                                               std::int32_t) {
+  std::unique_ptr<DashboardDelivery::Buffer> buffer(new (std::nothrow) DashboardDelivery::Buffer);
+  if (!buffer) {
+    VESK_LOG_ERROR("DashboardBackend(sendMessage): can't malloc.");
+    return std::nullopt;
+  }
+  DashboardHeader header;
+  header.libraryVersionMajor = _selfVersionMajor;
+  header.clientType = static_cast<std::uint8_t>(_compType);
+  header.subsecond = static_cast<std::uint8_t>(timestamp.tv_usec / kMicrosecondsPerStep);
+  header.seconds = static_cast<std::uint32_t>(timestamp.tv_sec);
+  header.sessionID = _sessionID;
+  header.clientVersion = _clientVersion;
+  header.method = method;
+  header.respCode = respCode;
+  std::copy_n(_udid.begin(), std::min(_udid.size(), header.deviceID.size()), header.deviceID.begin());
+  header.eventID = eventID;
+  header.isReliable = _delivery->isReliable();
+  header.isWithoutProfile = !_usingProfile;
+  const std::size_t textLength =
+      payload ? writePayloadText(*payload, buffer->data() + kDashboardHeaderSize, kDashboardTextArea) : 0;
+  header.length = static_cast<std::uint16_t>(kDashboardHeaderSize + textLength);
+  encodeDashboardHeader(header, buffer->data());
+  auto line = writeLocalLog({buffer->data(), header.length});
+  _delivery->send(std::move(buffer), header.length, eventID);
+  return line;
+}
+
+}  // namespace vesk

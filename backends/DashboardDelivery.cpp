@@ -1,0 +1,212 @@
+#include "backends/DashboardDelivery.h"
+
+#include <cerrno>
+#include <exception>
+#include <new>
+#include <system_error>
+#include <utility>
+
+#include "platform/log/SystemLog.h"
+
+namespace vesk {
+
+namespace {
+
+/// Ticks before a retransmission, by the retransmissions made so far; their number is the most that are made.
+constexpr std::array<std::int32_t, 4> kTicksBeforeRetransmit{2, 3, 5, 9};
+
+}  // namespace
+
+DashboardDelivery::DashboardDelivery(UDPSocket socket, std::shared_ptr<TimedQueue> networkProcQueue,
+                                     Counters& counters, std::string backendName)
+    : _networkProcQueue(std::move(networkProcQueue)),
+      _counters(counters),
+      _backendName(std::move(backendName)),
+      _socket(std::move(socket)) {}
+
+DashboardDelivery::~DashboardDelivery() {
+  MutexLock lock(_mutex);
+  countLost(DropReason::Unacknowledged, _messageQueue.size() + _handedOver.size());
+}
+
+// --- Construction
+// --------------------------------------------------------------------------------------------
+
+void DashboardDelivery::useReliableUDP() {
+  if (int error = _socket.bindToAnyPort()) {
+    VESK_LOG_ERROR("DashboardBackend(useReliableUDP): can't bind socket, %d", error);
+    return;
+  }
+  _reliableUDP = true;
+  try {
+    _readSource = _networkProcQueue->makeReadSource(_socket.descriptor(), [weak = weak_from_this()] {
+      if (auto self = weak.lock()) self->processSocketRead();
+    });
+  } catch (const std::exception&) {
+    VESK_LOG_ERROR("DashboardBackend(useReliableUDP): can't create read source");
+  }
+}
+
+bool DashboardDelivery::connect(const IPv4Endpoint& server) { return _socket.connect(server) == 0; }
+
+bool DashboardDelivery::start(std::chrono::milliseconds tick) {
+  try {
+    _timer.emplace(*_networkProcQueue, tick);
+    _networkProcQueue->submit([self = shared_from_this()] {
+      if (self->_timer) self->_timer->start([self] { self->myPeriodicTask(); });
+    });
+    return true;
+  } catch (const std::exception&) {
+    return false;
+  }
+}
+
+// --- From the session
+// ----------------------------------------------------------------------------------------
+
+void DashboardDelivery::send(std::unique_ptr<Buffer> buffer, std::uint16_t length,
+                             std::uint16_t eventNumber) {
+  bool isFirst = false;
+  {
+    MutexLock lock(_mutex);
+    if (_handedOver.size() >= kMaximumHandedOver) {
+      countLost(DropReason::OverBound);
+      return;
+    }
+    isFirst = _handedOver.empty();
+    _handedOver.push_back({std::move(buffer), length, eventNumber});
+  }
+  // The task that is under way already takes this datagram along.
+  if (isFirst) _networkProcQueue->submit([self = shared_from_this()] { self->sendHandedOver(); });
+}
+
+void DashboardDelivery::cleanup() {
+  _networkProcQueue->submit([self = shared_from_this()] {
+    if (self->_messageQueue.empty()) return self->cleanupSources();
+    if (self->_cleanupState == Running) self->_cleanupState = Requested;
+    self->keepTicking();
+  });
+}
+
+// --- On the queue
+// --------------------------------------------------------------------------------------------
+
+void DashboardDelivery::sendHandedOver() {
+  std::vector<HandedOver> datagrams;
+  {
+    MutexLock lock(_mutex);
+    datagrams.swap(_handedOver);
+  }
+  for (const auto& datagram : datagrams)
+    tryToSendMsg(datagram.buffer->data(), datagram.length, datagram.eventNumber);
+}
+
+void DashboardDelivery::tryToSendMsg(const char* bytes, std::uint16_t length, std::uint16_t eventNumber) {
+  if (!_timer) return countLost(DropReason::Unacknowledged);  // torn down: nobody would try again
+  const std::string_view datagram(bytes, length);
+  const bool isSent = _socket.send(datagram);
+  if (isSent && !_reliableUDP) return;
+  try {
+    UDPPacketToSend packet(datagram, eventNumber);
+    if (isSent) packet.setState(UDPPacketToSend::Sent);
+    append(std::move(packet));
+  } catch (const std::bad_alloc&) {
+    countLost(DropReason::OverBound);
+  }
+}
+
+void DashboardDelivery::append(UDPPacketToSend packet) {
+  _messageQueue.push_back(std::move(packet));
+  if (_messageQueue.size() > kMaximumQueued) {
+    _messageQueue.erase(_messageQueue.begin());
+    countLost(DropReason::OverBound);
+  }
+  keepTicking();
+}
+
+void DashboardDelivery::processSocketRead() {
+  Buffer buffer;
+  const auto size = _socket.receive(buffer);
+  if (!size) return;
+  const auto eventID = eventIDOfAcknowledgement({buffer.data(), *size});
+  if (!eventID) return;
+  for (auto packet = _messageQueue.begin(); packet != _messageQueue.end(); ++packet) {
+    if (packet->eventNumber() != *eventID) continue;
+    _messageQueue.erase(packet);
+    return;
+  }
+}
+
+void DashboardDelivery::myPeriodicTask() {
+  walkQueue();
+  if (_cleanupState != Running) {
+    continueShutdown();
+  } else if (_messageQueue.empty() && _timer) {
+    _timer->pause();  // until there is something to look after again
+  }
+}
+
+void DashboardDelivery::walkQueue() {
+  for (std::size_t index = 0; index < _messageQueue.size();) {
+    UDPPacketToSend& packet = _messageQueue[index];
+    bool isDone = false;
+    if (packet.state() == UDPPacketToSend::Unsent) {
+      const bool isSent = _socket.send(packet.data());
+      if (isSent && _reliableUDP) packet.setState(UDPPacketToSend::Sent);
+      isDone = isSent && !_reliableUDP;
+    } else {
+      isDone = !keepsWaiting(packet);
+    }
+    if (isDone) {
+      _messageQueue.erase(_messageQueue.begin() + static_cast<std::ptrdiff_t>(index));
+    } else {
+      ++index;
+    }
+  }
+}
+
+/// One tick of a datagram that waits for its acknowledgement; false once it is given up.
+bool DashboardDelivery::keepsWaiting(UDPPacketToSend& packet) {
+  const auto retransmits = static_cast<std::size_t>(packet.numberOfRetransmits());
+  if (retransmits >= kTicksBeforeRetransmit.size()) {
+    countLost(DropReason::Unacknowledged);
+    return false;
+  }
+  const std::int32_t checks = packet.numberOfChecks() + 1;
+  if (checks < kTicksBeforeRetransmit[retransmits]) {
+    packet.setNumberOfChecks(checks);
+  } else if (_socket.send(packet.data())) {
+    packet.setNumberOfChecks(0);
+    packet.setNumberOfRetransmits(packet.numberOfRetransmits() + 1);
+  }
+  return true;
+}
+
+void DashboardDelivery::continueShutdown() {
+  if (_messageQueue.empty()) {
+    VESK_LOG_DEBUG("DashboardBackend(myPeriodicTask): clean up at myPeriodicTask.");
+    cleanupSources();
+  } else if (_cleanupState == Requested) {
+    _cleanupState = LastResortScheduled;
+    VESK_LOG_DEBUG("DashboardBackend(myPeriodicTask): scheduled last resort clean-up in %d ms.",
+                   static_cast<int>(kLastResort.count()));
+    _networkProcQueue->submitAfter(kLastResort, [self = shared_from_this()] { self->cleanupSources(); });
+  }
+}
+
+void DashboardDelivery::keepTicking() {
+  if (_timer && _timer->isPaused()) _timer->resume([self = shared_from_this()] { self->myPeriodicTask(); });
+}
+
+// Whoever calls this holds a reference: what the sources held may have been the last others.
+void DashboardDelivery::cleanupSources() {
+  _timer.reset();
+  _readSource.reset();
+  _socket.close();
+}
+
+void DashboardDelivery::countLost(DropReason reason, std::size_t count) {
+  if (count > 0) _counters.count(_backendName, reason, count);
+}
+
+}  // namespace vesk

@@ -1,0 +1,94 @@
+#include "platform/net/UDPSocket.h"
+
+#include <arpa/inet.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
+
+#include <cerrno>
+#include <cstring>
+
+namespace vesk {
+
+namespace {
+
+constexpr std::size_t kLongestDotted = 15;
+
+sockaddr_in addressOf(const IPv4Endpoint& endpoint) {
+  sockaddr_in address{};
+  address.sin_family = AF_INET;
+  address.sin_port = htons(endpoint.port);
+  address.sin_addr.s_addr = htonl(endpoint.address);
+  return address;
+}
+
+IPv4Endpoint endpointOf(const sockaddr_in& address) {
+  return {ntohl(address.sin_addr.s_addr), ntohs(address.sin_port)};
+}
+
+int errorOf(int result) { return result == 0 ? 0 : errno; }
+
+bool isWhole(ssize_t count, std::string_view datagram) {
+  return count >= 0 && static_cast<std::size_t>(count) == datagram.size();
+}
+
+}  // namespace
+
+std::optional<IPv4Endpoint> IPv4Endpoint::parse(std::string_view dotted, std::uint16_t port) {
+  if (dotted.size() > kLongestDotted || dotted.find('\0') != std::string_view::npos) return std::nullopt;
+  in_addr address{};
+  if (::inet_pton(AF_INET, std::string(dotted).c_str(), &address) != 1) return std::nullopt;
+  return IPv4Endpoint{ntohl(address.s_addr), port};
+}
+
+std::string IPv4Endpoint::text() const {
+  std::string dotted;
+  for (int shift = 24; shift >= 0; shift -= 8)
+    dotted += std::to_string(address >> shift & 0xFF) + (shift > 0 ? "." : ":");
+  return dotted + std::to_string(port);
+}
+
+int UDPSocket::open() noexcept {
+  _descriptor = FileDescriptor(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+  return _descriptor ? 0 : errno;
+}
+
+int UDPSocket::bind(const IPv4Endpoint& local) noexcept {
+  const sockaddr_in address = addressOf(local);
+  return errorOf(::bind(descriptor(), reinterpret_cast<const sockaddr*>(&address), sizeof address));
+}
+
+int UDPSocket::connect(const IPv4Endpoint& peer) noexcept {
+  const sockaddr_in address = addressOf(peer);
+  return errorOf(::connect(descriptor(), reinterpret_cast<const sockaddr*>(&address), sizeof address));
+}
+
+bool UDPSocket::send(std::string_view datagram) noexcept {
+  return isWhole(::send(descriptor(), datagram.data(), datagram.size(), MSG_NOSIGNAL), datagram);
+}
+
+bool UDPSocket::sendTo(const IPv4Endpoint& peer, std::string_view datagram) noexcept {
+  const sockaddr_in address = addressOf(peer);
+  return isWhole(::sendto(descriptor(), datagram.data(), datagram.size(), MSG_NOSIGNAL,
+                          reinterpret_cast<const sockaddr*>(&address), sizeof address),
+                 datagram);
+}
+
+std::optional<std::size_t> UDPSocket::receive(std::span<char> buffer, IPv4Endpoint* sender) noexcept {
+  sockaddr_in address{};
+  socklen_t size = sizeof address;
+  const ssize_t count =
+      ::recvfrom(descriptor(), buffer.data(), buffer.size(), 0, reinterpret_cast<sockaddr*>(&address), &size);
+  if (count < 0) return std::nullopt;
+  if (sender != nullptr) *sender = endpointOf(address);
+  return static_cast<std::size_t>(count);
+}
+
+std::optional<IPv4Endpoint> UDPSocket::localEndpoint() const noexcept {
+  sockaddr_in address{};
+  socklen_t size = sizeof address;
+  if (::getsockname(descriptor(), reinterpret_cast<sockaddr*>(&address), &size) != 0) return std::nullopt;
+  if (address.sin_port == 0) return std::nullopt;
+  return endpointOf(address);
+}
+
+}  // namespace vesk

@@ -1,0 +1,60 @@
+// Datagrams over IPv4.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <optional>
+#include <span>
+#include <string>
+#include <string_view>
+
+#include "platform/files/FileDescriptor.h"
+
+namespace vesk {
+
+/// An IPv4 address with a port, both in host order.
+struct IPv4Endpoint {
+  std::uint32_t address = 0;
+  std::uint16_t port = 0;
+
+  /// Four decimal numbers between dots ("127.0.0.1"), 15 characters at most; nothing else is understood.
+  static std::optional<IPv4Endpoint> parse(std::string_view dotted, std::uint16_t port);
+  /// "127.0.0.1:40312"
+  std::string text() const;
+  friend bool operator==(const IPv4Endpoint&, const IPv4Endpoint&) = default;
+};
+
+/// One socket, which never blocks and never raises SIGPIPE. Operations that can fail give the system's error
+/// number, 0 for none. On a closed socket they fail with EBADF. Not synchronised, except that the kernel lets
+/// one thread send while another receives.
+class UDPSocket {
+ public:
+  /// Opens nothing.
+  UDPSocket() noexcept = default;
+  [[nodiscard]] int open() noexcept;
+  [[nodiscard]] int bind(const IPv4Endpoint& local) noexcept;
+  /// To the wildcard address and a port that the system picks.
+  [[nodiscard]] int bindToAnyPort() noexcept { return bind({}); }
+  /// Only this peer's datagrams are received from now on.
+  [[nodiscard]] int connect(const IPv4Endpoint& peer) noexcept;
+
+  /// To the connected peer; true when the whole datagram went out.
+  [[nodiscard]] bool send(std::string_view datagram) noexcept;
+  [[nodiscard]] bool sendTo(const IPv4Endpoint& peer, std::string_view datagram) noexcept;
+  /// One datagram, cut to the buffer's size; nothing when none is there or the system reports an error, which
+  /// that clears. `sender` may be null.
+  [[nodiscard]] std::optional<std::size_t> receive(std::span<char> buffer,
+                                                   IPv4Endpoint* sender = nullptr) noexcept;
+
+  /// What it is bound to; nothing before that.
+  std::optional<IPv4Endpoint> localEndpoint() const noexcept;
+  int descriptor() const noexcept { return _descriptor.get(); }
+  bool isOpen() const noexcept { return static_cast<bool>(_descriptor); }
+  /// May be called twice.
+  void close() noexcept { _descriptor.reset(); }
+
+ private:
+  FileDescriptor _descriptor;
+};
+
+}  // namespace vesk

@@ -1,0 +1,255 @@
+// Retransmission, acknowledgement, bounds and shutdown of datagrams, tick by tick over real sockets.
+#include <gtest/gtest.h>
+
+#include <numeric>
+
+#include "backends/DashboardDelivery.h"
+#include "tests/support/CapturedLog.h"
+#include "tests/support/DashboardServer.h"
+#include "tests/support/SimulatedQueues.h"
+
+namespace vesk::test {
+namespace {
+
+using std::chrono::milliseconds;
+
+constexpr char kCleanUpLine[] = "DashboardBackend(myPeriodicTask): clean up at myPeriodicTask.";
+constexpr char kLastResortLine[] =
+    "DashboardBackend(myPeriodicTask): scheduled last resort clean-up in 9500 ms.";
+
+class Delivery : public testing::Test {
+ protected:
+  void start(bool reliable = true, milliseconds tick = milliseconds(500)) {
+    UDPSocket socket;
+    ASSERT_EQ(socket.open(), 0);
+    _delivery = std::make_shared<DashboardDelivery>(std::move(socket), _queue, _counters, "dashboard");
+    if (reliable) _delivery->useReliableUDP();
+    ASSERT_TRUE(_delivery->connect(_server.endpoint()));
+    ASSERT_TRUE(_delivery->start(tick));
+    _queue->run();
+  }
+  void send(std::uint16_t eventID) {
+    auto buffer = std::make_unique<DashboardDelivery::Buffer>();
+    (*buffer)[60] = static_cast<char>(eventID >> 8);
+    (*buffer)[61] = static_cast<char>(eventID);
+    _delivery->send(std::move(buffer), kDashboardHeaderSize, eventID);
+    _queue->run();
+  }
+  void cleanup() {
+    _delivery->cleanup();
+    _queue->run();
+  }
+  /// Lets time pass in steps and gives when, in ms from now, which event arrived.
+  std::vector<std::pair<int, int>> arrivalsDuring(int duration, int step = 100) {
+    std::vector<std::pair<int, int>> arrivals;
+    for (int at = 0; at <= duration; at += step) {
+      if (at > 0) _queue->advance(milliseconds(step));
+      for (int id : _server.takeEventIDs()) arrivals.emplace_back(at, id);
+    }
+    return arrivals;
+  }
+  std::uint64_t lost(DropReason reason) const {
+    std::uint64_t sum = 0;
+    for (const auto& count : _counters.snapshot()) sum += count.reason == reason ? count.count : 0;
+    return sum;
+  }
+
+  using Arrivals = std::vector<std::pair<int, int>>;
+  Counters _counters;
+  DashboardServer _server;
+  std::shared_ptr<SimulatedQueue> _queue = std::make_shared<SimulatedQueue>();
+  std::shared_ptr<DashboardDelivery> _delivery;
+  CapturedLog _log;
+};
+
+TEST_F(Delivery, SendsAgainFourTimesAndThenGivesUp) {
+  for (int tick : {500, 1, 40}) {
+    SCOPED_TRACE(tick);
+    start(true, milliseconds(tick));
+    const auto lostBefore = lost(DropReason::Unacknowledged);
+    send(7);
+    EXPECT_EQ(arrivalsDuring(19 * tick, tick),
+              (Arrivals{{0, 7}, {2 * tick, 7}, {5 * tick, 7}, {10 * tick, 7}, {19 * tick, 7}}));
+    EXPECT_EQ(lost(DropReason::Unacknowledged), lostBefore);
+    EXPECT_EQ(arrivalsDuring(100 * tick, tick), Arrivals{});
+    EXPECT_EQ(lost(DropReason::Unacknowledged), lostBefore + 1);
+  }
+}
+
+TEST_F(Delivery, KeepsItsBeatWhileItIdles) {
+  start();
+  _queue->advance(milliseconds(1300));
+  EXPECT_EQ(_queue->waiting(), 0u) << "no timer while nothing is pending";
+  send(1);  // the beats are at 1500 and 2000
+  EXPECT_EQ(arrivalsDuring(3000), (Arrivals{{0, 1}, {700, 1}, {2200, 1}}));
+}
+
+TEST_F(Delivery, AnAcknowledgedDatagramIsNeverSentAgain) {
+  start();
+  send(1);
+  send(0x1234);
+  EXPECT_EQ(arrivalsDuring(2500),
+            (Arrivals{{0, 1}, {0, 0x1234}, {1000, 1}, {1000, 0x1234}, {2500, 1}, {2500, 0x1234}}));
+  _server.acknowledge(0x1234);
+  EXPECT_EQ(arrivalsDuring(2500), (Arrivals{{2500, 1}}));
+}
+
+TEST_F(Delivery, IgnoresWhatAcknowledgesNothing) {
+  start();
+  send(0);
+  _server.take();
+  _server.acknowledge(9);
+  _server.acknowledge(0, 61);  // a byte too short
+  _server.send("");
+  EXPECT_EQ(arrivalsDuring(1000), (Arrivals{{1000, 0}}));
+  _server.send(std::string(2000, '\0'));  // longer than any datagram, and carries 0
+  EXPECT_EQ(arrivalsDuring(9000), Arrivals{});
+}
+
+TEST_F(Delivery, OneAcknowledgementTakesOneOfTwoDatagramsWithItsEventID) {
+  start();
+  send(5);
+  _queue->advance(milliseconds(500));
+  send(5);
+  _server.take();
+  _server.acknowledge(5);
+  EXPECT_EQ(arrivalsDuring(1000), (Arrivals{{1000, 5}})) << "the older one is gone, which was due after 500";
+}
+
+TEST_F(Delivery, TheOldestOfFiftyOneGoes) {
+  start();
+  for (std::uint16_t id = 1; id <= 51; ++id) send(id);
+  EXPECT_EQ(_server.takeEventIDs().size(), 51u) << "each went out once";
+  EXPECT_EQ(lost(DropReason::OverBound), 1u);
+  _queue->advance(milliseconds(1000));
+  std::vector<int> others(50);
+  std::iota(others.begin(), others.end(), 2);
+  EXPECT_EQ(_server.takeEventIDs(), others);
+}
+
+TEST_F(Delivery, WithoutReliabilityOnlyWhatCouldNotBeSentWaits) {
+  start(false);
+  send(1);
+  EXPECT_EQ(arrivalsDuring(20'000), (Arrivals{{0, 1}}));
+  EXPECT_EQ(_queue->readers(), 0u);
+  _server.stop();
+  send(2);  // goes out, and its refusal comes back
+  send(3);  // is told of it
+  EXPECT_EQ(_queue->waiting(), 1u) << "3 waits for the next tick";
+  _queue->advance(milliseconds(500));  // goes out
+  _queue->advance(milliseconds(500));
+  EXPECT_EQ(_queue->waiting(), 0u);
+  EXPECT_EQ(lost(DropReason::Unacknowledged), 0u);
+}
+
+TEST_F(Delivery, AServerThatIsGoneCostsFiftyDatagramsAtMost) {
+  start();
+  _server.stop();
+  for (int i = 0; i < 1000; ++i) send(static_cast<std::uint16_t>(i));
+  EXPECT_EQ(lost(DropReason::OverBound), 950u);
+  _queue->advance(milliseconds(60'000));
+  EXPECT_EQ(lost(DropReason::Unacknowledged), 50u);
+  EXPECT_EQ(_queue->waiting(), 0u);
+}
+
+TEST_F(Delivery, WhatComesFasterThanItGoesOutIsBounded) {
+  start();
+  for (int i = 0; i < 1030; ++i)
+    _delivery->send(std::make_unique<DashboardDelivery::Buffer>(), kDashboardHeaderSize, 1);
+  EXPECT_EQ(lost(DropReason::OverBound), 6u);
+  _queue->run();
+  EXPECT_EQ(lost(DropReason::OverBound), 6u + 1024u - 50u);
+}
+
+TEST_F(Delivery, CleanupGivesEverythingBackOnce) {
+  for (bool reliable : {true, false}) {
+    const long before = openDescriptors();
+    start(reliable);
+    _queue->advance(milliseconds(700));
+    cleanup();
+    EXPECT_EQ(openDescriptors(), before);
+    EXPECT_EQ(_queue->waiting() + _queue->readers(), 0u);
+    cleanup();
+    send(1);  // from a session that has not noticed yet
+    EXPECT_EQ(arrivalsDuring(1000), Arrivals{});
+    std::weak_ptr<DashboardDelivery> gone = _delivery;
+    _delivery.reset();
+    EXPECT_TRUE(gone.expired());
+    EXPECT_EQ(_log.countContaining(7, "myPeriodicTask"), 0) << "nothing was pending";
+  }
+}
+
+TEST_F(Delivery, CleanupLetsAnAnsweringServerFinish) {
+  const long before = openDescriptors();
+  start();
+  send(1);
+  cleanup();
+  _delivery.reset();  // the session has let go
+  EXPECT_EQ(openDescriptors(), before + 1);
+  _server.take();
+  _server.acknowledge(1);
+  _queue->advance(milliseconds(500));
+  EXPECT_EQ(_log.count(7, kCleanUpLine), 1);
+  EXPECT_EQ(_log.count(7, kLastResortLine), 0);
+  EXPECT_EQ(openDescriptors(), before);
+  EXPECT_EQ(_queue->waiting() + _queue->readers(), 0u);
+}
+
+TEST_F(Delivery, CleanupEndsNineAndAHalfSecondsAfterTheNextTick) {
+  const long before = openDescriptors();
+  start();
+  _queue->advance(milliseconds(200));
+  send(1);
+  _queue->advance(milliseconds(2000));
+  send(2);
+  cleanup();
+  cleanup();
+  _delivery.reset();
+  _queue->advance(milliseconds(300));  // the tick at 2500
+  EXPECT_EQ(_log.count(7, kLastResortLine), 1);
+  _server.take();
+  EXPECT_EQ(arrivalsDuring(9'499, 1).size(), 6u) << "both still go out again";
+  EXPECT_EQ(openDescriptors(), before + 1);
+  _queue->advance(milliseconds(1));
+  EXPECT_EQ(openDescriptors(), before);
+  EXPECT_EQ(_queue->waiting() + _queue->readers(), 0u);
+  EXPECT_EQ(_log.count(7, kLastResortLine), 1);
+  EXPECT_EQ(lost(DropReason::Unacknowledged), 2u) << "one was given up, one discarded";
+}
+
+TEST_F(Delivery, TheLastResortFindsNothingToDoAfterAnEarlierEnd) {
+  start();
+  send(1);
+  cleanup();
+  _queue->advance(milliseconds(500));
+  _server.take();
+  _server.acknowledge(1);
+  _queue->advance(milliseconds(500));
+  EXPECT_EQ(_log.count(7, kCleanUpLine), 1);
+  _queue->advance(milliseconds(20'000));
+  EXPECT_EQ(_log.count(7, kCleanUpLine), 1);
+}
+
+TEST_F(Delivery, GoesOnWithoutWhatItCanNotHave) {
+  const long before = openDescriptors();
+  {
+    UDPSocket bound;
+    ASSERT_EQ(bound.open() + bound.bindToAnyPort(), 0);
+    DashboardDelivery twiceBound(std::move(bound), _queue, _counters, "dashboard");
+    twiceBound.useReliableUDP();
+    EXPECT_EQ(_log.count(3, "DashboardBackend(useReliableUDP): can't bind socket, 22"), 1);
+    EXPECT_FALSE(twiceBound.isReliable());
+  }
+  _queue->refusesReadSources = true;
+  start();
+  EXPECT_EQ(_log.count(3, "DashboardBackend(useReliableUDP): can't create read source"), 1);
+  EXPECT_TRUE(_delivery->isReliable());
+  send(1);
+  cleanup();
+  _delivery.reset();
+  _queue->advance(milliseconds(10'000));
+  EXPECT_EQ(openDescriptors(), before) << "closed although no read source was there to be cancelled";
+}
+
+}  // namespace
+}  // namespace vesk::test

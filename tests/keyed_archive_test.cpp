@@ -1,0 +1,148 @@
+// Keyed archives: round trip, Python's plistlib as a second opinion, and what is refused.
+#include <gtest/gtest.h>
+
+#include <functional>
+
+#include "platform/plist/KeyedArchive.h"
+#include "tests/support/ChildProcess.h"
+#include "tests/support/TempDirectory.h"
+
+namespace vesk::test {
+namespace {
+
+Value sample() {
+  const List shared{"same", 1};
+  return List{
+      "text",
+      "ä → 🎉",
+      "",
+      "$null",
+      "text",
+      -7,
+      INT64_MIN,
+      UINT64_MAX,
+      0.1,
+      true,
+      false,
+      Value(),
+      Date{1795552289.25},
+      Bytes(std::string("\0\x01\xff", 3)),
+      List{},
+      Dictionary{},
+      shared,
+      Dictionary{{"shared", shared}, {"text", "text"}, {"", List{Value(List{Value(List{Value()})})}}}};
+}
+
+TEST(KeyedArchive, ReadsBackWhatWasArchived) {
+  for (const Value& value : {sample(), Value(), Value("$null"), Value(3), Value(Dictionary{{"a", 1}})}) {
+    const auto archive = archiveValue(value);
+    ASSERT_TRUE(archive);
+    const auto read = unarchiveValue(*archive);
+    ASSERT_TRUE(read.value) << read.error;
+    EXPECT_EQ(*read.value, value) << describe(*read.value);
+  }
+}
+
+TEST(KeyedArchive, ArchivesSharedObjectsOnceAndSharesThemAgain) {
+  const List big(std::vector<Value>(1000, Value(std::string(20, 'x'))));
+  const auto once = archiveValue(List{big});
+  const auto often = archiveValue(List(std::vector<Value>(50, Value(big))));
+  ASSERT_TRUE(once && often);
+  EXPECT_LT(often->size(), once->size() + 500);
+  const auto read = unarchiveValue(*often);
+  ASSERT_TRUE(read.value) << read.error;
+  const List& lists = *read.value->list();
+  EXPECT_EQ(lists[0].list()->begin(), lists[49].list()->begin());
+}
+
+TEST(KeyedArchive, IsAGraphOfObjectsWithClassesForOthersToo) {
+  TempDirectory directory;
+  const auto archive =
+      archiveValue(List{"a", Dictionary{{"k", "a"}, {"d", Date{86400.5}}}, Bytes("xy"), Value()});
+  ASSERT_TRUE(archive);
+  ChildProcess python({VESK_PYTHON, "-c", R"(
+import plistlib, sys
+document = plistlib.load(open(sys.argv[1], "rb"))
+objects = document["$objects"]
+assert document["$version"] == 100000 and document["$archiver"] == "VeskKeyedArchiver"
+assert objects[0] == "$null" and list(document) == ["$version", "$archiver", "$top", "$objects"]
+def chain(name): return {"$classname": name, "$classes": [name, "Object"]}
+def read(uid):
+    assert isinstance(uid, plistlib.UID)
+    value = objects[uid.data]
+    if not isinstance(value, dict): return None if uid.data == 0 else value
+    kind = objects[value.pop("$class").data]
+    assert kind == chain(kind["$classname"]), kind
+    return (kind["$classname"], {k: [read(u) for u in v] if isinstance(v, list) else v for k, v in value.items()})
+assert objects.count("a") == 1
+print(read(document["$top"]["root"]))
+)",
+                       directory.write("archive", *archive).string()});
+  ASSERT_EQ(python.wait(), 0) << python.errors();
+  EXPECT_EQ(python.output(),
+            "('List', {'items': ['a', ('Dictionary', {'keys': ['k', 'd'], 'items': ['a', "
+            "('Date', {'seconds': 86400.5})]}), ('Data', {'bytes': b'xy'}), None]})\n");
+}
+
+TEST(KeyedArchive, RefusesWhatCanNotBeArchived) {
+  Value deep = 1;
+  for (int i = 0; i < 65; ++i) deep = List{deep};
+  for (const Value& value : {deep, Value("\xff"), Value(std::string("a\0b", 3)),
+                             Value(Dictionary{{Text(std::string("\xc0")), 1}})})
+    EXPECT_FALSE(archiveValue(value));
+}
+
+Value uid(std::uint64_t index) { return Dictionary{{"CF$UID", index}}; }
+
+std::string document(List objects, Value root = uid(1)) {
+  return *writeBinaryPropertyList(Dictionary{{"$version", 100000},
+                                             {"$archiver", "VeskKeyedArchiver"},
+                                             {"$top", Dictionary{{"root", std::move(root)}}},
+                                             {"$objects", std::move(objects)}},
+                                  PropertyListFlavor::KeyedArchive);
+}
+
+TEST(KeyedArchive, RefusesWhatIsNoArchive) {
+  const Value listClass = Dictionary{{"$classname", "List"}};
+  auto list = [](std::vector<Value> items) {
+    return Value(Dictionary{{"items", List(std::move(items))}, {"$class", uid(2)}});
+  };
+  // Each object holds the next twice: small to write, endless to walk.
+  std::vector<Value> doubling{"$null"};
+  for (std::uint64_t i = 1; i <= 40; ++i)
+    doubling.push_back(Dictionary{{"items", List{uid(i + 1), uid(i + 1)}}, {"$class", uid(42)}});
+  doubling.insert(doubling.end(), {Value(1), listClass});
+  std::vector<Value> deep{"$null"};
+  for (std::uint64_t i = 1; i <= 70; ++i)
+    deep.push_back(Dictionary{{"items", List{uid(i + 1)}}, {"$class", uid(72)}});
+  deep.insert(deep.end(), {Value(1), listClass});
+  const struct {
+    std::string bytes;
+    const char* error;
+  } cases[] = {
+      {"", "no keyed archive: it is no binary property list"},
+      {"bplist00", "no valid trailer"},
+      {*writeBinaryPropertyList(List{1}), "no keyed archive: its root is no dictionary"},
+      {*writeBinaryPropertyList(Dictionary{}), "no keyed archive: another archiver made it"},
+      {document({}), "no keyed archive: it has no objects or no root"},
+      {document({"$null", 1}, uid(2)), "a reference to no object"},
+      {document({"$null", 1}, 1), "a reference to no object"},
+      {document({"$null", list({uid(1)}), listClass}), "an object that holds itself"},
+      {document({"$null", Dictionary{{"items", List{}}}}), "a reference to no object"},
+      {document({"$null", Dictionary{{"$class", uid(0)}}}), "an object without a class"},
+      {document({"$null", Dictionary{{"$class", uid(2)}}, Dictionary{{"$classname", "Bus"}}}),
+       "an object of an unknown class or form"},
+      {document({"$null", Dictionary{{"$class", uid(2)}}, listClass}), "a list without items"},
+      {document({"$null", List{}}), "an object that is neither text, number nor of a class"},
+      {document(List(std::move(doubling))), "more than 100000 values"},
+      {document(List(std::move(deep))), "nested deeper than 64"},
+  };
+  for (const auto& test : cases) {
+    const auto outcome = unarchiveValue(test.bytes);
+    EXPECT_FALSE(outcome.value) << test.error;
+    EXPECT_EQ(outcome.error, test.error);
+  }
+}
+
+}  // namespace
+}  // namespace vesk::test

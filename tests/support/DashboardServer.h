@@ -1,0 +1,62 @@
+// A dashboard server that answers only when it is told to.
+#pragma once
+
+#include <gtest/gtest.h>
+
+#include <filesystem>
+#include <string>
+#include <vector>
+
+#include "backends/DashboardDatagram.h"
+#include "platform/net/UDPSocket.h"
+
+namespace vesk::test {
+
+constexpr std::uint32_t kLoopback = 0x7F000001;
+
+class DashboardServer {
+ public:
+  DashboardServer() {
+    EXPECT_EQ(_socket.open(), 0);
+    EXPECT_EQ(_socket.bind({kLoopback, 0}), 0);
+    _endpoint = _socket.localEndpoint().value();
+  }
+
+  IPv4Endpoint endpoint() const { return _endpoint; }
+  /// From now on its port refuses datagrams.
+  void stop() { _socket.close(); }
+
+  /// What has arrived since the last call; loopback delivers before `send` returns.
+  std::vector<std::string> take() {
+    std::vector<std::string> datagrams;
+    char buffer[2048];
+    while (auto size = _socket.receive(buffer, &_client)) datagrams.emplace_back(buffer, *size);
+    return datagrams;
+  }
+  std::vector<int> takeEventIDs() {
+    std::vector<int> ids;
+    for (const auto& datagram : take()) ids.push_back(eventIDOfAcknowledgement(datagram).value_or(0xFFFF));
+    return ids;
+  }
+  /// To whoever sent last.
+  void send(std::string_view datagram) { EXPECT_TRUE(_socket.sendTo(_client, datagram)); }
+  void acknowledge(std::uint16_t eventID, std::size_t size = kDashboardShortestAcknowledgement) {
+    std::string datagram(kDashboardShortestAcknowledgement, '\0');
+    datagram[60] = static_cast<char>(eventID >> 8);
+    datagram[61] = static_cast<char>(eventID);
+    send(datagram.substr(0, size));
+  }
+
+ private:
+  UDPSocket _socket;
+  IPv4Endpoint _endpoint;
+  IPv4Endpoint _client;
+};
+
+/// Descriptors that a process has open.
+inline long openDescriptors(const std::string& process = "self") {
+  auto files = std::filesystem::directory_iterator("/proc/" + process + "/fd");
+  return std::distance(begin(files), end(files));
+}
+
+}  // namespace vesk::test
