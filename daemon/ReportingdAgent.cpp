@@ -64,6 +64,9 @@ bool ReportingdAgent::shouldAcceptNewConnection(const std::shared_ptr<IPCConnect
   });
   connection->setInvalidationHandler(
       [session, agent = shared_from_this()] { agent->sessionInvalidated(session); });
+  connection->setLossHandler([&counters = _services.backends.counters](std::size_t calls) {
+    counters.count("session", DropReason::NotAggregated, calls);
+  });
   connection->resume();
   return true;
 }

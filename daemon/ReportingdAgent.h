@@ -54,6 +54,10 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
  private:
   using SessionList = std::vector<std::shared_ptr<ReportingdSession>>;
 
+  /// An emptied list stays, in case that its family comes back; but a client that keeps inventing names must
+  /// not fill the memory, so beyond this many lists the empty ones go.
+  static constexpr std::size_t kMostKeptLists = 256;
+
   void removeFromSessionList(const std::shared_ptr<ReportingdSession>& session);
   void removeFromCorrelation(const std::shared_ptr<ReportingdSession>& session);
 
@@ -61,6 +65,7 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
   static std::shared_ptr<ReportingdSession> getFirstSessionWithHierarchy(std::int32_t level,
                                                                          const SessionList& list);
   const SessionList* correlatedSessions(const std::string& key) const VESK_REQUIRES(_monitor);
+  SessionList& listForKey(const std::string& key) VESK_REQUIRES(_monitor);
 
   // Constant after construction.
   const SessionServices& _services;
@@ -73,8 +78,7 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
   // Guarded by _monitor.
   RecursiveMutex _monitor;
   StorebagCache _cachedStorebags VESK_GUARDED_BY(_monitor);
-  std::map<std::string, SessionList> _correlatedSessions
-      VESK_GUARDED_BY(_monitor);  // lists are never removed
+  std::map<std::string, SessionList> _correlatedSessions VESK_GUARDED_BY(_monitor);
 };
 
 }  // namespace vesk

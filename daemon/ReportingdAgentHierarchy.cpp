@@ -32,6 +32,13 @@ const ReportingdAgent::SessionList* ReportingdAgent::correlatedSessions(const st
   return list == _correlatedSessions.end() ? nullptr : &list->second;
 }
 
+ReportingdAgent::SessionList& ReportingdAgent::listForKey(const std::string& key) {
+  if (_correlatedSessions.size() >= kMostKeptLists && !correlatedSessions(key)) {
+    std::erase_if(_correlatedSessions, [](const auto& entry) { return entry.second.empty(); });
+  }
+  return _correlatedSessions[key];
+}
+
 void ReportingdAgent::userInfoUpdatedForSession(ReportingdSession& session) {
   auto userInfo = session.userInfo();
   if (!userInfo) {
@@ -44,7 +51,7 @@ void ReportingdAgent::userInfoUpdatedForSession(ReportingdSession& session) {
   for (auto& [otherKey, list] : _correlatedSessions) std::erase(list, self);
   VESK_LOG_DEBUG("userInfoUpdatedForSession: Adding session %u to list for userInfoKey %s",
                  session.sessionID(), key.c_str());
-  _correlatedSessions[key].push_back(self);
+  listForKey(key).push_back(self);
 }
 
 std::shared_ptr<ReportingdSession> ReportingdAgent::parentSessionForChild(ReportingdSession& session) {

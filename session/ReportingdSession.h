@@ -13,6 +13,7 @@
 #include "backends/BackendServices.h"
 #include "client/protocol/ClientSessionInterface.h"
 #include "platform/ipc/IPCConnection.h"
+#include "platform/ipc/WarningBurst.h"
 #include "platform/sync/Mutex.h"
 #include "session/BackendSet.h"
 #include "session/ReportingdSessionDelegate.h"
@@ -87,7 +88,8 @@ class ReportingdSession final : public ClientSessionInterface,
   /// The names of the enabled backends; nothing before the first start.
   std::optional<BackendNames> fetchReportingStates() const;
   std::optional<Value> samplingThresholdWithBackendName(const std::string& name) const;
-  /// Hands one message to this session's own client.
+  /// Hands one message to this session's own client; never waits. One that the client does not take is lost
+  /// and counted, and told once a burst: whoever sends it must not pay for a client that does not read.
   void sendToAggregator(const std::optional<Dictionary>& sessionInfo, double timestamp,
                         std::uint16_t category, std::uint16_t type, const std::optional<Dictionary>& payload);
 
@@ -120,6 +122,7 @@ class ReportingdSession final : public ClientSessionInterface,
                                 std::uint16_t type, const std::optional<Dictionary>& payload);
 
   // Aggregation.
+  bool undeliveredBurstBegins();
   void aggregateMessage(const std::optional<Dictionary>& sessionInfo, double timestamp,
                         std::uint16_t category, std::uint16_t type, const std::optional<Dictionary>& payload);
 
@@ -139,6 +142,7 @@ class ReportingdSession final : public ClientSessionInterface,
   SharedBackends _backends VESK_GUARDED_BY(_mutex);
   std::optional<std::string> _storebagVersion VESK_GUARDED_BY(_mutex);
   bool _hasAggregator VESK_GUARDED_BY(_mutex) = false;
+  WarningBurst _undelivered VESK_GUARDED_BY(_mutex);  // of messages to this session's client
 };
 
 }  // namespace vesk

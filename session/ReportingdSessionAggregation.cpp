@@ -62,10 +62,18 @@ void ReportingdSession::aggregateMessage(const std::optional<Dictionary>& sessio
 void ReportingdSession::sendToAggregator(const std::optional<Dictionary>& sessionInfo, double timestamp,
                                          std::uint16_t category, std::uint16_t type,
                                          const std::optional<Dictionary>& payload) {
-  ClientSessionReplyProxy proxy(_connection, [](const std::string& error) {
+  ClientSessionReplyProxy proxy(_connection, [&](const std::string& error) {
+    // The closing message, which has no session info, says nothing that the connection's end does not.
+    if (sessionInfo) _services.backends.counters.count("session", DropReason::NotAggregated);
+    if (!undeliveredBurstBegins()) return;
     VESK_LOG_ERROR("sendMessageWithDictionary: Failed to get remote object proxy: %s", error.c_str());
   });
   proxy.sendMessageToClient(sessionInfo, timestamp, category, type, payload);
+}
+
+bool ReportingdSession::undeliveredBurstBegins() {
+  MutexLock lock(_mutex);
+  return _undelivered.begins();
 }
 
 void ReportingdSession::shutdownSessionAggregation() {

@@ -1,53 +1,13 @@
 // Families of sessions: parents, combined IDs, reporting states, aggregation.
 #include <gtest/gtest.h>
 
-#include "tests/support/AgentHarness.h"
 #include "tests/support/CapturedLog.h"
-#include "tests/support/TestRoot.h"
+#include "tests/support/FamilyHarness.h"
 
 namespace vesk::test {
 namespace {
 
-/// Client types 5, 6, 7 are levels 0, 1, 2 of one family.
-class Family : public ::testing::Test {
- protected:
-  Family() {
-    testRoot().write("etc/veskreporting/device.toml", "DeviceName = \"Phone\"\n");
-    for (int level = 0; level < 3; ++level) {
-      harness.storebags[5 + level] = Dictionary{{"httpPost", profile(level, level == 0 ? 1.0 : 0.0)}};
-    }
-  }
-  Dictionary profile(int level, double threshold) {
-    return Dictionary{{"clients", List{Dictionary{{"post_url", harness.url()},
-                                                  {"hierarchy", level},
-                                                  {"locale_whitelist", List{"US"}},
-                                                  {"filters", List{Dictionary()}},
-                                                  {"override_sampling", 0.0},
-                                                  {"sampling_threshold", threshold}}}}};
-  }
-  DrivenSession join(int level, bool aggregates = false, const char* client = "MyApp") {
-    auto session = harness.newSession();
-    session->setSessionInfo(Dictionary{{kVeskReportingSessionInfoSessionID, 100 + level},
-                                       {kVeskReportingSessionInfoClientType, 5 + level},
-                                       {kVeskReportingSessionInfoRequireUserInfo, true}},
-                            userInfo(client), {}, aggregates);
-    names = session.start();
-    return session;
-  }
-  static Dictionary userInfo(const char* client) {
-    return Dictionary{{kVeskReportingUserInfoClientName, client},
-                      {kVeskReportingUserInfoServiceName, "Calls"}};
-  }
-  static Dictionary message() {
-    return Dictionary{{"category", 3}, {"type", 2}, {"flag", 1}, {"payload", Dictionary{{"a", 1}}}};
-  }
-  std::string lastSessionID() {
-    return std::string(harness.posts().back().event().at("_sessionID").as_string());
-  }
-
-  AgentHarness harness;
-  std::optional<BackendNames> names;  // what the last start answered
-};
+using Family = FamilyHarness;
 
 TEST_F(Family, ChildrenCarryTheirAncestorsAndCopyTheirStates) {
   CapturedLog log;

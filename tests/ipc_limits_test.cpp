@@ -265,8 +265,8 @@ TEST(IPCLimits, StopsReadingFromAClientThatDoesNotReadItsAnswers) {
 
 TEST(IPCLimits, TellsTheCallerWhenAClientsOutboxIsFull) {
   TestService service([](IPCListener::Options& options) { options.maximumOutbox = 10; });
-  TestClient client(service);
-  ASSERT_EQ(client.call("flushMessagesWithReply"), "flushed");
+  std::optional<TestClient> client(std::in_place, service);
+  ASSERT_EQ(client->call("flushMessagesWithReply"), "flushed");
   auto connection = service.connection();
   const IPCOutgoingCall call{wire::kReplyInterface, "sendMessageToClient", {std::string(30'000, 'x')}};
   std::string error;
@@ -279,6 +279,8 @@ TEST(IPCLimits, TellsTheCallerWhenAClientsOutboxIsFull) {
   connection->callRemoteObject({wire::kReplyInterface, "m", {std::string(std::size_t{1} << 20, 'x')}},
                                [&](const std::string& text) { error = text; });
   EXPECT_EQ(error, "the call is too large");
+  client.reset();
+  EXPECT_TRUE(service.journal.waitFor("lost ")) << "and what became of those that it took";
 }
 
 void sendWithDescriptors(int socket, const std::string& bytes, std::size_t count) {

@@ -1,6 +1,7 @@
 // Runs the veskreport program against a daemon's end that keeps a record, and against none.
 #include <gtest/gtest.h>
 
+#include <csignal>
 #include <optional>
 
 #include "tests/support/ChildProcess.h"
@@ -75,6 +76,43 @@ TEST_F(VeskreportCommand, EachCommandPrintsItsAnswer) {
     EXPECT_EQ(outcome.errors, "");
     EXPECT_TRUE(record.waitForLine(c.call));
   }
+}
+
+TEST_F(VeskreportCommand, AggregatePrintsWhatTheDaemonSendsAndEndsWithIt) {
+  for (bool json : {false, true}) {
+    ChildProcess process({VESK_BIN_DIRECTORY "/veskreport", "aggregate", "--root", root, "--client-type", "5",
+                          json ? "--json" : "--batch"});
+    ASSERT_TRUE(record.waitForCount("startConfig", json ? 2 : 1));
+    daemon->sendToClient(Dictionary{{"sessionID", 102}}, 1'700'000'000.25, 3, 2, Dictionary{{"a", 1}});
+    daemon->sendToClient(Dictionary{{"sessionID", 103}}, 1'700'000'001, 4, 0, std::nullopt);
+    daemon->sendToClient(std::nullopt, 0, 0, 0, std::nullopt);
+    EXPECT_EQ(process.wait(), 0);
+    EXPECT_EQ(
+        process.output(),
+        json
+            ? R"({"status":"done","sessionInfo":{"sessionID":102},"time":1700000000.25,"category":3,"type":2,)"
+              R"("payload":{"a":1}})"
+              "\n"
+              R"({"status":"done","sessionInfo":{"sessionID":103},"time":1700000001.0,"category":4,"type":0,)"
+              R"("payload":null})"
+              "\n"
+              R"({"status":"done","received":2,"closed":true})"
+              "\n"
+            : "2023-11-14T22:13:20.250Z category 3 type 2 payload {\"a\":1} session {\"sessionID\":102}\n"
+              "2023-11-14T22:13:21.000Z category 4 type 0 payload none session {\"sessionID\":103}\n");
+  }
+}
+
+TEST_F(VeskreportCommand, AggregateEndsWhenItIsToldTo) {
+  ChildProcess process({VESK_BIN_DIRECTORY "/veskreport", "aggregate", "--root", root, "--client-type", "5"});
+  ASSERT_TRUE(record.waitForLine("startConfig"));
+  process.signal(SIGTERM);
+  EXPECT_EQ(process.wait(), 0);
+  ChildProcess counting(
+      {VESK_BIN_DIRECTORY "/veskreport", "aggregate", "--root", root, "--client-type", "5", "--count", "1"});
+  ASSERT_TRUE(record.waitForCount("startConfig", 2));
+  daemon->sendToClient(Dictionary{{"sessionID", 102}}, 1, 3, 2, std::nullopt);
+  EXPECT_EQ(counting.wait(), 0);
 }
 
 TEST_F(VeskreportCommand, IntroducesItselfAsTheOptionsSay) {

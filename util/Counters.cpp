@@ -35,6 +35,8 @@ std::string_view nameOfDropReason(DropReason reason) noexcept {
       return "never-enabled";
     case DropReason::Unacknowledged:
       return "unacknowledged";
+    case DropReason::NotAggregated:
+      return "not-aggregated";
   }
   return "unknown";
 }

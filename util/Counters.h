@@ -26,8 +26,9 @@ enum class DropReason : std::uint8_t {
   UploadFailed,    ///< a file was not uploaded
   NeverEnabled,    ///< still held when the session ended: reporting had never been enabled
   Unacknowledged,  ///< a datagram that was not sent whole or never acknowledged, and given up
+  NotAggregated,   ///< the aggregating client did not take its copy: it does not read, or has gone
 };
-inline constexpr std::size_t kDropReasonCount = 11;
+inline constexpr std::size_t kDropReasonCount = 12;
 
 /// A word for it, for tools and logs: "state-disabled".
 std::string_view nameOfDropReason(DropReason reason) noexcept;

@@ -46,6 +46,10 @@ void BusConnection::setInvalidationHandler(std::function<void()> handler) {
   _invalidationHandler = std::move(handler);
 }
 
+void BusConnection::setLossHandler(std::function<void(std::size_t calls)> handler) {
+  _lossHandler = std::move(handler);
+}
+
 void BusConnection::resume() {
   {
     MutexLock lock(_mutex);
@@ -99,14 +103,16 @@ void BusConnection::run() noexcept {
 
 void BusConnection::finish(ConnectionLoop::End how, ConnectionLoop* loop) noexcept {
   // A client that has gone takes no call; one that is sent away still gets what its session says in the end.
-  if (how != ConnectionLoop::End::Invalidated) _outbox.close();
+  std::size_t lost = how == ConnectionLoop::End::Invalidated ? 0 : _outbox.close();
   if (how == ConnectionLoop::End::BrokenOff) callHandler(_interruptionHandler);
   callHandler(_invalidationHandler);
   dropHandlers();
   if (loop && how == ConnectionLoop::End::Invalidated) loop->flush(kFlushTime);
-  if (std::size_t lost = _outbox.close()) {
-    VESK_LOG_WARNING("ipc: %s: Ended before %zu calls to the client were sent", _name.c_str(), lost);
+  if (std::size_t unsent = _outbox.close()) {
+    VESK_LOG_WARNING("ipc: %s: Ended before %zu calls to the client were sent", _name.c_str(), unsent);
+    lost += unsent;
   }
+  if (lost > 0 && _lossHandler) callHandler([&] { _lossHandler(lost); });
 }
 
 void BusConnection::callHandler(const std::function<void()>& handler) noexcept {

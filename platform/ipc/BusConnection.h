@@ -43,6 +43,7 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   void setExportedObject(std::shared_ptr<IPCExportedObject> object) override;
   void setInterruptionHandler(std::function<void()> handler) override;
   void setInvalidationHandler(std::function<void()> handler) override;
+  void setLossHandler(std::function<void(std::size_t calls)> handler) override;
   void resume() override;
   void invalidate() override;
   void callRemoteObject(IPCOutgoingCall call,
@@ -74,6 +75,7 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   CallRouter _router;
   std::function<void()> _interruptionHandler;
   std::function<void()> _invalidationHandler;
+  std::function<void(std::size_t)> _lossHandler;
 
   Mutex _mutex;
   bool _started VESK_GUARDED_BY(_mutex) = false;

@@ -3,6 +3,7 @@
 
 #include <sys/types.h>
 
+#include <cstddef>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -68,6 +69,10 @@ class IPCConnection {
   virtual void setExportedObject(std::shared_ptr<IPCExportedObject> object) = 0;
   virtual void setInterruptionHandler(std::function<void()> handler) = 0;
   virtual void setInvalidationHandler(std::function<void()> handler) = 0;
+
+  /// Told, on the connection's thread, how many calls that `callRemoteObject` took were never sent, if any;
+  /// runs after the other handlers have been dropped. Set before `resume`.
+  virtual void setLossHandler(std::function<void(std::size_t calls)> handler) = 0;
 
   /// Begins to serve calls, on the connection's own thread.
   virtual void resume() = 0;

@@ -21,6 +21,7 @@ class RecordingConnection final : public IPCConnection {
   void setExportedObject(std::shared_ptr<IPCExportedObject> object) override { _object = std::move(object); }
   void setInterruptionHandler(std::function<void()> handler) override { _interrupted = std::move(handler); }
   void setInvalidationHandler(std::function<void()> handler) override { _invalidated = std::move(handler); }
+  void setLossHandler(std::function<void(std::size_t)>) override {}
   void resume() override {}
   void invalidate() override {
     if (auto handler = std::exchange(_invalidated, nullptr)) handler();
@@ -32,10 +33,12 @@ class RecordingConnection final : public IPCConnection {
                         const std::function<void(const std::string& error)>& errorHandler) override {
     if (clientIsGone) return errorHandler("gone");
     calls.push_back(std::move(call));
+    if (onCall) onCall(calls.back());
   }
 
   std::vector<IPCOutgoingCall> calls;
   bool clientIsGone = false;
+  std::function<void(const IPCOutgoingCall&)> onCall;  ///< by the sender, who may hold the agent's monitor
 
  private:
   std::shared_ptr<IPCExportedObject> _object;

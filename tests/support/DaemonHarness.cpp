@@ -1,5 +1,6 @@
 #include "tests/support/DaemonHarness.h"
 
+#include <algorithm>
 #include <csignal>
 #include <cstdio>
 #include <sstream>
@@ -76,8 +77,9 @@ void DaemonHarness::startCollector(std::vector<std::string> arguments) {
 void DaemonHarness::startDaemon(std::vector<std::string> arguments) {
   root.write("etc/veskreporting/preferences/com.corvane.veskreporting.toml", tomlLines(_preferences));
   root.write("etc/veskreporting/device.toml", tomlLines(_deviceFacts));
-  std::vector<std::string> command{VESK_BIN_DIRECTORY "/veskreportingd", "--root", root.path().string(),
-                                   "--log-level", "7"};
+  std::vector<std::string> command{VESK_BIN_DIRECTORY "/veskreportingd", "--root", root.path().string()};
+  if (std::find(arguments.begin(), arguments.end(), "--log-level") == arguments.end())
+    command.insert(command.end(), {"--log-level", "7"});
   command.insert(command.end(), arguments.begin(), arguments.end());
   // A confined daemon may not be traced, which is how leaks are looked for.
   _daemon = std::make_unique<ChildProcess>(ChildProcess::Options{

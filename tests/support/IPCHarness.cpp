@@ -169,6 +169,7 @@ bool TestService::shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>
     journal.add("invalidated");
     if (onInvalidation) onInvalidation();
   });
+  connection->setLossHandler([this](std::size_t calls) { journal.add("lost " + std::to_string(calls)); });
   {
     std::lock_guard lock(_mutex);
     _connections.push_back(connection);

@@ -67,6 +67,9 @@ class Reader {
     addClient("states", "Show the names of the enabled backends", Command::States);
     addClient("display-url", "Show where the session's messages can be looked at", Command::DisplayURL);
     addClient("flush", "Have the backends send what they hold back", Command::Flush);
+    addClient("aggregate", "Show the messages of this session and of those below it as they are sent",
+              Command::Aggregate)
+        ->add_option("--count", _invocation.aggregateCount, "End after so many messages (default: never)");
   }
 
   void addMessageCommands() {

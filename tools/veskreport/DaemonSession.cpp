@@ -62,9 +62,9 @@ int DaemonSession::connect() {
   return _output.failed("no daemon at " + _socketPath + ": is veskreportingd running? (" + cause + ")");
 }
 
-int DaemonSession::start() {
+int DaemonSession::start(AggregationHandler aggregation) {
   if (int status = connect()) return status;
-  auto configured = _reporting->setSessionInfo(_sessionInfo, _userInfo);
+  auto configured = _reporting->setSessionInfo(_sessionInfo, _userInfo, {}, std::move(aggregation));
   if (configured != ReportingStatus::Queued) return failed(configured, "");
   auto started = _reporting->startConfig(_identity.timeout);
   if (!started) return failed(started);

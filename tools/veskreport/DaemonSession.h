@@ -18,8 +18,8 @@ class DaemonSession {
 
   /// Each returns kExitDone, or the exit status of a failure that it has reported.
   [[nodiscard]] int connect();
-  /// Connects, configures and starts.
-  [[nodiscard]] int start();
+  /// Connects, configures and starts; with a handler, as an aggregating client. The handler outlives this.
+  [[nodiscard]] int start(AggregationHandler aggregation = nullptr);
 
   VeskReporting& reporting() { return *_reporting; }
   const Dictionary& sessionInfo() const { return _sessionInfo; }

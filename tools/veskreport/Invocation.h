@@ -56,6 +56,7 @@ enum class Command {
   Flush,
   UploadFile,
   UploadLog,
+  Aggregate,
   StorebagKeygen,
   StorebagSign,
   StorebagVerify,
@@ -69,6 +70,7 @@ struct Invocation {
   MessageArguments message;
   UploadArguments upload;
   StorebagArguments storebag;
+  std::uint64_t aggregateCount = 0;  ///< messages to wait for; 0: no end
 };
 
 }  // namespace vesk

@@ -3,6 +3,7 @@
 
 #include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
+#include "tools/veskreport/AggregateCommand.h"
 #include "tools/veskreport/CommandLine.h"
 #include "tools/veskreport/Output.h"
 #include "tools/veskreport/SendCommands.h"
@@ -29,6 +30,8 @@ int run(const Invocation& invocation, const Output& output) {
       return runUploadFile(invocation, output);
     case Command::UploadLog:
       return runUploadLog(invocation, output);
+    case Command::Aggregate:
+      return runAggregate(invocation, output);
     case Command::StorebagKeygen:
       return runStorebagKeygen(invocation.storebag, output);
     case Command::StorebagSign:

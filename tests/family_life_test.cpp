@@ -1,0 +1,149 @@
+// Families while their members come, move and go: the order in which things must happen.
+#include <gtest/gtest.h>
+
+#include <VeskReporting/VeskReporting.h>
+
+#include <future>
+#include <latch>
+
+#include "client/protocol/WireNames.h"
+#include "platform/ipc/IPCListener.h"
+#include "tests/support/CapturedLog.h"
+#include "tests/support/FamilyHarness.h"
+#include "tests/support/TempDirectory.h"
+
+namespace vesk::test {
+namespace {
+
+constexpr auto kPatience = std::chrono::seconds(60);
+
+class FamilyLife : public FamilyHarness {
+ protected:
+  static std::optional<Dictionary> infoOf(const IPCOutgoingCall& call) {
+    return std::get<std::optional<Dictionary>>(call.arguments.at(0));
+  }
+  /// True when another thread can take the agent's monitor now.
+  bool monitorIsFree() {
+    auto taken = std::make_shared<std::promise<void>>();
+    std::thread([taken, agent = harness.agent] {
+      RecursiveMutexLock lock(agent->monitor());
+      taken->set_value();
+    }).detach();
+    return taken->get_future().wait_for(std::chrono::seconds(10)) == std::future_status::ready;
+  }
+};
+
+TEST_F(FamilyLife, AnAncestorThatEndsWhileAChildSendsIsDestroyedByTheChildOutsideTheMonitor) {
+  CapturedLog log;
+  auto top = join(0, true);
+  auto child = join(1);
+  auto connection = top.connection;
+  std::weak_ptr<ReportingdSession> watched = top.session;
+  std::optional<bool> freeAtTheEnd;
+  connection->onCall = [&](const IPCOutgoingCall& call) {
+    if (!infoOf(call)) {
+      freeAtTheEnd = monitorIsFree();  // the closing message: this is the session's destruction
+    } else if (top.session) {
+      harness.agent->sessionInvalidated(top.session);  // its connection ends in the middle of the delivery
+      top.session.reset();
+    }
+  };
+  child.send(message());
+  EXPECT_TRUE(watched.expired());
+  EXPECT_EQ(freeAtTheEnd, true);
+  EXPECT_EQ(harness.agent->parentSessionIDStringForSession(*child.session), std::nullopt)
+      << "left its family";
+  connection->onCall = nullptr;
+}
+
+TEST_F(FamilyLife, ADestroyedAggregatorGetsItsOwnLastMessageBeforeTheClosingOne) {
+  std::shared_ptr<RecordingConnection> connection;
+  {
+    auto top = join(0, true);
+    connection = top.connection;
+    connection->calls.clear();
+  }
+  ASSERT_EQ(connection->calls.size(), 2u);
+  EXPECT_EQ(std::get<std::uint16_t>(connection->calls[0].arguments.at(3)), 1) << "the end of the session";
+  EXPECT_FALSE(infoOf(connection->calls[1]));
+}
+
+TEST_F(FamilyLife, ASessionThatMovesTakesItsHeldEventsAlongAndItsNextMessageGoesToTheNewAncestor) {
+  auto top = join(0);
+  auto other = join(0, true, "Other");
+  auto child = join(1, false, "MyApp", true);
+  child.send(message(0));
+  child->fetchStatesWithUserInfo(userInfo("Other"), {});
+  other.connection->calls.clear();
+  child.send(message(0));
+  EXPECT_EQ(other.connection->calls.size(), 1u);
+  child->flushMessagesWithReply({});
+  const std::string expected = other->sessionIDString() + "." + child->sessionIDString();
+  const auto events = harness.posts().back().events();
+  ASSERT_GE(events.size(), 2u);
+  for (const auto& event : events) EXPECT_EQ(event.at("_sessionID").as_string(), expected);
+}
+
+TEST_F(FamilyLife, ManyInventedNamesDoNotFillTheMemory) {
+  CapturedLog log;
+  auto session = join(0);
+  for (int i = 0; i < 600; ++i) session->fetchStatesWithUserInfo(userInfo(std::to_string(i).c_str()), {});
+  auto connection = std::make_shared<RecordingConnection>();
+  harness.agent->shouldAcceptNewConnection(connection);
+  auto lines = log.lines();
+  auto accepted = std::find_if(lines.begin(), lines.end(), [](const auto& line) {
+    return line.second.find("Accepting new Orvo connection") != std::string::npos;
+  });
+  ASSERT_NE(accepted, lines.end());
+  EXPECT_LE(std::stoi(accepted->second.substr(accepted->second.find('(') + 1)), 256) << accepted->second;
+  connection->invalidate();
+}
+
+TEST_F(FamilyLife, AClientThatDoesNotReadItsMessagesCostsItsOutboxAndNobodyElse) {
+  CapturedLog log;
+  TempDirectory directory;
+  IPCListener::Options options;
+  options.socketPath = (directory / "socket").string();
+  options.objectPath = wire::kObjectPath;
+  IPCListener listener(std::move(options));
+  listener.setDelegate(harness.agent.get());
+  listener.resume();
+  std::latch reads{1};
+  std::atomic<std::uint64_t> received{0};
+  ReportingOptions clientOptions;
+  clientOptions.socketPath = (directory / "socket").string();
+  VeskReporting parent(clientOptions);
+  ASSERT_EQ(parent.setSessionInfo(sessionInfo(0), userInfo("MyApp"), {},
+                                  [&](const AggregatedMessage& message) {
+                                    if (message.category != 3) return;
+                                    reads.wait();
+                                    ++received;
+                                  }),
+            ReportingStatus::Queued);
+  ASSERT_TRUE(parent.startConfig(kPatience));
+
+  auto child = join(1, false, "MyApp", true);
+  constexpr std::uint64_t kMessages = 1000;
+  for (std::uint64_t i = 0; i < kMessages; ++i) child.send(message(0, std::string(4000, 'x')));
+  child->flushMessagesWithReply({});
+  std::uint64_t posted = 0;
+  for (const auto& post : harness.posts()) {
+    for (const auto& event : post.events()) posted += event.at("_method") == 3;
+  }
+  EXPECT_EQ(posted, kMessages) << "the sender does not notice";
+  const std::uint64_t dropped = harness.dropped(DropReason::NotAggregated);
+  EXPECT_GT(dropped, 0u);
+  EXPECT_EQ(log.count(3,
+                      "sendMessageWithDictionary: Failed to get remote object proxy: too many calls wait for "
+                      "the client"),
+            1)
+      << "one line, however many there are";
+  reads.count_down();
+  auto deadline = std::chrono::steady_clock::now() + kPatience;
+  while (received + dropped < kMessages && std::chrono::steady_clock::now() < deadline)
+    std::this_thread::yield();
+  EXPECT_EQ(received + dropped, kMessages) << "what was not dropped arrives";
+}
+
+}  // namespace
+}  // namespace vesk::test

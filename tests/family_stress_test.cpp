@@ -1,0 +1,176 @@
+// Two families of sessions that do everything at once, for some seconds, over the real daemon.
+#include <gtest/gtest.h>
+
+#include <array>
+#include <atomic>
+#include <cstdlib>
+#include <random>
+#include <thread>
+
+#include "tests/support/DaemonHarness.h"
+
+namespace vesk::test {
+namespace {
+
+using namespace std::chrono_literals;
+
+constexpr int kMembers = 20;
+constexpr auto kDuration = 5s;
+/// The watchdog: an operation that takes longer, on whatever machine and under whatever sanitizer, hangs.
+constexpr auto kPatience = 60s;
+
+/// The level of each family's ten members.
+constexpr std::array<int, 10> kLevels{0, 1, 1, 1, 2, 2, 2, 2, 2, 2};
+
+std::string storebagOfLevel(int level) {
+  return "version = \"family\"\n[[release.httpPost.clients]]\npost_url = \"@EVENTS@\"\nhierarchy = " +
+         std::to_string(level) + "\nlocale_whitelist = [\"US\"]\nsampling_threshold = 1.0\nfilters = []\n";
+}
+
+Dictionary familyName(int family) {
+  return Dictionary{{kVeskReportingUserInfoClientName, family == 0 ? "Left" : "Right"},
+                    {kVeskReportingUserInfoServiceName, "Stress"}};
+}
+
+/// One client at a time, driven by a thread of its own with random numbers of its own.
+class Member {
+ public:
+  Member(const DaemonHarness& harness, int number, unsigned seed)
+      : _harness(harness),
+        _level(kLevels[static_cast<std::size_t>(number) % kLevels.size()]),
+        _number(number),
+        _family(number / 10),
+        _random(seed + static_cast<unsigned>(number)) {
+    connect(chance(2));
+  }
+
+  void runUntil(const std::atomic<bool>& ends) {
+    while (!ends && _problem.empty()) step();
+  }
+
+  std::string problem() const { return _problem; }
+  int number() const { return _number; }
+  std::uint64_t steps() const { return _steps; }
+  std::uint64_t aggregated() const { return _aggregated; }
+  void leave() {
+    _operation = "disconnect";
+    _reporting.reset();
+  }
+
+ private:
+  bool chance(int of) { return std::uniform_int_distribution(0, of - 1)(_random) == 0; }
+  template <class Result>
+  void expect(const Result& result) {
+    if (result || !_problem.empty()) return;
+    _problem = std::string(_operation) + ": " + describe(result.status) + " " + result.detail;
+    if (result.status == ReportingStatus::TimedOut) _problem += ": the daemon does not answer, a DEADLOCK";
+  }
+
+  void configure(bool aggregates) {
+    AggregationHandler handler;
+    if (aggregates) handler = [this](const AggregatedMessage&) { ++_aggregated; };
+    auto status = _reporting->setSessionInfo(Dictionary{{kVeskReportingSessionInfoSessionID, 100 + _number},
+                                                        {kVeskReportingSessionInfoClientType, 5 + _level},
+                                                        {kVeskReportingSessionInfoRequireUserInfo, true},
+                                                        {kVeskReportingSessionInfoBatchEvent, chance(2)}},
+                                             familyName(_family), {}, std::move(handler));
+    if (status != ReportingStatus::Queued) _problem = describe(status);
+    expect(_reporting->startConfig(kPatience));
+  }
+  void connect(bool aggregates) {
+    _operation = "connect and start";
+    auto options = _harness.clientOptions();
+    options.maximumQueuedMessages = 64;
+    options.drainTime = 2s;
+    _reporting.emplace(options);
+    configure(aggregates);
+  }
+
+  void step() {
+    ++_steps;
+    const Dictionary payload{{"n", _steps}};
+    switch (std::uniform_int_distribution(0, 19)(_random)) {
+      case 0:
+        leave();
+        return connect(chance(2));
+      case 1:
+        _operation = "configure and start anew";
+        return configure(chance(2));
+      case 2:
+        _operation = "move to the other family";
+        _family = 1 - _family;
+        return expect(_reporting->fetchStates(familyName(_family), kPatience));
+      case 3:
+      case 4:
+        _operation = "fetch states";
+        return expect(_reporting->fetchStates(familyName(_family), kPatience));
+      case 5:
+      case 6:
+        _operation = "flush";
+        return expect(_reporting->flushMessagesAndWait(kPatience));
+      case 7:
+      case 8:
+        _operation = "send and wait";
+        return expect(_reporting->sendMessageAndWait(3, 2, payload, kPatience));
+      default:
+        _operation = "send";
+        if (auto status = _reporting->sendMessage(3, 1, payload);
+            status != ReportingStatus::Queued && status != ReportingStatus::QueueFull)
+          _problem = describe(status);
+    }
+  }
+
+  const DaemonHarness& _harness;
+  const int _level;
+  const int _number;
+  int _family;
+  std::mt19937 _random;
+  std::string _problem;
+  std::uint64_t _steps = 0;
+  std::atomic<std::uint64_t> _aggregated{0};
+  const char* _operation = "";
+  std::optional<VeskReporting> _reporting;
+};
+
+std::string tail(const std::string& text) {
+  return text.substr(text.size() - std::min<std::size_t>(text.size(), 4000));
+}
+
+TEST(FamilyStress, TwoFamiliesThatDoEverythingAtOnceNeitherHangNorBreakTheDaemon) {
+  const char* given = std::getenv("VESK_STRESS_SEED");
+  const unsigned seed =
+      given ? static_cast<unsigned>(std::strtoul(given, nullptr, 10)) : std::random_device{}();
+  SCOPED_TRACE("again with VESK_STRESS_SEED=" + std::to_string(seed));
+  DaemonHarness harness;
+  const char* names[] = {"zelko", "brannic", "palvo"};
+  for (int level = 0; level < 3; ++level) harness.writeStorebag(names[level], storebagOfLevel(level));
+  harness.startDaemon({"--log-level", "6"});
+
+  std::vector<std::unique_ptr<Member>> members;
+  for (int i = 0; i < kMembers; ++i) members.push_back(std::make_unique<Member>(harness, i, seed));
+  std::uint64_t aggregated = 0;
+  {
+    std::atomic<bool> ends{false};
+    std::vector<std::thread> threads;
+    for (auto& member : members) threads.emplace_back([&] { member->runUntil(ends); });
+    EXPECT_EQ(harness.daemon().wait(kDuration), std::nullopt) << "the daemon died:\n"
+                                                              << tail(harness.daemon().errors());
+    ends = true;
+    for (auto& thread : threads) thread.join();
+    for (const auto& member : members) {
+      EXPECT_EQ(member->problem(), "") << "member " << member->number();
+      EXPECT_GT(member->steps(), 0u);
+      aggregated += member->aggregated();
+    }
+    EXPECT_GT(aggregated, 0u) << "nobody ever aggregated: the families did not form";
+    // One half goes, the other is there while the daemon ends.
+    for (int i = 0; i < kMembers; i += 2) members[static_cast<std::size_t>(i)]->leave();
+  }
+  EXPECT_EQ(harness.stopDaemon(), 0) << tail(harness.daemon().errors());
+  const std::string said = harness.daemon().errors();
+  auto report = said.find("Sanitizer");
+  EXPECT_EQ(report, std::string::npos) << said.substr(report == std::string::npos ? 0 : report, 8000);
+}
+
+}  // namespace
+}  // namespace vesk::test
