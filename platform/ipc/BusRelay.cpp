@@ -29,8 +29,8 @@ std::vector<FileDescriptor> takeDescriptors(msghdr& header) {
 
 }  // namespace
 
-BusRelay::BusRelay(int socket, uid_t peer, std::size_t maximumMessage)
-    : _socket(socket), _authentication(peer), _messages(maximumMessage) {
+BusRelay::BusRelay(int socket, uid_t peer, std::size_t maximumMessage, OneWayHandler oneWay)
+    : _socket(socket), _authentication(peer), _messages(maximumMessage), _oneWay(std::move(oneWay)) {
   int ends[2];
   if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends) != 0) {
     throw std::system_error(errno, std::generic_category(), "socketpair");
@@ -83,6 +83,7 @@ BusRelay::Outcome BusRelay::authenticate(std::vector<FileDescriptor> descriptors
   if (!write(result.passedOn)) return refuse("internal failure");
   keepFrom(result.taken);
   _hasBegun = result.verdict == AuthenticationGate::Verdict::Begun;
+  _cameWithBegin = _hasBegun && _held >= MessageGate::kFixedHeader;
   if (!descriptors.empty()) {
     // They may belong to a message that was read together with BEGIN.
     if (!_hasBegun || _held == 0) return refuse("a descriptor before authentication");
@@ -91,7 +92,36 @@ BusRelay::Outcome BusRelay::authenticate(std::vector<FileDescriptor> descriptors
   return result.passedOn.empty() ? Outcome::Nothing : Outcome::Fed;
 }
 
+/// How many bytes at the front have been served.
+std::size_t BusRelay::serveOneWayCalls() {
+  std::size_t served = 0;
+  // What has been handed to sd-bus before has been processed, so the order is kept.
+  while (!_messages.insideMessage() && _held - served >= MessageGate::kFixedHeader) {
+    auto rest = held().substr(served);
+    auto size = MessageGate::messageSize(rest);
+    if (!size || *size > rest.size() || !OneWayDecoder::mayDecode(rest, *size)) break;
+    if (!_oneWay(rest.substr(0, *size))) break;
+    served += *size;
+  }
+  return served;
+}
+
+/// Whether a call is held whose end has not come yet, and which may be served without sd-bus then.
+bool BusRelay::waitsForOneWayCall() const {
+  if (_messages.insideMessage() || _held < MessageGate::kFixedHeader) return false;
+  auto size = MessageGate::messageSize(held());
+  return size && *size > _held && OneWayDecoder::mayDecode(held(), *size);
+}
+
 BusRelay::Outcome BusRelay::passMessages(std::vector<FileDescriptor> descriptors) {
+  _cameWithBegin = false;
+  bool hasServed = false;
+  if (descriptors.empty() && _descriptors.empty()) {
+    std::size_t served = serveOneWayCalls();
+    hasServed = served > 0;
+    keepFrom(served);
+    if (_held == 0 || waitsForOneWayCall()) return hasServed ? Outcome::Served : Outcome::Nothing;
+  }
   auto result = _messages.pass(held());
   std::size_t split = result.passed;
   auto now = std::exchange(_descriptors, {});
@@ -122,7 +152,8 @@ BusRelay::Outcome BusRelay::passMessages(std::vector<FileDescriptor> descriptors
   keepFrom(result.passed);
   if (result.verdict == MessageGate::Verdict::TooLarge) return refuse("a message over the size limit");
   if (result.verdict == MessageGate::Verdict::Malformed) return refuse("no D-Bus message");
-  return result.passed == 0 ? Outcome::Nothing : Outcome::Fed;
+  if (result.passed > 0) return Outcome::Fed;
+  return hasServed ? Outcome::Served : Outcome::Nothing;
 }
 
 bool BusRelay::write(std::string_view data, std::vector<FileDescriptor> descriptors) {

@@ -3,12 +3,14 @@
 
 #include <array>
 #include <cstddef>
+#include <functional>
 #include <string_view>
 #include <vector>
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/ipc/AuthenticationGate.h"
 #include "platform/ipc/MessageGate.h"
+#include "platform/ipc/OneWayDecoder.h"
 
 namespace vesk {
 
@@ -26,15 +28,19 @@ class BusRelay {
   /// Descriptors that may come with one message; no member takes more than one.
   static constexpr std::size_t kMaximumDescriptors = 4;
 
+  /// Serves a whole message without sd-bus; false when that has to.
+  using OneWayHandler = std::function<bool(std::string_view message)>;
+
   enum class Outcome {
     Fed,       ///< something went on to sd-bus
+    Served,    ///< whole messages were served without it
     Nothing,   ///< nothing to read now, or not enough
     HungUp,    ///< the peer has closed its end, between two messages
     BrokenOff  ///< it broke off, or was refused: see `complaint`
   };
 
   /// Borrows `socket` (not blocking). Throws std::system_error.
-  BusRelay(int socket, uid_t peer, std::size_t maximumMessage);
+  BusRelay(int socket, uid_t peer, std::size_t maximumMessage, OneWayHandler oneWay);
 
   /// The end for sd-bus; to be taken once.
   FileDescriptor takeInnerEnd() { return std::move(_inner); }
@@ -50,7 +56,7 @@ class BusRelay {
   /// Whether the client has said BEGIN: all that follows are messages.
   bool hasBegun() const noexcept { return _hasBegun; }
   /// Whether `takeIn` has work although the socket may have nothing to read.
-  bool hasHeldMessages() const noexcept { return _hasBegun && _held >= MessageGate::kFixedHeader; }
+  bool hasHeldMessages() const noexcept { return _cameWithBegin; }
   bool insideMessage() const noexcept { return _held > 0 || _messages.insideMessage(); }
   /// Messages handed to sd-bus so far, whole.
   std::uint64_t finishedMessages() const noexcept { return _messages.finished(); }
@@ -68,6 +74,8 @@ class BusRelay {
   Outcome receive(Received& received);
   Outcome authenticate(std::vector<FileDescriptor> descriptors);
   Outcome passMessages(std::vector<FileDescriptor> descriptors);
+  std::size_t serveOneWayCalls();
+  bool waitsForOneWayCall() const;
   Outcome refuse(const char* complaint);
   bool write(std::string_view data, std::vector<FileDescriptor> descriptors = {});
   void keepFrom(std::size_t offset);
@@ -78,7 +86,9 @@ class BusRelay {
   FileDescriptor _outer;
   AuthenticationGate _authentication;
   MessageGate _messages;
+  const OneWayHandler _oneWay;
   bool _hasBegun = false;
+  bool _cameWithBegin = false;  // what is held has not been looked at
   const char* _complaint = nullptr;
   std::vector<FileDescriptor> _early;        // came with the messages that are held behind BEGIN
   std::vector<FileDescriptor> _descriptors;  // of the message whose header is held

@@ -40,11 +40,13 @@ CallRouter::CallRouter(std::string objectPath, std::string connectionName,
       _connectionName(std::move(connectionName)),
       _replies(std::move(replies)),
       _owner(owner),
-      _limits(limits) {}
+      _limits(limits),
+      _decoder(_objectPath, limits) {}
 
-void CallRouter::warn(const char* member, const char* what) {
+void CallRouter::warn(std::string_view member, const char* what) {
   if (_warnings.begins()) {
-    VESK_LOG_WARNING("ipc: %s: Dropped the one-way call %s: %s", _connectionName.c_str(), member, what);
+    VESK_LOG_WARNING("ipc: %s: Dropped the one-way call %.*s: %s", _connectionName.c_str(),
+                     static_cast<int>(member.size()), member.data(), what);
   }
 }
 
@@ -66,28 +68,38 @@ void CallRouter::route(sd_bus_message* message) {
   if (interface && std::strcmp(interface, _object->interfaceName()) != 0) {
     return refuse(message, SD_BUS_ERROR_UNKNOWN_INTERFACE, "The object has no such interface");
   }
-  call(message);
+  IPCIncomingCall call(message, _replies, _owner, _limits);
+  serve(call);
 }
 
-void CallRouter::call(sd_bus_message* message) {
-  IPCIncomingCall call(message, _replies, _owner, _limits);
+bool CallRouter::routeOneWay(std::string_view message) {
+  if (!_object) return false;
+  auto oneWay = _decoder.decode(message);
+  if (!oneWay) return false;
+  if (!oneWay->interfaceName.empty() && oneWay->interfaceName != _object->interfaceName()) return false;
+  IPCIncomingCall call(*oneWay, _replies, _limits);
+  serve(call);
+  return true;
+}
+
+void CallRouter::serve(IPCIncomingCall& call) {
   // The object stays alive during its call, also when the call makes the connection drop it.
   auto object = _object;
+  auto fail = [&](const char* what) {
+    VESK_LOG_ERROR("ipc: %s: %.*s failed%s", _connectionName.c_str(), static_cast<int>(call.member().size()),
+                   call.member().data(), what);
+    call.refuse(SD_BUS_ERROR_FAILED, "The call failed");
+  };
   try {
     object->handle(call);
     if (call.expectsReply() && !call.isSettled())
       call.refuse(SD_BUS_ERROR_FAILED, "The call was not answered");
   } catch (const std::exception& error) {
-    VESK_LOG_ERROR("ipc: %s: %s failed: %s", _connectionName.c_str(), sd_bus_message_get_member(message),
-                   error.what());
-    call.refuse(SD_BUS_ERROR_FAILED, "The call failed");
-    return;
+    return fail((std::string(": ") + error.what()).c_str());
   } catch (...) {
-    VESK_LOG_ERROR("ipc: %s: %s failed", _connectionName.c_str(), sd_bus_message_get_member(message));
-    call.refuse(SD_BUS_ERROR_FAILED, "The call failed");
-    return;
+    return fail("");
   }
-  if (call.complaint()) warn(sd_bus_message_get_member(message), call.complaint());
+  if (call.complaint()) warn(call.member(), call.complaint());
 }
 
 void CallRouter::introspect(sd_bus_message* message, std::string_view path) {

@@ -10,6 +10,7 @@
 #include "platform/ipc/BusHandles.h"
 #include "platform/ipc/BusReplies.h"
 #include "platform/ipc/IPCConnection.h"
+#include "platform/ipc/OneWayDecoder.h"
 #include "platform/ipc/WarningBurst.h"
 
 namespace vesk {
@@ -28,17 +29,21 @@ class CallRouter {
 
   void route(sd_bus_message* message);
 
+  /// Serves a message that has not been through sd-bus, and never comes there. False when it has to.
+  bool routeOneWay(std::string_view message);
+
  private:
-  void call(sd_bus_message* message);
+  void serve(IPCIncomingCall& call);
   void introspect(sd_bus_message* message, std::string_view path);
   void refuse(sd_bus_message* message, const char* errorName, const char* text);
-  void warn(const char* member, const char* what);
+  void warn(std::string_view member, const char* what);
 
   const std::string _objectPath;
   const std::string _connectionName;
   const std::shared_ptr<BusReplies> _replies;
   const std::uint64_t _owner;
   const CodecLimits _limits;
+  OneWayDecoder _decoder;
   std::shared_ptr<IPCExportedObject> _object;
   WarningBurst _warnings;
 };

@@ -62,7 +62,8 @@ ConnectionLoop::ConnectionLoop(int socket, const IPCPeer& peer, const std::strin
       _wakeup(wakeup),
       _replies(replies),
       _router(router),
-      _relay(socket, peer.user, settings.maximumMessage + kMessageOverhead),
+      _relay(socket, peer.user, settings.maximumMessage + kMessageOverhead,
+             [this](std::string_view message) { return _router.routeOneWay(message); }),
       _bus(openBus(_relay.takeInnerEnd())) {
   check(sd_bus_add_filter(_bus.get(), nullptr, countMessage, &_messagesSeen), "sd_bus_add_filter");
   _replies.open(_bus.get());
@@ -145,7 +146,9 @@ bool ConnectionLoop::mayRead() const {
 /// One step: what can be read is handed to the bus, the bus does what it can, what it answers goes out.
 std::optional<ConnectionLoop::End> ConnectionLoop::advance() {
   auto outcome = mayRead() ? _relay.takeIn() : BusRelay::Outcome::Nothing;
-  if (!process()) return endOfBus();
+  // A bus that was given nothing and has nothing to write costs two system calls to ask.
+  bool isIdle = outcome == BusRelay::Outcome::Served && unread() == 0;
+  if (!isIdle && !process()) return endOfBus();
   if (_relay.complaint()) VESK_LOG_WARNING("ipc: %s: Closed: %s", _name.c_str(), _relay.complaint());
   if (outcome == BusRelay::Outcome::HungUp || outcome == BusRelay::Outcome::BrokenOff) {
     if (!isReady()) return End::NotAuthenticated;

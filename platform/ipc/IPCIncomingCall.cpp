@@ -17,8 +17,19 @@ IPCIncomingCall::IPCIncomingCall(sd_bus_message* message, const std::shared_ptr<
       _member(sd_bus_message_get_member(message)),
       _expectsReply(sd_bus_message_get_expect_reply(message) > 0) {}
 
+IPCIncomingCall::IPCIncomingCall(OneWayCall& call, const std::shared_ptr<BusReplies>& replies,
+                                 const CodecLimits& limits)
+    : _message(nullptr),
+      _oneWay(&call),
+      _replies(replies),
+      _owner(0),
+      _limits(limits),
+      _member(call.member),
+      _expectsReply(false) {}
+
 bool IPCIncomingCall::checkSignature(const char* signature) {
-  if (sd_bus_message_has_signature(_message, signature) > 0) return true;
+  if (_oneWay ? _oneWay->signature == signature : sd_bus_message_has_signature(_message, signature) > 0)
+    return true;
   return refuseArguments(CodecResult::WrongType);
 }
 
@@ -45,13 +56,16 @@ std::string IPCIncomingCall::grant(FileDescriptor descriptor) {
 
 void IPCIncomingCall::answer(std::vector<IPCArgument> arguments) {
   if (std::exchange(_settled, true)) return;
-  _replies->send(_message, arguments);
+  if (_expectsReply) _replies->send(_message, arguments);
 }
 
 void IPCIncomingCall::refuse(const char* errorName, const char* text) {
   if (std::exchange(_settled, true)) return;
-  if (!_expectsReply) _complaint = text;
-  _replies->sendError(_message, errorName, text);
+  if (!_expectsReply) {
+    _complaint = text;
+  } else {
+    _replies->sendError(_message, errorName, text);
+  }
 }
 
 bool IPCIncomingCall::keep(std::uint64_t& ticket) {

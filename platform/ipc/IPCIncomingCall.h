@@ -11,6 +11,7 @@
 #include "platform/files/FileDescriptor.h"
 #include "platform/ipc/BusCodec.h"
 #include "platform/ipc/IPCConnection.h"
+#include "platform/ipc/OneWayDecoder.h"
 #include "platform/ipc/Reply.h"
 
 namespace vesk {
@@ -26,6 +27,9 @@ class IPCIncomingCall {
   IPCIncomingCall(sd_bus_message* message, const std::shared_ptr<BusReplies>& replies, std::uint64_t owner,
                   const CodecLimits& limits);
 
+  /// A one-way call that was read already. Its arguments are moved out by `read`.
+  IPCIncomingCall(OneWayCall& call, const std::shared_ptr<BusReplies>& replies, const CodecLimits& limits);
+
   std::string_view member() const noexcept { return _member; }
   /// False for a one-way call: nothing that is answered goes anywhere.
   bool expectsReply() const noexcept { return _expectsReply; }
@@ -36,6 +40,11 @@ class IPCIncomingCall {
   template <class... Arguments>
   [[nodiscard]] bool read(const char* signature, Arguments&... arguments) {
     if (!checkSignature(signature)) return false;
+    if (_oneWay) {
+      [[maybe_unused]] std::size_t next = 0;
+      return (takeOne(_oneWay->arguments[next++], arguments) && ...) ||
+             refuseArguments(CodecResult::WrongType);
+    }
     BusDecoder decoder(_message, _limits);
     return (readOne(decoder, arguments) && ...) || refuseArguments(decoder.result());
   }
@@ -74,6 +83,16 @@ class IPCIncomingCall {
     return decoder.read(out);
   }
   static bool readOne(BusDecoder& decoder, FileDescriptor& out);
+  template <class T>
+  static bool takeOne(IPCArgument& argument, T& out) {
+    if constexpr (!std::is_same_v<T, FileDescriptor>) {
+      if (T* value = std::get_if<T>(&argument)) {
+        out = std::move(*value);
+        return true;
+      }
+    }
+    return false;  // one-way calls are read without those
+  }
 
   bool checkSignature(const char* signature);
   bool refuseArguments(CodecResult result);
@@ -82,7 +101,8 @@ class IPCIncomingCall {
                        std::vector<IPCArgument> arguments) noexcept;
   static void abandonKept(BusReplies& replies, std::uint64_t ticket) noexcept;
 
-  sd_bus_message* const _message;
+  sd_bus_message* const _message;  // null for a one-way call that was read already
+  OneWayCall* const _oneWay = nullptr;
   const std::shared_ptr<BusReplies>& _replies;
   const std::uint64_t _owner;
   const CodecLimits& _limits;

@@ -26,6 +26,9 @@ class MessageGate {
 
   explicit MessageGate(std::size_t maximumMessage) : _maximumMessage(maximumMessage) {}
 
+  /// Size of the message whose first kFixedHeader bytes these are; nothing when they begin none.
+  static std::optional<std::uint64_t> messageSize(std::string_view header) noexcept;
+
   /// `data`: all that has come and was not passed yet. On a refusal `passed` covers the messages before.
   Result pass(std::string_view data);
 
