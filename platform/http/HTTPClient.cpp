@@ -26,13 +26,31 @@ std::optional<std::string_view> HTTPResponse::header(std::string_view name) cons
   return std::nullopt;
 }
 
-HTTPClient::HTTPClient(Options options) : _worker(std::make_unique<Worker>(std::move(options))) {}
+HTTPClient::HTTPClient(Options options) : _options(std::move(options)) {}
 HTTPClient::HTTPClient() : HTTPClient(Options{}) {}
 HTTPClient::~HTTPClient() = default;
 
+HTTPClient::Worker* HTTPClient::worker() {
+  MutexLock lock(_mutex);
+  return _worker.get();
+}
+
+HTTPClient::Worker& HTTPClient::startedWorker() {
+  MutexLock lock(_mutex);
+  if (!_worker) _worker = std::make_unique<Worker>(_options);
+  return *_worker;
+}
+
 void HTTPClient::start(HTTPRequest request, Completion completion) {
   removeUnsafeHeaders(request);
-  _worker->start(std::move(request), std::move(completion));
+  Worker* worker = nullptr;
+  try {
+    worker = &startedWorker();
+  } catch (const std::exception& error) {
+    completion({std::nullopt, HTTPError{HTTPError::Kind::Other, error.what()}});
+    return;
+  }
+  worker->start(std::move(request), std::move(completion));
 }
 
 HTTPResult HTTPClient::perform(HTTPRequest request) {
@@ -50,6 +68,9 @@ HTTPResult HTTPClient::perform(HTTPRequest request) {
   return std::move(call->result);
 }
 
-bool HTTPClient::waitUntilIdle(std::chrono::milliseconds timeout) { return _worker->waitUntilIdle(timeout); }
+bool HTTPClient::waitUntilIdle(std::chrono::milliseconds timeout) {
+  Worker* started = worker();
+  return !started || started->waitUntilIdle(timeout);
+}
 
 }  // namespace vesk

@@ -11,6 +11,8 @@
 #include <utility>
 #include <vector>
 
+#include "platform/sync/Mutex.h"
+
 namespace vesk {
 
 struct HTTPRequest {
@@ -86,7 +88,8 @@ class HTTPClient {
     std::size_t maximumConnectionsPerHost = 6;
   };
 
-  /// Starts the thread.
+  /// The thread and the libraries under it, which are large, start with the first request: a daemon that has
+  /// nothing to say is small.
   explicit HTTPClient(Options options);
   HTTPClient();
   /// Fails what is still outstanding with `Stopped` (completions run), then ends the thread. Not to be called
@@ -95,7 +98,8 @@ class HTTPClient {
   HTTPClient(const HTTPClient&) = delete;
   HTTPClient& operator=(const HTTPClient&) = delete;
 
-  /// Returns at once. Posts to one host are sent in the order of the calls as far as connections allow.
+  /// Returns at once. Posts to one host are sent in the order of the calls as far as connections allow. When
+  /// the thread can not be started, the completion runs within this call.
   void start(HTTPRequest request, Completion completion);
 
   /// Starts the request and blocks until it is completed. Not to be called from a completion.
@@ -106,7 +110,12 @@ class HTTPClient {
 
  private:
   class Worker;
-  std::unique_ptr<Worker> _worker;
+  Worker* worker();
+  Worker& startedWorker();
+
+  const Options _options;
+  Mutex _mutex;
+  std::unique_ptr<Worker> _worker VESK_GUARDED_BY(_mutex);
 };
 
 }  // namespace vesk
