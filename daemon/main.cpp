@@ -19,8 +19,8 @@ constexpr char kServiceName[] = "com.corvane.veskreportingd";
 constexpr std::chrono::seconds kIdleExitWhenActivated{
     300};  // the manager starts us again on the next connection
 
-/// A busy thread frees a batch's buffers a thousand times a second. Without these it would give their pages back
-/// to the kernel and fetch them again each time, and each of many threads would hoard some of its own.
+/// A busy thread frees a batch's buffers a thousand times a second. Without these it would give their pages
+/// back to the kernel and fetch them again each time, and each of many threads would hoard some of its own.
 void setUpAllocator() {
   ::mallopt(M_TRIM_THRESHOLD, 512 * 1024);
   ::mallopt(M_MMAP_THRESHOLD, 512 * 1024);

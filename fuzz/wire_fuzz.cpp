@@ -1,57 +1,20 @@
 // Bytes as the body of a client's call: through sd-bus into values, back onto the wire and into values again.
-#include <sys/socket.h>
-#include <unistd.h>
-
 #include <cstdint>
-#include <cstdlib>
 #include <cstring>
 #include <string>
 
 #include "platform/ipc/AuthenticationGate.h"
 #include "platform/ipc/BusCodec.h"
-#include "platform/ipc/BusHandles.h"
 #include "platform/ipc/MessageGate.h"
+#include "platform/ipc/OneWayDecoder.h"
+#include "tests/support/BusServer.h"
 
 namespace {
 
 using namespace vesk;
-using namespace std::string_literals;
+using test::BusServer;
 
-void require(bool condition) {
-  if (!condition) std::abort();
-}
-
-/// A server's bus whose client is authenticated and speaks through `client`.
-struct Server {
-  Server() {
-    int ends[2];
-    require(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends) == 0);
-    client = ends[1];
-    sd_bus* raw = nullptr;
-    require(sd_bus_new(&raw) >= 0 && sd_bus_set_fd(raw, ends[0], ends[0]) >= 0);
-    bus.reset(raw);
-    require(sd_bus_set_server(raw, 1, sd_id128_t{{1}}) >= 0);
-    require(sd_bus_start(raw) >= 0);
-    write("\0AUTH EXTERNAL\r\nDATA\r\nBEGIN\r\n"s);
-    while (sd_bus_process(raw, nullptr) > 0) {
-    }
-    require(sd_bus_is_ready(raw) > 0);
-  }
-
-  void write(const std::string& bytes) {
-    require(::send(client, bytes.data(), bytes.size(), 0) == static_cast<ssize_t>(bytes.size()));
-  }
-
-  BusMessageHandle receive() {
-    sd_bus_message* message = nullptr;
-    while (sd_bus_process(bus.get(), &message) > 0 && !message) {
-    }
-    return BusMessageHandle(message);
-  }
-
-  BusHandle bus;
-  int client = -1;
-};
+void require(bool condition) { BusServer::require(condition); }
 
 void appendNumber(std::string& bytes, std::size_t number) {
   for (int i = 0; i < 4; ++i) bytes += static_cast<char>(number >> (8 * i));
@@ -81,16 +44,31 @@ std::string callWith(const std::string& signature, const std::string& body) {
   return bytes + body;
 }
 
-void decode(Server& server, const std::string& signature, const std::string& body) {
-  server.write(callWith(signature, body));
-  BusMessageHandle message = server.receive();
-  if (!message) return;  // refused by sd-bus
+/// What is read without sd-bus is what sd-bus reads.
+void compareWays(const std::string& call, const Value& expected, bool isExpected) {
+  static OneWayDecoder decoder("/o");
+  if (!OneWayDecoder::mayDecode(call, call.size())) return;
+  auto read = decoder.decode(call);
+  if (!read || read->arguments.size() != 1) return;
+  const auto* dictionary = std::get_if<Dictionary>(&read->arguments.front());
+  const auto* list = std::get_if<List>(&read->arguments.front());
+  if (!dictionary && !list) return;
+  Value value = dictionary ? Value(*dictionary) : Value(*list);
+  require(isExpected && describe(value, 1 << 20) == describe(expected, 1 << 20));
+}
+
+void decode(BusServer& server, const std::string& signature, const std::string& body) {
+  const std::string call = callWith(signature, body);
+  BusMessageHandle message = server.read(call);
+  if (!message) return compareWays(call, {}, false);  // refused by sd-bus
   BusDecoder decoder(message.get());
   Value value;
-  if (!decoder.read(value)) return;
+  bool isRead = decoder.read(value);
+  compareWays(call, value, isRead);
+  if (!isRead) return;
 
   sd_bus_message* raw = nullptr;
-  require(sd_bus_message_new_method_call(server.bus.get(), &raw, nullptr, "/o", "i.f", "m") >= 0);
+  require(sd_bus_message_new_method_call(server.bus(), &raw, nullptr, "/o", "i.f", "m") >= 0);
   BusMessageHandle again(raw);
   BusEncoder encoder(raw);
   if (!encoder.append(value)) {
@@ -116,7 +94,7 @@ void passGates(const std::string& bytes) {
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-  static Server server;
+  static BusServer server;
   static const char* const kSignatures[] = {"v", "a{sv}", "av", "aa{sv}", "a(sv)", "(yv)", "as"};
   if (size < 1 || size > 65'536) return 0;
   std::string body(reinterpret_cast<const char*>(data + 1), size - 1);

@@ -1,6 +1,7 @@
 #include "platform/http/HTTPClient.h"
 
 #include <algorithm>
+#include <cstdlib>
 #include <semaphore>
 
 #include "platform/http/HTTPExchange.h"
@@ -17,6 +18,12 @@ bool equalsIgnoringCase(std::string_view a, std::string_view b) {
                     [](char x, char y) { return lower(x) == lower(y); });
 }
 
+std::optional<std::string> authoritiesFromEnvironment() {
+  const char* file = std::getenv("SSL_CERT_FILE");
+  if (!file || !*file) return std::nullopt;
+  return file;
+}
+
 }  // namespace
 
 std::optional<std::string_view> HTTPResponse::header(std::string_view name) const {
@@ -26,7 +33,8 @@ std::optional<std::string_view> HTTPResponse::header(std::string_view name) cons
   return std::nullopt;
 }
 
-HTTPClient::HTTPClient(Options options) : _options(std::move(options)) {}
+HTTPClient::HTTPClient(Options options)
+    : _options(std::move(options)), _authorities(authoritiesFromEnvironment()) {}
 HTTPClient::HTTPClient() : HTTPClient(Options{}) {}
 HTTPClient::~HTTPClient() = default;
 
@@ -37,7 +45,7 @@ HTTPClient::Worker* HTTPClient::worker() {
 
 HTTPClient::Worker& HTTPClient::startedWorker() {
   MutexLock lock(_mutex);
-  if (!_worker) _worker = std::make_unique<Worker>(_options);
+  if (!_worker) _worker = std::make_unique<Worker>(_options, _authorities);
   return *_worker;
 }
 

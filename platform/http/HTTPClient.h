@@ -114,6 +114,7 @@ class HTTPClient {
   Worker& startedWorker();
 
   const Options _options;
+  const std::optional<std::string> _authorities;
   Mutex _mutex;
   std::unique_ptr<Worker> _worker VESK_GUARDED_BY(_mutex);
 };

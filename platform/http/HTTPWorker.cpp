@@ -5,7 +5,6 @@
 
 #include <algorithm>
 #include <chrono>
-#include <cstdlib>
 #include <exception>
 #include <limits>
 #include <new>
@@ -19,12 +18,6 @@ namespace vesk {
 namespace {
 
 constexpr long kKeptConnections = 32;
-
-std::optional<std::string> authoritiesFromEnvironment() {
-  const char* file = std::getenv("SSL_CERT_FILE");
-  if (!file || !*file) return std::nullopt;
-  return file;
-}
 
 CURLM* makeMulti(std::size_t connectionsPerHost) {
   // The library is never shut down: other parts of the process may use it too.
@@ -50,9 +43,9 @@ int millisecondsUntil(HTTPSchedule::Instant time) {
 
 }  // namespace
 
-HTTPClient::Worker::Worker(Options options)
+HTTPClient::Worker::Worker(Options options, std::optional<std::string> authorities)
     : _options(std::move(options)),
-      _authorities(authoritiesFromEnvironment()),
+      _authorities(std::move(authorities)),
       _multi(makeMulti(std::max<std::size_t>(_options.maximumConnectionsPerHost, 1))),
       _schedule(_options),
       _thread([this] { run(); }) {}

@@ -22,7 +22,7 @@ namespace vesk {
 /// without any timeout while there is nothing to do.
 class HTTPClient::Worker {
  public:
-  explicit Worker(Options options);
+  Worker(Options options, std::optional<std::string> authorities);
   ~Worker();
   Worker(const Worker&) = delete;
   Worker& operator=(const Worker&) = delete;
