@@ -1,14 +1,18 @@
 // One client of the end-to-end bench: sends numbered messages as fast as the daemon takes them.
 //
-// Usage: load_client SOCKET CLIENT COUNT [FLAG]
-// Message ids are CLIENT * 10,000,000 and up. Prints its own CPU time per message in microseconds.
+// Usage: load_client SOCKET CLIENT COUNT [FLAG [SESSIONS]]
+// Message ids are CLIENT * 10,000,000 and up. With many sessions each gets a batch of 50 in its turn. Prints
+// "ready", waits for a line, sends, prints its own CPU time per message in microseconds, and ends with its
+// standard input.
 #include <VeskReporting/VeskReporting.h>
 #include <VeskReporting/VeskReportingKeys.h>
 #include <sys/resource.h>
 
 #include <cstdio>
 #include <cstdlib>
+#include <memory>
 #include <thread>
+#include <vector>
 
 namespace {
 
@@ -37,49 +41,70 @@ vesk::Dictionary message(long id, int flag) {
                                                   {Text::literal("ratio"), 0.3333}}}};
 }
 
-}  // namespace
-
-int main(int argc, char** argv) {
-  if (argc < 4) return 2;
+std::unique_ptr<vesk::VeskReporting> startSession(const char* socket, long client) {
   vesk::ReportingOptions options;
-  options.socketPath = argv[1];
+  options.socketPath = socket;
   options.drainTime = std::chrono::seconds(60);
-  const long client = std::strtol(argv[2], nullptr, 10);
-  const long count = std::strtol(argv[3], nullptr, 10);
-  const int flag = argc > 4 ? std::atoi(argv[4]) : 0;
-  vesk::VeskReporting reporting(options);
+  auto reporting = std::make_unique<vesk::VeskReporting>(options);
   vesk::Dictionary session{{vesk::kVeskReportingSessionInfoSessionID, client},
                            {vesk::kVeskReportingSessionInfoClientType, 5},
                            {vesk::kVeskReportingSessionInfoRequireUserInfo, true},
                            {vesk::kVeskReportingSessionInfoBatchEvent, true}};
   vesk::Dictionary user{{vesk::kVeskReportingUserInfoClientName, "Bench"},
                         {vesk::kVeskReportingUserInfoServiceName, "EndToEnd"}};
-  if (reporting.setSessionInfo(session, user) != vesk::ReportingStatus::Queued) return 1;
-  auto started = reporting.startConfig();
-  if (!started || !started.answer || started.answer->empty()) {
-    std::fprintf(stderr, "load_client: the session does not start: %s\n", started.detail.c_str());
-    return 1;
-  }
-  double before = cpuMicroseconds();
-  for (long i = 0; i < count;) {
-    auto status = reporting.sendMessage(message(client * kIdsPerClient + i, flag));
-    if (status == vesk::ReportingStatus::Queued) {
-      ++i;
-    } else if (status == vesk::ReportingStatus::QueueFull) {
-      // The bench wants every message to arrive: wait, as a careful client may, for the daemon to catch up.
-      std::this_thread::sleep_for(std::chrono::milliseconds(2));
-    } else {
+  if (reporting->setSessionInfo(session, user) != vesk::ReportingStatus::Queued) return nullptr;
+  auto started = reporting->startConfig();
+  if (started && started.answer && !started.answer->empty()) return reporting;
+  std::fprintf(stderr, "load_client: the session does not start: %s\n", started.detail.c_str());
+  return nullptr;
+}
+
+/// False, having said why, when the message can't be sent at all.
+bool send(vesk::VeskReporting& reporting, const vesk::Dictionary& message) {
+  for (;;) {
+    auto status = reporting.sendMessage(message);
+    if (status == vesk::ReportingStatus::Queued) return true;
+    if (status != vesk::ReportingStatus::QueueFull) {
       std::fprintf(stderr, "load_client: %s\n", vesk::describe(status));
-      return 1;
+      return false;
     }
+    // The bench wants every message to arrive: wait, as a careful client may, for the daemon to catch up.
+    std::this_thread::sleep_for(std::chrono::milliseconds(2));
   }
-  auto flushed = reporting.flushMessagesAndWait(std::chrono::seconds(120));
-  double cpu = cpuMicroseconds() - before;
-  if (!flushed) {
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  if (argc < 4) return 2;
+  constexpr long kBatch = 50;
+  const long client = std::strtol(argv[2], nullptr, 10);
+  const long count = std::strtol(argv[3], nullptr, 10);
+  const int flag = argc > 4 ? std::atoi(argv[4]) : 0;
+  const long sessionCount = argc > 5 ? std::strtol(argv[5], nullptr, 10) : 1;
+  std::vector<std::unique_ptr<vesk::VeskReporting>> sessions;
+  for (long i = 0; i < sessionCount; ++i) {
+    sessions.push_back(startSession(argv[1], client * 1000 + i));
+    if (!sessions.back()) return 1;
+  }
+  std::puts("ready");
+  std::fflush(stdout);
+  std::getchar();
+  double before = cpuMicroseconds();
+  for (long i = 0; i < count; ++i) {
+    auto& session = *sessions[static_cast<std::size_t>(i / kBatch % sessionCount)];
+    if (!send(session, message(client * kIdsPerClient + i, flag))) return 1;
+  }
+  for (auto& session : sessions) {
+    auto flushed = session->flushMessagesAndWait(std::chrono::seconds(120));
+    if (flushed) continue;
     std::fprintf(stderr, "load_client: flush: %s %s\n", vesk::describe(flushed.status),
                  flushed.detail.c_str());
     return 1;
   }
-  std::printf("%.3f\n", cpu / static_cast<double>(count));
+  std::printf("%.3f\n", (cpuMicroseconds() - before) / static_cast<double>(count));
+  std::fflush(stdout);
+  while (std::getchar() != EOF) {
+  }
   return 0;
 }
