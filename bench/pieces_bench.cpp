@@ -11,6 +11,8 @@
 #include "platform/files/RootPrefix.h"
 #include "platform/ipc/BusCodec.h"
 #include "platform/ipc/BusHandles.h"
+#include "platform/ipc/OneWayDecoder.h"
+#include "platform/ipc/OneWayEncoder.h"
 #include "platform/json/JSONWriter.h"
 #include "platform/queue/TimedQueuePool.h"
 #include "util/Gzip.h"
@@ -91,6 +93,16 @@ void decode(benchmark::State& state) {
   }
 }
 BENCHMARK(decode);
+
+/// A whole message as a client sends it, the way it comes in without sd-bus.
+void decodeOneWay(benchmark::State& state) {
+  std::string message;
+  OneWayEncoder encoder("/o");
+  if (encoder.append({"i.f", "m", {payload()}}, 1, message) != CodecResult::Ok) std::abort();
+  OneWayDecoder decoder("/o");
+  for (auto _ : state) benchmark::DoNotOptimize(decoder.decode(message));
+}
+BENCHMARK(decodeOneWay);
 
 /// Record, user info, filters and the place in the batch; the batch is given up every 50 events.
 void recordAndFilter(benchmark::State& state) {
