@@ -58,7 +58,7 @@ fact() { sed -n "s/^ *\"$1\": \"\(.*\)\",\{0,1\}$/\1/p" "$root/ready.json"; }
 
 # start_collector BIN: on free ports, with the example storebag; the daemon under this root will trust it.
 start_collector() {
-  start collector "$1/veskcollector" --directory "$root/collector" --https-port 0 --http-port 0 \
+  start collector "$1/veskcollector" --directory "$root/collector" --https-port 0 --http-port 0 --udp-port 0 \
     --ready-file "$root/ready.json"
   wait_for collector '}' "$root/ready.json"
   local events

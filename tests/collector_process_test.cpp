@@ -29,6 +29,8 @@ class CollectorProcess : public ::testing::Test {
                        "0",
                        "--http-port",
                        "0",
+                       "--udp-port",
+                       "0",
                        "--ready-file",
                        (_files / "ready.json").string()};
     options.command.insert(options.command.end(), further.begin(), further.end());

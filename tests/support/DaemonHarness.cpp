@@ -41,7 +41,8 @@ DaemonHarness::DaemonHarness(std::vector<std::string> collectorArguments) {
        {"run", "var/lib/veskreportingd", "var/mobile/Library/Logs/Dunmore", "storebags"}) {
     std::filesystem::create_directories(root / directory);
   }
-  collectorArguments.insert(collectorArguments.end(), {"--https-port", "0", "--http-port", "0"});
+  collectorArguments.insert(collectorArguments.end(),
+                            {"--https-port", "0", "--http-port", "0", "--udp-port", "0"});
   startCollector(std::move(collectorArguments));
   std::filesystem::copy_file(fact("publicKeyFile"), root / "usr/share/veskreporting/publicKey.der");
   setPreference("veskreporting_storebag_url", quoted(fact("storebagURL")));
@@ -63,8 +64,9 @@ void DaemonHarness::startCollector(std::vector<std::string> arguments) {
                                    "--ready-file",
                                    (root / "ready").string()};
   if (arguments.empty()) {
-    arguments = {"--https-port", std::to_string(_facts.at("httpsPort").as_int64()), "--http-port",
-                 std::to_string(_facts.at("httpPort").as_int64())};
+    arguments = {"--https-port", std::to_string(_facts.at("httpsPort").as_int64()),
+                 "--http-port",  std::to_string(_facts.at("httpPort").as_int64()),
+                 "--udp-port",   std::to_string(_facts.at("udpPort").as_int64())};
   }
   command.insert(command.end(), arguments.begin(), arguments.end());
   std::filesystem::remove(root / "ready");
@@ -96,7 +98,10 @@ int DaemonHarness::stopDaemon() {
 }
 
 void DaemonHarness::writeStorebag(const std::string& name, std::string source) {
-  root.write("storebags/" + name + ".toml", replaced(std::move(source), "@EVENTS@", fact("eventsURL")));
+  source = replaced(std::move(source), "@EVENTS@", fact("eventsURL"));
+  source = replaced(std::move(source), "@LOGDATA@", fact("logDataURL"));
+  source = replaced(std::move(source), "@UDPPORT@", std::to_string(_facts.at("udpPort").as_int64()));
+  root.write("storebags/" + name + ".toml", source);
 }
 
 std::string DaemonHarness::socketPath() const {
@@ -110,9 +115,9 @@ ReportingOptions DaemonHarness::clientOptions() const {
   return options;
 }
 
-std::vector<boost::json::object> DaemonHarness::events() const {
+std::vector<boost::json::object> DaemonHarness::linesOf(const std::string& file) const {
   std::vector<boost::json::object> all;
-  std::istringstream lines(root.read("events.jsonl"));
+  std::istringstream lines(root.read(file));
   for (std::string line; std::getline(lines, line);) {
     if (lines.eof()) break;  // the line that is being written
     all.push_back(boost::json::parse(line).as_object());
@@ -120,15 +125,14 @@ std::vector<boost::json::object> DaemonHarness::events() const {
   return all;
 }
 
-std::vector<boost::json::object> DaemonHarness::waitForEvents(
-    const std::function<bool(const std::vector<boost::json::object>&)>& enough) {
+std::vector<boost::json::object> DaemonHarness::waitForLines(const std::string& file, const Enough& enough) {
   auto deadline = std::chrono::steady_clock::now() + ChildProcess::kPatience;
   while (true) {
-    auto all = events();
+    auto all = linesOf(file);
     if (enough(all)) return all;
     if (std::chrono::steady_clock::now() > deadline) {
-      throw std::runtime_error("after waiting there are " + std::to_string(all.size()) +
-                               " events; daemon:\n" + _daemon->errors());
+      throw std::runtime_error("after waiting there are " + std::to_string(all.size()) + " lines in " + file +
+                               "; daemon:\n" + _daemon->errors());
     }
     std::this_thread::sleep_for(std::chrono::milliseconds(5));  // between two looks at the file
   }

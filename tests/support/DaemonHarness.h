@@ -35,7 +35,8 @@ class DaemonHarness {
   ChildProcess& daemon() const { return *_daemon; }
   ChildProcess& collector() { return *_collector; }
 
-  /// Writes a storebag source; the text may say @EVENTS@ for the collector's HTTPS event URL.
+  /// Writes a storebag source; the text may say @EVENTS@, @LOGDATA@ and @UDPPORT@ for the collector's
+  /// HTTPS URLs of events and log data and its port for datagrams.
   void writeStorebag(const std::string& name, std::string source);
   /// A line of the daemon's preferences or of the device's facts; `value` as TOML writes it.
   void setPreference(const std::string& key, const std::string& value) { _preferences[key] = value; }
@@ -45,8 +46,14 @@ class DaemonHarness {
   ReportingOptions clientOptions() const;
 
   /// The lines of the collector's event file, once `enough` says so; throws after ChildProcess::kPatience.
-  std::vector<boost::json::object> waitForEvents(
-      const std::function<bool(const std::vector<boost::json::object>&)>& enough);
+  using Enough = std::function<bool(const std::vector<boost::json::object>&)>;
+  std::vector<boost::json::object> waitForEvents(const Enough& enough) {
+    return waitForLines("events.jsonl", enough);
+  }
+  /// The same of the datagrams that it took.
+  std::vector<boost::json::object> waitForDatagrams(const Enough& enough) {
+    return waitForLines("collector/datagrams.jsonl", enough);
+  }
   /// Until that many events of method `method` are there; gives those.
   std::vector<boost::json::object> waitForEventsOfMethod(int method, std::size_t count);
 
@@ -58,7 +65,8 @@ class DaemonHarness {
   TempDirectory root;
 
  private:
-  std::vector<boost::json::object> events() const;
+  std::vector<boost::json::object> linesOf(const std::string& file) const;
+  std::vector<boost::json::object> waitForLines(const std::string& file, const Enough& enough);
 
   std::unique_ptr<ChildProcess> _collector;
   std::unique_ptr<ChildProcess> _daemon;

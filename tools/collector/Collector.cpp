@@ -5,6 +5,7 @@
 #include "tools/collector/CertificateAuthority.h"
 #include "tools/collector/ControlEndpoint.h"
 #include "tools/collector/EventsEndpoint.h"
+#include "tools/collector/LogDataEndpoint.h"
 #include "tools/collector/StorebagEndpoint.h"
 
 namespace vesk {
@@ -15,6 +16,7 @@ constexpr char kEventsPath[] = "/events";
 constexpr char kGeneralStorebagsPath[] = "/bags";
 constexpr char kPartnersStorebagsPath[] = "/storebags";
 constexpr char kStorebagBase[] = "/bags/sorrel";
+constexpr char kLogDataPath[] = "/logdata";
 constexpr char kControlPath[] = "/_control";
 
 CollectorOptions completed(CollectorOptions options) {
@@ -41,6 +43,7 @@ struct Collector::Parts {
         folder(options.storebags, options.checks),
         events({console, stats, faults}, options.events),
         storebags({console, stats, faults, folder, key}, options.maximumAge),
+        logData(console, stats, options.directory / "logdata"),
         control(console, stats, faults),
         securePaths(Refusals(console, stats)),
         plainPaths(Refusals(console, stats)) {
@@ -49,12 +52,19 @@ struct Collector::Parts {
     // What else is to be taken over HTTP gets its endpoint above and its path here.
     for (EndpointTable* paths : {&securePaths, &plainPaths}) {
       paths->add(kEventsPath, events);
+      paths->add(kLogDataPath, logData);
       paths->add(kGeneralStorebagsPath, storebags);
       paths->add(kPartnersStorebagsPath, storebags);
     }
     plainPaths.add(kControlPath, control);
     secure = serve(securePaths, options.httpsPort, authority.issueServerIdentity(options.names));
     plain = serve(plainPaths, options.httpPort, std::nullopt);
+    // Dashboards know IPv4 only.
+    if (IPv4Endpoint::parse(options.address, 0)) {
+      datagrams = std::make_unique<DashboardReceiver>(DashboardReceiver::Parts{console, stats},
+                                                      options.address, options.udpPort, options.datagramLoss,
+                                                      options.directory / "datagrams.jsonl");
+    }
   }
 
   std::unique_ptr<HTTPServer> serve(const EndpointTable& paths, std::uint16_t port,
@@ -80,6 +90,7 @@ struct Collector::Parts {
   StorebagFolder folder;
   EventsEndpoint events;
   StorebagEndpoint storebags;
+  LogDataEndpoint logData;
   ControlEndpoint control;
   EndpointTable securePaths;
   EndpointTable plainPaths;
@@ -87,6 +98,7 @@ struct Collector::Parts {
   // Last, since their threads use all of the above.
   std::unique_ptr<HTTPServer> secure;
   std::unique_ptr<HTTPServer> plain;
+  std::unique_ptr<DashboardReceiver> datagrams;
 };
 
 Collector::Collector(CollectorOptions options, Console& console)
@@ -101,7 +113,9 @@ Dictionary Collector::facts() const {
   return Dictionary{
       {"httpsPort", static_cast<int>(_parts->secure->port())},
       {"httpPort", static_cast<int>(_parts->plain->port())},
+      {"udpPort", static_cast<int>(_parts->datagrams ? _parts->datagrams->port() : 0)},
       {"eventsURL", https + kEventsPath},
+      {"logDataURL", https + kLogDataPath},
       {"storebagURL", https + kStorebagBase},
       {"controlURL", http + kControlPath},
       {"authorityFile", CertificateAuthority::certificateFile(directory).string()},
@@ -109,6 +123,7 @@ Dictionary Collector::facts() const {
       {"signingKeyFile", SigningKey::privateKeyFile(directory).string()},
       {"storebags", _parts->options.storebags.string()},
       {"events", _parts->options.events.string()},
+      {"datagrams", (directory / "datagrams.jsonl").string()},
   };
 }
 
@@ -119,6 +134,10 @@ std::string Collector::introduction() const {
   return "veskcollector takes events at " + fact("eventsURL") + " and " + http + kEventsPath +
          "\n  and saves them to " + fact("events") + "\nIt serves storebags at " + fact("storebagURL") +
          " and " + http + kStorebagBase + "\n  from NAME.toml and NAME.json in " + fact("storebags") +
+         (_parts->datagrams ? "\nIt takes dashboards' datagrams on UDP port " +
+                                  std::to_string(_parts->datagrams->port()) + "\n  and saves them to " +
+                                  fact("datagrams") + "; their log data goes to " + fact("logDataURL")
+                            : std::string()) +
          "\nClients trust it with    SSL_CERT_FILE=" + fact("authorityFile") +
          "\nStorebags are verified with publicKey.der from " + fact("publicKeyFile") +
          "\nThe daemon finds it with the preference    veskreporting_storebag_url = \"" +

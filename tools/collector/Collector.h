@@ -11,6 +11,7 @@
 
 #include "platform/values/Value.h"
 #include "tools/collector/Console.h"
+#include "tools/collector/DashboardReceiver.h"
 #include "tools/storebag/StorebagSource.h"
 
 namespace vesk {
@@ -18,8 +19,10 @@ namespace vesk {
 struct CollectorOptions {
   std::filesystem::path directory;  ///< the collector's own files
   std::string address = "127.0.0.1";
-  std::uint16_t httpsPort = 8443;   ///< 0: any free one
-  std::uint16_t httpPort = 8080;    ///< 0: any free one
+  std::uint16_t httpsPort = 8443;  ///< 0: any free one
+  std::uint16_t httpPort = 8080;   ///< 0: any free one
+  std::uint16_t udpPort = 9053;    ///< 0: any free one
+  DatagramLoss datagramLoss{};
   std::filesystem::path storebags;  ///< empty: "storebags" in `directory`
   std::filesystem::path events;     ///< empty: "events.jsonl" in `directory`
   std::optional<std::chrono::seconds> maximumAge{};
@@ -29,7 +32,7 @@ struct CollectorOptions {
 };
 
 /// Runs from construction to destruction. Everything is offered over HTTPS and over HTTP; the control path
-/// over HTTP only.
+/// over HTTP only. Datagrams are taken on a port of their own.
 class Collector {
  public:
   /// Makes directories, the certificate authority and the signing key where they are missing. Throws

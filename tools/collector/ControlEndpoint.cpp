@@ -52,6 +52,13 @@ HTTPAnswer ControlEndpoint::counters() const {
                                {"eventsNotSaved", _stats.eventsNotSaved.load()},
                                {"storebagsSent", _stats.storebagsSent.load()},
                                {"storebagsUnchanged", _stats.storebagsUnchanged.load()},
+                               {"datagrams", _stats.datagrams.load()},
+                               {"datagramsAgain", _stats.datagramsAgain.load()},
+                               {"datagramsMalformed", _stats.datagramsMalformed.load()},
+                               {"datagramsLost", _stats.datagramsLost.load()},
+                               {"acknowledgements", _stats.acknowledgements.load()},
+                               {"acknowledgementsLost", _stats.acknowledgementsLost.load()},
+                               {"logData", _stats.logData.load()},
                                {"refused", _stats.refused.load()},
                                {"notHTTP", _stats.notHTTP.load()},
                                {"faults", _stats.faults.load()}});

@@ -13,32 +13,13 @@ namespace {
 
 constexpr std::size_t kShownOfAValue = 500;  // bytes
 
-std::string clockText(WallTime time) {
-  timeval value = timevalFrom(time);
-  std::tm local{};
-  ::localtime_r(&value.tv_sec, &local);
-  char text[32];
-  std::size_t length = std::strftime(text, sizeof text, "%H:%M:%S", &local);
-  std::snprintf(text + length, sizeof text - length, ".%03ld", static_cast<long>(value.tv_usec / 1000));
-  return text;
-}
-
-double secondsFrom(WallTime time) { return std::chrono::duration<double>(time.time_since_epoch()).count(); }
-
-/// JSON carries nothing but UTF-8, a header any byte.
-std::string utf8(std::string_view bytes) {
-  if (isValidUTF8(bytes)) return std::string(bytes);
-  std::string shown;
-  for (char c : bytes) shown += (static_cast<unsigned char>(c) < 0x80) ? c : '?';
-  return shown;
-}
-
 Dictionary headersOf(const HTTPReceived& received) {
   MutableDictionary headers;
   for (const auto& [name, value] : received.headers) {
     const Value* earlier = headers.find(name);
-    std::string joined = earlier != nullptr ? earlier->text()->string() + ", " + utf8(value) : utf8(value);
-    headers.set(utf8(name), joined);
+    std::string joined =
+        earlier != nullptr ? earlier->text()->string() + ", " + printableUTF8(value) : printableUTF8(value);
+    headers.set(printableUTF8(name), joined);
   }
   return headers.share();
 }
@@ -58,6 +39,25 @@ std::string titleOf(const Dictionary& event) {
 }
 
 }  // namespace
+
+std::string clockText(WallTime time) {
+  timeval value = timevalFrom(time);
+  std::tm local{};
+  ::localtime_r(&value.tv_sec, &local);
+  char text[32];
+  std::size_t length = std::strftime(text, sizeof text, "%H:%M:%S", &local);
+  std::snprintf(text + length, sizeof text - length, ".%03ld", static_cast<long>(value.tv_usec / 1000));
+  return text;
+}
+
+double secondsFrom(WallTime time) { return std::chrono::duration<double>(time.time_since_epoch()).count(); }
+
+std::string printableUTF8(std::string_view bytes) {
+  if (isValidUTF8(bytes)) return std::string(bytes);
+  std::string shown;
+  for (char c : bytes) shown += (static_cast<unsigned char>(c) < 0x80) ? c : '?';
+  return shown;
+}
 
 std::string readableText(const EventPost& post, const HTTPReceived& received, WallTime now) {
   std::size_t count = post.events.size();
@@ -81,7 +81,7 @@ std::string jsonLines(const EventPost& post, const HTTPReceived& received, WallT
   for (const Value& event : post.events) {
     auto line = toJSON(Dictionary{{"received", secondsFrom(now)},
                                   {"peer", received.peer},
-                                  {"path", utf8(received.target)},
+                                  {"path", printableUTF8(received.target)},
                                   {"headers", headers},
                                   {"postTime", post.postTime},
                                   {"clientId", post.clientId},

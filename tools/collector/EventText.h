@@ -2,6 +2,7 @@
 #pragma once
 
 #include <string>
+#include <string_view>
 
 #include "platform/time/Clock.h"
 #include "tools/collector/EventPost.h"
@@ -15,5 +16,11 @@ std::string readableText(const EventPost& post, const HTTPReceived& received, Wa
 /// One line an event, each with its line feed: a JSON object of "received" (seconds since 1970), "peer",
 /// "path", "headers", "postTime", "clientId" and "event".
 std::string jsonLines(const EventPost& post, const HTTPReceived& received, WallTime now);
+
+/// "20:31:29.123", local time.
+std::string clockText(WallTime time);
+double secondsFrom(WallTime time);
+/// JSON carries nothing but UTF-8: where `bytes` are none, "?" stands for each byte above 127.
+std::string printableUTF8(std::string_view bytes);
 
 }  // namespace vesk

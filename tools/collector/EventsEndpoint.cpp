@@ -1,13 +1,9 @@
 #include "tools/collector/EventsEndpoint.h"
 
-#include <fcntl.h>
-#include <unistd.h>
-
-#include <cerrno>
 #include <cstring>
 
-#include "platform/files/FileDescriptor.h"
 #include "tools/collector/EventText.h"
+#include "tools/collector/LinesFile.h"
 
 namespace vesk {
 
@@ -53,16 +49,11 @@ void EventsEndpoint::record(const EventPost& post, const HTTPReceived& received)
 }
 
 void EventsEndpoint::save(const std::string& lines, std::size_t events) {
-  FileDescriptor file(::open(_file.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0644));
-  if (file) {
-    // One write, so that the lines of posts which arrive on two ports at once do not mix.
-    ssize_t written = ::write(file.get(), lines.data(), lines.size());
-    if (written == static_cast<ssize_t>(lines.size())) return;
-    if (written >= 0) errno = ENOSPC;
-  }
+  const int error = appendLines(_file, lines);
+  if (error == 0) return;
   _parts.stats.eventsNotSaved += events;
   _parts.console.problem("can't save " + std::to_string(events) + " events to " + _file.string() + ": " +
-                         std::strerror(errno));
+                         std::strerror(error));
 }
 
 }  // namespace vesk

@@ -8,6 +8,7 @@
 #include <iostream>
 
 #include "platform/json/JSONWriter.h"
+#include "tools/collector/ArchiveText.h"
 #include "tools/collector/Collector.h"
 #include "tools/collector/FaultPlan.h"
 #include "tools/files/WholeFile.h"
@@ -26,6 +27,9 @@ struct Arguments {
   std::optional<unsigned> maximumAge;
   bool json = false;
   bool lenient = false;
+  double loss = 0;
+  std::uint32_t lossSeed = 1;
+  std::string archive;  // to be shown
 };
 
 /// A descriptor that the parent left closed would be given to the next file, and lines for people go there.
@@ -66,6 +70,13 @@ void define(CLI::App& app, Arguments& arguments) {
       ->type_name("HOST");
   app.add_option("--https-port", collector.httpsPort, "0 takes any free port")->capture_default_str();
   app.add_option("--http-port", collector.httpPort, "0 takes any free port")->capture_default_str();
+  app.add_option("--udp-port", collector.udpPort, "For dashboards' datagrams; 0 takes any free port")
+      ->capture_default_str();
+  app.add_option("--ack-loss", arguments.loss,
+                 "Lose each datagram, and each acknowledgement, with this probability")
+      ->check(CLI::Range(0.0, 1.0))
+      ->type_name("P");
+  app.add_option("--seed", arguments.lossSeed, "Decides which of them are lost")->capture_default_str();
   app.add_option("--storebags", collector.storebags, "Folder of NAME.toml and NAME.json")->type_name("DIR");
   app.add_option("--events", collector.events, "Append events to this file of JSON lines")->type_name("FILE");
   app.add_option("--max-age", arguments.maximumAge, "Send storebags with this Cache-Control max-age")
@@ -79,6 +90,9 @@ void define(CLI::App& app, Arguments& arguments) {
       ->type_name("FAULT");
   app.add_option("--ready-file", arguments.readyFile, "Write ports and paths here as JSON once listening")
       ->type_name("FILE");
+  app.add_subcommand("show", "Print an archive of log data and exit")
+      ->add_option("FILE", arguments.archive)
+      ->required();
 }
 
 std::string ready(const Collector& collector) {
@@ -112,8 +126,13 @@ int main(int count, char** texts) {
     return app.exit(error) == 0 ? 0 : kUsage;
   }
   try {
+    if (!arguments.archive.empty()) {
+      std::cout << archiveText(readWholeFile(arguments.archive, archiveLimits().bytes)) << std::flush;
+      return std::cout ? 0 : kFailed;
+    }
     arguments.collector.directory = directoryFrom(arguments);
     if (arguments.maximumAge) arguments.collector.maximumAge = std::chrono::seconds(*arguments.maximumAge);
+    arguments.collector.datagramLoss = DatagramLoss(arguments.loss, arguments.lossSeed);
     if (arguments.lenient) arguments.collector.checks = StorebagChecks::Lenient;
     run(arguments);
     return 0;

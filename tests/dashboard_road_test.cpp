@@ -1,0 +1,184 @@
+// Dashboards on real processes: client library, daemon in its sandbox, collector; loss, outages and ends.
+#include <gtest/gtest.h>
+
+#include <csignal>
+#include <fstream>
+#include <set>
+#include <thread>
+
+#include "tests/support/DaemonHarness.h"
+#include "tests/support/DashboardServer.h"
+
+namespace vesk::test {
+namespace {
+
+constexpr char kDashboardBag[] = R"(
+version = "1"
+[release.dashboard]
+ip = "127.0.0.1"
+port = @UDPPORT@
+post_url = "@LOGDATA@"
+display_url = "http://dash"
+)";
+
+bool queued(ReportingStatus status) { return status == ReportingStatus::Queued; }
+
+class DashboardRoad : public testing::Test {
+ protected:
+  void start(std::vector<std::string> collectorArguments = {}, const std::string& reliable = {}) {
+    _harness = std::make_unique<DaemonHarness>(std::move(collectorArguments));
+    _harness->writeStorebag("zelko",
+                            kDashboardBag + (reliable.empty() ? "" : "reliable = " + reliable + "\n"));
+    _harness->startDaemon();
+  }
+  /// The daemon's descriptors of UDP sockets; others come and go with its HTTPS connections.
+  int datagramDescriptors() {
+    const std::string process = "/proc/" + std::to_string(_harness->daemon().pid());
+    std::ifstream table(process + "/net/udp");
+    const std::string sockets{std::istreambuf_iterator<char>(table), {}};
+    int count = 0;
+    for (const auto& file : std::filesystem::directory_iterator(process + "/fd")) {
+      std::error_code closedMeanwhile;
+      const std::string target = std::filesystem::read_symlink(file.path(), closedMeanwhile).string();
+      if (!target.starts_with("socket:[")) continue;
+      count += sockets.find(" " + target.substr(8, target.size() - 9) + " ") != std::string::npos;
+    }
+    return count;
+  }
+  void expectNoDatagramDescriptors() {
+    auto deadline = std::chrono::steady_clock::now() + ChildProcess::kPatience;
+    while (datagramDescriptors() > 0 && std::chrono::steady_clock::now() < deadline)
+      std::this_thread::sleep_for(std::chrono::milliseconds(5));  // between two looks
+    EXPECT_EQ(datagramDescriptors(), 0);
+  }
+  long residentKiB() {
+    std::ifstream status("/proc/" + std::to_string(_harness->daemon().pid()) + "/status");
+    for (std::string line; std::getline(status, line);)
+      if (line.starts_with("VmRSS:")) return std::strtol(line.c_str() + 6, nullptr, 10);
+    return 0;
+  }
+  std::set<std::int64_t> numbersIn(const std::vector<boost::json::object>& datagrams) {
+    std::set<std::int64_t> numbers;
+    for (const auto& datagram : datagrams) {
+      const auto& payload = datagram.at("payload").as_object();
+      if (payload.contains("n")) numbers.insert(std::stoll(std::string(payload.at("n").as_string())));
+    }
+    return numbers;
+  }
+
+  std::unique_ptr<DaemonHarness> _harness;
+};
+
+TEST_F(DashboardRoad, AMessageBecomesADatagramALineAndAnAnswer) {
+  start();
+  {
+    RoadClient client(*_harness);
+    EXPECT_EQ(client.enabled, BackendNames{"dashboard"});
+    EXPECT_EQ(client.reporting.fetchDisplayURL().answer, "http://dash?sequences=77&override=yes");
+    auto sent = client.reporting.sendMessageAndWait(3, 2, Dictionary{{"text", "a=b\\c"}, {"n", 1}});
+    ASSERT_TRUE(sent) << sent.detail;
+    ASSERT_TRUE(sent.answer);
+    EXPECT_TRUE(sent.answer->ends_with(" 127.0.0.1 HD     3    77     2     3     2  n=1 text=a\\=b\\\\c"))
+        << *sent.answer;
+    EXPECT_NE(_harness->messageLog().find("[dashboard -> sendMessageWithDictionary] " + *sent.answer),
+              std::string::npos);
+    auto uploaded = client.reporting.uploadLogData(List{"log", Date{1}});
+    ASSERT_TRUE(uploaded) << uploaded.detail;
+    EXPECT_TRUE(uploaded.answer);
+  }
+  // The session's start, the message, the announcement, the end.
+  auto datagrams = _harness->waitForDatagrams([](const auto& all) { return all.size() >= 4; });
+  ASSERT_EQ(datagrams.size(), 4u);
+  EXPECT_EQ(datagrams[1].at("payload").as_object(), (boost::json::object{{"n", "1"}, {"text", "a=b\\c"}}));
+  EXPECT_EQ(datagrams[1].at("sender"), "HD");
+  EXPECT_EQ(datagrams[1].at("sessionID"), 77);
+  EXPECT_EQ(datagrams[2].at("status"), 2);
+  const std::string location(datagrams[2].at("payload").at("LogDataUploadLocation").as_string());
+  ChildProcess show({VESK_BIN_DIRECTORY "/veskcollector", "show", location});
+  EXPECT_EQ(show.wait(), 0) << show.errors();
+  EXPECT_EQ(show.output(), "list of 2\n  - \"log\"\n  - 1970-01-01 00:00:01.000 UTC\n");
+}
+
+TEST_F(DashboardRoad, EverythingArrivesThoughThreeInTenAreLostBothWays) {
+  constexpr int kMessages = 1000;
+  constexpr int kAtOnce = 25;  // half of what the daemon keeps
+  start({"--ack-loss", "0.3", "--seed", "1"}, "5");
+  RoadClient client(*_harness);
+  for (int n = 0; n < kMessages; ++n) {
+    ASSERT_TRUE(queued(client.reporting.sendMessage(3, 1, Dictionary{{"n", n}})));
+    if ((n + 1) % kAtOnce != 0) continue;
+    auto all = _harness->waitForDatagrams(
+        [&](const auto& datagrams) { return static_cast<int>(numbersIn(datagrams).size()) == n + 1; });
+    if (n + 1 < kMessages) continue;
+    std::set<std::int64_t> events;
+    int again = 0;
+    for (const auto& datagram : all) {
+      EXPECT_EQ(datagram.at("again").as_bool(), !events.insert(datagram.at("eventID").as_int64()).second);
+      again += datagram.at("again").as_bool();
+    }
+    EXPECT_GT(again, 200) << "three in ten acknowledgements are lost";
+  }
+  EXPECT_GT(_harness->collectorCount("datagramsLost"), 300);
+  EXPECT_GT(_harness->collectorCount("acknowledgementsLost"), 200);
+}
+
+TEST_F(DashboardRoad, MemoryStaysFlatWithoutAServer) {
+  start({}, "100");
+  RoadClient client(*_harness);
+  _harness->stopCollector();
+  auto send = [&](int count) {
+    for (int n = 0; n < count; ++n) {
+      while (!queued(client.reporting.sendMessage(3, 1, Dictionary{{"filler", std::string(900, 'x')}})))
+        ASSERT_TRUE(client.reporting.flushMessagesAndWait());
+    }
+    ASSERT_TRUE(client.reporting.flushMessagesAndWait(ChildProcess::kPatience));
+  };
+  send(2000);
+  const long before = residentKiB();
+  send(10'000);
+#if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
+  EXPECT_LT(residentKiB() - before, 2048) << "10,000 datagrams are 10 MiB";
+#endif
+  EXPECT_GT(before, 0);
+}
+
+TEST_F(DashboardRoad, AnEndedSessionLeavesNoDescriptorBehind) {
+  start({}, "2000");
+  for (bool answered : {true, false}) {
+    {
+      RoadClient client(*_harness);
+      EXPECT_EQ(datagramDescriptors(), 2) << "the socket, and the watch for acknowledgements";
+      ASSERT_TRUE(client.reporting.sendMessageAndWait(3, 1, Dictionary{{"n", 1}}));
+      if (!answered) _harness->stopCollector();
+    }
+    expectNoDatagramDescriptors();
+    EXPECT_EQ(
+        _harness->daemon().errors().find("scheduled last resort clean-up in 9500 ms.") != std::string::npos,
+        !answered);
+  }
+}
+
+TEST_F(DashboardRoad, TerminationSendsTheEndOfTheSessionAndWaitsForNothingElse) {
+  start({}, "100");
+  RoadClient client(*_harness);
+  EXPECT_EQ(_harness->stopDaemon(), 0);
+  auto datagrams = _harness->waitForDatagrams([](const auto& all) { return all.size() >= 2; });
+  EXPECT_EQ(datagrams.back().at("status"), 1);
+  EXPECT_EQ(datagrams.back().at("payload").at("StorebagVersion"), "1");
+}
+
+TEST_F(DashboardRoad, TheCollectorSurvivesWhatIsNoDatagram) {
+  start();
+  UDPSocket socket;
+  ASSERT_EQ(socket.open(), 0);
+  auto ready = boost::json::parse(_harness->root.read("ready"));
+  ASSERT_EQ(socket.connect({kLoopback, static_cast<std::uint16_t>(ready.at("udpPort").as_int64())}), 0);
+  const std::string header = std::string("\x07\x05\x01", 3) + std::string(61, '\0');
+  for (const std::string& bytes : {std::string(), std::string("x"), header, std::string(3000, 'x')})
+    ASSERT_TRUE(socket.send(bytes));
+  EXPECT_TRUE(_harness->collector().waitForText("refused a datagram of 3000 bytes from 127.0.0.1:"));
+  EXPECT_EQ(_harness->collectorCount("datagramsMalformed"), 4);
+}
+
+}  // namespace
+}  // namespace vesk::test

@@ -1,0 +1,108 @@
+#include "tools/collector/DashboardText.h"
+
+#include "backends/SenderCodes.h"
+#include "platform/json/JSONWriter.h"
+#include "tools/collector/Console.h"
+#include "tools/collector/EventText.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::size_t kShownOfAPayload = 1200;  // bytes
+
+/// The next equals sign that is not behind an odd number of backslashes.
+std::size_t findPlainEquals(std::string_view text, std::size_t from) {
+  bool isEscaped = false;
+  for (std::size_t i = from; i < text.size(); ++i) {
+    if (text[i] == '=' && !isEscaped) return i;
+    isEscaped = text[i] == '\\' && !isEscaped;
+  }
+  return std::string_view::npos;
+}
+
+std::string withoutEscapes(std::string_view value) {
+  std::string plain;
+  for (std::size_t i = 0; i < value.size(); ++i) {
+    if (value[i] == '\\' && i + 1 < value.size()) ++i;
+    plain += value[i];
+  }
+  return plain;
+}
+
+/// " a=y b=xx": a key reaches from the last space to its equals sign; the first one from the start.
+Dictionary payloadFrom(std::string_view text) {
+  MutableDictionary payload;
+  std::size_t keyStart = 1;
+  std::size_t equals = findPlainEquals(text, 0);
+  while (equals != std::string_view::npos) {
+    std::size_t next = findPlainEquals(text, equals + 1);
+    std::size_t end = text.size();
+    while (next != std::string_view::npos) {
+      end = text.rfind(' ', next);
+      if (end != std::string_view::npos && end > equals) break;
+      next = findPlainEquals(text, next + 1);  // of a key that has one itself
+      end = text.size();
+    }
+    keyStart = std::min(keyStart, equals);
+    payload.append(printableUTF8(text.substr(keyStart, equals - keyStart)),
+                   printableUTF8(withoutEscapes(text.substr(equals + 1, end - equals - 1))));
+    keyStart = end + 1;
+    equals = next;
+  }
+  return payload.shareUnique();
+}
+
+double sentAt(const DashboardHeader& header) { return header.seconds + header.milliseconds() / 1000.0; }
+
+std::string_view senderOf(const DashboardHeader& header) {
+  return senderCodeForClientType(header.clientType).value_or("-");
+}
+
+}  // namespace
+
+DatagramOutcome readDashboardDatagram(std::string_view bytes) {
+  if (bytes.size() < kDashboardHeaderSize) return {std::nullopt, "it is shorter than a header"};
+  auto header = decodeDashboardHeader(bytes);
+  if (!header) return {std::nullopt, "its header is of another version, or states another length"};
+  const std::string_view text = bytes.substr(kDashboardHeaderSize);
+  if (!text.empty() && text[0] != ' ') return {std::nullopt, "its text does not begin with a space"};
+  ReceivedDatagram datagram{*header, payloadFrom(text), {}, {}};
+  datagram.isCut = bytes.size() >= kDashboardLongestDatagram;
+  return {std::move(datagram), {}};
+}
+
+std::string readableText(const ReceivedDatagram& datagram) {
+  const DashboardHeader& header = datagram.header;
+  std::string line = clockText(datagram.received) + " datagram from " + datagram.peer + ": " +
+                     std::string(senderOf(header)) + " session " + std::to_string(header.sessionID) +
+                     " event " + std::to_string(header.eventID) + " method " + std::to_string(header.method) +
+                     " status " + std::to_string(header.respCode);
+  if (header.isReliable) line += ", reliable";
+  if (datagram.isAgain) line += ", again";
+  if (datagram.isCut) line += ", cut";
+  return line + ", " + printable(describe(datagram.payload, kShownOfAPayload));
+}
+
+std::string jsonLine(const ReceivedDatagram& datagram) {
+  const DashboardHeader& header = datagram.header;
+  auto line = toJSON(Dictionary{{"received", secondsFrom(datagram.received)},
+                                {"sent", sentAt(header)},
+                                {"peer", datagram.peer},
+                                {"again", datagram.isAgain},
+                                {"cut", datagram.isCut},
+                                {"reliable", header.isReliable},
+                                {"device", printableUTF8(header.deviceIDText())},
+                                {"sender", std::string(senderOf(header))},
+                                {"clientType", static_cast<unsigned>(header.clientType)},
+                                {"clientVersion", static_cast<unsigned>(header.clientVersion)},
+                                {"sessionID", header.sessionID},
+                                {"eventID", static_cast<unsigned>(header.eventID)},
+                                {"method", static_cast<unsigned>(header.method)},
+                                {"status", static_cast<unsigned>(header.respCode)},
+                                {"payload", datagram.payload}},
+                     JSONStyle::Compact);
+  return line.value_or("null") + "\n";
+}
+
+}  // namespace vesk
