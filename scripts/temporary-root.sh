@@ -54,12 +54,14 @@ clean_up() {
 }
 
 # fact NAME: what the collector's ready file says.
-fact() { sed -n "s/^ *\"$1\": \"\(.*\)\",\{0,1\}$/\1/p" "$root/ready.json"; }
+fact() { sed -n "s/^ *\"$1\": \"\{0,1\}\([^\"]*[^\",]\)\"\{0,1\},\{0,1\}$/\1/p" "$root/ready.json"; }
 
-# start_collector BIN: on free ports, with the example storebag; the daemon under this root will trust it.
+# start_collector BIN [OPTION…]: on free ports, with the example storebag; the daemon under this root will trust it.
 start_collector() {
-  start collector "$1/veskcollector" --directory "$root/collector" --https-port 0 --http-port 0 --udp-port 0 \
-    --ready-file "$root/ready.json"
+  local bin=$1
+  shift
+  start collector "$bin/veskcollector" --directory "$root/collector" --https-port 0 --http-port 0 --udp-port 0 \
+    --ready-file "$root/ready.json" "$@"
   wait_for collector '}' "$root/ready.json"
   local events
   events=$(fact eventsURL)

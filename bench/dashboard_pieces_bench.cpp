@@ -1,0 +1,103 @@
+// What a datagram costs inside the daemon, beside the system call alone, and what its line in the message log
+// costs. Both count the CPU time of all threads.
+#include <benchmark/benchmark.h>
+
+#include <cstdlib>
+#include <filesystem>
+
+#include "backends/DashboardBackend.h"
+#include "backends/DashboardText.h"
+#include "platform/files/RootPrefix.h"
+#include "platform/log/SystemLog.h"
+#include "platform/queue/TimedQueuePool.h"
+#include "util/MessageLog.h"
+
+namespace vesk {
+namespace {
+
+Dictionary payload() {
+  return {{"msgid", 12345678},
+          {"view", "Preferences/Network"},
+          {"username", "someone@example"},
+          {"secret", "do-not-send"},
+          {"duration", 12.75},
+          {"count", 42},
+          {"result", "completed-ok"},
+          {"ratio", 0.3333}};
+}
+
+/// Takes datagrams without reading them; a full buffer drops what comes.
+struct Sink {
+  Sink() {
+    if (socket.open() != 0 || socket.bind({0x7F00'0001, 0}) != 0) std::abort();
+  }
+  UDPSocket socket;
+};
+
+struct Sender {
+  Sender() {
+    Dictionary profile{{"ip", "127.0.0.1"}, {"port", static_cast<int>(sink.socket.localEndpoint()->port)}};
+    backend = VeskReportingBackend::newBackendWithName("dashboard", profile, Text("Phone"), 5, services);
+    if (!backend) std::abort();
+    backend->setSelfVersion("7.0");
+    backend->setCompType(5);
+    backend->setSessionID(77);
+    backend->setUdid("0123456789abcdef0123456789abcdef01234567");
+  }
+  ~Sender() {
+    backend.reset();
+    if (!queues.waitUntilUnused(std::chrono::seconds(10))) std::abort();
+  }
+
+  Sink sink;
+  Counters counters;
+  TimedQueuePool queues{1};
+  HTTPClient http;
+  BackendServices services{http, WallClock::system(), counters, queues, {}, {}, {}};
+  std::shared_ptr<VeskReportingBackend> backend;
+};
+
+void sendAMessage(benchmark::State& state) {
+  Sender sender;
+  const Dictionary message = payload();
+  const timeval now{1'700'000'000, 500'000};
+  for (auto _ : state) benchmark::DoNotOptimize(sender.backend->sendMessage(message, now, 3, 2, 0));
+  for (const auto& lost : sender.counters.snapshot())
+    state.counters["lost"] = static_cast<double>(lost.count);
+}
+BENCHMARK(sendAMessage)->MeasureProcessCPUTime();
+
+void writeTheText(benchmark::State& state) {
+  const Dictionary message = payload();
+  char area[kDashboardTextArea];
+  for (auto _ : state) benchmark::DoNotOptimize(writePayloadText(message, area, sizeof area));
+}
+BENCHMARK(writeTheText);
+
+void sendOnly(benchmark::State& state) {
+  Sink sink;
+  UDPSocket socket;
+  if (socket.open() != 0 || socket.connect(*sink.socket.localEndpoint()) != 0) std::abort();
+  const std::string datagram(200, 'x');
+  for (auto _ : state) benchmark::DoNotOptimize(socket.send(datagram));
+}
+BENCHMARK(sendOnly);
+
+void writeALogLine(benchmark::State& state) {
+  const std::string line(300, 'x');
+  for (auto _ : state) writeToLogFile("[%@ -> sendMessageWithDictionary] %@", "dashboard", line);
+}
+BENCHMARK(writeALogLine);
+
+}  // namespace
+}  // namespace vesk
+
+int main(int argc, char** argv) {
+  char root[] = "/tmp/vesk-bench.XXXXXX";
+  if (::mkdtemp(root) == nullptr) return 1;
+  vesk::setRootPrefix(root);
+  vesk::SystemLog::setLevel(4);
+  benchmark::Initialize(&argc, argv);
+  benchmark::RunSpecifiedBenchmarks();
+  std::filesystem::remove_all(root);
+}
