@@ -58,8 +58,9 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
   /// not fill the memory, so beyond this many lists the empty ones go.
   static constexpr std::size_t kMostKeptLists = 256;
 
-  void removeFromSessionList(const std::shared_ptr<ReportingdSession>& session);
-  void removeFromCorrelation(const std::shared_ptr<ReportingdSession>& session);
+  void removeFromSessionList(const std::shared_ptr<ReportingdSession>& session) VESK_EXCLUDES(_monitor);
+  void removeFromCorrelation(const std::shared_ptr<ReportingdSession>& session)
+      VESK_EXCLUDES(_sessionListMutex);
 
   /// The first session of exactly that level, in the order in which they joined.
   static std::shared_ptr<ReportingdSession> getFirstSessionWithHierarchy(std::int32_t level,

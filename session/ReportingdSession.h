@@ -82,9 +82,9 @@ class ReportingdSession final : public ClientSessionInterface,
   /// The level in the family: 0 at the top.
   std::int32_t getSessionHierarchy() const;
   bool hasAggregator() const;
-  void updateCombinedSessionID();
-  void syncReportingStates();
-  void shutdownSessionAggregation();
+  void updateCombinedSessionID() VESK_EXCLUDES(_mutex);
+  void syncReportingStates() VESK_EXCLUDES(_mutex);
+  void shutdownSessionAggregation() VESK_EXCLUDES(_mutex);
   /// The names of the enabled backends; nothing before the first start.
   std::optional<BackendNames> fetchReportingStates() const;
   std::optional<Value> samplingThresholdWithBackendName(const std::string& name) const;
@@ -98,9 +98,9 @@ class ReportingdSession final : public ClientSessionInterface,
 
   // Configuration.
   void createBackendsWithStorebag(const std::optional<Dictionary>& storebag);
-  void updateSessionWithDefaultSessionInfo();
-  void updateReportingStates();
-  void receivedUserInfo(const std::optional<Dictionary>& userInfo);
+  void updateSessionWithDefaultSessionInfo() VESK_EXCLUDES(_mutex);
+  void updateReportingStates() VESK_EXCLUDES(_mutex);
+  void receivedUserInfo(const std::optional<Dictionary>& userInfo) VESK_EXCLUDES(_mutex);
   static void cleanupBackends(const SharedBackends& backends);
   SharedBackends backends() const;
   std::string displayURLText() const;
@@ -124,7 +124,8 @@ class ReportingdSession final : public ClientSessionInterface,
   // Aggregation.
   bool undeliveredBurstBegins();
   void aggregateMessage(const std::optional<Dictionary>& sessionInfo, double timestamp,
-                        std::uint16_t category, std::uint16_t type, const std::optional<Dictionary>& payload);
+                        std::uint16_t category, std::uint16_t type, const std::optional<Dictionary>& payload)
+      VESK_EXCLUDES(_mutex);
 
   // Constant after construction.
   const std::shared_ptr<ReportingdSessionDelegate> _sessionDelegate;

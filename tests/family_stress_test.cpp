@@ -147,7 +147,10 @@ TEST(FamilyStress, TwoFamiliesThatDoEverythingAtOnceNeitherHangNorBreakTheDaemon
   harness.startDaemon({"--log-level", "6"});
 
   std::vector<std::unique_ptr<Member>> members;
-  for (int i = 0; i < kMembers; ++i) members.push_back(std::make_unique<Member>(harness, i, seed));
+  for (int i = 0; i < kMembers; ++i) {
+    members.push_back(std::make_unique<Member>(harness, i, seed));
+    ASSERT_EQ(members.back()->problem(), "") << tail(harness.daemon().errors());
+  }
   std::uint64_t aggregated = 0;
   {
     std::atomic<bool> ends{false};
