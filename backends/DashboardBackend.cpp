@@ -1,6 +1,7 @@
 #include "backends/DashboardBackend.h"
 
 #include <algorithm>
+#include <exception>
 #include <new>
 #include <utility>
 
@@ -63,6 +64,15 @@ std::optional<Settings> settingsFrom(const std::optional<std::string>& serverIP,
   return Settings{*server};
 }
 
+std::shared_ptr<TimedQueue> networkQueue(const BackendServices& services) {
+  try {
+    return services.networkQueues.makeQueue(kQueueLabel);
+  } catch (const std::exception&) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): can't create timer source.");
+    return nullptr;
+  }
+}
+
 }  // namespace
 
 std::shared_ptr<DashboardBackend> DashboardBackend::create(const std::string& name,
@@ -92,8 +102,10 @@ std::shared_ptr<DashboardBackend> DashboardBackend::createConnected(
     VESK_LOG_ERROR("DashboardBackend(initWithName): socket() failed (%d)", error);
     return nullptr;
   }
-  auto delivery = std::make_shared<DashboardDelivery>(
-      std::move(socket), services.networkQueues.makeQueue(kQueueLabel), services.counters, name);
+  auto queue = networkQueue(services);
+  if (!queue) return nullptr;
+  auto delivery =
+      std::make_shared<DashboardDelivery>(std::move(socket), std::move(queue), services.counters, name);
   std::shared_ptr<DashboardBackend> backend(
       new DashboardBackend(name, profile, productFamily.value_or(Text()), delivery, services));
   if (!profile) settings = settingsFrom(serverIP, serverPort);

@@ -134,6 +134,9 @@ TEST(StorebagSource, WarnsOfWhatIsProbablyAMistake) {
       {"dashboard",
        R"({"release": {"dashboard": {}}})",
        {"dashboard.ip: missing", "dashboard.port: missing"}},
+      {"dashboard's values",
+       R"({"release": {"dashboard": {"ip": "localhost", "port": 1, "reliable": 0}}})",
+       {"dashboard.ip: not four decimal numbers", "dashboard.reliable: not 1 to 3600000 ms"}},
   };
   TempDirectory files;
   for (const auto& test : cases) {

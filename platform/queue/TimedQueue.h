@@ -39,7 +39,7 @@ class TimedQueue {
 class TimedQueueMaker {
  public:
   virtual ~TimedQueueMaker() = default;
-  /// `label` names the queue in log lines; a literal.
+  /// `label` names the queue in log lines; a literal. May throw when there is nothing to run it on.
   virtual std::shared_ptr<TimedQueue> makeQueue(const char* label) = 0;
 };
 

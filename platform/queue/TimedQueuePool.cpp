@@ -52,11 +52,11 @@ class TimedQueuePool::Queue final : public TimedQueue {
   const std::shared_ptr<Users> _users;
 };
 
-TimedQueuePool::TimedQueuePool(std::size_t threads) : _users(std::make_shared<Users>()), _pool(threads) {}
+TimedQueuePool::TimedQueuePool(std::size_t threads) : _threads(threads), _users(std::make_shared<Users>()) {}
 TimedQueuePool::~TimedQueuePool() = default;
 
 std::shared_ptr<TimedQueue> TimedQueuePool::makeQueue(const char* label) {
-  return std::make_shared<Queue>(_pool, label, _users);
+  return std::make_shared<Queue>(pool(), label, _users);
 }
 
 bool TimedQueuePool::waitUntilUnused(std::chrono::milliseconds timeout) {
@@ -64,6 +64,15 @@ bool TimedQueuePool::waitUntilUnused(std::chrono::milliseconds timeout) {
   return _users->left.wait_for(lock, timeout, [&] { return _users->count == 0; });
 }
 
-void TimedQueuePool::stop() { _pool.stop(); }
+void TimedQueuePool::stop() {
+  MutexLock lock(_mutex);
+  if (_pool) _pool->stop();
+}
+
+WorkQueuePool& TimedQueuePool::pool() {
+  MutexLock lock(_mutex);
+  if (!_pool) _pool.emplace(_threads);
+  return *_pool;  // stays where it is
+}
 
 }  // namespace vesk

@@ -6,6 +6,8 @@
 #include <string_view>
 
 #include "client/include/VeskReporting/VeskReportingKeys.h"
+#include "platform/net/UDPSocket.h"
+#include "platform/preferences/PreferencesSuite.h"
 
 namespace vesk {
 
@@ -18,6 +20,8 @@ struct KeyRule {
   Shape shape;
   std::string_view withoutIt = {};  ///< what the key's absence means, when it is worth a warning
 };
+
+constexpr std::int64_t kLongestTick = 3'600'000;  // ms, of a dashboard
 
 constexpr std::array kEnvironments{"development", "corvane_internal", "seed", "release"};
 
@@ -211,6 +215,10 @@ class Checker {
   void checkInside(const std::string& place, std::string_view key, const Value& value) {
     if (key == "action" && *value.text() != "remove" && *value.text() != "sha256")
       warn(join(place, key) + ": neither \"remove\" nor \"sha256\", the filter changes nothing");
+    if (key == "ip" && !IPv4Endpoint::parse(value.text()->view(), 0))
+      warn(join(place, key) + ": not four decimal numbers between dots, the backend is not built");
+    if (key == "reliable" && (integerForm(value) < 1 || integerForm(value) > kLongestTick))
+      warn(join(place, key) + ": not 1 to 3600000 ms, 500 is used");
     if (key != "clients" && key != "filters") return;
     for (std::size_t i = 0; i < value.list()->size(); ++i) {
       std::string item = join(place, key) + "[" + std::to_string(i) + "]";
