@@ -190,7 +190,10 @@ void DashboardDelivery::continueShutdown() {
     _cleanupState = LastResortScheduled;
     VESK_LOG_DEBUG("DashboardBackend(myPeriodicTask): scheduled last resort clean-up in %d ms.",
                    static_cast<int>(kLastResort.count()));
-    _networkProcQueue->submitAfter(kLastResort, [self = shared_from_this()] { self->cleanupSources(); });
+    // The timer goes on and holds this; once it doesn't, there is nothing left to do.
+    _networkProcQueue->submitAfter(kLastResort, [weak = weak_from_this()] {
+      if (auto self = weak.lock()) self->cleanupSources();
+    });
   }
 }
 

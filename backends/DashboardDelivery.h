@@ -24,9 +24,9 @@ namespace vesk {
 /// state of the shutdown runs on one serial queue.
 ///
 /// Life: the backend holds it, and so do the work on the queue and, while datagrams are pending, the timer;
-/// the read source does not. So it outlives its backend until the last datagram has gone or 9.5 s are over,
-/// and then lets go of everything. When the queue's threads are stopped before, it goes with its handlers.
-/// The socket is closed by the teardown, or with the object.
+/// the read source and the last resort do not. So it outlives its backend until the last datagram has gone
+/// or 9.5 s are over, and then lets go of everything. When the queue's threads are stopped before, it goes
+/// with its handlers. The socket is closed by the teardown, or with the object.
 class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery> {
  public:
   using Buffer = std::array<char, kDashboardBufferSize>;

@@ -38,6 +38,16 @@ class DashboardServer {
     for (const auto& datagram : take()) ids.push_back(eventIDOfAcknowledgement(datagram).value_or(0xFFFF));
     return ids;
   }
+  /// The same, each answered with its own bytes.
+  std::vector<std::string> takeAndAcknowledge() {
+    std::vector<std::string> datagrams;
+    char buffer[2048];
+    while (auto size = _socket.receive(buffer, &_client)) {
+      datagrams.emplace_back(buffer, *size);
+      send(datagrams.back());
+    }
+    return datagrams;
+  }
   /// To whoever sent last.
   void send(std::string_view datagram) { EXPECT_TRUE(_socket.sendTo(_client, datagram)); }
   void acknowledge(std::uint16_t eventID, std::size_t size = kDashboardShortestAcknowledgement) {
