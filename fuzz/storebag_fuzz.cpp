@@ -1,0 +1,69 @@
+// Property lists as what a storebag says of an HTTPS backend: the backend decides its state and takes
+// messages.
+#include <cstdint>
+
+#include "backends/VeskReportingBackend.h"
+#include "platform/log/SystemLog.h"
+#include "platform/plist/PropertyList.h"
+#include "platform/queue/TimedQueuePool.h"
+
+namespace {
+
+using namespace vesk;
+
+struct Shared {
+  Shared() { SystemLog::setLevel(static_cast<int>(LogLevel::Error)); }
+
+  HTTPClient http;
+  Counters counters;
+  TimedQueuePool networkQueues{1};
+  BackendServices services{http,
+                           WallClock::system(),
+                           counters,
+                           networkQueues,
+                           [](bool) { return std::string("id"); },
+                           [] { return true; },
+                           [] { return std::optional<std::string>("US"); }};
+};
+
+/// The profile without addresses: the bytes choose what is sent, not whom it reaches.
+Value withoutAddresses(const Value& value) {
+  if (const List* list = value.list()) {
+    std::vector<Value> kept;
+    for (const Value& element : *list) kept.push_back(withoutAddresses(element));
+    return List(std::move(kept));
+  }
+  const Dictionary* dictionary = value.dictionary();
+  if (!dictionary) return value;
+  MutableDictionary kept;
+  for (const auto& entry : *dictionary) {
+    if (entry.key.view().find("url") == std::string_view::npos)
+      kept.set(entry.key, withoutAddresses(entry.value));
+  }
+  return kept.share();
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
+  static Shared shared;
+  const auto outcome = parsePropertyList({reinterpret_cast<const char*>(data), size});
+  if (!outcome.value) return 0;
+  const Value profile = withoutAddresses(*outcome.value);
+  if (!profile.dictionary()) return 0;
+  for (const char* name : {"httpPost", "httpPost2"}) {
+    auto backend = VeskReportingBackend::newBackendWithName(name, *profile.dictionary(), Text("Phone"), 5,
+                                                            shared.services);
+    if (!backend) continue;
+    backend->setCompType(5);
+    backend->updateState();
+    timeval now{1'700'000'000, 250'000};
+    for (std::uint16_t i = 0; i < 4; ++i) {
+      (void)backend->sendMessage(Dictionary{{"username", "someone"}, {"count", i}, {"real", 0.5}}, now, i, 1,
+                                 i);
+    }
+    (void)backend->flushMessages();
+    backend->cleanup();
+  }
+  return 0;
+}
