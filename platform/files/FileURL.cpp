@@ -13,6 +13,19 @@ int hexDigit(char c) {
 
 }  // namespace
 
+std::optional<std::string> percentDecoded(std::string_view text) {
+  std::string decoded;
+  for (std::size_t i = 0; i < text.size(); ++i) {
+    int high = text[i] == '%' && i + 2 < text.size() ? hexDigit(text[i + 1]) : -1;
+    int low = high >= 0 ? hexDigit(text[i + 2]) : -1;
+    char c = low >= 0 ? static_cast<char>(high * 16 + low) : text[i];
+    if (low >= 0) i += 2;
+    if (c == '\0') return std::nullopt;
+    decoded += c;
+  }
+  return decoded;
+}
+
 std::string pathFromFileURL(std::string_view url) {
   constexpr std::string_view kScheme = "file:";
   if (!url.starts_with(kScheme)) return std::string(url);
@@ -24,16 +37,7 @@ std::string pathFromFileURL(std::string_view url) {
     if (slash == std::string_view::npos || (!host.empty() && host != "localhost")) return {};
     url.remove_prefix(slash);
   }
-  std::string path;
-  for (std::size_t i = 0; i < url.size(); ++i) {
-    int high = url[i] == '%' && i + 2 < url.size() ? hexDigit(url[i + 1]) : -1;
-    int low = high >= 0 ? hexDigit(url[i + 2]) : -1;
-    char c = low >= 0 ? static_cast<char>(high * 16 + low) : url[i];
-    if (low >= 0) i += 2;
-    if (c == '\0') return {};
-    path += c;
-  }
-  return path;
+  return percentDecoded(url).value_or(std::string());
 }
 
 }  // namespace vesk

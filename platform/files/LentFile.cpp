@@ -1,0 +1,55 @@
+#include "platform/files/LentFile.h"
+
+#include <fcntl.h>
+
+#include <cerrno>
+
+namespace vesk {
+
+LentFile::LentFile(FileDescriptor descriptor) noexcept : _descriptor(std::move(descriptor)) {
+  if (_descriptor && ::fstat(_descriptor.get(), &_status) != 0) _status = {};
+}
+
+bool LentFile::isRegularAt(const std::string& path) const noexcept {
+  if (!S_ISREG(_status.st_mode) || path.empty()) return false;
+  struct stat named {};
+  return ::lstat(path.c_str(), &named) != 0 || S_ISREG(named.st_mode);
+}
+
+LentFile::Reading LentFile::read(std::string& bytes) const {
+  bytes.resize(size());
+  std::size_t done = 0;
+  while (done < bytes.size()) {
+    ssize_t count =
+        ::pread(_descriptor.get(), bytes.data() + done, bytes.size() - done, static_cast<off_t>(done));
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return Reading::Unreadable;
+    if (count == 0) return Reading::Changed;
+    done += static_cast<std::size_t>(count);
+  }
+  struct stat now {};
+  if (::fstat(_descriptor.get(), &now) != 0) return Reading::Unreadable;
+  return isUnchanged(now) ? Reading::Whole : Reading::Changed;
+}
+
+bool LentFile::removeFrom(const std::string& path, uid_t user) const {
+  if (user != _status.st_uid && user != ::geteuid()) return false;
+  auto slash = path.rfind('/');
+  if (slash == std::string::npos) return false;
+  // The directory is held, so that both steps are about the same one whatever becomes of its path.
+  const std::string parent(path, 0, slash + 1);
+  FileDescriptor directory(::open(parent.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  if (!directory) return false;
+  const char* name = path.c_str() + slash + 1;
+  struct stat named {};
+  if (::fstatat(directory.get(), name, &named, AT_SYMLINK_NOFOLLOW) != 0) return false;
+  if (named.st_dev != _status.st_dev || named.st_ino != _status.st_ino || !isUnchanged(named)) return false;
+  return ::unlinkat(directory.get(), name, 0) == 0;
+}
+
+bool LentFile::isUnchanged(const struct stat& now) const noexcept {
+  return now.st_size == _status.st_size && now.st_mtim.tv_sec == _status.st_mtim.tv_sec &&
+         now.st_mtim.tv_nsec == _status.st_mtim.tv_nsec;
+}
+
+}  // namespace vesk

@@ -1,0 +1,121 @@
+#include "platform/powerlog/PowerLog.h"
+
+#include <cmath>
+#include <exception>
+#include <utility>
+
+#include "platform/crypto/Base64.h"
+#include "platform/json/JSONWriter.h"
+#include "platform/log/SystemLog.h"
+#include "platform/powerlog/PowerLogStore.h"
+
+namespace vesk {
+
+namespace {
+
+Value forJSON(const Value& value);
+
+double forJSON(double number) { return std::isfinite(number) ? number : -1; }
+
+Dictionary forJSON(const Dictionary& dictionary) {
+  MutableDictionary result;
+  result.reserve(dictionary.size());
+  for (const DictionaryEntry& entry : dictionary) result.append(entry.key, forJSON(entry.value));
+  return result.share();
+}
+
+Value forJSON(const Value& value) {
+  if (const double* number = value.real()) return forJSON(*number);
+  if (const Date* date = value.date()) return forJSON(date->secondsSince1970);
+  if (const Bytes* bytes = value.bytes()) return base64Encode(bytes->view());
+  if (const Dictionary* dictionary = value.dictionary()) return forJSON(*dictionary);
+  const List* list = value.list();
+  if (!list) return value;
+  std::vector<Value> items;
+  items.reserve(list->size());
+  for (const Value& item : *list) items.push_back(forJSON(item));
+  return List(std::move(items));
+}
+
+std::size_t sizeOf(const PowerLogEvent& event) {
+  return sizeof event + event.name.size() + event.dictionary.size();
+}
+
+}  // namespace
+
+PowerLog::PowerLog(Options options) : _options(std::move(options)) {}
+
+PowerLog::~PowerLog() {
+  std::thread thread;
+  {
+    MutexLock lock(_mutex);
+    _stopping = true;
+    _changed.notify_all();
+    thread = std::move(_thread);
+  }
+  if (thread.joinable()) thread.join();
+}
+
+void PowerLog::KLLogRegisteredEvent(std::uint32_t identifier, std::string_view name,
+                                    const Dictionary& dictionary, const std::optional<Value>&) noexcept {
+  try {
+    auto json = toJSON(forJSON(dictionary), JSONStyle::Compact);
+    if (!json || json->size() > _options.maximumEvent) return lost(1);
+    keep({identifier, std::string(name), _options.clock->now(), std::move(*json)});
+  } catch (const std::exception&) {
+    lost(1);  // no memory, or no thread
+  }
+}
+
+void PowerLog::keep(PowerLogEvent event) {
+  MutexLock lock(_mutex);
+  const std::size_t size = sizeOf(event);
+  if (_stopping || _waitingBytes + size > _options.maximumWaiting) return lost(1);
+  if (!_thread.joinable()) _thread = std::thread([this] { run(); });
+  _waiting.push_back(std::move(event));
+  _waitingBytes += size;
+  if (!_isWriting) _changed.notify_all();
+}
+
+void PowerLog::flush() {
+  MutexLock lock(_mutex);
+  while (!_waiting.empty() || _isWriting) _changed.wait(_mutex);
+}
+
+void PowerLog::lost(std::uint64_t events) const noexcept {
+  if (_options.onLost) _options.onLost(events);
+}
+
+void PowerLog::run() noexcept {
+  PowerLogStore store(_options.path, {_options.maximumAge, _options.maximumRows});
+  while (true) {
+    std::vector<PowerLogEvent> batch;
+    {
+      MutexLock lock(_mutex);
+      _isWriting = false;
+      _changed.notify_all();
+      while (_waiting.empty() && !_stopping) _changed.wait(_mutex);
+      if (_waiting.empty()) return;
+      batch.swap(_waiting);
+      _waitingBytes = 0;
+      _isWriting = true;
+    }
+    write(store, batch);
+  }
+}
+
+void PowerLog::write(PowerLogStore& store, const std::vector<PowerLogEvent>& events) noexcept {
+  std::string error;
+  try {
+    error = store.append(events, _options.clock->now());
+  } catch (const std::exception& exception) {
+    error = exception.what();
+  }
+  if (!error.empty()) {
+    lost(events.size());
+    if (!_failing) VESK_LOG_ERROR("PowerLog: %s: %s; events are lost", _options.path.c_str(), error.c_str());
+  }
+  _failing = !error.empty();
+}
+
+}  // namespace vesk

@@ -1,0 +1,159 @@
+#include "platform/powerlog/PowerLogStore.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+
+#include <cstdio>
+#include <filesystem>
+#include <system_error>
+
+#include "platform/files/FileDescriptor.h"
+#include "platform/log/SystemLog.h"
+
+namespace vesk {
+
+namespace {
+
+// Long enough for another process's batch; nobody but the log's own thread waits.
+constexpr int kBusyMilliseconds = 5000;
+
+constexpr char kSetUp[] =
+    "PRAGMA journal_mode=WAL;"
+    "PRAGMA synchronous=NORMAL;"
+    "PRAGMA temp_store=MEMORY;"
+    "PRAGMA journal_size_limit=4194304;"
+    "CREATE TABLE IF NOT EXISTS events(id INTEGER PRIMARY KEY AUTOINCREMENT, identifier INTEGER NOT NULL,"
+    " name TEXT NOT NULL, time REAL NOT NULL, dictionary TEXT NOT NULL);"
+    "CREATE INDEX IF NOT EXISTS events_time ON events(time);";
+
+bool isDamage(int result) {
+  int primary = result & 0xff;
+  return primary == SQLITE_CORRUPT || primary == SQLITE_NOTADB;
+}
+
+int execute(sqlite3* database, const char* statements) {
+  return sqlite3_exec(database, statements, nullptr, nullptr, nullptr);
+}
+
+double secondsOf(WallTime time) { return std::chrono::duration<double>(time.time_since_epoch()).count(); }
+
+int bindText(sqlite3_stmt* statement, int index, const std::string& text) {
+  return sqlite3_bind_text64(statement, index, text.data(), text.size(), SQLITE_STATIC, SQLITE_UTF8);
+}
+
+}  // namespace
+
+std::string PowerLogStore::append(const std::vector<PowerLogEvent>& events, WallTime now) {
+  // Another process may have begun the file anew, or somebody removed it.
+  if (_database && !(fileAtPath() == _opened)) _database.reset();
+  int result = SQLITE_OK;
+  for (int attempt = 0; attempt < 2; ++attempt) {
+    result = _database ? SQLITE_OK : open();
+    if (result == SQLITE_OK) result = write(events, now);
+    if (result == SQLITE_OK) return {};
+    if (!isDamage(result)) break;
+    VESK_LOG_ERROR("PowerLog: %s is damaged (%s); it is kept as %s.corrupt", _path.c_str(),
+                   sqlite3_errstr(result), _path.c_str());
+    setAside();
+  }
+  // Whatever it is may be over when the file is opened the next time.
+  _database.reset();
+  return sqlite3_errstr(result);
+}
+
+int PowerLogStore::open() {
+  std::error_code ignored;
+  std::filesystem::create_directories(std::filesystem::path(_path).parent_path(), ignored);
+  sqlite3* database = nullptr;
+  int result = sqlite3_open_v2(_path.c_str(), &database,
+                               SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX, nullptr);
+  _database.reset(database);
+  _opened = fileAtPath();
+  if (result != SQLITE_OK) return result;
+  sqlite3_extended_result_codes(database, 1);
+  sqlite3_busy_timeout(database, kBusyMilliseconds);
+  result = execute(database, kSetUp);
+  if (result != SQLITE_OK) return result;
+  _opened = fileAtPath();
+  auto check = prepare(database, "PRAGMA quick_check(1)");
+  result = check ? sqlite3_step(check.get()) : sqlite3_errcode(database);
+  if (result != SQLITE_ROW) return result;
+  const auto* verdict = sqlite3_column_text(check.get(), 0);
+  return verdict && std::string(reinterpret_cast<const char*>(verdict)) == "ok" ? SQLITE_OK : SQLITE_CORRUPT;
+}
+
+int PowerLogStore::write(const std::vector<PowerLogEvent>& events, WallTime now) {
+  int result = execute(_database.get(), "BEGIN IMMEDIATE");
+  if (result == SQLITE_OK) result = insert(events);
+  if (result == SQLITE_OK) result = prune(now);
+  if (result == SQLITE_OK) result = execute(_database.get(), "COMMIT");
+  if (result != SQLITE_OK) execute(_database.get(), "ROLLBACK");
+  return result;
+}
+
+int PowerLogStore::insert(const std::vector<PowerLogEvent>& events) {
+  auto row = prepare(_database.get(),
+                     "INSERT INTO events(identifier, name, time, dictionary) VALUES(?1, ?2, ?3, ?4)");
+  if (!row) return sqlite3_extended_errcode(_database.get());
+  for (const PowerLogEvent& event : events) {
+    sqlite3_bind_int64(row.get(), 1, event.identifier);
+    bindText(row.get(), 2, event.name);
+    sqlite3_bind_double(row.get(), 3, secondsOf(event.time));
+    bindText(row.get(), 4, event.dictionary);
+    int result = sqlite3_step(row.get());
+    if (result != SQLITE_DONE) return result;
+    sqlite3_reset(row.get());
+  }
+  return SQLITE_OK;
+}
+
+int PowerLogStore::prune(WallTime now) {
+  auto oldest = prepare(_database.get(), "DELETE FROM events WHERE time < ?1");
+  if (!oldest) return sqlite3_extended_errcode(_database.get());
+  sqlite3_bind_double(oldest.get(), 1, secondsOf(now - _bounds.age));
+  int result = sqlite3_step(oldest.get());
+  if (result != SQLITE_DONE) return result;
+  result = remove("DELETE FROM events WHERE id <= (SELECT max(id) FROM events) - ?1", _bounds.rows);
+  if (result != SQLITE_OK) return result;
+  const std::int64_t used =
+      (pragma("PRAGMA page_count") - pragma("PRAGMA freelist_count")) * pragma("PRAGMA page_size");
+  if (used <= _bounds.bytes) return SQLITE_OK;
+  // Its pages are used again; a quarter at a time, so that this is seldom.
+  return remove("DELETE FROM events WHERE id <= (SELECT min(id) + (max(id) - min(id)) / ?1 FROM events)", 4);
+}
+
+int PowerLogStore::remove(const char* statement, std::int64_t bound) {
+  auto removal = prepare(_database.get(), statement);
+  if (!removal) return sqlite3_extended_errcode(_database.get());
+  sqlite3_bind_int64(removal.get(), 1, bound);
+  int result = sqlite3_step(removal.get());
+  return result == SQLITE_DONE ? SQLITE_OK : result;
+}
+
+std::int64_t PowerLogStore::pragma(const char* name) {
+  auto statement = prepare(_database.get(), name);
+  if (!statement || sqlite3_step(statement.get()) != SQLITE_ROW) return 0;
+  return sqlite3_column_int64(statement.get(), 0);
+}
+
+void PowerLogStore::setAside() {
+  _database.reset();
+  FileDescriptor lock(::open((_path + ".lock").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
+  if (lock) ::flock(lock.get(), LOCK_EX);
+  // Another process may have found the same damage first.
+  if (!(fileAtPath() == _opened)) return;
+  const std::string aside = _path + ".corrupt";
+  std::rename(_path.c_str(), aside.c_str());
+  ::unlink((_path + "-shm").c_str());
+  std::string log = _path + "-wal";
+  if (std::rename(log.c_str(), (aside + "-wal").c_str()) != 0) ::unlink((aside + "-wal").c_str());
+}
+
+PowerLogStore::Identity PowerLogStore::fileAtPath() const {
+  struct stat status {};
+  if (::stat(_path.c_str(), &status) != 0) return {};
+  return {status.st_dev, status.st_ino};
+}
+
+}  // namespace vesk

@@ -1,0 +1,56 @@
+// The file of the power log, to be written.
+#pragma once
+
+#include <sys/types.h>
+
+#include <chrono>
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "platform/powerlog/PowerLogEvent.h"
+#include "platform/powerlog/SQLiteHandles.h"
+
+namespace vesk {
+
+/// An SQLite database (WAL) with one row an event. Several processes may write to it at the same time. One
+/// that is found damaged is moved to "….corrupt" (in place of an earlier one) and begun anew. Used by one
+/// thread; may wait for a disk and for other processes.
+class PowerLogStore {
+ public:
+  struct Bounds {
+    std::chrono::seconds age = std::chrono::days(7);
+    std::int64_t rows = 100'000;
+    std::int64_t bytes = std::int64_t{64} << 20;  ///< of the database, roughly
+  };
+
+  PowerLogStore(std::string path, const Bounds& bounds) : _path(std::move(path)), _bounds(bounds) {}
+
+  /// Adds all events or none, and drops what is beyond the bounds. What went wrong comes back as text; empty:
+  /// nothing did.
+  [[nodiscard]] std::string append(const std::vector<PowerLogEvent>& events, WallTime now);
+
+ private:
+  /// Which file a path names.
+  struct Identity {
+    dev_t device = 0;
+    ino_t inode = 0;
+    friend bool operator==(const Identity&, const Identity&) = default;
+  };
+
+  int open();
+  int write(const std::vector<PowerLogEvent>& events, WallTime now);
+  int insert(const std::vector<PowerLogEvent>& events);
+  int prune(WallTime now);
+  int remove(const char* statement, std::int64_t bound);
+  std::int64_t pragma(const char* name);
+  void setAside();
+  Identity fileAtPath() const;
+
+  const std::string _path;
+  const Bounds _bounds;
+  SQLiteDatabase _database;
+  Identity _opened;
+};
+
+}  // namespace vesk
