@@ -8,12 +8,15 @@
 #include <optional>
 #include <string>
 
+#include "backends/UploadGate.h"
 #include "platform/http/HTTPClient.h"
 #include "platform/queue/TimedQueue.h"
 #include "platform/time/Clock.h"
 #include "util/Counters.h"
 
 namespace vesk {
+
+class PowerLog;
 
 /// Built once, in daemon/main.cpp; everything in it outlives every backend.
 struct BackendServices {
@@ -29,6 +32,10 @@ struct BackendServices {
   std::function<bool()> diagnosticsSubmissionConsent;
   /// The two-letter country code of the current locale, when it has one.
   std::function<std::optional<std::string>()> regionCode;
+  /// What keeps uploads in bounds; closed when the daemon stops.
+  std::shared_ptr<UploadGate> uploads = std::make_shared<UploadGate>();
+  /// Where power-log backends record; without one they record nothing.
+  std::shared_ptr<PowerLog> powerLog = nullptr;
 };
 
 /// Bytes of events that all backends of one session hold; shared by them.

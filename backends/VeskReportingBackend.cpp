@@ -6,6 +6,9 @@
 
 #include "backends/DashboardBackend.h"
 #include "backends/HTTPSPostBackend.h"
+#include "backends/KilnarBackend.h"
+#include "backends/UploadBackend.h"
+#include "backends/WrenBackend.h"
 #include "platform/crypto/Digest.h"
 #include "platform/log/SystemLog.h"
 #include "util/ReportingdUtil.h"
@@ -28,13 +31,21 @@ std::uint8_t versionPiece(std::string_view piece) {
 
 std::shared_ptr<VeskReportingBackend> VeskReportingBackend::newBackendWithName(
     const std::string& name, const std::optional<Dictionary>& profile,
-    const std::optional<Text>& productFamily, [[maybe_unused]] std::int32_t clientType,
-    const BackendServices& services) {
+    const std::optional<Text>& productFamily, std::int32_t clientType, const BackendServices& services) {
   if (name == kVeskReportingBackendDashboard) {
     return DashboardBackend::create(name, profile, productFamily, services);
   }
+  if (name == kVeskReportingBackendUploadServer) {
+    return UploadBackend::create(name, profile, productFamily, services);
+  }
   if (name == kVeskReportingBackendHTTPPost || name == kVeskReportingBackendHTTPPost2) {
     return HTTPSPostBackend::create(name, profile, productFamily, services);
+  }
+  if (name == kVeskReportingBackendKilnar) {
+    return KilnarBackend::create(name, profile, productFamily, services);
+  }
+  if (name == kVeskReportingBackendWren && deviceProductType() != Text::literal("Bramble")) {
+    return WrenBackend::create(name, profile, productFamily, clientType, services);
   }
   VESK_LOG_ERROR("VeskReportingBackend(newBackendWithName): %s", name.c_str());
   return nullptr;

@@ -1,6 +1,7 @@
 #include "daemon/Daemon.h"
 
 #include <VeskReporting/VeskReporting.h>
+#include <VeskReporting/VeskReportingKeys.h>
 
 #include <algorithm>
 #include <chrono>
@@ -14,6 +15,7 @@
 #include "platform/http/HTTPClient.h"
 #include "platform/ipc/IPCListener.h"
 #include "platform/log/SystemLog.h"
+#include "platform/powerlog/PowerLog.h"
 #include "platform/queue/TimedQueuePool.h"
 
 namespace vesk {
@@ -34,6 +36,15 @@ HTTPClient::Options httpOptions() {
   return options;
 }
 
+PowerLog::Options powerLogOptions() {
+  PowerLog::Options options;
+  options.path = pathUnderRoot(kPowerLogPath);
+  options.onLost = [](std::uint64_t events) {
+    Counters::shared().count(kVeskReportingBackendKilnar, DropReason::NotRecorded, events);
+  };
+  return options;
+}
+
 }  // namespace
 
 struct Daemon::Parts {
@@ -46,7 +57,9 @@ struct Daemon::Parts {
                           return VeskReporting::getPersistentIdentifierForDNU(respectsConsent);
                         },
                         diagnosticsSubmissionConsent,
-                        regionCode},
+                        regionCode,
+                        std::make_shared<UploadGate>(),
+                        std::make_shared<PowerLog>(powerLogOptions())},
         sessionServices{backendServices, clientLibraryVersion()},
         http(httpOptions()),
         agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetch(), busyMarker)),
@@ -82,6 +95,8 @@ void Daemon::resume() { _parts->listener.resume(); }
 
 void Daemon::stop() {
   if (std::exchange(_stopped, true)) return;
+  // A server that does not answer must not hold up the threads of connections that upload to it.
+  _parts->backendServices.uploads->close();
   _parts->listener.stop();
   const auto begun = std::chrono::steady_clock::now();
   if (!_parts->http.waitUntilIdle(kPostWait)) {

@@ -154,9 +154,10 @@ TEST(IPCConnection, KeepsADescriptorUnderATokenThatIsGoodOnce) {
   EXPECT_EQ(first.size(), 32u);
   EXPECT_NE(first, second);
 
-  FileDescriptor consumed = ExtensionTokens::shared().consume(first);
+  ExtensionHandle consumed = ExtensionTokens::shared().consume(first);
   ASSERT_TRUE(consumed);
-  EXPECT_EQ(::write(consumed.get(), "x", 1), 1);
+  EXPECT_EQ(consumed.user, ::getuid());
+  EXPECT_EQ(::write(consumed.descriptor.get(), "x", 1), 1);
   char byte = 0;
   EXPECT_EQ(::read(readEnd.get(), &byte, 1), 1);
   EXPECT_FALSE(ExtensionTokens::shared().consume(first));

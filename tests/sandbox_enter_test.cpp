@@ -120,6 +120,7 @@ TEST_F(SandboxTest, DeniesWhatIsNotGranted) {
   pid_t parent = ::getpid();
   const std::string proc = "/proc/" + std::to_string(parent);
   const fs::path outside = root / "outside" / "file";
+  const fs::path waiting = directory.write("var/spool/veskreporting/file", "to be uploaded");
   char word[8] = {};
   iovec local{word, sizeof word};
   char noArgument[] = "true";
@@ -136,6 +137,9 @@ TEST_F(SandboxTest, DeniesWhatIsNotGranted) {
       {"truncate a file by reading", [&] { return opens(profilePath(), O_RDONLY | O_TRUNC); }},
       {"move a file in",
        [&] { return ::rename(outside.c_str(), (root / "var/lib/veskreportingd/file").c_str()); }},
+      {"read a file to be uploaded", [&] { return opens(waiting, O_RDONLY); }},
+      {"write a file to be uploaded", [&] { return opens(waiting, O_WRONLY); }},
+      {"put a file with those", [&] { return opens(waiting.parent_path() / "new", O_WRONLY | O_CREAT); }},
       {"remove another file", [&] { return ::unlink(outside.c_str()); }},
       {"own another file", [&] { return ::chown(outside.c_str(), 1, 1); }},
       {"bind a socket elsewhere", [&] { return socketBoundTo(root / "outside" / "socket").get(); }},
@@ -179,6 +183,7 @@ TEST_F(SandboxTest, AllowsWhatTheDaemonDoes) {
   const fs::path state = root / "var/lib/veskreportingd";
   const fs::path logs = root / "var/mobile/Library/Logs/Dunmore";
   const fs::path socketPath = root / "run/veskreportingd/socket";
+  const fs::path waiting = directory.write("var/spool/veskreporting/file", "uploaded");
   const std::vector<Probe> probes = {
       {"read the profile", [&] { return opens(profilePath(), O_RDONLY); }},
       {"read settings", [&] { return opens(settings, O_RDONLY); }},
@@ -195,6 +200,7 @@ TEST_F(SandboxTest, AllowsWhatTheDaemonDoes) {
       {"write the log", [&] { return opens(logs / "Retired" / "log", O_WRONLY | O_CREAT | O_APPEND); }},
       {"listen", [&] { return ::listen(socketBoundTo(socketPath).get(), 1); }},
       {"open the socket to all", [&] { return ::chmod(socketPath.c_str(), 0666); }},
+      {"remove an uploaded file", [&] { return ::unlink(waiting.c_str()); }},
       {"remove the socket", [&] { return ::unlink(socketPath.c_str()); }},
       {"look a name up",
        [] {

@@ -37,6 +37,10 @@ std::string_view nameOfDropReason(DropReason reason) noexcept {
       return "unacknowledged";
     case DropReason::NotAggregated:
       return "not-aggregated";
+    case DropReason::NotRecorded:
+      return "not-recorded";
+    case DropReason::AdaptorFailed:
+      return "adaptor-failed";
   }
   return "unknown";
 }

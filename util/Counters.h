@@ -27,8 +27,10 @@ enum class DropReason : std::uint8_t {
   NeverEnabled,    ///< still held when the session ended: reporting had never been enabled
   Unacknowledged,  ///< a datagram that was not sent whole or never acknowledged, and given up
   NotAggregated,   ///< the aggregating client did not take its copy: it does not read, or has gone
+  NotRecorded,     ///< a local record could not be written
+  AdaptorFailed,   ///< an adaptor was missing or did not take it
 };
-inline constexpr std::size_t kDropReasonCount = 12;
+inline constexpr std::size_t kDropReasonCount = 14;
 
 /// A word for it, for tools and logs: "state-disabled".
 std::string_view nameOfDropReason(DropReason reason) noexcept;

@@ -120,25 +120,27 @@ uInt limitedSize(std::size_t size) {
 }
 
 /// Z_STREAM_END with the stream in `out`, or what went wrong.
-int deflateWhole(z_stream& stream, std::string_view data, std::string& out) {
+int deflateWhole(z_stream& stream, std::string_view data, CompressedBytes& out) {
   if (data.size() > std::numeric_limits<uInt>::max()) return Z_BUF_ERROR;
   // zlib does not write through this pointer; its interface lacks the const.
   stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(data.data()));
   stream.avail_in = static_cast<uInt>(data.size());
-  out.resize(deflateBound(&stream, static_cast<uLong>(data.size())));
+  const std::size_t bound = deflateBound(&stream, static_cast<uLong>(data.size()));
+  // Not filled with zeros: pages that the stream does not reach cost nothing.
+  out.bytes.reset(new char[bound]);
   int result = Z_OK;
   while (result == Z_OK) {
-    stream.next_out = reinterpret_cast<Bytef*>(out.data()) + stream.total_out;
-    stream.avail_out = limitedSize(out.size() - stream.total_out);
+    stream.next_out = reinterpret_cast<Bytef*>(out.bytes.get()) + stream.total_out;
+    stream.avail_out = limitedSize(bound - stream.total_out);
     result = deflate(&stream, Z_FINISH);
   }
-  out.resize(stream.total_out);
+  out.size = stream.total_out;
   return result;
 }
 
 }  // namespace
 
-std::optional<std::string> compressDataWithZlibOrGzip(bool useGzip, std::string_view data) {
+std::optional<CompressedBytes> compressToBuffer(bool useGzip, std::string_view data) {
   if (data.empty()) {
     VESK_LOG_ERROR("compressDataWithZlibOrGzip: Cannot compress empty ByteBlob");
     return std::nullopt;
@@ -149,7 +151,7 @@ std::optional<std::string> compressDataWithZlibOrGzip(bool useGzip, std::string_
                    textForInitialisation(deflater->initialisation()), messageOf(deflater->stream()));
     return std::nullopt;
   }
-  std::string out;
+  CompressedBytes out;
   int result = Z_MEM_ERROR;
   try {
     result = deflateWhole(deflater->stream(), data, out);
@@ -164,8 +166,14 @@ std::optional<std::string> compressDataWithZlibOrGzip(bool useGzip, std::string_
   }
   poolFor(useGzip).giveBack(std::move(deflater));
   VESK_LOG_DEBUG("compressDataWithZlibOrGzip: Compressed file from %u to %u",
-                 static_cast<unsigned>(data.size()), static_cast<unsigned>(out.size()));
+                 static_cast<unsigned>(data.size()), static_cast<unsigned>(out.size));
   return out;
+}
+
+std::optional<std::string> compressDataWithZlibOrGzip(bool useGzip, std::string_view data) {
+  auto compressed = compressToBuffer(useGzip, data);
+  if (!compressed) return std::nullopt;
+  return std::string(compressed->bytes.get(), compressed->size);
 }
 
 std::optional<std::string> gzipDeflate(std::string_view data) {

@@ -104,7 +104,7 @@ class BusClient::Implementation {
 BusClient::Implementation::Implementation(Options options)
     : _objectPath(std::move(options.objectPath)),
       _replies(std::make_shared<BusReplies>(nullptr)),
-      _router(_objectPath, "client", _replies, 0),
+      _router(_objectPath, "client", _replies, {}),
       _outbox(_objectPath) {
   FileDescriptor socket =
       options.connected ? std::move(options.connected) : connectUnixSocket(options.socketPath);

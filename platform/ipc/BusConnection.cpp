@@ -30,7 +30,8 @@ BusConnection::BusConnection(FileDescriptor socket, const IPCPeer& peer, const C
       _replies(std::make_shared<BusReplies>([wakeup = _wakeup] { wakeup->signal(); })),
       _outbox(settings.maximumOutbox),
       _socket(std::move(socket)),
-      _router(settings.objectPath, _name, _replies, _serial, {.content = settings.maximumMessage}) {}
+      _router(settings.objectPath, _name, _replies, {_serial, _peer.user},
+              {.content = settings.maximumMessage}) {}
 
 BusConnection::~BusConnection() { close(); }
 

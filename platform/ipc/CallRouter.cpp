@@ -35,7 +35,7 @@ std::string_view childTowards(std::string_view path, std::string_view target) {
 }  // namespace
 
 CallRouter::CallRouter(std::string objectPath, std::string connectionName,
-                       std::shared_ptr<BusReplies> replies, std::uint64_t owner, CodecLimits limits)
+                       std::shared_ptr<BusReplies> replies, const ExtensionOwner& owner, CodecLimits limits)
     : _objectPath(std::move(objectPath)),
       _connectionName(std::move(connectionName)),
       _replies(std::move(replies)),

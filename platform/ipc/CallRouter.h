@@ -9,6 +9,7 @@
 #include "platform/ipc/BusCodec.h"
 #include "platform/ipc/BusHandles.h"
 #include "platform/ipc/BusReplies.h"
+#include "platform/ipc/ExtensionTokens.h"
 #include "platform/ipc/IPCConnection.h"
 #include "platform/ipc/OneWayDecoder.h"
 #include "platform/ipc/WarningBurst.h"
@@ -21,7 +22,7 @@ class CallRouter {
  public:
   /// `owner`: as IPCIncomingCall's. `limits`: of the arguments of one call.
   CallRouter(std::string objectPath, std::string connectionName, std::shared_ptr<BusReplies> replies,
-             std::uint64_t owner, CodecLimits limits = {});
+             const ExtensionOwner& owner, CodecLimits limits = {});
 
   void setExportedObject(std::shared_ptr<IPCExportedObject> object) { _object = std::move(object); }
   /// No call reaches the object any more; the caller lets go of it.
@@ -41,7 +42,7 @@ class CallRouter {
   const std::string _objectPath;
   const std::string _connectionName;
   const std::shared_ptr<BusReplies> _replies;
-  const std::uint64_t _owner;
+  const ExtensionOwner _owner;
   const CodecLimits _limits;
   OneWayDecoder _decoder;
   std::shared_ptr<IPCExportedObject> _object;

@@ -33,11 +33,11 @@ ExtensionTokens& ExtensionTokens::shared() {
   return tokens;
 }
 
-std::string ExtensionTokens::add(std::uint64_t owner, FileDescriptor descriptor) {
+std::string ExtensionTokens::add(const ExtensionOwner& owner, FileDescriptor descriptor) {
   std::string token = freshToken();
   FileDescriptor displaced;
   MutexLock lock(_mutex);
-  auto isOwners = [owner](const Entry& entry) { return entry.owner == owner; };
+  auto isOwners = [&owner](const Entry& entry) { return entry.owner.connection == owner.connection; };
   if (std::count_if(_entries.begin(), _entries.end(), isOwners) >= std::ptrdiff_t{kMaximumPerOwner}) {
     auto oldest = std::find_if(_entries.begin(), _entries.end(), isOwners);
     displaced = std::move(oldest->descriptor);
@@ -47,21 +47,21 @@ std::string ExtensionTokens::add(std::uint64_t owner, FileDescriptor descriptor)
   return token;
 }
 
-FileDescriptor ExtensionTokens::consume(std::string_view token) {
+ExtensionHandle ExtensionTokens::consume(std::string_view token) {
   MutexLock lock(_mutex);
   auto entry =
       std::find_if(_entries.begin(), _entries.end(), [&](const Entry& e) { return e.token == token; });
   if (entry == _entries.end()) return {};
-  FileDescriptor descriptor = std::move(entry->descriptor);
+  ExtensionHandle handle{std::move(entry->descriptor), entry->owner.user};
   _entries.erase(entry);
-  return descriptor;
+  return handle;
 }
 
-void ExtensionTokens::drop(std::uint64_t owner) {
+void ExtensionTokens::drop(std::uint64_t connection) {
   std::vector<Entry> dropped;  // closed after the lock: closing may wait for a file system
   MutexLock lock(_mutex);
   for (auto entry = _entries.begin(); entry != _entries.end();) {
-    if (entry->owner == owner) {
+    if (entry->owner.connection == connection) {
       dropped.push_back(std::move(*entry));
       entry = _entries.erase(entry);
     } else {

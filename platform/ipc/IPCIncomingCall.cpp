@@ -3,13 +3,12 @@
 #include <fcntl.h>
 
 #include "platform/ipc/BusReplies.h"
-#include "platform/ipc/ExtensionTokens.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
 
 IPCIncomingCall::IPCIncomingCall(sd_bus_message* message, const std::shared_ptr<BusReplies>& replies,
-                                 std::uint64_t owner, const CodecLimits& limits)
+                                 const ExtensionOwner& owner, const CodecLimits& limits)
     : _message(message),
       _replies(replies),
       _owner(owner),
@@ -22,7 +21,7 @@ IPCIncomingCall::IPCIncomingCall(OneWayCall& call, const std::shared_ptr<BusRepl
     : _message(nullptr),
       _oneWay(&call),
       _replies(replies),
-      _owner(0),
+      _owner{},
       _limits(limits),
       _member(call.member),
       _expectsReply(false) {}

@@ -10,6 +10,7 @@
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/ipc/BusCodec.h"
+#include "platform/ipc/ExtensionTokens.h"
 #include "platform/ipc/IPCConnection.h"
 #include "platform/ipc/OneWayDecoder.h"
 #include "platform/ipc/Reply.h"
@@ -24,8 +25,8 @@ class BusReplies;
 class IPCIncomingCall {
  public:
   /// `owner`: whose the descriptors are that `grant` keeps.
-  IPCIncomingCall(sd_bus_message* message, const std::shared_ptr<BusReplies>& replies, std::uint64_t owner,
-                  const CodecLimits& limits);
+  IPCIncomingCall(sd_bus_message* message, const std::shared_ptr<BusReplies>& replies,
+                  const ExtensionOwner& owner, const CodecLimits& limits);
 
   /// A one-way call that was read already. Its arguments are moved out by `read`.
   IPCIncomingCall(OneWayCall& call, const std::shared_ptr<BusReplies>& replies, const CodecLimits& limits);
@@ -104,7 +105,7 @@ class IPCIncomingCall {
   sd_bus_message* const _message;  // null for a one-way call that was read already
   OneWayCall* const _oneWay = nullptr;
   const std::shared_ptr<BusReplies>& _replies;
-  const std::uint64_t _owner;
+  const ExtensionOwner _owner;
   const CodecLimits& _limits;
   const std::string_view _member;
   const bool _expectsReply;

@@ -35,6 +35,8 @@ std::uint64_t rights(SandboxPath::Access access) {
       return kWriteRights;
     case SandboxPath::Access::Sockets:
       return kWriteRights | LANDLOCK_ACCESS_FS_MAKE_SOCK;
+    case SandboxPath::Access::Remove:
+      return LANDLOCK_ACCESS_FS_REMOVE_FILE;
   }
   return 0;
 }

@@ -24,6 +24,7 @@ constexpr PathKey kPathKeys[] = {
     {"read-if-present", SandboxPath::Access::Read, true},
     {"write", SandboxPath::Access::Write, false},
     {"sockets", SandboxPath::Access::Sockets, false},
+    {"remove-if-present", SandboxPath::Access::Remove, true},
 };
 
 /// Thrown inside this file only.
@@ -136,7 +137,7 @@ SandboxProfileOutcome parseSandboxProfile(std::string_view toml) {
 
 std::optional<std::string> makeDirectories(const std::vector<SandboxPath>& paths) {
   for (const SandboxPath& path : paths) {
-    if (path.access == SandboxPath::Access::Read) continue;
+    if (path.access == SandboxPath::Access::Read || path.optional) continue;
     std::error_code error;
     if (fs::exists(path.path, error)) continue;
     fs::create_directories(path.path, error);

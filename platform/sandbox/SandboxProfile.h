@@ -14,6 +14,7 @@ struct SandboxPath {
     Read,
     Write,    ///< read, write, create, rename and remove files and directories
     Sockets,  ///< as `Write`, and Unix sockets may be bound there
+    Remove    ///< remove files, nothing else
   };
   std::string path;  ///< absolute, root prefix included
   Access access = Access::Read;
@@ -41,6 +42,7 @@ struct SandboxProfileOutcome {
 ///     read-if-present = […]
 ///     write = […]                     # a directory that is missing is made (0750)
 ///     sockets = […]                   # likewise (0755: clients must get at the socket)
+///     remove-if-present = […]         # files below may be removed, neither read nor written
 ///     [root]                          # the same keys, for paths under the root prefix
 ///     [calls]
 ///     deny = […]

@@ -194,9 +194,11 @@ std::shared_ptr<RecordingSession> TestService::session(std::size_t index) {
 
 // --- TestClient
 
-TestClient::TestClient(const TestService& service) {
+TestClient::TestClient(const TestService& service) : TestClient(service.path()) {}
+
+TestClient::TestClient(const std::string& socketPath) {
   BusClient::Options options;
-  options.socketPath = service.path();
+  options.socketPath = socketPath;
   options.objectPath = wire::kObjectPath;
   _bus = std::make_unique<BusClient>(std::move(options));
   _bus->setExportedObject(_self);

@@ -102,6 +102,7 @@ class TestService : public IPCListenerDelegate {
 class TestClient : public IPCExportedObject {
  public:
   explicit TestClient(const TestService& service);
+  explicit TestClient(const std::string& socketPath);
 
   const char* interfaceName() const override { return wire::kReplyInterface; }
   void handle(IPCIncomingCall& call) override;

@@ -59,9 +59,9 @@ class RecordingSession final : public ClientSessionInterface {
   }
   void uploadFileAtPath(const std::string& fileURL, const std::string& extensionToken,
                         Reply<bool> reply) override {
-    FileDescriptor file = ExtensionTokens::shared().consume(extensionToken);
+    ExtensionHandle file = ExtensionTokens::shared().consume(extensionToken);
     char buffer[256];
-    ssize_t size = ::read(file.get(), buffer, sizeof buffer);
+    ssize_t size = ::read(file.descriptor.get(), buffer, sizeof buffer);
     _record.add("uploadFile " + fileURL + " " +
                 std::string(buffer, size > 0 ? static_cast<std::size_t>(size) : 0));
     answer(std::move(reply), true);

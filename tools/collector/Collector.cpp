@@ -7,6 +7,7 @@
 #include "tools/collector/EventsEndpoint.h"
 #include "tools/collector/LogDataEndpoint.h"
 #include "tools/collector/StorebagEndpoint.h"
+#include "tools/collector/UploadsEndpoint.h"
 
 namespace vesk {
 
@@ -17,6 +18,7 @@ constexpr char kGeneralStorebagsPath[] = "/bags";
 constexpr char kPartnersStorebagsPath[] = "/storebags";
 constexpr char kStorebagBase[] = "/bags/sorrel";
 constexpr char kLogDataPath[] = "/logdata";
+constexpr char kUploadsPath[] = "/uploads";
 constexpr char kControlPath[] = "/_control";
 
 CollectorOptions completed(CollectorOptions options) {
@@ -24,8 +26,10 @@ CollectorOptions completed(CollectorOptions options) {
   options.directory = fs::absolute(options.directory);
   if (options.storebags.empty()) options.storebags = options.directory / "storebags";
   if (options.events.empty()) options.events = options.directory / "events.jsonl";
+  if (options.uploads.empty()) options.uploads = options.directory / "uploads";
   options.storebags = fs::absolute(options.storebags);
   options.events = fs::absolute(options.events);
+  options.uploads = fs::absolute(options.uploads);
   fs::create_directories(options.directory);
   fs::create_directories(options.storebags);
   fs::create_directories(options.events.parent_path());
@@ -42,6 +46,7 @@ struct Collector::Parts {
         key(SigningKey::openOrCreate(options.directory)),
         folder(options.storebags, options.checks),
         events({console, stats, faults}, options.events),
+        uploads({console, stats, faults}, options.uploads, options.uploadAnswer),
         storebags({console, stats, faults, folder, key}, options.maximumAge),
         logData(console, stats, options.directory / "logdata"),
         control(console, stats, faults),
@@ -53,6 +58,7 @@ struct Collector::Parts {
     for (EndpointTable* paths : {&securePaths, &plainPaths}) {
       paths->add(kEventsPath, events);
       paths->add(kLogDataPath, logData);
+      paths->add(kUploadsPath, uploads);
       paths->add(kGeneralStorebagsPath, storebags);
       paths->add(kPartnersStorebagsPath, storebags);
     }
@@ -73,6 +79,7 @@ struct Collector::Parts {
     server.address = options.address;
     server.port = port;
     server.tls = std::move(identity);
+    server.maximumBody = UploadsEndpoint::kMaximumBody;
     server.onRefused = [this](const std::string& line) {
       ++stats.notHTTP;
       console.problem("refused " + line);
@@ -89,6 +96,7 @@ struct Collector::Parts {
   const SigningKey key;
   StorebagFolder folder;
   EventsEndpoint events;
+  UploadsEndpoint uploads;
   StorebagEndpoint storebags;
   LogDataEndpoint logData;
   ControlEndpoint control;
@@ -116,6 +124,7 @@ Dictionary Collector::facts() const {
       {"udpPort", static_cast<int>(_parts->datagrams ? _parts->datagrams->port() : 0)},
       {"eventsURL", https + kEventsPath},
       {"logDataURL", https + kLogDataPath},
+      {"uploadsURL", https + kUploadsPath},
       {"storebagURL", https + kStorebagBase},
       {"controlURL", http + kControlPath},
       {"authorityFile", CertificateAuthority::certificateFile(directory).string()},
@@ -124,6 +133,7 @@ Dictionary Collector::facts() const {
       {"storebags", _parts->options.storebags.string()},
       {"events", _parts->options.events.string()},
       {"datagrams", (directory / "datagrams.jsonl").string()},
+      {"uploads", _parts->options.uploads.string()},
   };
 }
 
@@ -132,7 +142,8 @@ std::string Collector::introduction() const {
   auto fact = [&](const char* key) { return all.text(key)->string(); };
   std::string http = _parts->plain->baseURL();
   return "veskcollector takes events at " + fact("eventsURL") + " and " + http + kEventsPath +
-         "\n  and saves them to " + fact("events") + "\nIt serves storebags at " + fact("storebagURL") +
+         "\n  and saves them to " + fact("events") + "\nIt takes files at " + fact("uploadsURL") +
+         " and saves them in " + fact("uploads") + "\nIt serves storebags at " + fact("storebagURL") +
          " and " + http + kStorebagBase + "\n  from NAME.toml and NAME.json in " + fact("storebags") +
          (_parts->datagrams ? "\nIt takes dashboards' datagrams on UDP port " +
                                   std::to_string(_parts->datagrams->port()) + "\n  and saves them to " +

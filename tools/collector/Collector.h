@@ -23,8 +23,10 @@ struct CollectorOptions {
   std::uint16_t httpPort = 8080;   ///< 0: any free one
   std::uint16_t udpPort = 9053;    ///< 0: any free one
   DatagramLoss datagramLoss{};
-  std::filesystem::path storebags;  ///< empty: "storebags" in `directory`
-  std::filesystem::path events;     ///< empty: "events.jsonl" in `directory`
+  std::filesystem::path storebags;                       ///< empty: "storebags" in `directory`
+  std::filesystem::path events;                          ///< empty: "events.jsonl" in `directory`
+  std::filesystem::path uploads{};                       ///< empty: "uploads" in `directory`
+  std::string uploadAnswer = R"({"result":"success"})";  ///< to every file that is taken
   std::optional<std::chrono::seconds> maximumAge{};
   std::vector<std::string> names{};   ///< further names and addresses for the certificate
   std::vector<std::string> faults{};  ///< as for FaultPlan::add

@@ -22,6 +22,7 @@ struct CollectorStats {
   Counter acknowledgements = 0;      ///< sent
   Counter acknowledgementsLost = 0;  ///< on demand
   Counter logData = 0;               ///< uploads of log data
+  Counter uploads = 0;               ///< files taken
   Counter refused = 0;               ///< requests that were not the protocol
   Counter notHTTP = 0;               ///< connections that did not get as far as a request
   Counter faults = 0;                ///< faults on demand

@@ -59,6 +59,7 @@ HTTPAnswer ControlEndpoint::counters() const {
                                {"acknowledgements", _stats.acknowledgements.load()},
                                {"acknowledgementsLost", _stats.acknowledgementsLost.load()},
                                {"logData", _stats.logData.load()},
+                               {"uploads", _stats.uploads.load()},
                                {"refused", _stats.refused.load()},
                                {"notHTTP", _stats.notHTTP.load()},
                                {"faults", _stats.faults.load()}});

@@ -13,7 +13,7 @@
 
 namespace vesk {
 
-enum class FaultTarget : unsigned char { Post, Storebag };
+enum class FaultTarget : unsigned char { Post, Storebag, Upload };
 
 struct CollectorFault {
   enum class Kind : unsigned char {
@@ -35,10 +35,10 @@ struct CollectorFault {
 /// The faults still to come, per target in the order in which they were added. Thread-safe.
 class FaultPlan {
  public:
-  /// Adds one fault written as "target=fault" or "target=fault*times", where target is "post" or "storebag"
-  /// and fault a status ("503", "answer=503") or one of the names that `faultNames` lists. Without "*times"
-  /// it stays until another is added; "target=none" forgets that target's. What is wrong with the text comes
-  /// back.
+  /// Adds one fault written as "target=fault" or "target=fault*times", where target is "post", "storebag" or
+  /// "upload" and fault a status ("503", "answer=503") or one of the names that `faultNames` lists. Without
+  /// "*times" it stays until another is added; "target=none" forgets that target's. What is wrong with the
+  /// text comes back.
   [[nodiscard]] std::optional<std::string> add(std::string_view text);
   void clear();
 
@@ -59,7 +59,7 @@ class FaultPlan {
   };
 
   mutable Mutex _mutex;
-  std::array<std::deque<Planned>, 2> _planned VESK_GUARDED_BY(_mutex);
+  std::array<std::deque<Planned>, 3> _planned VESK_GUARDED_BY(_mutex);
 };
 
 }  // namespace vesk

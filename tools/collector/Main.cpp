@@ -79,14 +79,17 @@ void define(CLI::App& app, Arguments& arguments) {
   app.add_option("--seed", arguments.lossSeed, "Decides which of them are lost")->capture_default_str();
   app.add_option("--storebags", collector.storebags, "Folder of NAME.toml and NAME.json")->type_name("DIR");
   app.add_option("--events", collector.events, "Append events to this file of JSON lines")->type_name("FILE");
+  app.add_option("--uploads", collector.uploads, "Save uploaded files in this folder")->type_name("DIR");
+  app.add_option("--upload-answer", collector.uploadAnswer, "Answer this to every uploaded file")
+      ->capture_default_str();
   app.add_option("--max-age", arguments.maximumAge, "Send storebags with this Cache-Control max-age")
       ->type_name("SECONDS");
   app.add_flag("--lenient", arguments.lenient, "Serve storebags with values of a wrong type too");
   app.add_flag("--json", arguments.json, "Write one JSON line an event, with its headers");
-  app.add_option(
-         "--fault", collector.faults,
-         "Answer badly: post=FAULT or storebag=FAULT, with *N for N times only (repeatable); FAULT is " +
-             FaultPlan::faultNames())
+  app.add_option("--fault", collector.faults,
+                 "Answer badly: post=FAULT, storebag=FAULT or upload=FAULT, with *N for N times only "
+                 "(repeatable); FAULT is " +
+                     FaultPlan::faultNames())
       ->type_name("FAULT");
   app.add_option("--ready-file", arguments.readyFile, "Write ports and paths here as JSON once listening")
       ->type_name("FILE");

@@ -9,6 +9,7 @@ namespace vesk {
 namespace {
 
 constexpr double kLongestTimeout = 86'400;
+constexpr double kUploadTimeout = 600;  // a file may be large and the line thin
 
 class Reader {
  public:
@@ -19,6 +20,7 @@ class Reader {
     addSessionCommands();
     addMessageCommands();
     addUploadCommands();
+    addPowerLogCommand();
     addStorebagCommands();
   }
 
@@ -109,10 +111,25 @@ class Reader {
     UploadArguments& upload = _invocation.upload;
     CLI::App* file = addClient("upload-file", "Upload a file", Command::UploadFile);
     file->add_option("path", upload.path, "The file")->required();
+    CLI::Option* timeout = file->get_option("--timeout")->default_str("600");
+    file->callback([this, timeout] {
+      _invocation.command = Command::UploadFile;
+      if (timeout->empty()) _timeout = kUploadTimeout;
+    });
     CLI::App* log = addClient("upload-log", "Upload log data", Command::UploadLog);
     auto* texts = log->add_option("text", upload.logData, "Entries of the log data");
     log->add_flag("--stdin", upload.fromStandardInput, "Take a JSON value from each line of standard input")
         ->excludes(texts);
+  }
+
+  void addPowerLogCommand() {
+    CLI::App* log =
+        add(_app, "power-log", "Show what was recorded in the device's power log", Command::PowerLog);
+    log->add_option("--root", _invocation.identity.root,
+                    "Directory that stands for / (default: $VESKREPORTINGD_ROOT)");
+    log->add_option("--since", _invocation.powerLog.since,
+                    "Only from then on: an age (30s, 15m, 2h, 7d) or a UTC time (2026-11-24T18:30:00Z)")
+        ->type_name("WHEN");
   }
 
   void addStorebagCommands() {

@@ -39,6 +39,10 @@ struct UploadArguments {
   bool fromStandardInput = false;    ///< one JSON value a line
 };
 
+struct PowerLogArguments {
+  std::string since;  ///< "90m" ago, or a time; empty: from the beginning
+};
+
 struct StorebagArguments {
   std::string directory = ".";  ///< of a new key pair
   std::string privateKey;
@@ -57,6 +61,7 @@ enum class Command {
   UploadFile,
   UploadLog,
   Aggregate,
+  PowerLog,
   StorebagKeygen,
   StorebagSign,
   StorebagVerify,
@@ -69,6 +74,7 @@ struct Invocation {
   ClientIdentity identity;
   MessageArguments message;
   UploadArguments upload;
+  PowerLogArguments powerLog;
   StorebagArguments storebag;
   std::uint64_t aggregateCount = 0;  ///< messages to wait for; 0: no end
 };

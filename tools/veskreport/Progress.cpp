@@ -13,6 +13,7 @@ namespace {
 
 constexpr std::chrono::milliseconds kInterval{100};
 constexpr std::uint64_t kWidth = 30;
+constexpr std::uint64_t kBlock = 6;
 
 std::uint64_t sizeOf(int input) noexcept {
   struct stat status {};
@@ -25,16 +26,36 @@ std::uint64_t sizeOf(int input) noexcept {
 Progress::Progress(int input) noexcept : _isTerminal(::isatty(STDERR_FILENO) == 1), _size(sizeOf(input)) {}
 
 void Progress::show(std::uint64_t items, std::uint64_t bytes) {
-  if (!_isTerminal) return;
-  auto now = std::chrono::steady_clock::now();
-  if (now < _next) return;
-  _next = now + kInterval;
+  if (!isDue()) return;
   std::string line;
   if (_size > 0) {
     auto filled = static_cast<std::size_t>(std::min(bytes, _size) * kWidth / _size);
     line = "[" + std::string(filled, '#') + std::string(kWidth - filled, ' ') + "] ";
   }
-  std::fprintf(stderr, "\r\x1b[K%s%llu messages", line.c_str(), static_cast<unsigned long long>(items));
+  draw(line + std::to_string(items) + " messages");
+}
+
+void Progress::showWaiting(std::string_view what) {
+  if (!isDue()) return;
+  if (_first == std::chrono::steady_clock::time_point{}) _first = _next;
+  const auto steps = static_cast<std::uint64_t>((_next - _first) / kInterval);
+  // There and back again.
+  const std::uint64_t way = kWidth - kBlock;
+  const std::uint64_t at = steps / way % 2 == 0 ? steps % way : way - steps % way;
+  draw("[" + std::string(at, ' ') + std::string(kBlock, '#') + std::string(way - at, ' ') + "] " +
+       std::string(what) + ", " + std::to_string(steps * kInterval / std::chrono::seconds(1)) + " s");
+}
+
+bool Progress::isDue() {
+  if (!_isTerminal) return false;
+  auto now = std::chrono::steady_clock::now();
+  if (now < _next) return false;
+  _next = now + kInterval;
+  return true;
+}
+
+void Progress::draw(const std::string& line) {
+  std::fprintf(stderr, "\r\x1b[K%s", line.c_str());
   std::fflush(stderr);
   _isShown = true;
 }

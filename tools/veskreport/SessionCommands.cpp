@@ -1,8 +1,12 @@
 #include "tools/veskreport/SessionCommands.h"
 
+#include <filesystem>
+#include <future>
+
 #include "tools/veskreport/DaemonSession.h"
 #include "tools/veskreport/Lines.h"
 #include "tools/veskreport/PayloadParser.h"
+#include "tools/veskreport/Progress.h"
 
 namespace vesk {
 
@@ -32,6 +36,15 @@ std::optional<List> logDataOf(const UploadArguments& arguments, const Output& ou
     return std::nullopt;
   }
   return List(std::move(entries));
+}
+
+std::string sizeInWords(const std::string& path) {
+  std::error_code unknown;
+  auto bytes = std::filesystem::file_size(path, unknown);
+  if (unknown) return "the file";
+  if (bytes < 10'240) return std::to_string(bytes) + " bytes";
+  if (bytes < 10 << 20) return std::to_string(bytes >> 10) + " KiB";
+  return std::to_string(bytes >> 20) + " MiB";
 }
 
 }  // namespace
@@ -68,7 +81,15 @@ int runUploadFile(const Invocation& invocation, const Output& output) {
   const std::string& path = invocation.upload.path;
   DaemonSession session(invocation.identity, output);
   if (int status = session.start()) return status;
-  auto uploaded = session.reporting().uploadFile(path, invocation.identity.timeout);
+  auto answer = std::async(std::launch::async,
+                           [&] { return session.reporting().uploadFile(path, invocation.identity.timeout); });
+  Progress progress(-1);
+  const std::string what = "uploading " + sizeInWords(path);
+  while (answer.wait_for(std::chrono::milliseconds(50)) != std::future_status::ready) {
+    progress.showWaiting(what);
+  }
+  progress.clear();
+  auto uploaded = answer.get();
   if (!uploaded) return session.failed(uploaded);
   if (!uploaded.answer) return output.failed("no backend took " + path);
   return output.done("uploaded " + path, {{"path", path}});

@@ -6,6 +6,7 @@
 #include "tools/veskreport/AggregateCommand.h"
 #include "tools/veskreport/CommandLine.h"
 #include "tools/veskreport/Output.h"
+#include "tools/veskreport/PowerLogCommand.h"
 #include "tools/veskreport/SendCommands.h"
 #include "tools/veskreport/SessionCommands.h"
 #include "tools/veskreport/StorebagCommands.h"
@@ -32,6 +33,8 @@ int run(const Invocation& invocation, const Output& output) {
       return runUploadLog(invocation, output);
     case Command::Aggregate:
       return runAggregate(invocation, output);
+    case Command::PowerLog:
+      return runPowerLog(invocation, output);
     case Command::StorebagKeygen:
       return runStorebagKeygen(invocation.storebag, output);
     case Command::StorebagSign:

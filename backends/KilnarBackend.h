@@ -1,0 +1,30 @@
+// Records messages in the device's power log.
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "backends/VeskReportingBackend.h"
+
+namespace vesk {
+
+/// Every message with a method and a payload becomes one event of the power log. Keeps no state and never has
+/// anything to say for the message log.
+class KilnarBackend final : public VeskReportingBackend {
+ public:
+  static std::shared_ptr<KilnarBackend> create(const std::string& name,
+                                               const std::optional<Dictionary>& profile,
+                                               const std::optional<Text>& productFamily,
+                                               const BackendServices& services);
+
+ private:
+  using VeskReportingBackend::VeskReportingBackend;
+
+  std::optional<std::string> sendMessageLocked(const std::optional<Dictionary>& payload,
+                                               const timeval& timestamp, std::uint16_t method,
+                                               std::uint16_t respCode, std::uint16_t eventID,
+                                               std::int32_t flag) override VESK_REQUIRES(_mutex);
+};
+
+}  // namespace vesk

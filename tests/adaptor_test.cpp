@@ -1,0 +1,152 @@
+// The adaptor backend with adaptors that are really loaded: the example's, and such as are of no use.
+#include <VeskReporting/WrenAdaptor.h>
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <filesystem>
+
+#include "backends/WrenBackend.h"
+#include "platform/files/RootPrefix.h"
+#include "tests/support/BackendHarness.h"
+#include "tests/support/CapturedLog.h"
+#include "tests/support/DaemonHarness.h"
+#include "tests/support/TempDirectory.h"
+
+namespace vesk::test {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr char kLibrary[] =
+    "System/Library/PrivateFrameworks/ZelkoServices.framework/Frameworks/ZKSPerformance.framework/"
+    "ZKSPerformance.so";
+
+void install(const fs::path& root, const fs::path& library) {
+  fs::create_directories((root / kLibrary).parent_path());
+  fs::copy_file(library, root / kLibrary, fs::copy_options::overwrite_existing);
+}
+
+std::string missing(const char* adaptor) {
+  return std::string("WrenBackend(sendMessage): Wren adaptor ") + adaptor +
+         " does not respond to forwarding selector sendMessageWithMethod:respCode:dict:";
+}
+
+class AdaptorTest : public testing::Test {
+ protected:
+  AdaptorTest() {
+    setRootPrefix(directory.path().string());
+    fs::create_directories(directory / "var/lib/veskreportingd");
+  }
+  ~AdaptorTest() override { setRootPrefix(""); }
+
+  std::shared_ptr<VeskReportingBackend> make(std::int32_t clientType = 7) {
+    return VeskReportingBackend::newBackendWithName("wren", Dictionary(), Text("Phone"), clientType,
+                                                    harness.services);
+  }
+  void send(VeskReportingBackend& backend, const std::optional<Dictionary>& payload,
+            std::uint16_t method = 3) {
+    EXPECT_EQ(backend.sendMessage(payload, timeval{}, method, 4, 0), std::nullopt);
+  }
+
+  TempDirectory directory;
+  BackendHarness harness;
+  CapturedLog log;
+};
+
+TEST_F(AdaptorTest, OnlyTwoClientTypesHaveOne) {
+  for (std::int32_t type : {0, 7, 8, 11, -7}) {
+    log.clear();
+    bool has = type == 7 || type == 11;
+    EXPECT_EQ(make(type) != nullptr, has) << type;
+    const std::string number = std::to_string(type);
+    EXPECT_EQ(log.count(6, "WrenBackend(initWithName): Loading Wren adaptor class for client type " + number),
+              1);
+    EXPECT_EQ(log.count(3, "WrenBackend(initWithName): No matching bundle found for client type " + number),
+              has ? 0 : 1);
+  }
+  log.clear();
+  EXPECT_FALSE(WrenBackend::create("wren", Dictionary(), Text("Phone"), harness.services));
+  EXPECT_EQ(log.count(3, "WrenBackend(initWithName): No matching bundle found for client type 0"), 1);
+}
+
+TEST_F(AdaptorTest, WhatIsOfNoUseCostsALineForEachMessage) {
+  struct Case {
+    const char* library;  // null: there is none
+    std::string line;
+    std::string later;  // for method 1
+  };
+  const std::string failed = "WrenBackend(sendMessage): Wren adaptor Bad failed: ";
+  const Case cases[] = {
+      {nullptr, missing("(null)"), missing("(null)")},
+      {"/etc/passwd", missing("(null)"), missing("(null)")},
+      {VESK_WITHOUT_FACTORY, missing("(null)"), missing("(null)")},
+      {VESK_WITHOUT_OPERATION, missing("Bad"), missing("Bad")},
+      {VESK_THROWING_FACTORY, missing("(null)"), missing("(null)")},
+      {VESK_THROWING_OPERATION, failed + "out of order", failed + "an exception of its own"},
+  };
+  int number = 0;
+  for (const auto& test : cases) {
+    SCOPED_TRACE(test.library ? test.library : "none");
+    // A path of its own: a library that was loaded once stays.
+    const fs::path root = directory / std::to_string(++number);
+    fs::create_directories(root);
+    setRootPrefix(root.string());
+    if (test.library) install(root, test.library);
+    log.clear();
+    auto backend = make();
+    ASSERT_TRUE(backend);
+    send(*backend, Dictionary{{"k", 1}});
+    backend->sendMessage(Dictionary(), timeval{}, 3, 1, 0);
+    EXPECT_EQ(log.count(3, test.line) + (test.later == test.line ? 0 : log.count(3, test.later)), 2);
+    backend.reset();
+    EXPECT_EQ(harness.dropped(DropReason::AdaptorFailed), static_cast<std::uint64_t>(2 * number));
+  }
+  EXPECT_EQ(log.count(3, "WrenBackend(dealloc): Wren adaptor failed: an exception of its own"), 1);
+}
+
+TEST_F(AdaptorTest, TheExampleWritesEveryKindOfValue) {
+  install(directory.path(), VESK_EXAMPLE_ADAPTOR);
+  auto first = make(7);
+  auto second = make(11);
+  const Dictionary nested{{"list", List{1, "a\"\n", Value(), List{}}}, {"none", Dictionary{}}};
+  send(*first,
+       Dictionary{{"on", true},
+                  {"signed", -5},
+                  {"unsigned", UINT64_MAX},
+                  {"real", 0.5},
+                  {"infinite", HUGE_VAL},
+                  {"date", Date{12}},
+                  {"bytes", Bytes("x")},
+                  {"nested", nested}},
+       65535);
+  send(*second, Dictionary(), 0);
+  send(*first, std::nullopt, 1);
+  EXPECT_EQ(directory.read("var/lib/veskreportingd/wren.jsonl"),
+            R"({"method":65535,"respCode":4,"dict":{"on":true,"signed":-5,"unsigned":18446744073709551615,)"
+            R"("real":0.5,"infinite":null,"date":12,"bytes":null,)"
+            R"("nested":{"list":[1,"a\"\u000a",null,[]],"none":{}}}})"
+            "\n"
+            R"({"method":0,"respCode":4,"dict":{}})"
+            "\n"
+            R"({"method":1,"respCode":4,"dict":{}})"
+            "\n");
+}
+
+TEST(AdaptorRoad, TheDaemonLoadsItInItsSandbox) {
+  DaemonHarness harness;
+  harness.writeStorebag("palvo", "version = \"1\"\n[release.wren]\n");
+  install(harness.root.path(), VESK_EXAMPLE_ADAPTOR);
+  harness.startDaemon();
+  {
+    RoadClient client(harness, Dictionary{{kVeskReportingSessionInfoClientType, 7}});
+    EXPECT_EQ(client.enabled, BackendNames{"wren"});
+    EXPECT_TRUE(client.reporting.sendMessageAndWait(5, 7, Dictionary{{"k", "v"}}));
+    EXPECT_NE(harness.root.read("var/lib/veskreportingd/wren.jsonl")
+                  .find(R"({"method":5,"respCode":7,"dict":{"k":"v"}})"),
+              std::string::npos);
+  }
+  EXPECT_EQ(harness.stopDaemon(), 0);
+}
+
+}  // namespace
+}  // namespace vesk::test

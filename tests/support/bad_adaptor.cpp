@@ -1,0 +1,34 @@
+// Adaptors that are of no use, each for its reason; which one, the build says.
+#include <VeskReporting/WrenAdaptor.h>
+
+#include <stdexcept>
+
+namespace {
+
+[[maybe_unused]] void fail(VeskWrenAdaptor*, uint16_t, uint16_t respCode, const VeskDictionaryView*) {
+  if (respCode == 1) throw 1;
+  throw std::runtime_error("out of order");
+}
+
+#if defined(VESK_WITHOUT_OPERATION)
+const VeskWrenOperation kOperations[] = {{"sendMessage", reinterpret_cast<VeskWrenFunction>(&fail)},
+                                         {nullptr, nullptr}};
+#else
+const VeskWrenOperation kOperations[] = {{VESK_WREN_SEND_MESSAGE, reinterpret_cast<VeskWrenFunction>(&fail)},
+                                         {nullptr, nullptr}};
+#endif
+
+[[maybe_unused]] VeskWrenAdaptor adaptor{VESK_WREN_ADAPTOR_VERSION, "Bad", kOperations,
+                                         [](VeskWrenAdaptor*) { throw 2; }};
+
+}  // namespace
+
+#if !defined(VESK_WITHOUT_FACTORY)
+VeskWrenAdaptor* WrenAdaptor(const VeskWrenHost* host) {
+  if (host->version != VESK_WREN_ADAPTOR_VERSION) return nullptr;
+#if defined(VESK_THROWING_FACTORY)
+  throw std::runtime_error("no antenna");
+#endif
+  return &adaptor;
+}
+#endif

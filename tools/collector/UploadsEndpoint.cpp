@@ -1,0 +1,74 @@
+#include "tools/collector/UploadsEndpoint.h"
+
+#include <stdexcept>
+
+#include "platform/files/FileURL.h"
+#include "tools/files/WholeFile.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::size_t kLongestName = 200;
+constexpr std::size_t kMaximumContents = std::size_t{1} << 30;
+
+/// The name that the query gives, made fit for a file in a directory of ours; empty when it gives none.
+std::string nameIn(const HTTPReceived& received) {
+  std::string name = percentDecoded(received.query("filename").value_or("")).value_or("");
+  for (char& c : name) {
+    auto byte = static_cast<unsigned char>(c);
+    if (c == '/' || byte < 0x20 || byte == 0x7f) c = '_';
+  }
+  return name.substr(0, kLongestName);
+}
+
+}  // namespace
+
+UploadsEndpoint::UploadsEndpoint(Parts parts, std::filesystem::path directory, std::string goodAnswer)
+    : _parts(parts),
+      _refuse(parts.console, parts.stats),
+      _directory(std::move(directory)),
+      _goodAnswer(std::move(goodAnswer)) {}
+
+HTTPAnswer UploadsEndpoint::answer(const HTTPReceived& received) {
+  auto fault = _parts.faults.take(FaultTarget::Upload);
+  HTTPAnswer answer;
+  if (!fault || fault->isOnlyInTheAnswer()) answer = take(received);
+  if (fault) {
+    ++_parts.stats.faults;
+    _parts.console.note("fault on demand for " + received.method + " " + received.target + " from " +
+                        received.peer);
+    fault->applyTo(answer);
+  }
+  return answer;
+}
+
+HTTPAnswer UploadsEndpoint::take(const HTTPReceived& received) {
+  if (received.method != "POST") return _refuse.wrongMethod(received, "POST");
+  std::string name = nameIn(received);
+  if (name.empty()) return _refuse(received, 400, "the query names no file");
+  if (received.header("Content-Encoding") != "gzip") return _refuse(received, 400, "the file is not gzip");
+  auto contents = received.decodedBody(kMaximumContents);
+  if (!contents.body) return _refuse(received, 400, contents.problem);
+  auto path = save(received, name);
+  ++_parts.stats.uploads;
+  _parts.console.note("file " + name + " (" + std::to_string(contents.body->size()) + " bytes, " +
+                      std::to_string(received.body.size()) + " as sent) of session " +
+                      std::string(received.query("sequence").value_or("?")) + " saved as " + path.string());
+  HTTPAnswer answer;
+  answer.headers = {{"Content-Type", "application/json"}};
+  answer.body = _goodAnswer + "\n";
+  return answer;
+}
+
+std::filesystem::path UploadsEndpoint::save(const HTTPReceived& received, const std::string& name) {
+  std::filesystem::create_directories(_directory);
+  std::filesystem::path path;
+  do {
+    path = _directory / (std::to_string(++_last) + "-" + name);
+  } while (std::filesystem::exists(path));
+  writeWholeFile(path, received.body, 0644);
+  return path;
+}
+
+}  // namespace vesk

@@ -1,0 +1,106 @@
+#include "tools/veskreport/PowerLogCommand.h"
+
+#include <charconv>
+#include <cstdio>
+#include <filesystem>
+
+#include "platform/files/RootPrefix.h"
+#include "platform/powerlog/PowerLogReader.h"
+#include "platform/time/CivilTime.h"
+#include "tools/json/JSONReader.h"
+
+namespace vesk {
+
+namespace {
+
+std::optional<std::chrono::seconds> unitNamed(char letter) {
+  switch (letter) {
+    case 's':
+      return std::chrono::seconds(1);
+    case 'm':
+      return std::chrono::minutes(1);
+    case 'h':
+      return std::chrono::hours(1);
+    case 'd':
+      return std::chrono::days(1);
+    default:
+      return std::nullopt;
+  }
+}
+
+std::optional<std::chrono::seconds> ageMeantBy(const std::string& text) {
+  if (text.empty()) return std::nullopt;
+  auto unit = unitNamed(text.back());
+  std::uint32_t count = 0;
+  const char* last = text.data() + text.size() - 1;
+  auto [end, error] = std::from_chars(text.data(), last, count);
+  if (!unit || error != std::errc() || end != last) return std::nullopt;
+  return *unit * std::int64_t{count};
+}
+
+std::string isoTime(WallTime time) {
+  std::string text = civilTime(time);
+  text[text.find(' ')] = 'T';
+  return text + "Z";
+}
+
+int show(const PowerLogEvent& event, const Output& output) {
+  std::string line = civilTime(event.time) + "  " + std::to_string(event.identifier) + " " + event.name +
+                     "  " + event.dictionary;
+  auto dictionary = parseJSON(event.dictionary, 64);
+  return output.done(line, {{"time", std::chrono::duration<double>(event.time.time_since_epoch()).count()},
+                            {"utc", isoTime(event.time)},
+                            {"identifier", event.identifier},
+                            {"name", event.name},
+                            {"dictionary", dictionary.value.value_or(Value())}});
+}
+
+}  // namespace
+
+std::optional<WallTime> timeMeantBy(const std::string& text, WallTime now) {
+  if (auto age = ageMeantBy(text)) return now - *age;
+  int year = 0;
+  unsigned month = 0;
+  unsigned day = 0;
+  unsigned hour = 0;
+  unsigned minute = 0;
+  unsigned second = 0;
+  int used = 0;
+  if (std::sscanf(text.c_str(), "%4d-%2u-%2u%n", &year, &month, &day, &used) != 3) return std::nullopt;
+  const char* rest = text.c_str() + used;
+  if (*rest != '\0') {
+    used = 0;
+    if (std::sscanf(rest, "%*1[T ]%2u:%2u:%2u%n", &hour, &minute, &second, &used) != 3) return std::nullopt;
+    rest += used;
+    if (*rest == 'Z') ++rest;
+  }
+  std::chrono::year_month_day date{std::chrono::year(year), std::chrono::month(month), std::chrono::day(day)};
+  if (*rest != '\0' || !date.ok() || hour > 23 || minute > 59 || second > 60) return std::nullopt;
+  return std::chrono::sys_days(date) + std::chrono::hours(hour) + std::chrono::minutes(minute) +
+         std::chrono::seconds(second);
+}
+
+int runPowerLog(const Invocation& invocation, const Output& output) {
+  WallTime since{};
+  if (!invocation.powerLog.since.empty()) {
+    auto meant = timeMeantBy(invocation.powerLog.since, WallClock::system().now());
+    if (!meant) {
+      output.failed("\"" + invocation.powerLog.since +
+                    "\" is neither an age (15m) nor a time (2026-11-24T18:30:00Z)");
+      return kExitUsage;
+    }
+    since = *meant;
+  }
+  const std::string path = pathUnderRoot(kPowerLogPath);
+  std::error_code unknown;
+  if (!std::filesystem::exists(path, unknown)) {
+    return output.failed(path + ": " + (unknown ? unknown.message() : "nothing has been recorded"));
+  }
+  std::string error = readPowerLog(path, since, [&](const PowerLogEvent& event) {
+    show(event, output);
+    return true;
+  });
+  return error.empty() ? kExitDone : output.failed(path + ": " + error);
+}
+
+}  // namespace vesk
