@@ -7,6 +7,7 @@
 #include "tools/collector/EventsEndpoint.h"
 #include "tools/collector/HTTPDate.h"
 #include "tools/collector/StorebagEndpoint.h"
+#include "tools/collector/UploadsEndpoint.h"
 #include "tools/json/JSONReader.h"
 #include "tools/storebag/StorebagDocument.h"
 
@@ -81,6 +82,22 @@ TEST_F(CollectorEndpoints, TakeAGoodPostAndSaveEachEventWithItsHeaders) {
   EXPECT_EQ(integerForKey(*lines[2].dictionary()->dictionary("event"), "c"), -2);
   EXPECT_EQ(_stats.posts, 2U);
   EXPECT_EQ(_stats.events, 3U);
+}
+
+TEST_F(CollectorEndpoints, TakeFilesUnderNamesThatLeadNowhere) {
+  UploadsEndpoint uploads({_console, _stats, _faults}, _files / "uploads", "as told");
+  const HTTPHeaderList packed{{"Content-Encoding", "gzip"}};
+  const std::string good = "/uploads?sequence=7&filename=";
+  EXPECT_EQ(uploads.answer(request("GET", good + "a.gz")).status, 405U);
+  EXPECT_EQ(uploads.answer(request("POST", "/uploads", packed, gzip("x"))).status, 400U);
+  EXPECT_EQ(uploads.answer(request("POST", good + "a.gz", {}, gzip("x"))).status, 400U);
+  EXPECT_EQ(uploads.answer(request("POST", good + "a.gz", packed, "x")).status, 400U);
+  EXPECT_EQ(_stats.uploads, 0U);
+  EXPECT_EQ(uploads.answer(request("POST", good + "%2e%2e%2Fa%20b.gz", packed, gzip("x"))).body, "as told\n");
+  EXPECT_EQ(_files.read("uploads/1-.._a b.gz"), gzip("x"));
+  EXPECT_EQ(_faults.add("upload=503*1"), std::nullopt);
+  EXPECT_EQ(uploads.answer(request("POST", good + "b.gz", packed, gzip("x"))).status, 503U);
+  EXPECT_EQ(_stats.uploads, 1U);
 }
 
 TEST_F(CollectorEndpoints, RefuseWhatIsNoPostAndSaveNothing) {
