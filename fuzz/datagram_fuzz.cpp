@@ -72,7 +72,7 @@ class Exchange {
     while (_server.receive(buffer, &client)) {
     }
     if (bytes.size() <= 60'000) require(_server.sendTo(client, bytes));
-    _queue->advance(std::chrono::milliseconds(bytes.size() % 50));
+    _queue->advance(std::chrono::milliseconds(bytes.size() % 3));
   }
 
  private:
