@@ -16,9 +16,11 @@ namespace {
 
 bool fitsIntoBody(const Value& value) { return value.isNumber() || value.text() != nullptr; }
 
-// Dates become seconds; what JSON events can't carry is removed and reported.
+// Dates become seconds; what JSON events can't carry is removed and reported. JSON has no number that is not
+// finite, and a single one would cost the whole batch.
 void sanitize(MutableDictionary& event) {
   std::erase_if(event.entries(), [](DictionaryEntry& entry) {
+    if (const double* number = entry.value.real()) entry.value = finiteOrMinusOne(*number);
     if (fitsIntoBody(entry.value)) return false;
     if (const Date* date = entry.value.date()) {
       entry.value = finiteOrMinusOne(date->secondsSince1970);
@@ -104,7 +106,8 @@ std::vector<std::pair<std::string, std::string>> HTTPSPostBackend::postHeaders(
 
 void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t flag,
                                        std::optional<std::uint16_t> method,
-                                       std::optional<std::uint16_t> responseCode, std::size_t eventCount) {
+                                       std::optional<std::uint16_t> responseCode,
+                                       std::size_t eventCount) try {
   const auto& url = flag == 1 || flag == 3 ? _realtimePostURL : _postURL;
   if (!url) {
     _services.counters.count(_name, DropReason::NoURL, eventCount);
@@ -126,15 +129,25 @@ void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t flag,
   _services.http.start(std::move(request), [self, eventCount](const HTTPResult& result) {
     self->postCompleted(result, eventCount);
   });
+} catch (...) {
+  // No memory for it, and the batch is given up already.
+  _services.counters.count(_name, DropReason::BodyNotBuilt, eventCount);
+  throw;
 }
 
 void HTTPSPostBackend::postCompleted(const HTTPResult& result, std::size_t eventCount) {
   if (result.error) {
     VESK_LOG_ERROR("HTTPSPostBackend(postJsonMessage): post error: %s", result.error->description.c_str());
     _services.counters.count(_name, DropReason::TransportError, eventCount);
+    return;
   }
-  long status = result.response ? result.response->status : 0;
-  if (status < 500 || status > 599) return;
+  const long status = result.response->status;
+  if (status < 500 || status > 599) {
+    if (status < 200 || status > 299) {
+      _services.counters.count(_name, DropReason::ServerRefused, eventCount);
+    }
+    return;
+  }
   VESK_LOG_INFO("postJSONMessage: backend %s disabled by server %ld return code", _name.c_str(), status);
   setState(BackendStateDisabled);
   _services.counters.count(_name, DropReason::ServerError5xx, eventCount);

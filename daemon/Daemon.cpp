@@ -17,6 +17,7 @@
 #include "platform/log/SystemLog.h"
 #include "platform/powerlog/PowerLog.h"
 #include "platform/queue/TimedQueuePool.h"
+#include "util/Counters.h"
 
 namespace vesk {
 
@@ -43,6 +44,14 @@ PowerLog::Options powerLogOptions() {
     Counters::shared().count(kVeskReportingBackendKilnar, DropReason::NotRecorded, events);
   };
   return options;
+}
+
+void logLosses() {
+  for (const auto& loss : Counters::shared().snapshot()) {
+    VESK_LOG_INFO("main: Lost since the start: %s %s %llu", loss.backend.c_str(),
+                  std::string(nameOfDropReason(loss.reason)).c_str(),
+                  static_cast<unsigned long long>(loss.count));
+  }
 }
 
 }  // namespace
@@ -109,6 +118,8 @@ void Daemon::stop() {
     VESK_LOG_WARNING("main: Stopping although datagrams are still unacknowledged after %d ms.",
                      static_cast<int>(kDatagramWait.count()));
   }
+  _parts.reset();  // gives up what is left, and counts it
+  logLosses();
 }
 
 }  // namespace vesk

@@ -22,7 +22,8 @@ class Daemon {
   void resume();
 
   /// Ends in order: no new connections, the sessions destroyed (they send their closing messages and flush),
-  /// then what is being posted waited for, at most `kPostWait`, and datagrams, at most `kDatagramWait`. Safe
+  /// then what is being posted waited for, at most `kPostWait`, and datagrams, at most `kDatagramWait`; what
+  /// is left is given up. Last, one line for each reason and backend says what was lost since the start. Safe
   /// to call twice.
   void stop();
 

@@ -44,12 +44,22 @@ ReportingdSession::ReportingdSession(std::shared_ptr<ReportingdSessionDelegate> 
 
 ReportingdSession::~ReportingdSession() {
   VESK_LOG_DEBUG("dealloc: ReportingdSession dealloc: %u", sessionID());
-  MutableDictionary payload;
-  if (auto version = storebagVersion()) payload.set("StorebagVersion", *version);
-  internalSendMessage(payload.share(), 0, 1);
-  flushMessages();
-  shutdownSessionAggregation();
-  cleanupBackends(backends());
+  // Without memory, one step's failure must neither end the process nor keep the others from being tried.
+  auto attempt = [](auto step) {
+    try {
+      step();
+    } catch (const std::exception& error) {
+      VESK_LOG_ERROR("dealloc: ReportingdSession: %s", error.what());
+    }
+  };
+  attempt([this] {
+    MutableDictionary payload;
+    if (auto version = storebagVersion()) payload.set("StorebagVersion", *version);
+    internalSendMessage(payload.share(), 0, 1);
+  });
+  attempt([this] { flushMessages(); });
+  attempt([this] { shutdownSessionAggregation(); });
+  attempt([this] { cleanupBackends(backends()); });
 }
 
 // --- Identity

@@ -314,7 +314,8 @@ TEST_F(BackendEvents, CorrelationRewritesHeldEvents) {
 
 TEST_F(BackendEvents, ServerAnswersDecideTheState) {
   CapturedLog log;
-  for (auto [status, stateAfter] : {std::pair{200u, 2}, {404u, 2}, {500u, 1}, {599u, 1}, {503u, 1}}) {
+  for (auto [status, stateAfter] :
+       {std::pair{200u, 2}, {204u, 2}, {302u, 2}, {404u, 2}, {500u, 1}, {599u, 1}, {503u, 1}}) {
     SCOPED_TRACE(status);
     harness.answerWith(status);
     auto backend = make();
@@ -325,6 +326,7 @@ TEST_F(BackendEvents, ServerAnswersDecideTheState) {
   }
   EXPECT_EQ(log.count(6, "postJSONMessage: backend httpPost disabled by server 503 return code"), 1);
   EXPECT_EQ(harness.dropped(DropReason::ServerError5xx), 3u);
+  EXPECT_EQ(harness.dropped(DropReason::ServerRefused), 2u);
 }
 
 TEST_F(BackendEvents, NamesCannotInjectHeaders) {

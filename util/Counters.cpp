@@ -41,6 +41,8 @@ std::string_view nameOfDropReason(DropReason reason) noexcept {
       return "not-recorded";
     case DropReason::AdaptorFailed:
       return "adaptor-failed";
+    case DropReason::ServerRefused:
+      return "server-refused";
   }
   return "unknown";
 }

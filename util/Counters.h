@@ -29,8 +29,9 @@ enum class DropReason : std::uint8_t {
   NotAggregated,   ///< the aggregating client did not take its copy: it does not read, or has gone
   NotRecorded,     ///< a local record could not be written
   AdaptorFailed,   ///< an adaptor was missing or did not take it
+  ServerRefused,   ///< the server answered, neither with success (2xx) nor with an error of its own (5xx)
 };
-inline constexpr std::size_t kDropReasonCount = 14;
+inline constexpr std::size_t kDropReasonCount = 15;
 
 /// A word for it, for tools and logs: "state-disabled".
 std::string_view nameOfDropReason(DropReason reason) noexcept;
