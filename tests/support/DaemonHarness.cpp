@@ -77,6 +77,11 @@ void DaemonHarness::startCollector(std::vector<std::string> arguments) {
 }
 
 void DaemonHarness::startDaemon(std::vector<std::string> arguments) {
+  launchDaemon(std::move(arguments));
+  if (!_daemon->waitForText("start loop.")) throw std::runtime_error("no daemon: " + _daemon->errors());
+}
+
+void DaemonHarness::launchDaemon(std::vector<std::string> arguments) {
   root.write("etc/veskreporting/preferences/com.corvane.veskreporting.toml", tomlLines(_preferences));
   root.write("etc/veskreporting/device.toml", tomlLines(_deviceFacts));
   std::vector<std::string> command{VESK_BIN_DIRECTORY "/veskreportingd", "--root", root.path().string()};
@@ -87,7 +92,6 @@ void DaemonHarness::startDaemon(std::vector<std::string> arguments) {
   _daemon = std::make_unique<ChildProcess>(ChildProcess::Options{
       .command = std::move(command),
       .environment = {{"SSL_CERT_FILE", fact("authorityFile")}, {"ASAN_OPTIONS", "detect_leaks=0"}}});
-  if (!_daemon->waitForText("start loop.")) throw std::runtime_error("no daemon: " + _daemon->errors());
 }
 
 int DaemonHarness::stopDaemon() {

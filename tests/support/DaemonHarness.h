@@ -30,6 +30,8 @@ class DaemonHarness {
   void stopCollector() { _collector.reset(); }
   /// Waits until clients are accepted.
   void startDaemon(std::vector<std::string> arguments = {});
+  /// The same without waiting.
+  void launchDaemon(std::vector<std::string> arguments = {});
   /// Ends it by SIGTERM and gives its exit status.
   int stopDaemon();
   ChildProcess& daemon() const { return *_daemon; }

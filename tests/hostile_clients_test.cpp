@@ -1,0 +1,153 @@
+// Many clients, and clients that say nonsense, against the real daemon.
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+
+#include <cstring>
+#include <limits>
+
+#include "platform/files/FileDescriptor.h"
+#include "tests/support/DaemonHarness.h"
+#include "tests/support/ProcessFacts.h"
+
+namespace vesk::test {
+namespace {
+
+using namespace std::string_view_literals;
+
+Dictionary message(int category) {
+  return Dictionary{{"category", category}, {"type", 2}, {"flag", 0}, {"payload", Dictionary{}}};
+}
+
+/// Kept connections of the HTTP client, which come and go.
+constexpr std::size_t kSpareDescriptors = 8;
+
+/// Whether the daemon is back to what it held before, and still serves.
+class Aftermath {
+ public:
+  explicit Aftermath(DaemonHarness& harness) : _harness(harness), _facts(harness.daemon().pid()) {
+    RoadClient client(_harness);  // so that all that is made once is there
+    EXPECT_TRUE(client.reporting.sendMessageAndWait(message(8)));
+    harness.waitForEventsOfMethod(8, 1);
+    _threads = _facts.threads() - 1;  // its own goes
+    _descriptors = _facts.descriptors();
+  }
+  void expectNothingLeft() {
+    EXPECT_TRUE(eventually([&] { return _facts.threads() <= _threads; })) << _facts.threads();
+    EXPECT_TRUE(eventually([&] { return _facts.descriptors() <= _descriptors + kSpareDescriptors; }))
+        << _facts.descriptors();
+    RoadClient client(_harness);
+    EXPECT_TRUE(client.reporting.sendMessageAndWait(message(9)));
+    _harness.waitForEventsOfMethod(9, 1);
+    EXPECT_EQ(_harness.stopDaemon(), 0);
+  }
+
+ private:
+  DaemonHarness& _harness;
+  ProcessFacts _facts;
+  std::size_t _threads = 0;
+  std::size_t _descriptors = 0;
+};
+
+/// An authenticated connection, or none when the daemon closed it.
+FileDescriptor connection(const std::string& path) {
+  FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  std::memcpy(address.sun_path, path.c_str(), std::min(path.size() + 1, sizeof address.sun_path - 1));
+  if (::connect(socket.get(), reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) return {};
+  constexpr auto kGreeting = "\0AUTH EXTERNAL\r\nDATA\r\nBEGIN\r\n"sv;
+  ::send(socket.get(), kGreeting.data(), kGreeting.size(), MSG_NOSIGNAL);
+  char answer[64];
+  pollfd readable{socket.get(), POLLIN, 0};
+  if (::poll(&readable, 1, 60'000) != 1 || ::recv(socket.get(), answer, sizeof answer, 0) <= 0) return {};
+  return socket;
+}
+
+TEST(HostileClients, ConnectionsInExcessAreClosedAndTheOthersGoOn) {
+  DaemonHarness harness;
+  harness.startDaemon();
+  Aftermath aftermath(harness);
+  {
+    RoadClient first(harness);
+    std::vector<FileDescriptor> open;
+    for (int i = 0; i < 300; ++i) {
+      if (auto made = connection(harness.socketPath())) open.push_back(std::move(made));
+    }
+    EXPECT_EQ(open.size(), 255u) << "256 of one user, with the first";
+    EXPECT_TRUE(first.reporting.sendMessageAndWait(message(3)));
+    harness.waitForEventsOfMethod(3, 1);
+    EXPECT_TRUE(harness.daemon().waitForText("Refused a connection of user"));
+  }
+  aftermath.expectNothingLeft();
+}
+
+const std::vector<Value>& strangeValues() {
+  static const std::vector<Value> values{
+      "text",
+      "",
+      "-9223372036854775809",
+      -1,
+      std::numeric_limits<std::int64_t>::min(),
+      std::uint64_t{1} << 63,
+      std::numeric_limits<std::uint64_t>::max(),
+      std::numeric_limits<double>::quiet_NaN(),
+      std::numeric_limits<double>::infinity(),
+      -std::numeric_limits<double>::infinity(),
+      1e300,
+      true,
+      Value(),
+      Bytes("bytes"),
+      Date{std::numeric_limits<double>::infinity()},
+      List{1, "two"},
+      Dictionary{{"a", 1}},
+  };
+  return values;
+}
+
+Dictionary with(const Dictionary& base, const char* key, const Value& value) {
+  MutableDictionary changed(base);
+  changed.set(key, value);
+  return changed.share();
+}
+
+TEST(HostileClients, EveryKindOfValueInEveryNumericKeyHarmsNobody) {
+  DaemonHarness harness;
+  harness.startDaemon({"--log-level", "6"});
+  Aftermath aftermath(harness);
+  std::optional<RoadClient> other(std::in_place, harness);
+  const Dictionary info{{kVeskReportingSessionInfoSessionID, 7},
+                        {kVeskReportingSessionInfoClientType, 5},
+                        {kVeskReportingSessionInfoClientVersion, 3}};
+  for (const Value& value : strangeValues()) {
+    SCOPED_TRACE(describe(value));
+    for (const char* key : {kVeskReportingSessionInfoSessionID, kVeskReportingSessionInfoClientType,
+                            kVeskReportingSessionInfoClientVersion, kVeskReportingSessionInfoRequireUserInfo,
+                            kVeskReportingSessionInfoBatchEvent}) {
+      VeskReporting session(harness.clientOptions());
+      ASSERT_EQ(session.setSessionInfo(with(info, key, value), Dictionary{{key, value}}),
+                ReportingStatus::Queued);
+      EXPECT_TRUE(session.startConfig(ChildProcess::kPatience)) << key;
+      EXPECT_TRUE(session.sendMessageAndWait(message(3))) << key;
+      EXPECT_TRUE(session.fetchStates(Dictionary{{"clientName", value}})) << key;
+      EXPECT_TRUE(session.flushMessagesAndWait()) << key;
+      EXPECT_TRUE(session.fetchDisplayURL()) << key;
+      // Whether it is taken or refused, it is answered.
+      EXPECT_NE(session.sendMessageOnceAndWait(with(info, key, value), std::nullopt, 3, 2).status,
+                ReportingStatus::NotConnected)
+          << key;
+    }
+    for (const char* key : {"category", "type", "flag", "payload"}) {
+      EXPECT_TRUE(other->reporting.sendMessageAndWait(with(message(4), key, value))) << key;
+    }
+    EXPECT_TRUE(other->reporting.sendMessageAndWait(5, 2, Dictionary{{"value", value}}));
+  }
+  // One event for each value, whatever became of the value itself.
+  harness.waitForEventsOfMethod(5, strangeValues().size());
+  other.reset();
+  aftermath.expectNothingLeft();
+}
+
+}  // namespace
+}  // namespace vesk::test

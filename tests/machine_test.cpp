@@ -1,0 +1,240 @@
+// What the daemon does when the machine under it fails: disks, descriptors, memory, and its own sudden end.
+#include <gtest/gtest.h>
+#include <sched.h>
+#include <sys/mount.h>
+#include <sys/resource.h>
+
+#include <algorithm>
+#include <atomic>
+#include <csignal>
+#include <cstdlib>
+#include <random>
+#include <thread>
+
+#include "tests/support/DaemonHarness.h"
+#include "tests/support/ProcessFacts.h"
+
+namespace vesk::test {
+namespace {
+
+using namespace std::chrono_literals;
+
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+constexpr bool kIsSanitized = true;
+#else
+constexpr bool kIsSanitized = false;
+#endif
+
+Dictionary message(int category, Dictionary payload = {}, int flag = 0) {
+  return Dictionary{{"category", category}, {"type", 2}, {"flag", flag}, {"payload", std::move(payload)}};
+}
+
+bool queued(ReportingStatus status) { return status == ReportingStatus::Queued; }
+
+/// A small file system that only this process and those it starts can see, and that goes away with them.
+class SmallDisk {
+ public:
+  SmallDisk(const std::filesystem::path& at, const char* size) : _at(at) {
+    _isMounted = ::unshare(CLONE_NEWNS) == 0 &&
+                 ::mount("none", "/", nullptr, MS_REC | MS_PRIVATE, nullptr) == 0 &&
+                 ::mount("tmpfs", _at.c_str(), "tmpfs", 0, (std::string("size=") + size).c_str()) == 0;
+  }
+  ~SmallDisk() {
+    if (_isMounted) ::umount2(_at.c_str(), MNT_DETACH);
+  }
+  SmallDisk(const SmallDisk&) = delete;
+  SmallDisk& operator=(const SmallDisk&) = delete;
+
+  bool isMounted() const { return _isMounted; }
+  void makeReadOnly() {
+    ASSERT_EQ(::mount("none", _at.c_str(), nullptr, MS_REMOUNT | MS_RDONLY, nullptr), 0);
+  }
+  void fill() {
+    std::ofstream file(_at / "filler");
+    while (file << std::string(4096, 'x') << std::flush) {
+    }
+  }
+
+ private:
+  std::filesystem::path _at;
+  bool _isMounted = false;
+};
+
+constexpr char kLogs[] = "var/mobile/Library/Logs/Dunmore";
+constexpr char kState[] = "var/lib/veskreportingd";
+
+struct DiskCase {
+  const char* what;
+  const char* directory;
+  void (*breakIt)(const DaemonHarness& harness, SmallDisk* disk);
+  bool needsDisk;
+  const char* line;  // how the daemon tells
+};
+
+const DiskCase kDiskCases[] = {
+    {"the log directory is a file", kLogs,
+     [](const DaemonHarness& harness, SmallDisk*) {
+       harness.root.write(std::string(kLogs) + "/Retired", "x");
+     },
+     false, "writeToLogFile: Error reading from log directory: Not a directory"},
+    {"the log directory can't be made", kLogs,
+     [](const DaemonHarness&, SmallDisk* disk) { disk->makeReadOnly(); }, true,
+     "writeToLogFile: Failed to create new veskreportingd log file"},
+    {"no room for the log", kLogs, [](const DaemonHarness&, SmallDisk* disk) { disk->fill(); }, true,
+     "writeToLogFile: "},
+    {"the identifiers can't be kept", kState,
+     [](const DaemonHarness&, SmallDisk* disk) { disk->makeReadOnly(); }, true, "cannot keep identifiers in"},
+    {"no room for the identifiers", kState, [](const DaemonHarness&, SmallDisk* disk) { disk->fill(); }, true,
+     "cannot keep identifiers in"},
+};
+
+TEST(Machine, ADiskThatFailsCostsNoMessage) {
+  for (const auto& test : kDiskCases) {
+    SCOPED_TRACE(test.what);
+    DaemonHarness harness;
+    std::optional<SmallDisk> disk;
+    if (test.needsDisk) {
+      disk.emplace(harness.root / test.directory, "64k");
+      if (!disk->isMounted()) GTEST_SKIP() << "needs the right to mount";
+    }
+    test.breakIt(harness, disk ? &*disk : nullptr);
+    harness.startDaemon();
+    RoadClient client(harness);
+    for (int i = 0; i < 5; ++i) {
+      auto sent = client.reporting.sendMessageAndWait(message(3));
+      ASSERT_TRUE(sent) << sent.detail;
+      EXPECT_TRUE(sent.answer) << "the client is told what was posted, the log or no log";
+    }
+    harness.waitForEventsOfMethod(3, 5);
+    EXPECT_TRUE(harness.daemon().waitForText(test.line));
+    EXPECT_EQ(harness.stopDaemon(), 0);
+  }
+}
+
+void limit(const ChildProcess& process, __rlimit_resource resource, rlim_t to) {
+  rlimit before{};
+  ASSERT_EQ(::prlimit(process.pid(), resource, nullptr, &before), 0);
+  const rlimit after{std::min(to, before.rlim_max), before.rlim_max};
+  ASSERT_EQ(::prlimit(process.pid(), resource, &after, nullptr), 0);
+}
+
+TEST(Machine, WithoutDescriptorsItGoesOnAndForgetsNothing) {
+  DaemonHarness harness;
+  harness.startDaemon();
+  RoadClient client(harness);
+  limit(harness.daemon(), RLIMIT_NOFILE, 3);
+  // Neither a post nor the message log nor a new client gets a descriptor.
+  harness.stopCollector();
+  for (int i = 0; i < 20; ++i) {
+    auto sent = client.reporting.sendMessageAndWait(message(3, Dictionary{{"n", i}}));
+    ASSERT_TRUE(sent) << sent.detail;
+  }
+  VeskReporting refused(harness.clientOptions());
+  EXPECT_EQ(refused.connect(500ms).status, ReportingStatus::NotConnected);
+  harness.startCollector();
+  limit(harness.daemon(), RLIMIT_NOFILE, RLIM_INFINITY);
+  harness.waitForEventsOfMethod(3, 20);
+  EXPECT_TRUE(refused.connect(ChildProcess::kPatience)) << "by itself, once there is room";
+  EXPECT_EQ(harness.stopDaemon(), 0);
+}
+
+TEST(Machine, WithoutMemoryItRefusesAndRecovers) {
+  if (kIsSanitized) GTEST_SKIP() << "the sanitizer itself needs more memory";
+  DaemonHarness harness;
+  harness.startDaemon({"--log-level", "6"});
+  limit(harness.daemon(), RLIMIT_DATA, rlim_t{64} << 20);
+  RoadClient fresh(harness);
+  std::vector<std::unique_ptr<RoadClient>> clients;
+  for (int i = 0; i < 8; ++i) clients.push_back(std::make_unique<RoadClient>(harness));
+  harness.setFault("post=stall");
+  // 200 MB that nobody takes: more than may wait, and more than there is.
+  std::string text(500'000, ' ');
+  std::mt19937 random(1);
+  for (char& letter : text) letter = static_cast<char>('!' + random() % 90);  // so that it stays large
+  const Dictionary large{{"x", text}};
+  std::vector<std::thread> threads;
+  std::atomic<int> answered{0};
+  for (auto& client : clients) {
+    threads.emplace_back([&] {
+      for (int i = 0; i < 50; ++i) {
+        auto sent = client->reporting.sendMessageAndWait(message(4, large), ChildProcess::kPatience);
+        answered += sent.status != ReportingStatus::TimedOut ? 1 : 0;
+      }
+    });
+  }
+  for (auto& thread : threads) thread.join();
+  EXPECT_EQ(answered, 400) << "each call ends";
+  EXPECT_TRUE(harness.daemon().waitForText("bad_alloc")) << "or else this test tries nothing";
+  harness.stopCollector();
+  harness.startCollector();
+  ASSERT_TRUE(eventually(
+      [&] { return fresh.reporting.sendMessageAndWait(message(5)).status == ReportingStatus::Done; }));
+  harness.waitForEventsOfMethod(5, 1);
+  EXPECT_EQ(harness.stopDaemon(), 0);
+}
+
+/// As many as fit in twenty seconds, or what VESK_TERMINATIONS says.
+class Rounds {
+ public:
+  bool goOn() {
+    ++_done;
+    return _wanted > 0 ? _done <= _wanted : std::chrono::steady_clock::now() < _end;
+  }
+  int done() const { return _done; }
+
+ private:
+  const char* const _setting = std::getenv("VESK_TERMINATIONS");
+  const int _wanted = _setting != nullptr ? std::atoi(_setting) : 0;
+  const std::chrono::steady_clock::time_point _end = std::chrono::steady_clock::now() + 20s;
+  int _done = 0;
+};
+
+// Before its signals are set up, a daemon ends as any program does; it has accepted nobody then.
+bool endedInOrder(int signal, int status, const std::string& log) {
+  if (status == 128 + signal) return signal == SIGKILL || log.find("start loop.") == std::string::npos;
+  return signal == SIGTERM && status == 0;
+}
+
+TEST(Machine, MayEndAtAnyMomentAndItsClientsReturnByThemselves) {
+  DaemonHarness harness;
+  harness.startDaemon();
+  auto options = harness.clientOptions();
+  options.lastReconnectWait = 20ms;
+  VeskReporting client(options);
+  ASSERT_TRUE(queued(client.setSessionInfo(
+      Dictionary{{kVeskReportingSessionInfoSessionID, 1}, {kVeskReportingSessionInfoClientType, 5}})));
+  ASSERT_TRUE(client.startConfig(ChildProcess::kPatience));
+  std::atomic<bool> stop{false};
+  std::atomic<int> answered{0};
+  std::thread sender([&] {
+    while (!stop) answered += client.sendMessageAndWait(message(3), 50ms) ? 1 : 0;
+  });
+  const auto seed = std::random_device()();
+  SCOPED_TRACE("seed " + std::to_string(seed));
+  std::mt19937 random(seed);
+  Rounds rounds;
+  while (rounds.goOn() && !HasFailure()) {
+    std::this_thread::sleep_for(std::chrono::milliseconds(random() % 100));  // the moment
+    const int signal = random() % 4 == 0 ? SIGKILL : SIGTERM;
+    harness.daemon().signal(signal);
+    const int status = harness.daemon().wait().value_or(-1);
+    const std::string log = harness.daemon().errors();
+    EXPECT_TRUE(endedInOrder(signal, status, log)) << "signal " << signal << ", status " << status << "\n"
+                                                   << log;
+    harness.launchDaemon();
+    if (random() % 2 == 0) {
+      EXPECT_TRUE(harness.daemon().waitForText("start loop."));
+    }
+  }
+  stop = true;
+  sender.join();
+  RecordProperty("rounds", rounds.done());
+  EXPECT_GT(answered, 0);
+  auto sent = client.sendMessageAndWait(message(5), ChildProcess::kPatience);
+  EXPECT_TRUE(sent) << sent.detail;
+  harness.waitForEventsOfMethod(5, 1);
+  EXPECT_EQ(harness.stopDaemon(), 0);
+}
+
+}  // namespace
+}  // namespace vesk::test

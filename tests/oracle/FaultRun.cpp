@@ -1,0 +1,222 @@
+#include "tests/oracle/FaultRun.h"
+
+#include <csignal>
+#include <cstdio>
+#include <stdexcept>
+#include <thread>
+
+#include "tests/oracle/OracleMessage.h"
+
+namespace vesk::test {
+
+namespace {
+
+using namespace std::chrono_literals;
+
+constexpr std::int64_t kIDsPerClient = 10'000'000;
+constexpr int kKilled = 128 + SIGKILL;
+
+constexpr char kStorebag[] = R"(
+version = "2024.1"
+refresh_cycle = 86400
+[[release.httpPost.clients]]
+client = "Oracle"
+locale_whitelist = ["US"]
+sampling_threshold = 1.0
+post_url = "@EVENTS@"
+realtime_post_url = "@EVENTS@/now"
+[[release.httpPost.clients.filters]]
+key = "no such key"
+action = "remove"
+)";
+
+}  // namespace
+
+// Server errors (5xx) are left out: they switch a backend off, and everything after that is a counted drop.
+const FaultRun::Fault FaultRun::kFaults[] = {
+    {8, &FaultRun::answerBadly},     {3, &FaultRun::stallPosts},   {4, &FaultRun::collectorAway},
+    {3, &FaultRun::freezeCollector}, {2, &FaultRun::freezeClient}, {6, &FaultRun::killClient},
+    {5, &FaultRun::terminateDaemon}, {3, &FaultRun::killDaemon},   {1, &FaultRun::terminateDaemonInOutage},
+};
+
+FaultRun::FaultRun(Options options)
+    : _options(options), _random(options.seed), _page((_harness.root / "page").string()) {
+  _harness.writeStorebag("zelko", kStorebag);
+  startDaemon();
+  for (std::size_t i = 0; i < _options.clients; ++i) startClient(i);
+}
+
+void FaultRun::say(const std::string& what) const {
+  const std::chrono::duration<double> since = std::chrono::steady_clock::now() - _begun;
+  std::printf("oracle: %6.1f s  %s\n", since.count(), what.c_str());
+  std::fflush(stdout);
+}
+
+void FaultRun::pause(std::uint64_t least, std::uint64_t most) {
+  std::this_thread::sleep_for(std::chrono::milliseconds(least + _random() % (most - least + 1)));
+}
+
+// --- Faults
+
+void FaultRun::disturb() {
+  while (std::chrono::steady_clock::now() - _begun < _options.duration) {
+    pause(100, 1200);
+    injectOne();
+  }
+}
+
+void FaultRun::injectOne() {
+  unsigned all = 0;
+  for (const Fault& fault : kFaults) all += fault.weight;
+  auto drawn = static_cast<unsigned>(_random() % all);
+  for (const Fault& fault : kFaults) {
+    if (drawn < fault.weight) return (this->*fault.inject)();
+    drawn -= fault.weight;
+  }
+}
+
+void FaultRun::answerBadly() {
+  static constexpr const char* kAnswers[] = {"reset", "close", "garbage", "cut",
+                                             "slow",  "404",   "302",     "empty-body"};
+  const std::string fault =
+      "post=" + std::string(kAnswers[_random() % std::size(kAnswers)]) + "*" + std::to_string(upTo(4));
+  say("collector: " + fault);
+  _harness.setFault(fault);
+}
+
+// Posts that are not answered take the daemon's connections; only the collector's end frees them soon.
+void FaultRun::stallPosts() {
+  const std::string fault = "post=stall*" + std::to_string(upTo(8));
+  say("collector: " + fault + ", then restarted");
+  _harness.setFault(fault);
+  pause(500, 2500);
+  restartCollector();
+}
+
+void FaultRun::collectorAway() {
+  say("collector away");
+  _harness.stopCollector();
+  pause(200, 4000);
+  _harness.startCollector();
+}
+
+void FaultRun::freezeCollector() {
+  say("collector frozen");
+  _harness.collector().signal(SIGSTOP);
+  pause(200, 2000);
+  _harness.collector().signal(SIGCONT);
+}
+
+void FaultRun::freezeClient() {
+  auto& client = *_clients[_random() % _clients.size()];
+  say("client frozen");
+  client.signal(SIGSTOP);
+  pause(200, 2000);
+  client.signal(SIGCONT);
+}
+
+void FaultRun::killClient() {
+  const auto index = static_cast<std::size_t>(_random() % _clients.size());
+  say("client killed, another started");
+  _clients[index]->signal(SIGKILL);
+  if (!clientEnded(index, kKilled)) throw std::runtime_error("a client ended before it was killed");
+  startClient(index);
+}
+
+void FaultRun::terminateDaemon() {
+  say("daemon terminated, another started");
+  endDaemon(DaemonEnd::Terminated);
+  startDaemon();
+}
+
+void FaultRun::killDaemon() {
+  say("daemon killed, another started");
+  endDaemon(DaemonEnd::Killed);
+  startDaemon();
+}
+
+void FaultRun::terminateDaemonInOutage() {
+  say("daemon terminated while the collector is away");
+  _harness.stopCollector();
+  pause(200, 1000);
+  endDaemon(DaemonEnd::Terminated);
+  // Without it, the next daemon would get no storebag, and would not ask again for a quarter of an hour.
+  _harness.startCollector();
+  startDaemon();
+}
+
+// --- Processes
+
+void FaultRun::startDaemon() {
+  ++_page->incarnation;
+  _harness.startDaemon({"--log-level", "6"});
+  RoadClient first(_harness);
+  if (!first.enabled) throw std::runtime_error("no storebag; daemon:\n" + _harness.daemon().errors());
+}
+
+void FaultRun::endDaemon(DaemonEnd end) {
+  auto& daemon = _harness.daemon();
+  daemon.signal(end == DaemonEnd::Killed ? SIGKILL : SIGTERM);
+  const int status = daemon.wait().value_or(-1);
+  if (status != (end == DaemonEnd::Killed ? kKilled : 0)) {
+    throw std::runtime_error("the daemon ended with " + std::to_string(status) + ":\n" + daemon.errors());
+  }
+  _ledger.daemonEnded(_page->incarnation, end, daemon.errors());
+}
+
+void FaultRun::restartCollector() {
+  _harness.stopCollector();
+  _harness.startCollector();
+}
+
+void FaultRun::startClient(std::size_t index) {
+  const auto firstID =
+      kIDsPerClient * (static_cast<std::int64_t>(_options.seed % 10'000) * 1000 + ++_clientsStarted);
+  _clients.resize(std::max(_clients.size(), index + 1));
+  _clients[index] = std::make_unique<ChildProcess>(
+      std::vector<std::string>{"/proc/self/exe", "--client", _harness.socketPath(),
+                               (_harness.root / "page").string(), std::to_string(firstID)});
+}
+
+bool FaultRun::clientEnded(std::size_t index, int status) {
+  auto& client = *_clients[index];
+  const auto ended = client.wait();
+  _ledger.clientReported(client.output());
+  if (ended == status) return true;
+  std::printf("%s\n", client.errors().c_str());
+  return false;
+}
+
+// --- The end
+
+bool FaultRun::judge() {
+  say("no more faults");
+  restartCollector();  // takes the planned faults and the stalled posts with it
+  _page->stop = true;
+  for (std::size_t i = 0; i < _clients.size(); ++i) {
+    if (!clientEnded(i, 0)) throw std::runtime_error("a client does not end as it should");
+  }
+  say("the clients have ended");
+  sendFreshMessage();
+  endDaemon(DaemonEnd::Terminated);
+  say("the daemon has ended");
+  _ledger.readEvents((_harness.root / "events.jsonl").string());
+  return _ledger.judge();
+}
+
+void FaultRun::sendFreshMessage() {
+  constexpr std::int64_t kFresh = 1;
+  RoadClient client(_harness);
+  if (!client.reporting.sendMessageAndWait(OracleMessage(kFresh).parameters(1), ChildProcess::kPatience))
+    throw std::runtime_error("the daemon does not take a fresh message");
+  const auto deadline = std::chrono::steady_clock::now() + ChildProcess::kPatience;
+  while (!_ledger.hasArrived(kFresh)) {
+    if (std::chrono::steady_clock::now() > deadline)
+      throw std::runtime_error("a fresh message does not flow");
+    std::this_thread::sleep_for(20ms);  // between two looks at the file
+    _ledger.readEvents((_harness.root / "events.jsonl").string());
+  }
+  say("a fresh message flows");
+}
+
+}  // namespace vesk::test

@@ -1,0 +1,76 @@
+// What the oracle does to the processes while the clients send.
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <memory>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "tests/oracle/Ledger.h"
+#include "tests/oracle/SharedPage.h"
+#include "tests/support/ChildProcess.h"
+#include "tests/support/DaemonHarness.h"
+
+namespace vesk::test {
+
+/// Runs daemon, collector and clients, and disturbs them by a plan that follows from the seed alone. What a
+/// process does that it should not (a crash, an exit status, an end that takes too long) throws
+/// std::runtime_error.
+class FaultRun {
+ public:
+  struct Options {
+    std::uint64_t seed = 1;
+    std::chrono::seconds duration{25};
+    std::size_t clients = 4;
+  };
+  /// Everything runs once it is made.
+  explicit FaultRun(Options options);
+
+  void disturb();
+  /// Ends the faults and lets everything that is held come out: the clients end, a fresh message arrives, the
+  /// daemon is terminated. True when what had been promised arrived.
+  bool judge();
+
+ private:
+  struct Fault {
+    unsigned weight;
+    void (FaultRun::*inject)();
+  };
+  static const Fault kFaults[];
+
+  void injectOne();
+  void answerBadly();
+  void stallPosts();
+  void collectorAway();
+  void freezeCollector();
+  void freezeClient();
+  void killClient();
+  void terminateDaemon();
+  void killDaemon();
+  void terminateDaemonInOutage();
+
+  void startDaemon();
+  void endDaemon(DaemonEnd end);
+  void restartCollector();
+  void startClient(std::size_t index);
+  /// Waits for it and takes its report; false when it does not end, or ended otherwise than with `status`.
+  bool clientEnded(std::size_t index, int status);
+  void sendFreshMessage();
+
+  void say(const std::string& what) const;
+  std::uint64_t upTo(std::uint64_t most) { return 1 + _random() % most; }
+  void pause(std::uint64_t least, std::uint64_t most);  // milliseconds
+
+  const Options _options;
+  std::mt19937_64 _random;
+  DaemonHarness _harness;
+  const SharedPage _page;
+  Ledger _ledger;
+  std::vector<std::unique_ptr<ChildProcess>> _clients;
+  std::int64_t _clientsStarted = 0;
+  const std::chrono::steady_clock::time_point _begun = std::chrono::steady_clock::now();
+};
+
+}  // namespace vesk::test

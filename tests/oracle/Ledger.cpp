@@ -1,0 +1,97 @@
+#include "tests/oracle/Ledger.h"
+
+#include <boost/json.hpp>
+#include <cinttypes>
+#include <cstdio>
+#include <sstream>
+
+#include "tests/oracle/OracleMessage.h"
+
+namespace vesk::test {
+
+namespace {
+
+constexpr std::string_view kLossLine = "main: Lost since the start: ";
+
+// What the collector should have got, and what no backend was there for; not uploads, datagrams or records.
+bool concernsEvents(std::string_view backend, std::string_view reason) {
+  return backend == "httpPost" || reason == "no-backend" || reason == "invalid-message";
+}
+
+}  // namespace
+
+void Ledger::daemonEnded(std::uint64_t incarnation, DaemonEnd end, std::string_view log) {
+  Account& account = _accounts[incarnation];
+  account.end = end;
+  for (std::size_t at = 0; (at = log.find(kLossLine, at)) != std::string_view::npos;) {
+    at += kLossLine.size();
+    const std::string line(log.substr(at, log.find('\n', at) - at));
+    std::istringstream words(line);
+    std::string backend, reason;
+    std::uint64_t count = 0;
+    if (!(words >> backend >> reason >> count) || !concernsEvents(backend, reason)) continue;
+    account.counted += count;
+    account.reasons += (account.reasons.empty() ? "" : ", ") + line;
+  }
+}
+
+void Ledger::clientReported(std::string_view output) {
+  output = output.substr(0, output.rfind('\n') + 1);  // it may have been killed in the middle of a line
+  std::istringstream words{std::string(output)};
+  std::string word;
+  std::int64_t first = 0, last = 0;
+  std::uint64_t incarnation = 0;
+  while (words >> word >> first >> last >> incarnation) {
+    auto& accepted = _accounts[incarnation].accepted;
+    for (std::int64_t id = first; id <= last; ++id) accepted.push_back(id);
+  }
+}
+
+void Ledger::readEvents(const std::string& path) {
+  std::ifstream file(path, std::ios::binary);
+  file.seekg(_read);
+  for (std::string line; std::getline(file, line) && !file.eof();) {  // at the end: still being written
+    _read += static_cast<std::streamoff>(line.size() + 1);
+    readEvent(line);
+  }
+}
+
+void Ledger::readEvent(const std::string& line) {
+  const auto parsed = boost::json::parse(line);
+  const auto& event = parsed.at("event").as_object();
+  const auto* id = event.if_contains(OracleMessage::kIDKey);
+  if (id == nullptr) return;  // a session's own
+  const std::string change =
+      id->is_int64() ? OracleMessage(id->as_int64()).changeIn(event) : OracleMessage::kIDKey;
+  if (!change.empty()) return _changed.push_back(change + " in " + boost::json::serialize(event));
+  if (!_arrived.insert(id->as_int64()).second) ++_again;
+}
+
+bool Ledger::judge(std::uint64_t incarnation, const Account& account) const {
+  std::uint64_t missing = 0;
+  std::int64_t firstMissing = 0;
+  for (std::int64_t id : account.accepted) {
+    if (_arrived.contains(id)) continue;
+    if (missing++ == 0 || id < firstMissing) firstMissing = id;
+  }
+  const bool isKilled = account.end == DaemonEnd::Killed;
+  std::printf("oracle: daemon %" PRIu64 ": %s, accepted %zu, missing %" PRIu64 ", counted %" PRIu64 "%s%s\n",
+              incarnation, isKilled ? "killed" : "terminated", account.accepted.size(), missing,
+              account.counted, account.reasons.empty() ? "" : ": ", account.reasons.c_str());
+  if (isKilled || missing <= account.counted) return true;
+  std::printf("oracle: LOST: daemon %" PRIu64 " accepted message %" PRId64
+              ", which neither arrived nor was counted\n",
+              incarnation, firstMissing);
+  return false;
+}
+
+bool Ledger::judge() const {
+  bool isGood = _changed.empty();
+  for (const auto& [incarnation, account] : _accounts) isGood = judge(incarnation, account) && isGood;
+  std::printf("oracle: %zu messages arrived, %" PRIu64 " of them more than once, %zu changed\n",
+              _arrived.size(), _again, _changed.size());
+  if (!_changed.empty()) std::printf("oracle: CHANGED: %s\n", _changed.front().c_str());
+  return isGood;
+}
+
+}  // namespace vesk::test

@@ -1,0 +1,73 @@
+#include "tests/oracle/OracleMessage.h"
+
+#include <VeskReporting/VeskReportingKeys.h>
+
+#include <boost/json.hpp>
+
+namespace vesk::test {
+
+namespace {
+
+// Steele, Lea and Flood's mixer: neighbouring numbers get messages that have nothing in common.
+std::uint64_t mixed(std::uint64_t number) {
+  number += 0x9e3779b97f4a7c15U;
+  number = (number ^ (number >> 30)) * 0xbf58476d1ce4e5b9U;
+  number = (number ^ (number >> 27)) * 0x94d049bb133111ebU;
+  return number ^ (number >> 31);
+}
+
+// What a body has to escape, and what it has to leave alone.
+constexpr const char* kPieces[] = {"plain ", "\"quoted\" ", "back\\slash ",     "line\nfeed ",
+                                   "\x01",   "ünïcödé ",    "\xf0\x9f\x9a\x80", "</tag>"};
+
+}  // namespace
+
+OracleMessage::OracleMessage(std::int64_t id) : _id(id), _hash(mixed(static_cast<std::uint64_t>(id))) {}
+
+std::string OracleMessage::text() const {
+  std::string text;
+  // Now and then a long one, which does not go the way of the ordinary ones.
+  const std::size_t pieces = _hash % 97 == 0 ? 2000 : _hash % 20;
+  for (std::uint64_t i = 0; i < pieces; ++i) text += kPieces[mixed(_hash + i) % std::size(kPieces)];
+  return text;
+}
+
+Dictionary OracleMessage::payload() const {
+  return Dictionary{{kIDKey, _id},
+                    {"oracleText", text()},
+                    {"oracleNegative", negative()},
+                    {"oracleLarge", large()},
+                    {"oracleRatio", ratio()},
+                    {"oracleOdd", isOdd()},
+                    {"oracleWhen", Date{ratio()}}};
+}
+
+Dictionary OracleMessage::parameters(int flag) const {
+  return Dictionary{{kVeskReportingMessageParametersCategory, static_cast<unsigned>(category())},
+                    {kVeskReportingMessageParametersType, static_cast<unsigned>(type())},
+                    {kVeskReportingMessageParametersPayload, payload()},
+                    {kVeskReportingMessageParametersFlag, flag}};
+}
+
+std::string OracleMessage::changeIn(const boost::json::object& event) const {
+  auto differs = [&](const char* key, auto isRight) {
+    const auto* value = event.if_contains(key);
+    return value == nullptr || !isRight(*value);
+  };
+  using JSON = boost::json::value;
+  if (differs(kIDKey, [&](const JSON& v) { return v == _id; })) return kIDKey;
+  if (differs("oracleText", [&](const JSON& v) { return v == boost::json::string(text()); }))
+    return "oracleText";
+  if (differs("oracleNegative", [&](const JSON& v) { return v == negative(); })) return "oracleNegative";
+  if (differs("oracleLarge", [&](const JSON& v) { return v == large(); })) return "oracleLarge";
+  if (differs("oracleRatio",
+              [&](const JSON& v) { return v.is_number() && v.to_number<double>() == ratio(); }))
+    return "oracleRatio";
+  if (differs("oracleOdd", [&](const JSON& v) { return v == isOdd(); })) return "oracleOdd";
+  if (differs("oracleWhen", [&](const JSON& v) { return v.is_number() && v.to_number<double>() == ratio(); }))
+    return "oracleWhen";
+  if (differs("_method", [&](const JSON& v) { return v == category(); })) return "_method";
+  return "";
+}
+
+}  // namespace vesk::test
