@@ -8,7 +8,6 @@
 #include <filesystem>
 #include <system_error>
 
-#include "platform/files/FileDescriptor.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
@@ -71,6 +70,8 @@ int PowerLogStore::open() {
   _database.reset(database);
   _opened = fileAtPath();
   if (result != SQLITE_OK) return result;
+  // Of two processes that turn a new file to WAL at once, SQLite lets one fail without waiting.
+  FileDescriptor lock = lockOthersOut();
   sqlite3_extended_result_codes(database, 1);
   sqlite3_busy_timeout(database, kBusyMilliseconds);
   result = execute(database, kSetUp);
@@ -137,10 +138,15 @@ std::int64_t PowerLogStore::pragma(const char* name) {
   return sqlite3_column_int64(statement.get(), 0);
 }
 
-void PowerLogStore::setAside() {
-  _database.reset();
+FileDescriptor PowerLogStore::lockOthersOut() const {
   FileDescriptor lock(::open((_path + ".lock").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
   if (lock) ::flock(lock.get(), LOCK_EX);
+  return lock;
+}
+
+void PowerLogStore::setAside() {
+  _database.reset();
+  FileDescriptor lock = lockOthersOut();
   // Another process may have found the same damage first.
   if (!(fileAtPath() == _opened)) return;
   const std::string aside = _path + ".corrupt";

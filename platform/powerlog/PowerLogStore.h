@@ -8,6 +8,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/files/FileDescriptor.h"
 #include "platform/powerlog/PowerLogEvent.h"
 #include "platform/powerlog/SQLiteHandles.h"
 
@@ -45,6 +46,8 @@ class PowerLogStore {
   int remove(const char* statement, std::int64_t bound);
   std::int64_t pragma(const char* name);
   void setAside();
+  /// Other processes neither set up the file nor put it aside while it is held.
+  FileDescriptor lockOthersOut() const;
   Identity fileAtPath() const;
 
   const std::string _path;
