@@ -152,9 +152,10 @@ TEST_F(DashboardRoad, AnEndedSessionLeavesNoDescriptorBehind) {
       if (!answered) _harness->stopCollector();
     }
     expectNoDatagramDescriptors();
-    EXPECT_EQ(
-        _harness->daemon().errors().find("scheduled last resort clean-up in 9500 ms.") != std::string::npos,
-        !answered);
+    // A tick may also come between a datagram and its answer.
+    if (answered) continue;
+    EXPECT_NE(_harness->daemon().errors().find("scheduled last resort clean-up in 9500 ms."),
+              std::string::npos);
   }
 }
 
