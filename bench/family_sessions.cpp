@@ -1,8 +1,8 @@
 // Holds many sessions in families, for bench/family_cost.
 //
-// Usage: family_sessions SOCKET FIRST COUNT
-// Starts the sessions FIRST to FIRST + COUNT - 1, five to a family in three levels, prints "ready", and ends
-// them with its standard input.
+// Usage: family_sessions SOCKET FIRST COUNT [FAMILY-SIZE]
+// Starts the sessions FIRST to FIRST + COUNT - 1, five (or at most that many) to a family in three levels,
+// prints "ready", and ends them with its standard input.
 #include <VeskReporting/VeskReporting.h>
 #include <VeskReporting/VeskReportingKeys.h>
 
@@ -14,19 +14,19 @@
 
 namespace {
 
-constexpr long kFamily = 5;
-constexpr int kLevels[kFamily] = {0, 1, 1, 2, 2};
+constexpr long kLargestFamily = 5;
+constexpr int kLevels[kLargestFamily] = {0, 1, 1, 2, 2};
 
-std::unique_ptr<vesk::VeskReporting> startSession(const char* socket, long number) {
+std::unique_ptr<vesk::VeskReporting> startSession(const char* socket, long number, long familySize) {
   vesk::ReportingOptions options;
   options.socketPath = socket;
   auto session = std::make_unique<vesk::VeskReporting>(options);
   const vesk::Dictionary user{
-      {vesk::kVeskReportingUserInfoClientName, "Family " + std::to_string(number / kFamily)},
+      {vesk::kVeskReportingUserInfoClientName, "Family " + std::to_string(number / familySize)},
       {vesk::kVeskReportingUserInfoServiceName, "Bench"}};
   auto configured = session->setSessionInfo(
       vesk::Dictionary{{vesk::kVeskReportingSessionInfoSessionID, number},
-                       {vesk::kVeskReportingSessionInfoClientType, 5 + kLevels[number % kFamily]},
+                       {vesk::kVeskReportingSessionInfoClientType, 5 + kLevels[number % familySize]},
                        {vesk::kVeskReportingSessionInfoRequireUserInfo, true},
                        {vesk::kVeskReportingSessionInfoBatchEvent, true}},
       user);
@@ -45,9 +45,11 @@ int main(int argc, char** argv) {
   if (argc < 4) return 2;
   const long first = std::strtol(argv[2], nullptr, 10);
   const long count = std::strtol(argv[3], nullptr, 10);
+  const long familySize = argc > 4 ? std::strtol(argv[4], nullptr, 10) : kLargestFamily;
+  if (familySize < 1 || familySize > kLargestFamily) return 2;
   std::vector<std::unique_ptr<vesk::VeskReporting>> sessions;
   for (long number = first; number < first + count; ++number) {
-    sessions.push_back(startSession(argv[1], number));
+    sessions.push_back(startSession(argv[1], number, familySize));
     if (!sessions.back()) return 1;
   }
   std::puts("ready");

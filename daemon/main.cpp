@@ -1,6 +1,4 @@
 // veskreportingd: accepts reporting messages from local clients and delivers them.
-#include <malloc.h>
-
 #include <cstdio>
 #include <exception>
 
@@ -11,6 +9,7 @@
 #include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
 #include "platform/sandbox/Sandbox.h"
+#include "platform/service/ProcessMemory.h"
 #include "platform/service/SchedulingClass.h"
 
 namespace {
@@ -18,14 +17,6 @@ namespace {
 constexpr char kServiceName[] = "com.corvane.veskreportingd";
 constexpr std::chrono::seconds kIdleExitWhenActivated{
     300};  // the manager starts us again on the next connection
-
-/// A busy thread frees a batch's buffers a thousand times a second. Without these it would give their pages
-/// back to the kernel and fetch them again each time, and each of many threads would hoard some of its own.
-void setUpAllocator() {
-  ::mallopt(M_TRIM_THRESHOLD, 512 * 1024);
-  ::mallopt(M_MMAP_THRESHOLD, 512 * 1024);
-  ::mallopt(M_ARENA_MAX, 4);
-}
 
 int run(const vesk::DaemonOptions& options) {
   vesk::enterSchedulingClass(vesk::SchedulingClass::Utility, 0);
@@ -47,6 +38,7 @@ int run(const vesk::DaemonOptions& options) {
   VESK_LOG_INFO("%s", options.sandbox ? "main: Listener resumes with sandbox, start loop."
                                       : "main: Listener resumes without sandbox, start loop.");
   serviceManager.notifyReady();
+  vesk::releaseStartUpPages();
   loop.run();
   serviceManager.notifyStopping();
   daemon.stop();
@@ -60,7 +52,7 @@ int main(int argc, char** argv) {
   auto parsed = vesk::parseDaemonOptions(argc, argv);
   if (const int* status = std::get_if<int>(&parsed)) return *status;
   const auto& options = std::get<vesk::DaemonOptions>(parsed);
-  setUpAllocator();
+  vesk::setUpAllocator();
   if (options.root) vesk::setRootPrefix(*options.root);
   vesk::SystemLog::setLevel(options.logLevel);
   try {

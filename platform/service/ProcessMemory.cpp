@@ -1,0 +1,40 @@
+#include "platform/service/ProcessMemory.h"
+
+#include <link.h>
+#include <malloc.h>
+#include <sys/mman.h>
+#include <unistd.h>
+
+#include <cstdint>
+
+namespace vesk {
+
+namespace {
+
+constexpr int kKept = 512 * 1024;  // bytes at the top of a heap, and the least that is mapped by itself
+constexpr int kMostArenas = 4;
+
+/// Only what is never written, and so can come back from its file unchanged.
+int releaseObject(dl_phdr_info* object, std::size_t, void*) {
+  const auto page = static_cast<std::uintptr_t>(::sysconf(_SC_PAGESIZE));
+  for (int i = 0; i < object->dlpi_phnum; ++i) {
+    const auto& segment = object->dlpi_phdr[i];
+    if (segment.p_type != PT_LOAD || (segment.p_flags & PF_W) != 0) continue;
+    const std::uintptr_t start = object->dlpi_addr + segment.p_vaddr;
+    const std::uintptr_t begin = start / page * page;
+    ::madvise(reinterpret_cast<void*>(begin), start + segment.p_memsz - begin, MADV_DONTNEED);
+  }
+  return 0;
+}
+
+}  // namespace
+
+void setUpAllocator() noexcept {
+  ::mallopt(M_TRIM_THRESHOLD, kKept);
+  ::mallopt(M_MMAP_THRESHOLD, kKept);
+  ::mallopt(M_ARENA_MAX, kMostArenas);
+}
+
+void releaseStartUpPages() noexcept { ::dl_iterate_phdr(&releaseObject, nullptr); }
+
+}  // namespace vesk
