@@ -98,6 +98,7 @@ TEST_F(Preferences, ThatAreUnusableCountAsEmptyWithOneLine) {
   for (int i = 0; i < 300'000; ++i) dots += ".a";
   const std::string contents[] = {"a = ",
                                   "a = \"\xFF\"",
+                                  "\xC3\xA9 = 1",
                                   "a = 1\na = 2\n",
                                   std::string("a = \"\0\"", 7),
                                   dots + " = 1",

@@ -1,16 +1,12 @@
 #include "platform/preferences/TomlFile.h"
 
-#define TOML_MAX_NESTED_VALUES 32
-#define TOML_EXCEPTIONS 0
-#define TOML_ENABLE_FORMATTERS 0
-#include <toml++/toml.h>
-
 #include <algorithm>
 #include <chrono>
 #include <sstream>
 
 #include "platform/files/SmallFile.h"
 #include "platform/log/SystemLog.h"
+#include "platform/preferences/TomlLibrary.h"
 
 namespace vesk {
 

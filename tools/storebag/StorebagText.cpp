@@ -5,13 +5,9 @@
 #include <sstream>
 #include <stdexcept>
 
-// As the platform layer's reader sets them: both are part of one program.
-#define TOML_MAX_NESTED_VALUES 32
-#define TOML_EXCEPTIONS 0
-#include <toml++/toml.h>
-
 #include "platform/crypto/Base64.h"
 #include "platform/json/JSONWriter.h"
+#include "platform/preferences/TomlLibrary.h"
 
 namespace vesk {
 
