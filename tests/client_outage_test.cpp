@@ -1,22 +1,15 @@
-#include <VeskReporting/VeskReporting.h>
-#include <gtest/gtest.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <future>
-#include <optional>
 
 #include "client/ReconnectPolicy.h"
-#include "tests/support/RecordingDaemon.h"
-#include "tests/support/TempDirectory.h"
+#include "tests/support/ClientHarness.h"
 
 namespace vesk::test {
 namespace {
 
 using namespace std::chrono_literals;
-
-const Dictionary kSessionInfo{{kVeskReportingSessionInfoSessionID, 7U},
-                              {kVeskReportingSessionInfoClientType, 3}};
 
 // ThreadSanitizer ends a process that does.
 #if defined(__SANITIZE_THREAD__)
@@ -25,22 +18,7 @@ constexpr bool kMayStartThreadsAfterFork = false;
 constexpr bool kMayStartThreadsAfterFork = true;
 #endif
 
-class ClientOutage : public testing::Test {
- protected:
-  ReportingOptions options() const {
-    ReportingOptions options;
-    options.socketPath = socket;
-    options.firstReconnectWait = 5ms;
-    options.lastReconnectWait = 20ms;
-    options.drainTime = 1min;
-    return options;
-  }
-
-  TempDirectory directory;
-  std::string socket = directory / "run/socket";
-  Record record;
-  std::optional<RecordingDaemon> daemon;
-};
+using ClientOutage = ClientHarness;
 
 TEST_F(ClientOutage, SaysThatNoDaemonIsThere) {
   // Its end must not take the drain time: there never was a daemon.
@@ -56,7 +34,7 @@ TEST_F(ClientOutage, SaysThatNoDaemonIsThere) {
 TEST_F(ClientOutage, SendsInOrderWhatWasQueuedBeforeTheDaemonWasThere) {
   VeskReporting session(options());
   EXPECT_FALSE(session.connect());
-  EXPECT_EQ(session.setSessionInfo(kSessionInfo), ReportingStatus::Queued);
+  EXPECT_EQ(session.setSessionInfo(sessionInfo), ReportingStatus::Queued);
   for (std::uint16_t i = 0; i < 100; ++i) EXPECT_EQ(session.sendMessage(1, i), ReportingStatus::Queued);
   daemon.emplace(socket, record);
   EXPECT_TRUE(session.flushMessagesAndWait());
@@ -72,7 +50,7 @@ TEST_F(ClientOutage, ConfiguresAndStartsAgainBeforeItSendsWhatIsQueued) {
   const Dictionary user{{kVeskReportingUserInfoClientName, "second"}};
   daemon.emplace(socket, record);
   VeskReporting session(options());
-  EXPECT_EQ(session.setSessionInfo(kSessionInfo, Dictionary{{kVeskReportingUserInfoClientName, "first"}}),
+  EXPECT_EQ(session.setSessionInfo(sessionInfo, Dictionary{{kVeskReportingUserInfoClientName, "first"}}),
             ReportingStatus::Queued);
   EXPECT_TRUE(session.startConfig());
   EXPECT_TRUE(session.fetchStates(user));
@@ -82,10 +60,10 @@ TEST_F(ClientOutage, ConfiguresAndStartsAgainBeforeItSendsWhatIsQueued) {
     std::size_t before = record.lines().size();
     EXPECT_EQ(session.sendMessage(9, static_cast<std::uint16_t>(restart)), ReportingStatus::Queued);
     daemon.emplace(socket, record);
-    ASSERT_TRUE(record.waitForLine("message 9 " + std::to_string(restart)));
+    ASSERT_TRUE(record.waitFor("message 9 " + std::to_string(restart)));
     auto lines = record.lines();
     ASSERT_EQ(lines.size(), before + 3);
-    EXPECT_EQ(lines[before], "setSessionInfo " + describe(kSessionInfo) + " " + describe(user) + " []");
+    EXPECT_EQ(lines[before], "setSessionInfo " + describe(sessionInfo) + " " + describe(user) + " []");
     EXPECT_EQ(lines[before + 1], "startConfig");
   }
 }
@@ -93,11 +71,11 @@ TEST_F(ClientOutage, ConfiguresAndStartsAgainBeforeItSendsWhatIsQueued) {
 TEST_F(ClientOutage, ReturnsToTheDaemonWithoutBeingAsked) {
   daemon.emplace(socket, record);
   VeskReporting session(options());
-  EXPECT_EQ(session.setSessionInfo(kSessionInfo), ReportingStatus::Queued);
+  EXPECT_EQ(session.setSessionInfo(sessionInfo), ReportingStatus::Queued);
   EXPECT_TRUE(session.startConfig());
   daemon.reset();
   daemon.emplace(socket, record);
-  EXPECT_TRUE(record.waitForCount("startConfig", 2));
+  EXPECT_TRUE(record.waitFor("startConfig", 2));
 }
 
 TEST_F(ClientOutage, EndsTheCallsThatALostDaemonOwes) {
@@ -105,7 +83,7 @@ TEST_F(ClientOutage, EndsTheCallsThatALostDaemonOwes) {
   daemon.emplace(socket, record);
   VeskReporting session(options());
   auto answer = std::async(std::launch::async, [&] { return session.fetchDisplayURL(); });
-  ASSERT_TRUE(record.waitForLine("fetchDisplayURL"));
+  ASSERT_TRUE(record.waitFor("fetchDisplayURL"));
   daemon.reset();
   EXPECT_EQ(answer.get().status, ReportingStatus::NotConnected);
 }
@@ -140,7 +118,7 @@ TEST_F(ClientOutage, HasRoomAgainOnceTheDaemonTookWhatWaited) {
   EXPECT_EQ(session.sendMessage(1, 2), ReportingStatus::Queued);
   EXPECT_EQ(session.sendMessage(1, 3), ReportingStatus::QueueFull);
   daemon.emplace(socket, record);
-  ASSERT_TRUE(record.waitForCount("message", 2));
+  ASSERT_TRUE(record.waitFor("message", 2));
   auto sent = session.flushMessagesAndWait();
   for (int i = 0; i < 100 && sent.status == ReportingStatus::QueueFull; ++i) {
     ASSERT_TRUE(session.connect());  // a round through the session's thread

@@ -1,6 +1,5 @@
 #include <gtest/gtest.h>
 #include <utime.h>
-#include <zlib.h>
 
 #include "tests/support/TempDirectory.h"
 #include "tools/collector/ControlEndpoint.h"
@@ -10,25 +9,14 @@
 #include "tools/collector/UploadsEndpoint.h"
 #include "tools/json/JSONReader.h"
 #include "tools/storebag/StorebagDocument.h"
+#include "util/Gzip.h"
 
 namespace vesk {
 namespace {
 
 using test::TempDirectory;
 
-std::string gzip(const std::string& text) {
-  z_stream stream{};
-  deflateInit2(&stream, Z_DEFAULT_COMPRESSION, Z_DEFLATED, 16 + MAX_WBITS, 8, Z_DEFAULT_STRATEGY);
-  std::string out(deflateBound(&stream, text.size()), '\0');
-  stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(text.data()));
-  stream.avail_in = static_cast<uInt>(text.size());
-  stream.next_out = reinterpret_cast<Bytef*>(out.data());
-  stream.avail_out = static_cast<uInt>(out.size());
-  EXPECT_EQ(deflate(&stream, Z_FINISH), Z_STREAM_END);
-  out.resize(stream.total_out);
-  deflateEnd(&stream);
-  return out;
-}
+std::string gzip(const std::string& text) { return gzipDeflate(text).value(); }
 
 HTTPReceived request(std::string method, std::string target, HTTPHeaderList headers = {},
                      std::string body = {}) {

@@ -3,16 +3,12 @@
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 
-#include <algorithm>
 #include <atomic>
-#include <chrono>
-#include <string>
 #include <thread>
-#include <vector>
 
 #include "platform/files/FileDescriptor.h"
-#include "platform/http/HTTPClient.h"
 #include "tests/support/CapturedLog.h"
+#include "tests/support/HTTPRequests.h"
 #include "tests/support/RecordingServer.h"
 
 namespace vesk::test {
@@ -23,18 +19,6 @@ using Fault = HTTPAnswer::Fault;
 using Kind = HTTPError::Kind;
 using Bodies = std::vector<std::string>;
 
-HTTPRequest request(const std::string& url, HTTPRequest::Retry retry, std::string body = "event") {
-  HTTPRequest made;
-  made.method = "POST";
-  made.url = url;
-  made.body = std::move(body);
-  made.retry = retry;
-  return made;
-}
-HTTPRequest post(const std::string& url, std::string body = "event") {
-  return request(url, HTTPRequest::Retry::UntilSent, std::move(body));
-}
-
 /// Impatient, so that tests do not wait.
 HTTPClient::Options quick() { return {.retryFor = 60s, .firstRetryAfter = 5ms}; }
 
@@ -44,7 +28,7 @@ TEST(HTTPOutage, APostThatWasCutOffIsSentAgainUntilItIsAnswered) {
       return count < 3 ? faulty(fault) : HTTPAnswer::text(200, "ok");
     });
     HTTPClient client(quick());
-    auto result = client.perform(post(server.url()));
+    auto result = client.perform(postTo(server.url()));
     ASSERT_TRUE(result.response) << result.error->description;
     EXPECT_EQ(server.bodies(), Bodies(4, "event"));
   }
@@ -54,7 +38,7 @@ TEST(HTTPOutage, AKeptConnectionThatTheServerClosedCostsNothing) {
   RecordingServer server([](const HTTPReceived&, std::size_t) { return faulty(Fault::CloseAfterAnswer); });
   HTTPClient client(quick());
   for (int i = 0; i < 10; ++i) {
-    auto result = client.perform(post(server.url(), std::to_string(i)));
+    auto result = client.perform(postTo(server.url(), std::to_string(i)));
     ASSERT_TRUE(result.response) << result.error->description;
   }
   EXPECT_EQ(server.bodies(), (Bodies{"0", "1", "2", "3", "4", "5", "6", "7", "8", "9"}));
@@ -64,13 +48,13 @@ TEST(HTTPOutage, NothingIsLostWhileTheServerIsDown) {
   CapturedLog log;
   RecordingServer server;
   HTTPClient client(quick());
-  ASSERT_TRUE(client.perform(post(server.url(), "before")).response);
+  ASSERT_TRUE(client.perform(postTo(server.url(), "before")).response);
   server.stop();
   std::atomic<int> answered{0};
   Bodies expected{"before"};
   for (int i = 0; i < 40; ++i) {
     expected.push_back("event " + std::to_string(i));
-    client.start(post(server.url(), expected.back()),
+    client.start(postTo(server.url(), expected.back()),
                  [&](const HTTPResult& result) { answered += result.response ? 1 : 0; });
   }
   while (log.countContaining(6, "no answer from " + server.server().baseURL()) == 0) {
@@ -92,14 +76,15 @@ TEST(HTTPOutage, AnUploadOrFetchIsSentOnceEvenOnAKeptConnection) {
     return received.body == "event" ? HTTPAnswer::text(200, "ok") : faulty(Fault::ResetBeforeAnswer);
   });
   HTTPClient client(quick());
-  ASSERT_TRUE(client.perform(post(server.url())).response);
-  auto result = client.perform(request(server.url(), HTTPRequest::Retry::Never, "upload"));
+  ASSERT_TRUE(client.perform(postTo(server.url())).response);
+  auto result = client.perform(postTo(server.url(), "upload", HTTPRequest::Retry::Never));
   ASSERT_TRUE(result.error);
   EXPECT_EQ(result.error->kind, Kind::Interrupted);
   EXPECT_EQ(server.bodies(), (Bodies{"event", "upload"}));
 
   server.stop();
-  EXPECT_EQ(client.perform(request(server.url(), HTTPRequest::Retry::Never)).error->kind, Kind::Connect);
+  EXPECT_EQ(client.perform(postTo(server.url(), "upload", HTTPRequest::Retry::Never)).error->kind,
+            Kind::Connect);
 }
 
 TEST(HTTPOutage, WhatWasAnsweredIsNeverSentAgain) {
@@ -108,7 +93,7 @@ TEST(HTTPOutage, WhatWasAnsweredIsNeverSentAgain) {
         faulty(Fault::CloseMidAnswer), faulty(Fault::ResetMidAnswer), faulty(Fault::Garbage)}) {
     RecordingServer server([&](const HTTPReceived&, std::size_t) { return answer; });
     HTTPClient client(quick());
-    auto result = client.perform(post(server.url()));
+    auto result = client.perform(postTo(server.url()));
     EXPECT_EQ(result.response.has_value(), answer.fault == Fault::None);
     EXPECT_NE(result.response.has_value(), result.error.has_value());
     EXPECT_EQ(server.count(), 1u);
@@ -118,7 +103,7 @@ TEST(HTTPOutage, WhatWasAnsweredIsNeverSentAgain) {
 TEST(HTTPOutage, AServerThatHasThePostAndStallsDoesNotGetItTwice) {
   RecordingServer server([](const HTTPReceived&, std::size_t) { return faulty(Fault::Stall); });
   HTTPClient client(quick());
-  auto stalled = post(server.url());
+  auto stalled = postTo(server.url());
   stalled.timeout = 100ms;
   EXPECT_EQ(client.perform(stalled).error->kind, Kind::Timeout);
   EXPECT_EQ(server.count(), 1u);
@@ -139,20 +124,11 @@ TEST(HTTPOutage, AConnectionThatTakesTooLongIsTriedAgain) {
   auto options = quick();
   options.connectTimeout = 20ms;
   HTTPClient client(options);
-  client.start(post("https://127.0.0.1:" + std::to_string(ntohs(address.sin_port))),
+  client.start(postTo("https://127.0.0.1:" + std::to_string(ntohs(address.sin_port))),
                [](const HTTPResult& result) { EXPECT_EQ(result.error->kind, Kind::Stopped); });
   FileDescriptor first(::accept(listener.get(), nullptr, nullptr));
   FileDescriptor second(::accept(listener.get(), nullptr, nullptr));
   EXPECT_TRUE(first && second);
-}
-
-TEST(HTTPOutage, PostsAreGivenUpWhenTheTimeIsOver) {
-  RecordingServer server;
-  server.stop();
-  HTTPClient client(HTTPClient::Options{.retryFor = 60ms, .firstRetryAfter = 5ms});
-  auto result = client.perform(post(server.url()));
-  ASSERT_TRUE(result.error);
-  EXPECT_EQ(result.error->kind, Kind::Connect);
 }
 
 TEST(HTTPOutage, PostsAreGivenUpWhenTooMuchWaits) {
@@ -164,7 +140,7 @@ TEST(HTTPOutage, PostsAreGivenUpWhenTooMuchWaits) {
   std::atomic<int> answered{0};
   constexpr int kPosts = 30;
   for (int i = 0; i < kPosts; ++i) {
-    client.start(post(server.url(), std::string(1u << 20, 'x')), [&](const HTTPResult& result) {
+    client.start(postTo(server.url(), std::string(1u << 20, 'x')), [&](const HTTPResult& result) {
       if (result.response) ++answered;
       if (result.error && result.error->kind == Kind::Connect) ++refused;
     });

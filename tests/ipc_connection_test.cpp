@@ -1,63 +1,21 @@
 // The daemon's and the client's end of the IPC layer over real sockets: calls, answers, life cycle.
 #include <gtest/gtest.h>
 #include <sys/socket.h>
-#include <unistd.h>
-
-#include <filesystem>
-#include <thread>
 
 #include "client/protocol/ClientSessionReplyProxy.h"
 #include "platform/ipc/ExtensionTokens.h"
 #include "platform/ipc/UnixSocket.h"
+#include "tests/support/CapturedLog.h"
 #include "tests/support/IPCHarness.h"
+#include "tests/support/ProcessFacts.h"
 
 namespace vesk::test {
 namespace {
 
 using namespace std::chrono_literals;
 
-const std::optional<Dictionary> kAbsent;
-
 std::vector<IPCArgument> message(int number, const char* action = "", std::size_t filling = 0) {
   return {Dictionary{{"n", number}, {"do", action}, {"filling", std::string(filling, 'x')}}};
-}
-
-TEST(IPCConnection, ServesEveryMember) {
-  TestService service;
-  TestClient client(service);
-  const Dictionary info{{"id", 1}};
-  const std::optional<Dictionary> user = Dictionary{{"name", "x"}};
-  struct Case {
-    const char* member;
-    std::vector<IPCArgument> arguments;
-    const char* answer;
-    const char* journalled;
-  };
-  const Case cases[] = {
-      {"setSessionInfo",
-       {info, user, std::vector<std::string>{"f"}, true},
-       "done",
-       R"(setSessionInfo {"id": 1} {"name": "x"} ["f"] true)"},
-      {"startConfigWithCompletionHandler", {}, "one,two", "start"},
-      {"fetchStatesWithUserInfo", {kAbsent}, "absent", "fetchStates absent"},
-      {"fetchDisplayURL", {}, "https://display", "fetchDisplayURL"},
-      {"sendMessageWithCategory",
-       {std::uint16_t{5}, std::uint16_t{6}, user},
-       "absent",
-       R"(category 5 6 {"name": "x"})"},
-      {"sendMessageWithDictionary", message(7), "7", "message 7"},
-      {"flushMessagesWithReply", {}, "flushed", "flush"},
-      {"uploadFileAtPath", {std::string("file:///f"), IPCDescriptor{}}, "true", "upload file:///f "},
-      {"uploadLogData", {List{1, "two"}}, "false", R"(log [1, "two"])"},
-      {"sendMessageWithSessionInfo",
-       {info, kAbsent, std::uint16_t{1}, std::uint16_t{2}, kAbsent},
-       "finished",
-       R"(single {"id": 1} absent 1 2 absent)"},
-  };
-  for (const auto& test : cases) {
-    EXPECT_EQ(client.call(test.member, test.arguments), test.answer) << test.member;
-    EXPECT_EQ(service.journal.lines().back(), test.journalled);
-  }
 }
 
 TEST(IPCConnection, ServesPipelinedCallsInOrder) {
@@ -66,7 +24,7 @@ TEST(IPCConnection, ServesPipelinedCallsInOrder) {
   // Long ones take another way through the daemon than short ones.
   for (int i = 0; i < 2000; ++i)
     client.post("sendMessageWithDictionary", message(i, "", i % 7 == 0 ? 10'000 : 0));
-  EXPECT_EQ(client.call("flushMessagesWithReply"), "flushed");
+  EXPECT_EQ(client.call("flushMessagesWithReply"), "posted all");
   auto lines = service.journal.lines();
   ASSERT_EQ(lines.size(), 2002u);
   for (int i = 0; i < 2000; ++i)
@@ -76,7 +34,7 @@ TEST(IPCConnection, ServesPipelinedCallsInOrder) {
 TEST(IPCConnection, CallsTheClientInOrderFromAnyThread) {
   TestService service;
   TestClient client(service);
-  ASSERT_EQ(client.call("flushMessagesWithReply"), "flushed");
+  ASSERT_EQ(client.call("flushMessagesWithReply"), "posted all");
   std::thread other([&] {
     ClientSessionReplyProxy proxy(service.connection(),
                                   [](const std::string& error) { ADD_FAILURE() << error; });
@@ -85,12 +43,12 @@ TEST(IPCConnection, CallsTheClientInOrderFromAnyThread) {
   });
   EXPECT_TRUE(client.runUntil([&] { return client.received.size() == 100; }));
   other.join();
-  EXPECT_EQ(client.received[0], R"(sendMessageToClient {"i": 0} 0.5 0 9 absent)");
-  EXPECT_EQ(client.received[99], R"(sendMessageToClient {"i": 99} 0.5 99 9 absent)");
+  EXPECT_EQ(client.received[0], R"(sendMessageToClient {"i": 0} 0.5 0 9 none)");
+  EXPECT_EQ(client.received[99], R"(sendMessageToClient {"i": 99} 0.5 99 9 none)");
 }
 
 TEST(IPCConnection, AnswersWhatCannotBeServedWithAnError) {
-  LogCapture log;
+  CapturedLog log;
   TestService service;
   TestClient client(service);
   EXPECT_EQ(client.call("sendMessageWithDictionary", message(1, "abandon")), "NoReply");
@@ -99,18 +57,18 @@ TEST(IPCConnection, AnswersWhatCannotBeServedWithAnError) {
   EXPECT_EQ(client.call("fetchDisplayURL", {true}), "InvalidArgs");
   EXPECT_EQ(client.call("sendMessageWithDictionary", {List{}}), "InvalidArgs");
   EXPECT_EQ(client.call("flushMessagesWithReply", {}, "com.corvane.Other"), "UnknownInterface");
-  EXPECT_EQ(client.call("flushMessagesWithReply"), "flushed") << "the connection goes on";
-  EXPECT_EQ(log.lines().count("3 ipc: connection"), 1u) << "the exception";
+  EXPECT_EQ(client.call("flushMessagesWithReply"), "posted all") << "the connection goes on";
+  EXPECT_EQ(log.countContaining(3, "ipc: connection"), 1) << "the exception";
 }
 
 TEST(IPCConnection, DropsWrongOneWayCallsWithOneLineABurst) {
-  LogCapture log;
+  CapturedLog log;
   TestService service;
   TestClient client(service);
   for (int i = 0; i < 10; ++i) client.post("sendMessageWithDictionary", {true});
   client.post("noSuchMember");
-  EXPECT_EQ(client.call("flushMessagesWithReply"), "flushed");
-  EXPECT_EQ(log.lines().count("4 "), 1u);
+  EXPECT_EQ(client.call("flushMessagesWithReply"), "posted all");
+  EXPECT_EQ(log.countContaining(4, ""), 1);
   EXPECT_EQ(service.journal.count("message"), 0u);
 }
 
@@ -129,6 +87,10 @@ TEST(IPCConnection, TellsWhatThereIs) {
   TestService service;
   TestClient client(service);
   EXPECT_EQ(client.call("Ping", {}, "org.freedesktop.DBus.Peer"), "done");
+  EXPECT_EQ(client.call("setSessionInfo",
+                        {Dictionary(), std::optional<Dictionary>(), std::vector<std::string>(), false}),
+            "done")
+      << "also to those who ask for an answer";
   auto xml = client.call("Introspect", {}, "org.freedesktop.DBus.Introspectable");
   for (const auto* member :
        {&wire::kSetSessionInfo, &wire::kUploadFile, &wire::kSendMessageWithSessionInfo}) {
@@ -182,7 +144,7 @@ TEST(IPCConnection, ServesWhatAClientSentBeforeItLeftItsAnswersUnread) {
   TestService service;
   {
     TestClient client(service);
-    ASSERT_EQ(client.call("flushMessagesWithReply"), "flushed");
+    ASSERT_EQ(client.call("flushMessagesWithReply"), "posted all");
     for (int i = 0; i < 300; ++i) {
       ASSERT_EQ(
           client.bus().send(
@@ -216,7 +178,7 @@ TEST(IPCConnection, GivesTheClientTheLastWordOfASessionThatIsSentAway) {
   std::thread stopping([&] { service.listener().stop(); });
   EXPECT_TRUE(client.runToEnd());
   stopping.join();
-  EXPECT_EQ(client.received, (std::vector<std::string>{"sendMessageToClient absent 0 0 0 absent"}));
+  EXPECT_EQ(client.received, (std::vector<std::string>{"sendMessageToClient none 0 0 0 none"}));
   EXPECT_EQ(service.journal.lines().back(), "destroyed");
 }
 
@@ -243,14 +205,10 @@ TEST(IPCConnection, RunsNoHandlerWhenItIsNeverResumed) {
   }
 }
 
-std::size_t entriesOf(const char* directory) {
-  auto entries = std::filesystem::directory_iterator(directory);
-  return static_cast<std::size_t>(std::distance(begin(entries), end(entries)));
-}
-
 TEST(IPCListener, LeavesNeitherThreadNorDescriptorBehind) {
-  const std::size_t descriptors = entriesOf("/proc/self/fd");
-  const std::size_t threads = entriesOf("/proc/self/task");
+  const ProcessFacts facts(::getpid());
+  const std::size_t descriptors = facts.descriptors();
+  const std::size_t threads = facts.threads();
   {
     TestService service;
     std::vector<std::unique_ptr<TestClient>> clients;
@@ -265,8 +223,8 @@ TEST(IPCListener, LeavesNeitherThreadNorDescriptorBehind) {
     service.listener().stop();
     for (auto& client : clients) EXPECT_TRUE(client->runToEnd());
   }
-  EXPECT_EQ(entriesOf("/proc/self/fd"), descriptors);
-  EXPECT_EQ(entriesOf("/proc/self/task"), threads);
+  EXPECT_EQ(facts.descriptors(), descriptors);
+  EXPECT_EQ(facts.threads(), threads);
 }
 
 TEST(IPCListener, TakesOverAStaleSocketButNoLiveOne) {
@@ -274,7 +232,7 @@ TEST(IPCListener, TakesOverAStaleSocketButNoLiveOne) {
   auto samePath = [&](IPCListener::Options& options) { options.socketPath = first.path(); };
   EXPECT_THROW(TestService second(samePath), std::system_error);
   TestClient client(first);
-  EXPECT_EQ(client.call("flushMessagesWithReply"), "flushed");
+  EXPECT_EQ(client.call("flushMessagesWithReply"), "posted all");
 
   // What a daemon that was killed leaves behind: a socket that nobody listens on.
   const std::string stale = first.path() + ".stale";
@@ -286,26 +244,24 @@ TEST(IPCListener, TakesOverAStaleSocketButNoLiveOne) {
   {
     TestService third([&](IPCListener::Options& options) { options.socketPath = stale; });
     TestClient other(third);
-    EXPECT_EQ(other.call("flushMessagesWithReply"), "flushed");
+    EXPECT_EQ(other.call("flushMessagesWithReply"), "posted all");
     EXPECT_EQ(std::filesystem::status(stale).permissions(), static_cast<std::filesystem::perms>(0666));
   }
   EXPECT_FALSE(std::filesystem::exists(stale));
 }
 
 TEST(IPCListener, ServesAnInheritedSocketAndAPathLongerThanAnAddress) {
-  char directory[] = "/tmp/vesk-ipc-XXXXXX";
-  ASSERT_TRUE(::mkdtemp(directory));
-  const std::string path = directory + std::string("/") + std::string(120, 'd') + "/socket";
+  TempDirectory directory;
+  const std::string path = directory / std::string(120, 'd') / "socket";
   {
     TestService service([&](IPCListener::Options& options) {
       options.socketPath = path;
       options.inherited = listenOnUnixSocket(path);
     });
     TestClient client(service);
-    EXPECT_EQ(client.call("flushMessagesWithReply"), "flushed");
+    EXPECT_EQ(client.call("flushMessagesWithReply"), "posted all");
   }
   EXPECT_TRUE(std::filesystem::exists(path)) << "it is the service manager's";
-  std::filesystem::remove_all(directory);
 }
 
 }  // namespace

@@ -1,8 +1,6 @@
 // Keyed archives: round trip, Python's plistlib as a second opinion, and what is refused.
 #include <gtest/gtest.h>
 
-#include <functional>
-
 #include "platform/plist/KeyedArchive.h"
 #include "tests/support/ChildProcess.h"
 #include "tests/support/TempDirectory.h"

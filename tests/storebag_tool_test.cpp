@@ -1,7 +1,5 @@
 #include <gtest/gtest.h>
 
-#include <stdexcept>
-
 #include "platform/crypto/Base64.h"
 #include "platform/plist/PropertyList.h"
 #include "tests/support/TempDirectory.h"
@@ -55,23 +53,17 @@ std::string failureOf(const std::filesystem::path& file) {
   }
 }
 
-TEST(StorebagSource, IsTheSameFromTOMLAndJSON) {
+TEST(StorebagSource, IsTheSameFromTOMLAndJSONAndFromItsOwnTexts) {
   TempDirectory files;
-  auto toml = readStorebagSource(files.write("a.toml", kTOML));
-  auto json = readStorebagSource(files.write("a.json", kJSON));
-  EXPECT_EQ(canonical(toml.payload), canonical(json.payload));
-  EXPECT_TRUE(toml.warnings.empty());
-  EXPECT_TRUE(json.warnings.empty());
-  EXPECT_EQ(integerForKey(toml.payload, "refresh_cycle"), 600);
-}
-
-TEST(StorebagSource, ReadsItsOwnTextsBack) {
-  TempDirectory files;
-  Dictionary payload = readStorebagSource(files.write("a.toml", kTOML)).payload;
-  auto fromTOML = readStorebagSource(files.write("b.toml", storebagAsTOML(payload))).payload;
-  auto fromJSON = readStorebagSource(files.write("b.json", storebagAsJSON(payload))).payload;
-  EXPECT_EQ(canonical(fromTOML), canonical(payload));
-  EXPECT_EQ(canonical(fromJSON), canonical(payload));
+  const Dictionary payload = readStorebagSource(files.write("a.toml", kTOML)).payload;
+  EXPECT_EQ(integerForKey(payload, "refresh_cycle"), 600);
+  for (const auto& file :
+       {files.write("b.toml", kTOML), files.write("b.json", kJSON),
+        files.write("c.toml", storebagAsTOML(payload)), files.write("c.json", storebagAsJSON(payload))}) {
+    auto read = readStorebagSource(file);
+    EXPECT_EQ(canonical(read.payload), canonical(payload)) << file;
+    EXPECT_TRUE(read.warnings.empty()) << file;
+  }
 }
 
 struct FindingCase {
@@ -147,16 +139,6 @@ TEST(StorebagSource, WarnsOfWhatIsProbablyAMistake) {
   }
 }
 
-TEST(StorebagDocument, VerifiesWithThePublicKeyAndShowsThePayload) {
-  Dictionary payload{
-      {"version", "1"}, {"refresh_cycle", 60}, {"release", Dictionary{{"wren", Dictionary{}}}}};
-  auto inspection = inspectStorebag(signStorebag(payload, key()), key().publicKeyDER());
-  EXPECT_TRUE(inspection.isValid());
-  ASSERT_TRUE(inspection.payload);
-  EXPECT_EQ(canonical(*inspection.payload), canonical(payload));
-  EXPECT_THROW(signStorebag(Dictionary{{"version", Value()}}, key()), std::runtime_error);
-}
-
 std::string documentOf(const Dictionary& entries) { return writeXMLPropertyList(entries).value(); }
 
 TEST(StorebagDocument, TellsEveryWayInWhichOneIsNotValid) {
@@ -166,47 +148,40 @@ TEST(StorebagDocument, TellsEveryWayInWhichOneIsNotValid) {
   std::string tampered = bag;
   tampered[bag.find("version")] = 'V';
   const std::string noList = "no property list";
+  const auto with = [](const Value& bagText, const Value& signatureText) {
+    return documentOf({{"bag", bagText}, {"signature", signatureText}});
+  };
+  const std::string good = with(encoded, signature);
   const struct {
     const char* name;
     std::string document;
-    std::string publicKey;
     StorebagVerdict verdict;
+    std::string publicKey = key().publicKeyDER();
   } cases[] = {
-      {"good", documentOf({{"bag", encoded}, {"signature", signature}}), key().publicKeyDER(),
+      {"good", good, StorebagVerdict::Valid},
+      {"line breaks", with(encoded.substr(0, 8) + "\n  " + encoded.substr(8), signature),
        StorebagVerdict::Valid},
-      {"line breaks",
-       documentOf({{"bag", encoded.substr(0, 8) + "\n  " + encoded.substr(8)}, {"signature", signature}}),
-       key().publicKeyDER(), StorebagVerdict::Valid},
-      {"empty", "", key().publicKeyDER(), StorebagVerdict::NoPropertyList},
-      {"HTML", "<html>404</html>", key().publicKeyDER(), StorebagVerdict::NoPropertyList},
-      {"list", writeXMLPropertyList(List{1}).value(), key().publicKeyDER(), StorebagVerdict::NoPropertyList},
-      {"no signature", documentOf({{"bag", encoded}}), key().publicKeyDER(),
-       StorebagVerdict::SignatureMissing},
-      {"number as signature", documentOf({{"bag", encoded}, {"signature", 1}}), key().publicKeyDER(),
-       StorebagVerdict::SignatureMissing},
-      {"empty signature", documentOf({{"bag", encoded}, {"signature", ""}}), key().publicKeyDER(),
-       StorebagVerdict::SignatureNoBase64},
-      {"signature cut", documentOf({{"bag", encoded}, {"signature", signature.substr(1)}}),
-       key().publicKeyDER(), StorebagVerdict::SignatureNoBase64},
-      {"no bag", documentOf({{"signature", signature}}), key().publicKeyDER(), StorebagVerdict::BagMissing},
-      {"bag cut", documentOf({{"bag", encoded.substr(1)}, {"signature", signature}}), key().publicKeyDER(),
-       StorebagVerdict::BagNoBase64},
-      {"tampered", documentOf({{"bag", base64Encode(tampered)}, {"signature", signature}}),
-       key().publicKeyDER(), StorebagVerdict::SignatureMismatch},
-      {"other key", documentOf({{"bag", encoded}, {"signature", signature}}),
-       SigningKey::generate().publicKeyDER(), StorebagVerdict::SignatureMismatch},
-      {"no key", documentOf({{"bag", encoded}, {"signature", signature}}), "no key",
-       StorebagVerdict::PublicKeyUnusable},
-      {"badly signed", signStorebagBadly(Dictionary{{"version", "1"}}, key()), key().publicKeyDER(),
-       StorebagVerdict::SignatureMismatch},
-      {"signed junk",
-       documentOf({{"bag", base64Encode(noList)}, {"signature", base64Encode(key().sign(noList))}}),
-       key().publicKeyDER(), StorebagVerdict::PayloadUnreadable},
+      {"empty", "", StorebagVerdict::NoPropertyList},
+      {"HTML", "<html>404</html>", StorebagVerdict::NoPropertyList},
+      {"list", writeXMLPropertyList(List{1}).value(), StorebagVerdict::NoPropertyList},
+      {"no signature", documentOf({{"bag", encoded}}), StorebagVerdict::SignatureMissing},
+      {"number as signature", with(encoded, 1), StorebagVerdict::SignatureMissing},
+      {"empty signature", with(encoded, ""), StorebagVerdict::SignatureNoBase64},
+      {"signature cut", with(encoded, signature.substr(1)), StorebagVerdict::SignatureNoBase64},
+      {"no bag", documentOf({{"signature", signature}}), StorebagVerdict::BagMissing},
+      {"bag cut", with(encoded.substr(1), signature), StorebagVerdict::BagNoBase64},
+      {"tampered", with(base64Encode(tampered), signature), StorebagVerdict::SignatureMismatch},
+      {"other key", good, StorebagVerdict::SignatureMismatch, SigningKey::generate().publicKeyDER()},
+      {"no key", good, StorebagVerdict::PublicKeyUnusable, "no key"},
+      {"badly signed", signStorebagBadly({{"version", "1"}}, key()), StorebagVerdict::SignatureMismatch},
+      {"signed junk", with(base64Encode(noList), base64Encode(key().sign(noList))),
+       StorebagVerdict::PayloadUnreadable},
   };
   for (const auto& test : cases) {
     auto inspection = inspectStorebag(test.document, test.publicKey);
     EXPECT_EQ(inspection.verdict, test.verdict) << test.name << ": " << explain(inspection.verdict);
   }
+  EXPECT_THROW(signStorebag({{"version", Value()}}, key()), std::runtime_error);
 }
 
 TEST(SigningKey, IsKeptInItsDirectoryAndNeverReplaced) {

@@ -1,7 +1,6 @@
 #include <gtest/gtest.h>
 
 #include <thread>
-#include <vector>
 
 #include "util/Counters.h"
 #include "util/SamplingDraw.h"

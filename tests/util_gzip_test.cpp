@@ -1,9 +1,6 @@
 #include <gtest/gtest.h>
 #include <zlib.h>
 
-#include <thread>
-#include <vector>
-
 #include "tests/support/CapturedLog.h"
 #include "util/Gzip.h"
 
@@ -61,17 +58,6 @@ TEST(Gzip, TellsBothSizes) {
   EXPECT_EQ(log.count(7, "compressDataWithZlibOrGzip: Compressed file from 100000 to " +
                              std::to_string(gzip->size())),
             1);
-}
-
-TEST(Gzip, ServesSeveralThreadsAtOnce) {
-  std::vector<std::thread> threads;
-  for (int i = 0; i < 4; ++i) {
-    threads.emplace_back([i] {
-      const std::string data = noise(1000 + 1000 * static_cast<std::size_t>(i));
-      for (int k = 0; k < 25; ++k) EXPECT_EQ(inflated(*gzipDeflate(data), 31, data.size()), data);
-    });
-  }
-  for (auto& thread : threads) thread.join();
 }
 
 }  // namespace

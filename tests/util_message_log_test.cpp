@@ -2,14 +2,12 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
-#include <algorithm>
 #include <atomic>
 #include <set>
 #include <thread>
-#include <vector>
 
 #include "tests/support/CapturedLog.h"
-#include "tests/support/TestRoot.h"
+#include "tests/support/TempDirectory.h"
 #include "util/MessageLog.h"
 
 namespace vesk::test {
@@ -162,18 +160,6 @@ TEST_F(MessageLogTest, NeitherMixesNorLosesLinesOfSeveralThreads) {
     EXPECT_EQ(std::count(line.begin(), line.end(), line.back()), 2000);
   }
   EXPECT_EQ(count, kThreads * kLines);
-}
-
-TEST(WriteToLogFile, WritesUnderTheRootPrefix) {
-  writeToLogFile("[%@ -> flushMessages] %@", "httpPost", Text("{ }"));
-  const auto directory = testRoot() / "var/mobile/Library/Logs/Dunmore/Retired";
-  for (const auto& entry : std::filesystem::directory_iterator(directory)) {
-    const std::string text =
-        testRoot().read(std::filesystem::relative(entry.path(), testRoot().path()).string());
-    EXPECT_EQ(text.substr(28), "[httpPost -> flushMessages] { }\n");
-    return;
-  }
-  FAIL() << "no file";
 }
 
 TEST(LogFormat, ShowsEveryValueByItsOwnType) {

@@ -2,7 +2,6 @@
 #include <gtest/gtest.h>
 
 #include <csignal>
-#include <optional>
 
 #include "tests/support/ChildProcess.h"
 #include "tests/support/RecordingDaemon.h"
@@ -74,7 +73,7 @@ TEST_F(VeskreportCommand, EachCommandPrintsItsAnswer) {
     EXPECT_EQ(outcome.status, 0);
     EXPECT_EQ(outcome.output, c.output);
     EXPECT_EQ(outcome.errors, "");
-    EXPECT_TRUE(record.waitForLine(c.call));
+    EXPECT_TRUE(record.waitFor(c.call));
   }
 }
 
@@ -82,7 +81,7 @@ TEST_F(VeskreportCommand, AggregatePrintsWhatTheDaemonSendsAndEndsWithIt) {
   for (bool json : {false, true}) {
     ChildProcess process({VESK_BIN_DIRECTORY "/veskreport", "aggregate", "--root", root, "--client-type", "5",
                           json ? "--json" : "--batch"});
-    ASSERT_TRUE(record.waitForCount("startConfig", json ? 2 : 1));
+    ASSERT_TRUE(record.waitFor("startConfig", json ? 2 : 1));
     daemon->sendToClient(Dictionary{{"sessionID", 102}}, 1'700'000'000.25, 3, 2, Dictionary{{"a", 1}});
     daemon->sendToClient(Dictionary{{"sessionID", 103}}, 1'700'000'001, 4, 0, std::nullopt);
     daemon->sendToClient(std::nullopt, 0, 0, 0, std::nullopt);
@@ -105,12 +104,12 @@ TEST_F(VeskreportCommand, AggregatePrintsWhatTheDaemonSendsAndEndsWithIt) {
 
 TEST_F(VeskreportCommand, AggregateEndsWhenItIsToldTo) {
   ChildProcess process({VESK_BIN_DIRECTORY "/veskreport", "aggregate", "--root", root, "--client-type", "5"});
-  ASSERT_TRUE(record.waitForLine("startConfig"));
+  ASSERT_TRUE(record.waitFor("startConfig"));
   process.signal(SIGTERM);
   EXPECT_EQ(process.wait(), 0);
   ChildProcess counting(
       {VESK_BIN_DIRECTORY "/veskreport", "aggregate", "--root", root, "--client-type", "5", "--count", "1"});
-  ASSERT_TRUE(record.waitForCount("startConfig", 2));
+  ASSERT_TRUE(record.waitFor("startConfig", 2));
   daemon->sendToClient(Dictionary{{"sessionID", 102}}, 1, 3, 2, std::nullopt);
   EXPECT_EQ(counting.wait(), 0);
 }

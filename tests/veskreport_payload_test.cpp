@@ -37,12 +37,6 @@ TEST(PayloadParser, PairsBecomeValuesOfTheTypeThatIsWritten) {
   }
 }
 
-TEST(PayloadParser, KeepsTheOrderOfTheArguments) {
-  auto parsed = parsePairs({"b=1", "a:=2"});
-  ASSERT_TRUE(parsed.value);
-  EXPECT_EQ(*parsed.value, (Dictionary{{"b", "1"}, {"a", 2}}));
-}
-
 TEST(PayloadParser, SaysWhatIsWrong) {
   struct Case {
     std::vector<std::string> arguments;

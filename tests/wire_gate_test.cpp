@@ -2,8 +2,6 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
-#include <string>
-
 #include "platform/ipc/AuthenticationGate.h"
 #include "platform/ipc/MessageGate.h"
 

@@ -1,4 +1,4 @@
-// One-way calls that do without sd-bus: what arrives, what is refused, and what is left to sd-bus.
+// Calls on the wire, with sd-bus and without: what arrives, what is refused, and what is left to sd-bus.
 #include <gtest/gtest.h>
 #include <poll.h>
 
@@ -20,6 +20,7 @@ namespace {
 constexpr char kObjectPath[] = "/test";
 constexpr char kInterface[] = "test.Interface";
 constexpr char kMember[] = "take";
+constexpr std::chrono::seconds kPatience{60};
 constexpr char kSignature[] = "bqdsa{sv}avaa{sv}asasaas";
 
 struct Arguments {
@@ -58,7 +59,7 @@ class Taker final : public IPCExportedObject, public IPCListenerDelegate {
   const char* interfaceName() const override { return kInterface; }
   void handle(IPCIncomingCall& call) override {
     Arguments a;
-    EXPECT_FALSE(call.expectsReply());
+    EXPECT_EQ(call.expectsReply(), expectsReply);
     EXPECT_TRUE(call.read(kSignature, a.flag, a.number, a.real, a.text, a.dictionary, a.list,
                           a.maybeDictionary, a.maybeText, a.texts, a.maybeTexts));
     taken.set_value(a);
@@ -68,12 +69,14 @@ class Taker final : public IPCExportedObject, public IPCListenerDelegate {
     connection->resume();
     return true;
   }
+  bool expectsReply = false;
   std::promise<Arguments> taken;
 };
 
-Arguments carried(const Arguments& sent) {
+Arguments carried(const Arguments& sent, bool expectsReply = false) {
   TempDirectory directory;
   Taker taker;
+  taker.expectsReply = expectsReply;
   IPCListener::Options options;
   options.socketPath = directory / "run/socket";
   options.objectPath = kObjectPath;
@@ -90,6 +93,13 @@ Arguments carried(const Arguments& sent) {
     ::poll(&poll, 1, bus.timeout());
     EXPECT_EQ(bus.process(), BusClient::Progress::Connected);
   }
+  if (expectsReply) {
+    EXPECT_EQ(bus.send(
+                  sent.call(), [](BusAnswer&) {}, kPatience),
+              BusClient::SendResult::Sent);
+    EXPECT_TRUE(bus.flush(kPatience));
+    return taker.taken.get_future().get();
+  }
   EXPECT_EQ(bus.add(sent.call()), BusClient::SendResult::Sent);
   EXPECT_EQ(bus.queuedMessages(), 1U);
   EXPECT_EQ(bus.write(), BusClient::Progress::Connected);
@@ -97,7 +107,7 @@ Arguments carried(const Arguments& sent) {
   return taker.taken.get_future().get();
 }
 
-TEST(WireOneWay, EveryArgumentArrivesAsItWas) {
+TEST(Wire, EveryArgumentArrivesAsItWas) {
   Arguments all;
   all.flag = true;
   all.number = 65535;
@@ -108,12 +118,14 @@ TEST(WireOneWay, EveryArgumentArrivesAsItWas) {
                     {"yes", true},
                     {"least", std::numeric_limits<std::int64_t>::min()},
                     {"most", std::numeric_limits<std::uint64_t>::max()},
-                    {"real", 0.1},
+                    {"real", -0.1},
+                    {"infinite", std::numeric_limits<double>::infinity()},
                     {"text", ""},
+                    {"", ""},
                     {"bytes", Bytes(std::string("\0\xff", 2))},
                     {"no bytes", Bytes()},
-                    {"date", Date{12.25}},
-                    {"list", List{1, "a", List{}, Dictionary{}}},
+                    {"date", Date{-12.25}},
+                    {"list", List{1, "a", List{}, Dictionary{{"ü", 1}}, Dictionary{}}},
                     {"mixed", Dictionary{{"x", Dictionary{{"y", List{Date{1}, true}}}}}},
                     {"deepest", nested(kDeepest)}};
   all.list = {"a", 2U, Bytes("b")};
@@ -121,7 +133,8 @@ TEST(WireOneWay, EveryArgumentArrivesAsItWas) {
   all.maybeText = "t";
   all.texts = {"a", "", "bcd"};
   all.maybeTexts = {{"x", "y"}};
-  for (const Arguments& sent : {all, Arguments{}}) EXPECT_EQ(carried(sent), sent);
+  for (const Arguments& sent : {all, Arguments{}})
+    for (bool expectsReply : {false, true}) EXPECT_EQ(carried(sent, expectsReply), sent);
 
   // Every alignment that a text can leave behind itself.
   for (int length = 0; length < 9; ++length) {
@@ -132,7 +145,7 @@ TEST(WireOneWay, EveryArgumentArrivesAsItWas) {
   }
 }
 
-TEST(WireOneWay, RefusesWhatNoReceiverTakesAndLeavesNothingBehind) {
+TEST(Wire, NothingIsWrittenThatNoReceiverTakes) {
   struct Case {
     const char* what;
     Value value;
@@ -140,28 +153,45 @@ TEST(WireOneWay, RefusesWhatNoReceiverTakesAndLeavesNothingBehind) {
   };
   Value lists = 1;
   for (int i = 0; i < 63; ++i) lists = List{lists};
+  BusServer server;
   for (const Case& c : {
            Case{"not UTF-8", "\xff", CodecResult::Malformed},
            Case{"not UTF-8 after much that is", "12345678\xc3", CodecResult::Malformed},
            Case{"an overlong form", "\xc0\x80", CodecResult::Malformed},
+           Case{"another", "\xc0\xaf", CodecResult::Malformed},
            Case{"a surrogate", "\xed\xa0\x80", CodecResult::Malformed},
+           Case{"above the last character", "\xf4\x90\x80\x80", CodecResult::Malformed},
+           Case{"cut off", "\xe2\x82", CodecResult::Malformed},
            Case{"a NUL", std::string("12345678\0", 9), CodecResult::Malformed},
            Case{"a NUL in eight", std::string("1234567\0", 8), CodecResult::Malformed},
            Case{"a bad key", Dictionary{{"\xff", 1}}, CodecResult::Malformed},
-           Case{"one container too many", nested(kDeepest + 1), CodecResult::LimitExceeded},
-           Case{"lists nested too deeply", lists, CodecResult::LimitExceeded},
-           Case{"too many values", List(std::vector<Value>(100'001)), CodecResult::LimitExceeded},
-           Case{"too much content", std::string(1'100'000, 'x'), CodecResult::LimitExceeded},
-           Case{"too long only on the wire", List(std::vector<Value>(90'000, Date{})),
-                CodecResult::LimitExceeded},
-           Case{"an emoji", "\xf0\x9f\x98\x80", CodecResult::Ok},
+           Case{"a lone continuation as key", Dictionary{{"\x80", 1}}, CodecResult::Malformed},
+           Case{"100,000 values", List(std::vector<Value>(100'000)), CodecResult::LimitExceeded},
+           Case{"1 MiB", std::string(std::size_t{1} << 20, 'x'), CodecResult::LimitExceeded},
+           Case{"first and last of each length",
+                "\x01\x7F\xC2\x80\xDF\xBF\xE0\xA0\x80\xEF\xBF\xBF\xF0\x90\x80\x80\xF4\x8F\xBF\xBF",
+                CodecResult::Ok},
        }) {
     SCOPED_TRACE(c.what);
-    OneWayEncoder encoder(kObjectPath);
-    IPCOutgoingCall call{kInterface, kMember, {Dictionary{{"k", c.value}}}};
+    const Dictionary written{{"k", c.value}};
+    OneWayEncoder oneWay(kObjectPath);
     std::string out = "before";
-    EXPECT_EQ(encoder.append(call, 1, out), c.result);
+    EXPECT_EQ(oneWay.append({kInterface, kMember, {written}}, 1, out), c.result);
     EXPECT_EQ(out == "before", c.result != CodecResult::Ok);
+    sd_bus_message* raw = nullptr;
+    ASSERT_GE(sd_bus_message_new_method_call(server.bus(), &raw, nullptr, "/o", "i.f", "m"), 0);
+    BusMessageHandle message(raw);
+    BusEncoder encoder(raw);
+    EXPECT_EQ(encoder.append(written), c.result == CodecResult::Ok);
+    EXPECT_EQ(encoder.result(), c.result);
+  }
+  // What sd-bus refuses by itself: containers within containers, and lengths on the wire.
+  for (const Value& value : {nested(kDeepest + 1), lists, Value(List(std::vector<Value>(90'000, Date{})))}) {
+    OneWayEncoder encoder(kObjectPath);
+    std::string out = "before";
+    EXPECT_EQ(encoder.append({kInterface, kMember, {Dictionary{{"k", value}}}}, 1, out),
+              CodecResult::LimitExceeded);
+    EXPECT_EQ(out, "before");
   }
 }
 

@@ -12,7 +12,7 @@
 
 namespace vesk::test {
 
-/// Its client is authenticated. Aborts on what can't happen.
+/// Its client is authenticated and may send descriptors. Aborts on what can't happen.
 class BusServer {
  public:
   BusServer() {
@@ -25,7 +25,7 @@ class BusServer {
     _bus.reset(raw);
     require(sd_bus_set_server(raw, 1, sd_id128_t{{1}}) >= 0);
     require(sd_bus_start(raw) >= 0);
-    write("\0AUTH EXTERNAL\r\nDATA\r\nBEGIN\r\n"s);
+    write("\0AUTH EXTERNAL\r\nDATA\r\nNEGOTIATE_UNIX_FD\r\nBEGIN\r\n"s);
     receive();
     require(sd_bus_is_ready(raw) > 0);
   }

@@ -5,7 +5,6 @@
 #include <signal.h>
 #include <spawn.h>
 #include <sys/eventfd.h>
-#include <sys/inotify.h>
 #include <sys/mman.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
@@ -66,38 +65,26 @@ std::vector<char*> pointersTo(std::vector<std::string>& texts) {
   return pointers;
 }
 
-class SpawnActions {
- public:
-  SpawnActions() { ::posix_spawn_file_actions_init(&_actions); }
-  ~SpawnActions() { ::posix_spawn_file_actions_destroy(&_actions); }
-  SpawnActions(const SpawnActions&) = delete;
-  SpawnActions& operator=(const SpawnActions&) = delete;
-  posix_spawn_file_actions_t* get() { return &_actions; }
-
- private:
-  posix_spawn_file_actions_t _actions{};
-};
-
 }  // namespace
 
 ChildProcess::ChildProcess(Options options) : _stop(::eventfd(0, EFD_CLOEXEC)) {
   FileDescriptor input = inputHolding(options.input);
   Pipe output;
   Pipe errors;
-  SpawnActions actions;
-  if (!options.directory.empty())
-    ::posix_spawn_file_actions_addchdir_np(actions.get(), options.directory.c_str());
-  ::posix_spawn_file_actions_adddup2(actions.get(), input.get(), STDIN_FILENO);
-  ::posix_spawn_file_actions_adddup2(actions.get(), errors.writing.get(), STDERR_FILENO);
+  posix_spawn_file_actions_t actions;
+  ::posix_spawn_file_actions_init(&actions);
+  ::posix_spawn_file_actions_adddup2(&actions, input.get(), STDIN_FILENO);
+  ::posix_spawn_file_actions_adddup2(&actions, errors.writing.get(), STDERR_FILENO);
   if (options.outputClosed) {
-    ::posix_spawn_file_actions_addclose(actions.get(), STDOUT_FILENO);
+    ::posix_spawn_file_actions_addclose(&actions, STDOUT_FILENO);
   } else {
-    ::posix_spawn_file_actions_adddup2(actions.get(), output.writing.get(), STDOUT_FILENO);
+    ::posix_spawn_file_actions_adddup2(&actions, output.writing.get(), STDOUT_FILENO);
   }
   auto environment = environmentWith(options.environment);
   auto arguments = pointersTo(options.command);
-  int error = ::posix_spawnp(&_pid, arguments[0], actions.get(), nullptr, arguments.data(),
+  int error = ::posix_spawnp(&_pid, arguments[0], &actions, nullptr, arguments.data(),
                              pointersTo(environment).data());
+  ::posix_spawn_file_actions_destroy(&actions);
   if (error != 0) throw std::runtime_error("can't start " + options.command[0] + ": " + std::strerror(error));
   _process = FileDescriptor(static_cast<int>(::syscall(SYS_pidfd_open, _pid, 0)));
   _output = std::move(output.reading);
@@ -182,18 +169,9 @@ bool ChildProcess::collectFrom(int descriptor, std::string& text) {
 }
 
 bool waitForFile(const std::string& path, std::chrono::milliseconds patience) {
-  auto end = Clock::now() + patience;
-  FileDescriptor watch(::inotify_init1(IN_CLOEXEC | IN_NONBLOCK));
-  std::string directory = std::filesystem::path(path).parent_path().string();
-  ::inotify_add_watch(watch.get(), directory.c_str(), IN_CLOSE_WRITE | IN_MOVED_TO | IN_CREATE);
-  while (!std::filesystem::exists(path)) {
-    pollfd changed{watch.get(), POLLIN, 0};
-    int left = millisecondsUntil(end);
-    if (left == 0) return false;
-    ::poll(&changed, 1, left);
-    std::array<char, 4096> events;
-    while (::read(watch.get(), events.data(), events.size()) > 0) {
-    }
+  for (auto end = Clock::now() + patience; !std::filesystem::exists(path);) {
+    if (Clock::now() > end) return false;
+    std::this_thread::sleep_for(std::chrono::milliseconds(5));  // between two looks
   }
   return true;
 }

@@ -27,7 +27,6 @@ class ChildProcess {
   struct Options {
     std::vector<std::string> command;                  ///< program (path or name in PATH) and arguments
     std::map<std::string, std::string> environment{};  ///< added to the test's own
-    std::string directory{};                           ///< working directory; empty: the test's own
     std::string input{};                               ///< what it reads on standard input
     bool outputClosed = false;                         ///< runs without a standard output
   };

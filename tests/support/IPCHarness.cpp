@@ -4,150 +4,50 @@
 #include <poll.h>
 #include <sys/socket.h>
 
-#include <algorithm>
-#include <chrono>
-#include <filesystem>
-
 #include "client/protocol/ClientSessionReplyProxy.h"
 #include "client/protocol/ClientSessionStub.h"
 #include "platform/ipc/IPCIncomingCall.h"
 #include "platform/ipc/UnixSocket.h"
-#include "platform/log/SystemLog.h"
 
 namespace vesk::test {
 
 using namespace std::chrono_literals;
 using namespace std::string_view_literals;
 
-namespace {
+// --- ActingSession
 
-constexpr auto kPatience = 30s;
-
-template <class T>
-std::string shown(const std::optional<T>& value) {
-  return value ? describe(Value(*value)) : "absent";
-}
-
-std::string shown(bool value) { return value ? "true" : "false"; }
-
-}  // namespace
-
-// --- Journal
-
-void Journal::add(std::string line) {
-  std::lock_guard lock(_mutex);
-  _lines.push_back(std::move(line));
-  _changed.notify_all();
-}
-
-std::size_t Journal::countLocked(std::string_view beginning) const {
-  return static_cast<std::size_t>(std::count_if(
-      _lines.begin(), _lines.end(), [&](const auto& line) { return line.starts_with(beginning); }));
-}
-
-bool Journal::waitFor(std::string_view beginning, std::size_t count) {
-  std::unique_lock lock(_mutex);
-  return _changed.wait_for(lock, kPatience, [&] { return countLocked(beginning) >= count; });
-}
-
-std::size_t Journal::count(std::string_view beginning) {
-  std::lock_guard lock(_mutex);
-  return countLocked(beginning);
-}
-
-std::vector<std::string> Journal::lines() {
-  std::lock_guard lock(_mutex);
-  return _lines;
-}
-
-// --- RecordingSession
-
-RecordingSession::~RecordingSession() {
+ActingSession::~ActingSession() {
   if (_saysFarewell) {
     ClientSessionReplyProxy proxy(_connection,
-                                  [this](const std::string& error) { _journal.add("lost: " + error); });
+                                  [this](const std::string& error) { _record.add("lost: " + error); });
     proxy.sendMessageToClient(std::nullopt, 0, 0, 0, std::nullopt);
   }
-  _journal.add("destroyed");
+  _record.add("destroyed");
 }
 
-void RecordingSession::setSessionInfo(const Dictionary& sessionInfo,
-                                      const std::optional<Dictionary>& userInfo,
-                                      const List& frameworksToCheck, bool hasAggregationBlock) {
-  _journal.add("setSessionInfo " + describe(sessionInfo) + " " + shown(userInfo) + " " +
-               describe(frameworksToCheck) + " " + shown(hasAggregationBlock));
-}
-
-void RecordingSession::startConfigWithCompletionHandler(Reply<std::optional<BackendNames>> reply) {
-  _journal.add("start");
-  reply(BackendNames{"one", "two"});
-}
-
-void RecordingSession::fetchStatesWithUserInfo(const std::optional<Dictionary>& userInfo,
-                                               Reply<std::optional<BackendNames>> completionHandler) {
-  _journal.add("fetchStates " + shown(userInfo));
-  completionHandler(std::nullopt);
-}
-
-void RecordingSession::fetchDisplayURL(Reply<std::string> reply) {
-  _journal.add("fetchDisplayURL");
-  reply("https://display");
-}
-
-void RecordingSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
-                                               const std::optional<Dictionary>& payload,
-                                               Reply<std::optional<std::string>> reply) {
-  _journal.add("category " + std::to_string(category) + " " + std::to_string(type) + " " + shown(payload));
-  reply(std::nullopt);
-}
-
-void RecordingSession::sendMessageWithDictionary(const Dictionary& parameters,
-                                                 Reply<std::optional<std::string>> reply) {
+void ActingSession::sendMessageWithDictionary(const Dictionary& parameters,
+                                              Reply<std::optional<std::string>> reply) {
   const std::string action = parameters.text("do").value_or(Text()).string();
   const std::string number = std::to_string(integerForKey(parameters, "n").value_or(0));
   if (action == "farewell") _saysFarewell = true;
   if (action == "keep") kept = std::move(reply);
-  _journal.add("message " + number);
+  _record.add("message " + number);
   if (action == "throw") throw std::runtime_error("thrown");
   const auto padding = static_cast<std::size_t>(integerForKey(parameters, "pad").value_or(0));
   if (action != "abandon" && reply) reply(number + std::string(padding, '.'));
 }
 
-void RecordingSession::flushMessagesWithReply(Reply<std::optional<std::string>> reply) {
-  _journal.add("flush");
-  reply("flushed");
-}
-
-void RecordingSession::uploadFileAtPath(const std::string& fileURL, const std::string& extensionToken,
-                                        Reply<bool> completionHandler) {
-  _journal.add("upload " + fileURL + " " + extensionToken);
+void ActingSession::uploadFileAtPath(const std::string& fileURL, const std::string& extensionToken,
+                                     Reply<bool> completionHandler) {
+  _record.add("upload " + fileURL + " " + extensionToken);
   completionHandler(true);
-}
-
-void RecordingSession::uploadLogData(const List& logData,
-                                     Reply<bool, std::optional<std::string>> completionHandler) {
-  _journal.add("log " + describe(logData));
-  completionHandler(false, std::nullopt);
-}
-
-void RecordingSession::sendMessageWithSessionInfo(const Dictionary& sessionInfo,
-                                                  const std::optional<Dictionary>& userInfo,
-                                                  std::uint16_t category, std::uint16_t type,
-                                                  const std::optional<Dictionary>& payload,
-                                                  Reply<std::string> reply) {
-  _journal.add("single " + describe(sessionInfo) + " " + shown(userInfo) + " " + std::to_string(category) +
-               " " + std::to_string(type) + " " + shown(payload));
-  reply("finished");
 }
 
 // --- TestService
 
 TestService::TestService(const std::function<void(IPCListener::Options&)>& adjust) {
-  char pattern[] = "/tmp/vesk-ipc-XXXXXX";
-  _directory = ::mkdtemp(pattern);
-  _path = _directory + "/run/socket";
   IPCListener::Options options;
-  options.socketPath = _path;
+  options.socketPath = _directory / "run/socket";
   options.objectPath = wire::kObjectPath;
   if (adjust) adjust(options);
   _path = options.socketPath;
@@ -156,13 +56,8 @@ TestService::TestService(const std::function<void(IPCListener::Options&)>& adjus
   _listener->resume();
 }
 
-TestService::~TestService() {
-  _listener.reset();
-  std::filesystem::remove_all(_directory);
-}
-
 bool TestService::shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) {
-  auto session = std::make_shared<RecordingSession>(journal, connection);
+  auto session = std::make_shared<ActingSession>(journal, connection);
   connection->setExportedObject(std::make_shared<ClientSessionStub>(session));
   connection->setInterruptionHandler([this, session] { journal.add("interrupted"); });
   connection->setInvalidationHandler([this, session] {
@@ -186,7 +81,7 @@ std::shared_ptr<IPCConnection> TestService::connection(std::size_t index) {
   return _connections.at(index).lock();
 }
 
-std::shared_ptr<RecordingSession> TestService::session(std::size_t index) {
+std::shared_ptr<ActingSession> TestService::session(std::size_t index) {
   EXPECT_TRUE(journal.waitFor("accepted", index + 1));
   std::lock_guard lock(_mutex);
   return _sessions.at(index).lock();
@@ -218,7 +113,7 @@ void TestClient::handle(IPCIncomingCall& call) {
 }
 
 bool TestClient::runUntil(const std::function<bool()>& predicate) {
-  const auto deadline = std::chrono::steady_clock::now() + kPatience;
+  const auto deadline = std::chrono::steady_clock::now() + 30s;
   while (!predicate()) {
     if (std::chrono::steady_clock::now() > deadline) return false;
     pollfd poll{_bus->fd(), _bus->events(), 0};
@@ -246,10 +141,10 @@ std::string TestClient::call(const char* member, std::vector<IPCArgument> argume
     if (answer.isError()) {
       result = answer.errorName().substr(answer.errorName().rfind('.') + 1);
     } else if (name.starts_with("upload")) {
-      result = answer.read(flag) ? shown(flag) : "unreadable";
-    } else if (name.starts_with("start") || name == "fetchStatesWithUserInfo") {
+      result = !answer.read(flag) ? "unreadable" : flag ? "true" : "false";
+    } else if (name.starts_with("start")) {
       result = !answer.read(names) ? "unreadable" : names ? names->at(0) + "," + names->at(1) : "absent";
-    } else if (name == "fetchDisplayURL" || name == "sendMessageWithSessionInfo" || name == "Introspect") {
+    } else if (name == "fetchDisplayURL" || name == "Introspect") {
       result = answer.read(text) ? text : "unreadable";
     } else if (name == "setSessionInfo" || name == "Ping") {
       result = "done";
@@ -385,15 +280,5 @@ std::string RawClient::bytesDictionary(std::size_t size) {
   body.raw(bytes);
   return body.take();
 }
-
-// --- LogCapture
-
-LogCapture::LogCapture() {
-  SystemLog::setSink([lines = _lines](LogLevel level, std::string_view line) {
-    lines->add(std::to_string(static_cast<int>(level)) + " " + std::string(line));
-  });
-}
-
-LogCapture::~LogCapture() { SystemLog::setSink({}); }
 
 }  // namespace vesk::test

@@ -1,70 +1,31 @@
 // A listener with recording sessions behind it, and clients that are driven by hand.
 #pragma once
 
-#include <condition_variable>
-#include <functional>
-#include <memory>
-#include <mutex>
-#include <string>
-#include <string_view>
-#include <vector>
-
-#include "client/protocol/ClientSessionInterface.h"
 #include "client/protocol/WireNames.h"
 #include "platform/ipc/BusClient.h"
 #include "platform/ipc/IPCListener.h"
+#include "tests/support/RecordingSession.h"
+#include "tests/support/TempDirectory.h"
 
 namespace vesk::test {
 
-/// Lines in the order in which they happened, on whatever thread.
-class Journal {
+/// A message's "do" decides what becomes of it: "throw", "abandon", "keep" (answered later, by the test),
+/// "farewell" (the destruction calls the client); else it is answered with its "n" and as many dots as its
+/// "pad" says. Tokens are left to the test.
+class ActingSession final : public RecordingSession {
  public:
-  void add(std::string line);
-  /// Waits until `count` lines begin with `beginning`; false when that takes half a minute.
-  bool waitFor(std::string_view beginning, std::size_t count = 1);
-  std::size_t count(std::string_view beginning);
-  std::vector<std::string> lines();
+  ActingSession(Record& record, std::shared_ptr<IPCConnection> connection)
+      : RecordingSession(record), _connection(std::move(connection)) {}
+  ~ActingSession() override;
 
- private:
-  std::size_t countLocked(std::string_view beginning) const;
-  std::mutex _mutex;
-  std::condition_variable _changed;
-  std::vector<std::string> _lines;
-};
-
-/// Journals each call. A message's "do" decides what becomes of it: "throw", "abandon", "keep" (answered
-/// later, by the test), "farewell" (the destruction calls the client); else it is answered with its "n" and
-/// as many dots as its "pad" says.
-class RecordingSession final : public ClientSessionInterface {
- public:
-  RecordingSession(Journal& journal, std::shared_ptr<IPCConnection> connection)
-      : _journal(journal), _connection(std::move(connection)) {}
-  ~RecordingSession() override;
-
-  void setSessionInfo(const Dictionary& sessionInfo, const std::optional<Dictionary>& userInfo,
-                      const List& frameworksToCheck, bool hasAggregationBlock) override;
-  void startConfigWithCompletionHandler(Reply<std::optional<BackendNames>> reply) override;
-  void fetchStatesWithUserInfo(const std::optional<Dictionary>& userInfo,
-                               Reply<std::optional<BackendNames>> completionHandler) override;
-  void fetchDisplayURL(Reply<std::string> reply) override;
-  void sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
-                               const std::optional<Dictionary>& payload,
-                               Reply<std::optional<std::string>> reply) override;
   void sendMessageWithDictionary(const Dictionary& parameters,
                                  Reply<std::optional<std::string>> reply) override;
-  void flushMessagesWithReply(Reply<std::optional<std::string>> reply) override;
   void uploadFileAtPath(const std::string& fileURL, const std::string& extensionToken,
                         Reply<bool> completionHandler) override;
-  void uploadLogData(const List& logData, Reply<bool, std::optional<std::string>> completionHandler) override;
-  void sendMessageWithSessionInfo(const Dictionary& sessionInfo, const std::optional<Dictionary>& userInfo,
-                                  std::uint16_t category, std::uint16_t type,
-                                  const std::optional<Dictionary>& payload,
-                                  Reply<std::string> reply) override;
 
   Reply<std::optional<std::string>> kept;
 
  private:
-  Journal& _journal;
   const std::shared_ptr<IPCConnection> _connection;
   bool _saysFarewell = false;
 };
@@ -75,7 +36,6 @@ class TestService : public IPCListenerDelegate {
   enum class Accept { Resume, NotResume, Refuse };
 
   explicit TestService(const std::function<void(IPCListener::Options&)>& adjust = {});
-  ~TestService() override;
 
   bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) override;
 
@@ -83,18 +43,18 @@ class TestService : public IPCListenerDelegate {
   IPCListener& listener() { return *_listener; }
   /// The connection accepted as the `index`th, while somebody holds it.
   std::shared_ptr<IPCConnection> connection(std::size_t index = 0);
-  std::shared_ptr<RecordingSession> session(std::size_t index = 0);
+  std::shared_ptr<ActingSession> session(std::size_t index = 0);
 
   Accept accept = Accept::Resume;
   std::function<void()> onInvalidation;
-  Journal journal;
+  Record journal;
 
  private:
-  std::string _directory;
+  TempDirectory _directory;
   std::string _path;
   std::mutex _mutex;
   std::vector<std::weak_ptr<IPCConnection>> _connections;
-  std::vector<std::weak_ptr<RecordingSession>> _sessions;
+  std::vector<std::weak_ptr<ActingSession>> _sessions;
   std::unique_ptr<IPCListener> _listener;
 };
 
@@ -154,17 +114,6 @@ class RawClient {
 
  private:
   FileDescriptor _socket;
-};
-
-/// Collects the log's lines while it lives.
-class LogCapture {
- public:
-  LogCapture();
-  ~LogCapture();
-  Journal& lines() { return *_lines; }
-
- private:
-  std::shared_ptr<Journal> _lines = std::make_shared<Journal>();
 };
 
 }  // namespace vesk::test

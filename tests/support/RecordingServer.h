@@ -1,13 +1,7 @@
 // A server that keeps what it gets and answers as a test wants.
 #pragma once
 
-#include <cstddef>
-#include <functional>
-#include <memory>
 #include <mutex>
-#include <string>
-#include <utility>
-#include <vector>
 
 #include "tools/collector/CertificateAuthority.h"
 #include "tools/collector/HTTPServer.h"

@@ -27,15 +27,14 @@ std::size_t addHeader(char* data, std::size_t, std::size_t size, void* answer) {
 }  // namespace
 
 WebAnswer WebClient::perform(const std::string& method, const std::string& url,
-                             const std::vector<std::string>& headers, const std::string* body,
-                             long timeoutMilliseconds) {
+                             const std::vector<std::string>& headers, const std::string* body) {
   WebAnswer answer;
   CURL* curl = _curl.get();
   curl_easy_reset(curl);
   curl_easy_setopt(curl, CURLOPT_URL, url.c_str());
   curl_easy_setopt(curl, CURLOPT_NOSIGNAL, 1L);
   curl_easy_setopt(curl, CURLOPT_PROXY, "");
-  curl_easy_setopt(curl, CURLOPT_TIMEOUT_MS, timeoutMilliseconds);
+  curl_easy_setopt(curl, CURLOPT_TIMEOUT_MS, 10'000L);
   curl_easy_setopt(curl, CURLOPT_WRITEFUNCTION, &appendBody);
   curl_easy_setopt(curl, CURLOPT_WRITEDATA, &answer);
   curl_easy_setopt(curl, CURLOPT_HEADERFUNCTION, &addHeader);
@@ -45,12 +44,7 @@ WebAnswer WebClient::perform(const std::string& method, const std::string& url,
     curl_easy_setopt(curl, CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(body->size()));
     curl_easy_setopt(curl, CURLOPT_POSTFIELDS, body->data());
   }
-  if (method == "HEAD") {
-    curl_easy_setopt(curl, CURLOPT_NOBODY, 1L);
-  } else {
-    curl_easy_setopt(curl, CURLOPT_CUSTOMREQUEST, method.c_str());
-  }
-
+  curl_easy_setopt(curl, CURLOPT_CUSTOMREQUEST, method.c_str());
   curl_slist* list = nullptr;
   for (const auto& header : headers) list = curl_slist_append(list, header.c_str());
   curl_easy_setopt(curl, CURLOPT_HTTPHEADER, list);

@@ -31,12 +31,10 @@ class WebClient {
                  const std::vector<std::string>& headers = {}) {
     return perform("POST", url, headers, &body);
   }
-  /// `body` may be null.
-  WebAnswer perform(const std::string& method, const std::string& url,
-                    const std::vector<std::string>& headers, const std::string* body,
-                    long timeoutMilliseconds = 10'000);
 
  private:
+  WebAnswer perform(const std::string& method, const std::string& url,
+                    const std::vector<std::string>& headers, const std::string* body);
   struct Cleanup {
     void operator()(CURL* curl) const { curl_easy_cleanup(curl); }
   };
