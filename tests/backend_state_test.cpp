@@ -61,34 +61,27 @@ class BackendState : public ::testing::Test {
 };
 
 TEST_F(BackendState, FollowsTheMatchingEntry) {
-  struct Case {
+  const struct {
     const char* name;
     Dictionary entry;
     std::int32_t state;
-    std::pair<int, const char*> line{0, ""};
-  };
-  const Case cases[] = {
+    int level = 0;
+    const char* line = nullptr;  // after the name of the function
+  } cases[] = {
       {"all allowed", entry(), 2},
       {"client by name", entry({{"client", "Phone,camera"}}), 2},
       {"client is no fragment", entry({{"client", "Cam"}}), 1},
       {"service by fragment", entry({{"service", "mail,call"}}), 2},
       {"other service", entry({{"service", "mail"}}), 1},
-      {"other region",
-       entry({{"locale_whitelist", List{"DE", "FR"}}}),
-       1,
-       {7, "HTTPSPostBackend(updateBackendState): (US) isn't in locale list (DE, FR)"}},
+      {"other region", entry({{"locale_whitelist", List{"DE", "FR"}}}), 1, 7,
+       "(US) isn't in locale list (DE, FR)"},
       {"empty region list", entry({{"locale_whitelist", List{}}}), 1},
       {"no region list", entry({}, "locale_whitelist"), 1},
       {"device by fragment", entry({{"device_whitelist", List{"pho"}}}), 2},
-      {"other device",
-       entry({{"device_whitelist", List{"Pad"}}}),
-       1,
-       {7, "HTTPSPostBackend(updateBackendState): (Phone) isn't in device list (Pad)"}},
+      {"other device", entry({{"device_whitelist", List{"Pad"}}}), 1, 7,
+       "(Phone) isn't in device list (Pad)"},
       {"empty device list", entry({{"device_whitelist", List{}}}), 2},
-      {"no filters",
-       entry({}, "filters"),
-       1,
-       {4, "HTTPSPostBackend(updateBackendState): filters are required."}},
+      {"no filters", entry({}, "filters"), 1, 4, "filters are required."},
       {"no sampling", entry({}, "sampling_threshold"), 1},
       {"draw at the threshold", entry({{"sampling_threshold", 0.30}}), 2},
       {"draw above, no override", entry({{"sampling_threshold", 0.29}}), 3},
@@ -96,24 +89,10 @@ TEST_F(BackendState, FollowsTheMatchingEntry) {
       {"draw outside override", entry({{"sampling_threshold", 0.1}, {"override_sampling", 0.20}}), 1},
       {"threshold of a wrong type", entry({{"sampling_threshold", "high"}}), 1},
       {"filters of a wrong type", entry({{"filters", 7}}), 1},
-      {"threshold",
-       entry({{"event_threshold", 7}}),
-       2,
-       {7, "HTTPSPostBackend(updateBackendState): event_threshold set to 7"}},
-      {"no threshold",
-       entry(),
-       2,
-       {7,
-        "HTTPSPostBackend(updateBackendState): event_threshold value not found in storebag - defaulting to "
-        "49"}},
-      {"expedite",
-       entry({{"expedite", 1}}),
-       2,
-       {7, "HTTPSPostBackend(updateBackendState): Store bag override  _batchEvent=0"}},
-      {"summary",
-       entry(),
-       2,
-       {7, "HTTPSPostBackend(updateBackendState): httpPost: client found Camera, state? 2, 0.300000"}},
+      {"threshold", entry({{"event_threshold", 7}}), 2, 7, "event_threshold set to 7"},
+      {"no threshold", entry(), 2, 7, "event_threshold value not found in storebag - defaulting to 49"},
+      {"expedite", entry({{"expedite", 1}}), 2, 7, "Store bag override  _batchEvent=0"},
+      {"summary", entry(), 2, 7, "httpPost: client found Camera, state? 2, 0.300000"},
   };
   for (const auto& test : cases) {
     SCOPED_TRACE(test.name);
@@ -121,8 +100,8 @@ TEST_F(BackendState, FollowsTheMatchingEntry) {
     auto backend = make(List{test.entry});
     backend->updateState();
     EXPECT_EQ(backend->state(), test.state);
-    if (test.line.first != 0) {
-      EXPECT_EQ(log.count(test.line.first, test.line.second), 1);
+    if (test.line) {
+      EXPECT_EQ(log.count(test.level, std::string("HTTPSPostBackend(updateBackendState): ") + test.line), 1);
     }
   }
 }
@@ -151,18 +130,17 @@ TEST_F(BackendState, AnUnknownRegionPasses) {
 }
 
 TEST_F(BackendState, ConsentIsRespectedUnlessTheStorebagOverridesIt) {
-  struct Case {
+  const struct {
     bool consent;
     std::optional<int> override;
     std::int32_t state;
     const char* clientId;
     bool printable;
-  };
-  const Case cases[] = {{true, std::nullopt, 2, "id-respecting", true},
-                        {true, 1, 2, "id-overriding", false},
-                        {false, 1, 2, "id-overriding", false},
-                        {false, std::nullopt, 1, "", false},
-                        {false, 2, 1, "", false}};
+  } cases[] = {{true, std::nullopt, 2, "id-respecting", true},
+               {true, 1, 2, "id-overriding", false},
+               {false, 1, 2, "id-overriding", false},
+               {false, std::nullopt, 1, "", false},
+               {false, 2, 1, "", false}};
   for (const auto& test : cases) {
     SCOPED_TRACE(test.clientId);
     CapturedLog log;

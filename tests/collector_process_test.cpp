@@ -22,17 +22,10 @@ class CollectorProcess : public ::testing::Test {
  protected:
   ChildProcess::Options options(std::vector<std::string> further = {}) const {
     ChildProcess::Options options;
-    options.command = {VESK_COLLECTOR,
-                       "--directory",
-                       (_files / "collector").string(),
-                       "--https-port",
-                       "0",
-                       "--http-port",
-                       "0",
-                       "--udp-port",
-                       "0",
-                       "--ready-file",
-                       (_files / "ready.json").string()};
+    options.command = {VESK_COLLECTOR, "--directory", _files / "collector", "--ready-file",
+                       _files / "ready.json"};
+    for (const char* port : {"--https-port", "--http-port", "--udp-port"})
+      options.command.insert(options.command.end(), {port, "0"});
     options.command.insert(options.command.end(), further.begin(), further.end());
     return options;
   }

@@ -2,9 +2,7 @@
 #include <gtest/gtest.h>
 
 #include <set>
-#include <string>
 #include <thread>
-#include <vector>
 
 #include "platform/crypto/Base64.h"
 #include "platform/crypto/Digest.h"

@@ -2,8 +2,6 @@
 #include <gtest/gtest.h>
 
 #include <numeric>
-#include <set>
-#include <thread>
 
 #include "backends/DashboardDelivery.h"
 #include "platform/queue/TimedQueuePool.h"
@@ -252,43 +250,6 @@ TEST_F(Delivery, GoesOnWithoutWhatItCanNotHave) {
   _delivery.reset();
   _queue->advance(milliseconds(10'000));
   EXPECT_EQ(openDescriptors(), before) << "closed although no read source was there to be cancelled";
-}
-
-TEST(DeliveryOnThreads, EverythingArrivesAndEndsWhateverIsGoingOn) {
-  constexpr int kSenders = 4;
-  constexpr int kEach = 40;
-  const long before = openDescriptors();
-  Counters counters;
-  std::set<std::string> arrived;
-  {
-    DashboardServer server;
-    TimedQueuePool pool(2);
-    std::vector<std::thread> senders;
-    for (int sender = 0; sender < kSenders; ++sender) {
-      senders.emplace_back([&, sender] {
-        UDPSocket socket;
-        ASSERT_EQ(socket.open(), 0);
-        auto delivery = std::make_shared<DashboardDelivery>(std::move(socket), pool.makeQueue("test"),
-                                                            counters, "dashboard");
-        delivery->useReliableUDP();
-        ASSERT_TRUE(delivery->connect(server.endpoint()));
-        ASSERT_TRUE(delivery->start(milliseconds(3)));
-        for (int i = 0; i < kEach; ++i) {
-          auto buffer = std::make_unique<DashboardDelivery::Buffer>();
-          buffer->fill(static_cast<char>(sender));
-          (*buffer)[61] = static_cast<char>(i);
-          (*buffer)[60] = 0;
-          delivery->send(std::move(buffer), kDashboardHeaderSize, static_cast<std::uint16_t>(i));
-        }
-        delivery->cleanup();
-      });
-    }
-    while (static_cast<int>(arrived.size()) < kSenders * kEach || !pool.waitUntilUnused(milliseconds(1)))
-      for (const auto& datagram : server.takeAndAcknowledge()) arrived.insert(datagram);
-    for (auto& sender : senders) sender.join();
-  }
-  EXPECT_EQ(counters.snapshot().size(), 0u) << "nothing was lost";
-  EXPECT_EQ(openDescriptors(), before);
 }
 
 TEST(DeliveryOnThreads, StoppedThreadsLeaveNothingBehind) {

@@ -2,12 +2,11 @@
 #include <gtest/gtest.h>
 
 #include <csignal>
-#include <fstream>
 #include <set>
-#include <thread>
 
 #include "tests/support/DaemonHarness.h"
 #include "tests/support/DashboardServer.h"
+#include "tests/support/ProcessFacts.h"
 
 namespace vesk::test {
 namespace {
@@ -44,12 +43,6 @@ class DashboardRoad : public testing::Test {
       count += sockets.find(" " + target.substr(8, target.size() - 9) + " ") != std::string::npos;
     }
     return count;
-  }
-  void expectNoDatagramDescriptors() {
-    auto deadline = std::chrono::steady_clock::now() + ChildProcess::kPatience;
-    while (datagramDescriptors() > 0 && std::chrono::steady_clock::now() < deadline)
-      std::this_thread::sleep_for(std::chrono::milliseconds(5));  // between two looks
-    EXPECT_EQ(datagramDescriptors(), 0);
   }
   long residentKiB() {
     std::ifstream status("/proc/" + std::to_string(_harness->daemon().pid()) + "/status");
@@ -151,7 +144,7 @@ TEST_F(DashboardRoad, AnEndedSessionLeavesNoDescriptorBehind) {
       ASSERT_TRUE(client.reporting.sendMessageAndWait(3, 1, Dictionary{{"n", 1}}));
       if (!answered) _harness->stopCollector();
     }
-    expectNoDatagramDescriptors();
+    EXPECT_TRUE(eventually([&] { return datagramDescriptors() == 0; }));
     // A tick may also come between a datagram and its answer.
     if (answered) continue;
     EXPECT_NE(_harness->daemon().errors().find("scheduled last resort clean-up in 9500 ms."),

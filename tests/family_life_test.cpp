@@ -69,11 +69,14 @@ TEST_F(FamilyLife, ADestroyedAggregatorGetsItsOwnLastMessageBeforeTheClosingOne)
 }
 
 TEST_F(FamilyLife, ASessionThatMovesTakesItsHeldEventsAlongAndItsNextMessageGoesToTheNewAncestor) {
+  CapturedLog log;
   auto top = join(0);
   auto other = join(0, true, "Other");
   auto child = join(1, false, "MyApp", true);
   child.send(message(0));
   child->fetchStatesWithUserInfo(userInfo("Other"), {});
+  EXPECT_EQ(log.count(7, "userInfoUpdatedForSession: Adding session 101 to list for userInfoKey other:calls"),
+            1);
   other.connection->calls.clear();
   child.send(message(0));
   EXPECT_EQ(other.connection->calls.size(), 1u);

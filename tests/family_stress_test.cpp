@@ -5,7 +5,6 @@
 #include <atomic>
 #include <cstdlib>
 #include <random>
-#include <thread>
 
 #include "tests/support/DaemonHarness.h"
 

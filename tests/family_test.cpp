@@ -67,18 +67,6 @@ TEST_F(Family, TheHighestAggregatorGetsTheMessages) {
   EXPECT_EQ(log.count(3, "sendMessageWithDictionary: Failed to get remote object proxy: gone"), 1);
 }
 
-TEST_F(Family, ASessionThatMovesTakesItsPlaceElsewhere) {
-  CapturedLog log;
-  auto top = join(0);
-  auto other = join(0, false, "Other");
-  auto child = join(1);
-  child->fetchStatesWithUserInfo(userInfo("Other"), {});
-  child.send(message());
-  EXPECT_EQ(lastSessionID(), other->sessionIDString() + "." + child->sessionIDString());
-  EXPECT_EQ(log.count(7, "userInfoUpdatedForSession: Adding session 101 to list for userInfoKey other:calls"),
-            1);
-}
-
 TEST_F(Family, ASessionLeavesItsFamilyUnderWhateverNameItJoined) {
   std::weak_ptr<ReportingdSession> tookItBack;
   std::weak_ptr<ReportingdSession> configuredAnew;

@@ -5,7 +5,6 @@
 #include <boost/json.hpp>
 #include <cmath>
 #include <limits>
-#include <string>
 
 namespace vesk {
 namespace {

@@ -4,27 +4,17 @@
 
 #include <atomic>
 #include <future>
-#include <memory>
 #include <stdexcept>
-#include <string>
 #include <system_error>
 #include <thread>
-#include <vector>
 
-#include "platform/log/SystemLog.h"
 #include "platform/queue/WorkQueue.h"
+#include "tests/support/CapturedLog.h"
 
 namespace vesk {
 namespace {
 
 using std::chrono::milliseconds;
-
-/// Waits until everything submitted to the queue before has run.
-void drain(WorkQueue queue) {
-  std::promise<void> done;
-  queue.submit([&done] { done.set_value(); });
-  done.get_future().wait();
-}
 
 struct Pipe {
   Pipe() {
@@ -40,9 +30,23 @@ struct Pipe {
   int ends[2] = {-1, -1};
 };
 
-TEST(WorkQueue, RunsItsWorkOneAtATimeInOrder) {
-  WorkQueuePool pool(3);
-  WorkQueue queue(pool);
+class Queues : public testing::Test {
+ protected:
+  /// Waits until everything submitted to the queue before has run.
+  static void drain(WorkQueue& queue) {
+    std::promise<void> done;
+    queue.submit([&done] { done.set_value(); });
+    done.get_future().wait();
+  }
+
+  WorkQueuePool pool{3};
+  WorkQueue queue{pool};
+  std::promise<void> done;
+};
+using WorkTimerTest = Queues;
+using ReadSourceTest = Queues;
+
+TEST_F(Queues, RunsItsWorkOneAtATimeInOrder) {
   std::vector<int> order;  // guarded by the queue itself
   std::atomic<int> inside{0};
   for (int i = 0; i < 500; ++i) {
@@ -57,9 +61,8 @@ TEST(WorkQueue, RunsItsWorkOneAtATimeInOrder) {
   EXPECT_TRUE(std::is_sorted(order.begin(), order.end()));
 }
 
-TEST(WorkQueue, ABlockedQueueDoesNotHoldUpAnother) {
-  WorkQueuePool pool(2);
-  WorkQueue blocked(pool);
+TEST_F(Queues, ABlockedQueueDoesNotHoldUpAnother) {
+  WorkQueue& blocked = queue;
   WorkQueue other(pool);
   std::promise<void> gate;
   blocked.submit([future = gate.get_future().share()] { future.wait(); });
@@ -68,25 +71,16 @@ TEST(WorkQueue, ABlockedQueueDoesNotHoldUpAnother) {
   drain(blocked);
 }
 
-TEST(WorkQueue, GoesOnAfterWorkThatThrows) {
-  std::atomic<int> lines{0};
-  SystemLog::setSink([&](LogLevel level, std::string_view) { lines += level == LogLevel::Error; });
-  {
-    WorkQueuePool pool(1);
-    WorkQueue queue(pool);
-    queue.submit([] { throw std::runtime_error("broken"); });
-    queue.submit([] { throw 7; });
-    drain(queue);
-  }
-  SystemLog::setSink(nullptr);
-  EXPECT_EQ(lines, 2);
+TEST_F(Queues, GoOnAfterWorkThatThrows) {
+  test::CapturedLog log;
+  queue.submit([] { throw std::runtime_error("broken"); });
+  queue.submit([] { throw 7; });
+  drain(queue);
+  EXPECT_EQ(log.countContaining(3, ""), 2);
 }
 
-TEST(WorkQueue, DelayedWorkRunsOnceAndInTheOrderOfItsDelays) {
-  WorkQueuePool pool(2);
-  WorkQueue queue(pool);
+TEST_F(Queues, DelayedWorkRunsOnceAndInTheOrderOfItsDelays) {
   std::vector<int> order;
-  std::promise<void> done;
   queue.submitAfter(milliseconds(60), [&] {
     order.push_back(2);
     done.set_value();
@@ -96,10 +90,7 @@ TEST(WorkQueue, DelayedWorkRunsOnceAndInTheOrderOfItsDelays) {
   EXPECT_EQ(order, (std::vector<int>{1, 2}));
 }
 
-TEST(WorkTimer, RepeatsUntilItCancelsItself) {
-  WorkQueuePool pool(2);
-  WorkQueue queue(pool);
-  std::promise<void> done;
+TEST_F(WorkTimerTest, RepeatsUntilItCancelsItself) {
   int fired = 0;
   WorkTimer timer;
   queue.submit([&] {
@@ -117,9 +108,7 @@ TEST(WorkTimer, RepeatsUntilItCancelsItself) {
   EXPECT_EQ(fired, 3);
 }
 
-TEST(WorkTimer, CancelledOnItsQueueItNeverFiresAndLetsItsCapturesGo) {
-  WorkQueuePool pool(2);
-  WorkQueue queue(pool);
+TEST_F(WorkTimerTest, CancelledOnItsQueueItNeverFiresAndLetsItsCapturesGo) {
   auto token = std::make_shared<int>(1);
   std::promise<void> checked;
   queue.submit([&, kept = token] {
@@ -133,12 +122,10 @@ TEST(WorkTimer, CancelledOnItsQueueItNeverFiresAndLetsItsCapturesGo) {
   drain(queue);
 }
 
-TEST(WorkTimer, ManyComeAndGoFromSeveralThreads) {
-  WorkQueuePool pool(2);
-  WorkQueue queue(pool);
+TEST_F(WorkTimerTest, ManyComeAndGoFromSeveralThreads) {
   std::vector<std::thread> threads;
   for (int t = 0; t < 3; ++t) {
-    threads.emplace_back([&queue] {
+    threads.emplace_back([this] {
       for (int i = 0; i < 200; ++i) {
         WorkTimer timer(queue, milliseconds(i % 2), milliseconds(1), [] {});
         WorkTimer moved = std::move(timer);
@@ -151,11 +138,8 @@ TEST(WorkTimer, ManyComeAndGoFromSeveralThreads) {
   drain(queue);
 }
 
-TEST(ReadSource, IsCalledAgainWhileAnythingIsLeft) {
-  WorkQueuePool pool(2);
-  WorkQueue queue(pool);
+TEST_F(ReadSourceTest, IsCalledAgainWhileAnythingIsLeft) {
   Pipe pipe;
-  std::promise<void> done;
   std::string read;
   ReadSource source(queue, pipe.ends[0], [&] {
     char byte = 0;
@@ -169,11 +153,8 @@ TEST(ReadSource, IsCalledAgainWhileAnythingIsLeft) {
   EXPECT_EQ(read, "abcdef");
 }
 
-TEST(ReadSource, CancelsItselfAtTheEndOfItsStream) {
-  WorkQueuePool pool(1);
-  WorkQueue queue(pool);
+TEST_F(ReadSourceTest, CancelsItselfAtTheEndOfItsStream) {
   auto pipe = std::make_unique<Pipe>();
-  std::promise<void> done;
   int calls = 0;
   ReadSource source;
   queue.submit([&] {

@@ -11,8 +11,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
-#include <filesystem>
-#include <string>
 
 #include "tests/support/DaemonHarness.h"
 

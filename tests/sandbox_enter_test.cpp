@@ -16,12 +16,7 @@
 
 #include <csignal>
 #include <cstring>
-#include <filesystem>
-#include <fstream>
-#include <functional>
-#include <string>
 #include <thread>
-#include <vector>
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/files/RootPrefix.h"

@@ -8,9 +8,7 @@
 #include <unistd.h>
 
 #include <cstdlib>
-#include <filesystem>
 #include <future>
-#include <string>
 #include <thread>
 
 #include "daemon/RunLoop.h"

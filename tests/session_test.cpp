@@ -1,8 +1,6 @@
 // Sessions driven by hand: configuration, dispatch, answers, and their end.
 #include <gtest/gtest.h>
 
-#include <filesystem>
-
 #include "tests/support/AgentHarness.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/TestRoot.h"
@@ -141,11 +139,10 @@ TEST_F(Session, DisplayURLComesFromTheFirstBackendThatHasOne) {
     changed.set("display_url", url);
     return changed.share();
   };
-  struct Case {
+  const struct {
     Dictionary storebag;
     const char* expected;
-  };
-  const Case cases[] = {
+  } cases[] = {
       {Dictionary{{"httpPost", profile("/")}}, "URL not available"},
       {Dictionary{{"httpPost2", with("http://b")}, {"httpPost", with("http://a")}},
        "http://a?sequences=77&override=yes"},

@@ -2,19 +2,11 @@
 #include <gtest/gtest.h>
 
 #include <cstdlib>
-#include <functional>
-#include <memory>
-#include <mutex>
-#include <optional>
-#include <string>
-#include <vector>
 
 #include "platform/crypto/Base64.h"
-#include "platform/crypto/RSAPublicKey.h"
 #include "platform/plist/PropertyList.h"
 #include "storebag/StorebagFallback.h"
 #include "storebag/StorebagFetch.h"
-#include "storebag/StorebagSignature.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/RecordingServer.h"
 #include "tests/support/TestRoot.h"
@@ -176,12 +168,11 @@ TEST_F(StorebagFetch, EveryFailureSaysWhatItIs) {
   const std::pair<int, std::string> unsigned_{3, withName("Signature is missing")};
   const std::pair<int, std::string> invalid{3, withName("Signature can not be verified, 0x")};
   const std::pair<int, std::string> unreadable{3, withName("propertyListWithData error ")};
-  struct Case {
+  const struct {
     const char* name;
     std::string body;
     Lines lines;
-  };
-  const Case cases[] = {
+  } cases[] = {
       {"no property list", "junk", {unreadable, unsigned_, unfetched}},
       {"nothing", "", {unreadable, unsigned_, unfetched}},
       {"a list", *writeXMLPropertyList(List{1}), {unsigned_, unfetched}},
@@ -355,17 +346,17 @@ TEST(StorebagSection, BelongsToItsEnvironment) {
               1);
     EXPECT_EQ(log.count(4, forClientType("Seed section is missing in the storebag.")), type == 3);
   }
+  EXPECT_FALSE(storebagSectionForEnvironment(all, -1, 5));
   CapturedLog log;
   EXPECT_FALSE(storebagSectionForEnvironment({{"development", "text"}}, 1, 9));
   EXPECT_EQ(log.countContaining(4, "'development'"), 1);
 }
 
 TEST(StorebagAge, IsWhatCacheControlGrants) {
-  struct Case {
+  const struct {
     std::optional<std::string_view> header;
     std::int32_t age;
-  };
-  const Case cases[] = {
+  } cases[] = {
       {std::nullopt, 86400},
       {"", 86400},
       {"no-cache", 86400},
@@ -390,17 +381,6 @@ TEST(StorebagAge, IsWhatCacheControlGrants) {
   for (const auto& test : cases) {
     EXPECT_EQ(maxAgeFromCacheControl(test.header), test.age) << test.header.value_or("(none)");
   }
-}
-
-TEST(StorebagSignature, CoversEveryByteOfThePayload) {
-  TestSigningKey key;
-  auto publicKey = RSAPublicKey::fromDER(key.bareKey());
-  ASSERT_TRUE(publicKey);
-  const std::string bytes("pay\0load", 8);
-  auto signature = key.sign(bytes);
-  EXPECT_TRUE(verifyStorebagSignature(*publicKey, bytes, signature));
-  EXPECT_FALSE(verifyStorebagSignature(*publicKey, "pay", signature));
-  EXPECT_FALSE(verifyStorebagSignature(*publicKey, bytes, bytes));
 }
 
 }  // namespace

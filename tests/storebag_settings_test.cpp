@@ -2,9 +2,6 @@
 #include <gtest/gtest.h>
 
 #include <limits>
-#include <optional>
-#include <string>
-#include <vector>
 
 #include "storebag/StorebagFallback.h"
 #include "storebag/StorebagNaming.h"
@@ -29,20 +26,12 @@ TEST(StorebagNaming, NamesTheStorebagOfAClientType) {
   }
 }
 
-TEST(StorebagNaming, NamesTheSectionOfAnEnvironment) {
-  const std::optional<std::string_view> names[] = {std::nullopt, "development", "corvane_internal",
-                                                   "seed",       "release",     std::nullopt};
-  for (int type = 0; type < 6; ++type) EXPECT_EQ(environmentNameForType(type), names[type]) << type;
-  EXPECT_FALSE(environmentNameForType(-1));
-}
-
 TEST(StorebagNaming, ReadsTheEnvironmentTypeFromASetting) {
-  struct Case {
+  const struct {
     std::optional<Value> setting;
     int type;
     const char* invalid = nullptr;
-  };
-  const Case cases[] = {
+  } cases[] = {
       {std::nullopt, 3},
       {Value(0), 0},
       {Value(1), 1},

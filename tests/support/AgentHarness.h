@@ -1,12 +1,7 @@
 // An agent with real backends and a real collector behind it, whose sessions are driven by hand.
 #pragma once
 
-#include <functional>
 #include <map>
-#include <memory>
-#include <optional>
-#include <string>
-#include <vector>
 
 #include "daemon/ReportingdAgent.h"
 #include "tests/support/BackendHarness.h"

@@ -6,12 +6,8 @@
 
 #include <atomic>
 #include <boost/json.hpp>
-#include <chrono>
-#include <memory>
 #include <mutex>
 #include <stdexcept>
-#include <string>
-#include <vector>
 
 #include "backends/VeskReportingBackend.h"
 #include "platform/queue/TimedQueuePool.h"

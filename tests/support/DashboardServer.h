@@ -4,8 +4,6 @@
 #include <gtest/gtest.h>
 
 #include <filesystem>
-#include <string>
-#include <vector>
 
 #include "backends/DashboardDatagram.h"
 #include "platform/net/UDPSocket.h"
@@ -37,16 +35,6 @@ class DashboardServer {
     std::vector<int> ids;
     for (const auto& datagram : take()) ids.push_back(eventIDOfAcknowledgement(datagram).value_or(0xFFFF));
     return ids;
-  }
-  /// The same, each answered with its own bytes.
-  std::vector<std::string> takeAndAcknowledge() {
-    std::vector<std::string> datagrams;
-    char buffer[2048];
-    while (auto size = _socket.receive(buffer, &_client)) {
-      datagrams.emplace_back(buffer, *size);
-      send(datagrams.back());
-    }
-    return datagrams;
   }
   /// To whoever sent last.
   void send(std::string_view datagram) { EXPECT_TRUE(_socket.sendTo(_client, datagram)); }

@@ -3,8 +3,6 @@
 
 #include <gtest/gtest.h>
 
-#include <string>
-
 #include "tests/support/AgentHarness.h"
 #include "tests/support/TestRoot.h"
 

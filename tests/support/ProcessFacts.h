@@ -8,7 +8,6 @@
 #include <fstream>
 #include <iterator>
 #include <string>
-#include <thread>
 
 #include "tests/support/ChildProcess.h"
 

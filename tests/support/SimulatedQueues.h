@@ -4,10 +4,7 @@
 #include <poll.h>
 
 #include <algorithm>
-#include <memory>
 #include <system_error>
-#include <utility>
-#include <vector>
 
 #include "platform/queue/TimedQueue.h"
 
