@@ -20,6 +20,7 @@ constexpr char kLastResortLine[] =
 
 class Delivery : public testing::Test {
  protected:
+  ~Delivery() override { _queue->stop(); }
   void start(bool reliable = true, milliseconds tick = milliseconds(500)) {
     UDPSocket socket;
     ASSERT_EQ(socket.open(), 0);

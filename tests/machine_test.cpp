@@ -206,9 +206,8 @@ TEST(Machine, MayEndAtAnyMomentAndItsClientsReturnByThemselves) {
       Dictionary{{kVeskReportingSessionInfoSessionID, 1}, {kVeskReportingSessionInfoClientType, 5}})));
   ASSERT_TRUE(client.startConfig(ChildProcess::kPatience));
   std::atomic<bool> stop{false};
-  std::atomic<int> answered{0};
   std::thread sender([&] {
-    while (!stop) answered += client.sendMessageAndWait(message(3), 50ms) ? 1 : 0;
+    while (!stop) (void)client.sendMessageAndWait(message(3), 50ms);
   });
   const auto seed = std::random_device()();
   SCOPED_TRACE("seed " + std::to_string(seed));
@@ -230,7 +229,6 @@ TEST(Machine, MayEndAtAnyMomentAndItsClientsReturnByThemselves) {
   stop = true;
   sender.join();
   RecordProperty("rounds", rounds.done());
-  EXPECT_GT(answered, 0);
   auto sent = client.sendMessageAndWait(message(5), ChildProcess::kPatience);
   EXPECT_TRUE(sent) << sent.detail;
   harness.waitForEventsOfMethod(5, 1);

@@ -16,6 +16,7 @@ class SimulatedQueue final : public TimedQueue, public std::enable_shared_from_t
   Clock::time_point now() const override { return _now; }
   void submit(Work work) override { submitAfter(std::chrono::milliseconds::zero(), std::move(work)); }
   void submitAfter(std::chrono::milliseconds delay, Work work) override {
+    if (_isStopped) return;
     _entries.push_back(
         std::make_shared<Entry>(Entry{_now + delay, {}, std::make_shared<const Work>(std::move(work))}));
   }
@@ -49,6 +50,17 @@ class SimulatedQueue final : public TimedQueue, public std::enable_shared_from_t
       readAll();
     }
     _now = end;
+  }
+  /// Lets go of all work, as a pool that stops does: what it holds may hold this queue.
+  void stop() {
+    _isStopped = true;
+    for (auto* list : {&_entries, &_readers}) {
+      while (!list->empty()) {
+        auto entry = std::move(list->back());
+        list->pop_back();
+        auto work = std::exchange(entry->work, nullptr);
+      }
+    }
   }
   /// Timers and delayed work that still wait.
   std::size_t waiting() {
@@ -97,11 +109,13 @@ class SimulatedQueue final : public TimedQueue, public std::enable_shared_from_t
   Clock::time_point _now = Clock::time_point(std::chrono::hours(1));
   std::vector<std::shared_ptr<Entry>> _entries;
   std::vector<std::shared_ptr<Entry>> _readers;
+  bool _isStopped = false;
 };
 
 /// Every backend gets the same queue.
 class SimulatedQueues final : public TimedQueueMaker {
  public:
+  ~SimulatedQueues() override { queue->stop(); }
   std::shared_ptr<TimedQueue> makeQueue(const char*) override { return queue; }
   std::shared_ptr<SimulatedQueue> queue = std::make_shared<SimulatedQueue>();
 };
