@@ -9,6 +9,7 @@
 #include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
 #include "platform/sandbox/Sandbox.h"
+#include "platform/service/DescriptorLimit.h"
 #include "platform/service/ProcessMemory.h"
 #include "platform/service/SchedulingClass.h"
 
@@ -53,6 +54,7 @@ int main(int argc, char** argv) {
   if (const int* status = std::get_if<int>(&parsed)) return *status;
   const auto& options = std::get<vesk::DaemonOptions>(parsed);
   vesk::setUpAllocator();
+  vesk::raiseDescriptorLimit();
   if (options.root) vesk::setRootPrefix(*options.root);
   vesk::SystemLog::setLevel(options.logLevel);
   try {

@@ -19,12 +19,6 @@ namespace {
 
 using namespace std::chrono_literals;
 
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-constexpr bool kIsSanitized = true;
-#else
-constexpr bool kIsSanitized = false;
-#endif
-
 Dictionary message(int category, Dictionary payload = {}, int flag = 0) {
   return Dictionary{{"category", category}, {"type", 2}, {"flag", flag}, {"payload", std::move(payload)}};
 }

@@ -8,10 +8,17 @@
 #include <fstream>
 #include <iterator>
 #include <string>
+#include <thread>
 
 #include "tests/support/ChildProcess.h"
 
 namespace vesk::test {
+
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+constexpr bool kIsSanitized = true;
+#else
+constexpr bool kIsSanitized = false;
+#endif
 
 class ProcessFacts {
  public:

@@ -1,0 +1,10 @@
+// How many descriptors the process may have.
+#pragma once
+
+namespace vesk {
+
+/// Takes all that the hard limit grants: the soft one is low by default for the sake of programs that use
+/// select(), which we don't, and each connection needs a few. To be called before threads start.
+void raiseDescriptorLimit() noexcept;
+
+}  // namespace vesk
