@@ -171,18 +171,25 @@ void HTTPSPostBackend::hold(MutableDictionary event) {
 // Enabled, a full batch is simply sent. Otherwise nobody may be told yet, and the oldest events have to go.
 void HTTPSPostBackend::boundHeldEvents() {
   if (state() == BackendStateEnabled) flushMessagesLocked();
-  std::size_t dropped = 0;
-  while (_batchedEvents && _batchedEvents->size() > 1 && *_heldBytes > kMaximumHeldBytes) {
+  if (!_batchedEvents) return;
+  std::size_t surplus = 0;
+  for (std::size_t bytes = *_heldBytes; bytes > kMaximumHeldBytes && surplus + 1 < _batchedEvents->size();) {
+    bytes -= (*_batchedEvents)[surplus++].bytes;
+  }
+  dropOldestEvents(surplus, kMaximumHeldBytes);
+}
+
+void HTTPSPostBackend::dropOldestEvents(std::size_t count, std::size_t bound) {
+  if (count == 0) return;
+  for (std::size_t i = 0; i < count; ++i) {
     *_heldBytes -= _batchedEvents->front().bytes;
     _batchedEvents->pop_front();
-    ++dropped;
   }
-  if (dropped == 0) return;
-  _services.counters.count(_name, DropReason::OverBound, dropped);
+  _services.counters.count(_name, DropReason::OverBound, count);
   if (std::exchange(_droppingBurst, true)) return;
   VESK_LOG_WARNING(
       "HTTPSPostBackend(batchEvent): backend %s holds more than %zu bytes: dropping its oldest events",
-      _name.c_str(), kMaximumHeldBytes);
+      _name.c_str(), bound);
 }
 
 HTTPSPostBackend::Events HTTPSPostBackend::takeBatch() {
@@ -215,13 +222,21 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesLocked() {
 // Events held before the user info arrived get it now. Its first key tells which events have it already.
 void HTTPSPostBackend::addUserInfoToHeldEvents() {
   if (!_userInfoDict) return;
-  MutableDictionary userInfo(*_userInfoDict);
-  _filters.filterEvent(userInfo);
-  if (userInfo.empty()) return;
-  const Text& marker = userInfo.entries().front().key;
-  for (HeldEvent& held : *_batchedEvents) {
-    if (held.event.contains(marker.view())) continue;
-    for (const auto& entry : userInfo.entries()) held.event.set(entry.key, entry.value);
+  MutableDictionary filtered(*_userInfoDict);
+  _filters.filterEvent(filtered);
+  if (filtered.empty()) return;
+  const Dictionary userInfo = filtered.share();
+  const std::string_view marker = userInfo.begin()->key.view();
+  const std::size_t growth = approximateMemory(userInfo);
+  for (std::size_t left = _batchedEvents->size(); left > 0; --left) {  // the newest first
+    HeldEvent& held = (*_batchedEvents)[left - 1];
+    if (held.event.contains(marker)) continue;
+    if (*_heldBytes + growth > kMaximumFlushBytes && left < _batchedEvents->size()) {
+      return dropOldestEvents(left, kMaximumFlushBytes);
+    }
+    held.event.setAll(userInfo);
+    held.bytes += growth;
+    *_heldBytes += growth;
   }
 }
 

@@ -23,6 +23,8 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   /// Bytes of events that the backends of one session may hold while reporting is not enabled. Above it the
   /// oldest are dropped, and counted.
   static constexpr std::size_t kMaximumHeldBytes = std::size_t{16} << 20;
+  /// The same while they are sent and get user info that came later than they did.
+  static constexpr std::size_t kMaximumFlushBytes = 2 * kMaximumHeldBytes;
 
   /// Nothing when profile or product family are missing, or when the profile has no `clients`.
   static std::shared_ptr<HTTPSPostBackend> create(const std::string& name,
@@ -85,6 +87,7 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   void batchEvent(MutableDictionary event) VESK_REQUIRES(_mutex);
   void hold(MutableDictionary event) VESK_REQUIRES(_mutex);
   void boundHeldEvents() VESK_REQUIRES(_mutex);
+  void dropOldestEvents(std::size_t count, std::size_t bound) VESK_REQUIRES(_mutex);
   void addUserInfoToHeldEvents() VESK_REQUIRES(_mutex);
   Events takeBatch() VESK_REQUIRES(_mutex);
   std::optional<std::string> postNow(MutableDictionary event, std::uint16_t method, std::uint16_t respCode,

@@ -285,6 +285,25 @@ TEST_F(BackendEvents, EventsHeldBeforeTheUserInfoGetItFiltered) {
   EXPECT_EQ(posts[0].request.header("X-Vesk-Service-Name"), "Clips");
 }
 
+TEST_F(BackendEvents, LargeUserInfoThatComesLateGoesWithTheNewestEvents) {
+  auto backend = makeRequiringUserInfo(Dictionary{{"expedite", 0}}, std::nullopt);
+  for (int i = 0; i < 100; ++i) send(*backend, Dictionary{{"n", i}}, static_cast<std::uint16_t>(i));
+  MutableDictionary large(userInfo);
+  large.set("bulk", std::string(std::size_t{1} << 20, 'x'));
+  for (int i = 0; i < 40; ++i) large.set(std::to_string(i), i);
+  large.set("n", "of the user");
+  backend->setUserInfoDict(large.share());
+  backend->updateState();
+  backend->flushMessages();
+  auto post = harness.posts().at(0);
+  const std::size_t sent = post.events().size();
+  EXPECT_EQ(sent, 31u) << "twice what may be held";
+  EXPECT_EQ(sent + harness.dropped(DropReason::OverBound), 100u);
+  EXPECT_EQ(post.event(sent - 1).at("_method"), 99);
+  EXPECT_EQ(post.event(sent - 1).at("n"), "of the user");
+  EXPECT_EQ(post.event(sent - 1).at("39"), 39);
+}
+
 TEST_F(BackendEvents, ServerAnswersDecideTheState) {
   CapturedLog log;
   for (auto [status, stateAfter] :

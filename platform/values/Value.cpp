@@ -4,6 +4,7 @@
 #include <cmath>
 #include <limits>
 #include <unordered_map>
+#include <unordered_set>
 
 namespace vesk {
 
@@ -122,7 +123,19 @@ void MutableDictionary::set(Text key, Value value) {
 }
 
 void MutableDictionary::setAll(const Dictionary& source) {
-  for (const auto& entry : source) set(entry.key, entry.value);
+  if (source.size() <= kLinearScanLimit) {
+    for (const auto& entry : source) set(entry.key, entry.value);
+    return;
+  }
+  // The source is indexed, this one is not.
+  std::unordered_set<const Value*> taken;
+  for (auto& entry : _entries) {
+    const Value* value = source.find(entry.key.view());
+    if (value && taken.insert(value).second) entry.value = *value;
+  }
+  for (const auto& entry : source) {
+    if (!taken.contains(&entry.value)) append(entry.key, entry.value);
+  }
 }
 
 void MutableDictionary::remove(std::string_view key) {
