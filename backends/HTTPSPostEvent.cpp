@@ -1,5 +1,7 @@
 // Event records: what becomes of one message.
+#include <algorithm>
 #include <cmath>
+#include <limits>
 
 #include "backends/HTTPSPostBackend.h"
 #include "backends/SenderCodes.h"
@@ -14,10 +16,11 @@ namespace {
 constexpr std::size_t kFixedFields = 17;
 constexpr std::int32_t kClientTypeWithNumericSessionID = 7;
 
-// Of all sessions that start within a minute the records show the same start.
+// Of all sessions that start within a minute the records show the same start. A clock may be wrong by
+// decades.
 std::int32_t startOfMinute(double seconds) {
-  auto whole = static_cast<std::int32_t>(seconds);
-  return whole / 60 * 60;
+  constexpr double kLatest = std::numeric_limits<std::int32_t>::max();
+  return static_cast<std::int32_t>(std::clamp(seconds, -kLatest, kLatest)) / 60 * 60;
 }
 
 // Sets a field whose source may be unknown; then it stays out of the record.

@@ -6,6 +6,7 @@
 #include "backends/UploadGate.h"
 #include "platform/ipc/ExtensionTokens.h"
 #include "platform/log/SystemLog.h"
+#include "platform/unicode/Unicode.h"
 #include "storebag/StorebagProfile.h"
 #include "util/Gzip.h"
 #include "util/URLQuery.h"
@@ -99,7 +100,6 @@ bool UploadBackend::upload(const std::string& path, const std::string& extension
   auto compressed = compressToBuffer(true, *contents);
   contents.reset();
   if (!compressed) return false;
-  pass->shrinkTo(compressed->size);
 
   auto request = requestFor(path, uploadURL);
   if (!request) {
@@ -109,6 +109,7 @@ bool UploadBackend::upload(const std::string& path, const std::string& extension
   request->timeout = timeoutFor(compressed->size);
   request->body.assign(compressed->bytes.get(), compressed->size);
   compressed.reset();
+  pass->shrinkTo(request->body.size());
   HTTPResult result = _services.uploads->perform(_services.http, std::move(*request));
   if (accepted(result, uploadURL) && !file.removeFrom(path, handle.user)) {
     VESK_LOG_DEBUG("UploadBackend(uploadFileAtPath): Left in its place: %s", path.c_str());
@@ -158,9 +159,10 @@ bool UploadBackend::accepted(const HTTPResult& result, const std::string& upload
     return false;
   }
   const std::string& answer = result.response->body;
+  const bool isText = isValidUTF8(answer);
   VESK_LOG_DEBUG("UploadBackend(uploadFileAtPath): sending to |%s|, Json output: %s", uploadURL.c_str(),
-                 answer.c_str());
-  return answer.find("success") != std::string::npos;
+                 isText ? answer.c_str() : "(null)");
+  return isText && answer.find("success") != std::string::npos;
 }
 
 }  // namespace vesk

@@ -122,6 +122,11 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const Storebag
   VESK_LOG_DEBUG("fetchStorebagWithName: Storebag Server URL: %s", url.c_str());
 
   HTTPResult result = http.perform(requestFor(url, lastModified));
+  if (result.error && result.error->kind == HTTPError::Kind::TooLarge) {
+    // There is an answer, and it is no storebag.
+    VESK_LOG_ERROR("fetchStorebagWithName: propertyListWithData error %s", result.error->description.c_str());
+    return verifiedPayload({}, source);
+  }
   if (result.error) {
     VESK_LOG_INFO(
         "fetchStorebagWithName: Error resolving with lookup server %s, sendSynchronousRequest error %s",

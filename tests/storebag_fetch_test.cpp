@@ -248,6 +248,8 @@ TEST_F(StorebagFetch, AnUnreachableServerMeansTheBuiltInStorebagForOneNameOnly) 
                            {6, forClientType("Store bag override MaxAge=3600")}}));
   }
   server().start();
+  serve(std::string(std::size_t{5} << 20, ' '));
+  EXPECT_FALSE(fetch(7)) << "an answer of any kind does not mean that";
 }
 
 TEST_F(StorebagFetch, ACutOffFetchIsNotRepeated) {

@@ -114,8 +114,9 @@ TEST_F(UploadTest, RemovesTheFileOnlyWhenTheAnswerSaysSuccess) {
     const char* answer;
     bool removed;
   };
-  for (const auto& test : {Case{200, "unsuccessful", true}, Case{500, "{\"success\":0}", true},
-                           Case{200, "Success", false}, Case{200, "", false}, Case{503, "busy", false}}) {
+  for (const auto& test :
+       {Case{200, "unsuccessful", true}, Case{500, "{\"success\":0}", true}, Case{200, "success \xff", false},
+        Case{200, "Success", false}, Case{200, "", false}, Case{503, "busy", false}}) {
     auto path = file();
     answer = [&] {
       HTTPAnswer made;

@@ -93,6 +93,7 @@ TEST_F(Device, CopiesItsIdentifierIntoABuffer) {
   EXPECT_EQ(roomy[49], '\0');
   char cramped[] = "12345678|behind";
   copyUniqueDeviceID(cramped, 8);
+  EXPECT_STREQ(cramped, "");
   EXPECT_STREQ(cramped + 8, "|behind");
   copyUniqueDeviceID(nullptr, 0);
 }

@@ -36,7 +36,8 @@ void copyUniqueDeviceID(char* buffer, std::size_t size) {
   if (size == 0) return;
   auto identifier = QNCopyAnswer("UniqueDeviceID");
   if (!identifier) return;
-  const std::size_t fitting = std::min(identifier->size(), size - 1);
+  // Half an identifier would be another one.
+  const std::size_t fitting = identifier->size() < size ? identifier->size() : 0;
   std::memcpy(buffer, identifier->data(), fitting);
   buffer[fitting] = '\0';
   buffer[size - 1] = '\0';
