@@ -41,7 +41,14 @@ bool DashboardBackend::uploadLogData(const List& logData) {
     VESK_LOG_ERROR("DashboardBackend(uploadLogData): Failed to serialize log data array for upload");
     return false;
   }
-  const HTTPResult result = _services.http.perform(requestFor(*_postURL, *std::move(archive)));
+  const auto pass = _services.uploads->enter(archive->size());
+  if (!pass) {
+    VESK_LOG_ERROR("DashboardBackend(uploadLogData): Error uploading log data array (%s)",
+                   "too many uploads are under way");
+    return false;
+  }
+  const HTTPResult result =
+      _services.uploads->perform(_services.http, requestFor(*_postURL, *std::move(archive)));
   if (const char* problem = problemWith(result)) {
     VESK_LOG_ERROR("DashboardBackend(uploadLogData): Error uploading log data array (%s)", problem);
     return false;

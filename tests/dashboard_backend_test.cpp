@@ -265,6 +265,13 @@ TEST_F(Dashboard, RefusesLogDataThatCanNotGo) {
   EXPECT_FALSE(backend->uploadLogData(List{1}));
   EXPECT_EQ(_log.countContaining(3, "DashboardBackend(uploadLogData): Error uploading log data array ("), 1);
   EXPECT_FALSE(make(profile(Dictionary{{"post_url", "nowhere"}}))->uploadLogData(List{1}));
+  _services.uploads =
+      std::make_shared<UploadGate>(UploadGate::Limits{.uploads = 0, .bytes = 0, .patience = {}});
+  EXPECT_FALSE(backend->uploadLogData(List{1}));
+  EXPECT_EQ(_log.count(3,
+                       "DashboardBackend(uploadLogData): Error uploading log data array "
+                       "(too many uploads are under way)"),
+            1);
   _queues.queue->run();
   EXPECT_TRUE(_server.take().empty());
 }
