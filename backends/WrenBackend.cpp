@@ -112,17 +112,28 @@ std::optional<std::string> WrenBackend::sendMessageLocked(const std::optional<Di
     _services.counters.count(_name, DropReason::AdaptorFailed);
     return std::nullopt;
   }
-  auto problem = guarded([&] {
-    const Dictionary dictionary = payload.value_or(Dictionary());
-    WrenPayload view(dictionary);
-    forward(_wrenAdaptor.get(), method, respCode, &view.view());
-  });
+  // An adaptor may take its time. Whoever else wants something of this backend, the agent with its monitor
+  // among them, must not wait for that.
+  _mutex.unlock();
+  auto problem = forwardTo(forward, method, respCode, payload);
+  _mutex.lock();
   if (problem) {
     VESK_LOG_ERROR("WrenBackend(sendMessage): Wren adaptor %s failed: %s", adaptorDescription(),
                    problem->c_str());
     _services.counters.count(_name, DropReason::AdaptorFailed);
   }
   return std::nullopt;
+}
+
+std::optional<std::string> WrenBackend::forwardTo(VeskWrenSendMessage forward, std::uint16_t method,
+                                                  std::uint16_t respCode,
+                                                  const std::optional<Dictionary>& payload) noexcept {
+  MutexLock lock(_adaptorMutex);
+  return guarded([&] {
+    const Dictionary dictionary = payload.value_or(Dictionary());
+    WrenPayload view(dictionary);
+    forward(_wrenAdaptor.get(), method, respCode, &view.view());
+  });
 }
 
 VeskWrenSendMessage WrenBackend::forwardingOperation() const noexcept {

@@ -1,9 +1,12 @@
 // The adaptor backend with adaptors that are really loaded: the example's, and such as are of no use.
 #include <VeskReporting/WrenAdaptor.h>
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 
 #include <cmath>
 #include <filesystem>
+#include <future>
 
 #include "backends/WrenBackend.h"
 #include "platform/files/RootPrefix.h"
@@ -102,6 +105,20 @@ TEST_F(AdaptorTest, WhatIsOfNoUseCostsALineForEachMessage) {
     EXPECT_EQ(harness.dropped(DropReason::AdaptorFailed), static_cast<std::uint64_t>(2 * number));
   }
   EXPECT_EQ(log.count(3, "WrenBackend(dealloc): Wren adaptor failed: an exception of its own"), 1);
+}
+
+TEST_F(AdaptorTest, OneThatHangsHoldsUpNothingButMessages) {
+  install(directory.path(), VESK_HANGING_OPERATION);
+  const std::string pipe = directory / "var/lib/veskreportingd/pipe";
+  ASSERT_EQ(::mkfifo(pipe.c_str(), 0600), 0);
+  auto backend = make();
+  auto sent = std::async(std::launch::async, [&] { send(*backend, Dictionary()); });
+  FileDescriptor end(::open(pipe.c_str(), O_WRONLY));  // waits until the adaptor is at work
+  auto set = std::async(std::launch::async, [&] { backend->setCorrelatedSessionID("combined"); });
+  EXPECT_EQ(set.wait_for(std::chrono::seconds(30)), std::future_status::ready);
+  end.reset();
+  sent.get();
+  EXPECT_EQ(backend->combinedSessionIDString(), "combined");
 }
 
 TEST_F(AdaptorTest, TheExampleWritesEveryKindOfValue) {

@@ -1,9 +1,23 @@
 // Adaptors that are of no use, each for its reason; which one, the build says.
 #include <VeskReporting/WrenAdaptor.h>
 
+#include <fcntl.h>
+#include <unistd.h>
+
 #include <stdexcept>
+#include <string>
 
 namespace {
+
+std::string pipePath;
+
+/// Hangs until somebody has opened the pipe and closed it again.
+[[maybe_unused]] void hang(VeskWrenAdaptor*, uint16_t, uint16_t, const VeskDictionaryView*) {
+  char byte = 0;
+  const int pipe = ::open(pipePath.c_str(), O_RDONLY);
+  while (::read(pipe, &byte, 1) > 0) continue;
+  ::close(pipe);
+}
 
 [[maybe_unused]] void fail(VeskWrenAdaptor*, uint16_t, uint16_t respCode, const VeskDictionaryView*) {
   if (respCode == 1) throw 1;
@@ -12,6 +26,9 @@ namespace {
 
 #if defined(VESK_WITHOUT_OPERATION)
 const VeskWrenOperation kOperations[] = {{"sendMessage", reinterpret_cast<VeskWrenFunction>(&fail)},
+                                         {nullptr, nullptr}};
+#elif defined(VESK_HANGING_OPERATION)
+const VeskWrenOperation kOperations[] = {{VESK_WREN_SEND_MESSAGE, reinterpret_cast<VeskWrenFunction>(&hang)},
                                          {nullptr, nullptr}};
 #else
 const VeskWrenOperation kOperations[] = {{VESK_WREN_SEND_MESSAGE, reinterpret_cast<VeskWrenFunction>(&fail)},
@@ -26,6 +43,7 @@ const VeskWrenOperation kOperations[] = {{VESK_WREN_SEND_MESSAGE, reinterpret_ca
 #if !defined(VESK_WITHOUT_FACTORY)
 VeskWrenAdaptor* WrenAdaptor(const VeskWrenHost* host) {
   if (host->version != VESK_WREN_ADAPTOR_VERSION) return nullptr;
+  pipePath = std::string(host->stateDirectory) + "/pipe";
 #if defined(VESK_THROWING_FACTORY)
   throw std::runtime_error("no antenna");
 #endif
