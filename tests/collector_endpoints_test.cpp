@@ -123,6 +123,9 @@ TEST_F(CollectorEndpoints, RefuseWhatIsNoPostAndSaveNothing) {
       {"event", post(R"({"postTime":1,"clientId":"c","events":[{},3]})"), 400, "events[1] must be an object"},
       {"nested", post(R"({"postTime":1,"clientId":"c","events":[{"a":{}}]})"), 400, "events[0].a must be"},
       {"null", post(R"({"postTime":1,"clientId":"c","events":[{"a":null}]})"), 400, "events[0].a must be"},
+      {"huge time", post(R"({"postTime":1e999,"clientId":"c","events":[{}]})"), 400, "postTime is too large"},
+      {"huge", post(R"({"postTime":1,"clientId":"c","events":[{"b":2},{"a":-1e999}]})"), 400,
+       "events[1].a is"},
       {"further key", post(R"({"postTime":1,"clientId":"c","events":[{}],"x":1})"), 400, "unknown key 'x'"},
   };
   for (const auto& test : cases) {

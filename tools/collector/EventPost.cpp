@@ -1,6 +1,7 @@
 #include "tools/collector/EventPost.h"
 
 #include <algorithm>
+#include <cmath>
 #include <stdexcept>
 
 #include "tools/json/JSONReader.h"
@@ -51,13 +52,21 @@ void checkEventMap(const HTTPReceived& received, std::size_t events) {
     throw Refusal("X-Vesk-Event-Map stands on a post of " + std::to_string(events) + " events");
 }
 
+/// No JSON can carry what is too large for a double, so it could be neither saved nor shown.
+bool isTooLarge(const Value& value) {
+  const double* number = value.real();
+  return number != nullptr && !std::isfinite(*number);
+}
+
 void checkEvent(const Value& value, std::size_t index) {
   std::string place = "events[" + std::to_string(index) + "]";
   const Dictionary* event = value.dictionary();
   if (event == nullptr) throw Refusal(place + " must be an object");
-  for (const auto& [key, entry] : *event)
+  for (const auto& [key, entry] : *event) {
     if (!entry.isNumber() && entry.text() == nullptr)
       throw Refusal(place + "." + key.string() + " must be a text or a number, is " + describe(entry, 60));
+    if (isTooLarge(entry)) throw Refusal(place + "." + key.string() + " is too large a number");
+  }
 }
 
 EventPost readBody(const std::string& json) {
@@ -72,6 +81,7 @@ EventPost readBody(const std::string& json) {
   const Value* postTime = body->find("postTime");
   if (postTime == nullptr || !postTime->isNumber() || postTime->boolean() != nullptr)
     throw Refusal("the body must hold the number postTime");
+  if (isTooLarge(*postTime)) throw Refusal("postTime is too large a number");
   auto clientId = body->text("clientId");
   if (!clientId) throw Refusal("the body must hold the text clientId");
   auto events = body->list("events");
