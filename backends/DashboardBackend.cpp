@@ -133,8 +133,14 @@ DashboardBackend::DashboardBackend(const std::string& name, const std::optional<
   _displayURL = profileText(name, _profile, "display_url");
 }
 
-// For a backend that its session never came to clean up.
-DashboardBackend::~DashboardBackend() { cleanup(); }
+// For a backend that its session never came to clean up. Without memory the delivery isn't told, and lets go
+// of everything once nothing is pending any more.
+DashboardBackend::~DashboardBackend() {
+  try {
+    _delivery->cleanup();
+  } catch (const std::exception&) {
+  }
+}
 
 void DashboardBackend::cleanup() { _delivery->cleanup(); }
 

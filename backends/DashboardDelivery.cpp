@@ -1,5 +1,6 @@
 #include "backends/DashboardDelivery.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <exception>
 #include <new>
@@ -67,17 +68,22 @@ bool DashboardDelivery::start(std::chrono::milliseconds tick) {
 void DashboardDelivery::send(std::unique_ptr<Buffer> buffer, std::uint16_t length,
                              std::uint16_t eventNumber) {
   bool isFirst = false;
-  {
-    MutexLock lock(_mutex);
-    if (_handedOver.size() >= kMaximumHandedOver) {
-      countLost(DropReason::OverBound);
-      return;
+  try {
+    {
+      MutexLock lock(_mutex);
+      if (_handedOver.size() >= kMaximumHandedOver) return countLost(DropReason::OverBound);
+      isFirst = _handedOver.empty();
+      _handedOver.push_back({std::move(buffer), length, eventNumber});
     }
-    isFirst = _handedOver.empty();
-    _handedOver.push_back({std::move(buffer), length, eventNumber});
+    // The task that is under way already takes this datagram along.
+    if (isFirst) _networkProcQueue->submit([self = shared_from_this()] { self->sendHandedOver(); });
+  } catch (const std::exception&) {  // no memory
+    MutexLock lock(_mutex);
+    if (!isFirst) return countLost(DropReason::OverBound);
+    // No task comes for the list; left in place, it would keep all later datagrams waiting for one.
+    countLost(DropReason::OverBound, std::max<std::size_t>(_handedOver.size(), 1));
+    _handedOver.clear();
   }
-  // The task that is under way already takes this datagram along.
-  if (isFirst) _networkProcQueue->submit([self = shared_from_this()] { self->sendHandedOver(); });
 }
 
 void DashboardDelivery::cleanup() {

@@ -57,7 +57,7 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   /// Constant once constructed.
   bool isReliable() const noexcept { return _reliableUDP; }
   /// Sends the first `length` bytes. Never waits for the network; what is sent faster than the system takes
-  /// it is bounded, the excess dropped and counted.
+  /// it is bounded, the excess dropped and counted, as is what there is no memory for.
   void send(std::unique_ptr<Buffer> buffer, std::uint16_t length, std::uint16_t eventNumber);
   /// Asks for the shutdown: at once when nothing is pending, else when nothing is any more, 9.5 s after the
   /// next tick at the latest. Safe to call twice.

@@ -202,9 +202,14 @@ TEST_F(Dashboard, TakesTheTickFromItsProfile) {
 
 TEST_F(Dashboard, GoesWithItsSessionEvenWithoutCleanup) {
   const long before = openDescriptors();
-  make(profile(Dictionary{{"reliable", 10}})).reset();
-  _queues.queue->run();
-  EXPECT_EQ(openDescriptors(), before);
+  for (bool hasMemory : {true, false}) {
+    auto backend = make(profile(Dictionary{{"reliable", 10}}));
+    _queues.queue->refusesWork = !hasMemory;
+    backend.reset();
+    _queues.queue->refusesWork = false;
+    _queues.queue->run();
+    EXPECT_EQ(openDescriptors(), before);
+  }
 }
 
 TEST_F(Dashboard, AnnouncesWhereLogDataWent) {

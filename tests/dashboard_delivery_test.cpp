@@ -163,6 +163,16 @@ TEST_F(Delivery, WhatComesFasterThanItGoesOutIsBounded) {
   EXPECT_EQ(lost(DropReason::OverBound), 6u + 1024u - 50u);
 }
 
+TEST_F(Delivery, WithoutMemoryOnlyThatDatagramIsLost) {
+  start();
+  _queue->refusesWork = true;
+  send(1);
+  EXPECT_EQ(lost(DropReason::OverBound), 1u);
+  _queue->refusesWork = false;
+  send(2);
+  EXPECT_EQ(arrivalsDuring(0), (Arrivals{{0, 2}}));
+}
+
 TEST_F(Delivery, CleanupGivesEverythingBackOnce) {
   for (bool reliable : {true, false}) {
     const long before = openDescriptors();

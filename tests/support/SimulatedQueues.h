@@ -16,6 +16,7 @@ class SimulatedQueue final : public TimedQueue, public std::enable_shared_from_t
   Clock::time_point now() const override { return _now; }
   void submit(Work work) override { submitAfter(std::chrono::milliseconds::zero(), std::move(work)); }
   void submitAfter(std::chrono::milliseconds delay, Work work) override {
+    if (refusesWork) throw std::bad_alloc();
     if (_isStopped) return;
     _entries.push_back(
         std::make_shared<Entry>(Entry{_now + delay, {}, std::make_shared<const Work>(std::move(work))}));
@@ -73,6 +74,7 @@ class SimulatedQueue final : public TimedQueue, public std::enable_shared_from_t
   }
 
   bool refusesReadSources = false;
+  bool refusesWork = false;
 
  private:
   struct Entry {
