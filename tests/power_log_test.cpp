@@ -125,6 +125,19 @@ TEST_F(PowerLogTest, BeginsADamagedFileAnewAndKeepsTheOldOne) {
   EXPECT_EQ(lost, 0u);
 }
 
+TEST_F(PowerLogTest, AReaderThatStandsStillIsNotInTheWriterSWay) {
+  PowerLog powerLog(options());
+  for (int i = 0; i < 600; ++i) record(powerLog, {{"i", i}});
+  std::size_t seen = 0;
+  auto take = [&](const PowerLogEvent&) {
+    for (int i = 0; seen == 0 && i < 250; ++i) record(powerLog, {{"k", std::string(60'000, 'x')}});
+    return ++seen > 0;
+  };
+  EXPECT_EQ(readPowerLog(path, {}, take), "");
+  EXPECT_EQ(seen, 600u);
+  EXPECT_LT(fs::file_size(path + "-wal"), 8u << 20) << "of 15 MB";
+}
+
 TEST_F(PowerLogTest, TwoWritersShareIt) {
   auto write = [this] {
     PowerLog powerLog(options());

@@ -1,6 +1,7 @@
 #include "platform/powerlog/PowerLogReader.h"
 
 #include <cmath>
+#include <vector>
 
 #include "platform/powerlog/SQLiteHandles.h"
 
@@ -9,6 +10,13 @@ namespace vesk {
 namespace {
 
 constexpr int kBusyMilliseconds = 5000;
+constexpr std::size_t kBatchEvents = 500;
+constexpr std::size_t kBatchBytes = std::size_t{1} << 20;
+
+// The planner would rather take the index of times and sort: hence the plus.
+constexpr char kEvents[] =
+    "SELECT identifier, name, time, dictionary, id FROM events"
+    " WHERE id BETWEEN ?1 AND ?2 AND +time >= ?3 ORDER BY id";
 
 std::string textIn(sqlite3_stmt* row, int column) {
   const auto* text = reinterpret_cast<const char*>(sqlite3_column_text(row, column));
@@ -25,6 +33,53 @@ PowerLogEvent eventIn(sqlite3_stmt* row) {
   return event;
 }
 
+/// Which events are there, and the way through them. A statement keeps the state of the file that it began
+/// with, and as long as it does, the log of changes can't be begun anew: so none is open while events are
+/// handed out, which may take as long as a person takes to read them.
+class Batches {
+ public:
+  Batches(sqlite3* database, double since) : _database(database), _since(since) {}
+
+  /// The first and the last event's row. A result code of SQLite.
+  int begin() {
+    auto range = prepare(_database, "SELECT min(id), max(id) FROM events WHERE time >= ?1");
+    if (!range) return sqlite3_errcode(_database);
+    sqlite3_bind_double(range.get(), 1, _since);
+    const int result = sqlite3_step(range.get());
+    if (result != SQLITE_ROW) return result;
+    if (sqlite3_column_type(range.get(), 0) == SQLITE_NULL) return SQLITE_DONE;
+    _next = sqlite3_column_int64(range.get(), 0);
+    _last = sqlite3_column_int64(range.get(), 1);
+    return SQLITE_OK;
+  }
+
+  /// SQLITE_ROW while more may come, SQLITE_DONE with the last.
+  int read(std::vector<PowerLogEvent>& events) {
+    events.clear();
+    auto row = prepare(_database, kEvents);
+    if (!row) return sqlite3_errcode(_database);
+    sqlite3_bind_int64(row.get(), 1, _next);
+    sqlite3_bind_int64(row.get(), 2, _last);
+    sqlite3_bind_double(row.get(), 3, _since);
+    int result = SQLITE_ROW;
+    std::size_t bytes = 0;
+    while (events.size() < kBatchEvents && bytes < kBatchBytes) {
+      result = sqlite3_step(row.get());
+      if (result != SQLITE_ROW) break;
+      events.push_back(eventIn(row.get()));
+      bytes += events.back().dictionary.size();
+      _next = sqlite3_column_int64(row.get(), 4) + 1;
+    }
+    return result;
+  }
+
+ private:
+  sqlite3* _database;
+  double _since;
+  std::int64_t _next = 0;
+  std::int64_t _last = 0;
+};
+
 }  // namespace
 
 std::string readPowerLog(const std::string& path, WallTime since,
@@ -34,12 +89,15 @@ std::string readPowerLog(const std::string& path, WallTime since,
   SQLiteDatabase database(opened);
   if (result != SQLITE_OK) return sqlite3_errmsg(opened);
   sqlite3_busy_timeout(opened, kBusyMilliseconds);
-  auto row =
-      prepare(opened, "SELECT identifier, name, time, dictionary FROM events WHERE time >= ?1 ORDER BY id");
-  if (!row) return sqlite3_errmsg(opened);
-  sqlite3_bind_double(row.get(), 1, std::chrono::duration<double>(since.time_since_epoch()).count());
-  while ((result = sqlite3_step(row.get())) == SQLITE_ROW) {
-    if (!take(eventIn(row.get()))) return {};
+  Batches batches(opened, std::chrono::duration<double>(since.time_since_epoch()).count());
+  std::vector<PowerLogEvent> events;
+  result = batches.begin();
+  if (result == SQLITE_OK) result = SQLITE_ROW;
+  while (result == SQLITE_ROW) {
+    result = batches.read(events);
+    for (const PowerLogEvent& event : events) {
+      if (!take(event)) return {};
+    }
   }
   return result == SQLITE_DONE ? std::string() : sqlite3_errmsg(opened);
 }
