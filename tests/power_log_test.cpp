@@ -1,5 +1,7 @@
 // The power log: what the backend records, what the file keeps, and how it fares on the real daemon.
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/file.h>
 #include <sys/resource.h>
 
 #include <csignal>
@@ -123,6 +125,29 @@ TEST_F(PowerLogTest, BeginsADamagedFileAnewAndKeepsTheOldOne) {
   record(powerLog);
   EXPECT_EQ(events().size(), 1u) << "as when another daemon was the first to find the damage";
   EXPECT_EQ(lost, 0u);
+}
+
+TEST_F(PowerLogTest, OneThatCanNotBeMovedAwayCostsOneLine) {
+  CapturedLog log;
+  directory.write("power-log.sqlite", std::string(20'000, '#'));
+  directory.write("power-log.sqlite.corrupt/in the way", "");
+  PowerLog powerLog(options());
+  for (int i = 0; i < 3; ++i) record(powerLog);
+  EXPECT_EQ(lost, 3u);
+  EXPECT_EQ(log.countContaining(3, "PowerLog: "), 1);
+  EXPECT_EQ(log.countContaining(3, "can't be moved: Is a directory; events are lost"), 1);
+  fs::remove_all(path + ".corrupt");
+  record(powerLog);
+  EXPECT_EQ(lost, 3u);
+}
+
+TEST_F(PowerLogTest, AFrozenProcessHoldsUpNobodyForGood) {
+  FileDescriptor lock(::open((path + ".lock").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
+  ASSERT_EQ(::flock(lock.get(), LOCK_EX), 0);
+  PowerLog::Options hasty = options();
+  hasty.patience = std::chrono::milliseconds(20);
+  PowerLog(hasty).KLLogRegisteredEvent(28, "Rookery-Vesk", Dictionary(), std::nullopt);
+  EXPECT_EQ(lost, 1u);
 }
 
 TEST_F(PowerLogTest, AReaderThatStandsStillIsNotInTheWriterSWay) {

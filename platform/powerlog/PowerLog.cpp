@@ -87,7 +87,9 @@ void PowerLog::lost(std::uint64_t events) const noexcept {
 }
 
 void PowerLog::run() noexcept {
-  PowerLogStore store(_options.path, {_options.maximumAge, _options.maximumRows});
+  PowerLogStore store(
+      _options.path,
+      {.age = _options.maximumAge, .rows = _options.maximumRows, .patience = _options.patience});
   while (true) {
     std::vector<PowerLogEvent> batch;
     {

@@ -28,15 +28,16 @@ class PowerLog {
     std::string path;
     std::chrono::seconds maximumAge = std::chrono::days(7);
     std::int64_t maximumRows = 100'000;
-    std::size_t maximumWaiting = std::size_t{4} << 20;  ///< bytes of events that wait for the disk
-    std::size_t maximumEvent = std::size_t{64} << 10;   ///< bytes of one event
+    std::size_t maximumWaiting = std::size_t{4} << 20;             ///< bytes of events that wait for the disk
+    std::size_t maximumEvent = std::size_t{64} << 10;              ///< bytes of one event
+    std::chrono::milliseconds patience = std::chrono::seconds(5);  ///< with another process that writes
     const WallClock* clock = &WallClock::system();
     /// Told how many events were lost, on any thread; must not block or throw.
     std::function<void(std::uint64_t events)> onLost;
   };
 
   explicit PowerLog(Options options);
-  /// Writes what waits.
+  /// Writes what waits, as far as the disk and other processes allow.
   ~PowerLog();
   PowerLog(const PowerLog&) = delete;
   PowerLog& operator=(const PowerLog&) = delete;

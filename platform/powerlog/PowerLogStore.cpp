@@ -4,9 +4,11 @@
 #include <sys/file.h>
 #include <sys/stat.h>
 
+#include <cerrno>
 #include <cstdio>
 #include <filesystem>
 #include <system_error>
+#include <thread>
 
 #include "platform/log/SystemLog.h"
 
@@ -14,8 +16,7 @@ namespace vesk {
 
 namespace {
 
-// Long enough for another process's batch; nobody but the log's own thread waits.
-constexpr int kBusyMilliseconds = 5000;
+constexpr std::chrono::milliseconds kBetweenAttempts{10};
 
 constexpr char kSetUp[] =
     "PRAGMA journal_mode=WAL;"
@@ -46,19 +47,25 @@ int bindText(sqlite3_stmt* statement, int index, const std::string& text) {
 std::string PowerLogStore::append(const std::vector<PowerLogEvent>& events, WallTime now) {
   // Another process may have begun the file anew, or somebody removed it.
   if (_database && !(fileAtPath() == _opened)) _database.reset();
-  int result = SQLITE_OK;
-  for (int attempt = 0; attempt < 2; ++attempt) {
-    result = _database ? SQLITE_OK : open();
-    if (result == SQLITE_OK) result = write(events, now);
-    if (result == SQLITE_OK) return {};
-    if (!isDamage(result)) break;
-    VESK_LOG_ERROR("PowerLog: %s is damaged (%s); it is kept as %s.corrupt", _path.c_str(),
-                   sqlite3_errstr(result), _path.c_str());
-    setAside();
+  int result = openAndWrite(events, now);
+  if (isDamage(result)) {
+    const std::string damage = sqlite3_errstr(result);
+    if (std::string problem = setAside(); !problem.empty()) {
+      return damage + ", and it can't be moved: " + problem;
+    }
+    VESK_LOG_ERROR("PowerLog: %s is damaged (%s); it is kept as %s.corrupt", _path.c_str(), damage.c_str(),
+                   _path.c_str());
+    result = openAndWrite(events, now);
   }
+  if (result == SQLITE_OK) return {};
   // Whatever it is may be over when the file is opened the next time.
   _database.reset();
   return sqlite3_errstr(result);
+}
+
+int PowerLogStore::openAndWrite(const std::vector<PowerLogEvent>& events, WallTime now) {
+  const int result = _database ? SQLITE_OK : open();
+  return result == SQLITE_OK ? write(events, now) : result;
 }
 
 int PowerLogStore::open() {
@@ -71,9 +78,10 @@ int PowerLogStore::open() {
   _opened = fileAtPath();
   if (result != SQLITE_OK) return result;
   // Of two processes that turn a new file to WAL at once, SQLite lets one fail without waiting.
-  FileDescriptor lock = lockOthersOut();
+  FileDescriptor lock;
+  if (!lockOthersOut(lock)) return SQLITE_BUSY;
   sqlite3_extended_result_codes(database, 1);
-  sqlite3_busy_timeout(database, kBusyMilliseconds);
+  sqlite3_busy_timeout(database, static_cast<int>(_bounds.patience.count()));
   result = execute(database, kSetUp);
   if (result != SQLITE_OK) return result;
   _opened = fileAtPath();
@@ -138,22 +146,29 @@ std::int64_t PowerLogStore::pragma(const char* name) {
   return sqlite3_column_int64(statement.get(), 0);
 }
 
-FileDescriptor PowerLogStore::lockOthersOut() const {
-  FileDescriptor lock(::open((_path + ".lock").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
-  if (lock) ::flock(lock.get(), LOCK_EX);
-  return lock;
+bool PowerLogStore::lockOthersOut(FileDescriptor& lock) const {
+  lock = FileDescriptor(::open((_path + ".lock").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
+  // Where no lock is to be had, there is nobody who could write to the file either.
+  const auto deadline = std::chrono::steady_clock::now() + _bounds.patience;
+  while (lock && ::flock(lock.get(), LOCK_EX | LOCK_NB) != 0 && errno == EWOULDBLOCK) {
+    if (std::chrono::steady_clock::now() >= deadline) return false;
+    std::this_thread::sleep_for(kBetweenAttempts);
+  }
+  return true;
 }
 
-void PowerLogStore::setAside() {
+std::string PowerLogStore::setAside() {
   _database.reset();
-  FileDescriptor lock = lockOthersOut();
+  FileDescriptor lock;
+  if (!lockOthersOut(lock)) return sqlite3_errstr(SQLITE_BUSY);
   // Another process may have found the same damage first.
-  if (!(fileAtPath() == _opened)) return;
+  if (!(fileAtPath() == _opened)) return {};
   const std::string aside = _path + ".corrupt";
-  std::rename(_path.c_str(), aside.c_str());
+  if (std::rename(_path.c_str(), aside.c_str()) != 0) return std::generic_category().message(errno);
   ::unlink((_path + "-shm").c_str());
   std::string log = _path + "-wal";
   if (std::rename(log.c_str(), (aside + "-wal").c_str()) != 0) ::unlink((aside + "-wal").c_str());
+  return {};
 }
 
 PowerLogStore::Identity PowerLogStore::fileAtPath() const {
