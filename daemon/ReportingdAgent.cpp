@@ -54,11 +54,6 @@ bool ReportingdAgent::shouldAcceptNewConnection(const std::shared_ptr<IPCConnect
   }
   auto session = std::make_shared<ReportingdSession>(shared_from_this(), connection, _services);
   connection->setExportedObject(std::make_shared<ClientSessionStub>(session));
-  {
-    MutexLock lock(_sessionListMutex);
-    if (_sessionList.empty()) _busyMarker.begin();
-    _sessionList.push_back(session);
-  }
   connection->setInterruptionHandler([session] {
     VESK_LOG_DEBUG("listener: Orvo connection to %s was interrupted", session->description().c_str());
   });
@@ -67,6 +62,12 @@ bool ReportingdAgent::shouldAcceptNewConnection(const std::shared_ptr<IPCConnect
   connection->setLossHandler([&counters = _services.backends.counters](std::size_t calls) {
     counters.count("session", DropReason::NotAggregated, calls);
   });
+  // Last, so that nothing that fails leaves a session behind that no connection ends.
+  {
+    MutexLock lock(_sessionListMutex);
+    _sessionList.push_back(session);
+    if (_sessionList.size() == 1) _busyMarker.begin();
+  }
   connection->resume();
   return true;
 }

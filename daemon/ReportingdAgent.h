@@ -63,7 +63,7 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
       VESK_EXCLUDES(_sessionListMutex);
 
   /// The first session of exactly that level, in the order in which they joined.
-  static std::shared_ptr<ReportingdSession> getFirstSessionWithHierarchy(std::int32_t level,
+  static std::shared_ptr<ReportingdSession> getFirstSessionWithHierarchy(std::int64_t level,
                                                                          const SessionList& list);
   const SessionList* correlatedSessions(const std::string& key) const VESK_REQUIRES(_monitor);
   SessionList& listForKey(const std::string& key) VESK_REQUIRES(_monitor);

@@ -1,5 +1,6 @@
 // Families of sessions: those of the same client and service, by level.
 #include <algorithm>
+#include <cinttypes>
 
 #include "daemon/ReportingdAgent.h"
 #include "platform/log/SystemLog.h"
@@ -20,7 +21,7 @@ bool contains(const List& list, const ReportingdSession& session) {
 
 }  // namespace
 
-std::shared_ptr<ReportingdSession> ReportingdAgent::getFirstSessionWithHierarchy(std::int32_t level,
+std::shared_ptr<ReportingdSession> ReportingdAgent::getFirstSessionWithHierarchy(std::int64_t level,
                                                                                  const SessionList& list) {
   auto found = std::find_if(list.begin(), list.end(),
                             [&](const auto& session) { return session->getSessionHierarchy() == level; });
@@ -70,10 +71,12 @@ std::shared_ptr<ReportingdSession> ReportingdAgent::parentSessionForChild(Report
                    session.sessionID(), key.c_str());
     return nullptr;
   }
-  auto parent = getFirstSessionWithHierarchy(level - 1, *list);
+  const std::int64_t above = std::int64_t{level} - 1;
+  auto parent = getFirstSessionWithHierarchy(above, *list);
   if (!parent) {
-    VESK_LOG_INFO("parentSessionForChild: Unable to find session with hierarchy of %d for userInfoKey '%s'",
-                  level - 1, key.c_str());
+    VESK_LOG_INFO("parentSessionForChild: Unable to find session with hierarchy of %" PRId64
+                  " for userInfoKey '%s'",
+                  above, key.c_str());
   }
   return parent;
 }
@@ -96,6 +99,7 @@ std::optional<std::string> ReportingdAgent::parentSessionIDStringForSession(Repo
                    session.sessionID(), key.c_str());
     return std::nullopt;
   }
+  if (level < 0) return std::nullopt;
   std::optional<std::string> chain;
   for (std::int32_t above = level - 1; above >= 0; --above) {
     auto ancestor = getFirstSessionWithHierarchy(above, *list);
@@ -123,11 +127,17 @@ std::shared_ptr<ReportingdSession> ReportingdAgent::getAncestorWithAggregatorFor
   if (level < 1) return nullptr;
   const SessionList* list = correlatedSessions(correlationKeyForUserInfo(*userInfo));
   if (!list) return nullptr;
-  for (std::int32_t above = 0; above < level; ++above) {
-    auto ancestor = getFirstSessionWithHierarchy(above, *list);
-    if (ancestor && ancestor->hasAggregator()) return ancestor;
+  // The list is walked, not the levels: those come from outside, and may be any number.
+  std::shared_ptr<ReportingdSession> ancestor;
+  std::int32_t highest = level;
+  for (auto candidate = list->begin(); candidate != list->end() && highest > 0; ++candidate) {
+    const std::int32_t above = (*candidate)->getSessionHierarchy();
+    if (above < 0 || above >= highest || !(*candidate)->hasAggregator()) continue;
+    if (getFirstSessionWithHierarchy(above, *list) != *candidate) continue;
+    ancestor = *candidate;
+    highest = above;
   }
-  return nullptr;
+  return ancestor;
 }
 
 void ReportingdAgent::updateDownstreamSessions(ReportingdSession& session) {

@@ -1,6 +1,8 @@
 // Families of sessions: parents, combined IDs, reporting states, aggregation.
 #include <gtest/gtest.h>
 
+#include <limits>
+
 #include "tests/support/CapturedLog.h"
 #include "tests/support/FamilyHarness.h"
 
@@ -65,6 +67,19 @@ TEST_F(Family, TheHighestAggregatorGetsTheMessages) {
   top.connection->clientIsGone = true;
   grandchild.send(message());
   EXPECT_EQ(log.count(3, "sendMessageWithDictionary: Failed to get remote object proxy: gone"), 1);
+}
+
+TEST_F(Family, LevelsMayBeAnyNumber) {
+  auto top = join(0, true);
+  harness.storebags[8] = Dictionary{{"httpPost", profile(std::numeric_limits<std::int32_t>::max(), 1.0)}};
+  harness.storebags[9] = Dictionary{{"httpPost", profile(std::numeric_limits<std::int32_t>::min(), 1.0)}};
+  join(3).send(message());
+  ASSERT_FALSE(top.connection->calls.empty());
+  const std::size_t before = top.connection->calls.size();
+  CapturedLog log;
+  join(4).send(message());
+  EXPECT_EQ(top.connection->calls.size(), before);
+  EXPECT_EQ(log.countContaining(6, "Found a gap"), 0) << "nothing is above it";
 }
 
 TEST_F(Family, ASessionLeavesItsFamilyUnderWhateverNameItJoined) {

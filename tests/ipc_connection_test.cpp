@@ -264,5 +264,14 @@ TEST(IPCListener, ServesAnInheritedSocketAndAPathLongerThanAnAddress) {
   EXPECT_TRUE(std::filesystem::exists(path)) << "it is the service manager's";
 }
 
+TEST(IPCReply, ThatCanNotBeSentIsAbandoned) {
+  bool abandoned = false;
+  {
+    Reply<int> reply([](int) { throw std::bad_alloc(); }, [&] { abandoned = true; });
+    EXPECT_THROW(reply(1), std::bad_alloc);
+  }
+  EXPECT_TRUE(abandoned);
+}
+
 }  // namespace
 }  // namespace vesk::test

@@ -73,10 +73,10 @@ ConnectionLoop::~ConnectionLoop() { _replies.close(); }
 
 bool ConnectionLoop::isReady() const { return sd_bus_is_ready(_bus.get()) > 0; }
 
-std::size_t ConnectionLoop::unread() const {
+bool ConnectionLoop::isBackedUp() const {
   std::uint64_t queued = 0;
   sd_bus_get_n_queued_write(_bus.get(), &queued);
-  return queued;
+  return queued > 0;
 }
 
 ConnectionLoop::End ConnectionLoop::serve(const std::atomic<bool>& invalidated) {
@@ -97,21 +97,22 @@ ConnectionLoop::End ConnectionLoop::serve(const std::atomic<bool>& invalidated) 
 bool ConnectionLoop::sendOutgoing() {
   _replies.sendWaiting();
   for (;;) {
-    while (isReady() && unread() <= kMaximumUnread) {
+    while (isReady() && !isBackedUp() && !_peerGone) {
       auto call = _outbox.take();
       if (!call) break;
-      sendCall(*call);
+      if (!sendCall(*call)) _outbox.lose();
     }
-    if (!_relay.passOut() || (unread() == 0 && _outbox.empty())) return true;
+    if (!_relay.passOut() || (!isBackedUp() && _outbox.empty())) return true;
     if (!processWaiting()) return false;
   }
 }
 
-void ConnectionLoop::sendCall(const IPCOutgoingCall& call) {
+/// False when it is lost.
+bool ConnectionLoop::sendCall(const IPCOutgoingCall& call) {
   sd_bus_message* raw = nullptr;
   if (sd_bus_message_new_method_call(_bus.get(), &raw, nullptr, _settings.objectPath.c_str(),
                                      call.interfaceName, call.member) < 0) {
-    return;  // the bus has ended, which `process` will tell
+    return false;  // the bus has ended, which `process` will tell
   }
   BusMessageHandle message(raw);
   sd_bus_message_set_expect_reply(raw, 0);
@@ -120,9 +121,9 @@ void ConnectionLoop::sendCall(const IPCOutgoingCall& call) {
   if (!encoder.ok()) {
     VESK_LOG_WARNING("ipc: %s: The call %s can't be sent: %s", _name.c_str(), call.member,
                      describe(encoder.result()));
-    return;
+    return false;
   }
-  sd_bus_send(_bus.get(), raw, nullptr);
+  return sd_bus_send(_bus.get(), raw, nullptr) >= 0;
 }
 
 void ConnectionLoop::wait(Time deadline) {
@@ -140,14 +141,14 @@ void ConnectionLoop::wait(Time deadline) {
 bool ConnectionLoop::mayRead() const {
   // sd-bus must have taken BEGIN before it sees a message.
   if (_relay.hasBegun() && !isReady()) return false;
-  return _peerGone || unread() <= kMaximumUnread;
+  return !isBackedUp();
 }
 
 /// One step: what can be read is handed to the bus, the bus does what it can, what it answers goes out.
 std::optional<ConnectionLoop::End> ConnectionLoop::advance() {
   auto outcome = mayRead() ? _relay.takeIn() : BusRelay::Outcome::Nothing;
   // A bus that was given nothing and has nothing to write costs two system calls to ask.
-  bool isIdle = outcome == BusRelay::Outcome::Served && unread() == 0;
+  bool isIdle = outcome == BusRelay::Outcome::Served && !isBackedUp();
   if (!isIdle && !process()) return endOfBus();
   if (_relay.complaint()) VESK_LOG_WARNING("ipc: %s: Closed: %s", _name.c_str(), _relay.complaint());
   if (outcome == BusRelay::Outcome::HungUp || outcome == BusRelay::Outcome::BrokenOff) {
@@ -166,7 +167,7 @@ bool ConnectionLoop::process() {
   do {
     if (!processWaiting()) return false;
     // Once there is room again the bus writes what it has queued.
-  } while (_relay.passOut() && unread() > 0);
+  } while (_relay.passOut() && isBackedUp());
   return true;
 }
 
@@ -178,6 +179,8 @@ bool ConnectionLoop::processWaiting() {
     if (result < 0) return false;
     if (message) _router.route(raw);
     if (sd_bus_is_open(_bus.get()) <= 0) return false;
+    // What is left is served once the client has read: until then nothing more is read from it either.
+    if (isBackedUp()) return true;
     if (result == 0) break;
   }
   noteBrokenMessages();
@@ -211,7 +214,7 @@ void ConnectionLoop::flush(std::chrono::milliseconds limit) {
   const Time deadline = std::chrono::steady_clock::now() + limit;
   while (isReady() && !_peerGone && std::chrono::steady_clock::now() < deadline) {
     if (!sendOutgoing() || !process()) return;
-    if (unread() == 0 && _outbox.empty() && !_relay.isBlocked()) return;
+    if (!isBackedUp() && _outbox.empty() && !_relay.isBlocked()) return;
     pollfd poll{_socket, POLLOUT, 0};
     if (::poll(&poll, 1, untilDeadline(deadline)) <= 0 || (poll.revents & (POLLHUP | POLLERR))) return;
   }

@@ -29,9 +29,6 @@ struct ConnectionSettings {
 /// refers to belongs to the connection and outlives it.
 class ConnectionLoop {
  public:
-  /// Messages that the client has not read. Above it nothing more is read from the client, so that one that
-  /// calls without reading its answers waits itself.
-  static constexpr std::size_t kMaximumUnread = 64;
   /// The content of a message is limited to `maximumMessage`, with an error that names the limit; the bytes
   /// around it, by closing the connection, to this much more.
   static constexpr std::size_t kMessageOverhead = 64 * 1024;
@@ -60,9 +57,11 @@ class ConnectionLoop {
   using Time = std::chrono::steady_clock::time_point;
 
   bool isReady() const;
-  std::size_t unread() const;
+  /// Whether what the client has not read has filled the sockets. Then nothing more is served or sent, so
+  /// that one that calls without reading its answers waits itself, and costs no more than one message.
+  bool isBackedUp() const;
   bool sendOutgoing();
-  void sendCall(const IPCOutgoingCall& call);
+  bool sendCall(const IPCOutgoingCall& call);
   void wait(Time deadline);
   bool mayRead() const;
   std::optional<End> advance();

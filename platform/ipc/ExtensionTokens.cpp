@@ -5,7 +5,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <system_error>
-#include <vector>
 
 namespace vesk {
 
@@ -57,16 +56,12 @@ ExtensionHandle ExtensionTokens::consume(std::string_view token) {
   return handle;
 }
 
-void ExtensionTokens::drop(std::uint64_t connection) {
-  std::vector<Entry> dropped;  // closed after the lock: closing may wait for a file system
+void ExtensionTokens::drop(std::uint64_t connection) noexcept {
+  std::list<Entry> dropped;  // closed after the lock: closing may wait for a file system
   MutexLock lock(_mutex);
   for (auto entry = _entries.begin(); entry != _entries.end();) {
-    if (entry->owner.connection == connection) {
-      dropped.push_back(std::move(*entry));
-      entry = _entries.erase(entry);
-    } else {
-      ++entry;
-    }
+    const auto at = entry++;
+    if (at->owner.connection == connection) dropped.splice(dropped.end(), _entries, at);
   }
 }
 

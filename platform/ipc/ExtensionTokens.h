@@ -5,7 +5,7 @@
 
 #include <cstddef>
 #include <cstdint>
-#include <deque>
+#include <list>
 #include <string>
 #include <string_view>
 
@@ -47,7 +47,7 @@ class ExtensionTokens {
   ExtensionHandle consume(std::string_view token);
 
   /// Closes what an owner, a connection that ended, has left.
-  void drop(std::uint64_t connection);
+  void drop(std::uint64_t connection) noexcept;
 
  private:
   struct Entry {
@@ -57,7 +57,7 @@ class ExtensionTokens {
   };
 
   Mutex _mutex;
-  std::deque<Entry> _entries VESK_GUARDED_BY(_mutex);
+  std::list<Entry> _entries VESK_GUARDED_BY(_mutex);
 };
 
 }  // namespace vesk

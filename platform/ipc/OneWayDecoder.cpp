@@ -19,6 +19,8 @@ constexpr std::size_t kFieldsAt = 12;
 // Lists and dictionaries inside one another; what is deeper is rare.
 constexpr std::size_t kDeepest = 16;
 constexpr std::size_t kNodeContent = 8;
+// Of a body that all texts of a call share. One short text keeps all of it, which has to stay small.
+constexpr std::size_t kMostShared = 1024;
 
 enum Field : std::uint8_t { kPath = 1, kInterface = 2, kMember = 3, kSignature = 8 };
 
@@ -26,7 +28,7 @@ enum Field : std::uint8_t { kPath = 1, kInterface = 2, kMember = 3, kSignature =
 /// found what it looks for, whole and by the rules.
 class Reader {
  public:
-  /// `owner` shares the life of the bytes with the texts that are read.
+  /// `owner` shares the life of the bytes with the texts that are read; without one they are copied.
   explicit Reader(std::string_view bytes, std::shared_ptr<const char> owner = nullptr)
       : _bytes(bytes), _owner(std::move(owner)) {}
 
@@ -69,7 +71,7 @@ class Reader {
     std::string_view view;
     if (!rawText(view) || !isSendable(view)) return false;
     _content += view.size();
-    out = Text(std::shared_ptr<const char>(_owner, view.data()), view.size());
+    out = _owner ? Text(std::shared_ptr<const char>(_owner, view.data()), view.size()) : _arena.add(view);
     return true;
   }
   /// `elements` must read exactly up to the end that it is given.
@@ -102,6 +104,7 @@ class Reader {
 
   const std::string_view _bytes;
   const std::shared_ptr<const char> _owner;
+  TextArena _arena;
   std::size_t _at = 0;
   std::size_t _depth = 0;
   std::size_t _content = 0;
@@ -301,9 +304,14 @@ bool OneWayDecoder::readHeader(std::string_view message) {
 std::optional<OneWayCall> OneWayDecoder::decode(std::string_view message) {
   if (!readHeader(message)) return std::nullopt;
   auto body = message.substr(kFieldsAt + _header.size());
-  auto copy = std::make_shared_for_overwrite<char[]>(body.size());
-  std::memcpy(copy.get(), body.data(), body.size());
-  Reader reader({copy.get(), body.size()}, std::shared_ptr<const char>(copy, copy.get()));
+  std::shared_ptr<const char> owner;
+  if (body.size() <= kMostShared) {
+    auto copy = std::make_shared_for_overwrite<char[]>(body.size());
+    std::memcpy(copy.get(), body.data(), body.size());
+    owner = std::shared_ptr<const char>(copy, copy.get());
+    body = {copy.get(), body.size()};
+  }
+  Reader reader(body, std::move(owner));
 
   OneWayCall call{_interfaceName, _member, _signature, {}};
   call.arguments.reserve(_signature.size());

@@ -1,5 +1,7 @@
 #include "platform/ipc/Outbox.h"
 
+#include <utility>
+
 #include "platform/ipc/BusCodec.h"
 
 namespace vesk {
@@ -27,45 +29,60 @@ std::size_t contentOf(const Dictionary& dictionary) {
   return content;
 }
 
-struct ArgumentContent {
-  std::size_t operator()(const std::string& text) const { return text.size(); }
-  std::size_t operator()(const Dictionary& dictionary) const { return contentOf(dictionary); }
-  std::size_t operator()(const List& list) const { return contentOf(Value(list)); }
-  std::size_t operator()(const std::vector<std::string>& texts) const {
-    std::size_t content = 0;
-    for (const auto& text : texts) content += kNodeContent + text.size();
-    return content;
+/// As it will be sent, and as it is held.
+struct Size {
+  std::size_t content = 0;
+  std::size_t memory = 0;
+
+  Size& operator+=(Size other) {
+    content += other.content;
+    memory += other.memory;
+    return *this;
   }
-  template <class T>
-  std::size_t operator()(const std::optional<T>& argument) const {
-    return argument ? (*this)(*argument) : 0;
-  }
-  std::size_t operator()(bool) const { return 0; }
-  std::size_t operator()(std::uint16_t) const { return 0; }
-  std::size_t operator()(double) const { return 0; }
-  std::size_t operator()(IPCDescriptor) const { return 0; }
 };
 
-std::size_t contentOf(const IPCOutgoingCall& call) {
-  std::size_t content = sizeof call;
-  for (const auto& argument : call.arguments) {
-    content += kNodeContent + std::visit(ArgumentContent{}, argument);
+struct ArgumentSize {
+  Size operator()(const std::string& text) const { return {text.size(), text.size()}; }
+  Size operator()(const Dictionary& dictionary) const {
+    return {contentOf(dictionary), approximateMemory(dictionary)};
   }
-  return content;
+  Size operator()(const List& list) const { return {contentOf(Value(list)), approximateMemory(Value(list))}; }
+  Size operator()(const std::vector<std::string>& texts) const {
+    Size size;
+    for (const auto& text : texts) size += {kNodeContent + text.size(), sizeof text + text.size()};
+    return size;
+  }
+  template <class T>
+  Size operator()(const std::optional<T>& argument) const {
+    return argument ? (*this)(*argument) : Size();
+  }
+  Size operator()(bool) const { return {}; }
+  Size operator()(std::uint16_t) const { return {}; }
+  Size operator()(double) const { return {}; }
+  Size operator()(IPCDescriptor) const { return {}; }
+};
+
+Size sizeOf(const IPCOutgoingCall& call) {
+  Size size{sizeof call, sizeof call};
+  for (const auto& argument : call.arguments) {
+    size += {kNodeContent, sizeof argument};
+    size += std::visit(ArgumentSize{}, argument);
+  }
+  return size;
 }
 
 }  // namespace
 
 const char* Outbox::put(IPCOutgoingCall call) {
-  std::size_t content = contentOf(call);
-  if (content > CodecLimits{}.content) return "the call is too large";
+  const Size size = sizeOf(call);
+  if (size.content > CodecLimits{}.content) return "the call is too large";
   MutexLock lock(_mutex);
   if (_closed) return "the connection has ended";
-  if (_entries.size() >= _maximumCalls || _content + content > kMaximumContent) {
+  if (_entries.size() >= _maximumCalls || (!_entries.empty() && _memory + size.memory > kMaximumMemory)) {
     return "too many calls wait for the client";
   }
-  _content += content;
-  _entries.push_back({std::move(call), content});
+  _entries.push_back({std::move(call), size.memory});
+  _memory += size.memory;
   return nullptr;
 }
 
@@ -74,8 +91,13 @@ std::optional<IPCOutgoingCall> Outbox::take() {
   if (_entries.empty()) return std::nullopt;
   Entry entry = std::move(_entries.front());
   _entries.pop_front();
-  _content -= entry.content;
+  _memory -= entry.memory;
   return std::move(entry.call);
+}
+
+void Outbox::lose() {
+  MutexLock lock(_mutex);
+  ++_lost;
 }
 
 bool Outbox::empty() const {
@@ -87,9 +109,9 @@ std::size_t Outbox::close() {
   std::deque<Entry> forgotten;  // released after the lock
   MutexLock lock(_mutex);
   _closed = true;
-  _content = 0;
+  _memory = 0;
   forgotten.swap(_entries);
-  return forgotten.size();
+  return forgotten.size() + std::exchange(_lost, 0);
 }
 
 }  // namespace vesk

@@ -10,12 +10,13 @@
 
 namespace vesk {
 
-/// Bounded by number and by content, because a client that does not read must cost its session's memory only
-/// so much. Thread-safe; its lock is a leaf.
+/// Bounded by number and by memory, because a client that does not read must cost its session only so much.
+/// Thread-safe; its lock is a leaf.
 class Outbox {
  public:
-  /// Content of all waiting calls together; a single one may have `CodecLimits::content`.
-  static constexpr std::size_t kMaximumContent = std::size_t{4} << 20;
+  /// Bytes that all waiting calls hold together, unless there is only one, which may have
+  /// `CodecLimits::content`.
+  static constexpr std::size_t kMaximumMemory = std::size_t{4} << 20;
 
   explicit Outbox(std::size_t maximumCalls) : _maximumCalls(maximumCalls) {}
 
@@ -23,19 +24,22 @@ class Outbox {
   const char* put(IPCOutgoingCall call);
   std::optional<IPCOutgoingCall> take();
   bool empty() const;
-  /// Refuses calls from now on and forgets those that wait; returns how many did.
+  /// Notes that a call which had been taken could not be sent.
+  void lose();
+  /// Refuses calls from now on and forgets those that wait; returns how many are lost, in all.
   std::size_t close();
 
  private:
   struct Entry {
     IPCOutgoingCall call;
-    std::size_t content;
+    std::size_t memory;
   };
 
   const std::size_t _maximumCalls;
   mutable Mutex _mutex;
   bool _closed VESK_GUARDED_BY(_mutex) = false;
-  std::size_t _content VESK_GUARDED_BY(_mutex) = 0;
+  std::size_t _memory VESK_GUARDED_BY(_mutex) = 0;
+  std::size_t _lost VESK_GUARDED_BY(_mutex) = 0;
   std::deque<Entry> _entries VESK_GUARDED_BY(_mutex);
 };
 

@@ -13,7 +13,8 @@ template <class... Arguments>
 class Reply {
  public:
   Reply() = default;
-  /// `send` carries the answer; `abandon` tells the caller that none will come. Neither may throw.
+  /// `send` carries the answer; when it throws, for want of memory, `abandon` tells the caller that none will
+  /// come, and must not throw.
   Reply(std::function<void(const Arguments&...)> send, std::function<void()> abandon)
       : _send(std::move(send)), _abandon(std::move(abandon)) {}
   Reply(Reply&& other) noexcept
@@ -32,8 +33,9 @@ class Reply {
 
   void operator()(const Arguments&... arguments) {
     auto send = std::exchange(_send, nullptr);
+    if (!send) return;
+    send(arguments...);
     _abandon = nullptr;
-    if (send) send(arguments...);
   }
 
  private:

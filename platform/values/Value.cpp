@@ -34,6 +34,7 @@ bool areUnique(const std::vector<DictionaryEntry>& entries) noexcept {
 // ---------------------------------------------------------------------------------------------------
 
 List::List(std::vector<Value> values) {
+  values.shrink_to_fit();  // few are made, and those that wait add up
   if (!values.empty()) _values = std::make_shared<const std::vector<Value>>(std::move(values));
 }
 
@@ -249,30 +250,39 @@ std::optional<bool> booleanForKey(const Dictionary& dictionary, std::string_view
 
 namespace {
 
-std::size_t memoryOf(const Value& value) noexcept {
-  if (const Text* text = value.text()) return text->size();
-  if (const Bytes* bytes = value.bytes()) return bytes->size();
-  std::size_t size = 0;
-  if (const List* list = value.list()) {
-    for (const Value& item : *list) size += sizeof(Value) + memoryOf(item);
-  } else if (const Dictionary* dictionary = value.dictionary()) {
-    size = approximateMemory(*dictionary);
-  }
+// What the allocator and the reference count cost, and a node of an index.
+constexpr std::size_t kBlockMemory = 32;
+constexpr std::size_t kIndexNodeMemory = 48;
+
+std::size_t memoryOf(const std::vector<DictionaryEntry>& entries) noexcept {
+  std::size_t size = entries.capacity() * sizeof(DictionaryEntry);
+  for (const auto& entry : entries) size += entry.key.size() + approximateMemory(entry.value);
   return size;
 }
 
 }  // namespace
 
-std::size_t approximateMemory(const Dictionary& dictionary) noexcept {
-  std::size_t size = dictionary.size() * sizeof(DictionaryEntry);
-  for (const auto& entry : dictionary) size += entry.key.size() + memoryOf(entry.value);
+std::size_t approximateMemory(const Value& value) noexcept {
+  if (const Text* text = value.text()) return text->size();
+  if (const Bytes* bytes = value.bytes()) return bytes->size();
+  if (const Dictionary* dictionary = value.dictionary()) return approximateMemory(*dictionary);
+  std::size_t size = 0;
+  if (const List* list = value.list(); list && !list->empty()) {
+    size = sizeof(std::vector<Value>) + 2 * kBlockMemory;
+    for (const Value& item : *list) size += sizeof(Value) + approximateMemory(item);
+  }
   return size;
 }
 
+std::size_t approximateMemory(const Dictionary& dictionary) noexcept {
+  if (!dictionary._storage) return 0;
+  const auto& storage = *dictionary._storage;
+  return sizeof storage + 2 * kBlockMemory + memoryOf(storage.entries) +
+         storage.index.size() * (sizeof(*storage.index.begin()) + kIndexNodeMemory);
+}
+
 std::size_t approximateMemory(const MutableDictionary& dictionary) noexcept {
-  std::size_t size = dictionary.entries().capacity() * sizeof(DictionaryEntry);
-  for (const auto& entry : dictionary.entries()) size += entry.key.size() + memoryOf(entry.value);
-  return size;
+  return memoryOf(dictionary.entries());
 }
 
 }  // namespace vesk

@@ -81,6 +81,7 @@ class VESK_API Dictionary {
   std::optional<List> list(std::string_view key) const;
 
   friend VESK_API bool operator==(const Dictionary& a, const Dictionary& b) noexcept;
+  friend VESK_API std::size_t approximateMemory(const Dictionary& dictionary) noexcept;
 
  private:
   friend class MutableDictionary;
@@ -210,8 +211,9 @@ VESK_API std::optional<bool> booleanForKey(const Dictionary& dictionary, std::st
 /// One line that shows a value to a person, cut at about `limit` bytes (log lines, tools).
 VESK_API std::string describe(const Value& value, std::size_t limit = 1024);
 
-/// Memory that a dictionary holds, roughly, in bytes: its entries and texts. Texts shared with other
-/// dictionaries count in full.
+/// Memory that a value or dictionary holds beyond its own size, roughly, in bytes: its entries and texts.
+/// Texts shared with other dictionaries count in full.
+VESK_API std::size_t approximateMemory(const Value& value) noexcept;
 VESK_API std::size_t approximateMemory(const Dictionary& dictionary) noexcept;
 VESK_API std::size_t approximateMemory(const MutableDictionary& dictionary) noexcept;
 
