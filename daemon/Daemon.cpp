@@ -98,15 +98,21 @@ struct Daemon::Parts {
 Daemon::Daemon(ServiceManager& serviceManager, BusyMarker& busyMarker)
     : _parts(std::make_unique<Parts>(serviceManager, busyMarker)) {}
 
-Daemon::~Daemon() { stop(); }
+Daemon::~Daemon() {
+  if (!stop()) _parts->listener.stop();
+}
 
 void Daemon::resume() { _parts->listener.resume(); }
 
-void Daemon::stop() {
-  if (std::exchange(_stopped, true)) return;
+bool Daemon::stop() {
+  if (std::exchange(_stopped, true)) return !_parts;
   // A server that does not answer must not hold up the threads of connections that upload to it.
   _parts->backendServices.uploads->close();
-  _parts->listener.stop();
+  const bool haveEnded = _parts->listener.stopWithin(kSessionWait);
+  if (!haveEnded) {
+    VESK_LOG_WARNING("main: Stopping although sessions have not ended after %d seconds.",
+                     static_cast<int>(kSessionWait.count()));
+  }
   const auto begun = std::chrono::steady_clock::now();
   if (!_parts->http.waitUntilIdle(kPostWait)) {
     VESK_LOG_WARNING("main: Stopping although posts are still outstanding after %d seconds.",
@@ -118,8 +124,9 @@ void Daemon::stop() {
     VESK_LOG_WARNING("main: Stopping although datagrams are still unacknowledged after %d ms.",
                      static_cast<int>(kDatagramWait.count()));
   }
-  _parts.reset();  // gives up what is left, and counts it
+  if (haveEnded) _parts.reset();  // gives up what is left, and counts it
   logLosses();
+  return haveEnded;
 }
 
 }  // namespace vesk

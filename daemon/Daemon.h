@@ -1,6 +1,7 @@
 // The daemon's object graph, built in one place.
 #pragma once
 
+#include <chrono>
 #include <memory>
 
 #include "daemon/DaemonOptions.h"
@@ -15,7 +16,7 @@ class Daemon {
  public:
   /// Publishes nothing yet. Throws std::system_error when the socket can't be made.
   Daemon(ServiceManager& serviceManager, BusyMarker& busyMarker);
-  /// As `stop`.
+  /// As `stop`, but for sessions that do not end: those are waited for.
   ~Daemon();
 
   /// Begins to accept clients.
@@ -25,8 +26,12 @@ class Daemon {
   /// then what is being posted waited for, at most `kPostWait`, and datagrams, at most `kDatagramWait`; what
   /// is left is given up. Last, one line for each reason and backend says what was lost since the start. Safe
   /// to call twice.
-  void stop();
+  ///
+  /// False when a session did not end within `kSessionWait`, as happens when the disk under it hangs: then
+  /// nothing was destroyed, and the process has to be left by std::_Exit.
+  [[nodiscard]] bool stop();
 
+  static constexpr std::chrono::seconds kSessionWait{15};
   static constexpr std::chrono::seconds kPostWait{10};
   /// From the same moment: a dashboard that is not answered gives up 9.5 s after its next tick.
   static constexpr std::chrono::milliseconds kDatagramWait{10'500};

@@ -1,5 +1,6 @@
 // veskreportingd: accepts reporting messages from local clients and delivers them.
 #include <cstdio>
+#include <cstdlib>
 #include <exception>
 
 #include "client/common/Logging.h"
@@ -42,8 +43,9 @@ int run(const vesk::DaemonOptions& options) {
   vesk::releaseStartUpPages();
   loop.run();
   serviceManager.notifyStopping();
-  daemon.stop();
+  const bool haveEnded = daemon.stop();
   vesk::VeskReportingLogging::close();
+  if (!haveEnded) std::_Exit(1);  // what its sessions' threads still use can't be destroyed
   return 0;
 }
 

@@ -2,6 +2,8 @@
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 
+#include <future>
+
 #include "client/protocol/ClientSessionReplyProxy.h"
 #include "platform/ipc/ExtensionTokens.h"
 #include "platform/ipc/UnixSocket.h"
@@ -225,6 +227,18 @@ TEST(IPCListener, LeavesNeitherThreadNorDescriptorBehind) {
   }
   EXPECT_EQ(facts.descriptors(), descriptors);
   EXPECT_EQ(facts.threads(), threads);
+}
+
+TEST(IPCListener, DoesNotWaitForEverForAHandlerThatHangs) {
+  TestService service;
+  std::promise<void> released;
+  service.onInvalidation = [&] { released.get_future().wait(); };
+  TestClient client(service);
+  EXPECT_EQ(client.call("flushMessagesWithReply"), "posted all");
+  EXPECT_FALSE(service.listener().stopWithin(10ms));
+  released.set_value();
+  EXPECT_TRUE(service.listener().stopWithin(60s));
+  EXPECT_EQ(service.listener().connectionCount(), 0u);
 }
 
 TEST(IPCListener, TakesOverAStaleSocketButNoLiveOne) {

@@ -78,12 +78,17 @@ void ConnectionRegistry::reap() {
   }
 }
 
-void ConnectionRegistry::waitForThreads() {
+bool ConnectionRegistry::waitForThreads(std::chrono::steady_clock::time_point deadline) {
+  bool haveEnded = true;
   {
     MutexLock lock(_mutex);
-    while (!_running.empty()) _noneRuns.wait(_mutex);
+    while (!_running.empty() && haveEnded) {
+      haveEnded = _noneRuns.wait_until(_mutex, deadline) == std::cv_status::no_timeout;
+    }
+    haveEnded = _running.empty();
   }
   reap();
+  return haveEnded;
 }
 
 }  // namespace vesk

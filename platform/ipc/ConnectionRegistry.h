@@ -3,6 +3,7 @@
 
 #include <sys/types.h>
 
+#include <chrono>
 #include <condition_variable>
 #include <cstddef>
 #include <cstdint>
@@ -40,8 +41,9 @@ class ConnectionRegistry {
   void launch(std::function<void()> body);
   /// Joins threads that have ended. The listener calls it when `threadEnded` is readable.
   void reap();
-  /// Waits until every thread has ended, and joins them.
-  void waitForThreads();
+  /// Waits until every thread has ended, at most until `deadline`, and joins those that have. False when some
+  /// still run.
+  bool waitForThreads(std::chrono::steady_clock::time_point deadline);
   const Wakeup& threadEnded() const noexcept { return _threadEnded; }
 
  private:

@@ -47,11 +47,11 @@ FileDescriptor checkedInherited(FileDescriptor socket) {
 class IPCListener::Implementation {
  public:
   explicit Implementation(Options options);
-  ~Implementation() { stop(); }
+  ~Implementation() { stop(std::chrono::steady_clock::time_point::max()); }
 
   void setDelegate(IPCListenerDelegate* delegate) { _delegate = delegate; }
   void resume();
-  void stop();
+  bool stop(std::chrono::steady_clock::time_point deadline);
   std::size_t connectionCount() const { return _registry->count(); }
 
  private:
@@ -94,14 +94,14 @@ void IPCListener::Implementation::resume() {
   _thread = SmallThread("vesk-listener", [this] { run(); });
 }
 
-void IPCListener::Implementation::stop() {
+bool IPCListener::Implementation::stop(std::chrono::steady_clock::time_point deadline) {
   _stopping = true;
   _wakeup.signal();
   _thread.join();
   removeSocket();
   _listening.reset();
   for (const auto& connection : _registry->connections()) connection->end();
-  _registry->waitForThreads();
+  return _registry->waitForThreads(deadline);
 }
 
 /// Only the socket that this listener has made: another daemon may have taken the path over.
@@ -198,7 +198,11 @@ void IPCListener::setDelegate(IPCListenerDelegate* delegate) { _implementation->
 
 void IPCListener::resume() { _implementation->resume(); }
 
-void IPCListener::stop() { _implementation->stop(); }
+void IPCListener::stop() { _implementation->stop(std::chrono::steady_clock::time_point::max()); }
+
+bool IPCListener::stopWithin(std::chrono::milliseconds patience) {
+  return _implementation->stop(std::chrono::steady_clock::now() + patience);
+}
 
 std::size_t IPCListener::connectionCount() const { return _implementation->connectionCount(); }
 

@@ -45,6 +45,9 @@ class IPCListener {
   /// connection's thread has ended (invalidation handlers included). Safe before `resume` and twice; not from
   /// a connection's thread.
   void stop();
+  /// The same, but waits no longer than that. False when a thread still runs: then neither this nor what its
+  /// handlers use may be destroyed.
+  [[nodiscard]] bool stopWithin(std::chrono::milliseconds patience);
 
   std::size_t connectionCount() const;
 
