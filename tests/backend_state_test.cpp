@@ -106,22 +106,6 @@ TEST_F(BackendState, FollowsTheMatchingEntry) {
   }
 }
 
-TEST_F(BackendState, WrongTypesCostOneWarningThatNamesBackendAndKey) {
-  CapturedLog log;
-  auto backend = make(List{entry({{"override_sampling", List{}}, {"sampling_threshold", 0.1}})});
-  backend->updateState();
-  EXPECT_EQ(backend->state(), BackendStateOverride) << "counts as absent";
-  EXPECT_EQ(log.countContaining(4, "httpPost"), 1);
-  EXPECT_EQ(log.countContaining(4, "override_sampling"), 1);
-}
-
-TEST_F(BackendState, UserInfoThatIsAwaitedKeepsItPending) {
-  auto backend = make(List{entry()});
-  backend->setUserInfoDict(std::nullopt);
-  backend->updateState();
-  EXPECT_EQ(backend->state(), BackendStatePending);
-}
-
 TEST_F(BackendState, AnUnknownRegionPasses) {
   harness.region.reset();
   auto backend = make(List{entry()});

@@ -6,7 +6,6 @@
 
 #include "tests/support/DaemonHarness.h"
 #include "tests/support/DashboardServer.h"
-#include "tests/support/ProcessFacts.h"
 
 namespace vesk::test {
 namespace {
@@ -20,8 +19,6 @@ post_url = "@LOGDATA@"
 display_url = "http://dash"
 )";
 
-bool queued(ReportingStatus status) { return status == ReportingStatus::Queued; }
-
 class DashboardRoad : public testing::Test {
  protected:
   void start(std::vector<std::string> collectorArguments = {}, const std::string& reliable = {}) {
@@ -29,26 +26,6 @@ class DashboardRoad : public testing::Test {
     _harness->writeStorebag("zelko",
                             kDashboardBag + (reliable.empty() ? "" : "reliable = " + reliable + "\n"));
     _harness->startDaemon();
-  }
-  /// The daemon's descriptors of UDP sockets; others come and go with its HTTPS connections.
-  int datagramDescriptors() {
-    const std::string process = "/proc/" + std::to_string(_harness->daemon().pid());
-    std::ifstream table(process + "/net/udp");
-    const std::string sockets{std::istreambuf_iterator<char>(table), {}};
-    int count = 0;
-    for (const auto& file : std::filesystem::directory_iterator(process + "/fd")) {
-      std::error_code closedMeanwhile;
-      const std::string target = std::filesystem::read_symlink(file.path(), closedMeanwhile).string();
-      if (!target.starts_with("socket:[")) continue;
-      count += sockets.find(" " + target.substr(8, target.size() - 9) + " ") != std::string::npos;
-    }
-    return count;
-  }
-  long residentKiB() {
-    std::ifstream status("/proc/" + std::to_string(_harness->daemon().pid()) + "/status");
-    for (std::string line; std::getline(status, line);)
-      if (line.starts_with("VmRSS:")) return std::strtol(line.c_str() + 6, nullptr, 10);
-    return 0;
   }
   std::set<std::int64_t> numbersIn(const std::vector<boost::json::object>& datagrams) {
     std::set<std::int64_t> numbers;
@@ -113,44 +90,6 @@ TEST_F(DashboardRoad, EverythingArrivesThoughThreeInTenAreLostBothWays) {
   }
   EXPECT_GT(_harness->collectorCount("datagramsLost"), 300);
   EXPECT_GT(_harness->collectorCount("acknowledgementsLost"), 200);
-}
-
-TEST_F(DashboardRoad, MemoryStaysFlatWithoutAServer) {
-  start({}, "100");
-  RoadClient client(*_harness);
-  _harness->stopCollector();
-  auto send = [&](int count) {
-    for (int n = 0; n < count; ++n) {
-      while (!queued(client.reporting.sendMessage(3, 1, Dictionary{{"filler", std::string(900, 'x')}})))
-        (void)client.reporting.flushMessagesAndWait();  // which a full queue may refuse, too
-    }
-    ASSERT_TRUE(
-        eventually([&] { return bool(client.reporting.flushMessagesAndWait(ChildProcess::kPatience)); }));
-  };
-  send(2000);
-  const long before = residentKiB();
-  send(10'000);
-#if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
-  EXPECT_LT(residentKiB() - before, 2048) << "10,000 datagrams are 10 MiB";
-#endif
-  EXPECT_GT(before, 0);
-}
-
-TEST_F(DashboardRoad, AnEndedSessionLeavesNoDescriptorBehind) {
-  start({}, "2000");
-  for (bool answered : {true, false}) {
-    {
-      RoadClient client(*_harness);
-      EXPECT_EQ(datagramDescriptors(), 2) << "the socket, and the watch for acknowledgements";
-      ASSERT_TRUE(client.reporting.sendMessageAndWait(3, 1, Dictionary{{"n", 1}}));
-      if (!answered) _harness->stopCollector();
-    }
-    EXPECT_TRUE(eventually([&] { return datagramDescriptors() == 0; }));
-    // A tick may also come between a datagram and its answer.
-    if (answered) continue;
-    EXPECT_NE(_harness->daemon().errors().find("scheduled last resort clean-up in 9500 ms."),
-              std::string::npos);
-  }
 }
 
 TEST_F(DashboardRoad, TerminationSendsTheEndOfTheSessionAndWaitsForNothingElse) {

@@ -66,6 +66,14 @@ TEST_F(FamilyLife, ADestroyedAggregatorGetsItsOwnLastMessageBeforeTheClosingOne)
   ASSERT_EQ(connection->calls.size(), 2u);
   EXPECT_EQ(std::get<std::uint16_t>(connection->calls[0].arguments.at(3)), 1) << "the end of the session";
   EXPECT_FALSE(infoOf(connection->calls[1]));
+  {
+    auto top = join(0, true);
+    connection = top.connection;
+    connection->calls.clear();
+    top->shutdownSessionAggregation();
+    top->shutdownSessionAggregation();
+  }
+  EXPECT_EQ(connection->calls.size(), 1u) << "the closing one, once";
 }
 
 TEST_F(FamilyLife, ASessionThatMovesTakesItsHeldEventsAlongAndItsNextMessageGoesToTheNewAncestor) {

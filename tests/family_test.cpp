@@ -97,18 +97,5 @@ TEST_F(Family, ASessionLeavesItsFamilyUnderWhateverNameItJoined) {
   EXPECT_TRUE(configuredAnew.expired());
 }
 
-TEST_F(Family, ClosingAnAggregatingSessionTellsItsClientOnce) {
-  auto top = join(0, true);
-  auto connection = top.connection;
-  top->shutdownSessionAggregation();
-  top->shutdownSessionAggregation();
-  auto closing = [&] {
-    return std::count_if(connection->calls.begin(), connection->calls.end(), [](const auto& call) {
-      return !std::get<std::optional<Dictionary>>(call.arguments.at(0));
-    });
-  };
-  EXPECT_EQ(closing(), 1);
-}
-
 }  // namespace
 }  // namespace vesk::test

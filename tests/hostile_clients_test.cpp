@@ -17,10 +17,6 @@ namespace {
 
 using namespace std::string_view_literals;
 
-Dictionary message(int category) {
-  return Dictionary{{"category", category}, {"type", 2}, {"flag", 0}, {"payload", Dictionary{}}};
-}
-
 /// Kept connections of the HTTP client, which come and go.
 constexpr std::size_t kSpareDescriptors = 8;
 

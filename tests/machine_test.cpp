@@ -19,12 +19,6 @@ namespace {
 
 using namespace std::chrono_literals;
 
-Dictionary message(int category, Dictionary payload = {}, int flag = 0) {
-  return Dictionary{{"category", category}, {"type", 2}, {"flag", flag}, {"payload", std::move(payload)}};
-}
-
-bool queued(ReportingStatus status) { return status == ReportingStatus::Queued; }
-
 /// A small file system that only this process and those it starts can see, and that goes away with them.
 class SmallDisk {
  public:

@@ -71,8 +71,6 @@ class StorebagFetch : public testing::Test {
     setAnswer(std::move(next));
   }
 
-  static void cutOff() { setAnswer(faulty(HTTPAnswer::Fault::ResetBeforeAnswer)); }
-
   std::optional<Dictionary> fetch(std::int32_t clientType = 5) {
     maxAge = -1;
     version.reset();
@@ -250,14 +248,6 @@ TEST_F(StorebagFetch, AnUnreachableServerMeansTheBuiltInStorebagForOneNameOnly) 
   server().start();
   serve(std::string(std::size_t{5} << 20, ' '));
   EXPECT_FALSE(fetch(7)) << "an answer of any kind does not mean that";
-}
-
-TEST_F(StorebagFetch, ACutOffFetchIsNotRepeated) {
-  auto before = server().count();
-  cutOff();
-  EXPECT_FALSE(fetch());
-  EXPECT_EQ(server().count(), before + 1);
-  EXPECT_EQ(log.countContaining(6, withName("Error resolving with lookup server ")), 1);
 }
 
 TEST_F(StorebagFetch, AsksOnlyForWhatIsNewer) {

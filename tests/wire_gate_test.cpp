@@ -20,29 +20,6 @@ std::string header(std::uint32_t body, std::uint32_t fields, char order = 'l') {
   return bytes;
 }
 
-TEST(MessageGate, ReadsTheSizeInBothByteOrders) {
-  for (char order : {'l', 'B'}) {
-    MessageGate gate(100);
-    const std::string whole = header(10, 5, order) + std::string(8 + 10, 'x');
-    auto result = gate.pass(whole + whole.substr(0, 20) + "");
-    EXPECT_EQ(result.verdict, Verdict::Pass);
-    EXPECT_EQ(result.passed, whole.size() + 20);
-    EXPECT_EQ(result.lastStart, whole.size());
-    EXPECT_TRUE(gate.insideMessage());
-    EXPECT_EQ(gate.pass(whole.substr(20)).passed, whole.size() - 20);
-    EXPECT_FALSE(gate.insideMessage());
-  }
-}
-
-TEST(MessageGate, HoldsBackAnUnfinishedHeader) {
-  MessageGate gate(100);
-  const std::string whole = header(0, 8) + std::string(8, 'x');
-  auto result = gate.pass(whole + whole.substr(0, 15));
-  EXPECT_EQ(result.passed, whole.size());
-  EXPECT_EQ(gate.pass(whole.substr(0, 15)).passed, 0u);
-  EXPECT_EQ(gate.pass(whole).passed, whole.size());
-}
-
 TEST(MessageGate, RefusesWhatIsTooLargeOrNoHeader) {
   struct Case {
     const char* what;
@@ -83,16 +60,6 @@ TEST(AuthenticationGate, ComparesClaimsWithThePeerAndPassesTheOutcomeOn) {
   EXPECT_EQ(passedOn("\0AUTH EXTERNAL 30\r\n"s), "\0AUTH EXTERNAL 6e6f626f6479\r\n"s);
   EXPECT_EQ(passedOn("\0AUTH EXTERNAL\r\nDATA\r\nAUTH\r\nCANCEL\r\n"s),
             "\0AUTH EXTERNAL\r\nDATA\r\nAUTH\r\nCANCEL\r\n"s);
-}
-
-TEST(AuthenticationGate, StopsBehindBeginAndWaitsForWholeLines) {
-  AuthenticationGate gate(0);
-  const std::string data = "\0AUTH\r\nBEGIN\r\nl\1\1\1"s;
-  auto first = gate.pass(data.substr(0, 6));
-  EXPECT_EQ(first.taken, 1u);
-  auto second = gate.pass(data.substr(1));
-  EXPECT_EQ(second.verdict, AuthenticationGate::Verdict::Begun);
-  EXPECT_EQ(second.taken, data.size() - 5);
 }
 
 }  // namespace

@@ -77,6 +77,12 @@ class DaemonHarness {
   std::map<std::string, std::string> _deviceFacts;
 };
 
+/// A message's parameters.
+inline Dictionary message(int category, Dictionary payload = {}, int flag = 0) {
+  return Dictionary{{"category", category}, {"type", 2}, {"flag", flag}, {"payload", std::move(payload)}};
+}
+inline bool queued(ReportingStatus status) { return status == ReportingStatus::Queued; }
+
 /// A session of client type 5, configured and started.
 struct RoadClient {
   explicit RoadClient(const DaemonHarness& harness, Dictionary moreSessionInfo = {},
