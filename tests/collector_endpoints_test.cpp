@@ -9,6 +9,7 @@
 #include "tools/collector/UploadsEndpoint.h"
 #include "tools/json/JSONReader.h"
 #include "tools/storebag/StorebagDocument.h"
+#include "tools/text/Printable.h"
 #include "util/Gzip.h"
 
 namespace vesk {

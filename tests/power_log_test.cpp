@@ -204,7 +204,7 @@ TEST(PowerLogRoad, TheDaemonRecordsAndTheToolShows) {
   {
     RoadClient client(harness);
     EXPECT_EQ(client.enabled, BackendNames{"kilnar"});
-    EXPECT_TRUE(client.reporting.sendMessageAndWait(5, 7, Dictionary{{"k", "v"}}));
+    EXPECT_TRUE(client.reporting.sendMessageAndWait(5, 7, Dictionary{{"k", "v\u009b"}}));
   }
   EXPECT_EQ(harness.stopDaemon(), 0);
   auto show = [&](std::vector<std::string> more) {
@@ -217,8 +217,8 @@ TEST(PowerLogRoad, TheDaemonRecordsAndTheToolShows) {
   };
   auto line = boost::json::parse(show({"--json", "--since", "1h"})).as_object();
   EXPECT_EQ(line.at("name"), "Rookery-Vesk");
-  EXPECT_EQ(line.at("dictionary"), boost::json::parse(R"({"k":"v","method":5,"respCode":7,"event":2})"));
-  EXPECT_NE(show({}).find(R"(  28 Rookery-Vesk  {"k":"v")"), std::string::npos);
+  EXPECT_EQ(line.at("dictionary"), boost::json::parse("{\"k\":\"v\u009b\",\"method\":5,\"respCode\":7,\"event\":2}"));
+  EXPECT_NE(show({}).find(R"(  28 Rookery-Vesk  {"k":"v\xc2\x9b")"), std::string::npos);
   EXPECT_EQ(show({"--since", "2999-01-01"}), "");
 }
 

@@ -5,7 +5,7 @@
 #include <stdexcept>
 
 #include "platform/time/CivilTime.h"
-#include "tools/collector/Console.h"
+#include "tools/text/Printable.h"
 
 namespace vesk {
 

@@ -35,8 +35,4 @@ class Console {
   bool _outputClosed VESK_GUARDED_BY(_mutex) = false;
 };
 
-/// `text` with every control character, and whatever is not UTF-8, shown as \xNN, so that a peer can neither
-/// forge a line nor steer a terminal.
-std::string printable(std::string_view text);
-
 }  // namespace vesk

@@ -2,8 +2,8 @@
 
 #include "backends/SenderCodes.h"
 #include "platform/json/JSONWriter.h"
-#include "tools/collector/Console.h"
 #include "tools/collector/EventText.h"
+#include "tools/text/Printable.h"
 
 namespace vesk {
 

@@ -4,8 +4,7 @@
 #include <ctime>
 
 #include "platform/json/JSONWriter.h"
-#include "platform/unicode/Unicode.h"
-#include "tools/collector/Console.h"
+#include "tools/text/Printable.h"
 
 namespace vesk {
 
@@ -51,13 +50,6 @@ std::string clockText(WallTime time) {
 }
 
 double secondsFrom(WallTime time) { return std::chrono::duration<double>(time.time_since_epoch()).count(); }
-
-std::string printableUTF8(std::string_view bytes) {
-  if (isValidUTF8(bytes)) return std::string(bytes);
-  std::string shown;
-  for (char c : bytes) shown += (static_cast<unsigned char>(c) < 0x80) ? c : '?';
-  return shown;
-}
 
 std::string readableText(const EventPost& post, const HTTPReceived& received, WallTime now) {
   std::size_t count = post.events.size();

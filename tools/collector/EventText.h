@@ -20,7 +20,5 @@ std::string jsonLines(const EventPost& post, const HTTPReceived& received, WallT
 /// "20:31:29.123", local time.
 std::string clockText(WallTime time);
 double secondsFrom(WallTime time);
-/// JSON carries nothing but UTF-8: where `bytes` are none, "?" stands for each byte above 127.
-std::string printableUTF8(std::string_view bytes);
 
 }  // namespace vesk

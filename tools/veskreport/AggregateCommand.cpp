@@ -13,6 +13,7 @@
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/json/JSONWriter.h"
+#include "tools/text/Printable.h"
 #include "tools/veskreport/DaemonSession.h"
 
 namespace vesk {
@@ -45,7 +46,7 @@ Value carried(const std::optional<Dictionary>& dictionary) {
 
 std::string words(const std::optional<Dictionary>& dictionary) {
   if (!dictionary) return "none";
-  return toJSON(*dictionary, JSONStyle::Compact).value_or(describe(*dictionary));
+  return printable(toJSON(*dictionary, JSONStyle::Compact).value_or(describe(*dictionary)));
 }
 
 /// Prints on the session's thread and tells the main thread when there is nothing more to wait for.

@@ -8,6 +8,7 @@
 #include "platform/powerlog/PowerLogReader.h"
 #include "platform/time/CivilTime.h"
 #include "tools/json/JSONReader.h"
+#include "tools/text/Printable.h"
 
 namespace vesk {
 
@@ -45,8 +46,8 @@ std::string isoTime(WallTime time) {
 }
 
 int show(const PowerLogEvent& event, const Output& output) {
-  std::string line = civilTime(event.time) + "  " + std::to_string(event.identifier) + " " + event.name +
-                     "  " + event.dictionary;
+  std::string line = civilTime(event.time) + "  " + std::to_string(event.identifier) + " " +
+                     printable(event.name) + "  " + printable(event.dictionary);
   auto dictionary = parseJSON(event.dictionary, 64);
   return output.done(line, {{"time", std::chrono::duration<double>(event.time.time_since_epoch()).count()},
                             {"utc", isoTime(event.time)},

@@ -1,0 +1,48 @@
+#include "tools/text/Printable.h"
+
+#include <cstdio>
+
+#include "platform/unicode/Unicode.h"
+
+namespace vesk {
+
+namespace {
+
+void appendCode(std::string& shown, char c) {
+  char code[8];
+  std::snprintf(code, sizeof code, "\\x%02x", static_cast<unsigned char>(c));
+  shown += code;
+}
+
+/// U+0080 to U+009F, which terminals obey as they do the first 32.
+bool isSecondControlSet(std::string_view text) {
+  return text.size() > 1 && text[0] == '\xc2' && static_cast<unsigned char>(text[1]) < 0xa0;
+}
+
+}  // namespace
+
+std::string printable(std::string_view text) {
+  const bool isUTF8 = isValidUTF8(text);
+  std::string shown;
+  for (std::size_t i = 0; i < text.size(); ++i) {
+    if (isUTF8 && isSecondControlSet(text.substr(i))) {
+      appendCode(shown, text[i++]);
+      appendCode(shown, text[i]);
+    } else if (auto byte = static_cast<unsigned char>(text[i]);
+               byte < 0x20 || byte == 0x7f || (byte > 0x7f && !isUTF8)) {
+      appendCode(shown, text[i]);
+    } else {
+      shown += text[i];
+    }
+  }
+  return shown;
+}
+
+std::string printableUTF8(std::string_view bytes) {
+  if (isValidUTF8(bytes)) return std::string(bytes);
+  std::string shown;
+  for (char c : bytes) shown += (static_cast<unsigned char>(c) < 0x80) ? c : '?';
+  return shown;
+}
+
+}  // namespace vesk
