@@ -1,6 +1,8 @@
 #include "tools/veskreport/CommandLine.h"
 
 #include <CLI/CLI.hpp>
+#include <cmath>
+#include <cstdlib>
 
 #include "tools/veskreport/Output.h"
 
@@ -10,6 +12,11 @@ namespace {
 
 constexpr double kLongestTimeout = 86'400;
 constexpr double kUploadTimeout = 600;  // a file may be large and the line thin
+
+/// Ranges let a "nan" pass, which lies neither below nor above them.
+std::string isNumber(const std::string& text) {
+  return std::isnan(std::strtod(text.c_str(), nullptr)) ? text + " is no number" : "";
+}
 
 class Reader {
  public:
@@ -60,7 +67,7 @@ class Reader {
                   "Have backends wait for user info and heed it");
     sub->add_flag("--batch", identity.batch, "Have backends gather messages before they post them");
     sub->add_option("--timeout", _timeout, "Seconds to wait for each answer")
-        ->check(CLI::Range(0.001, kLongestTimeout))
+        ->check(CLI::Range(0.001, kLongestTimeout) & CLI::Validator(isNumber, "", "NUMBER"))
         ->capture_default_str();
     return sub;
   }
