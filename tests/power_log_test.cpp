@@ -217,8 +217,14 @@ TEST(PowerLogRoad, TheDaemonRecordsAndTheToolShows) {
   };
   auto line = boost::json::parse(show({"--json", "--since", "1h"})).as_object();
   EXPECT_EQ(line.at("name"), "Rookery-Vesk");
-  EXPECT_EQ(line.at("dictionary"), boost::json::parse("{\"k\":\"v\u009b\",\"method\":5,\"respCode\":7,\"event\":2}"));
+  EXPECT_EQ(line.at("dictionary"),
+            boost::json::parse("{\"k\":\"v\u009b\",\"method\":5,\"respCode\":7,\"event\":2}"));
   EXPECT_NE(show({}).find(R"(  28 Rookery-Vesk  {"k":"v\xc2\x9b")"), std::string::npos);
+  ChildProcess full(
+      {"/bin/sh", "-c",
+       "exec " VESK_BIN_DIRECTORY "/veskreport power-log >/dev/full --root " + harness.root.path().string()});
+  EXPECT_EQ(full.wait(), 1);
+  EXPECT_EQ(full.errors(), "veskreport: cannot write to standard output\n");
   EXPECT_EQ(show({"--since", "2999-01-01"}), "");
 }
 
@@ -229,6 +235,7 @@ TEST(PowerLogCommandTest, UnderstandsAgesAndTimes) {
       {"30s", now - 30s},
       {"2h", now - 2h},
       {"7d", now - 168h},
+      {"4294967295d", now - 24h * 100'000},
       {"1970-01-02", WallTime(24h)},
       {"1970-01-01T01:02:03Z", WallTime(1h + 2min + 3s)},
       {"1970-01-01 01:02:03", WallTime(1h + 2min + 3s)},

@@ -173,6 +173,12 @@ TEST_F(VeskreportCommand, SaysWhatFailed) {
   EXPECT_EQ(runClient({"upload-file", root + "/missing"}).errors,
             "veskreport: the file can't be opened: No such file or directory\n");
 
+  for (const std::string command : {"flush --client-type 5 --root " + root, "storebag keygen " + root}) {
+    ChildProcess full({"/bin/sh", "-c", "exec " VESK_BIN_DIRECTORY "/veskreport " + command + " >/dev/full"});
+    EXPECT_EQ(full.wait(), 1) << command;
+    EXPECT_EQ(full.errors(), "veskreport: cannot write to standard output\n");
+  }
+
   record.abandonsAnswers = true;
   EXPECT_EQ(runClient({"flush"}).status, 1);
 }
@@ -197,6 +203,7 @@ TEST_F(VeskreportCommand, WrongUsageIsStatusTwo) {
            {"send", "--client-type", "5", "-c", "1", "-t", "1", "no pair"},
            {"send", "--client-type", "5", "-c", "1", "-t", "1", "--stdin", "k=v"},
            {"states", "--client-type", "5", "--timeout", "0"},
+           {"states", "--client-type", "5", "--timeout", "nan"},
            {"storebag", "sign"},
        }) {
     auto outcome = run(arguments);
@@ -220,6 +227,9 @@ TEST_F(VeskreportCommand, MakesAndExaminesStorebags) {
             bag + ": valid, version 1.2\n");
   EXPECT_NE(run({"storebag", "show", bag}).output.find("active = true"), std::string::npos);
 
+  EXPECT_EQ(run({"storebag", "keygen", "--json", root + "/k\xff"}).output,
+            R"({"status":"done","privateKey":")" + root + R"(/k?/storebag-signing.key","publicKey":")" +
+                root + "/k?/publicKey.der\"}\n");
   auto other = root + "/other";
   run({"storebag", "keygen", other});
   auto outcome = run({"storebag", "verify", bag, "--key", other + "/publicKey.der"});

@@ -119,12 +119,12 @@ int runAggregate(const Invocation& invocation, const Output& output) {
   if (int status = session.start([&](const AggregatedMessage& message) { receiver.take(message); }))
     return status;
   receiver.waitForTheEnd();
-  if (std::ferror(stdout)) return output.failed("cannot write to standard output");
+  if (std::ferror(stdout)) return kExitFailed;
   if (receiver.wasClosed() && !output.isJSON()) {
     output.note("the aggregation was closed: the daemon ends, or a session above this one aggregates");
   }
   if (output.isJSON()) {
-    output.done("", {{"received", receiver.received()}, {"closed", receiver.wasClosed()}});
+    return output.done("", {{"received", receiver.received()}, {"closed", receiver.wasClosed()}});
   }
   return kExitDone;
 }

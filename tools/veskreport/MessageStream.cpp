@@ -107,8 +107,8 @@ int MessageStream::finish() {
   if (!_lines.error().empty()) return _output.failed("standard input: " + _lines.error());
   std::string words = std::to_string(_sent) + (_sent == 1 ? " message sent" : " messages sent");
   if (_failed > 0) words += ", " + std::to_string(_failed) + " failed";
-  _output.done(words, {{"sent", _sent}, {"failed", _failed}});
-  return _failed == 0 ? kExitDone : kExitFailed;
+  const int told = _output.done(words, {{"sent", _sent}, {"failed", _failed}});
+  return _failed == 0 ? told : kExitFailed;
 }
 
 }  // namespace vesk

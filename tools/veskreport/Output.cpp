@@ -3,16 +3,23 @@
 #include <cstdio>
 
 #include "platform/json/JSONWriter.h"
+#include "tools/text/Printable.h"
 
 namespace vesk {
 
 namespace {
 
+bool print(std::FILE* file, std::string_view bytes) {
+  return std::fwrite(bytes.data(), 1, bytes.size(), file) == bytes.size() && std::fflush(file) == 0;
+}
+
 // One write for a line: others may write at the same time.
-void printLine(std::FILE* file, std::string line) {
-  line += '\n';
-  std::fwrite(line.data(), 1, line.size(), file);
-  std::fflush(file);
+bool printLine(std::FILE* file, std::string line) { return print(file, line += '\n'); }
+
+/// Texts of the tool's own, names of files among them, as JSON can carry them.
+Value carried(const Value& value) {
+  const Text* text = value.text();
+  return text ? Value(printableUTF8(text->view())) : value;
 }
 
 }  // namespace
@@ -22,12 +29,14 @@ int Output::done(std::string_view line, const Dictionary& fields) const {
 }
 
 int Output::done(const std::vector<std::string>& lines, const Dictionary& fields) const {
+  if (std::ferror(stdout)) return kExitFailed;  // that was told when it happened
+  bool isWritten = true;
   if (_json) {
-    object("done", {}, fields);
+    isWritten = object("done", {}, fields);
   } else {
-    for (const std::string& line : lines) printLine(stdout, line);
+    for (const std::string& line : lines) isWritten = isWritten && printLine(stdout, line);
   }
-  return kExitDone;
+  return isWritten ? kExitDone : failed("cannot write to standard output");
 }
 
 int Output::failed(std::string_view cause, const Dictionary& fields) const {
@@ -39,18 +48,18 @@ int Output::failed(std::string_view cause, const Dictionary& fields) const {
 void Output::note(std::string_view words) const { printLine(stderr, "veskreport: " + std::string(words)); }
 
 int Output::raw(std::string_view bytes) const {
-  bool isWritten =
-      std::fwrite(bytes.data(), 1, bytes.size(), stdout) == bytes.size() && std::fflush(stdout) == 0;
-  return isWritten ? kExitDone : failed("cannot write to standard output");
+  return print(stdout, bytes) ? kExitDone : failed("cannot write to standard output");
 }
 
-void Output::object(const char* status, std::string_view cause, const Dictionary& fields) const {
+bool Output::object(const char* status, std::string_view cause, const Dictionary& fields) const {
   MutableDictionary entries;
   entries.append(Text::literal("status"), status);
-  if (!cause.empty()) entries.append(Text::literal("error"), cause);
-  entries.setAll(fields);
+  if (!cause.empty()) entries.append(Text::literal("error"), printableUTF8(cause));
+  for (const DictionaryEntry& field : fields) entries.set(field.key, carried(field.value));
   auto line = toJSON(entries.share(), JSONStyle::Compact);
-  printLine(stdout, line ? *line : R"({"status":"failed","error":"no JSON can carry the outcome"})");
+  const bool isPrinted =
+      printLine(stdout, line ? *line : R"({"status":"failed","error":"no JSON can carry the outcome"})");
+  return line && isPrinted;
 }
 
 }  // namespace vesk

@@ -21,7 +21,8 @@ class Output {
 
   bool isJSON() const noexcept { return _json; }
 
-  /// A result: `line` for people, {"status":"done", and `fields`} for scripts. Returns kExitDone.
+  /// A result: `line` for people, {"status":"done", and `fields`} for scripts. Returns kExitDone,
+  /// or kExitFailed when it can't be written, which the first such call tells as `failed` does.
   int done(std::string_view line, const Dictionary& fields) const;
   /// A result of several lines for people.
   int done(const std::vector<std::string>& lines, const Dictionary& fields) const;
@@ -34,7 +35,7 @@ class Output {
   int raw(std::string_view bytes) const;
 
  private:
-  void object(const char* status, std::string_view cause, const Dictionary& fields) const;
+  bool object(const char* status, std::string_view cause, const Dictionary& fields) const;
 
   const bool _json;
 };

@@ -1,5 +1,6 @@
 #include "tools/veskreport/PowerLogCommand.h"
 
+#include <algorithm>
 #include <charconv>
 #include <cstdio>
 #include <filesystem>
@@ -13,6 +14,9 @@
 namespace vesk {
 
 namespace {
+
+// Ages reach back to any time that a log can hold, and no time is out of the clock's range.
+constexpr std::chrono::seconds kLongestAge = std::chrono::days(100'000);
 
 std::optional<std::chrono::seconds> unitNamed(char letter) {
   switch (letter) {
@@ -36,7 +40,7 @@ std::optional<std::chrono::seconds> ageMeantBy(const std::string& text) {
   const char* last = text.data() + text.size() - 1;
   auto [end, error] = std::from_chars(text.data(), last, count);
   if (!unit || error != std::errc() || end != last) return std::nullopt;
-  return *unit * std::int64_t{count};
+  return std::min<std::chrono::seconds>(*unit * std::int64_t{count}, kLongestAge);
 }
 
 std::string isoTime(WallTime time) {
@@ -97,11 +101,12 @@ int runPowerLog(const Invocation& invocation, const Output& output) {
   if (!std::filesystem::exists(path, unknown)) {
     return output.failed(path + ": " + (unknown ? unknown.message() : "nothing has been recorded"));
   }
+  int status = kExitDone;
   std::string error = readPowerLog(path, since, [&](const PowerLogEvent& event) {
-    show(event, output);
-    return true;
+    status = show(event, output);
+    return status == kExitDone;
   });
-  return error.empty() ? kExitDone : output.failed(path + ": " + error);
+  return error.empty() ? status : output.failed(path + ": " + error);
 }
 
 }  // namespace vesk
