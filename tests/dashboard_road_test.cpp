@@ -108,10 +108,14 @@ TEST_F(DashboardRoad, TheCollectorSurvivesWhatIsNoDatagram) {
   auto ready = boost::json::parse(_harness->root.read("ready"));
   ASSERT_EQ(socket.connect({kLoopback, static_cast<std::uint16_t>(ready.at("udpPort").as_int64())}), 0);
   const std::string header = std::string("\x07\x05\x01", 3) + std::string(61, '\0');
-  for (const std::string& bytes : {std::string(), std::string("x"), header, std::string(3000, 'x')})
+  std::string huge = std::string(kDashboardHeaderSize, '\0') + ' ' + std::string(60'000, '=');
+  DashboardHeader ofHuge;
+  ofHuge.length = static_cast<std::uint16_t>(huge.size());
+  encodeDashboardHeader(ofHuge, huge.data());
+  for (const std::string& bytes : {std::string(), std::string("x"), header, huge, std::string(3000, 'x')})
     ASSERT_TRUE(socket.send(bytes));
   EXPECT_TRUE(_harness->collector().waitForText("refused a datagram of 3000 bytes from 127.0.0.1:"));
-  EXPECT_EQ(_harness->collectorCount("datagramsMalformed"), 4);
+  EXPECT_EQ(_harness->collectorCount("datagramsMalformed"), 5);
 }
 
 }  // namespace

@@ -63,12 +63,13 @@ std::string_view senderOf(const DashboardHeader& header) {
 
 DatagramOutcome readDashboardDatagram(std::string_view bytes) {
   if (bytes.size() < kDashboardHeaderSize) return {std::nullopt, "it is shorter than a header"};
+  if (bytes.size() > kDashboardLongestDatagram) return {std::nullopt, "it is longer than any datagram"};
   auto header = decodeDashboardHeader(bytes);
   if (!header) return {std::nullopt, "its header is of another version, or states another length"};
   const std::string_view text = bytes.substr(kDashboardHeaderSize);
   if (!text.empty() && text[0] != ' ') return {std::nullopt, "its text does not begin with a space"};
   ReceivedDatagram datagram{*header, payloadFrom(text), {}, {}};
-  datagram.isCut = bytes.size() >= kDashboardLongestDatagram;
+  datagram.isCut = bytes.size() == kDashboardLongestDatagram;
   return {std::move(datagram), {}};
 }
 

@@ -27,7 +27,8 @@ struct DatagramOutcome {
 };
 
 /// Decodes header and text. Keys travel without escapes, so that one with an equals sign or a space in it can
-/// be taken for something else; nothing that arrives makes this fail but a header that is none.
+/// be taken for something else; nothing that arrives makes this fail but a header that is none, and
+/// a length that no datagram has.
 DatagramOutcome readDashboardDatagram(std::string_view bytes);
 
 /// One line, without line feed and control characters.
