@@ -1,5 +1,8 @@
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 #include <utime.h>
+
+#include <csignal>
 
 #include "tests/support/TempDirectory.h"
 #include "tools/collector/ControlEndpoint.h"
@@ -84,6 +87,9 @@ TEST_F(CollectorEndpoints, TakeFilesUnderNamesThatLeadNowhere) {
   EXPECT_EQ(_stats.uploads, 0U);
   EXPECT_EQ(uploads.answer(request("POST", good + "%2e%2e%2Fa%20b.gz", packed, gzip("x"))).body, "as told\n");
   EXPECT_EQ(_files.read("uploads/1-.._a b.gz"), gzip("x"));
+  UploadsEndpoint nowhere({_console, _stats, _faults}, _files.write("file", "") / "below", "as told");
+  EXPECT_EQ(nowhere.answer(request("POST", good + "a.gz", packed, gzip("x"))).status, 500U);
+  EXPECT_EQ(_stats.refused, 5U);
   EXPECT_EQ(_faults.add("upload=503*1"), std::nullopt);
   EXPECT_EQ(uploads.answer(request("POST", good + "b.gz", packed, gzip("x"))).status, 503U);
   EXPECT_EQ(_stats.uploads, 1U);
@@ -142,13 +148,26 @@ TEST_F(CollectorEndpoints, CountEventsThatCanNotBeSaved) {
   EventsEndpoint events({_console, _stats, _faults}, _files / "no/such/directory");
   EXPECT_EQ(events.answer(post()).status, 200U);
   EXPECT_EQ(_stats.eventsNotSaved, 1U);
+
+  _events.answer(post());
+  rlimit before{};
+  ::getrlimit(RLIMIT_FSIZE, &before);
+  ::signal(SIGXFSZ, SIG_IGN);
+  rlimit full = before;
+  full.rlim_cur = _files.read("events.jsonl").size() + 10;
+  ::setrlimit(RLIMIT_FSIZE, &full);
+  _events.answer(post());
+  ::setrlimit(RLIMIT_FSIZE, &before);
+  EXPECT_EQ(_stats.eventsNotSaved, 2U);
+  _events.answer(post());
+  EXPECT_EQ(savedLines().size(), 2U) << "and no torn line between them";
 }
 
 TEST_F(CollectorEndpoints, GiveFaultsInTheirOrderAndAsOftenAsAsked) {
   for (const char* bad : {"", "post", "post=", "past=500", "post=700", "post=500*0", "post=500*x",
                           "post=bad-signature", "post=answer="})
     EXPECT_TRUE(_faults.add(bad)) << bad;
-  for (const char* good : {"post=503*2", "post=answer=204*1", "post=slow*1", "post=reset"})
+  for (const char* good : {"post=503*2", "post=answer=204*1", "post=slow*1", "post=reset", "logdata=500"})
     EXPECT_FALSE(_faults.add(good)) << good;
   const std::tuple<unsigned, HTTPAnswer::Fault, std::size_t> expected[] = {
       {503, HTTPAnswer::Fault::None, 0},

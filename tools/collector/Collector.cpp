@@ -48,7 +48,7 @@ struct Collector::Parts {
         events({console, stats, faults}, options.events),
         uploads({console, stats, faults}, options.uploads, options.uploadAnswer),
         storebags({console, stats, faults, folder, key}, options.maximumAge),
-        logData(console, stats, options.directory / "logdata"),
+        logData({console, stats, faults}, options.directory / "logdata"),
         control(console, stats, faults),
         securePaths(Refusals(console, stats)),
         plainPaths(Refusals(console, stats)) {

@@ -8,19 +8,13 @@
 namespace vesk {
 
 EventsEndpoint::EventsEndpoint(Parts parts, std::filesystem::path file)
-    : _parts(parts), _refuse(parts.console, parts.stats), _file(std::move(file)) {}
+    : _parts(parts),
+      _refuse(parts.console, parts.stats),
+      _faulty(parts.console, parts.stats, parts.faults, FaultTarget::Post),
+      _file(std::move(file)) {}
 
 HTTPAnswer EventsEndpoint::answer(const HTTPReceived& received) {
-  auto fault = _parts.faults.take(FaultTarget::Post);
-  HTTPAnswer answer;
-  if (!fault || fault->isOnlyInTheAnswer()) answer = take(received);
-  if (fault) {
-    ++_parts.stats.faults;
-    _parts.console.note("fault on demand for " + received.method + " " + received.target + " from " +
-                        received.peer);
-    fault->applyTo(answer);
-  }
-  return answer;
+  return _faulty(received, [&](const CollectorFault*) { return take(received); });
 }
 
 HTTPAnswer EventsEndpoint::take(const HTTPReceived& received) {

@@ -6,7 +6,6 @@
 #include "platform/time/Clock.h"
 #include "tools/collector/Endpoint.h"
 #include "tools/collector/EventPost.h"
-#include "tools/collector/FaultPlan.h"
 
 namespace vesk {
 
@@ -32,6 +31,7 @@ class EventsEndpoint : public Endpoint {
 
   const Parts _parts;
   const Refusals _refuse;
+  const FaultyAnswers _faulty;
   const std::filesystem::path _file;
 };
 

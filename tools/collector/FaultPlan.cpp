@@ -10,7 +10,7 @@ using Kind = CollectorFault::Kind;
 using Fault = HTTPAnswer::Fault;
 
 constexpr std::size_t kMaximumPlanned = 1000;
-constexpr std::array<std::string_view, 3> kTargets{"post", "storebag", "upload"};
+constexpr std::array<std::string_view, 4> kTargets{"post", "storebag", "upload", "logdata"};
 
 struct NamedFault {
   std::string_view name;
@@ -76,8 +76,8 @@ std::optional<std::string> FaultPlan::add(std::string_view text) {
   auto equals = text.find('=');
   auto target = targetNamed(text.substr(0, equals));
   if (!target || equals == std::string_view::npos)
-    return "a fault is written as post=FAULT, storebag=FAULT or upload=FAULT, not '" + std::string(text) +
-           "'";
+    return "a fault is written as post=FAULT, storebag=FAULT, upload=FAULT or logdata=FAULT, not '" +
+           std::string(text) + "'";
   std::string_view name = text.substr(equals + 1);
   std::optional<unsigned> times;
   if (auto star = name.rfind('*'); star != std::string_view::npos) {

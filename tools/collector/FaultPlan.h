@@ -13,7 +13,7 @@
 
 namespace vesk {
 
-enum class FaultTarget : unsigned char { Post, Storebag, Upload };
+enum class FaultTarget : unsigned char { Post, Storebag, Upload, LogData };
 
 struct CollectorFault {
   enum class Kind : unsigned char {
@@ -35,8 +35,9 @@ struct CollectorFault {
 /// The faults still to come, per target in the order in which they were added. Thread-safe.
 class FaultPlan {
  public:
-  /// Adds one fault written as "target=fault" or "target=fault*times", where target is "post", "storebag" or
-  /// "upload" and fault a status ("503", "answer=503") or one of the names that `faultNames` lists. Without
+  /// Adds one fault written as "target=fault" or "target=fault*times", where target is "post", "storebag",
+  /// "upload" or "logdata" and fault a status ("503", "answer=503") or one of the names that `faultNames`
+  /// lists. Without
   /// "*times" it stays until another is added; "target=none" forgets that target's. What is wrong with the
   /// text comes back.
   [[nodiscard]] std::optional<std::string> add(std::string_view text);
@@ -59,7 +60,7 @@ class FaultPlan {
   };
 
   mutable Mutex _mutex;
-  std::array<std::deque<Planned>, 3> _planned VESK_GUARDED_BY(_mutex);
+  std::array<std::deque<Planned>, 4> _planned VESK_GUARDED_BY(_mutex);
 };
 
 }  // namespace vesk

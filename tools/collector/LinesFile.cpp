@@ -1,6 +1,7 @@
 #include "tools/collector/LinesFile.h"
 
 #include <fcntl.h>
+#include <sys/file.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -12,9 +13,13 @@ namespace vesk {
 int appendLines(const std::filesystem::path& path, std::string_view lines) {
   FileDescriptor file(::open(path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0644));
   if (!file) return errno;
+  // Others append to the file, too, and must not do so before a torn line is gone again.
+  ::flock(file.get(), LOCK_EX);
   ssize_t written = ::write(file.get(), lines.data(), lines.size());
   if (written < 0) return errno;
-  return static_cast<std::size_t>(written) == lines.size() ? 0 : ENOSPC;
+  if (static_cast<std::size_t>(written) == lines.size()) return 0;
+  const off_t end = ::lseek(file.get(), 0, SEEK_CUR);
+  return ::ftruncate(file.get(), end - written) == 0 ? ENOSPC : errno;
 }
 
 }  // namespace vesk

@@ -5,10 +5,17 @@
 
 namespace vesk {
 
-LogDataEndpoint::LogDataEndpoint(Console& console, CollectorStats& stats, std::filesystem::path directory)
-    : _console(console), _stats(stats), _refuse(console, stats), _directory(std::move(directory)) {}
+LogDataEndpoint::LogDataEndpoint(Parts parts, std::filesystem::path directory)
+    : _parts(parts),
+      _refuse(parts.console, parts.stats),
+      _faulty(parts.console, parts.stats, parts.faults, FaultTarget::LogData),
+      _directory(std::move(directory)) {}
 
 HTTPAnswer LogDataEndpoint::answer(const HTTPReceived& received) {
+  return _faulty(received, [&](const CollectorFault*) { return take(received); });
+}
+
+HTTPAnswer LogDataEndpoint::take(const HTTPReceived& received) {
   if (received.method != "POST") return _refuse.wrongMethod(received, "POST");
   if (received.header("Content-Type") != "application/octet-stream")
     return _refuse(received, 400, "the header Content-Type must be application/octet-stream");
@@ -16,9 +23,9 @@ HTTPAnswer LogDataEndpoint::answer(const HTTPReceived& received) {
   if (!archive.value) return _refuse(received, 400, archive.error);
   try {
     const auto file = store(received);
-    ++_stats.logData;
-    _console.note("log data of " + std::to_string(received.body.size()) + " bytes from " + received.peer +
-                  " in " + file.string());
+    ++_parts.stats.logData;
+    _parts.console.note("log data of " + std::to_string(received.body.size()) + " bytes from " +
+                        received.peer + " in " + file.string());
     HTTPAnswer answer;
     answer.headers = {{"Content-Type", "text/plain; charset=utf-8"}};
     answer.body = file.string();

@@ -13,17 +13,23 @@ namespace vesk {
 /// what the sender announces as location. Anything else is refused with 400 or 405.
 class LogDataEndpoint : public Endpoint {
  public:
+  struct Parts {
+    Console& console;
+    CollectorStats& stats;
+    FaultPlan& faults;
+  };
   /// `directory` is made when the first upload arrives.
-  LogDataEndpoint(Console& console, CollectorStats& stats, std::filesystem::path directory);
+  LogDataEndpoint(Parts parts, std::filesystem::path directory);
 
   HTTPAnswer answer(const HTTPReceived& received) override;
 
  private:
+  HTTPAnswer take(const HTTPReceived& received);
   std::filesystem::path store(const HTTPReceived& received);
 
-  Console& _console;
-  CollectorStats& _stats;
+  const Parts _parts;
   const Refusals _refuse;
+  const FaultyAnswers _faulty;
   const std::filesystem::path _directory;
   std::atomic<std::uint64_t> _next = 1;
 };

@@ -22,19 +22,15 @@ bool isUnchangedSince(const HTTPReceived& received, std::time_t lastModified) {
 }  // namespace
 
 StorebagEndpoint::StorebagEndpoint(Parts parts, std::optional<std::chrono::seconds> maximumAge)
-    : _parts(parts), _refuse(parts.console, parts.stats), _maximumAge(maximumAge) {}
+    : _parts(parts),
+      _refuse(parts.console, parts.stats),
+      _faulty(parts.console, parts.stats, parts.faults, FaultTarget::Storebag),
+      _maximumAge(maximumAge) {}
 
 HTTPAnswer StorebagEndpoint::answer(const HTTPReceived& received) {
-  auto fault = _parts.faults.take(FaultTarget::Storebag);
-  HTTPAnswer answer;
-  bool signWell = !fault || fault->kind != CollectorFault::Kind::BadSignature;
-  if (!fault || fault->isOnlyInTheAnswer()) answer = serve(received, signWell);
-  if (fault) {
-    ++_parts.stats.faults;
-    _parts.console.note("fault on demand for " + describeRequest(received));
-    fault->applyTo(answer);
-  }
-  return answer;
+  return _faulty(received, [&](const CollectorFault* fault) {
+    return serve(received, fault == nullptr || fault->kind != CollectorFault::Kind::BadSignature);
+  });
 }
 
 HTTPAnswer StorebagEndpoint::serve(const HTTPReceived& received, bool signWell) {

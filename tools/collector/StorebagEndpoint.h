@@ -5,7 +5,6 @@
 #include <optional>
 
 #include "tools/collector/Endpoint.h"
-#include "tools/collector/FaultPlan.h"
 #include "tools/collector/StorebagFolder.h"
 #include "tools/storebag/SigningKey.h"
 
@@ -35,6 +34,7 @@ class StorebagEndpoint : public Endpoint {
 
   const Parts _parts;
   const Refusals _refuse;
+  const FaultyAnswers _faulty;
   const std::optional<std::chrono::seconds> _maximumAge;
 };
 

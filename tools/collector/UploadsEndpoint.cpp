@@ -27,20 +27,12 @@ std::string nameIn(const HTTPReceived& received) {
 UploadsEndpoint::UploadsEndpoint(Parts parts, std::filesystem::path directory, std::string goodAnswer)
     : _parts(parts),
       _refuse(parts.console, parts.stats),
+      _faulty(parts.console, parts.stats, parts.faults, FaultTarget::Upload),
       _directory(std::move(directory)),
       _goodAnswer(std::move(goodAnswer)) {}
 
 HTTPAnswer UploadsEndpoint::answer(const HTTPReceived& received) {
-  auto fault = _parts.faults.take(FaultTarget::Upload);
-  HTTPAnswer answer;
-  if (!fault || fault->isOnlyInTheAnswer()) answer = take(received);
-  if (fault) {
-    ++_parts.stats.faults;
-    _parts.console.note("fault on demand for " + received.method + " " + received.target + " from " +
-                        received.peer);
-    fault->applyTo(answer);
-  }
-  return answer;
+  return _faulty(received, [&](const CollectorFault*) { return take(received); });
 }
 
 HTTPAnswer UploadsEndpoint::take(const HTTPReceived& received) {
@@ -50,7 +42,12 @@ HTTPAnswer UploadsEndpoint::take(const HTTPReceived& received) {
   if (received.header("Content-Encoding") != "gzip") return _refuse(received, 400, "the file is not gzip");
   auto contents = received.decodedBody(kMaximumContents);
   if (!contents.body) return _refuse(received, 400, contents.problem);
-  auto path = save(received, name);
+  std::filesystem::path path;
+  try {
+    path = save(received, name);
+  } catch (const std::exception& error) {
+    return _refuse(received, 500, error.what());
+  }
   ++_parts.stats.uploads;
   _parts.console.note("file " + name + " (" + std::to_string(contents.body->size()) + " bytes, " +
                       std::to_string(received.body.size()) + " as sent) of session " +

@@ -6,7 +6,6 @@
 #include <string>
 
 #include "tools/collector/Endpoint.h"
-#include "tools/collector/FaultPlan.h"
 
 namespace vesk {
 
@@ -35,6 +34,7 @@ class UploadsEndpoint : public Endpoint {
 
   const Parts _parts;
   const Refusals _refuse;
+  const FaultyAnswers _faulty;
   const std::filesystem::path _directory;
   const std::string _goodAnswer;
   std::atomic<unsigned> _last{0};  ///< number of a file
