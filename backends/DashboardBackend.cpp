@@ -24,6 +24,11 @@ struct Settings {
   std::chrono::milliseconds tick = DashboardDelivery::kDefaultTick;
 };
 
+/// What is no address stands for all ones, to which nothing can be connected.
+IPv4Endpoint serverAt(std::string_view ip, std::uint16_t port) {
+  return IPv4Endpoint::parse(ip, port).value_or(IPv4Endpoint{0xFFFF'FFFF, port});
+}
+
 std::chrono::milliseconds tickFrom(std::int64_t reliable) {
   if (reliable > 0 && reliable <= kLongestTick) return std::chrono::milliseconds(reliable);
   VESK_LOG_WARNING("DashboardBackend(initWithName): 'reliable' can't be %lld ms, using %d ms",
@@ -35,8 +40,7 @@ std::chrono::milliseconds tickFrom(std::int64_t reliable) {
 /// Nothing, and a line, when the server can't be told.
 std::optional<Settings> settingsFrom(const std::string& name, const Dictionary& profile) {
   auto ip = profileText(name, profile, "ip");
-  auto server = ip ? IPv4Endpoint::parse(*ip, 0) : std::nullopt;
-  if (!server) {
+  if (!ip) {
     VESK_LOG_ERROR("DashboardBackend(initWithName): can't resolve server IP");
     return std::nullopt;
   }
@@ -45,9 +49,8 @@ std::optional<Settings> settingsFrom(const std::string& name, const Dictionary& 
     VESK_LOG_ERROR("DashboardBackend(initWithName): can't resolve server port");
     return std::nullopt;
   }
-  server->port = static_cast<std::uint16_t>(*port);
   auto reliable = profileIntegerOrNumericText(name, profile, "reliable");
-  return Settings{*server, reliable.has_value(),
+  return Settings{serverAt(*ip, static_cast<std::uint16_t>(*port)), reliable.has_value(),
                   reliable ? tickFrom(*reliable) : DashboardDelivery::kDefaultTick};
 }
 
@@ -56,12 +59,7 @@ std::optional<Settings> settingsFrom(const std::optional<std::string>& serverIP,
     VESK_LOG_ERROR("DashboardBackend(initWithName): initWitName with all null params.");
     return std::nullopt;
   }
-  auto server = IPv4Endpoint::parse(*serverIP, serverPort);
-  if (!server) {
-    VESK_LOG_ERROR("DashboardBackend(initWithName): can't resolve server IP");
-    return std::nullopt;
-  }
-  return Settings{*server};
+  return Settings{serverAt(*serverIP, serverPort)};
 }
 
 std::shared_ptr<TimedQueue> networkQueue(const BackendServices& services) {
