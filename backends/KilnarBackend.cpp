@@ -15,8 +15,8 @@ std::shared_ptr<KilnarBackend> KilnarBackend::create(const std::string& name,
                                                      const std::optional<Dictionary>& profile,
                                                      const std::optional<Text>& productFamily,
                                                      const BackendServices& services) {
-  if (!profile || !productFamily) return nullptr;
-  return std::shared_ptr<KilnarBackend>(new KilnarBackend(name, *profile, *productFamily, services));
+  return std::shared_ptr<KilnarBackend>(
+      new KilnarBackend(name, profile.value_or(Dictionary()), productFamily.value_or(Text()), services));
 }
 
 std::optional<std::string> KilnarBackend::sendMessageLocked(const std::optional<Dictionary>& payload,

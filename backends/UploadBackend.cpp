@@ -38,8 +38,8 @@ std::shared_ptr<UploadBackend> UploadBackend::create(const std::string& name,
     VESK_LOG_ERROR("UploadBackend(initWithName): can't resolve upload post URL.");
     return nullptr;
   }
-  if (!productFamily) return nullptr;
-  std::shared_ptr<UploadBackend> backend(new UploadBackend(name, *profile, *productFamily, services));
+  std::shared_ptr<UploadBackend> backend(
+      new UploadBackend(name, *profile, productFamily.value_or(Text()), services));
   MutexLock lock(backend->_mutex);
   backend->_uploadURL = postURL;
   backend->_displayURL = profileText(name, *profile, "display_url");

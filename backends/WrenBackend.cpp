@@ -48,15 +48,14 @@ std::shared_ptr<WrenBackend> WrenBackend::create(const std::string& name,
                                                  const std::optional<Dictionary>& profile,
                                                  const std::optional<Text>& productFamily,
                                                  std::int32_t clientType, const BackendServices& services) {
-  if (!profile || !productFamily) return nullptr;
   VESK_LOG_INFO("WrenBackend(initWithName): Loading Wren adaptor class for client type %d", clientType);
   auto bundle = bundleForClientType(clientType);
   if (!bundle) {
     VESK_LOG_ERROR("WrenBackend(initWithName): No matching bundle found for client type %d", clientType);
     return nullptr;
   }
-  return std::shared_ptr<WrenBackend>(
-      new WrenBackend(name, *profile, *productFamily, services, std::move(*bundle)));
+  return std::shared_ptr<WrenBackend>(new WrenBackend(
+      name, profile.value_or(Dictionary()), productFamily.value_or(Text()), services, std::move(*bundle)));
 }
 
 std::shared_ptr<WrenBackend> WrenBackend::create(const std::string& name,

@@ -43,7 +43,7 @@ class AdaptorTest : public testing::Test {
   ~AdaptorTest() override { setRootPrefix(""); }
 
   std::shared_ptr<VeskReportingBackend> make(std::int32_t clientType = 7) {
-    return VeskReportingBackend::newBackendWithName("wren", Dictionary(), Text("Phone"), clientType,
+    return VeskReportingBackend::newBackendWithName("wren", std::nullopt, std::nullopt, clientType,
                                                     harness.services);
   }
   void send(VeskReportingBackend& backend, const std::optional<Dictionary>& payload,

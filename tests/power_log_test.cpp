@@ -55,7 +55,7 @@ TEST_F(PowerLogTest, TheBackendRecordsMessagesThatHaveMethodAndPayload) {
   BackendHarness harness;
   harness.services.powerLog = std::make_shared<PowerLog>(options());
   auto backend =
-      VeskReportingBackend::newBackendWithName("kilnar", Dictionary(), Text("Phone"), 5, harness.services);
+      VeskReportingBackend::newBackendWithName("kilnar", std::nullopt, std::nullopt, 5, harness.services);
   ASSERT_TRUE(backend);
   auto send = [&](std::uint16_t method, const std::optional<Dictionary>& payload) {
     EXPECT_EQ(backend->sendMessage(payload, timeval{}, method, 200, 0), std::nullopt);

@@ -40,7 +40,7 @@ class UploadTest : public testing::Test {
 
   std::shared_ptr<VeskReportingBackend> make(const std::string& url) {
     auto made = VeskReportingBackend::newBackendWithName(
-        "uploadServer", Dictionary{{"post_url", url}, {"display_url", "https://show"}}, Text("Phone"), 5,
+        "uploadServer", Dictionary{{"post_url", url}, {"display_url", "https://show"}}, std::nullopt, 5,
         services);
     made->setUdid("udid");
     made->setSessionID(4'000'000'000);
