@@ -12,12 +12,14 @@ void require(bool condition) {
   if (!condition) std::abort();
 }
 
-void roundTrip(const Value& value, const std::optional<std::string>& written, PropertyListFlavor flavor) {
+/// NaN is unlike itself, and XML cuts dates to seconds: what counts is what is shown, of the first so many
+/// bytes.
+void roundTrip(const Value& value, const std::optional<std::string>& written, PropertyListFlavor flavor,
+               std::size_t shown) {
   if (!written || written->size() > PropertyListLimits{}.bytes) return;
   const auto again = parsePropertyList(*written, flavor);
   require(again.value.has_value());
-  // NaN is unlike itself, and XML cuts dates to seconds: what counts is that both show the same shape.
-  require(describe(*again.value, 64).substr(0, 1) == describe(value, 64).substr(0, 1));
+  require(describe(*again.value, shown).substr(0, shown) == describe(value, shown).substr(0, shown));
 }
 
 }  // namespace
@@ -30,8 +32,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     if (!outcome.value) continue;
     const auto binary = writeBinaryPropertyList(*outcome.value, flavor);
     require(binary.has_value());
-    roundTrip(*outcome.value, binary, flavor);
-    roundTrip(*outcome.value, writeXMLPropertyList(*outcome.value), PropertyListFlavor::Plain);
+    roundTrip(*outcome.value, binary, flavor, std::size_t{1} << 20);
+    roundTrip(*outcome.value, writeXMLPropertyList(*outcome.value), PropertyListFlavor::Plain, 1);
   }
   return 0;
 }

@@ -51,11 +51,15 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   if (!outcome.value) return 0;
   const Value profile = withoutAddresses(*outcome.value);
   if (!profile.dictionary()) return 0;
-  for (const char* name : {"httpPost", "httpPost2"}) {
-    auto backend = VeskReportingBackend::newBackendWithName(name, *profile.dictionary(), Text("Phone"), 5,
-                                                            shared.services);
+  for (bool knowsUser : {false, true}) {
+    auto backend = VeskReportingBackend::newBackendWithName("httpPost", *profile.dictionary(), Text("Phone"),
+                                                            5, shared.services);
     if (!backend) continue;
     backend->setCompType(5);
+    if (knowsUser) {
+      backend->setRequireUserInfo(true);
+      backend->setUserInfoDict(Dictionary{{"clientName", "Camera"}, {"serviceName", "Clips"}});
+    }
     backend->updateState();
     timeval now{1'700'000'000, 250'000};
     for (std::uint16_t i = 0; i < 4; ++i) {

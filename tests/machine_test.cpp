@@ -69,7 +69,7 @@ const DiskCase kDiskCases[] = {
      [](const DaemonHarness&, SmallDisk* disk) { disk->makeReadOnly(); }, true,
      "writeToLogFile: Failed to create new veskreportingd log file"},
     {"no room for the log", kLogs, [](const DaemonHarness&, SmallDisk* disk) { disk->fill(); }, true,
-     "writeToLogFile: "},
+     "writeToLogFile: Deleted expired veskreportingd log file"},
     {"the identifiers can't be kept", kState,
      [](const DaemonHarness&, SmallDisk* disk) { disk->makeReadOnly(); }, true, "cannot keep identifiers in"},
     {"no room for the identifiers", kState, [](const DaemonHarness&, SmallDisk* disk) { disk->fill(); }, true,

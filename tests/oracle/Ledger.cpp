@@ -87,7 +87,17 @@ bool Ledger::judge(std::uint64_t incarnation, const Account& account) const {
 
 bool Ledger::judge() const {
   bool isGood = _changed.empty();
-  for (const auto& [incarnation, account] : _accounts) isGood = judge(incarnation, account) && isGood;
+  std::size_t accepted = 0;
+  std::size_t afterwards = 0;
+  for (const auto& [incarnation, account] : _accounts) {
+    isGood = judge(incarnation, account) && isGood;
+    accepted += account.accepted.size();
+    if (incarnation != _accounts.begin()->first) afterwards += account.accepted.size();
+  }
+  if (accepted == 0 || (_accounts.size() > 1 && afterwards == 0)) {
+    std::printf("oracle: NOTHING was accepted%s\n", accepted == 0 ? "" : " after the first daemon's end");
+    isGood = false;
+  }
   std::printf("oracle: %zu messages arrived, %" PRIu64 " of them more than once, %zu changed\n",
               _arrived.size(), _again, _changed.size());
   if (!_changed.empty()) std::printf("oracle: CHANGED: %s\n", _changed.front().c_str());

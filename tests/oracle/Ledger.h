@@ -38,7 +38,8 @@ class Ledger {
   void readEvents(const std::string& path);
   bool hasArrived(std::int64_t id) const { return _arrived.contains(id); }
 
-  /// Prints the accounts. True when every daemon's losses are covered and nothing was changed.
+  /// Prints the accounts. True when every daemon's losses are covered, nothing was changed, and messages were
+  /// accepted at all, also by those who came back after a restart.
   bool judge() const;
 
  private:

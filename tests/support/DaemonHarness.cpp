@@ -76,6 +76,13 @@ void DaemonHarness::startCollector(std::vector<std::string> arguments) {
   _facts = boost::json::parse(root.read("ready")).as_object();
 }
 
+void DaemonHarness::stopCollector() {
+  if (!_collector) return;
+  _collector->signal(SIGTERM);
+  (void)_collector->wait();
+  _collector.reset();
+}
+
 void DaemonHarness::startDaemon(std::vector<std::string> arguments) {
   launchDaemon(std::move(arguments));
   if (!_daemon->waitForText("start loop.")) throw std::runtime_error("no daemon: " + _daemon->errors());

@@ -27,7 +27,8 @@ class DaemonHarness {
 
   /// Again on the same ports, after `stopCollector`.
   void startCollector(std::vector<std::string> arguments = {});
-  void stopCollector() { _collector.reset(); }
+  /// In order: an event that it has saved is saved whole.
+  void stopCollector();
   /// Waits until clients are accepted.
   void startDaemon(std::vector<std::string> arguments = {});
   /// The same without waiting.
