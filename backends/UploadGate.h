@@ -4,8 +4,8 @@
 #include <chrono>
 #include <condition_variable>
 #include <cstddef>
-#include <memory>
 #include <optional>
+#include <utility>
 
 #include "platform/http/HTTPClient.h"
 #include "platform/sync/Mutex.h"
@@ -49,18 +49,21 @@ class UploadGate {
   /// or the gate is closed.
   [[nodiscard]] std::optional<Pass> enter(std::size_t bytes);
 
-  /// Sends the request and waits for its end, or until the gate is closed, which gives an error `Stopped`.
-  HTTPResult perform(HTTPClient& http, HTTPRequest request);
+  /// Sends the request and waits for its end, which comes at once when the client no longer serves uploads.
+  static HTTPResult perform(HTTPClient& http, HTTPRequest request);
 
-  /// Nobody is let in or waits any more: the daemon stops.
+  /// Nobody is let in or waits for that any more: the daemon stops.
   void close();
 
  private:
-  struct State;
   void leave(std::size_t uploads, std::size_t bytes);
 
   const Limits _limits;
-  const std::shared_ptr<State> _state;  ///< shared with completions, which may come when the gate is gone
+  Mutex _mutex;
+  std::condition_variable_any _changed;
+  std::size_t _uploads VESK_GUARDED_BY(_mutex) = 0;
+  std::size_t _bytes VESK_GUARDED_BY(_mutex) = 0;
+  bool _closed VESK_GUARDED_BY(_mutex) = false;
 };
 
 }  // namespace vesk

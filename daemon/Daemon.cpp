@@ -106,7 +106,8 @@ void Daemon::resume() { _parts->listener.resume(); }
 
 bool Daemon::stop() {
   if (std::exchange(_stopped, true)) return !_parts;
-  // A server that does not answer must not hold up the threads of connections that upload to it.
+  // A server that does not answer must not hold up the threads of connections that wait for it.
+  _parts->http.stopAllButPosts();
   _parts->backendServices.uploads->close();
   const bool haveEnded = _parts->listener.stopWithin(kSessionWait);
   if (!haveEnded) {

@@ -305,5 +305,26 @@ TEST(HTTPClient, ItsEndFailsWhatIsOutstandingAtOnce) {
   EXPECT_EQ(kinds, std::vector<Kind>(24, Kind::Stopped));
 }
 
+TEST(HTTPClient, StopsAllButPosts) {
+  RecordingServer server([](const HTTPReceived& received, std::size_t) {
+    return received.method == "POST" ? HTTPAnswer::text(200, "ok") : faulty(Fault::Stall);
+  });
+  HTTPClient client(HTTPClient::Options{.maximumConnectionsPerHost = 2});
+  std::vector<Kind> kinds;
+  auto note = [&](const HTTPResult& result) { kinds.push_back(result.error->kind); };
+  for (int i = 0; i < 3; ++i) client.start(fetchFrom(server.url()), note);  // one waits for a connection
+  waitFor([&] { return server.count() == 2; });
+  bool posted = false;
+  client.start(postTo(server.url()), [&](const HTTPResult& result) { posted = result.response.has_value(); });
+  client.stopAllButPosts();
+  client.start(fetchFrom(server.url()), note);
+  ASSERT_TRUE(client.waitUntilIdle(30s));  // a fetch itself has a minute
+  EXPECT_EQ(kinds, std::vector<Kind>(4, Kind::Stopped));
+  EXPECT_TRUE(posted);
+  HTTPClient unused;
+  unused.stopAllButPosts();
+  EXPECT_EQ(unused.perform(fetchFrom(server.url())).error->kind, Kind::Stopped);
+}
+
 }  // namespace
 }  // namespace vesk::test

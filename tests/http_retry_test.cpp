@@ -46,7 +46,11 @@ class Schedule : public testing::Test {
     request.body = std::string(size, 'x');
     request.retry = retry;
     return std::make_unique<HTTPExchange>(
-        std::move(request), [](const HTTPResult&) {}, now);
+        std::move(request),
+        [this, name](const HTTPResult& result) {
+          if (result.error) givenUpNames += name;
+        },
+        now, outstanding);
   }
   HTTPSchedule::Exchange post(const std::string& name, std::size_t size = 10,
                               const std::string& host = "https://a") {
@@ -64,19 +68,14 @@ class Schedule : public testing::Test {
     }
     return names;
   }
-  std::string givenUp() {
-    std::string names;
-    for (auto& [exchange, error] : schedule().takeGivenUp()) {
-      names += exchange->request.url.substr(exchange->request.url.rfind('/') + 1);
-    }
-    return names;
-  }
+  std::string givenUp() { return std::exchange(givenUpNames, ""); }
   void failFirst() {
     schedule().failed(std::move(active.front()), {HTTPError::Kind::Connect, "down"}, true, now);
     active.erase(active.begin());
   }
   void answerFirst() {
     schedule().answered(*active.front());
+    active.front()->complete({HTTPResponse(), std::nullopt});
     active.erase(active.begin());
   }
   HTTPSchedule& schedule() {
@@ -84,6 +83,8 @@ class Schedule : public testing::Test {
     return *_schedule;
   }
 
+  std::string givenUpNames;
+  HTTPOutstanding outstanding;
   HTTPClient::Options options;
   Instant now{Instant{} + 1h};
   std::vector<HTTPSchedule::Exchange> active;
@@ -166,8 +167,12 @@ TEST_F(Schedule, AFetchThatFindsNoConnectionInTimeIsGivenUp) {
 TEST(HTTPExchange, ItsCompletionRunsEvenWhenNobodyEndsIt) {
   std::vector<HTTPError::Kind> kinds;
   auto note = [&](const HTTPResult& result) { kinds.push_back(result.error->kind); };
-  std::make_unique<HTTPExchange>(HTTPRequest{}, note, Instant{}).reset();
+  HTTPOutstanding outstanding;
+  auto exchange = std::make_unique<HTTPExchange>(HTTPRequest{}, note, Instant{}, outstanding);
+  EXPECT_FALSE(outstanding.waitUntilNone(0ms));
+  exchange.reset();
   EXPECT_EQ(kinds, std::vector{HTTPError::Kind::Other});
+  EXPECT_TRUE(outstanding.waitUntilNone(0ms));
 }
 
 }  // namespace

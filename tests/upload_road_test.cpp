@@ -157,6 +157,23 @@ TEST_F(UploadRoad, AServerThatHangsStopsNeitherOtherSessionsNorTheEnd) {
   EXPECT_TRUE(fs::exists(path));
 }
 
+TEST_F(UploadRoad, AStorebagServerThatHangsDoesNotHoldUpTheEnd) {
+  ASSERT_EQ(harness.stopDaemon(), 0);
+  harness.startDaemon({"--log-level", "7"});
+  harness.setFault("storebag=stall");
+  std::vector<std::future<void>> clients;
+  for (int type : {5, 6, 8}) {
+    clients.push_back(std::async(std::launch::async, [&, type] {
+      VeskReporting client(harness.clientOptions());
+      (void)client.setSessionInfo(Dictionary{{kVeskReportingSessionInfoClientType, type}});
+      (void)client.startConfig(ChildProcess::kPatience);
+    }));
+  }
+  ASSERT_TRUE(harness.daemon().waitForText("Retrieving storebag for session", 3));
+  EXPECT_EQ(harness.stopDaemon(), 0);
+  EXPECT_TRUE(harness.daemon().waitForText("sendSynchronousRequest error the client was stopped", 3));
+}
+
 #if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
 TEST_F(UploadRoad, TakesNoMoreMemoryThanTheFileAndItsCompressedForm) {
   RoadClient client(harness);

@@ -238,6 +238,7 @@ TEST_F(UploadTest, AServerThatHangsHoldsUpNobodyElse) {
   backend->updateState();  // these wait for the backend's own mutex
   backend->setUserInfoDict(std::nullopt);
   EXPECT_EQ(backend->state(), BackendStateEnabled);
+  services.http.stopAllButPosts();
   services.uploads->close();
   EXPECT_TRUE(uploaded.get()) << "it was sent";
   EXPECT_EQ(log.count(3, "UploadBackend(uploadFileAtPath): post the daemon stops"), 1);

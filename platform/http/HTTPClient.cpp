@@ -2,6 +2,8 @@
 
 #include <algorithm>
 #include <cstdlib>
+#include <exception>
+#include <new>
 #include <semaphore>
 
 #include "platform/http/HTTPExchange.h"
@@ -45,20 +47,22 @@ HTTPClient::Worker* HTTPClient::worker() {
 
 HTTPClient::Worker& HTTPClient::startedWorker() {
   MutexLock lock(_mutex);
-  if (!_worker) _worker = std::make_unique<Worker>(_options, _authorities);
+  if (!_worker) _worker = std::make_unique<Worker>(_options, _authorities, _postsOnly);
   return *_worker;
 }
 
 void HTTPClient::start(HTTPRequest request, Completion completion) {
   removeUnsafeHeaders(request);
-  Worker* worker = nullptr;
+  HTTPError problem;
   try {
-    worker = &startedWorker();
-  } catch (const std::exception& error) {
-    completion({std::nullopt, HTTPError{HTTPError::Kind::Other, error.what()}});
+    startedWorker().start(std::move(request), std::move(completion));
     return;
+  } catch (const std::bad_alloc&) {
+    problem = outOfMemory();
+  } catch (const std::exception& error) {
+    problem = httpError(HTTPError::Kind::Other, error.what());
   }
-  worker->start(std::move(request), std::move(completion));
+  runCompletion(std::move(completion), {std::nullopt, std::move(problem)});
 }
 
 HTTPResult HTTPClient::perform(HTTPRequest request) {
@@ -67,13 +71,26 @@ HTTPResult HTTPClient::perform(HTTPRequest request) {
     HTTPResult result;
     std::binary_semaphore done{0};
   };
-  auto call = std::make_shared<Call>();
-  start(std::move(request), [call](const HTTPResult& result) {
-    call->result = result;
-    call->done.release();
-  });
+  std::shared_ptr<Call> call;
+  Completion completion;
+  try {
+    call = std::make_shared<Call>();
+    // Nothing here can fail, so that whoever waits is always let go.
+    completion = [call](HTTPResult result) noexcept {
+      call->result = std::move(result);
+      call->done.release();
+    };
+  } catch (const std::bad_alloc&) {
+    return {std::nullopt, outOfMemory()};
+  }
+  start(std::move(request), std::move(completion));
   call->done.acquire();
   return std::move(call->result);
+}
+
+void HTTPClient::stopAllButPosts() {
+  _postsOnly = true;
+  if (Worker* started = worker()) started->wake();
 }
 
 bool HTTPClient::waitUntilIdle(std::chrono::milliseconds timeout) {

@@ -1,6 +1,7 @@
 // The process's HTTP client: one shared connection pool, one thread of its own.
 #pragma once
 
+#include <atomic>
 #include <chrono>
 #include <cstddef>
 #include <functional>
@@ -54,6 +55,7 @@ struct HTTPError {
     Interrupted,
     BadURL,
     TooLarge,
+    OutOfMemory,
     Stopped,
     Other
   };
@@ -71,9 +73,9 @@ struct HTTPResult {
 /// the file named by SSL_CERT_FILE. Redirects are not followed; no response is cached.
 class HTTPClient {
  public:
-  /// Runs once per request, on the client's thread; must neither block nor throw. What it captured is
-  /// destroyed on that thread right after it ran.
-  using Completion = std::function<void(const HTTPResult&)>;
+  /// Runs once per request, on the client's thread; must neither block nor throw. The result is its own, to
+  /// be moved from. What it captured is destroyed on that thread right after it ran.
+  using Completion = std::function<void(HTTPResult)>;
 
   struct Options {
     std::string userAgent = "veskreportingd";
@@ -99,11 +101,16 @@ class HTTPClient {
   HTTPClient& operator=(const HTTPClient&) = delete;
 
   /// Returns at once. Posts to one host are sent in the order of the calls as far as connections allow. When
-  /// the thread can not be started, the completion runs within this call.
+  /// the thread can not be started or there is no memory for the request, the completion runs within this
+  /// call.
   void start(HTTPRequest request, Completion completion);
 
   /// Starts the request and blocks until it is completed. Not to be called from a completion.
   HTTPResult perform(HTTPRequest request);
+
+  /// From now on fails at once, with `Stopped`, what is not to be retried, be it under way, waiting or new: a
+  /// server that hangs no longer holds up those who wait for it. Posts go on. Returns at once.
+  void stopAllButPosts();
 
   /// Waits until nothing is outstanding, at most `timeout`; true when nothing was left.
   [[nodiscard]] bool waitUntilIdle(std::chrono::milliseconds timeout);
@@ -115,6 +122,7 @@ class HTTPClient {
 
   const Options _options;
   const std::optional<std::string> _authorities;
+  std::atomic<bool> _postsOnly{false};
   Mutex _mutex;
   std::unique_ptr<Worker> _worker VESK_GUARDED_BY(_mutex);
 };

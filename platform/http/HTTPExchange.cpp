@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <exception>
+#include <new>
 #include <string>
 
 #include "platform/log/SystemLog.h"
@@ -28,8 +29,37 @@ bool isSafe(const std::pair<std::string, std::string>& header) {
 
 }  // namespace
 
+void HTTPOutstanding::add() noexcept {
+  MutexLock lock(_mutex);
+  ++_count;
+}
+
+void HTTPOutstanding::remove() noexcept {
+  MutexLock lock(_mutex);
+  if (--_count == 0) _becameNone.notify_all();
+}
+
+bool HTTPOutstanding::waitUntilNone(std::chrono::milliseconds timeout) {
+  const auto deadline = std::chrono::steady_clock::now() + timeout;
+  MutexLock lock(_mutex);
+  while (_count > 0) {
+    if (_becameNone.wait_until(_mutex, deadline) == std::cv_status::timeout) return _count == 0;
+  }
+  return true;
+}
+
+HTTPExchange::HTTPExchange(HTTPRequest&& wanted, HTTPClient::Completion&& completion, Instant now,
+                           HTTPOutstanding& outstanding) noexcept
+    : request(std::move(wanted)),
+      started(now),
+      _completion(std::move(completion)),
+      _outstanding(outstanding) {
+  _outstanding.add();
+}
+
 HTTPExchange::~HTTPExchange() {
-  if (_completion) fail({HTTPError::Kind::Other, "the client could not take the request"});
+  if (_completion) fail(httpError(HTTPError::Kind::Other, "the client could not take the request"));
+  _outstanding.remove();
 }
 
 std::string_view HTTPExchange::host() const noexcept {
@@ -39,16 +69,25 @@ std::string_view HTTPExchange::host() const noexcept {
   return url.substr(0, url.find_first_of("/?#", scheme + 3));
 }
 
-void HTTPExchange::complete(const HTTPResult& result) noexcept {
-  // What it captured is destroyed with it, here.
-  auto completion = std::exchange(_completion, nullptr);
-  if (!completion) return;
+void HTTPExchange::complete(HTTPResult result) noexcept {
+  if (_completion) runCompletion(std::exchange(_completion, nullptr), std::move(result));
+}
+
+void runCompletion(HTTPClient::Completion completion, HTTPResult result) noexcept {
   try {
-    completion(result);
+    completion(std::move(result));
   } catch (const std::exception& error) {
     VESK_LOG_ERROR("HTTPClient: a completion failed: %s", error.what());
   } catch (...) {
     VESK_LOG_ERROR("HTTPClient: a completion failed");
+  }
+}
+
+HTTPError httpError(HTTPError::Kind kind, std::string_view description) noexcept {
+  try {
+    return {kind, std::string(description)};
+  } catch (const std::bad_alloc&) {
+    return {kind, "out of memory"};  // so short that it lies in the string itself
   }
 }
 

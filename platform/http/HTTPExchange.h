@@ -2,13 +2,30 @@
 #pragma once
 
 #include <chrono>
+#include <condition_variable>
 #include <cstddef>
+#include <memory>
 #include <string_view>
 #include <utility>
 
 #include "platform/http/HTTPClient.h"
+#include "platform/sync/Mutex.h"
 
 namespace vesk {
+
+/// How many exchanges there are. Thread-safe.
+class HTTPOutstanding {
+ public:
+  void add() noexcept;
+  void remove() noexcept;
+  /// At most `timeout`; true when there are none.
+  bool waitUntilNone(std::chrono::milliseconds timeout);
+
+ private:
+  Mutex _mutex;
+  std::condition_variable_any _becameNone;
+  std::size_t _count VESK_GUARDED_BY(_mutex) = 0;
+};
 
 /// Owned by whoever has it in hand: the client's inbox, the schedule or a transfer. Its completion runs
 /// exactly once: when nobody else did it, the destructor does, so that no caller waits for ever.
@@ -16,8 +33,9 @@ class HTTPExchange {
  public:
   using Instant = std::chrono::steady_clock::time_point;
 
-  HTTPExchange(HTTPRequest wanted, HTTPClient::Completion completion, Instant now)
-      : request(std::move(wanted)), started(now), _completion(std::move(completion)) {}
+  /// Counts among `outstanding`, which must outlive it, until what its completion captured is gone.
+  HTTPExchange(HTTPRequest&& wanted, HTTPClient::Completion&& completion, Instant now,
+               HTTPOutstanding& outstanding) noexcept;
   ~HTTPExchange();
   HTTPExchange(const HTTPExchange&) = delete;
   HTTPExchange& operator=(const HTTPExchange&) = delete;
@@ -30,17 +48,27 @@ class HTTPExchange {
   /// Memory that it holds while it waits, roughly.
   std::size_t cost() const noexcept { return request.body.size() + 1024; }
 
-  void complete(const HTTPResult& result) noexcept;
+  void complete(HTTPResult result) noexcept;
   void fail(HTTPError error) noexcept { complete(HTTPResult{std::nullopt, std::move(error)}); }
 
   HTTPRequest request;
   const Instant started;
   Instant firstAttempt{};  ///< once `attempts` is not 0
   unsigned attempts = 0;
+  std::unique_ptr<HTTPExchange> next;  ///< in the queue that it is in
 
  private:
   HTTPClient::Completion _completion;
+  HTTPOutstanding& _outstanding;
 };
+
+/// Runs it and destroys what it captured; logs what it throws.
+void runCompletion(HTTPClient::Completion completion, HTTPResult result) noexcept;
+
+/// An error that can be made when there is no memory for its description, too: it has a short one then.
+HTTPError httpError(HTTPError::Kind kind, std::string_view description) noexcept;
+inline HTTPError outOfMemory() noexcept { return httpError(HTTPError::Kind::OutOfMemory, "out of memory"); }
+inline HTTPError stopped() noexcept { return httpError(HTTPError::Kind::Stopped, "the client was stopped"); }
 
 /// Takes out, with a line in the log, every header that could break the request apart.
 void removeUnsafeHeaders(HTTPRequest& request);

@@ -1,6 +1,7 @@
 #include "platform/http/HTTPSchedule.h"
 
 #include <algorithm>
+#include <new>
 #include <utility>
 
 #include "platform/log/SystemLog.h"
@@ -9,6 +10,12 @@ namespace vesk {
 
 namespace {
 constexpr std::chrono::seconds kLongestWait{10};
+
+/// Whether a post to the same host would fail likewise.
+bool isOfTheHost(const HTTPError& error) {
+  using Kind = HTTPError::Kind;
+  return error.kind != Kind::BadURL && error.kind != Kind::OutOfMemory;
+}
 }  // namespace
 
 HTTPSchedule::HTTPSchedule(const HTTPClient::Options& options)
@@ -18,24 +25,23 @@ HTTPSchedule::HTTPSchedule(const HTTPClient::Options& options)
       _maximumActivePosts(std::max<std::size_t>(_maximumActive - 1, 1)),
       _random(std::random_device{}()) {}
 
-void HTTPSchedule::add(Exchange exchange) {
-  Host& host = hostOf(*exchange);
-  if (!exchange->isPost()) {
-    host.requests.push_back(std::move(exchange));
-    return;
-  }
-  if (host.outage && waiting() + exchange->request.body.size() > _policy.maximumWaiting) {
-    giveUp(std::move(exchange), *host.outage);
+void HTTPSchedule::add(Exchange exchange) noexcept {
+  Host* host = hostFor(*exchange);
+  if (!host) {
+    exchange->fail(outOfMemory());
+  } else if (!exchange->isPost()) {
+    host->requests.pushBack(std::move(exchange));
+  } else if (host->outage && waiting() + exchange->request.body.size() > _policy.maximumWaiting) {
+    exchange->fail(httpError(host->outage->kind, host->outage->description));
   } else if (_queuedCost + exchange->cost() > _maximumQueued) {
-    auto name = std::string(exchange->host());
-    giveUp(std::move(exchange), {HTTPError::Kind::Other, "too many posts wait to be sent"});
-    forgetIfUnused(name);
+    forgetIfUnused(exchange->host());
+    exchange->fail(httpError(HTTPError::Kind::Other, "too many posts wait to be sent"));
   } else {
-    queuePost(host, std::move(exchange), false);
+    queuePost(*host, std::move(exchange), false);
   }
 }
 
-void HTTPSchedule::advance(Instant now) {
+void HTTPSchedule::advance(Instant now) noexcept {
   while (!_retries.empty() && _retries.begin()->first <= now) {
     auto exchange = std::move(_retries.extract(_retries.begin()).mapped());
     _retryBytes -= exchange->request.body.size();
@@ -44,27 +50,27 @@ void HTTPSchedule::advance(Instant now) {
     queuePost(host, std::move(exchange), true);
   }
   for (auto& [name, host] : _hosts) {
-    for (auto& request : host.requests) {
-      if (request->deadline() > now) continue;
-      giveUp(std::move(request), {HTTPError::Kind::Timeout, "timed out before a connection was free"});
+    HTTPQueue inTime;
+    while (auto request = host.requests.pop()) {
+      if (request->deadline() > now) {
+        inTime.pushBack(std::move(request));
+      } else {
+        request->fail(httpError(HTTPError::Kind::Timeout, "timed out before a connection was free"));
+      }
     }
-    std::erase(host.requests, nullptr);
+    host.requests.swap(inTime);
   }
 }
 
-HTTPSchedule::Exchange HTTPSchedule::next(Instant now) {
+HTTPSchedule::Exchange HTTPSchedule::next(Instant now) noexcept {
   for (auto& [name, host] : _hosts) {
     if (host.active >= _maximumActive) continue;
-    Exchange exchange;
-    if (!host.requests.empty()) {
-      exchange = std::move(host.requests.front());
-      host.requests.pop_front();
-    } else if (!host.posts.empty() && host.activePosts < _maximumActivePosts) {
+    Exchange exchange = host.requests.pop();
+    if (!exchange && !host.posts.empty() && host.activePosts < _maximumActivePosts) {
       exchange = takePost(host);
       ++host.activePosts;
-    } else {
-      continue;
     }
+    if (!exchange) continue;
     ++host.active;
     if (exchange->attempts++ == 0) exchange->firstAttempt = now;
     return exchange;
@@ -72,7 +78,7 @@ HTTPSchedule::Exchange HTTPSchedule::next(Instant now) {
   return nullptr;
 }
 
-void HTTPSchedule::answered(const HTTPExchange& exchange) {
+void HTTPSchedule::answered(const HTTPExchange& exchange) noexcept {
   Host& host = hostOf(exchange);
   if (host.outage) {
     VESK_LOG_INFO("HTTPClient: %.*s answers again", static_cast<int>(exchange.host().size()),
@@ -82,74 +88,65 @@ void HTTPSchedule::answered(const HTTPExchange& exchange) {
   release(host, exchange);
 }
 
-void HTTPSchedule::failed(Exchange exchange, HTTPError error, bool mayRetry, Instant now) {
+void HTTPSchedule::failed(Exchange exchange, HTTPError error, bool mayRetry, Instant now) noexcept {
   Host& host = hostOf(*exchange);
-  if (exchange->isPost() && error.kind != HTTPError::Kind::BadURL) {
-    if (!host.outage) {
-      VESK_LOG_INFO("HTTPClient: no answer from %.*s: %s", static_cast<int>(exchange->host().size()),
-                    exchange->host().data(), error.description.c_str());
-    }
-    host.outage = error;
-    giveUpOverdue(host, error, now);
-  }
-  std::optional<RetryPolicy::Duration> wait;
-  std::size_t size = exchange->request.body.size();
-  if (mayRetry && exchange->isPost()) {
-    double random = std::uniform_real_distribution<double>()(_random);
-    wait = _policy.waitAfter(exchange->attempts, exchange->firstAttempt, now, waiting() + size, random);
-  }
-  if (wait) ++host.retrying;
+  if (exchange->isPost() && isOfTheHost(error)) beginOutage(host, *exchange, error, now);
+  if (mayRetry && exchange->isPost() && keepForRetry(host, exchange, now)) return;
   release(host, *exchange);
-  if (wait) {
-    _retryBytes += size;
-    _retries.emplace(now + *wait, std::move(exchange));
-  } else {
-    giveUp(std::move(exchange), std::move(error));
+  exchange->fail(std::move(error));
+}
+
+void HTTPSchedule::stopAllButPosts() noexcept {
+  for (auto& [name, host] : _hosts) {
+    while (auto request = host.requests.pop()) request->fail(stopped());
   }
 }
 
-std::vector<HTTPSchedule::GivenUp> HTTPSchedule::takeGivenUp() { return std::exchange(_givenUp, {}); }
-
-std::vector<HTTPSchedule::Exchange> HTTPSchedule::takeAll() {
-  std::vector<Exchange> all;
+void HTTPSchedule::stopAll() noexcept {
+  stopAllButPosts();
   for (auto& [name, host] : _hosts) {
-    for (auto& exchange : host.requests) all.push_back(std::move(exchange));
-    for (auto& exchange : host.posts) all.push_back(std::move(exchange));
+    while (auto post = host.posts.pop()) post->fail(stopped());
   }
-  for (auto& [time, exchange] : _retries) all.push_back(std::move(exchange));
-  for (auto& entry : _givenUp) all.push_back(std::move(entry.exchange));
+  for (auto& [time, post] : _retries) post->fail(stopped());
   _hosts.clear();
   _retries.clear();
-  _givenUp.clear();
   _retryBytes = _queuedCost = 0;
-  return all;
 }
 
-std::optional<HTTPSchedule::Instant> HTTPSchedule::nextAdvance() const {
+std::optional<HTTPSchedule::Instant> HTTPSchedule::nextAdvance() const noexcept {
   std::optional<Instant> next;
   auto consider = [&next](Instant time) {
     if (!next || time < *next) next = time;
   };
   if (!_retries.empty()) consider(_retries.begin()->first);
   for (const auto& [name, host] : _hosts) {
-    for (const auto& request : host.requests) consider(request->deadline());
+    const HTTPExchange* request = host.requests.front();
+    for (; request; request = request->next.get()) consider(request->deadline());
   }
   return next;
 }
 
-HTTPSchedule::Host& HTTPSchedule::hostOf(const HTTPExchange& exchange) {
+HTTPSchedule::Host* HTTPSchedule::hostFor(const HTTPExchange& exchange) noexcept {
   auto found = _hosts.find(exchange.host());
-  if (found == _hosts.end()) found = _hosts.emplace(exchange.host(), Host{}).first;
-  return found->second;
+  if (found != _hosts.end()) return &found->second;
+  try {
+    return &_hosts.try_emplace(std::string(exchange.host())).first->second;
+  } catch (const std::bad_alloc&) {
+    return nullptr;
+  }
 }
 
-void HTTPSchedule::release(Host& host, const HTTPExchange& exchange) {
+HTTPSchedule::Host& HTTPSchedule::hostOf(const HTTPExchange& exchange) noexcept {
+  return _hosts.find(exchange.host())->second;
+}
+
+void HTTPSchedule::release(Host& host, const HTTPExchange& exchange) noexcept {
   --host.active;
   if (exchange.isPost()) --host.activePosts;
   forgetIfUnused(exchange.host());
 }
 
-void HTTPSchedule::forgetIfUnused(std::string_view name) {
+void HTTPSchedule::forgetIfUnused(std::string_view name) noexcept {
   auto found = _hosts.find(name);
   const Host& host = found->second;
   if (host.active == 0 && host.requests.empty() && host.posts.empty() && host.retrying == 0) {
@@ -157,36 +154,54 @@ void HTTPSchedule::forgetIfUnused(std::string_view name) {
   }
 }
 
-void HTTPSchedule::queuePost(Host& host, Exchange exchange, bool first) {
+void HTTPSchedule::queuePost(Host& host, Exchange exchange, bool first) noexcept {
   host.postBytes += exchange->request.body.size();
   _queuedCost += exchange->cost();
   if (first) {
-    host.posts.push_front(std::move(exchange));
+    host.posts.pushFront(std::move(exchange));
   } else {
-    host.posts.push_back(std::move(exchange));
+    host.posts.pushBack(std::move(exchange));
   }
 }
 
-HTTPSchedule::Exchange HTTPSchedule::takePost(Host& host) {
-  Exchange exchange = std::move(host.posts.front());
-  host.posts.pop_front();
+HTTPSchedule::Exchange HTTPSchedule::takePost(Host& host) noexcept {
+  Exchange exchange = host.posts.pop();
   host.postBytes -= exchange->request.body.size();
   _queuedCost -= exchange->cost();
   return exchange;
 }
 
-void HTTPSchedule::giveUp(Exchange exchange, HTTPError error) {
-  _givenUp.push_back({std::move(exchange), std::move(error)});
-}
-
-// While a host swallows connections, few attempts fill its slots; posts behind them would wait without end.
-void HTTPSchedule::giveUpOverdue(Host& host, const HTTPError& error, Instant now) {
+void HTTPSchedule::beginOutage(Host& host, const HTTPExchange& exchange, const HTTPError& error,
+                               Instant now) noexcept {
+  if (!host.outage) {
+    VESK_LOG_INFO("HTTPClient: no answer from %.*s: %s", static_cast<int>(exchange.host().size()),
+                  exchange.host().data(), error.description.c_str());
+  }
+  host.outage = httpError(error.kind, error.description);
+  // While a host swallows connections, few attempts fill its slots; posts behind them would wait without end.
   while (!host.posts.empty() && host.posts.front()->started + _policy.retryFor <= now) {
-    giveUp(takePost(host), error);
+    takePost(host)->fail(httpError(error.kind, error.description));
   }
 }
 
-std::size_t HTTPSchedule::waiting() const {
+bool HTTPSchedule::keepForRetry(Host& host, Exchange& exchange, Instant now) noexcept {
+  const std::size_t size = exchange->request.body.size();
+  const double random = std::uniform_real_distribution<double>()(_random);
+  auto wait = _policy.waitAfter(exchange->attempts, exchange->firstAttempt, now, waiting() + size, random);
+  if (!wait) return false;
+  try {
+    Exchange& kept = _retries.emplace(now + *wait, nullptr)->second;
+    ++host.retrying;
+    release(host, *exchange);
+    _retryBytes += size;
+    kept = std::move(exchange);
+    return true;
+  } catch (const std::bad_alloc&) {
+    return false;
+  }
+}
+
+std::size_t HTTPSchedule::waiting() const noexcept {
   std::size_t bytes = _retryBytes;
   for (const auto& [name, host] : _hosts) {
     if (host.outage) bytes += host.postBytes;

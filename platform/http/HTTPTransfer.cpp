@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <chrono>
+#include <cstdio>
 #include <new>
 
 namespace vesk {
@@ -57,6 +58,8 @@ Kind kindOf(CURLcode code) {
       return Kind::Interrupted;
     case CURLE_URL_MALFORMAT:
       return Kind::BadURL;
+    case CURLE_OUT_OF_MEMORY:
+      return Kind::OutOfMemory;
     default:
       return Kind::Other;
   }
@@ -137,9 +140,9 @@ HTTPTransfer::HTTPTransfer(const HTTPClient::Options& options, const std::option
   }
   set(easy, CURLOPT_PRIVATE, this);
   set(easy, CURLOPT_ERRORBUFFER, _errorText);
-  set(easy, CURLOPT_HEADERFUNCTION, &HTTPTransfer::receiveHeader);
+  set(easy, CURLOPT_HEADERFUNCTION, &HTTPTransfer::receive<&HTTPTransfer::addHeader>);
   set(easy, CURLOPT_HEADERDATA, this);
-  set(easy, CURLOPT_WRITEFUNCTION, &HTTPTransfer::receiveBody);
+  set(easy, CURLOPT_WRITEFUNCTION, &HTTPTransfer::receive<&HTTPTransfer::addBody>);
   set(easy, CURLOPT_WRITEDATA, this);
 }
 
@@ -147,11 +150,11 @@ std::optional<HTTPError> HTTPTransfer::prepare(std::unique_ptr<HTTPExchange>& ex
                                                HTTPExchange::Instant now) {
   const HTTPRequest& request = exchange->request;
   if (!startsWithScheme(request.url, "http://") && !startsWithScheme(request.url, "https://")) {
-    return HTTPError{Kind::BadURL, "not an http or https URL"};
+    return httpError(Kind::BadURL, "not an http or https URL");
   }
   _response = {};
   _headerBytes = 0;
-  _answered = _tooLarge = false;
+  _answered = _tooLarge = _outOfMemory = false;
   _errorText[0] = '\0';
 
   set(handle(), CURLOPT_URL, request.url.c_str());
@@ -205,7 +208,7 @@ void HTTPTransfer::setTimes(const HTTPExchange& exchange, HTTPExchange::Instant 
   set(handle(), CURLOPT_CONNECTTIMEOUT_MS, std::clamp<long>(_connectTimeout, 1, limit));
 }
 
-HTTPTransfer::Outcome HTTPTransfer::finish(CURLcode code) {
+HTTPTransfer::Outcome HTTPTransfer::finish(CURLcode code) noexcept {
   Outcome outcome;
   outcome.answered = _answered;
   if (code == CURLE_OK) {
@@ -219,21 +222,26 @@ HTTPTransfer::Outcome HTTPTransfer::finish(CURLcode code) {
   return outcome;
 }
 
-HTTPError HTTPTransfer::errorFrom(CURLcode code) {
+HTTPError HTTPTransfer::errorFrom(CURLcode code) const noexcept {
+  if (_outOfMemory) return outOfMemory();
   if (_tooLarge) {
-    return {Kind::TooLarge, "the answer is longer than " + std::to_string(_maximumBody) + " bytes"};
+    char text[64];
+    std::snprintf(text, sizeof text, "the answer is longer than %zu bytes", _maximumBody);
+    return httpError(Kind::TooLarge, text);
   }
-  return {kindOf(code), _errorText[0] ? _errorText : curl_easy_strerror(code)};
+  return httpError(kindOf(code), _errorText[0] ? _errorText : curl_easy_strerror(code));
 }
 
-std::size_t HTTPTransfer::receiveHeader(char* bytes, std::size_t size, std::size_t count, void* transfer) {
+// An exception that went through libcurl would leave all of its transfers inside a callback for ever.
+template <HTTPTransfer::Add add>
+std::size_t HTTPTransfer::receive(char* bytes, std::size_t size, std::size_t count, void* transfer) noexcept {
   auto* self = static_cast<HTTPTransfer*>(transfer);
-  return self->addHeader({bytes, size * count}) ? size * count : 0;
-}
-
-std::size_t HTTPTransfer::receiveBody(char* bytes, std::size_t size, std::size_t count, void* transfer) {
-  auto* self = static_cast<HTTPTransfer*>(transfer);
-  return self->addBody({bytes, size * count}) ? size * count : 0;
+  try {
+    return (self->*add)({bytes, size * count}) ? size * count : 0;
+  } catch (const std::bad_alloc&) {
+    self->_outOfMemory = true;
+    return 0;
+  }
 }
 
 bool HTTPTransfer::addHeader(std::string_view line) {

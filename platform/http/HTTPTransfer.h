@@ -47,13 +47,14 @@ class HTTPTransfer {
 
   CURL* handle() const noexcept { return _easy.get(); }
   bool isBusy() const noexcept { return _exchange != nullptr; }
+  bool isPost() const noexcept { return _exchange && _exchange->isPost(); }
 
   /// Makes the handle ready to send `exchange` and takes it over, unless there is an error: then it can't be
   /// sent. Throws std::bad_alloc.
   std::optional<HTTPError> prepare(std::unique_ptr<HTTPExchange>& exchange, HTTPExchange::Instant now);
 
   /// What became of it, once libcurl is done with the handle.
-  Outcome finish(CURLcode code);
+  Outcome finish(CURLcode code) noexcept;
 
   std::unique_ptr<HTTPExchange> release() noexcept { return std::move(_exchange); }
 
@@ -61,15 +62,16 @@ class HTTPTransfer {
   struct FreeEasy {
     void operator()(CURL* easy) const noexcept { curl_easy_cleanup(easy); }
   };
-  static std::size_t receiveHeader(char* bytes, std::size_t size, std::size_t count, void* transfer);
-  static std::size_t receiveBody(char* bytes, std::size_t size, std::size_t count, void* transfer);
+  using Add = bool (HTTPTransfer::*)(std::string_view);
+  template <Add add>
+  static std::size_t receive(char* bytes, std::size_t size, std::size_t count, void* transfer) noexcept;
   bool addHeader(std::string_view line);
   bool addBody(std::string_view bytes);
 
   void setMethod(const HTTPRequest& request);
   void setHeaders(const HTTPRequest& request);
   void setTimes(const HTTPExchange& exchange, HTTPExchange::Instant now);
-  HTTPError errorFrom(CURLcode code);
+  HTTPError errorFrom(CURLcode code) const noexcept;
 
   const std::size_t _maximumBody;
   const long _connectTimeout;  ///< milliseconds
@@ -82,6 +84,7 @@ class HTTPTransfer {
   std::size_t _headerBytes = 0;
   bool _answered = false;
   bool _tooLarge = false;
+  bool _outOfMemory = false;
 };
 
 }  // namespace vesk

@@ -5,7 +5,6 @@
 
 #include <algorithm>
 #include <chrono>
-#include <exception>
 #include <limits>
 #include <new>
 #include <stdexcept>
@@ -43,10 +42,12 @@ int millisecondsUntil(HTTPSchedule::Instant time) {
 
 }  // namespace
 
-HTTPClient::Worker::Worker(Options options, std::optional<std::string> authorities)
+HTTPClient::Worker::Worker(Options options, std::optional<std::string> authorities,
+                           const std::atomic<bool>& postsOnly)
     : _options(std::move(options)),
       _authorities(std::move(authorities)),
       _multi(makeMulti(std::max<std::size_t>(_options.maximumConnectionsPerHost, 1))),
+      _postsOnly(postsOnly),
       _schedule(_options),
       _thread([this] { run(); }) {}
 
@@ -55,86 +56,81 @@ HTTPClient::Worker::~Worker() {
     MutexLock lock(_mutex);
     _stopping = true;
   }
-  curl_multi_wakeup(_multi.get());
+  wake();
   _thread.join();
 }
 
-void HTTPClient::Worker::start(HTTPRequest request, Completion completion) {
+void HTTPClient::Worker::wake() noexcept { curl_multi_wakeup(_multi.get()); }
+
+void HTTPClient::Worker::start(HTTPRequest&& request, Completion&& completion) {
   auto exchange = std::make_unique<HTTPExchange>(std::move(request), std::move(completion),
-                                                 std::chrono::steady_clock::now());
+                                                 std::chrono::steady_clock::now(), _outstanding);
   bool mustWake;
   {
     MutexLock lock(_mutex);
     // What lies in the inbox already has woken the thread.
     mustWake = _inbox.empty();
-    _inbox.push_back(std::move(exchange));
-    ++_outstanding;
+    _inbox.pushBack(std::move(exchange));
   }
-  if (mustWake) curl_multi_wakeup(_multi.get());
-}
-
-bool HTTPClient::Worker::waitUntilIdle(std::chrono::milliseconds timeout) {
-  auto deadline = std::chrono::steady_clock::now() + timeout;
-  MutexLock lock(_mutex);
-  while (_outstanding > 0) {
-    if (_becameIdle.wait_until(_mutex, deadline) == std::cv_status::timeout) return _outstanding == 0;
-  }
-  return true;
+  if (mustWake) wake();
 }
 
 void HTTPClient::Worker::run() noexcept {
   blockSignals();
   pthread_setname_np(pthread_self(), "http");
-  for (bool goOn = true; goOn;) {
-    try {
-      goOn = turn();
-    } catch (const std::exception& error) {
-      // Whatever exchange was in hand has completed itself.
-      VESK_LOG_ERROR("HTTPClient: %s", error.what());
-    }
+  while (turn()) {
   }
   stop();
 }
 
-bool HTTPClient::Worker::turn() {
+bool HTTPClient::Worker::turn() noexcept {
   if (!takeInbox()) return false;
+  if (_postsOnly) stopAllButPosts();
   _schedule.advance(std::chrono::steady_clock::now());
   startReady();
   int running = 0;
   curl_multi_perform(_multi.get(), &running);
   bool freed = collectFinished();
-  completeGivenUp();
   // What ended made room: the next request starts before the thread sleeps.
   if (!freed) sleep();
   return true;
 }
 
-bool HTTPClient::Worker::takeInbox() {
+bool HTTPClient::Worker::takeInbox() noexcept {
+  HTTPQueue arrived;
   {
     MutexLock lock(_mutex);
     if (_stopping) return false;
-    std::swap(_arrived, _inbox);
+    arrived.swap(_inbox);
   }
-  for (auto& exchange : _arrived) _schedule.add(std::move(exchange));
-  _arrived.clear();
+  while (auto exchange = arrived.pop()) _schedule.add(std::move(exchange));
   return true;
 }
 
-void HTTPClient::Worker::startReady() {
+void HTTPClient::Worker::stopAllButPosts() noexcept {
+  for (auto& transfer : _transfers) {
+    if (!transfer->isBusy() || transfer->isPost()) continue;
+    auto exchange = interrupt(*transfer);
+    _schedule.failed(std::move(exchange), stopped(), false, std::chrono::steady_clock::now());
+  }
+  _schedule.stopAllButPosts();
+}
+
+void HTTPClient::Worker::startReady() noexcept {
   while (auto exchange = _schedule.next(std::chrono::steady_clock::now())) begin(std::move(exchange));
 }
 
-void HTTPClient::Worker::begin(Exchange exchange) {
+void HTTPClient::Worker::begin(Exchange exchange) noexcept {
   std::optional<HTTPError> error;
   HTTPTransfer* transfer = nullptr;
   try {
     transfer = &idleTransfer();
     error = transfer->prepare(exchange, std::chrono::steady_clock::now());
   } catch (const std::bad_alloc&) {
-    error = HTTPError{HTTPError::Kind::Other, "out of memory"};
+    error = outOfMemory();
   }
   if (!error && curl_multi_add_handle(_multi.get(), transfer->handle()) != CURLM_OK) {
-    error = HTTPError{HTTPError::Kind::Other, "libcurl did not take the request"};
+    error = httpError(HTTPError::Kind::Other, "libcurl did not take the request");
   }
   if (!error) return;
   if (transfer) {
@@ -144,7 +140,7 @@ void HTTPClient::Worker::begin(Exchange exchange) {
   _schedule.failed(std::move(exchange), std::move(*error), false, std::chrono::steady_clock::now());
 }
 
-bool HTTPClient::Worker::collectFinished() {
+bool HTTPClient::Worker::collectFinished() noexcept {
   bool any = false;
   int left = 0;
   while (CURLMsg* message = curl_multi_info_read(_multi.get(), &left)) {
@@ -159,33 +155,20 @@ bool HTTPClient::Worker::collectFinished() {
   return any;
 }
 
-void HTTPClient::Worker::conclude(HTTPTransfer& transfer, CURLcode code) {
+void HTTPClient::Worker::conclude(HTTPTransfer& transfer, CURLcode code) noexcept {
   auto outcome = transfer.finish(code);
   auto exchange = transfer.release();
   _idle.push_back(&transfer);
   if (outcome.answered) {
     _schedule.answered(*exchange);
-    complete(std::move(exchange), outcome.result);
+    exchange->complete(std::move(outcome.result));
   } else {
     _schedule.failed(std::move(exchange), std::move(*outcome.result.error), outcome.mayRetry,
                      std::chrono::steady_clock::now());
   }
 }
 
-void HTTPClient::Worker::completeGivenUp() {
-  for (auto& [exchange, error] : _schedule.takeGivenUp()) {
-    complete(std::move(exchange), HTTPResult{std::nullopt, std::move(error)});
-  }
-}
-
-void HTTPClient::Worker::complete(Exchange exchange, const HTTPResult& result) noexcept {
-  exchange->complete(result);
-  exchange.reset();
-  MutexLock lock(_mutex);
-  if (--_outstanding == 0) _becameIdle.notify_all();
-}
-
-void HTTPClient::Worker::sleep() {
+void HTTPClient::Worker::sleep() noexcept {
   auto next = _schedule.nextAdvance();
   int timeout = next ? millisecondsUntil(*next) : std::numeric_limits<int>::max();
   CURLMcode code = curl_multi_poll(_multi.get(), nullptr, 0, timeout, nullptr);
@@ -197,8 +180,8 @@ void HTTPClient::Worker::sleep() {
 
 HTTPTransfer& HTTPClient::Worker::idleTransfer() {
   if (_idle.empty()) {
+    _idle.reserve(_transfers.size() + 1);
     _transfers.push_back(std::make_unique<HTTPTransfer>(_options, _authorities));
-    _idle.reserve(_transfers.size());
     _idle.push_back(_transfers.back().get());
   }
   HTTPTransfer* transfer = _idle.back();
@@ -206,23 +189,26 @@ HTTPTransfer& HTTPClient::Worker::idleTransfer() {
   return *transfer;
 }
 
+HTTPClient::Worker::Exchange HTTPClient::Worker::interrupt(HTTPTransfer& transfer) noexcept {
+  curl_multi_remove_handle(_multi.get(), transfer.handle());
+  _idle.push_back(&transfer);
+  return transfer.release();
+}
+
 void HTTPClient::Worker::stop() noexcept {
-  const HTTPResult stopped{std::nullopt, HTTPError{HTTPError::Kind::Stopped, "the client was stopped"}};
   for (auto& transfer : _transfers) {
-    if (!transfer->isBusy()) continue;
-    curl_multi_remove_handle(_multi.get(), transfer->handle());
-    complete(transfer->release(), stopped);
+    if (transfer->isBusy()) interrupt(*transfer)->fail(stopped());
   }
-  for (auto& exchange : _schedule.takeAll()) complete(std::move(exchange), stopped);
+  _schedule.stopAll();
   for (bool more = true; more;) {
     // A completion may have asked for more.
+    HTTPQueue arrived;
     {
       MutexLock lock(_mutex);
-      std::swap(_arrived, _inbox);
+      arrived.swap(_inbox);
     }
-    more = !_arrived.empty();
-    for (auto& exchange : _arrived) complete(std::move(exchange), stopped);
-    _arrived.clear();
+    more = !arrived.empty();
+    while (auto exchange = arrived.pop()) exchange->fail(stopped());
   }
   _transfers.clear();
 }

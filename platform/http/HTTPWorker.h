@@ -3,8 +3,7 @@
 
 #include <curl/curl.h>
 
-#include <condition_variable>
-#include <cstddef>
+#include <atomic>
 #include <memory>
 #include <optional>
 #include <string>
@@ -12,6 +11,7 @@
 #include <vector>
 
 #include "platform/http/HTTPClient.h"
+#include "platform/http/HTTPQueue.h"
 #include "platform/http/HTTPSchedule.h"
 #include "platform/http/HTTPTransfer.h"
 #include "platform/sync/Mutex.h"
@@ -19,54 +19,59 @@
 namespace vesk {
 
 /// Takes requests from any thread through an inbox and carries them out on a thread of its own, which sleeps
-/// without any timeout while there is nothing to do.
+/// without any timeout while there is nothing to do. A want of memory ends the one exchange that suffers from
+/// it: nothing that runs on the thread lets an exception out.
 class HTTPClient::Worker {
  public:
-  Worker(Options options, std::optional<std::string> authorities);
+  /// `postsOnly`: outlives it; who sets it calls `wake`.
+  Worker(Options options, std::optional<std::string> authorities, const std::atomic<bool>& postsOnly);
   ~Worker();
   Worker(const Worker&) = delete;
   Worker& operator=(const Worker&) = delete;
 
-  void start(HTTPRequest request, Completion completion);
-  bool waitUntilIdle(std::chrono::milliseconds timeout);
+  /// Throws std::bad_alloc, and has taken neither then.
+  void start(HTTPRequest&& request, Completion&& completion);
+  void wake() noexcept;
+  bool waitUntilIdle(std::chrono::milliseconds timeout) { return _outstanding.waitUntilNone(timeout); }
 
  private:
-  using Exchange = std::unique_ptr<HTTPExchange>;
+  using Exchange = HTTPQueue::Exchange;
   struct FreeMulti {
     void operator()(CURLM* multi) const noexcept { curl_multi_cleanup(multi); }
   };
 
   void run() noexcept;
   /// One round; false when it is time to stop.
-  bool turn();
+  bool turn() noexcept;
   void stop() noexcept;
 
-  bool takeInbox();
-  void startReady();
-  void begin(Exchange exchange);
+  bool takeInbox() noexcept;
+  void stopAllButPosts() noexcept;
+  void startReady() noexcept;
+  void begin(Exchange exchange) noexcept;
   /// Whether any transfer ended.
-  bool collectFinished();
-  void conclude(HTTPTransfer& transfer, CURLcode code);
-  void completeGivenUp();
-  void complete(Exchange exchange, const HTTPResult& result) noexcept;
-  void sleep();
+  bool collectFinished() noexcept;
+  void conclude(HTTPTransfer& transfer, CURLcode code) noexcept;
+  void sleep() noexcept;
   HTTPTransfer& idleTransfer();
+  /// Takes a busy transfer out of libcurl's hands; gives what it carried.
+  Exchange interrupt(HTTPTransfer& transfer) noexcept;
 
   // Constant after construction.
   const Options _options;
   std::optional<std::string> _authorities;
   std::unique_ptr<CURLM, FreeMulti> _multi;  ///< the client's thread's, but for waking it up
+  const std::atomic<bool>& _postsOnly;
+
+  HTTPOutstanding _outstanding;  // before all that holds exchanges
 
   // The client's thread only.
   HTTPSchedule _schedule;
   std::vector<std::unique_ptr<HTTPTransfer>> _transfers;
-  std::vector<HTTPTransfer*> _idle;  ///< those of `_transfers` that hold no exchange
-  std::vector<Exchange> _arrived;
+  std::vector<HTTPTransfer*> _idle;  ///< those of `_transfers` that hold no exchange; has room for all
 
   Mutex _mutex;
-  std::condition_variable_any _becameIdle;
-  std::vector<Exchange> _inbox VESK_GUARDED_BY(_mutex);
-  std::size_t _outstanding VESK_GUARDED_BY(_mutex) = 0;
+  HTTPQueue _inbox VESK_GUARDED_BY(_mutex);
   bool _stopping VESK_GUARDED_BY(_mutex) = false;
 
   std::thread _thread;
