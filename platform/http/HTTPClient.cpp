@@ -55,7 +55,7 @@ void HTTPClient::start(HTTPRequest request, Completion completion) {
   removeUnsafeHeaders(request);
   HTTPError problem;
   try {
-    startedWorker().start(std::move(request), std::move(completion));
+    startedWorker().start(request, completion);
     return;
   } catch (const std::bad_alloc&) {
     problem = outOfMemory();

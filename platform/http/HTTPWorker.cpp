@@ -62,7 +62,7 @@ HTTPClient::Worker::~Worker() {
 
 void HTTPClient::Worker::wake() noexcept { curl_multi_wakeup(_multi.get()); }
 
-void HTTPClient::Worker::start(HTTPRequest&& request, Completion&& completion) {
+void HTTPClient::Worker::start(HTTPRequest& request, Completion& completion) {
   auto exchange = std::make_unique<HTTPExchange>(std::move(request), std::move(completion),
                                                  std::chrono::steady_clock::now(), _outstanding);
   bool mustWake;

@@ -29,8 +29,8 @@ class HTTPClient::Worker {
   Worker(const Worker&) = delete;
   Worker& operator=(const Worker&) = delete;
 
-  /// Throws std::bad_alloc, and has taken neither then.
-  void start(HTTPRequest&& request, Completion&& completion);
+  /// Takes both over, unless it throws std::bad_alloc.
+  void start(HTTPRequest& request, Completion& completion);
   void wake() noexcept;
   bool waitUntilIdle(std::chrono::milliseconds timeout) { return _outstanding.waitUntilNone(timeout); }
 
