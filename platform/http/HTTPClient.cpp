@@ -62,7 +62,7 @@ void HTTPClient::start(HTTPRequest request, Completion completion) {
   } catch (const std::exception& error) {
     problem = httpError(HTTPError::Kind::Other, error.what());
   }
-  runCompletion(std::move(completion), {std::nullopt, std::move(problem)});
+  runCompletion(completion, {std::nullopt, std::move(problem)});
 }
 
 HTTPResult HTTPClient::perform(HTTPRequest request) {

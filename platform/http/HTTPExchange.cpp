@@ -70,10 +70,12 @@ std::string_view HTTPExchange::host() const noexcept {
 }
 
 void HTTPExchange::complete(HTTPResult result) noexcept {
-  if (_completion) runCompletion(std::exchange(_completion, nullptr), std::move(result));
+  // What it captured is destroyed with it, here.
+  auto completion = std::exchange(_completion, nullptr);
+  if (completion) runCompletion(completion, std::move(result));
 }
 
-void runCompletion(HTTPClient::Completion completion, HTTPResult result) noexcept {
+void runCompletion(const HTTPClient::Completion& completion, HTTPResult result) noexcept {
   try {
     completion(std::move(result));
   } catch (const std::exception& error) {

@@ -62,8 +62,8 @@ class HTTPExchange {
   HTTPOutstanding& _outstanding;
 };
 
-/// Runs it and destroys what it captured; logs what it throws.
-void runCompletion(HTTPClient::Completion completion, HTTPResult result) noexcept;
+/// Logs what it throws.
+void runCompletion(const HTTPClient::Completion& completion, HTTPResult result) noexcept;
 
 /// An error that can be made when there is no memory for its description, too: it has a short one then.
 HTTPError httpError(HTTPError::Kind kind, std::string_view description) noexcept;
