@@ -90,7 +90,7 @@ bool UploadBackend::upload(const std::string& path, const std::string& extension
     VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Input file is empty");
     return false;
   }
-  auto pass = _services.uploads->enter(2 * static_cast<std::size_t>(file.size()));
+  auto pass = _services.uploads->enter(handle.user, 2 * static_cast<std::size_t>(file.size()));
   if (!pass) {
     VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Too many uploads are under way");
     return false;
@@ -117,9 +117,16 @@ bool UploadBackend::upload(const std::string& path, const std::string& extension
   return true;
 }
 
-std::optional<std::string> UploadBackend::contentsOf(const LentFile& file) {
+std::optional<std::string> UploadBackend::contentsOf(const LentFile& file) const {
   std::string contents;
-  LentFile::Reading reading = file.read(contents);
+  // A file system may be slow on purpose, and others wait for the room that its file takes.
+  const auto deadline = std::chrono::steady_clock::now() + timeoutFor(file.size());
+  LentFile::Reading reading = file.read(
+      contents, [&] { return _services.uploads->isOpen() && std::chrono::steady_clock::now() < deadline; });
+  if (reading == LentFile::Reading::GivenUp) {
+    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Input file was not read in time");
+    return std::nullopt;
+  }
   if (reading == LentFile::Reading::Changed) {
     VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Input file was changed while it was read");
     return std::nullopt;

@@ -37,7 +37,7 @@ class UploadBackend final : public VeskReportingBackend {
 
   bool upload(const std::string& path, const std::string& extensionToken, const std::string& uploadURL);
   /// The file's contents; nothing, and a line in the log, when it is refused.
-  static std::optional<std::string> contentsOf(const LentFile& file);
+  std::optional<std::string> contentsOf(const LentFile& file) const;
   /// The request but for its body; nothing when the profile's URL is of no use.
   std::optional<HTTPRequest> requestFor(const std::string& path, const std::string& uploadURL) const;
   /// Whether the server has the file.

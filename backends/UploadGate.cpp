@@ -6,14 +6,23 @@ namespace vesk {
 
 UploadGate::UploadGate(const Limits& limits) : _limits(limits) {}
 
-std::optional<UploadGate::Pass> UploadGate::enter(std::size_t bytes) {
+bool UploadGate::hasRoomFor(std::size_t bytes, const Share& ofUser) const {
+  return _all.uploads < _limits.uploads && bytes <= _limits.bytes - _all.bytes &&
+         ofUser.uploads < _limits.uploadsOfUser && bytes <= _limits.bytesOfUser - ofUser.bytes;
+}
+
+std::optional<UploadGate::Pass> UploadGate::enter(uid_t user, std::size_t bytes) {
   const auto deadline = std::chrono::steady_clock::now() + _limits.patience;
   MutexLock lock(_mutex);
   while (!_closed) {
-    if (_uploads < _limits.uploads && bytes <= _limits.bytes - _bytes) {
-      ++_uploads;
-      _bytes += bytes;
-      return std::optional<Pass>(std::in_place, *this, bytes);
+    const auto ofUser = _ofUser.find(user);
+    if (hasRoomFor(bytes, ofUser == _ofUser.end() ? Share{} : ofUser->second)) {
+      Share& share = _ofUser[user];
+      for (Share* each : {&share, &_all}) {
+        ++each->uploads;
+        each->bytes += bytes;
+      }
+      return std::optional<Pass>(std::in_place, *this, user, bytes);
     }
     if (_changed.wait_until(_mutex, deadline) == std::cv_status::timeout) break;
   }
@@ -34,16 +43,25 @@ void UploadGate::close() {
   _changed.notify_all();
 }
 
-void UploadGate::leave(std::size_t uploads, std::size_t bytes) {
+bool UploadGate::isOpen() const {
   MutexLock lock(_mutex);
-  _uploads -= uploads;
-  _bytes -= bytes;
+  return !_closed;
+}
+
+void UploadGate::leave(uid_t user, Share share) {
+  MutexLock lock(_mutex);
+  const auto ofUser = _ofUser.find(user);
+  for (Share* each : {&ofUser->second, &_all}) {
+    each->uploads -= share.uploads;
+    each->bytes -= share.bytes;
+  }
+  if (ofUser->second.uploads == 0) _ofUser.erase(ofUser);
   _changed.notify_all();
 }
 
 void UploadGate::Pass::shrinkTo(std::size_t bytes) {
   if (bytes >= _bytes) return;
-  _gate->leave(0, std::exchange(_bytes, bytes) - bytes);
+  _gate->leave(_user, {0, std::exchange(_bytes, bytes) - bytes});
 }
 
 }  // namespace vesk

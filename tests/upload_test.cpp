@@ -247,18 +247,37 @@ TEST_F(UploadTest, AServerThatHangsHoldsUpNobodyElse) {
   EXPECT_TRUE(fs::exists(path));
 }
 
-TEST(UploadGateTest, LetsInWhatThereIsRoomFor) {
-  UploadGate gate({.uploads = 2, .bytes = 100, .patience = std::chrono::milliseconds(0)});
-  auto first = gate.enter(80);
+TEST(UploadGateTest, LetsInWhatThereIsRoomForAndLeavesSomeToOthers) {
+  UploadGate gate({.uploads = 3,
+                   .bytes = 100,
+                   .uploadsOfUser = 2,
+                   .bytesOfUser = 90,
+                   .patience = std::chrono::milliseconds(0)});
+  auto first = gate.enter(1, 80);
   ASSERT_TRUE(first);
-  EXPECT_FALSE(gate.enter(21)) << "bytes";
+  EXPECT_FALSE(gate.enter(1, 11)) << "bytes of one user";
+  EXPECT_FALSE(gate.enter(2, 21)) << "bytes";
   first->shrinkTo(40);
   first->shrinkTo(90);
-  auto second = gate.enter(60);
+  auto second = gate.enter(1, 50);
   EXPECT_TRUE(second);
-  EXPECT_FALSE(gate.enter(0)) << "uploads";
+  EXPECT_FALSE(gate.enter(1, 0)) << "uploads of one user";
+  auto third = gate.enter(2, 10);
+  EXPECT_TRUE(third);
+  EXPECT_FALSE(gate.enter(3, 0)) << "uploads";
   second.reset();
-  EXPECT_TRUE(gate.enter(60));
+  EXPECT_TRUE(gate.enter(1, 50));
+}
+
+TEST(LentFileTest, IsReadOnlyAsLongAsItsReaderWants) {
+  TempDirectory directory;
+  const std::string path = directory.write("file", std::string(3 << 20, 'x')).string();
+  const LentFile lent(FileDescriptor(::open(path.c_str(), O_RDONLY | O_CLOEXEC)));
+  std::string bytes;
+  int pieces = 0;
+  EXPECT_EQ(lent.read(bytes, [&] { return ++pieces < 3; }), LentFile::Reading::GivenUp);
+  EXPECT_EQ(lent.read(bytes, [] { return true; }), LentFile::Reading::Whole);
+  EXPECT_EQ(bytes, std::string(3 << 20, 'x'));
 }
 
 TEST(URLQueryTest, EncodesWhatAQueryMayNotHold) {

@@ -2,9 +2,16 @@
 
 #include <fcntl.h>
 
+#include <algorithm>
 #include <cerrno>
 
 namespace vesk {
+
+namespace {
+
+constexpr std::size_t kPiece = std::size_t{1} << 20;
+
+}  // namespace
 
 LentFile::LentFile(FileDescriptor descriptor) noexcept : _descriptor(std::move(descriptor)) {
   if (_descriptor && ::fstat(_descriptor.get(), &_status) != 0) _status = {};
@@ -16,12 +23,13 @@ bool LentFile::isRegularAt(const std::string& path) const noexcept {
   return ::lstat(path.c_str(), &named) != 0 || S_ISREG(named.st_mode);
 }
 
-LentFile::Reading LentFile::read(std::string& bytes) const {
+LentFile::Reading LentFile::read(std::string& bytes, const std::function<bool()>& goOn) const {
   bytes.resize(size());
   std::size_t done = 0;
   while (done < bytes.size()) {
-    ssize_t count =
-        ::pread(_descriptor.get(), bytes.data() + done, bytes.size() - done, static_cast<off_t>(done));
+    if (!goOn()) return Reading::GivenUp;
+    const std::size_t piece = std::min(bytes.size() - done, kPiece);
+    ssize_t count = ::pread(_descriptor.get(), bytes.data() + done, piece, static_cast<off_t>(done));
     if (count < 0 && errno == EINTR) continue;
     if (count < 0) return Reading::Unreadable;
     if (count == 0) return Reading::Changed;

@@ -5,6 +5,7 @@
 #include <sys/types.h>
 
 #include <cstdint>
+#include <functional>
 #include <string>
 
 #include "platform/files/FileDescriptor.h"
@@ -28,11 +29,13 @@ class LentFile {
   enum class Reading : unsigned char {
     Whole,
     Unreadable,  ///< the client itself could not read it, or the device fails
-    Changed      ///< not of one piece: it was changed while it was read
+    Changed,     ///< not of one piece: it was changed while it was read
+    GivenUp      ///< `goOn` said so
   };
   /// Reads all `size()` bytes; `bytes` is of no use unless they are Whole. Leaves the client's position in
-  /// the file alone. Throws std::bad_alloc.
-  [[nodiscard]] Reading read(std::string& bytes) const;
+  /// the file alone. `goOn` is asked before each piece: the file's device may be as slow as its client likes.
+  /// Throws std::bad_alloc.
+  [[nodiscard]] Reading read(std::string& bytes, const std::function<bool()>& goOn) const;
 
   /// Removes the file from `path` when that still names this very file, unchanged, and when `user` owns it or
   /// is this process's own user. False when it was left, for whatever reason. Whoever could make `path` name
