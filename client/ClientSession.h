@@ -12,7 +12,6 @@
 #include "client/Answers.h"
 #include "client/ClientCall.h"
 #include "client/SessionThread.h"
-#include "platform/log/SystemLog.h"
 
 namespace vesk {
 
@@ -74,9 +73,7 @@ class ClientSession {
 
   ReportingStatus push(ClientCall&& call) {
     ReportingStatus status = worker().queue().push(std::move(call));
-    if (status == ReportingStatus::QueueFull && worker().drops().queueFull()) {
-      VESK_LOG_WARNING("VeskReporting: too much waits for the daemon, messages are dropped");
-    }
+    if (status == ReportingStatus::QueueFull && worker().drops().queueFull()) worker().queue().wake();
     return status;
   }
 

@@ -10,10 +10,16 @@ namespace vesk {
 /// For any thread.
 class DropCounters {
  public:
-  /// True for the first of a burst, which deserves a log line.
+  /// True for the first of a burst, of which the session's thread has to be told.
   bool queueFull() noexcept {
     _queueFull.fetch_add(1, std::memory_order_relaxed);
-    return !_isBurst.load(std::memory_order_relaxed) && !_isBurst.exchange(true);
+    if (_isBurst.load(std::memory_order_relaxed) || _isBurst.exchange(true)) return false;
+    _isUntold.store(true, std::memory_order_relaxed);
+    return true;
+  }
+  /// A burst has begun since this was asked last: it deserves a log line.
+  bool takeBurst() noexcept {
+    return _isUntold.load(std::memory_order_relaxed) && _isUntold.exchange(false, std::memory_order_relaxed);
   }
   void burstIsOver() noexcept { _isBurst.store(false, std::memory_order_relaxed); }
   void invalid() noexcept { _invalid.fetch_add(1, std::memory_order_relaxed); }
@@ -29,6 +35,7 @@ class DropCounters {
   std::atomic<std::uint64_t> _invalid{0};
   std::atomic<std::uint64_t> _unsent{0};
   std::atomic<bool> _isBurst{false};
+  std::atomic<bool> _isUntold{false};
 };
 
 }  // namespace vesk

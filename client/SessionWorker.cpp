@@ -79,6 +79,7 @@ void SessionWorker::step() {
   Time now = Clock::now();
   takeRequests();
   takeCalls();
+  tellOfDrops();
   endOverdue(now);
   reachDaemon(now);
   sendWaiting(now);
@@ -95,6 +96,7 @@ bool SessionWorker::isFinished(Time now) const noexcept {
 
 void SessionWorker::endEverything() noexcept {
   _isClosed = true;
+  tellOfDrops();
   _isConnected.store(false, std::memory_order_relaxed);
   _link.lose(Clock::now(), "the session was closed");
   if (_callsInBus > 0 && _waiting.front().wantsAnswer()) frontHasLeft();
@@ -124,6 +126,13 @@ void SessionWorker::takeRequests() {
   if (!_newRequests.empty() || _newDrainDeadline) _urgency = DaemonLink::Urgency::AtOnce;
   for (auto& request : std::exchange(_newRequests, {})) _requests.push_back(std::move(request));
   if (_newDrainDeadline) _drainDeadline = std::exchange(_newDrainDeadline, std::nullopt);
+}
+
+// Here and not where the call was refused: a log may have a host's sink behind it, which takes its time.
+void SessionWorker::tellOfDrops() noexcept {
+  if (_drops.takeBurst()) {
+    VESK_LOG_WARNING("VeskReporting: too much waits for the daemon, messages are dropped");
+  }
 }
 
 void SessionWorker::endOverdue(Time now) {

@@ -57,6 +57,7 @@ class SessionWorker final : private ClientSessionReplyInterface {
 
   void takeCalls();
   void takeRequests();
+  void tellOfDrops() noexcept;
   void endOverdue(Time now);
   void endRequests(ReportingStatus status, std::string_view detail);
 

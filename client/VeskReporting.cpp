@@ -5,6 +5,7 @@
 
 #include "client/CallBuilding.h"
 #include "client/ClientSession.h"
+#include "platform/log/SystemLog.h"
 
 namespace vesk {
 

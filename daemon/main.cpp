@@ -19,10 +19,12 @@ namespace {
 constexpr char kServiceName[] = "com.corvane.veskreportingd";
 constexpr std::chrono::seconds kIdleExitWhenActivated{
     300};  // the manager starts us again on the next connection
+constexpr std::chrono::seconds kPatienceOfLog{1};
 
 int run(const vesk::DaemonOptions& options) {
   vesk::enterSchedulingClass(vesk::SchedulingClass::Utility, 0);
   vesk::VeskReportingLogging::startLogging("veskreportingd", "Daemon");
+  vesk::SystemLog::setPatience(kPatienceOfLog);
   if (options.sandbox) {
     if (auto error = vesk::enterSandbox(kServiceName)) {
       VESK_LOG_ERROR("main: confine_enter() fails: %s\n", error->c_str());

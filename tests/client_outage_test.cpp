@@ -1,6 +1,8 @@
+#include <fcntl.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <csignal>
 #include <future>
 
 #include "client/ReconnectPolicy.h"
@@ -108,6 +110,28 @@ TEST_F(ClientOutage, DropsAndCountsWhatDoesNotFit) {
     EXPECT_EQ(session.droppedMessages(), 20 - c.fitting);
     EXPECT_EQ(session.drops().queueFull, 20 - c.fitting);
   }
+}
+
+TEST_F(ClientOutage, LogsOfDropsWithoutHarmToAHostWhoseStandardErrorNobodyReads) {
+  GTEST_FLAG_SET(death_test_style, "fast");
+  auto dropTwo = [&](bool isFull) {
+    ::alarm(60);
+    ::signal(SIGPIPE, SIG_DFL);
+    int ends[2];
+    if (::pipe2(ends, O_NONBLOCK) != 0 || ::dup2(ends[1], STDERR_FILENO) < 0) ::_exit(1);
+    if (!isFull) ::close(ends[0]);
+    while (isFull && ::write(ends[1], "x", 1) > 0) {
+    }
+    ::fcntl(ends[1], F_SETFL, 0);
+    auto bounded = options();
+    bounded.maximumQueuedMessages = 1;
+    {
+      VeskReporting session(bounded);
+      for (int i = 0; i < 3; ++i) static_cast<void>(session.sendMessage(1, 1));
+    }
+    ::_exit(0);
+  };
+  for (bool isFull : {false, true}) EXPECT_EXIT(dropTwo(isFull), testing::ExitedWithCode(0), "") << isFull;
 }
 
 TEST_F(ClientOutage, HasRoomAgainOnceTheDaemonTookWhatWaited) {

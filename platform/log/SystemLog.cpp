@@ -1,7 +1,6 @@
 #include "platform/log/SystemLog.h"
 
 #include <sys/stat.h>
-#include <sys/uio.h>
 #include <unistd.h>
 
 #define SD_JOURNAL_SUPPRESS_LOCATION
@@ -15,6 +14,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/log/StandardError.h"
 #include "platform/sync/Mutex.h"
 #include "platform/time/CivilTime.h"
 
@@ -76,24 +76,21 @@ std::string printable(std::string_view text) {
   return out;
 }
 
-void writeToStderr(const LogState& log, LogLevel level, const std::string& line) {
+std::string withHead(const LogState& log, LogLevel level, const std::string& line) {
   WallTime now = WallClock::system().now();
   auto fraction = now - std::chrono::floor<std::chrono::seconds>(now);
   char head[160];
-  int size = std::snprintf(head, sizeof head, "%s.%03d %.64s[%d] <%d> ", civilTime(now).c_str(),
-                           static_cast<int>(fraction.count() / 1000),
-                           log.processName.empty() ? "vesk" : log.processName.c_str(), ::getpid(),
-                           static_cast<int>(level));
-  iovec parts[] = {{head, static_cast<std::size_t>(size)},
-                   {const_cast<char*>(line.data()), line.size()},
-                   {const_cast<char*>("\n"), 1}};
-  // One write, so that lines of several threads and processes do not mix.
-  [[maybe_unused]] auto written = ::writev(STDERR_FILENO, parts, 3);
+  std::snprintf(head, sizeof head, "%s.%03d %.64s[%d] <%d> ", civilTime(now).c_str(),
+                static_cast<int>(fraction.count() / 1000),
+                log.processName.empty() ? "vesk" : log.processName.c_str(), ::getpid(),
+                static_cast<int>(level));
+  return head + line;
 }
 
 }  // namespace
 
 std::atomic<int> SystemLog::_level{static_cast<int>(LogLevel::Info)};
+std::atomic<int> SystemLog::_patience{0};
 
 void SystemLog::open(std::string_view processName, std::string_view facility) {
   changeState([&](LogState& log) {
@@ -143,7 +140,8 @@ void SystemLog::write(LogLevel level, const char* format, ...) noexcept {
                       "SYSLOG_IDENTIFIER=%s", log->processName.c_str(), "VESK_FACILITY=%s",
                       log->facility.c_str(), nullptr);
     } else {
-      writeToStderr(*log, level, line);
+      writeToStandardError(withHead(*log, level, line),
+                           std::chrono::milliseconds(_patience.load(std::memory_order_relaxed)));
     }
   } catch (...) {
     // A line that can't be formatted for want of memory is lost; the caller goes on.

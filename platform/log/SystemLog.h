@@ -2,6 +2,7 @@
 #pragma once
 
 #include <atomic>
+#include <chrono>
 #include <functional>
 #include <string_view>
 
@@ -12,8 +13,8 @@ enum class LogLevel : int { Error = 3, Warning = 4, Info = 6, Debug = 7 };
 
 /// Writes the process's log lines. Lines go to the journal when stderr is connected to it, else to stderr as
 /// "2026-11-24 20:31:29.123 name[pid] <level> text", in UTC. Safe from any thread; takes no lock of the
-/// project's own; never throws. Control characters in a line are shown as \xNN, so that text from outside
-/// can't forge a line.
+/// project's own; never throws, raises no SIGPIPE. Control characters in a line are shown as \xNN, so that
+/// text from outside can't forge a line.
 class SystemLog {
  public:
   using Sink = std::function<void(LogLevel, std::string_view line)>;
@@ -28,6 +29,13 @@ class SystemLog {
     return static_cast<int>(level) <= _level.load(std::memory_order_relaxed);
   }
 
+  /// How long a line waits for a reader of stderr that is behind; a line that it has no room for then is
+  /// lost. Default: not at all, and lines are cut to 4096 bytes, because a library must not hold up its host.
+  /// A process of the project's own, whose lines somebody looks for, can wait a little.
+  static void setPatience(std::chrono::milliseconds patience) noexcept {
+    _patience.store(static_cast<int>(patience.count()), std::memory_order_relaxed);
+  }
+
   /// Hands every line to `sink` instead; an empty sink restores the default. For hosts that have a log of
   /// their own. The sink is called on the logging thread and must not log.
   static void setSink(Sink sink);
@@ -36,6 +44,7 @@ class SystemLog {
 
  private:
   static std::atomic<int> _level;
+  static std::atomic<int> _patience;  ///< milliseconds
 };
 
 }  // namespace vesk
