@@ -1,6 +1,7 @@
 #include "client/DaemonLink.h"
 
 #include <cerrno>
+#include <cstring>
 #include <system_error>
 #include <utility>
 
@@ -41,7 +42,7 @@ DaemonLink::Change DaemonLink::reach(Time now, Urgency urgency) {
     _since = now;
     return Change::None;
   } catch (const std::system_error& error) {
-    lose(now, error.code().message());
+    lose(now, std::strerror(error.code().value()));
     return Change::Lost;
   }
 }
@@ -63,14 +64,18 @@ DaemonLink::Change DaemonLink::process(Time now) {
   return Change::Lost;
 }
 
-void DaemonLink::lose(Time now, const std::string& cause) {
-  _problem = _socketPath + ": " + cause;
+void DaemonLink::lose(Time now, const char* cause) noexcept {
   if (_isReady && now - _since >= kShortestVisit) {
     _policy.succeeded();
   } else {
     _policy.failed(now);
   }
   _isReady = false;
+  try {
+    _problem = _socketPath + ": " + cause;
+  } catch (const std::exception&) {
+    _problem.clear();
+  }
   // Out of the way first: the handlers that its end calls may ask about this link.
   auto bus = std::move(_bus);
 }

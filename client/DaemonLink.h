@@ -32,7 +32,7 @@ class DaemonLink {
 
   bool isReady() const noexcept { return _isReady; }
   bool wasEverReady() const noexcept { return _wasEverReady; }
-  /// For a person: the socket's path and what is wrong with it.
+  /// For a person: the socket's path and what is wrong with it; empty when there was no memory for it.
   const std::string& problem() const noexcept { return _problem; }
 
   /// Only when ready. After SendResult::Disconnected call `lose`.
@@ -43,7 +43,7 @@ class DaemonLink {
   /// Does what the socket is ready for.
   [[nodiscard]] Change process(Time now);
   /// Gives the connection up. Handlers of answers still owed run before this returns.
-  void lose(Time now, const std::string& cause);
+  void lose(Time now, const char* cause) noexcept;
 
   /// For poll(); -1 when away.
   int descriptor() const { return _bus ? _bus->fd() : -1; }

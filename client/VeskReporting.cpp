@@ -1,5 +1,6 @@
 #include <VeskReporting/VeskReporting.h>
 
+#include <cerrno>
 #include <cstring>
 #include <exception>
 
@@ -68,6 +69,11 @@ ClientCall makeMessageOnce(Dictionary& sessionInfo, std::optional<Dictionary>& u
                            std::uint16_t category, std::uint16_t type, std::optional<Dictionary>& payload) {
   return makeCall(wire::kSendMessageWithSessionInfo, std::move(sessionInfo), std::move(userInfo), category,
                   type, std::move(payload));
+}
+
+ReportingStatus statusOf(const FileToUpload& file) noexcept {
+  bool isScarce = file.error == EMFILE || file.error == ENFILE || file.error == ENOMEM;
+  return isScarce ? ReportingStatus::OutOfResources : ReportingStatus::FileUnavailable;
 }
 
 ClientCall makeUpload(FileToUpload& file) {
@@ -197,16 +203,24 @@ ReportingResult<MessageAnswer> VeskReporting::flushMessagesAndWait(Timeout timeo
 }
 
 ReportingResult<bool> VeskReporting::uploadFile(const std::string& path, Timeout timeout) noexcept {
-  FileToUpload file = openToUpload(path);
-  if (!file.descriptor) return {ReportingStatus::FileUnavailable, false, std::strerror(file.error)};
-  return wait<bool>(_implementation, timeout, [&] { return makeUpload(file); });
+  try {
+    FileToUpload file = openToUpload(path);
+    if (!file.descriptor) return {statusOf(file), false, std::strerror(file.error)};
+    return wait<bool>(_implementation, timeout, [&] { return makeUpload(file); });
+  } catch (const std::exception&) {
+    return {ReportingStatus::OutOfResources, false, {}};
+  }
 }
 
 ReportingStatus VeskReporting::uploadFile(const std::string& path, ReportingCallback<bool> callback,
                                           Timeout timeout) noexcept {
-  FileToUpload file = openToUpload(path);
-  if (!file.descriptor) return ReportingStatus::FileUnavailable;
-  return ask<bool>(_implementation, callback, timeout, [&] { return makeUpload(file); });
+  try {
+    FileToUpload file = openToUpload(path);
+    if (!file.descriptor) return statusOf(file);
+    return ask<bool>(_implementation, callback, timeout, [&] { return makeUpload(file); });
+  } catch (const std::exception&) {
+    return ReportingStatus::OutOfResources;
+  }
 }
 
 ReportingResult<bool> VeskReporting::uploadLogData(List logData, Timeout timeout) noexcept {

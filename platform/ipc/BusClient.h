@@ -7,6 +7,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <string_view>
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/ipc/IPCConnection.h"
@@ -22,14 +23,15 @@ class BusAnswer {
  public:
   /// Answered with arguments.
   explicit BusAnswer(BusDecoder& arguments) noexcept : _arguments(&arguments) {}
-  BusAnswer(std::string errorName, std::string errorText)
-      : _errorName(std::move(errorName)), _errorText(std::move(errorText)) {}
+  /// Answered with an error, whose texts outlive this.
+  BusAnswer(std::string_view errorName, std::string_view errorText) noexcept
+      : _errorName(errorName), _errorText(errorText) {}
 
   bool isError() const noexcept { return _arguments == nullptr; }
   /// D-Bus error name; "org.freedesktop.DBus.Error.NoReply" also when the time ran out and
   /// "org.freedesktop.DBus.Error.Disconnected" when the connection ended first.
-  const std::string& errorName() const noexcept { return _errorName; }
-  const std::string& errorText() const noexcept { return _errorText; }
+  std::string_view errorName() const noexcept { return _errorName; }
+  std::string_view errorText() const noexcept { return _errorText; }
 
   /// Reads the next argument (the types: BusDecoder::read). False for an error and for a wrong type.
   bool read(bool& out);
@@ -40,8 +42,8 @@ class BusAnswer {
 
  private:
   BusDecoder* _arguments = nullptr;
-  std::string _errorName;
-  std::string _errorText;
+  std::string_view _errorName;
+  std::string_view _errorText;
 };
 
 /// Owned and used by one thread, whose poll loop waits for `fd` with `events` and `timeout` and then calls
