@@ -4,6 +4,7 @@
 #include <VeskReporting/VeskReportingTypes.h>
 
 #include <condition_variable>
+#include <exception>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -27,10 +28,16 @@ template <class Answer>
 std::shared_ptr<CallEnd> endFor(ReportingCallback<Answer> callback) {
   return std::make_shared<CallEnd>(
       [callback = std::move(callback)](ReportingStatus status, BusAnswer* answer, std::string_view detail) {
-        ReportingResult<Answer> result{status, {}, std::string(detail)};
-        if (answer && !readAnswer(*answer, result.answer)) {
-          result.status = ReportingStatus::Refused;
-          result.detail = "the daemon's answer is of another type";
+        ReportingResult<Answer> result{status, {}, {}};
+        try {
+          result.detail = detail;
+          if (answer && !readAnswer(*answer, result.answer)) {
+            result.status = ReportingStatus::Refused;
+            result.detail = "the daemon's answer is of another type";
+          }
+        } catch (const std::exception&) {
+          // The callback is called all the same: without the words, or without the answer.
+          result = {answer ? ReportingStatus::OutOfResources : status, {}, {}};
         }
         callback(std::move(result));
       });

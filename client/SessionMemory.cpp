@@ -1,5 +1,7 @@
 #include "client/SessionMemory.h"
 
+#include <utility>
+
 namespace vesk {
 
 namespace {
@@ -9,32 +11,28 @@ constexpr std::size_t kUserInfoOfStates = 0;
 
 }  // namespace
 
-void SessionMemory::note(const ClientCall& call) {
-  switch (call.effect) {
+void SessionMemory::sent(IPCOutgoingCall&& call, CallEffect effect) noexcept {
+  switch (effect) {
     case CallEffect::None:
       break;
     case CallEffect::Configures:
-      _configuration = call.call;
-      _aggregation = call.aggregation;
+      _configuration = std::move(call);
       _isConfigured = true;
       break;
     case CallEffect::Starts:
-      _start = call.call;
+      _start = std::move(call);
       _isStarted = true;
       break;
     case CallEffect::ChangesUserInfo:
       if (_isConfigured) {
-        _configuration.arguments[kUserInfoOfConfiguration] = call.call.arguments[kUserInfoOfStates];
+        _configuration.arguments[kUserInfoOfConfiguration] = std::move(call.arguments[kUserInfoOfStates]);
       }
       break;
   }
 }
 
-std::vector<IPCOutgoingCall> SessionMemory::replay() const {
-  std::vector<IPCOutgoingCall> calls;
-  if (_isConfigured) calls.push_back(_configuration);
-  if (_isStarted) calls.push_back(_start);
-  return calls;
+std::array<const IPCOutgoingCall*, 2> SessionMemory::replay() const noexcept {
+  return {_isConfigured ? &_configuration : nullptr, _isStarted ? &_start : nullptr};
 }
 
 }  // namespace vesk

@@ -115,7 +115,8 @@ void SessionWorker::endEverything() noexcept {
 // --- What comes in
 
 void SessionWorker::takeCalls() {
-  _queue.takeAll(_taken);
+  // What could not be moved on for want of memory comes before what was queued since.
+  if (_taken.empty()) _queue.takeAll(_taken);
   _isNapping = !_taken.empty();
   if (!_taken.empty() && _urgency == DaemonLink::Urgency::WhenDue) _urgency = DaemonLink::Urgency::Early;
   _waiting.append(_taken);
@@ -124,8 +125,9 @@ void SessionWorker::takeCalls() {
 void SessionWorker::takeRequests() {
   MutexLock lock(_mutex);
   if (!_newRequests.empty() || _newDrainDeadline) _urgency = DaemonLink::Urgency::AtOnce;
-  for (auto& request : std::exchange(_newRequests, {})) _requests.push_back(std::move(request));
   if (_newDrainDeadline) _drainDeadline = std::exchange(_newDrainDeadline, std::nullopt);
+  _requests.reserve(_requests.size() + _newRequests.size());
+  for (auto& request : std::exchange(_newRequests, {})) _requests.push_back(std::move(request));
 }
 
 // Here and not where the call was refused: a log may have a host's sink behind it, which takes its time.
@@ -195,16 +197,23 @@ void SessionWorker::linkHasChanged(DaemonLink::Change change) {
   VESK_LOG_DEBUG("VeskReporting: %s", _link.problem().c_str());
   // What the socket had not taken whole, the daemon has not seen: a one-way call is sent again. A call that
   // wants an answer has learnt of the loss already.
-  if (_callsInBus > 0 && _waiting.front().wantsAnswer()) frontHasLeft();
+  if (_callsInBus > 0 && _waiting.front().wantsAnswer()) frontWasSent();
   _callsInBus = 0;
   _isHopeless = _drainDeadline && !_link.wasEverReady();
   endRequests(ReportingStatus::NotConnected, _link.problem());
 }
 
+// A daemon that does not know who we are must not get a message: without memory to tell it, try again later.
 void SessionWorker::introduceAgain() {
-  for (const IPCOutgoingCall& call : _memory.replay()) {
-    if (_link.bus().send(call) == BusClient::SendResult::Disconnected) return connectionBroke(Clock::now());
+  bool isTold = true;
+  try {
+    for (const IPCOutgoingCall* call : _memory.replay()) {
+      isTold = isTold && (!call || _link.bus().send(*call) != BusClient::SendResult::Disconnected);
+    }
+  } catch (const std::exception&) {
+    isTold = false;
   }
+  if (!isTold) connectionBroke(Clock::now());
 }
 
 // --- Sending
@@ -277,8 +286,8 @@ void SessionWorker::sendFront(Time now) {
   }
 }
 
-void SessionWorker::handedOver(ClientCall& call) {
-  _memory.note(call);
+void SessionWorker::handedOver(const ClientCall& call) noexcept {
+  _memory.sending(call);
   ++_callsInBus;
 }
 
@@ -290,8 +299,13 @@ void SessionWorker::connectionBroke(Time now) {
 void SessionWorker::callsHaveLeft() {
   if (_callsInBus == 0) return;
   std::size_t held = std::min(_callsInBus, _link.bus().queuedMessages());
-  for (std::size_t left = std::exchange(_callsInBus, held) - held; left > 0; --left) frontHasLeft();
+  for (std::size_t left = std::exchange(_callsInBus, held) - held; left > 0; --left) frontWasSent();
   if (_callsGone >= kCallsPerWrite) giveRoomBack();
+}
+
+void SessionWorker::frontWasSent() noexcept {
+  _memory.sent(std::move(_waiting.front().call), _waiting.front().effect);
+  frontHasLeft();
 }
 
 void SessionWorker::frontHasLeft() noexcept {
@@ -312,11 +326,10 @@ void SessionWorker::sayFarewell(Time now) {
   bool isTime = _drainDeadline && _farewell == Farewell::NotYet && _link.isReady() && _waiting.empty() &&
                 _answersOwed == 0;
   if (!isTime) return;
-  _farewell = Farewell::Asked;
   auto result = _link.bus().send(
       {"org.freedesktop.DBus.Peer", "Ping", {}}, [this](BusAnswer&) { _farewell = Farewell::Answered; },
       std::chrono::ceil<std::chrono::milliseconds>(*_drainDeadline - now));
-  if (result != BusClient::SendResult::Sent) _farewell = Farewell::Answered;
+  _farewell = result == BusClient::SendResult::Sent ? Farewell::Asked : Farewell::Answered;
 }
 
 void SessionWorker::end(const std::shared_ptr<CallEnd>& end, ReportingStatus status, BusAnswer* answer,

@@ -70,9 +70,10 @@ class SessionWorker final : private ClientSessionReplyInterface {
   void sendWaiting(Time now);
   void sendTogether(Time now);
   void sendFront(Time now);
-  void handedOver(ClientCall& call);
+  void handedOver(const ClientCall& call) noexcept;
   void connectionBroke(Time now);
   void callsHaveLeft();
+  void frontWasSent() noexcept;
   void frontHasLeft() noexcept;
   void giveRoomBack() noexcept;
   void sayFarewell(Time now);

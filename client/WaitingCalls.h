@@ -41,8 +41,9 @@ class WaitingCalls {
     _answered += answered;
   }
 
-  /// Moves those whose answer is overdue to `overdue`, in order.
+  /// Moves those whose answer is overdue to `overdue`, in order. When it throws std::bad_alloc, all stay.
   void moveOverdue(std::vector<ClientCall>& overdue, ClientCall::Time now) {
+    overdue.reserve(_answered);
     removeGone();
     auto kept = _calls.begin();
     for (auto call = _calls.begin(); call != _calls.end(); ++call) {

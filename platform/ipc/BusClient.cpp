@@ -148,7 +148,12 @@ BusClient::SendResult BusClient::Implementation::send(const IPCOutgoingCall& cal
   auto pending = _pending.end();
   if (handler) pending = _pending.insert(_pending.end(), {this, std::move(handler)});
   if (!isReady() || !_outbox.empty() || !_deferred.empty()) {
-    _deferred.push_back({std::move(message), pending, timeout});
+    try {
+      _deferred.push_back({std::move(message), pending, timeout});
+    } catch (...) {
+      if (pending != _pending.end()) _pending.erase(pending);
+      throw;
+    }
     return SendResult::Sent;
   }
   if (write(message.get(), pending, timeout)) return SendResult::Sent;

@@ -232,6 +232,16 @@ const std::string& OneWayEncoder::headerFor(const IPCOutgoingCall& call, const s
 
 CodecResult OneWayEncoder::append(const IPCOutgoingCall& call, std::uint32_t serial, std::string& out) {
   const std::size_t start = out.size();
+  try {
+    return appendTo(out, start, call, serial);
+  } catch (...) {
+    out.resize(start);  // or else the half of a message would be sent
+    throw;
+  }
+}
+
+CodecResult OneWayEncoder::appendTo(std::string& out, std::size_t start, const IPCOutgoingCall& call,
+                                    std::uint32_t serial) {
   _signature.clear();
   for (const auto& argument : call.arguments) _signature += kSignatures[argument.index()];
   out += headerFor(call, _signature);

@@ -23,8 +23,8 @@ class OneWayEncoder {
   explicit OneWayEncoder(std::string objectPath, CodecLimits limits = {})
       : _objectPath(std::move(objectPath)), _limits(limits) {}
 
-  /// Appends a message to `out`. Unless it returns Ok, `out` is as before. The call's names are constants:
-  /// what was made of them is kept.
+  /// Appends a message to `out`. Unless it returns Ok, `out` is as before, also when it throws
+  /// std::bad_alloc. The call's names are constants: what was made of them is kept.
   CodecResult append(const IPCOutgoingCall& call, std::uint32_t serial, std::string& out);
 
   /// Whether `call`, sent in any way, would be too long a message.
@@ -42,6 +42,8 @@ class OneWayEncoder {
     std::string bytes;  ///< without body length and serial
   };
 
+  CodecResult appendTo(std::string& out, std::size_t start, const IPCOutgoingCall& call,
+                       std::uint32_t serial);
   const std::string& headerFor(const IPCOutgoingCall& call, const std::string& signature);
 
   const std::string _objectPath;

@@ -14,8 +14,15 @@ constexpr std::uint32_t kSerials = 0x8000'0000;
 }  // namespace
 
 CodecResult OneWayOutbox::add(const IPCOutgoingCall& call) {
+  const std::size_t start = _buffer.size();
   CodecResult result = _encoder.append(call, kSerials | ++_serial, _buffer);
-  if (result == CodecResult::Ok) _ends.push_back(_buffer.size());
+  if (result != CodecResult::Ok) return result;
+  try {
+    _ends.push_back(_buffer.size());
+  } catch (...) {
+    _buffer.resize(start);
+    throw;
+  }
   return result;
 }
 

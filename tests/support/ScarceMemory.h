@@ -1,0 +1,55 @@
+// Memory that runs out on one thread. Include it in the one source file of a test program that replaces
+// operator new.
+#pragma once
+
+#include <sys/prctl.h>
+
+#include <atomic>
+#include <cstdlib>
+#include <cstring>
+#include <new>
+
+namespace vesk::test {
+
+/// While it lives, the `n`th allocation on a thread fails, and those after it too when it is lasting.
+class ScarceMemory {
+ public:
+  /// On the calling thread, or on that of this name.
+  explicit ScarceMemory(long n, bool lasting = false, const char* thread = nullptr) {
+    if (!thread) ::prctl(PR_GET_NAME, _caller);
+    _left = n;
+    _isLasting = lasting;
+    _victim = thread ? thread : _caller;
+  }
+  ~ScarceMemory() { _victim = nullptr; }
+  ScarceMemory(const ScarceMemory&) = delete;
+  ScarceMemory& operator=(const ScarceMemory&) = delete;
+
+  static bool hasRunOut() { return _left <= 0; }
+
+  static bool runsOut() {
+    const char* victim = _victim;
+    if (!victim) return false;
+    char name[16] = "";
+    ::prctl(PR_GET_NAME, name);
+    if (std::strcmp(name, victim) != 0) return false;
+    const long left = --_left;
+    return left == 0 || (left < 0 && _isLasting);
+  }
+
+ private:
+  static inline std::atomic<const char*> _victim{nullptr};
+  static inline std::atomic<long> _left{1};
+  static inline std::atomic<bool> _isLasting{false};
+  static inline char _caller[16] = "";
+};
+
+}  // namespace vesk::test
+
+void* operator new(std::size_t size) {
+  void* memory = vesk::test::ScarceMemory::runsOut() ? nullptr : std::malloc(size > 0 ? size : 1);
+  if (!memory) throw std::bad_alloc();
+  return memory;
+}
+void operator delete(void* memory) noexcept { std::free(memory); }
+void operator delete(void* memory, std::size_t) noexcept { std::free(memory); }
