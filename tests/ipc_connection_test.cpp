@@ -1,6 +1,9 @@
 // The daemon's and the client's end of the IPC layer over real sockets: calls, answers, life cycle.
 #include <gtest/gtest.h>
 #include <sys/socket.h>
+#include <sys/wait.h>
+
+#include <csignal>
 
 #include <future>
 
@@ -140,6 +143,27 @@ TEST(IPCConnection, HangingUpInvalidatesThenDestroys) {
   EXPECT_TRUE(service.journal.waitFor("destroyed"));
   EXPECT_EQ(service.journal.lines(),
             (std::vector<std::string>{"accepted", "message 1", "invalidated", "destroyed"}));
+}
+
+TEST(IPCConnection, EndsWithTheProcessThatMadeItAndNotWithOneForkedFromThat) {
+  TestService service;
+  std::optional<TestClient> client(std::in_place, service);
+  ASSERT_EQ(client->call("flushMessagesWithReply"), "posted all");
+  auto fork = [&](const std::function<void()>& body) {
+    pid_t child = ::fork();
+    if (child == 0) {
+      body();
+      ::_exit(0);
+    }
+    return child;
+  };
+  ASSERT_GT(::waitpid(fork([&] { client.reset(); }), nullptr, 0), 0);
+  EXPECT_EQ(client->call("flushMessagesWithReply"), "posted all");
+  pid_t holder = fork([] { ::pause(); });
+  client.reset();
+  EXPECT_TRUE(service.journal.waitFor("destroyed"));
+  ::kill(holder, SIGKILL);
+  EXPECT_EQ(::waitpid(holder, nullptr, 0), holder);
 }
 
 TEST(IPCConnection, ServesWhatAClientSentBeforeItLeftItsAnswersUnread) {

@@ -1,6 +1,7 @@
 #include "platform/ipc/BusClient.h"
 
 #include <poll.h>
+#include <sys/socket.h>
 
 #include <algorithm>
 #include <climits>
@@ -279,6 +280,9 @@ void BusClient::Implementation::end() noexcept {
   PendingList owed;
   owed.swap(_pending);
   for (auto& pending : owed) pending.slot.reset();
+  // A process forked from this one may hold the socket too, and would keep the session alive in the daemon.
+  // In that process sd-bus gives no descriptor.
+  if (int socket = fd(); socket >= 0) ::shutdown(socket, SHUT_RDWR);
   _bus.reset();
   for (auto& pending : owed) {
     call(pending.handler, BusAnswer(SD_BUS_ERROR_DISCONNECTED, "The connection has ended"));
