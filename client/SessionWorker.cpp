@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <exception>
+#include <new>
 #include <utility>
 
 #include "client/AggregationReceiver.h"
@@ -208,7 +209,9 @@ void SessionWorker::introduceAgain() {
   bool isTold = true;
   try {
     for (const IPCOutgoingCall* call : _memory.replay()) {
-      isTold = isTold && (!call || _link.bus().send(*call) != BusClient::SendResult::Disconnected);
+      if (!isTold || !call) continue;
+      auto result = _link.bus().send(*call);
+      isTold = result == BusClient::SendResult::Sent || result == BusClient::SendResult::Refused;
     }
   } catch (const std::exception&) {
     isTold = false;
@@ -244,6 +247,7 @@ void SessionWorker::sendTogether(Time now) {
     if (!call.isPlain()) break;
     auto result = bus.add(call.call);
     if (result == BusClient::SendResult::Disconnected) return connectionBroke(now);
+    if (result == BusClient::SendResult::OutOfResources) throw std::bad_alloc();  // later, then
     if (result == BusClient::SendResult::Sent) {
       handedOver(call);
     } else if (_callsInBus > 0) {
@@ -280,6 +284,10 @@ void SessionWorker::sendFront(Time now) {
     case BusClient::SendResult::Refused:
       _drops.invalid();
       end(front.end, ReportingStatus::InvalidArgument, nullptr, "");
+      return frontHasLeft();
+    case BusClient::SendResult::OutOfResources:
+      _drops.unsent();
+      end(front.end, ReportingStatus::OutOfResources, nullptr, "");
       return frontHasLeft();
     case BusClient::SendResult::Disconnected:
       return connectionBroke(now);

@@ -1,3 +1,6 @@
+#include <sys/resource.h>
+#include <unistd.h>
+
 #include <future>
 
 #include "tests/support/ClientHarness.h"
@@ -154,6 +157,27 @@ TEST_F(ClientSession, RefusesWhatCannotBeSentAndGoesOn) {
   EXPECT_EQ(session.drops().invalid, 3U);
   EXPECT_EQ(session.uploadFile(directory / "missing").status, ReportingStatus::FileUnavailable);
   EXPECT_EQ(session.uploadFile(directory.path()).detail, "Is a directory");
+}
+
+TEST_F(ClientSession, TellsOfTheLastDescriptorThatTheFileTook) {
+  auto file = directory.write("file", "contents");
+  VeskReporting session(options());
+  ASSERT_TRUE(session.connect());
+  rlimit before{};
+  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &before), 0);
+  const rlimit few{256, before.rlim_max};
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &few), 0);
+  std::vector<FileDescriptor> taken;
+  do taken.emplace_back(::dup(0));
+  while (taken.back());
+  for (int left : {0, 1}) {
+    if (left == 1) taken.erase(taken.end() - 2);
+    EXPECT_EQ(session.uploadFile(file).status, ReportingStatus::OutOfResources) << left;
+  }
+  taken.clear();
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &before), 0);
+  EXPECT_TRUE(session.uploadFile(file).answer);
+  EXPECT_EQ(session.drops().invalid, 0U);
 }
 
 TEST_F(ClientSession, ManyThreadsSendThroughOneSession) {

@@ -132,7 +132,7 @@ BusMessageHandle BusClient::Implementation::encode(const IPCOutgoingCall& call, 
   for (const auto& argument : call.arguments) encoder.append(argument);
   result = encoder.result();
   // The daemon ends the connection of whoever sends it a message that is too long.
-  if (encoder.content() > kSurelyShort && OneWayEncoder(_objectPath).isTooLong(call)) {
+  if (encoder.ok() && encoder.content() > kSurelyShort && OneWayEncoder(_objectPath).isTooLong(call)) {
     result = CodecResult::LimitExceeded;
   }
   return message;
@@ -144,6 +144,7 @@ BusClient::SendResult BusClient::Implementation::send(const IPCOutgoingCall& cal
   CodecResult result = CodecResult::Ok;
   BusMessageHandle message = encode(call, static_cast<bool>(handler), result);
   if (!message) return SendResult::Disconnected;
+  if (result == CodecResult::OutOfResources) return SendResult::OutOfResources;
   if (result != CodecResult::Ok) return SendResult::Refused;
 
   auto pending = _pending.end();

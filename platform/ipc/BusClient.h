@@ -57,9 +57,10 @@ class BusClient {
   };
 
   enum class SendResult {
-    Sent,         ///< written or queued
-    Refused,      ///< the arguments are too large, too deep or no valid text: no receiver would take them
-    Disconnected  ///< the connection has ended; make a new BusClient
+    Sent,            ///< written or queued
+    Refused,         ///< the arguments are too large, too deep or no valid text: no receiver would take them
+    OutOfResources,  ///< no memory or no descriptor was left for the message; nothing was sent
+    Disconnected     ///< the connection has ended; make a new BusClient
   };
 
   enum class Progress { Connected, Disconnected };

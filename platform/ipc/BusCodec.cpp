@@ -40,6 +40,8 @@ const char* describe(CodecResult result) noexcept {
       return "the arguments are too deep, too many or too large";
     case CodecResult::Malformed:
       return "the arguments are malformed";
+    case CodecResult::OutOfResources:
+      return "no memory or no descriptor is left for the arguments";
   }
   return "unknown error";
 }

@@ -25,7 +25,8 @@ enum class CodecResult {
   Ok,
   WrongType,      ///< the arguments are not of the types asked for, or hold a type that no value has
   LimitExceeded,  ///< too deep, too many values or too large
-  Malformed       ///< bytes that are no D-Bus message, or text that is not UTF-8 or holds a NUL
+  Malformed,      ///< bytes that are no D-Bus message, or text that is not UTF-8 or holds a NUL
+  OutOfResources  ///< no memory or no descriptor was left to write them with
 };
 
 const char* describe(CodecResult result) noexcept;

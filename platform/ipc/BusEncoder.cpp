@@ -19,9 +19,12 @@ bool BusEncoder::fail(CodecResult result) noexcept {
   return false;
 }
 
-// The calls below name their types themselves, so what sd-bus refuses is what it has no room for: memory, or
-// a container too many.
-bool BusEncoder::failWith(int) noexcept { return fail(CodecResult::LimitExceeded); }
+// The calls below name their types themselves, so what sd-bus refuses is what it has no room for: memory, the
+// duplicate of a descriptor, or a container too many.
+bool BusEncoder::failWith(int error) noexcept {
+  bool isScarce = error == -ENOMEM || error == -EMFILE;
+  return fail(isScarce ? CodecResult::OutOfResources : CodecResult::LimitExceeded);
+}
 
 bool BusEncoder::count(std::size_t content) {
   if (!ok()) return false;

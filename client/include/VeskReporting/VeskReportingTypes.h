@@ -90,7 +90,7 @@ struct ReportingOptions {
 struct ReportingDrops {
   std::uint64_t queueFull = 0;  ///< refused with QueueFull
   std::uint64_t invalid = 0;    ///< could not be encoded
-  std::uint64_t unsent = 0;     ///< still queued when their time or the session ended
+  std::uint64_t unsent = 0;     ///< still queued when their time or the session ended, or no descriptor left
 
   std::uint64_t total() const noexcept { return queueFull + invalid + unsent; }
 };
