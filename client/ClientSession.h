@@ -3,13 +3,13 @@
 
 #include <VeskReporting/VeskReportingTypes.h>
 
-#include <algorithm>
 #include <chrono>
 #include <memory>
 #include <utility>
 #include <variant>
 
 #include "client/Answers.h"
+#include "client/BoundedWait.h"
 #include "client/ClientCall.h"
 #include "client/SessionThread.h"
 
@@ -67,8 +67,7 @@ class ClientSession {
 
  private:
   static ClientCall::Time deadlineAfter(Timeout timeout) noexcept {
-    constexpr Timeout kLongest = std::chrono::hours(24);
-    return std::chrono::steady_clock::now() + std::clamp(timeout, Timeout(0), kLongest);
+    return std::chrono::steady_clock::now() + boundedWait(timeout);
   }
 
   ReportingStatus push(ClientCall&& call) {

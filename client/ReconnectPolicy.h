@@ -4,6 +4,8 @@
 #include <algorithm>
 #include <chrono>
 
+#include "client/BoundedWait.h"
+
 namespace vesk {
 
 /// Waits grow from the first to the last, doubling with each failure. While one runs, a message that is
@@ -16,7 +18,9 @@ class ReconnectPolicy {
   using Wait = std::chrono::milliseconds;
 
   ReconnectPolicy(Wait first, Wait last)
-      : _first(std::max(first, Wait{1})), _last(std::max(last, _first)), _wait(_first) {}
+      : _first(std::max(boundedWait(first), Wait{1})),
+        _last(std::max(boundedWait(last), _first)),
+        _wait(_first) {}
 
   /// When the next attempt is due; the past before the first failure.
   Time due() const noexcept { return _due; }

@@ -8,6 +8,7 @@
 #include <utility>
 
 #include "client/AggregationReceiver.h"
+#include "client/BoundedWait.h"
 #include "client/protocol/WireNames.h"
 #include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
@@ -38,7 +39,7 @@ std::string socketOf(const ReportingOptions& options) {
 }  // namespace
 
 SessionWorker::SessionWorker(const ReportingOptions& options)
-    : _drainTime(options.drainTime),
+    : _drainTime(boundedWait(options.drainTime)),
       _queue(options.maximumQueuedMessages, options.maximumQueuedBytes),
       _link(socketOf(options), ReconnectPolicy(options.firstReconnectWait, options.lastReconnectWait),
             std::make_shared<AggregationReceiver>(static_cast<ClientSessionReplyInterface&>(*this))) {}
