@@ -55,6 +55,8 @@ class PendingAnswer {
     _isSet.notify_one();
   }
 
+  /// Returns a tenth of a second after the deadline at the latest, when a callback holds the session's
+  /// thread.
   ReportingResult<Answer> wait(ClientCall::Time deadline) {
     // The session's thread knows better why there is no answer in time; it is given a moment to say so.
     constexpr std::chrono::milliseconds kGrace{100};

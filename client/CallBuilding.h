@@ -31,7 +31,8 @@ struct FileToUpload {
   int error = 0;              ///< errno; EINVAL for what is no regular file
 };
 
-/// Never waits, whatever stands under that name.
+/// Waits for no peer, whatever stands under that name (a pipe, a terminal); but a file system over a network
+/// or in user space may take its time. Throws std::bad_alloc.
 FileToUpload openToUpload(const std::string& path);
 
 }  // namespace vesk

@@ -13,12 +13,14 @@ namespace vesk {
 
 namespace {
 
-// While it lives, threads that are started take no signals: those are the host's business.
+// While it lives, threads that are started take no signals: those are the host's business. Only what a fault
+// in a callback raises stays as it is: the kernel would end the process past the host's handler.
 class NoSignals {
  public:
   NoSignals() noexcept {
     sigset_t all;
     ::sigfillset(&all);
+    for (int fault : {SIGSEGV, SIGBUS, SIGFPE, SIGILL, SIGTRAP, SIGABRT, SIGSYS}) ::sigdelset(&all, fault);
     ::pthread_sigmask(SIG_SETMASK, &all, &_before);
   }
   ~NoSignals() { ::pthread_sigmask(SIG_SETMASK, &_before, nullptr); }

@@ -1,5 +1,6 @@
 #include <VeskReporting/VeskReporting.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <exception>
@@ -79,7 +80,7 @@ ReportingStatus statusOf(const FileToUpload& file) noexcept {
 ClientCall makeUpload(FileToUpload& file) {
   ClientCall call = makeCall(wire::kUploadFile, std::move(file.url), IPCDescriptor{file.descriptor.get()});
   call.descriptor = std::move(file.descriptor);
-  call.memory += kMemoryOfDescriptor;
+  call.memory = std::max(call.memory, kMemoryOfDescriptor);
   return call;
 }
 

@@ -1,6 +1,8 @@
 #include <VeskReporting/VeskReporting.h>
 #include <VeskReporting/VeskReportingLogging.h>
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -9,6 +11,7 @@
 
 #include "client/common/PersistentIdentifiers.h"
 #include "client/common/Resources.h"
+#include "platform/files/FileDescriptor.h"
 #include "platform/files/RootPrefix.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/TempDirectory.h"
@@ -108,13 +111,17 @@ TEST(ClientIdentifiers, AFileThatCannotBeUnderstoodIsKeptAside) {
 
 TEST(ClientIdentifiers, LiveAsLongAsTheProcessWhenTheyCannotBeKept) {
   TempDirectory directory;
-  CapturedLog log;
   directory.write("lib", "a file where a directory should be");
-  PersistentIdentifiers identifiers(directory / "lib/identifiers.toml");
-  std::string made = identifiers.identifier(true);
-  EXPECT_EQ(made.size(), 36U);
-  EXPECT_EQ(identifiers.identifier(true), made);
-  EXPECT_EQ(log.lines().size(), 1U);
+  FileDescriptor lock(::open(directory.write("identifiers.toml.lock", "").c_str(), O_RDWR | O_CLOEXEC));
+  ASSERT_EQ(::flock(lock.get(), LOCK_EX), 0);
+  for (const char* path : {"lib/identifiers.toml", "identifiers.toml"}) {
+    CapturedLog log;
+    PersistentIdentifiers identifiers(directory / path);
+    std::string made = identifiers.identifier(true);
+    EXPECT_EQ(made.size(), 36U);
+    EXPECT_EQ(identifiers.identifier(true), made);
+    EXPECT_EQ(log.lines().size(), 1U);
+  }
 }
 
 TEST(ClientIdentifiers, TheLibraryKeepsThemUnderTheRoot) {

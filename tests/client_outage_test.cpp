@@ -110,6 +110,10 @@ TEST_F(ClientOutage, DropsAndCountsWhatDoesNotFit) {
     EXPECT_EQ(session.droppedMessages(), 20 - c.fitting);
     EXPECT_EQ(session.drops().queueFull, 20 - c.fitting);
   }
+  VeskReporting session(options());
+  int files = 0;
+  while (files < 20 && session.uploadFile("/proc/self/exe", nullptr) == ReportingStatus::Queued) ++files;
+  EXPECT_EQ(files, 16);
 }
 
 TEST_F(ClientOutage, LogsOfDropsWithoutHarmToAHostWhoseStandardErrorNobodyReads) {

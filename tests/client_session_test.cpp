@@ -1,6 +1,7 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
+#include <csignal>
 #include <future>
 
 #include "tests/support/ClientHarness.h"
@@ -119,8 +120,10 @@ TEST_F(ClientSession, HandsAggregatedMessagesToTheHandler) {
 
 TEST_F(ClientSession, CallbacksMayUseTheSessionButNotWait) {
   Caught<ReportingStatus> inner;
+  sigset_t blocked;
   VeskReporting session(options());
   EXPECT_EQ(session.startConfig([&](const auto&) {
+    ::pthread_sigmask(SIG_BLOCK, nullptr, &blocked);
     auto sent = session.sendMessage(1, 1);
     auto waited = session.fetchDisplayURL().status;
     inner.promise.set_value({sent, waited, {}});
@@ -129,6 +132,8 @@ TEST_F(ClientSession, CallbacksMayUseTheSessionButNotWait) {
   auto result = inner.get();
   EXPECT_EQ(result.status, ReportingStatus::Queued);
   EXPECT_EQ(result.answer, ReportingStatus::OnSessionThread);
+  EXPECT_TRUE(sigismember(&blocked, SIGTERM)) << "signals are the host's";
+  EXPECT_FALSE(sigismember(&blocked, SIGSEGV)) << "faults are the callback's";
   EXPECT_TRUE(record.waitFor("message 1 1"));
 }
 

@@ -1,6 +1,7 @@
 #include "client/common/PersistentIdentifiers.h"
 
 #include <fcntl.h>
+#include <poll.h>
 #include <sys/file.h>
 #include <sys/random.h>
 #include <unistd.h>
@@ -54,12 +55,22 @@ bool isIdentifier(std::string_view text) {
   return true;
 }
 
-// Locks until it is destroyed, against other processes and other objects of this one.
+// Who holds the lock needs it for as long as a small file takes to be written.
+constexpr int kTriesToLock = 50;
+constexpr int kBetweenTries = 10;  // milliseconds
+
+// Locks until it is destroyed, against other processes and other objects of this one. None, with errno, when
+// another keeps the lock.
 FileDescriptor lockFile(const std::string& path) {
   FileDescriptor file(::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
-  if (!file) return file;
-  while (::flock(file.get(), LOCK_EX) != 0) {
-    if (errno != EINTR) return {};
+  for (int tries = 1; file && ::flock(file.get(), LOCK_EX | LOCK_NB) != 0; ++tries) {
+    const int cause = errno;
+    if (cause == EWOULDBLOCK && tries < kTriesToLock) {
+      ::poll(nullptr, 0, kBetweenTries);
+      continue;
+    }
+    file.reset();
+    errno = cause;
   }
   return file;
 }

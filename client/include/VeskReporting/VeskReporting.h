@@ -22,7 +22,8 @@ namespace vesk {
 ///
 /// Three forms: a call that returns `ReportingStatus` and takes no callback is sent one way; one with a
 /// callback returns Queued at once and delivers its result later; one that returns a `ReportingResult` waits
-/// at most `timeout`. A timeout counts from the call and covers the time in the queue.
+/// at most `timeout`, and a tenth of a second more while a callback holds the session's thread. A timeout
+/// counts from the call and covers the time in the queue.
 class VESK_API VeskReporting {
  public:
   static constexpr std::chrono::milliseconds kDefaultTimeout{30'000};
@@ -87,8 +88,9 @@ class VESK_API VeskReporting {
   ReportingResult<MessageAnswer> flushMessagesAndWait(
       std::chrono::milliseconds timeout = kDefaultTimeout) noexcept;
 
-  /// 8. Uploads a file: it is opened here, by the caller, and the daemon gets the open descriptor, so it must
-  /// be readable for the caller only. The answer says whether a backend took it.
+  /// 8. Uploads a file: it is opened here, by the caller (which takes as long as its file system takes), and
+  /// the daemon gets the open descriptor, so it must be readable for the caller only. The answer says whether
+  /// a backend took it.
   ReportingResult<bool> uploadFile(const std::string& path,
                                    std::chrono::milliseconds timeout = kDefaultTimeout) noexcept;
   ReportingStatus uploadFile(const std::string& path, ReportingCallback<bool> callback,
