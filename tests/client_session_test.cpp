@@ -89,10 +89,10 @@ TEST_F(ClientSession, TellsNoStorebagFromNoEnabledBackend) {
 }
 
 TEST_F(ClientSession, HandsAggregatedMessagesToTheHandler) {
-  std::promise<AggregatedMessage> first, closing;
+  Caught<AggregatedMessage> first, closing;
   VeskReporting session(options());
   auto handler = [&](const AggregatedMessage& message) {
-    (message.isClosing() ? closing : first).set_value(message);
+    (message.isClosing() ? closing : first).promise.set_value({ReportingStatus::Done, message, {}});
     if (message.isClosing()) throw std::runtime_error("handlers should not");
   };
   EXPECT_EQ(session.setSessionInfo(sessionInfo, std::nullopt, {}, handler), ReportingStatus::Queued);
@@ -101,13 +101,14 @@ TEST_F(ClientSession, HandsAggregatedMessagesToTheHandler) {
 
   daemon->sendToClient(sessionInfo, 12.5, 3, 4, Dictionary{{"k", 1}});
   daemon->sendToClient(std::nullopt, 0, 0, 0, std::nullopt);
-  auto message = first.get_future().get();
+  auto [arrived, message, detail] = first.get();
+  ASSERT_EQ(arrived, ReportingStatus::Done) << testing::PrintToString(record.lines());
   EXPECT_EQ(message.sessionInfo, sessionInfo);
   EXPECT_EQ(message.timestamp, 12.5);
   EXPECT_EQ(message.category, 3);
   EXPECT_EQ(message.type, 4);
   EXPECT_EQ(message.payload, (Dictionary{{"k", 1}}));
-  EXPECT_FALSE(closing.get_future().get().sessionInfo);
+  EXPECT_TRUE(closing.get()) << testing::PrintToString(record.lines());
   EXPECT_TRUE(session.startConfig()) << "an exception ended the session";
 }
 
