@@ -1,46 +1,9 @@
 // The HTTP client when memory runs out: what was asked for ends, and what is asked for next succeeds.
 #include <gtest/gtest.h>
-#include <sys/prctl.h>
-
-#include <atomic>
-#include <cstdlib>
-#include <cstring>
-#include <new>
 
 #include "tests/support/HTTPRequests.h"
 #include "tests/support/RecordingServer.h"
-
-namespace {
-
-enum class Victim : unsigned char { Nobody, ClientThread, Caller };
-
-std::atomic<Victim> victim{Victim::Nobody};
-std::atomic<bool> lasting{false};
-std::atomic<long> allocationsLeft{0};
-thread_local bool isCaller = false;
-
-bool isVictim() {
-  if (victim != Victim::ClientThread) return victim == Victim::Caller && isCaller;
-  char name[16] = "";
-  ::prctl(PR_GET_NAME, name);
-  return std::strcmp(name, "http") == 0;
-}
-
-bool runsOut() {
-  if (!isVictim()) return false;
-  const long left = --allocationsLeft;
-  return left == 0 || (left < 0 && lasting);
-}
-
-}  // namespace
-
-void* operator new(std::size_t size) {
-  void* memory = runsOut() ? nullptr : std::malloc(size > 0 ? size : 1);
-  if (!memory) throw std::bad_alloc();
-  return memory;
-}
-void operator delete(void* memory) noexcept { std::free(memory); }
-void operator delete(void* memory, std::size_t) noexcept { std::free(memory); }
+#include "tests/support/ScarceMemory.h"
 
 namespace vesk::test {
 namespace {
@@ -56,13 +19,13 @@ TEST(HTTPMemory, EveryRequestEndsAndTheNextSucceedsWhereverMemoryRunsOut) {
   const std::string gone = [] { return RecordingServer().url(); }();
   const struct {
     const char* what;
-    Victim victim;
+    const char* thread;
     bool lasting;
   } cases[] = {
-      {"once on the client's thread", Victim::ClientThread, false},
-      {"for long on the client's thread", Victim::ClientThread, true},
-      {"once on the caller's", Victim::Caller, false},
-      {"for long on the caller's", Victim::Caller, true},
+      {"once on the client's thread", "http", false},
+      {"for long on the client's thread", "http", true},
+      {"once on the caller's", nullptr, false},
+      {"for long on the caller's", nullptr, true},
   };
   for (const auto& test : cases) {
     long n = 0;
@@ -74,19 +37,16 @@ TEST(HTTPMemory, EveryRequestEndsAndTheNextSucceedsWhereverMemoryRunsOut) {
       fetch.headers = {{"X-Long", std::string(100, 'x')}};
       std::atomic<int> completions{0};
 
-      allocationsLeft = n;
-      lasting = test.lasting;
-      victim = test.victim;
-      isCaller = true;
+      std::optional<ScarceMemory> scarce(std::in_place, n, test.lasting, test.thread);
       for (auto& request : requests) {
         client.start(std::move(request), [&](const HTTPResult&) { ++completions; });
       }
       const HTTPResult result = client.perform(std::move(fetch));
-      isCaller = false;
+      if (!test.thread) scarce.reset();
       const bool isIdle = client.waitUntilIdle(20s);
-      victim = Victim::Nobody;
+      scarce.reset();
 
-      ranOut = allocationsLeft <= 0;
+      ranOut = ScarceMemory::hasRunOut();
       ASSERT_TRUE(isIdle);
       EXPECT_EQ(completions, 4);
       EXPECT_NE(result.response.has_value(), result.error.has_value());

@@ -16,32 +16,37 @@ class ScarceMemory {
  public:
   /// On the calling thread, or on that of this name.
   explicit ScarceMemory(long n, bool lasting = false, const char* thread = nullptr) {
-    if (!thread) ::prctl(PR_GET_NAME, _caller);
     _left = n;
     _isLasting = lasting;
-    _victim = thread ? thread : _caller;
+    _isHere = !thread;
+    _victim = thread;
   }
-  ~ScarceMemory() { _victim = nullptr; }
+  ~ScarceMemory() {
+    _isHere = false;
+    _victim = nullptr;
+  }
   ScarceMemory(const ScarceMemory&) = delete;
   ScarceMemory& operator=(const ScarceMemory&) = delete;
 
   static bool hasRunOut() { return _left <= 0; }
 
   static bool runsOut() {
-    const char* victim = _victim;
-    if (!victim) return false;
-    char name[16] = "";
-    ::prctl(PR_GET_NAME, name);
-    if (std::strcmp(name, victim) != 0) return false;
+    if (!_isHere && !isVictim()) return false;
     const long left = --_left;
     return left == 0 || (left < 0 && _isLasting);
   }
 
  private:
-  static inline std::atomic<const char*> _victim{nullptr};
+  static bool isVictim() {
+    const char* victim = _victim;
+    char name[16] = "";
+    return victim && ::prctl(PR_GET_NAME, name) == 0 && std::strcmp(name, victim) == 0;
+  }
+
+  static inline thread_local bool _isHere = false;
+  static inline std::atomic<const char*> _victim{nullptr};  ///< its name
   static inline std::atomic<long> _left{1};
   static inline std::atomic<bool> _isLasting{false};
-  static inline char _caller[16] = "";
 };
 
 }  // namespace vesk::test
