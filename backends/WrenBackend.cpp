@@ -28,6 +28,15 @@ void writeLine(int level, const char* line) {
   VESK_LOG(static_cast<LogLevel>(level), "WrenAdaptor: %s", line ? line : "");
 }
 
+/// Short, where there is no memory for more.
+std::string textOf(const char* problem) noexcept {
+  try {
+    return problem;
+  } catch (const std::bad_alloc&) {
+    return "out of memory";  // which fits into any string
+  }
+}
+
 /// Runs what an adaptor does. Whatever it throws ends here; the text of it comes back, or null when all went
 /// well.
 template <class Call>
@@ -36,9 +45,9 @@ std::optional<std::string> guarded(const Call& call) noexcept {
     call();
     return std::nullopt;
   } catch (const std::exception& error) {
-    return error.what();
+    return textOf(error.what());
   } catch (...) {
-    return "an exception of its own";
+    return textOf("an exception of its own");
   }
 }
 
