@@ -156,6 +156,7 @@ TEST(HTTPClient, VerifiesTheServerAgainstTheGivenAuthorities) {
   RecordingServer good({}, {.tls = authority.issueServerIdentity()});
   RecordingServer otherName({}, {.address = "127.0.0.2", .tls = authority.issueServerIdentity()});
   RecordingServer otherAuthority({}, {.tls = CertificateAuthority::generate().issueServerIdentity()});
+  RecordingServer expired({}, {.tls = authority.issueServerIdentity({}, 0)});
   std::string otherNameURL = "https://127.0.0.2:" + std::to_string(otherName.server().port());
 
   ::setenv("SSL_CERT_FILE", file.c_str(), 1);
@@ -166,15 +167,17 @@ TEST(HTTPClient, VerifiesTheServerAgainstTheGivenAuthorities) {
   EXPECT_TRUE(client.perform(postTo(good.url())).response);
   EXPECT_TRUE(client.perform(postTo(good.url())).response);
   EXPECT_EQ(good.server().connectionsAccepted(), 1u);
-  for (auto [which, url] :
-       {std::pair(&client, otherNameURL), {&client, otherAuthority.url()}, {&systemClient, good.url()}}) {
+  for (auto [which, url] : {std::pair(&client, otherNameURL),
+                            {&client, otherAuthority.url()},
+                            {&client, expired.url()},
+                            {&systemClient, good.url()}}) {
     // A post too: a bad certificate is no outage.
     auto result = which->perform(postTo(url));
     ASSERT_TRUE(result.error) << url;
     EXPECT_EQ(result.error->kind, Kind::TLS) << result.error->description;
   }
   EXPECT_EQ(good.count(), 2u);
-  EXPECT_EQ(otherName.count() + otherAuthority.count(), 0u);
+  EXPECT_EQ(otherName.count() + otherAuthority.count() + expired.count(), 0u);
 }
 
 TEST(HTTPClient, FollowsOnlyHTTPAndNoRedirect) {

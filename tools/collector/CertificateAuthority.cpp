@@ -16,7 +16,6 @@ namespace {
 
 constexpr long kSecondsPerDay = 24L * 60 * 60;
 constexpr long kAuthorityDays = 3650;
-constexpr long kServerDays = 365;
 
 Key makeKey() { return checked(Key(EVP_EC_gen("P-256")), "make an EC key"); }
 
@@ -106,11 +105,12 @@ CertificateAuthority CertificateAuthority::openOrCreate(const std::filesystem::p
   return kept;
 }
 
-TLSIdentity CertificateAuthority::issueServerIdentity(const std::vector<std::string>& furtherNames) const {
+TLSIdentity CertificateAuthority::issueServerIdentity(const std::vector<std::string>& furtherNames,
+                                                      long days) const {
   Certificate authority = checked(certificateFromPEM(_certificate), "read the authority's certificate");
   Key authorityKey = checked(privateKeyFromPEM(_key), "read the authority's key");
   Key key = makeKey();
-  Certificate certificate = startCertificate(key.get(), "localhost", kServerDays);
+  Certificate certificate = startCertificate(key.get(), "localhost", days);
   X509* leaf = certificate.get();
   extend(leaf, authority.get(), NID_basic_constraints, "critical,CA:FALSE");
   extend(leaf, authority.get(), NID_key_usage, "critical,digitalSignature");

@@ -29,9 +29,9 @@ class CertificateAuthority {
   /// What clients are to trust (SSL_CERT_FILE).
   const std::string& certificate() const { return _certificate; }
 
-  /// A fresh certificate, valid for a year, for "localhost", 127.0.0.1, ::1 and the given further names or
-  /// numeric addresses.
-  TLSIdentity issueServerIdentity(const std::vector<std::string>& furtherNames = {}) const;
+  /// A fresh certificate, valid for so many days, for "localhost", 127.0.0.1, ::1 and the given further names
+  /// or numeric addresses.
+  TLSIdentity issueServerIdentity(const std::vector<std::string>& furtherNames = {}, long days = 365) const;
 
  private:
   CertificateAuthority(std::string certificate, std::string key)
