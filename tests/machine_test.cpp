@@ -189,13 +189,10 @@ TEST(Machine, MayEndAtAnyMomentAndItsClientsReturnByThemselves) {
   harness.startDaemon();
   auto options = harness.clientOptions();
   options.lastReconnectWait = 20ms;
-  VeskReporting client(options);
-  ASSERT_TRUE(queued(client.setSessionInfo(
-      Dictionary{{kVeskReportingSessionInfoSessionID, 1}, {kVeskReportingSessionInfoClientType, 5}})));
-  ASSERT_TRUE(client.startConfig(ChildProcess::kPatience));
+  RoadClient client(harness, {}, std::nullopt, {}, options);
   std::atomic<bool> stop{false};
   std::thread sender([&] {
-    while (!stop) (void)client.sendMessageAndWait(message(3), 50ms);
+    while (!stop) (void)client.reporting.sendMessageAndWait(message(3), 50ms);
   });
   const auto seed = std::random_device()();
   SCOPED_TRACE("seed " + std::to_string(seed));
@@ -217,7 +214,7 @@ TEST(Machine, MayEndAtAnyMomentAndItsClientsReturnByThemselves) {
   stop = true;
   sender.join();
   RecordProperty("rounds", rounds.done());
-  auto sent = client.sendMessageAndWait(message(5), ChildProcess::kPatience);
+  auto sent = client.reporting.sendMessageAndWait(message(5), ChildProcess::kPatience);
   EXPECT_TRUE(sent) << sent.detail;
   harness.waitForEventsOfMethod(5, 1);
   EXPECT_EQ(harness.stopDaemon(), 0);

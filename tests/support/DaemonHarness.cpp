@@ -5,7 +5,8 @@
 #include <cstdio>
 #include <sstream>
 #include <stdexcept>
-#include <thread>
+
+#include "tests/support/ProcessFacts.h"
 
 namespace vesk::test {
 
@@ -137,16 +138,11 @@ std::vector<boost::json::object> DaemonHarness::linesOf(const std::string& file)
 }
 
 std::vector<boost::json::object> DaemonHarness::waitForLines(const std::string& file, const Enough& enough) {
-  auto deadline = std::chrono::steady_clock::now() + ChildProcess::kPatience;
-  while (true) {
-    auto all = linesOf(file);
-    if (enough(all)) return all;
-    if (std::chrono::steady_clock::now() > deadline) {
-      throw std::runtime_error("after waiting there are " + std::to_string(all.size()) + " lines in " + file +
-                               "; daemon:\n" + _daemon->errors());
-    }
-    std::this_thread::sleep_for(std::chrono::milliseconds(5));  // between two looks at the file
-  }
+  std::vector<boost::json::object> all;
+  auto isEnough = [&] { return enough(all = linesOf(file)); };
+  if (eventually(isEnough)) return all;
+  throw std::runtime_error("after waiting there are " + std::to_string(all.size()) + " lines in " + file +
+                           "; daemon:\n" + _daemon->errors());
 }
 
 std::vector<boost::json::object> DaemonHarness::waitForEventsOfMethod(int method, std::size_t count) {
@@ -180,15 +176,15 @@ std::string DaemonHarness::messageLog() const {
 }
 
 RoadClient::RoadClient(const DaemonHarness& harness, Dictionary moreSessionInfo,
-                       std::optional<Dictionary> userInfo)
-    : reporting(harness.clientOptions()) {
+                       std::optional<Dictionary> userInfo, AggregationHandler aggregationHandler,
+                       const std::optional<ReportingOptions>& options)
+    : reporting(options.value_or(harness.clientOptions())) {
   MutableDictionary info(Dictionary{{kVeskReportingSessionInfoSessionID, 77},
                                     {kVeskReportingSessionInfoClientType, 5},
                                     {kVeskReportingSessionInfoClientVersion, 3}});
   info.setAll(moreSessionInfo);
-  if (reporting.setSessionInfo(info.share(), std::move(userInfo)) != ReportingStatus::Queued) {
+  if (!queued(reporting.setSessionInfo(info.share(), std::move(userInfo), {}, std::move(aggregationHandler))))
     throw std::runtime_error("the session can't be configured");
-  }
   auto started = reporting.startConfig(ChildProcess::kPatience);
   if (!started)
     throw std::runtime_error("the session does not start: " + started.detail + "; daemon:\n" +

@@ -87,7 +87,9 @@ inline bool queued(ReportingStatus status) { return status == ReportingStatus::Q
 /// A session of client type 5, configured and started.
 struct RoadClient {
   explicit RoadClient(const DaemonHarness& harness, Dictionary moreSessionInfo = {},
-                      std::optional<Dictionary> userInfo = std::nullopt);
+                      std::optional<Dictionary> userInfo = std::nullopt,
+                      AggregationHandler aggregationHandler = {},
+                      const std::optional<ReportingOptions>& options = std::nullopt);
   VeskReporting reporting;
   BackendNamesAnswer enabled;
 };
