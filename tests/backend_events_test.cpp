@@ -35,6 +35,7 @@ class BackendEvents : public ::testing::Test {
     backend->setStartTimestamp(at(kStart));
     backend->setCombinedSessionIDString("session-text");
     backend->setUdid("0123456789");
+    backend->updateState();
     return backend;
   }
   /// The same, told to wait for user info; it has it already when `known` is given.
@@ -58,7 +59,6 @@ class BackendEvents : public ::testing::Test {
 
 TEST_F(BackendEvents, RecordCarriesPayloadAndComputedFields) {
   auto backend = make();
-  backend->updateState();
   send(*backend, Dictionary{{"text", "häß"}, {"n", -7}, {"x", 2.5}, {"_method", "mine"}, {"eventTime", 0}});
   auto posts = harness.posts();
   ASSERT_EQ(posts.size(), 1u);
@@ -100,7 +100,6 @@ TEST_F(BackendEvents, EventNumbersWrap) {
 TEST_F(BackendEvents, BodyLosesWhatJSONEventsCannotCarry) {
   CapturedLog log;
   auto backend = make();
-  backend->updateState();
   send(*backend, Dictionary{{"when", Date{1.5}},
                             {"never", Date{std::numeric_limits<double>::infinity()}},
                             {"nested", Dictionary{{"a", 1}}},
@@ -127,7 +126,6 @@ TEST_F(BackendEvents, StopMessageTellsHowItWasSampled) {
   backend->setState(BackendStateEnabled);
   backend->sendMessage(Dictionary{{"StorebagVersion", "1"}}, at(kStart), 0, 1, 0);
   auto plain = make();
-  plain->updateState();
   plain->sendMessage(Dictionary(), at(kStart), 0, 1, 0);
   auto posts = harness.posts();
   ASSERT_EQ(posts.size(), 2u);
@@ -216,7 +214,6 @@ TEST_F(BackendEvents, FlagsStateAndBatchingChooseTheRoad) {
   for (const auto& test : cases) {
     SCOPED_TRACE(test.name);
     auto backend = make();
-    backend->updateState();
     backend->setBatchEvents(test.batch);
     backend->setState(test.state);
     std::size_t before = harness.posts().size();
@@ -232,7 +229,6 @@ TEST_F(BackendEvents, FlagsStateAndBatchingChooseTheRoad) {
 
 TEST_F(BackendEvents, HeldEventsGoFirstOnceEnabled) {
   auto backend = make();
-  backend->updateState();
   backend->setState(BackendStatePending);
   send(*backend, Dictionary{{"n", 1}});
   backend->setState(BackendStateEnabled);
@@ -245,7 +241,6 @@ TEST_F(BackendEvents, HeldEventsGoFirstOnceEnabled) {
 
 TEST_F(BackendEvents, ThresholdFlushesTheWholeBatch) {
   auto backend = make();
-  backend->updateState();
   backend->setBatchEvents(true);
   send(*backend, Dictionary{{"other", 1}}, 9);
   for (int i = 0; i < 50; ++i) send(*backend, Dictionary{{"n", i}});
@@ -271,18 +266,20 @@ TEST_F(BackendEvents, EventsHeldBeforeTheUserInfoGetItFiltered) {
   EXPECT_EQ(backend->state(), BackendStatePending);
   send(*backend, Dictionary{{"n", 1}});
   EXPECT_FALSE(backend->flushMessages());
-  backend->setUserInfoDict(userInfo);
+  backend->setUserInfoDict(Dictionary{{kVeskReportingUserInfoClientName, "Cam\r\nX-Evil: 1"},
+                                      {kVeskReportingUserInfoServiceName, "Clips"}});
   backend->updateState();
   send(*backend, Dictionary{{"n", 2}});
   backend->flushMessages();
   auto posts = harness.posts();
   ASSERT_EQ(posts.size(), 1u);
   for (std::size_t i = 0; i < 2; ++i) {
-    EXPECT_EQ(posts[0].event(i).at("clientName"), "Camera");
+    EXPECT_EQ(posts[0].event(i).at("clientName"), "Cam\r\nX-Evil: 1");
     EXPECT_FALSE(posts[0].event(i).contains("serviceName"));
   }
-  EXPECT_EQ(posts[0].request.header("X-Vesk-Client-Name"), "Camera");
+  EXPECT_EQ(posts[0].request.header("X-Vesk-Client-Name"), "CamX-Evil: 1");
   EXPECT_EQ(posts[0].request.header("X-Vesk-Service-Name"), "Clips");
+  EXPECT_FALSE(posts[0].request.header("X-Evil"));
 }
 
 TEST_F(BackendEvents, LargeUserInfoThatComesLateGoesWithTheNewestEvents) {
@@ -311,7 +308,6 @@ TEST_F(BackendEvents, ServerAnswersDecideTheState) {
     SCOPED_TRACE(status);
     harness.answerWith(status);
     auto backend = make();
-    backend->updateState();
     send(*backend, {});
     harness.posts();
     EXPECT_EQ(backend->state(), stateAfter);
@@ -319,14 +315,6 @@ TEST_F(BackendEvents, ServerAnswersDecideTheState) {
   EXPECT_EQ(log.count(6, "postJSONMessage: backend httpPost disabled by server 503 return code"), 1);
   EXPECT_EQ(harness.dropped(DropReason::ServerError5xx), 3u);
   EXPECT_EQ(harness.dropped(DropReason::ServerRefused), 2u);
-}
-
-TEST_F(BackendEvents, NamesCannotInjectHeaders) {
-  auto backend = makeRequiringUserInfo({}, Dictionary{{kVeskReportingUserInfoClientName, "a\r\nX-Evil: 1"}});
-  send(*backend, {});
-  const auto request = harness.posts().at(0).request;
-  EXPECT_EQ(request.header("X-Vesk-Client-Name"), "aX-Evil: 1");
-  EXPECT_FALSE(request.header("X-Evil"));
 }
 
 TEST_F(BackendEvents, WithoutURLNothingIsSentAndItIsCounted) {

@@ -71,11 +71,9 @@ TEST(StorebagNaming, TheEnvironmentTypeIsReadOnceForTheProcess) {
 }
 
 TEST(StorebagNaming, OtherSettingsAreReadAfreshAsText) {
-  writePreferences("httpsPostURL = 'https://a/'\nnumber = 12\nreal = 0.5\nlist = [1]\n");
+  writePreferences("httpsPostURL = 'https://a/'\nnumber = 12\n");
   EXPECT_EQ(preferenceStringForKey("httpsPostURL"), "https://a/");
   EXPECT_EQ(preferenceStringForKey("number"), "12");
-  EXPECT_EQ(preferenceStringForKey("real"), "0.5");
-  EXPECT_FALSE(preferenceStringForKey("list"));
   EXPECT_FALSE(preferenceStringForKey("absent"));
   writePreferences("httpsPostURL = 'https://b/'\n");
   EXPECT_EQ(preferenceStringForKey("httpsPostURL"), "https://b/");
