@@ -27,15 +27,7 @@ class Session : public ::testing::Test {
   static Dictionary message(Value category, Value type, Dictionary payload = {}) {
     return Dictionary{{"category", category}, {"type", type}, {"payload", payload}};
   }
-  std::string messageLog() {
-    std::string all;
-    auto directory = testRoot() / "var/mobile/Library/Logs/Dunmore/Retired";
-    if (!std::filesystem::exists(directory)) return all;
-    for (const auto& file : std::filesystem::directory_iterator(directory)) {
-      all += testRoot().read(std::filesystem::relative(file.path(), testRoot().path()).string());
-    }
-    return all;
-  }
+  static std::string messageLog() { return testRoot().readAll("var/mobile/Library/Logs/Dunmore/Retired"); }
 
   AgentHarness harness;
 };

@@ -166,15 +166,6 @@ std::int64_t DaemonHarness::collectorCount(const std::string& counter) {
   return boost::json::parse(WebClient().get(fact("controlURL") + "/stats").body).at(counter).as_int64();
 }
 
-std::string DaemonHarness::messageLog() const {
-  std::string all;
-  for (const auto& file :
-       std::filesystem::directory_iterator(root / "var/mobile/Library/Logs/Dunmore/Retired")) {
-    all += root.read(std::filesystem::relative(file.path(), root.path()).string());
-  }
-  return all;
-}
-
 RoadClient::RoadClient(const DaemonHarness& harness, Dictionary moreSessionInfo,
                        std::optional<Dictionary> userInfo, AggregationHandler aggregationHandler,
                        const std::optional<ReportingOptions>& options)

@@ -62,7 +62,7 @@ class DaemonHarness {
 
   void setFault(const std::string& fault);
   std::int64_t collectorCount(const std::string& counter);
-  std::string messageLog() const;
+  std::string messageLog() const { return root.readAll("var/mobile/Library/Logs/Dunmore/Retired"); }
   std::string fact(const char* name) const { return std::string(_facts.at(name).as_string()); }
 
   TempDirectory root;

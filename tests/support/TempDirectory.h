@@ -39,6 +39,14 @@ class TempDirectory {
     std::ifstream in(_path / name, std::ios::binary);
     return {std::istreambuf_iterator<char>(in), {}};
   }
+  /// The contents of all files of a directory, in no order; "" when there is none.
+  std::string readAll(std::string_view directory) const {
+    std::string all;
+    std::error_code missing;
+    for (const auto& file : std::filesystem::directory_iterator(_path / directory, missing))
+      all += read(file.path().string());
+    return all;
+  }
 
  private:
   std::filesystem::path _path;

@@ -1,26 +1,11 @@
 #include "tests/support/WebRequest.h"
 
-#include <algorithm>
-#include <cctype>
-
 namespace vesk::test {
 
 namespace {
 
 std::size_t appendBody(char* data, std::size_t, std::size_t size, void* answer) {
   static_cast<WebAnswer*>(answer)->body.append(data, size);
-  return size;
-}
-
-std::size_t addHeader(char* data, std::size_t, std::size_t size, void* answer) {
-  std::string line(data, size);
-  auto colon = line.find(':');
-  if (colon == std::string::npos) return size;
-  std::string name = line.substr(0, colon);
-  std::transform(name.begin(), name.end(), name.begin(), [](unsigned char c) { return std::tolower(c); });
-  auto start = line.find_first_not_of(' ', colon + 1);
-  auto end = line.find_last_not_of("\r\n");
-  static_cast<WebAnswer*>(answer)->headers[name] = start <= end ? line.substr(start, end + 1 - start) : "";
   return size;
 }
 
@@ -37,8 +22,6 @@ WebAnswer WebClient::perform(const std::string& method, const std::string& url,
   curl_easy_setopt(curl, CURLOPT_TIMEOUT_MS, 10'000L);
   curl_easy_setopt(curl, CURLOPT_WRITEFUNCTION, &appendBody);
   curl_easy_setopt(curl, CURLOPT_WRITEDATA, &answer);
-  curl_easy_setopt(curl, CURLOPT_HEADERFUNCTION, &addHeader);
-  curl_easy_setopt(curl, CURLOPT_HEADERDATA, &answer);
   if (!_authorityFile.empty()) curl_easy_setopt(curl, CURLOPT_CAINFO, _authorityFile.c_str());
   if (body) {
     curl_easy_setopt(curl, CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(body->size()));

@@ -3,7 +3,6 @@
 
 #include <curl/curl.h>
 
-#include <map>
 #include <memory>
 #include <string>
 #include <vector>
@@ -14,7 +13,6 @@ struct WebAnswer {
   CURLcode outcome = CURLE_OK;
   long status = 0;
   std::string body;
-  std::map<std::string, std::string> headers;  ///< names in lower case
 };
 
 /// A client that keeps its connection alive between requests, as curl does.
