@@ -32,25 +32,16 @@ constexpr const char* kProfile = "com.corvane.veskreportingd";
 
 /// Runs `body` in a child process, for what it does to its process can't be undone. Returns its text.
 std::string inChild(const std::function<std::string()>& body) {
-  int ends[2];
-  if (::pipe(ends) != 0) return "no pipe";
-  FileDescriptor in(ends[0]);
-  FileDescriptor out(ends[1]);
+  const test::TempDirectory directory;
+  std::ofstream out(directory / "text");
   pid_t child = ::fork();
   if (child == 0) {
-    std::string text = body();
-    bool written = ::write(out.get(), text.data(), text.size()) == static_cast<ssize_t>(text.size());
-    ::_exit(written ? 0 : 1);
-  }
-  out.reset();
-  std::string text;
-  char piece[4096];
-  for (ssize_t size; (size = ::read(in.get(), piece, sizeof piece)) > 0;) {
-    text.append(piece, static_cast<std::size_t>(size));
+    out << body() << std::flush;
+    ::_exit(out ? 0 : 1);
   }
   int status = 0;
   ::waitpid(child, &status, 0);
-  return status == 0 ? text : text + "child ended with status " + std::to_string(status);
+  return directory.read("text") + (status == 0 ? "" : "child ended with status " + std::to_string(status));
 }
 
 class SandboxTest : public testing::Test {

@@ -29,12 +29,16 @@ std::string noise(std::size_t size) {
   return out;
 }
 
-TEST(Gzip, MakesStreamsThatAnyReaderReads) {
+TEST(Gzip, MakesStreamsThatAnyReaderReadsAndTellsBothSizes) {
   for (const std::string& data : {std::string("x"), std::string(100'000, 'r'), noise(200'000)}) {
     for (int round = 0; round < 2; ++round) {  // the second one works with a stream that was used before
+      CapturedLog log;
       const auto gzip = gzipDeflate(data);
       ASSERT_TRUE(gzip);
       EXPECT_EQ(gzip->substr(0, 2), "\x1f\x8b");
+      EXPECT_EQ(log.count(7, "compressDataWithZlibOrGzip: Compressed file from " +
+                                 std::to_string(data.size()) + " to " + std::to_string(gzip->size())),
+                1);
       EXPECT_EQ(inflated(*gzip, 31, data.size()), data);
       const auto zlib = compressDataWithZlibOrGzip(false, data);
       ASSERT_TRUE(zlib);
@@ -48,16 +52,6 @@ TEST(Gzip, RefusesNothingToCompress) {
   EXPECT_EQ(gzipDeflate(""), std::nullopt);
   EXPECT_EQ(log.lines(), (std::vector<std::pair<int, std::string>>{
                              {3, "compressDataWithZlibOrGzip: Cannot compress empty ByteBlob"}}));
-}
-
-TEST(Gzip, TellsBothSizes) {
-  CapturedLog log;
-  const auto gzip = gzipDeflate(std::string(100'000, 'r'));
-  ASSERT_TRUE(gzip);
-  EXPECT_LT(gzip->size(), 1000u);
-  EXPECT_EQ(log.count(7, "compressDataWithZlibOrGzip: Compressed file from 100000 to " +
-                             std::to_string(gzip->size())),
-            1);
 }
 
 }  // namespace
