@@ -28,31 +28,18 @@ Value archived(const std::string& bytes) {
   return parsePropertyList(bytes, PropertyListFlavor::KeyedArchive).value.value_or(Value("(refused)"));
 }
 
-TEST(BinaryPropertyList, ReadsScalars) {
+// What plistlib writes is read in plist_oracle_test.cpp.
+TEST(BinaryPropertyList, ReadsTheRarerForms) {
   const struct {
     std::string object;
     Value value;
   } cases[] = {
       {"\x00"s, Value()},
-      {"\x08"s, false},
-      {"\x09"s, true},
-      {"\x10\xFF"s, 255},
-      {"\x11\xFF\xFF"s, 65535},
-      {"\x12\xFF\xFF\xFF\xFF"s, 4294967295LL},
-      {"\x13\xFF\xFF\xFF\xFF\xFF\xFF\xFF\xFE"s, -2},
-      {"\x14"s + std::string(8, '\0') + std::string(8, '\xFF'), UINT64_MAX},
       {"\x14"s + std::string(8, '\0') + std::string(7, '\0') + "\x05", 5},
       {"\x14"s + std::string(15, '\xFF') + "\xFD", -3},
       {"\x22\x3F\xC0\x00\x00"s, 1.5},
-      {"\x23\xBF\xF8\x00\x00\x00\x00\x00\x00"s, -1.5},
-      {"\x33\x00\x00\x00\x00\x00\x00\x00\x00"s, Date{978307200}},
-      {"\x42\x00\xFF"s, Bytes("\x00\xFF"s)},
-      {"\x53\x61\x62\x63"s, "abc"},
       {"\x5F\x10\x02\x68\x69"s, "hi"},
       {"\x5F\x13\x00\x00\x00\x00\x00\x00\x00\x02\x68\x69"s, "hi"},
-      {"\x62\xD8\x3C\xDF\x89"s, "\U0001F389"},
-      {"\xA0"s, List{}},
-      {"\xD0"s, Dictionary{}},
   };
   for (const auto& c : cases) {
     const auto outcome = parsePropertyList(document({c.object}));

@@ -21,7 +21,8 @@ std::string nestedArrays(std::size_t depth) {
   return document(repeated("<array>", depth) + repeated("</array>", depth));
 }
 
-TEST(XMLPropertyList, ReadsScalars) {
+// What plistlib writes is read in plist_oracle_test.cpp.
+TEST(XMLPropertyList, ReadsTheRarerForms) {
   const struct {
     const char* content;
     Value value;
@@ -32,13 +33,9 @@ TEST(XMLPropertyList, ReadsScalars) {
       {"<integer> +7 </integer>", 7},
       {"<integer>0xFF</integer>", 255},
       {"<integer>-0x10</integer>", -16},
-      {"<integer>18446744073709551615</integer>", UINT64_MAX},
-      {"<integer>-9223372036854775808</integer>", INT64_MIN},
       {"<real>+1.5e3</real>", 1500.0},
       {"<real>-infinity</real>", -HUGE_VAL},
       {"<date>2000-02-29T23:59:59Z</date>", Date{951868799}},
-      {"<data>\n\t\taGVs\n\t\tbG8=\n</data>", Bytes("hello")},
-      {"<dict><key>k</key><true/><key>l</key><false/></dict>", Dictionary{{"k", true}, {"l", false}}},
       {"<dict><key>k</key><integer>1</integer><key>k</key><integer>2</integer></dict>", Dictionary{{"k", 2}}},
       {" <!-- a note --> <array> <true/> </array> ", List{true}},
   };
@@ -100,15 +97,6 @@ TEST(XMLPropertyList, RefusesWhatIsWrong) {
     EXPECT_FALSE(outcome.value) << text;
     EXPECT_FALSE(outcome.error.empty()) << text;
   }
-}
-
-TEST(XMLPropertyList, TakesADoctypeThatDeclaresNothing) {
-  EXPECT_EQ(
-      parsePropertyList("<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
-                        "<!DOCTYPE plist PUBLIC \"-//A//DTD PLIST 1.0//EN\" \"http://localhost/p.dtd\">\n" +
-                        document("<true/>"))
-          .value,
-      Value(true));
 }
 
 TEST(XMLPropertyList, ReadsUTF16WithAByteOrderMark) {
