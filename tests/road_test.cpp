@@ -78,17 +78,6 @@ TEST(Road, ABadSignatureGivesNoStorebagAndIsNotFetchedAgainAtOnce) {
   EXPECT_TRUE(harness.daemon().waitForText("must wait 900 seconds between attempts"));
 }
 
-TEST(Road, WithoutItsServerPalvoFallsBack) {
-  DaemonHarness harness;
-  harness.startDaemon();
-  harness.stopCollector();
-  RoadClient palvo(harness, Dictionary{{kVeskReportingSessionInfoClientType, 7}});
-  EXPECT_TRUE(palvo.enabled);
-  EXPECT_TRUE(harness.daemon().waitForText("fetchStorebagWithName: Loading default storebag 'palvo'"));
-  RoadClient zelko(harness);
-  EXPECT_EQ(zelko.enabled, std::nullopt);
-}
-
 TEST(Road, TerminationSendsWhatIsHeld) {
   DaemonHarness harness;
   harness.startDaemon();
