@@ -46,6 +46,7 @@ class BackendState : public ::testing::Test {
     backend->setUserInfoDict(Dictionary{{kVeskReportingUserInfoClientName, "Camera"},
                                         {kVeskReportingUserInfoServiceName, "MyCallService"}});
     backend->setSamplingFactor(0.30);
+    backend->updateState();
     return backend;
   }
   static Dictionary entry(Dictionary changes = {}, std::string_view without = "") {
@@ -98,7 +99,6 @@ TEST_F(BackendState, FollowsTheMatchingEntry) {
     SCOPED_TRACE(test.name);
     CapturedLog log;
     auto backend = make(List{test.entry});
-    backend->updateState();
     EXPECT_EQ(backend->state(), test.state);
     if (test.line) {
       EXPECT_EQ(log.count(test.level, std::string("HTTPSPostBackend(updateBackendState): ") + test.line), 1);
@@ -109,7 +109,6 @@ TEST_F(BackendState, FollowsTheMatchingEntry) {
 TEST_F(BackendState, AnUnknownRegionPasses) {
   harness.region.reset();
   auto backend = make(List{entry()});
-  backend->updateState();
   EXPECT_EQ(backend->state(), BackendStateEnabled);
 }
 
@@ -132,7 +131,6 @@ TEST_F(BackendState, ConsentIsRespectedUnlessTheStorebagOverridesIt) {
     auto changes = Dictionary{{"post_url", harness.url()}};
     if (test.override) changes = Dictionary{{"post_url", harness.url()}, {"override_dnu", *test.override}};
     auto backend = make(List{entry(changes)});
-    backend->updateState();
     EXPECT_EQ(backend->state(), test.state);
     auto printable = backend->sendMessage(Dictionary{{"a", 1}}, timeval{}, 1, 0, 0);
     EXPECT_EQ(printable.has_value(), test.printable);
@@ -152,7 +150,6 @@ TEST_F(BackendState, WithoutRequiredUserInfoOnlyTheFirstPostURLCounts) {
                            Dictionary{{"post_url", "http://second/"}, {"sampling_threshold", 0.0}},
                            Dictionary{{"post_url", "http://third/"}}},
                       false);
-  backend->updateState();
   EXPECT_EQ(backend->state(), BackendStateEnabled) << "whatever the draw";
   EXPECT_EQ(std::static_pointer_cast<HTTPSPostBackend>(backend)->postURL(), "http://second/");
 }
@@ -160,7 +157,6 @@ TEST_F(BackendState, WithoutRequiredUserInfoOnlyTheFirstPostURLCounts) {
 TEST_F(BackendState, ThresholdFallsBackWhenALaterEntryHasNone) {
   CapturedLog log;
   auto backend = make(List{entry({{"client", "Camera"}, {"event_threshold", 7}}), entry()});
-  backend->updateState();
   backend->setUserInfoDict(Dictionary{{kVeskReportingUserInfoClientName, "Other"}});
   backend->updateState();
   EXPECT_EQ(log.countContaining(7, "defaulting to 49"), 1);
