@@ -94,28 +94,25 @@ TEST(HostileClients, ConnectionsInExcessAreClosedAndTheOthersGoOn) {
   aftermath.expectNothingLeft();
 }
 
-const std::vector<Value>& strangeValues() {
-  static const std::vector<Value> values{
-      "text",
-      "",
-      "-9223372036854775809",
-      -1,
-      std::numeric_limits<std::int64_t>::min(),
-      std::uint64_t{1} << 63,
-      std::numeric_limits<std::uint64_t>::max(),
-      std::numeric_limits<double>::quiet_NaN(),
-      std::numeric_limits<double>::infinity(),
-      -std::numeric_limits<double>::infinity(),
-      1e300,
-      true,
-      Value(),
-      Bytes("bytes"),
-      Date{std::numeric_limits<double>::infinity()},
-      List{1, "two"},
-      Dictionary{{"a", 1}},
-  };
-  return values;
-}
+const std::vector<Value> kStrangeValues{
+    "text",
+    "",
+    "-9223372036854775809",
+    -1,
+    std::numeric_limits<std::int64_t>::min(),
+    std::uint64_t{1} << 63,
+    std::numeric_limits<std::uint64_t>::max(),
+    std::numeric_limits<double>::quiet_NaN(),
+    std::numeric_limits<double>::infinity(),
+    -std::numeric_limits<double>::infinity(),
+    1e300,
+    true,
+    Value(),
+    Bytes("bytes"),
+    Date{std::numeric_limits<double>::infinity()},
+    List{1, "two"},
+    Dictionary{{"a", 1}},
+};
 
 Dictionary with(const Dictionary& base, const char* key, const Value& value) {
   MutableDictionary changed(base);
@@ -131,7 +128,7 @@ TEST(HostileClients, EveryKindOfValueInEveryNumericKeyHarmsNobody) {
   const Dictionary info{{kVeskReportingSessionInfoSessionID, 7},
                         {kVeskReportingSessionInfoClientType, 5},
                         {kVeskReportingSessionInfoClientVersion, 3}};
-  for (const Value& value : strangeValues()) {
+  for (const Value& value : kStrangeValues) {
     SCOPED_TRACE(describe(value));
     for (const char* key : {kVeskReportingSessionInfoSessionID, kVeskReportingSessionInfoClientType,
                             kVeskReportingSessionInfoClientVersion, kVeskReportingSessionInfoRequireUserInfo,
@@ -155,7 +152,7 @@ TEST(HostileClients, EveryKindOfValueInEveryNumericKeyHarmsNobody) {
     EXPECT_TRUE(other->reporting.sendMessageAndWait(5, 2, Dictionary{{"value", value}}));
   }
   // One event for each value, whatever became of the value itself.
-  harness.waitForEventsOfMethod(5, strangeValues().size());
+  harness.waitForEventsOfMethod(5, kStrangeValues.size());
   other.reset();
   aftermath.expectNothingLeft();
 }

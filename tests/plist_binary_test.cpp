@@ -145,21 +145,18 @@ TEST(BinaryPropertyList, IsNotWrittenWithWhatNobodyCouldReadBack) {
 }
 
 /// Every kind of value in a few hundred bytes.
-const Value& smallSample() {
-  static const Value value =
-      Dictionary{{"t", "text é"},
-                 {"i", List{1, -1, UINT64_MAX}},
-                 {"r", 1.5},
-                 {"d", Date{1e9}},
-                 {"b", Bytes("\0\x01"s)},
-                 {"f", false},
-                 {"n", Dictionary{{"t", "text é"}, {"a fairly long key", List{Value(List{})}}}}};
-  return value;
-}
+const Value kSmallSample =
+    Dictionary{{"t", "text é"},
+               {"i", List{1, -1, UINT64_MAX}},
+               {"r", 1.5},
+               {"d", Date{1e9}},
+               {"b", Bytes("\0\x01"s)},
+               {"f", false},
+               {"n", Dictionary{{"t", "text é"}, {"a fairly long key", List{Value(List{})}}}}};
 
 TEST(PropertyList, SurvivesEveryTruncationAndEveryFlippedBit) {
-  for (const auto& bytes : {*writeBinaryPropertyList(smallSample()), *writeXMLPropertyList(smallSample())}) {
-    ASSERT_EQ(parsePropertyList(bytes).value, smallSample());
+  for (const auto& bytes : {*writeBinaryPropertyList(kSmallSample), *writeXMLPropertyList(kSmallSample)}) {
+    ASSERT_EQ(parsePropertyList(bytes).value, kSmallSample);
     const auto check = [](std::string damaged) {
       for (auto flavor : {PropertyListFlavor::Plain, PropertyListFlavor::KeyedArchive}) {
         // A copy of its own, so that a read past the end is one past the allocation.

@@ -49,13 +49,12 @@ TEST_F(Queues, RunsItsWorkOneAtATimeInOrder) {
 }
 
 TEST_F(Queues, ABlockedQueueDoesNotHoldUpAnother) {
-  WorkQueue& blocked = queue;
   WorkQueue other(pool);
   std::promise<void> gate;
-  blocked.submit([future = gate.get_future().share()] { future.wait(); });
+  queue.submit([future = gate.get_future().share()] { future.wait(); });
   drain(other);
   gate.set_value();
-  drain(blocked);
+  drain(queue);
 }
 
 TEST_F(Queues, GoOnAfterWorkThatThrows) {

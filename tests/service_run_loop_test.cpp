@@ -23,13 +23,6 @@ using Outcome = RunLoop::Outcome;
 
 class RunLoopTest : public testing::Test {
  protected:
-  void SetUp() override {
-    _manager = FileDescriptor(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
-    bindTo(_manager, _directory / "notify");
-    timeval patience{20, 0};
-    ::setsockopt(_manager.get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
-    ::setenv("NOTIFY_SOCKET", (_directory / "notify").c_str(), 1);
-  }
   void TearDown() override { ::unsetenv("NOTIFY_SOCKET"); }
 
   static void bindTo(const FileDescriptor& descriptor, const std::filesystem::path& path) {
@@ -47,13 +40,20 @@ class RunLoopTest : public testing::Test {
   }
 
   const test::TempDirectory _directory;
-  FileDescriptor _manager;
+  const FileDescriptor _manager = [this] {
+    FileDescriptor manager(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+    bindTo(manager, _directory / "notify");
+    timeval patience{20, 0};
+    ::setsockopt(manager.get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
+    ::setenv("NOTIFY_SOCKET", (_directory / "notify").c_str(), 1);
+    return manager;
+  }();
+  ServiceManager _service;
   BusyMarker _busy;
 };
 
 TEST_F(RunLoopTest, StopsFromAnyThreadAlsoBeforehand) {
-  ServiceManager service;
-  RunLoop loop({}, _busy, service);
+  RunLoop loop({}, _busy, _service);
   std::thread stopper([&] { loop.stop(); });
   EXPECT_EQ(loop.run(), Outcome::Stopped);
   stopper.join();
@@ -61,9 +61,8 @@ TEST_F(RunLoopTest, StopsFromAnyThreadAlsoBeforehand) {
 }
 
 TEST_F(RunLoopTest, StopsOnEachStopSignal) {
-  ServiceManager service;
   for (int signal : {SIGTERM, SIGINT}) {
-    RunLoop loop({}, _busy, service);
+    RunLoop loop({}, _busy, _service);
     ::kill(::getpid(), signal);
     EXPECT_EQ(loop.run(), Outcome::Signalled);
   }
@@ -72,8 +71,7 @@ TEST_F(RunLoopTest, StopsOnEachStopSignal) {
 TEST_F(RunLoopTest, ASecondSignalEndsASlowStop) {
   EXPECT_EXIT(
       {
-        ServiceManager service;
-        RunLoop loop({}, _busy, service);
+        RunLoop loop({}, _busy, _service);
         ::kill(::getpid(), SIGTERM);
         if (loop.run() == Outcome::Signalled) ::kill(::getpid(), SIGTERM);
         ::_exit(1);
@@ -82,8 +80,7 @@ TEST_F(RunLoopTest, ASecondSignalEndsASlowStop) {
 }
 
 TEST_F(RunLoopTest, WritingToAClosedPipeIsAnErrorOnly) {
-  ServiceManager service;
-  RunLoop loop({}, _busy, service);
+  RunLoop loop({}, _busy, _service);
   int ends[2];
   ASSERT_EQ(::pipe(ends), 0);
   ::close(ends[0]);
@@ -93,10 +90,9 @@ TEST_F(RunLoopTest, WritingToAClosedPipeIsAnErrorOnly) {
 }
 
 TEST_F(RunLoopTest, EndsWhenIdleButNotWhileBusy) {
-  ServiceManager service;
   _busy.begin();
   _busy.begin();
-  RunLoop loop({.idleExit = 1ms}, _busy, service);
+  RunLoop loop({.idleExit = 1ms}, _busy, _service);
   auto outcome = std::async(std::launch::async, [&] { return loop.run(); });
   _busy.end();
   EXPECT_EQ(outcome.wait_for(50ms), std::future_status::timeout);
@@ -106,8 +102,7 @@ TEST_F(RunLoopTest, EndsWhenIdleButNotWhileBusy) {
 }
 
 TEST_F(RunLoopTest, StaysWithoutAnIdleTime) {
-  ServiceManager service;
-  RunLoop loop({}, _busy, service);
+  RunLoop loop({}, _busy, _service);
   auto outcome = std::async(std::launch::async, [&] { return loop.run(); });
   _busy.begin();
   _busy.end();

@@ -37,16 +37,12 @@ FileDescriptor inputHolding(const std::string& text) {
   return file;
 }
 
-struct Pipe {
-  Pipe() {
-    int ends[2];
-    if (::pipe2(ends, O_CLOEXEC) != 0) throw std::runtime_error("no pipe for a child process");
-    reading = FileDescriptor(ends[0]);
-    writing = FileDescriptor(ends[1]);
-  }
-  FileDescriptor reading;
-  FileDescriptor writing;
-};
+/// The reading and the writing end.
+std::array<FileDescriptor, 2> makePipe() {
+  int ends[2];
+  if (::pipe2(ends, O_CLOEXEC) != 0) throw std::runtime_error("no pipe for a child process");
+  return {FileDescriptor(ends[0]), FileDescriptor(ends[1])};
+}
 
 std::vector<std::string> environmentWith(const std::map<std::string, std::string>& added) {
   std::vector<std::string> all;
@@ -69,16 +65,16 @@ std::vector<char*> pointersTo(std::vector<std::string>& texts) {
 
 ChildProcess::ChildProcess(Options options) : _stop(::eventfd(0, EFD_CLOEXEC)) {
   FileDescriptor input = inputHolding(options.input);
-  Pipe output;
-  Pipe errors;
+  auto output = makePipe();
+  auto errors = makePipe();
   posix_spawn_file_actions_t actions;
   ::posix_spawn_file_actions_init(&actions);
   ::posix_spawn_file_actions_adddup2(&actions, input.get(), STDIN_FILENO);
-  ::posix_spawn_file_actions_adddup2(&actions, errors.writing.get(), STDERR_FILENO);
+  ::posix_spawn_file_actions_adddup2(&actions, errors[1].get(), STDERR_FILENO);
   if (options.outputClosed) {
     ::posix_spawn_file_actions_addclose(&actions, STDOUT_FILENO);
   } else {
-    ::posix_spawn_file_actions_adddup2(&actions, output.writing.get(), STDOUT_FILENO);
+    ::posix_spawn_file_actions_adddup2(&actions, output[1].get(), STDOUT_FILENO);
   }
   auto environment = environmentWith(options.environment);
   auto arguments = pointersTo(options.command);
@@ -87,8 +83,8 @@ ChildProcess::ChildProcess(Options options) : _stop(::eventfd(0, EFD_CLOEXEC)) {
   ::posix_spawn_file_actions_destroy(&actions);
   if (error != 0) throw std::runtime_error("can't start " + options.command[0] + ": " + std::strerror(error));
   _process = FileDescriptor(static_cast<int>(::syscall(SYS_pidfd_open, _pid, 0)));
-  _output = std::move(output.reading);
-  _errors = std::move(errors.reading);
+  _output = std::move(output[0]);
+  _errors = std::move(errors[0]);
   _collector = std::thread([this] { collect(); });
 }
 
