@@ -124,14 +124,6 @@ TEST(ClientIdentifiers, LiveAsLongAsTheProcessWhenTheyCannotBeKept) {
   }
 }
 
-TEST(ClientIdentifiers, TheLibraryKeepsThemUnderTheRoot) {
-  TempDirectory directory;
-  RootOfTest root(directory);
-  std::string identifier = VeskReporting::getPersistentIdentifierForDNU(true);
-  EXPECT_EQ(PersistentIdentifiers(directory / "var/lib/veskreportingd/identifiers.toml").identifier(true),
-            identifier);
-}
-
 TEST(ClientLogging, HandsLinesToTheHost) {
   std::vector<std::pair<int, std::string>> lines;
   VeskReportingLogging::startLogging("host", "Test");

@@ -265,29 +265,10 @@ TEST_F(StorebagServing, RefusesNamesItDoesNotHaveAndSourcesWithMistakes) {
   EXPECT_EQ(_endpoint.answer(request("POST", "/bags/good")).status, 405U);
 }
 
-TEST_F(StorebagServing, GivesItsFaults) {
-  writeVersion("1", 1'795'552'289);
-  for (const char* fault : {"storebag=bad-signature*1", "storebag=404*1", "storebag=empty-body*1"})
-    ASSERT_FALSE(_faults.add(fault));
-  EXPECT_EQ(verdictOn(get("/bags/zelko")), StorebagVerdict::SignatureMismatch);
-  EXPECT_EQ(get("/bags/zelko").status, 404U);
-  HTTPAnswer empty = get("/bags/zelko");
-  EXPECT_EQ(empty.status, 200U);
-  EXPECT_EQ(empty.body, "");
-  EXPECT_TRUE(findHeader(empty.headers, "Last-Modified"));
-  EXPECT_EQ(verdictOn(get("/bags/zelko")), StorebagVerdict::Valid);
-}
-
 TEST(Console, ShowsNothingThatSteersATerminal) {
   EXPECT_EQ(printable("a\x1b[2J\n\x7f"), "a\\x1b[2J\\x0a\\x7f");
   EXPECT_EQ(printable("gr\u00fc\u00dfe \u0090"), "gr\u00fc\u00dfe \\xc2\\x90");
   EXPECT_EQ(printable("\xff\xc3\xbc"), "\\xff\\xc3\\xbc");
-}
-
-TEST(HTTPDate, ReadsWhatItWritesAndNothingElse) {
-  EXPECT_EQ(timeFromHTTPDate(httpDate(1'795'552'289)), 1'795'552'289);
-  for (const char* text : {"", "Tue, 24 Nov 2026", "Tue, 24 Nov 2026 20:31:29 GMT x", "2026-11-24"})
-    EXPECT_FALSE(timeFromHTTPDate(text)) << text;
 }
 
 TEST(HTTPReceived, UnpacksNoMoreThanItsLimit) {
@@ -297,14 +278,6 @@ TEST(HTTPReceived, UnpacksNoMoreThanItsLimit) {
     EXPECT_EQ(packed.decodedBody(1000).body.has_value(), size == 1000);
     EXPECT_EQ(plain.decodedBody(1000).body.has_value(), size == 1000);
   }
-}
-
-TEST(HTTPReceived, FindsPathAndQuery) {
-  auto received = request("GET", "/a/b?x=1&version=7.0&version=8&flag");
-  EXPECT_EQ(received.path(), "/a/b");
-  EXPECT_EQ(received.query("version"), "7.0");
-  EXPECT_EQ(received.query("flag"), "");
-  EXPECT_FALSE(received.query("b"));
 }
 
 }  // namespace

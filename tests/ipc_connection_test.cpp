@@ -133,18 +133,6 @@ TEST(IPCConnection, KeepsADescriptorUnderATokenThatIsGoodOnce) {
   EXPECT_FALSE(ExtensionTokens::shared().consume(second)) << "it went with the connection";
 }
 
-TEST(IPCConnection, HangingUpInvalidatesThenDestroys) {
-  TestService service;
-  {
-    TestClient client(service);
-    client.post("sendMessageWithDictionary", message(1));
-    EXPECT_TRUE(client.bus().flush(10s));
-  }
-  EXPECT_TRUE(service.journal.waitFor("destroyed"));
-  EXPECT_EQ(service.journal.lines(),
-            (std::vector<std::string>{"accepted", "message 1", "invalidated", "destroyed"}));
-}
-
 TEST(IPCConnection, EndsWithTheProcessThatMadeItAndNotWithOneForkedFromThat) {
   TestService service;
   std::optional<TestClient> client(std::in_place, service);
@@ -180,6 +168,11 @@ TEST(IPCConnection, ServesWhatAClientSentBeforeItLeftItsAnswersUnread) {
   }
   EXPECT_TRUE(service.journal.waitFor("destroyed"));
   EXPECT_EQ(service.journal.count("message"), 300u);
+  const std::size_t before = service.journal.count("interrupted");
+  EXPECT_EQ(TestClient(service).call("flushMessagesWithReply"), "posted all");
+  EXPECT_TRUE(service.journal.waitFor("destroyed", 2));
+  EXPECT_EQ(service.journal.count("interrupted"), before) << "a client that has read them just hangs up";
+  EXPECT_EQ(*(service.journal.lines().end() - 2), "invalidated") << "and only then is destroyed";
 }
 
 TEST(IPCConnection, MayBeInvalidatedFromItsOwnHandlerAndTwice) {
@@ -206,15 +199,6 @@ TEST(IPCConnection, GivesTheClientTheLastWordOfASessionThatIsSentAway) {
   stopping.join();
   EXPECT_EQ(client.received, (std::vector<std::string>{"sendMessageToClient none 0 0 0 none"}));
   EXPECT_EQ(service.journal.lines().back(), "destroyed");
-}
-
-TEST(IPCConnection, TellsTheCallerOfACallThatCannotReachItsClient) {
-  TestService service;
-  {
-    TestClient client(service);
-    EXPECT_EQ(client.call("sendMessageWithDictionary", message(1, "farewell")), "1");
-  }
-  EXPECT_TRUE(service.journal.waitFor("lost: the connection has ended"));
 }
 
 TEST(IPCConnection, RunsNoHandlerWhenItIsNeverResumed) {
