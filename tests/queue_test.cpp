@@ -4,6 +4,7 @@
 
 #include <atomic>
 #include <future>
+#include <optional>
 #include <stdexcept>
 #include <system_error>
 #include <thread>
@@ -193,6 +194,32 @@ TEST(WorkQueuePool, StopDestroysWhatHasNotRunAndEverythingMayOutliveIt) {
   source.cancel();
   late.cancel();
   EXPECT_EQ(token.use_count(), 1);
+}
+
+TEST(WorkQueuePool, WhatIsMadeWhileItStopsKeepsNothingAlive) {
+  auto ring = std::make_shared<std::optional<WorkTimer>>();
+  const std::weak_ptr<void> watched = ring;
+  WorkQueuePool pool(1);
+  WorkQueue queue(pool);
+  std::promise<void> begun;
+  std::promise<void> stopping;
+  queue.submit([&, ring] {
+    begun.set_value();
+    stopping.get_future().wait();
+    ring->emplace(queue, milliseconds(0), milliseconds(1), [ring] {});
+  });
+  begun.get_future().wait();
+  std::thread stopper([&pool] { pool.stop(); });
+  for (;;) {  // a pool that is stopped takes no work
+    auto probe = std::make_shared<int>();
+    queue.submit([probe] {});
+    if (probe.use_count() == 1) break;
+    std::this_thread::yield();
+  }
+  stopping.set_value();
+  stopper.join();
+  ring.reset();
+  EXPECT_TRUE(watched.expired());
 }
 
 }  // namespace

@@ -111,19 +111,25 @@ class WorkQueuePool::Core {
     });
   }
 
-  /// For those whose handlers are to be destroyed when the pool is stopped.
-  void add(std::weak_ptr<Source> source) {
-    MutexLock lock(_mutex);
-    if (_sources.size() >= _pruneAt) {
-      std::erase_if(_sources, [](const auto& known) { return known.expired(); });
-      _pruneAt = 2 * _sources.size() + 16;
-    }
-    _sources.push_back(std::move(source));
+  /// For those whose handlers are to be destroyed when the pool is stopped, or at once when it was: work that
+  /// ran at that moment may make some.
+  void add(const std::shared_ptr<Source>& source) {
+    if (!remember(source)) source->dropHandler();
   }
 
   void stop() noexcept;
 
  private:
+  bool remember(const std::shared_ptr<Source>& source) {
+    MutexLock lock(_mutex);
+    if (_stopped) return false;
+    if (_sources.size() >= _pruneAt) {
+      std::erase_if(_sources, [](const auto& known) { return known.expired(); });
+      _pruneAt = 2 * _sources.size() + 16;
+    }
+    _sources.push_back(source);
+    return true;
+  }
   void serve() noexcept {
     sigset_t all;
     sigfillset(&all);
@@ -194,7 +200,7 @@ class WorkQueuePool::Timer : public Source, public std::enable_shared_from_this<
         _timer(core.context()) {}
 
   void start(std::chrono::milliseconds first) {
-    _core.add(weak_from_this());
+    _core.add(shared_from_this());
     auto expiry = Clock::now() + first;
     _core.post(_strand, [self = shared_from_this(), expiry] { self->arm(expiry); });
   }
@@ -229,7 +235,7 @@ class WorkQueuePool::Watch : public Source, public std::enable_shared_from_this<
   }
 
   void start() {
-    _core.add(weak_from_this());
+    _core.add(shared_from_this());
     _core.post(_strand, [self = shared_from_this()] { self->wait(); });
   }
   void shut() override {
