@@ -241,6 +241,25 @@ TEST(IPCLimits, StopsReadingFromAClientThatDoesNotReadItsAnswers) {
   EXPECT_TRUE(client.runUntil([&] { return answered == sent; })) << "nothing is lost";
 }
 
+TEST(IPCLimits, CallsBehindAnUnreadAnswerAreNotServed) {
+  TestService service;
+  TestClient client(service);
+  ASSERT_EQ(client.call("flushMessagesWithReply"), "posted all");
+  const IPCOutgoingCall ask{
+      wire::kSessionInterface, "sendMessageWithDictionary", {Dictionary{{"pad", 500'000}}}};
+  for (int i = 0; i < 100; ++i) {
+    ASSERT_EQ(client.bus().send(
+                  ask, [](BusAnswer&) {}, 60s),
+              BusClient::SendResult::Sent);
+  }
+  EXPECT_TRUE(service.journal.waitFor("message"));
+  for (int i = 0; i < 50; ++i) {  // each wakes the connection's thread
+    service.connection()->callRemoteObject({wire::kReplyInterface, "m", {}}, nullptr);
+    std::this_thread::sleep_for(1ms);
+  }
+  EXPECT_LE(service.journal.count("message"), 2u);
+}
+
 TEST(IPCLimits, TellsTheCallerWhenAClientsOutboxIsFull) {
   struct Case {
     std::size_t outbox;

@@ -172,6 +172,9 @@ bool ConnectionLoop::process() {
 }
 
 bool ConnectionLoop::processWaiting() {
+  // With a full socket before it, sd-bus would not write but serve the next call.
+  pollfd socket{sd_bus_get_fd(_bus.get()), POLLOUT, 0};
+  if (isBackedUp() && ::poll(&socket, 1, 0) == 0) return true;
   for (;;) {
     sd_bus_message* raw = nullptr;
     int result = sd_bus_process(_bus.get(), &raw);

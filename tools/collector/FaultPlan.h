@@ -37,9 +37,8 @@ class FaultPlan {
  public:
   /// Adds one fault written as "target=fault" or "target=fault*times", where target is "post", "storebag",
   /// "upload" or "logdata" and fault a status ("503", "answer=503") or one of the names that `faultNames`
-  /// lists. Without
-  /// "*times" it stays until another is added; "target=none" forgets that target's. What is wrong with the
-  /// text comes back.
+  /// lists. Without "*times" it stays until another is added; "target=none" forgets that target's. What is
+  /// wrong with the text comes back.
   [[nodiscard]] std::optional<std::string> add(std::string_view text);
   void clear();
 
