@@ -221,7 +221,7 @@ class StorebagServing : public CollectorEndpoints {
 
   const SigningKey _key = SigningKey::generate();
   StorebagFolder _folder{_files.path(), StorebagChecks::Strict};
-  StorebagEndpoint _endpoint{{_console, _stats, _faults, _folder, _key}, std::chrono::seconds(60)};
+  StorebagEndpoint _endpoint{{_console, _stats, _faults}, _folder, _key, std::chrono::seconds(60)};
 };
 
 TEST_F(StorebagServing, SignsOnTheFlyAndAnswersConditionally) {

@@ -47,7 +47,7 @@ struct Collector::Parts {
         folder(options.storebags, options.checks),
         events({console, stats, faults}, options.events),
         uploads({console, stats, faults}, options.uploads, options.uploadAnswer),
-        storebags({console, stats, faults, folder, key}, options.maximumAge),
+        storebags({console, stats, faults}, folder, key, options.maximumAge),
         logData({console, stats, faults}, options.directory / "logdata"),
         control(console, stats, faults),
         securePaths(Refusals(console, stats)),

@@ -3,29 +3,35 @@
 
 #include <atomic>
 #include <cstdint>
+#include <vector>
 
 namespace vesk {
 
 /// Each counter is synchronised by itself.
 struct CollectorStats {
-  using Counter = std::atomic<std::uint64_t>;
+  struct Counter : std::atomic<std::uint64_t> {
+    Counter(CollectorStats& stats, const char* counterName) : name(counterName) { stats.all.push_back(this); }
+    const char* const name;
+  };
 
-  Counter posts = 0;                 ///< taken
-  Counter events = 0;                ///< in the posts taken
-  Counter eventsNotSaved = 0;        ///< taken, but the file could not be written
-  Counter storebagsSent = 0;         ///< whole, also those with a bad signature on demand
-  Counter storebagsUnchanged = 0;    ///< answered with 304
-  Counter datagrams = 0;             ///< of dashboards, taken
-  Counter datagramsAgain = 0;        ///< of these, that had been there before
-  Counter datagramsMalformed = 0;    ///< that were none
-  Counter datagramsLost = 0;         ///< on demand
-  Counter acknowledgements = 0;      ///< sent
-  Counter acknowledgementsLost = 0;  ///< on demand
-  Counter logData = 0;               ///< uploads of log data
-  Counter uploads = 0;               ///< files taken
-  Counter refused = 0;               ///< requests that were not the protocol
-  Counter notHTTP = 0;               ///< connections that did not get as far as a request
-  Counter faults = 0;                ///< faults on demand
+  std::vector<const Counter*> all;  ///< in the order of their declaration; constant after construction
+
+  Counter posts{*this, "posts"};                    ///< taken
+  Counter events{*this, "events"};                  ///< in the posts taken
+  Counter eventsNotSaved{*this, "eventsNotSaved"};  ///< taken, but the file could not be written
+  Counter storebagsSent{*this, "storebagsSent"};    ///< whole, also those with a bad signature on demand
+  Counter storebagsUnchanged{*this, "storebagsUnchanged"};      ///< answered with 304
+  Counter datagrams{*this, "datagrams"};                        ///< of dashboards, taken
+  Counter datagramsAgain{*this, "datagramsAgain"};              ///< of these, that had been there before
+  Counter datagramsMalformed{*this, "datagramsMalformed"};      ///< that were none
+  Counter datagramsLost{*this, "datagramsLost"};                ///< on demand
+  Counter acknowledgements{*this, "acknowledgements"};          ///< sent
+  Counter acknowledgementsLost{*this, "acknowledgementsLost"};  ///< on demand
+  Counter logData{*this, "logData"};                            ///< uploads of log data
+  Counter uploads{*this, "uploads"};                            ///< files taken
+  Counter refused{*this, "refused"};                            ///< requests that were not the protocol
+  Counter notHTTP{*this, "notHTTP"};  ///< connections that did not get as far as a request
+  Counter faults{*this, "faults"};    ///< faults on demand
 };
 
 }  // namespace vesk

@@ -47,22 +47,9 @@ HTTPAnswer ControlEndpoint::plannedFaults() const {
 }
 
 HTTPAnswer ControlEndpoint::counters() const {
-  return jsonAnswer(Dictionary{{"posts", _stats.posts.load()},
-                               {"events", _stats.events.load()},
-                               {"eventsNotSaved", _stats.eventsNotSaved.load()},
-                               {"storebagsSent", _stats.storebagsSent.load()},
-                               {"storebagsUnchanged", _stats.storebagsUnchanged.load()},
-                               {"datagrams", _stats.datagrams.load()},
-                               {"datagramsAgain", _stats.datagramsAgain.load()},
-                               {"datagramsMalformed", _stats.datagramsMalformed.load()},
-                               {"datagramsLost", _stats.datagramsLost.load()},
-                               {"acknowledgements", _stats.acknowledgements.load()},
-                               {"acknowledgementsLost", _stats.acknowledgementsLost.load()},
-                               {"logData", _stats.logData.load()},
-                               {"uploads", _stats.uploads.load()},
-                               {"refused", _stats.refused.load()},
-                               {"notHTTP", _stats.notHTTP.load()},
-                               {"faults", _stats.faults.load()}});
+  MutableDictionary counters;
+  for (const auto* counter : _stats.all) counters.append(counter->name, counter->load());
+  return jsonAnswer(counters.share());
 }
 
 }  // namespace vesk

@@ -24,19 +24,6 @@ HTTPAnswer Refusals::wrongMethod(const HTTPReceived& received, std::string_view 
   return answer;
 }
 
-HTTPAnswer FaultyAnswers::operator()(
-    const HTTPReceived& received, const std::function<HTTPAnswer(const CollectorFault* fault)>& serve) const {
-  const auto fault = _faults.take(_target);
-  if (!fault) return serve(nullptr);
-  HTTPAnswer answer;
-  if (fault->isOnlyInTheAnswer()) answer = serve(&*fault);
-  ++_stats.faults;
-  _console.note("fault on demand for " + received.method + " " + received.target.substr(0, 200) + " from " +
-                received.peer);
-  fault->applyTo(answer);
-  return answer;
-}
-
 HTTPAnswer EndpointTable::answer(const HTTPReceived& received) const {
   const std::pair<std::string, Endpoint*>* best = nullptr;
   for (const auto& entry : _endpoints) {

@@ -1,7 +1,6 @@
 // What the collector offers under its paths.
 #pragma once
 
-#include <functional>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -9,7 +8,6 @@
 
 #include "tools/collector/CollectorStats.h"
 #include "tools/collector/Console.h"
-#include "tools/collector/FaultPlan.h"
 #include "tools/collector/HTTPMessage.h"
 
 namespace vesk {
@@ -35,24 +33,6 @@ class Refusals {
  private:
   Console& _console;
   CollectorStats& _stats;
-};
-
-/// Makes answers bad where a fault on demand says so, and tells it on the console.
-class FaultyAnswers {
- public:
-  FaultyAnswers(Console& console, CollectorStats& stats, FaultPlan& faults, FaultTarget target)
-      : _console(console), _stats(stats), _faults(faults), _target(target) {}
-
-  /// What `serve` gives, with the fault that is due, if any. `serve` is not called when the fault comes
-  /// instead of the answer; else it is told the fault, or null.
-  HTTPAnswer operator()(const HTTPReceived& received,
-                        const std::function<HTTPAnswer(const CollectorFault* fault)>& serve) const;
-
- private:
-  Console& _console;
-  CollectorStats& _stats;
-  FaultPlan& _faults;
-  const FaultTarget _target;
 };
 
 /// Which endpoint answers which path: filled before the server starts, constant afterwards.

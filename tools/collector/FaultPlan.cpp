@@ -10,7 +10,6 @@ using Kind = CollectorFault::Kind;
 using Fault = HTTPAnswer::Fault;
 
 constexpr std::size_t kMaximumPlanned = 1000;
-constexpr std::array<std::string_view, 4> kTargets{"post", "storebag", "upload", "logdata"};
 
 struct NamedFault {
   std::string_view name;
@@ -45,8 +44,8 @@ std::optional<CollectorFault> faultNamed(std::string_view name) {
 }
 
 std::optional<FaultTarget> targetNamed(std::string_view name) {
-  for (std::size_t i = 0; i < kTargets.size(); ++i)
-    if (kTargets[i] == name) return static_cast<FaultTarget>(i);
+  for (std::size_t i = 0; i < kFaultTargetNames.size(); ++i)
+    if (kFaultTargetNames[i] == name) return static_cast<FaultTarget>(i);
   return std::nullopt;
 }
 
@@ -76,8 +75,7 @@ std::optional<std::string> FaultPlan::add(std::string_view text) {
   auto equals = text.find('=');
   auto target = targetNamed(text.substr(0, equals));
   if (!target || equals == std::string_view::npos)
-    return "a fault is written as post=FAULT, storebag=FAULT, upload=FAULT or logdata=FAULT, not '" +
-           std::string(text) + "'";
+    return "a fault is written as " + forms() + ", not '" + std::string(text) + "'";
   std::string_view name = text.substr(equals + 1);
   std::optional<unsigned> times;
   if (auto star = name.rfind('*'); star != std::string_view::npos) {
@@ -121,14 +119,23 @@ std::optional<CollectorFault> FaultPlan::take(FaultTarget target) {
 std::vector<std::string> FaultPlan::describe() const {
   std::vector<std::string> lines;
   MutexLock lock(_mutex);
-  for (std::size_t target = 0; target < kTargets.size(); ++target) {
+  for (std::size_t target = 0; target < kFaultTargetNames.size(); ++target) {
     for (const auto& planned : _planned[target]) {
-      std::string line = std::string(kTargets[target]) + "=" + planned.name;
+      std::string line = std::string(kFaultTargetNames[target]) + "=" + planned.name;
       if (planned.times) line += "*" + std::to_string(*planned.times);
       lines.push_back(std::move(line));
     }
   }
   return lines;
+}
+
+std::string FaultPlan::forms() {
+  std::string forms;
+  for (std::size_t i = 0; i < kFaultTargetNames.size(); ++i) {
+    if (i > 0) forms += i + 1 < kFaultTargetNames.size() ? ", " : " or ";
+    forms.append(kFaultTargetNames[i]).append("=FAULT");
+  }
+  return forms;
 }
 
 std::string FaultPlan::faultNames() {

@@ -14,6 +14,8 @@
 namespace vesk {
 
 enum class FaultTarget : unsigned char { Post, Storebag, Upload, LogData };
+/// In the order of the targets.
+inline constexpr std::array<std::string_view, 4> kFaultTargetNames{"post", "storebag", "upload", "logdata"};
 
 struct CollectorFault {
   enum class Kind : unsigned char {
@@ -35,8 +37,8 @@ struct CollectorFault {
 /// The faults still to come, per target in the order in which they were added. Thread-safe.
 class FaultPlan {
  public:
-  /// Adds one fault written as "target=fault" or "target=fault*times", where target is "post", "storebag",
-  /// "upload" or "logdata" and fault a status ("503", "answer=503") or one of the names that `faultNames`
+  /// Adds one fault written as "target=fault" or "target=fault*times", where target is one of
+  /// `kFaultTargetNames` and fault a status ("503", "answer=503") or one of the names that `faultNames`
   /// lists. Without "*times" it stays until another is added; "target=none" forgets that target's. What is
   /// wrong with the text comes back.
   [[nodiscard]] std::optional<std::string> add(std::string_view text);
@@ -48,7 +50,9 @@ class FaultPlan {
   /// One text a fault still to come, as for `add`.
   std::vector<std::string> describe() const;
 
-  /// "500, stall, reset, …", for help and messages.
+  /// "post=FAULT, storebag=FAULT, … or …", for help and messages.
+  static std::string forms();
+  /// "500, stall, reset, …", likewise.
   static std::string faultNames();
 
  private:
@@ -59,7 +63,7 @@ class FaultPlan {
   };
 
   mutable Mutex _mutex;
-  std::array<std::deque<Planned>, 4> _planned VESK_GUARDED_BY(_mutex);
+  std::array<std::deque<Planned>, kFaultTargetNames.size()> _planned VESK_GUARDED_BY(_mutex);
 };
 
 }  // namespace vesk

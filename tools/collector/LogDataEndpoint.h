@@ -1,37 +1,24 @@
 // Takes uploads of log data.
 #pragma once
 
-#include <atomic>
-#include <cstdint>
 #include <filesystem>
 
-#include "tools/collector/Endpoint.h"
+#include "tools/collector/FaultyEndpoint.h"
+#include "tools/collector/NumberedFiles.h"
 
 namespace vesk {
 
 /// Stores each keyed archive that is posted as a file of its own and answers with the file's path, which is
 /// what the sender announces as location. Anything else is refused with 400 or 405.
-class LogDataEndpoint : public Endpoint {
+class LogDataEndpoint : public FaultyEndpoint {
  public:
-  struct Parts {
-    Console& console;
-    CollectorStats& stats;
-    FaultPlan& faults;
-  };
   /// `directory` is made when the first upload arrives.
-  LogDataEndpoint(Parts parts, std::filesystem::path directory);
-
-  HTTPAnswer answer(const HTTPReceived& received) override;
+  LogDataEndpoint(const CollectorServices& services, std::filesystem::path directory);
 
  private:
-  HTTPAnswer take(const HTTPReceived& received);
-  std::filesystem::path store(const HTTPReceived& received);
+  HTTPAnswer serve(const HTTPReceived& received, const CollectorFault* fault) override;
 
-  const Parts _parts;
-  const Refusals _refuse;
-  const FaultyAnswers _faulty;
-  const std::filesystem::path _directory;
-  std::atomic<std::uint64_t> _next = 1;
+  NumberedFiles _files;
 };
 
 }  // namespace vesk

@@ -86,11 +86,9 @@ void define(CLI::App& app, Arguments& arguments) {
       ->type_name("SECONDS");
   app.add_flag("--lenient", arguments.lenient, "Serve storebags with values of a wrong type too");
   app.add_flag("--json", arguments.json, "Write one JSON line an event, with its headers");
-  app.add_option(
-         "--fault", collector.faults,
-         "Answer badly: post=FAULT, storebag=FAULT, upload=FAULT or logdata=FAULT, with *N for N times only "
-         "(repeatable); FAULT is " +
-             FaultPlan::faultNames())
+  app.add_option("--fault", collector.faults,
+                 "Answer badly: " + FaultPlan::forms() +
+                     ", with *N for N times only (repeatable); FAULT is " + FaultPlan::faultNames())
       ->type_name("FAULT");
   app.add_option("--ready-file", arguments.readyFile, "Write ports and paths here as JSON once listening")
       ->type_name("FILE");

@@ -21,29 +21,22 @@ bool isUnchangedSince(const HTTPReceived& received, std::time_t lastModified) {
 
 }  // namespace
 
-StorebagEndpoint::StorebagEndpoint(Parts parts, std::optional<std::chrono::seconds> maximumAge)
-    : _parts(parts),
-      _refuse(parts.console, parts.stats),
-      _faulty(parts.console, parts.stats, parts.faults, FaultTarget::Storebag),
-      _maximumAge(maximumAge) {}
+StorebagEndpoint::StorebagEndpoint(const CollectorServices& services, StorebagFolder& folder,
+                                   const SigningKey& key, std::optional<std::chrono::seconds> maximumAge)
+    : FaultyEndpoint(services, FaultTarget::Storebag), _folder(folder), _key(key), _maximumAge(maximumAge) {}
 
-HTTPAnswer StorebagEndpoint::answer(const HTTPReceived& received) {
-  return _faulty(received, [&](const CollectorFault* fault) {
-    return serve(received, fault == nullptr || fault->kind != CollectorFault::Kind::BadSignature);
-  });
-}
-
-HTTPAnswer StorebagEndpoint::serve(const HTTPReceived& received, bool signWell) {
+HTTPAnswer StorebagEndpoint::serve(const HTTPReceived& received, const CollectorFault* fault) {
+  const bool signWell = fault == nullptr || fault->kind != CollectorFault::Kind::BadSignature;
   if (received.method != "GET") return _refuse.wrongMethod(received, "GET");
   std::string_view path = received.path();
   std::string name(path.substr(path.rfind('/') + 1));
-  auto found = _parts.folder.find(name);
+  auto found = _folder.find(name);
   if (!found)
     return _refuse(received, 404,
-                   "no " + name + ".toml or " + name + ".json in " + _parts.folder.directory().string());
+                   "no " + name + ".toml or " + name + ".json in " + _folder.directory().string());
   if (signWell && isUnchangedSince(received, found->lastModified)) {
-    ++_parts.stats.storebagsUnchanged;
-    _parts.console.note(describeRequest(received) + ": unchanged");
+    ++_stats.storebagsUnchanged;
+    _console.note(describeRequest(received) + ": unchanged");
     HTTPAnswer answer;
     answer.status = 304;
     answer.headers = headersFor(found->lastModified);
@@ -59,18 +52,18 @@ HTTPAnswer StorebagEndpoint::send(const HTTPReceived& received, const StorebagFo
   answer.headers.emplace_back("Content-Type", "application/xml");
   Dictionary payload;
   try {
-    StorebagSource source = _parts.folder.read(found);
+    StorebagSource source = _folder.read(found);
     if (found.isNew)
-      for (const auto& warning : source.warnings) _parts.console.problem("warning: " + warning);
+      for (const auto& warning : source.warnings) _console.problem("warning: " + warning);
     payload = source.payload;
-    answer.body = signWell ? signStorebag(payload, _parts.key) : signStorebagBadly(payload, _parts.key);
+    answer.body = signWell ? signStorebag(payload, _key) : signStorebagBadly(payload, _key);
   } catch (const std::runtime_error& error) {
     return _refuse(received, 500, error.what());
   }
-  ++_parts.stats.storebagsSent;
+  ++_stats.storebagsSent;
   auto version = payload.text("version");
-  _parts.console.note(describeRequest(received) + ": " + std::to_string(answer.body.size()) +
-                      " bytes, version " + (version ? version->string() : "none"));
+  _console.note(describeRequest(received) + ": " + std::to_string(answer.body.size()) + " bytes, version " +
+                (version ? version->string() : "none"));
   return answer;
 }
 

@@ -3,7 +3,6 @@
 #include <stdexcept>
 
 #include "platform/files/FileURL.h"
-#include "tools/files/WholeFile.h"
 
 namespace vesk {
 
@@ -24,18 +23,13 @@ std::string nameIn(const HTTPReceived& received) {
 
 }  // namespace
 
-UploadsEndpoint::UploadsEndpoint(Parts parts, std::filesystem::path directory, std::string goodAnswer)
-    : _parts(parts),
-      _refuse(parts.console, parts.stats),
-      _faulty(parts.console, parts.stats, parts.faults, FaultTarget::Upload),
-      _directory(std::move(directory)),
+UploadsEndpoint::UploadsEndpoint(const CollectorServices& services, std::filesystem::path directory,
+                                 std::string goodAnswer)
+    : FaultyEndpoint(services, FaultTarget::Upload),
+      _files(std::move(directory)),
       _goodAnswer(std::move(goodAnswer)) {}
 
-HTTPAnswer UploadsEndpoint::answer(const HTTPReceived& received) {
-  return _faulty(received, [&](const CollectorFault*) { return take(received); });
-}
-
-HTTPAnswer UploadsEndpoint::take(const HTTPReceived& received) {
+HTTPAnswer UploadsEndpoint::serve(const HTTPReceived& received, const CollectorFault*) {
   if (received.method != "POST") return _refuse.wrongMethod(received, "POST");
   std::string name = nameIn(received);
   if (name.empty()) return _refuse(received, 400, "the query names no file");
@@ -44,28 +38,18 @@ HTTPAnswer UploadsEndpoint::take(const HTTPReceived& received) {
   if (!contents.body) return _refuse(received, 400, contents.problem);
   std::filesystem::path path;
   try {
-    path = save(received, name);
+    path = _files.save(received.body, "-" + name);
   } catch (const std::exception& error) {
     return _refuse(received, 500, error.what());
   }
-  ++_parts.stats.uploads;
-  _parts.console.note("file " + name + " (" + std::to_string(contents.body->size()) + " bytes, " +
-                      std::to_string(received.body.size()) + " as sent) of session " +
-                      std::string(received.query("sequence").value_or("?")) + " saved as " + path.string());
+  ++_stats.uploads;
+  _console.note("file " + name + " (" + std::to_string(contents.body->size()) + " bytes, " +
+                std::to_string(received.body.size()) + " as sent) of session " +
+                std::string(received.query("sequence").value_or("?")) + " saved as " + path.string());
   HTTPAnswer answer;
   answer.headers = {{"Content-Type", "application/json"}};
   answer.body = _goodAnswer + "\n";
   return answer;
-}
-
-std::filesystem::path UploadsEndpoint::save(const HTTPReceived& received, const std::string& name) {
-  std::filesystem::create_directories(_directory);
-  std::filesystem::path path;
-  do {
-    path = _directory / (std::to_string(++_last) + "-" + name);
-  } while (std::filesystem::exists(path));
-  writeWholeFile(path, received.body, 0644);
-  return path;
 }
 
 }  // namespace vesk

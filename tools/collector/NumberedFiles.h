@@ -1,0 +1,27 @@
+// Files that are saved as they arrive.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <filesystem>
+#include <string>
+#include <string_view>
+
+namespace vesk {
+
+/// Saves files in one directory, each under a number that no file there had before. Thread-safe.
+class NumberedFiles {
+ public:
+  /// `directory` is made when the first file is saved.
+  explicit NumberedFiles(std::filesystem::path directory) : _directory(std::move(directory)) {}
+
+  /// Saves `bytes` under the next number, followed by `ending`, and returns the path. Throws
+  /// std::runtime_error.
+  std::filesystem::path save(std::string_view bytes, const std::string& ending);
+
+ private:
+  const std::filesystem::path _directory;
+  std::atomic<std::uint64_t> _last = 0;
+};
+
+}  // namespace vesk
