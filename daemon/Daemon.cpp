@@ -71,16 +71,16 @@ struct Daemon::Parts {
                         std::make_shared<PowerLog>(powerLogOptions())},
         sessionServices{backendServices, clientLibraryVersion()},
         http(httpOptions()),
-        agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetch(), busyMarker)),
+        agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetcher(), busyMarker)),
         listener(listenerOptions(serviceManager)) {
     listener.setDelegate(agent.get());
   }
 
-  StorebagFetch storebagFetch() {
-    return [this, source = StorebagSource{sessionServices.libraryVersion, publicKeyDER}](
+  StorebagFetcher storebagFetcher() {
+    return [this, library = LibraryFacts{sessionServices.libraryVersion, publicKeyDER}](
                std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version,
                bool& notModified, std::optional<std::string>& lastModified) {
-      return fetchStorebagForEnvironmentAndClientType(http, source, clientType, maxAge, version, notModified,
+      return fetchStorebagForEnvironmentAndClientType(http, library, clientType, maxAge, version, notModified,
                                                       &lastModified);
     };
   }

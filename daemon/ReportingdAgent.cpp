@@ -21,7 +21,7 @@ std::int32_t clientTypeOf(const ReportingdSession& session) {
 
 }  // namespace
 
-ReportingdAgent::ReportingdAgent(const SessionServices& services, StorebagFetch fetchStorebag,
+ReportingdAgent::ReportingdAgent(const SessionServices& services, StorebagFetcher fetchStorebag,
                                  BusyMarker& busyMarker)
     : _services(services),
       _busyMarker(busyMarker),

@@ -29,7 +29,7 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
                               public std::enable_shared_from_this<ReportingdAgent> {
  public:
   /// All three outlive the agent.
-  ReportingdAgent(const SessionServices& services, StorebagFetch fetchStorebag, BusyMarker& busyMarker);
+  ReportingdAgent(const SessionServices& services, StorebagFetcher fetchStorebag, BusyMarker& busyMarker);
 
   // --- IPCListenerDelegate
   // ----------------------------------------------------------------------------------

@@ -15,7 +15,7 @@
 namespace vesk {
 
 /// Fetches the section of a client type's storebag that applies to this device. Blocks for the request.
-using StorebagFetch = std::function<std::optional<Dictionary>(
+using StorebagFetcher = std::function<std::optional<Dictionary>(
     std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
     std::optional<std::string>& lastModified)>;
 
@@ -26,7 +26,7 @@ class StorebagCache {
   /// After a failed attempt the server is left alone for this long.
   static constexpr std::chrono::seconds kMinimumWaitAfterFailure{900};
 
-  StorebagCache(StorebagFetch fetch, const WallClock& clock) : _fetch(std::move(fetch)), _clock(clock) {}
+  StorebagCache(StorebagFetcher fetch, const WallClock& clock) : _fetch(std::move(fetch)), _clock(clock) {}
 
   /// The cached section where it is fresh enough or may not be fetched yet, else what a fetch brings (or,
   /// when that fails, the last good section). Nothing for a client type without a storebag.
@@ -51,7 +51,7 @@ class StorebagCache {
   bool isFresh(const Record& record, std::int32_t clientType) const;
   void fetchAndCacheStorebag(std::int32_t clientType);
 
-  const StorebagFetch _fetch;
+  const StorebagFetcher _fetch;
   const WallClock& _clock;
   std::map<std::string, Record> _records;
 };

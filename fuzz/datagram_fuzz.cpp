@@ -7,7 +7,7 @@
 #include "backends/DashboardText.h"
 #include "platform/unicode/Unicode.h"
 #include "tests/support/SimulatedQueues.h"
-#include "tools/collector/DashboardText.h"
+#include "tools/collector/ReceivedDatagram.h"
 
 namespace {
 

@@ -74,13 +74,13 @@ Dictionary documentIn(const std::string& body) {
   return document ? *document : Dictionary();
 }
 
-std::optional<Dictionary> verifiedPayload(const Dictionary& document, const StorebagSource& source) {
+std::optional<Dictionary> verifiedPayload(const Dictionary& document, const LibraryFacts& library) {
   auto signatureText = document.text("signature");
   if (!signatureText) {
     VESK_LOG_ERROR("fetchStorebagWithName: Signature is missing");
     return std::nullopt;
   }
-  auto der = source.publicKey ? source.publicKey() : std::nullopt;
+  auto der = library.publicKey ? library.publicKey() : std::nullopt;
   auto publicKey = der ? RSAPublicKey::fromDER(*der) : std::nullopt;
   if (!publicKey) return std::nullopt;
 
@@ -113,19 +113,19 @@ std::int32_t maxAgeFromCacheControl(std::optional<std::string_view> cacheControl
   }
 }
 
-std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const StorebagSource& source,
+std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryFacts& library,
                                                 std::string_view name, std::int32_t& maxAge,
                                                 bool& notModified, std::optional<std::string>* lastModified) {
   std::string url = storebagServerBaseURL();
   ((url += '/') += name) += "?version=";
-  url += source.libraryVersion;
+  url += library.version;
   VESK_LOG_DEBUG("fetchStorebagWithName: Storebag Server URL: %s", url.c_str());
 
   HTTPResult result = http.perform(requestFor(url, lastModified));
   if (result.error && result.error->kind == HTTPError::Kind::TooLarge) {
     // There is an answer, and it is no storebag.
     VESK_LOG_ERROR("fetchStorebagWithName: propertyListWithData error %s", result.error->description.c_str());
-    return verifiedPayload({}, source);
+    return verifiedPayload({}, library);
   }
   if (result.error) {
     VESK_LOG_INFO(
@@ -140,7 +140,7 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const Storebag
     notModified = true;
     return std::nullopt;
   }
-  return verifiedPayload(documentIn(result.response->body), source);
+  return verifiedPayload(documentIn(result.response->body), library);
 }
 
 std::optional<Dictionary> storebagSectionForEnvironment(const Dictionary& payload,
@@ -163,7 +163,7 @@ std::optional<Dictionary> storebagSectionForEnvironment(const Dictionary& payloa
 }
 
 std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
-    HTTPClient& http, const StorebagSource& source, std::int32_t clientType, std::int32_t& maxAge,
+    HTTPClient& http, const LibraryFacts& library, std::int32_t clientType, std::int32_t& maxAge,
     std::optional<std::string>& version, bool& notModified, std::optional<std::string>* lastModified) {
   auto name = storebagNameForClientType(clientType);
   if (!name) {
@@ -172,7 +172,7 @@ std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
         clientType);
     return std::nullopt;
   }
-  auto payload = fetchStorebagWithName(http, source, *name, maxAge, notModified, lastModified);
+  auto payload = fetchStorebagWithName(http, library, *name, maxAge, notModified, lastModified);
   if (!payload) {
     if (notModified) return std::nullopt;
     VESK_LOG_ERROR("fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type %d",

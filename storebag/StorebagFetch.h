@@ -13,8 +13,8 @@
 namespace vesk {
 
 /// What the client library's installation contributes to a fetch.
-struct StorebagSource {
-  std::string libraryVersion;
+struct LibraryFacts {
+  std::string version;
   /// The DER bytes of the RSA key that storebags are signed with, when there is one. Asked on each fetch.
   std::function<std::optional<std::string>()> publicKey;
 };
@@ -32,7 +32,7 @@ std::int32_t maxAgeFromCacheControl(std::optional<std::string_view> cacheControl
 ///
 /// Nothing when there is no usable storebag; the log says why. When the server can't be reached, the storebag
 /// "palvo" is the built-in one.
-std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const StorebagSource& source,
+std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryFacts& library,
                                                 std::string_view name, std::int32_t& maxAge,
                                                 bool& notModified, std::optional<std::string>* lastModified);
 
@@ -46,7 +46,7 @@ std::optional<Dictionary> storebagSectionForEnvironment(const Dictionary& payloa
 /// Fetches the storebag of a client type, as above, and returns the section for this device's environment.
 /// `maxAge` is what the storebag itself says, when it does; `version` is set together with the result.
 std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
-    HTTPClient& http, const StorebagSource& source, std::int32_t clientType, std::int32_t& maxAge,
+    HTTPClient& http, const LibraryFacts& library, std::int32_t clientType, std::int32_t& maxAge,
     std::optional<std::string>& version, bool& notModified, std::optional<std::string>* lastModified);
 
 }  // namespace vesk

@@ -76,7 +76,7 @@ class StorebagFetch : public testing::Test {
     version.reset();
     notModified = false;
     log.clear();
-    return fetchStorebagForEnvironmentAndClientType(http, source, clientType, maxAge, version, notModified,
+    return fetchStorebagForEnvironmentAndClientType(http, library, clientType, maxAge, version, notModified,
                                                     &lastModified);
   }
   /// What the fetch logged, without the line of the URL.
@@ -91,7 +91,7 @@ class StorebagFetch : public testing::Test {
 
   CapturedLog log;
   HTTPClient http;
-  StorebagSource source{"7.3", [] { return std::optional(_key->publicKeyInfo()); }};
+  LibraryFacts library{"7.3", [] { return std::optional(_key->publicKeyInfo()); }};
   std::int32_t maxAge = -1;
   std::optional<std::string> version;
   bool notModified = false;
@@ -200,7 +200,7 @@ TEST_F(StorebagFetch, EveryFailureSaysWhatItIs) {
 TEST_F(StorebagFetch, WithoutAUsableKeyNothingIsTrusted) {
   serve(signedStorebag(payload()));
   for (auto key : {std::optional<std::string>(), std::optional<std::string>("rubbish")}) {
-    source.publicKey = [key] { return key; };
+    library.publicKey = [key] { return key; };
     EXPECT_FALSE(fetch());
     EXPECT_EQ(lines(), (Lines{{3, forClientType("Could not fetch storebag for client type 5")}}));
   }
@@ -279,7 +279,7 @@ TEST_F(StorebagFetch, AsksOnlyForWhatIsNewer) {
 
   // Without a slot nothing is conditional.
   serve(signedStorebag(payload()), {{"Last-Modified", first}});
-  EXPECT_TRUE(fetchStorebagWithName(http, source, "zelko", maxAge, notModified, nullptr));
+  EXPECT_TRUE(fetchStorebagWithName(http, library, "zelko", maxAge, notModified, nullptr));
   EXPECT_FALSE(server().requests().back().header("If-Modified-Since"));
 }
 

@@ -13,8 +13,8 @@
 #include "platform/time/Clock.h"
 #include "tools/collector/CollectorStats.h"
 #include "tools/collector/Console.h"
-#include "tools/collector/DashboardText.h"
 #include "tools/collector/DatagramLoss.h"
+#include "tools/collector/ReceivedDatagram.h"
 
 namespace vesk {
 

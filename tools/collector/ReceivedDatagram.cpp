@@ -1,4 +1,4 @@
-#include "tools/collector/DashboardText.h"
+#include "tools/collector/ReceivedDatagram.h"
 
 #include "backends/SenderCodes.h"
 #include "platform/json/JSONWriter.h"
