@@ -4,7 +4,6 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <cerrno>
 #include <filesystem>
 #include <optional>
 #include <system_error>
@@ -12,6 +11,7 @@
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/files/RootPrefix.h"
+#include "platform/files/WriteAll.h"
 #include "platform/log/SystemLog.h"
 #include "platform/sync/Mutex.h"
 #include "platform/time/CivilTime.h"
@@ -121,14 +121,7 @@ std::optional<LogFile> createLogFile(const std::string& directory, WallTime now)
 
 bool append(const std::string& path, std::string_view line) {
   FileDescriptor file(::open(path.c_str(), O_WRONLY | O_APPEND | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
-  if (!file) return false;
-  while (!line.empty()) {
-    ssize_t count = ::write(file.get(), line.data(), line.size());
-    if (count < 0 && errno == EINTR) continue;
-    if (count <= 0) return false;
-    line.remove_prefix(static_cast<std::size_t>(count));
-  }
-  return true;
+  return file && writeAll(file.get(), line) == 0;
 }
 
 }  // namespace

@@ -1,14 +1,13 @@
 #include "client/common/PersistentIdentifiers.h"
 
 #include <fcntl.h>
-#include <poll.h>
-#include <sys/file.h>
 #include <sys/random.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cctype>
 #include <cerrno>
+#include <chrono>
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
@@ -16,8 +15,10 @@
 #include <system_error>
 
 #include "platform/files/FileDescriptor.h"
+#include "platform/files/FileLock.h"
 #include "platform/files/RootPrefix.h"
 #include "platform/files/SmallFile.h"
+#include "platform/files/WriteAll.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
@@ -56,34 +57,7 @@ bool isIdentifier(std::string_view text) {
 }
 
 // Who holds the lock needs it for as long as a small file takes to be written.
-constexpr int kTriesToLock = 50;
-constexpr int kBetweenTries = 10;  // milliseconds
-
-// Locks until it is destroyed, against other processes and other objects of this one. None, with errno, when
-// another keeps the lock.
-FileDescriptor lockFile(const std::string& path) {
-  FileDescriptor file(::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
-  for (int tries = 1; file && ::flock(file.get(), LOCK_EX | LOCK_NB) != 0; ++tries) {
-    const int cause = errno;
-    if (cause == EWOULDBLOCK && tries < kTriesToLock) {
-      ::poll(nullptr, 0, kBetweenTries);
-      continue;
-    }
-    file.reset();
-    errno = cause;
-  }
-  return file;
-}
-
-bool writeAll(int file, std::string_view text) {
-  while (!text.empty()) {
-    ssize_t written = ::write(file, text.data(), text.size());
-    if (written < 0 && errno == EINTR) continue;
-    if (written < 0) return false;
-    text.remove_prefix(static_cast<std::size_t>(written));
-  }
-  return true;
-}
+constexpr std::chrono::milliseconds kPatience{500};
 
 }  // namespace
 
@@ -100,11 +74,11 @@ PersistentIdentifiers::Pair PersistentIdentifiers::load() const {
   }
   std::error_code ignored;
   std::filesystem::create_directories(std::filesystem::path(_path).parent_path(), ignored);
-  FileDescriptor lock = lockFile(_path + ".lock");
+  FileDescriptor lock;
+  int cause = lockFile(lock, _path + ".lock", kPatience);
   if (lock) {
     if (auto known = readFile()) return *known;
   }
-  int cause = errno;
   Pair pair = fresh();
   if (lock) cause = store(pair);
   if (cause != 0) {
@@ -146,12 +120,10 @@ int PersistentIdentifiers::store(const Pair& pair) const {
   ::unlink(temporary.c_str());
   FileDescriptor file(::open(temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600));
   if (!file) return errno;
-  if (writeAll(file.get(), text) && ::fsync(file.get()) == 0 &&
-      std::rename(temporary.c_str(), _path.c_str()) == 0) {
-    return 0;
-  }
-  int cause = errno;
-  ::unlink(temporary.c_str());
+  int cause = writeAll(file.get(), text);
+  if (cause == 0 && (::fsync(file.get()) != 0 || std::rename(temporary.c_str(), _path.c_str()) != 0))
+    cause = errno;
+  if (cause != 0) ::unlink(temporary.c_str());
   return cause;
 }
 

@@ -1,22 +1,18 @@
 #include "platform/powerlog/PowerLogStore.h"
 
-#include <fcntl.h>
-#include <sys/file.h>
 #include <sys/stat.h>
 
 #include <cerrno>
 #include <cstdio>
 #include <filesystem>
 #include <system_error>
-#include <thread>
 
+#include "platform/files/FileLock.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
 
 namespace {
-
-constexpr std::chrono::milliseconds kBetweenAttempts{10};
 
 constexpr char kSetUp[] =
     "PRAGMA journal_mode=WAL;"
@@ -147,14 +143,8 @@ std::int64_t PowerLogStore::pragma(const char* name) {
 }
 
 bool PowerLogStore::lockOthersOut(FileDescriptor& lock) const {
-  lock = FileDescriptor(::open((_path + ".lock").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
   // Where no lock is to be had, there is nobody who could write to the file either.
-  const auto deadline = std::chrono::steady_clock::now() + _bounds.patience;
-  while (lock && ::flock(lock.get(), LOCK_EX | LOCK_NB) != 0 && errno == EWOULDBLOCK) {
-    if (std::chrono::steady_clock::now() >= deadline) return false;
-    std::this_thread::sleep_for(kBetweenAttempts);
-  }
-  return true;
+  return lockFile(lock, _path + ".lock", _bounds.patience) != EWOULDBLOCK;
 }
 
 std::string PowerLogStore::setAside() {

@@ -2,10 +2,10 @@
 
 #include <unistd.h>
 
-#include <cerrno>
 #include <cstring>
 #include <string>
 
+#include "platform/files/WriteAll.h"
 #include "tools/text/Printable.h"
 
 namespace vesk {
@@ -14,15 +14,7 @@ namespace {
 
 /// 0, or the error number.
 int writeLine(int descriptor, std::string_view line) {
-  std::string bytes = std::string(line) + "\n";
-  std::string_view rest = bytes;
-  while (!rest.empty()) {
-    ssize_t count = ::write(descriptor, rest.data(), rest.size());
-    if (count < 0 && errno == EINTR) continue;
-    if (count < 0) return errno;
-    rest.remove_prefix(static_cast<std::size_t>(count));
-  }
-  return 0;
+  return writeAll(descriptor, std::string(line) + "\n");
 }
 
 }  // namespace

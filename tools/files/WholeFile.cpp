@@ -11,6 +11,7 @@
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/files/SmallFile.h"
+#include "platform/files/WriteAll.h"
 
 namespace vesk {
 
@@ -37,12 +38,7 @@ class Replacement {
 
   void fill(std::string_view contents, mode_t mode) {
     if (::fchmod(_file.get(), mode) != 0) fail(_path, errno);
-    while (!contents.empty()) {
-      ssize_t written = ::write(_file.get(), contents.data(), contents.size());
-      if (written < 0 && errno == EINTR) continue;
-      if (written < 0) fail(_path, errno);
-      contents.remove_prefix(static_cast<std::size_t>(written));
-    }
+    if (int error = writeAll(_file.get(), contents)) fail(_path, error);
     if (::fsync(_file.get()) != 0) fail(_path, errno);
   }
 

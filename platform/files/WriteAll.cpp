@@ -1,0 +1,20 @@
+#include "platform/files/WriteAll.h"
+
+#include <unistd.h>
+
+#include <cerrno>
+
+namespace vesk {
+
+int writeAll(int descriptor, std::string_view bytes) noexcept {
+  while (!bytes.empty()) {
+    const ssize_t count = ::write(descriptor, bytes.data(), bytes.size());
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return errno;
+    if (count == 0) return EIO;  // no progress, and no reason given: trying again might never end
+    bytes.remove_prefix(static_cast<std::size_t>(count));
+  }
+  return 0;
+}
+
+}  // namespace vesk
