@@ -18,7 +18,7 @@ namespace vesk {
 
 class PowerLog;
 
-/// Built once, in daemon/main.cpp; everything in it outlives every backend.
+/// Built once, by the daemon (`Daemon`); everything in it outlives every backend.
 struct BackendServices {
   HTTPClient& http;
   const WallClock& clock;
@@ -37,8 +37,5 @@ struct BackendServices {
   /// Where power-log backends record; without one they record nothing.
   std::shared_ptr<PowerLog> powerLog = nullptr;
 };
-
-/// Bytes of events that all backends of one session hold; shared by them.
-using HeldBytes = std::shared_ptr<std::atomic<std::size_t>>;
 
 }  // namespace vesk

@@ -30,8 +30,6 @@ class EventFilters {
   /// named in the log lines about values of a wrong type, which count as absent.
   void createFiltersFromArray(const List& filters, std::string_view backendName);
 
-  std::int32_t numberOfFilters() const noexcept { return static_cast<std::int32_t>(_filters.size()); }
-
   /// Applies the table in place. The first record that matches a key decides about that key.
   void filterEvent(MutableDictionary& event) const;
 

@@ -8,14 +8,7 @@ namespace vesk {
 
 namespace {
 
-constexpr std::int32_t kDefaultEventThreshold = 49;
 constexpr std::uint16_t kSessionTypeStop = 1;
-
-// What a held event costs beyond its entries and texts: its place in the batch and the decoder's arena chunk.
-constexpr std::size_t kHeldEventOverhead = 1024;
-
-bool isRealtime(std::int32_t flag) { return flag == 1 || flag == 3; }
-bool isOverridingSampling(std::int32_t flag) { return flag == 2 || flag == 3; }
 
 }  // namespace
 
@@ -56,7 +49,7 @@ HTTPSPostBackend::HTTPSPostBackend(const std::string& name, const Dictionary& pr
 HTTPSPostBackend::~HTTPSPostBackend() {
   MutexLock lock(_mutex);
   // Events that never found the backend enabled leave no other trace.
-  std::size_t unsent = takeBatch().size();
+  const std::size_t unsent = endBatch();
   if (unsent > 0) _services.counters.count(_name, DropReason::NeverEnabled, unsent);
 }
 
@@ -71,7 +64,6 @@ void HTTPSPostBackend::setPostURL(const std::optional<std::string>& url) {
 }
 
 // --- One message
-// --------------------------------------------------------------------------------------------
 
 std::optional<std::string> HTTPSPostBackend::sendMessageLocked(const std::optional<Dictionary>& payload,
                                                                const timeval& timestamp, std::uint16_t method,
@@ -123,8 +115,7 @@ std::optional<std::string> HTTPSPostBackend::postNow(MutableDictionary event, st
   if (state() == BackendStateEnabled && !_batchEvents && _batchedEvents) {
     VESK_LOG_DEBUG(
         "HTTPSPostBackend(sendMessage): Backend has changed its state to 'Enabled', batching is not "
-        "requested and "
-        "some events have already been batched. Forcing Flush here to keep events in order.");
+        "requested and some events have already been batched. Forcing Flush here to keep events in order.");
     flushMessagesLocked();
   }
   VESK_LOG_DEBUG("HTTPSPostBackend(sendMessage): Sending %d, %d, %d", state(), _batchEvents,
@@ -142,7 +133,6 @@ std::optional<std::string> HTTPSPostBackend::postNow(MutableDictionary event, st
 }
 
 // --- Batches
-// ------------------------------------------------------------------------------------------------
 
 void HTTPSPostBackend::batchEvent(MutableDictionary event) {
   const Value* methodValue = event.find("_method");
@@ -161,30 +151,19 @@ void HTTPSPostBackend::batchEvent(MutableDictionary event) {
 }
 
 void HTTPSPostBackend::hold(MutableDictionary event) {
-  if (!_batchedEvents) _batchedEvents.emplace();
-  std::size_t bytes = approximateMemory(event) + kHeldEventOverhead;
-  _batchedEvents->push_back({std::move(event), bytes});
-  *_heldBytes += bytes;
+  if (!_batchedEvents) _batchedEvents.emplace(_heldBytes);
+  _batchedEvents->add(std::move(event));
   if (*_heldBytes > kMaximumHeldBytes) boundHeldEvents();
 }
 
 // Enabled, a full batch is simply sent. Otherwise nobody may be told yet, and the oldest events have to go.
 void HTTPSPostBackend::boundHeldEvents() {
   if (state() == BackendStateEnabled) flushMessagesLocked();
-  if (!_batchedEvents) return;
-  std::size_t surplus = 0;
-  for (std::size_t bytes = *_heldBytes; bytes > kMaximumHeldBytes && surplus + 1 < _batchedEvents->size();) {
-    bytes -= (*_batchedEvents)[surplus++].bytes;
-  }
-  dropOldestEvents(surplus, kMaximumHeldBytes);
+  if (_batchedEvents) noteDropped(_batchedEvents->dropOldest(kMaximumHeldBytes), kMaximumHeldBytes);
 }
 
-void HTTPSPostBackend::dropOldestEvents(std::size_t count, std::size_t bound) {
+void HTTPSPostBackend::noteDropped(std::size_t count, std::size_t bound) {
   if (count == 0) return;
-  for (std::size_t i = 0; i < count; ++i) {
-    *_heldBytes -= _batchedEvents->front().bytes;
-    _batchedEvents->pop_front();
-  }
   _services.counters.count(_name, DropReason::OverBound, count);
   if (std::exchange(_droppingBurst, true)) return;
   VESK_LOG_WARNING(
@@ -192,14 +171,13 @@ void HTTPSPostBackend::dropOldestEvents(std::size_t count, std::size_t bound) {
       _name.c_str(), bound);
 }
 
-HTTPSPostBackend::Events HTTPSPostBackend::takeBatch() {
-  Events events;
-  if (_batchedEvents) events.swap(*_batchedEvents);
+/// How many events it had.
+std::size_t HTTPSPostBackend::endBatch() {
+  const std::size_t count = _batchedEvents ? _batchedEvents->size() : 0;
   _batchedEvents.reset();
   _eventMethodCounts.clear();
   _droppingBurst = false;
-  for (const HeldEvent& held : events) *_heldBytes -= held.bytes;
-  return events;
+  return count;
 }
 
 std::optional<std::string> HTTPSPostBackend::flushMessagesLocked() {
@@ -209,8 +187,8 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesLocked() {
   VESK_LOG_DEBUG("HTTPSPostBackend(flushMessages): called");
   addUserInfoToHeldEvents();
   std::optional<std::string> pretty;
-  auto body = createMessageForPostAndLogging(*_batchedEvents, &pretty);
-  std::size_t eventCount = takeBatch().size();
+  auto body = createMessageForPostAndLogging(_batchedEvents->events(), &pretty);
+  const std::size_t eventCount = endBatch();
   if (!body) {
     _services.counters.count(_name, DropReason::BodyNotBuilt, eventCount);
     return std::nullopt;
@@ -219,37 +197,18 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesLocked() {
   return pretty;
 }
 
-// Events held before the user info arrived get it now. Its first key tells which events have it already.
+// Events held before the user info arrived get it now.
 void HTTPSPostBackend::addUserInfoToHeldEvents() {
   if (!_userInfoDict) return;
   MutableDictionary filtered(*_userInfoDict);
   _filters.filterEvent(filtered);
   if (filtered.empty()) return;
-  const Dictionary userInfo = filtered.share();
-  const std::string_view marker = userInfo.begin()->key.view();
-  const std::size_t growth = approximateMemory(userInfo);
-  for (std::size_t left = _batchedEvents->size(); left > 0; --left) {  // the newest first
-    HeldEvent& held = (*_batchedEvents)[left - 1];
-    if (held.event.contains(marker)) continue;
-    if (*_heldBytes + growth > kMaximumFlushBytes && left < _batchedEvents->size()) {
-      return dropOldestEvents(left, kMaximumFlushBytes);
-    }
-    held.event.setAll(userInfo);
-    held.bytes += growth;
-    *_heldBytes += growth;
-  }
+  noteDropped(_batchedEvents->addUserInfo(filtered.share(), kMaximumFlushBytes), kMaximumFlushBytes);
 }
 
 void HTTPSPostBackend::setCorrelatedSessionIDLocked(const std::optional<Text>& sessionID) {
   VeskReportingBackend::setCorrelatedSessionIDLocked(sessionID);
-  if (!_batchedEvents) return;
-  for (HeldEvent& held : *_batchedEvents) {
-    if (sessionID) {
-      held.event.set(Text::literal("_sessionID"), *sessionID);
-    } else {
-      held.event.remove("_sessionID");
-    }
-  }
+  if (_batchedEvents) _batchedEvents->setSessionID(sessionID);
 }
 
 }  // namespace vesk

@@ -1,7 +1,6 @@
 // The main backend: events as JSON, posted singly or in batches over HTTPS.
 #pragma once
 
-#include <deque>
 #include <memory>
 #include <optional>
 #include <string>
@@ -9,6 +8,7 @@
 #include <unordered_map>
 #include <vector>
 
+#include "backends/EventBatch.h"
 #include "backends/EventFilters.h"
 #include "backends/VeskReportingBackend.h"
 
@@ -50,12 +50,10 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   void setCorrelatedSessionIDLocked(const std::optional<Text>& sessionID) override VESK_REQUIRES(_mutex);
 
  private:
-  /// An event waiting for the next flush.
-  struct HeldEvent {
-    MutableDictionary event;
-    std::size_t bytes = 0;
-  };
-  using Events = std::deque<HeldEvent>;
+  /// Messages of one method that a batch takes beyond the first.
+  static constexpr std::int32_t kDefaultEventThreshold = 49;
+
+  using Events = EventBatch::Events;
 
   HTTPSPostBackend(const std::string& name, const Dictionary& profile, const Text& productFamily,
                    const BackendServices& services);
@@ -87,9 +85,9 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   void batchEvent(MutableDictionary event) VESK_REQUIRES(_mutex);
   void hold(MutableDictionary event) VESK_REQUIRES(_mutex);
   void boundHeldEvents() VESK_REQUIRES(_mutex);
-  void dropOldestEvents(std::size_t count, std::size_t bound) VESK_REQUIRES(_mutex);
+  void noteDropped(std::size_t count, std::size_t bound) VESK_REQUIRES(_mutex);
   void addUserInfoToHeldEvents() VESK_REQUIRES(_mutex);
-  Events takeBatch() VESK_REQUIRES(_mutex);
+  std::size_t endBatch() VESK_REQUIRES(_mutex);
   std::optional<std::string> postNow(MutableDictionary event, std::uint16_t method, std::uint16_t respCode,
                                      std::int32_t flag) VESK_REQUIRES(_mutex);
 
@@ -106,21 +104,23 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   void postCompleted(const HTTPResult& result, std::size_t eventCount);
 
   // Constant after construction.
-  const bool _dnuEnabled;              // the user's consent
-  const std::string _uuidRespectDnu;   // client identifier where the consent is respected
-  const std::string _uuidOverrideDnu;  // client identifier where the storebag overrides it
+  const bool _dnuEnabled;  // the user's consent
+  // The client's identifier: where the consent is respected, and where the storebag overrides it.
+  const std::string _uuidRespectDnu;
+  const std::string _uuidOverrideDnu;
 
   // Guarded by _mutex.
   std::optional<std::string> _postURL VESK_GUARDED_BY(_mutex);
-  bool _useDefaultPostURL VESK_GUARDED_BY(_mutex) = false;  // _postURL comes from the preferences
   std::optional<std::string> _realtimePostURL VESK_GUARDED_BY(_mutex);
+  // Whether they come from the preferences.
+  bool _useDefaultPostURL VESK_GUARDED_BY(_mutex) = false;
   bool _useDefaultRealtimePostURL VESK_GUARDED_BY(_mutex) = false;
-  std::optional<Events> _batchedEvents VESK_GUARDED_BY(_mutex);
-  bool _droppingBurst VESK_GUARDED_BY(_mutex) =
-      false;  // the line about dropped events is written once a burst
+  std::optional<EventBatch> _batchedEvents VESK_GUARDED_BY(_mutex);
+  // The line about dropped events is written once a batch.
+  bool _droppingBurst VESK_GUARDED_BY(_mutex) = false;
   EventFilters _filters VESK_GUARDED_BY(_mutex);
-  std::int32_t _dnuType VESK_GUARDED_BY(_mutex) =
-      0;  // 0 consent respected; overridden: 1 without it, 2 with it
+  // 0 consent respected; overridden: 1 without it, 2 with it.
+  std::int32_t _dnuType VESK_GUARDED_BY(_mutex) = 0;
   std::int32_t _eventThreshold VESK_GUARDED_BY(_mutex);
   std::int32_t _extrasOnInternal VESK_GUARDED_BY(_mutex) = 0;
   std::optional<Value> _overrideSampling VESK_GUARDED_BY(_mutex);  // a number

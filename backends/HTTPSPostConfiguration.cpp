@@ -12,8 +12,6 @@ namespace vesk {
 
 namespace {
 
-constexpr std::int32_t kDefaultEventThreshold = 49;
-
 std::optional<std::string_view> viewOf(const std::optional<Text>& text) {
   if (!text) return std::nullopt;
   return text->view();

@@ -50,7 +50,7 @@ std::string HTTPSPostBackend::clientIdentifier() const {
 std::optional<std::string> HTTPSPostBackend::createMessageForPostAndLogging(
     Events& events, std::optional<std::string>* prettyJsonString) const {
   double postTime = finiteOrMinusOne(secondsFromTimeval(timevalFrom(_services.clock.now())));
-  for (HeldEvent& held : events) sanitize(held.event);
+  for (auto& held : events) sanitize(held.event);
   std::string clientId = clientIdentifier();
 
   auto serialize = [&](JSONStyle style) {
@@ -63,14 +63,7 @@ std::optional<std::string> HTTPSPostBackend::createMessageForPostAndLogging(
     writer.text(clientId);
     writer.key("events");
     writer.beginArray();
-    for (const HeldEvent& held : events) {
-      writer.beginObject();
-      for (const auto& entry : held.event.entries()) {
-        writer.key(entry.key.view());
-        writer.value(entry.value);
-      }
-      writer.endObject();
-    }
+    for (const auto& held : events) writer.value(held.event);
     writer.endArray();
     writer.endObject();
     return writer.finish();
@@ -108,7 +101,7 @@ void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t flag,
                                        std::optional<std::uint16_t> method,
                                        std::optional<std::uint16_t> responseCode,
                                        std::size_t eventCount) try {
-  const auto& url = flag == 1 || flag == 3 ? _realtimePostURL : _postURL;
+  const auto& url = isRealtime(flag) ? _realtimePostURL : _postURL;
   if (!url) {
     _services.counters.count(_name, DropReason::NoURL, eventCount);
     return;

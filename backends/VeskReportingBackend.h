@@ -11,6 +11,7 @@
 #include <string_view>
 
 #include "backends/BackendServices.h"
+#include "backends/EventBatch.h"
 #include "platform/sync/Mutex.h"
 #include "platform/values/Value.h"
 
@@ -23,16 +24,15 @@ enum BackendState : std::int32_t {
   BackendStateOverride = 3,  ///< sampled out, inside the override band: held back until a message lifts it
 };
 
-/// Bits of a message's flag.
-enum MessageFlag : std::uint32_t {
-  MessageFlagRealtime = 1,
-  MessageFlagOverrideSampling = 2,
-};
+/// A message's flag is compared with these as a whole: other bits make it an ordinary message.
+constexpr bool isRealtime(std::int32_t flag) { return flag == 1 || flag == 3; }
+constexpr bool isOverridingSampling(std::int32_t flag) { return flag == 2 || flag == 3; }
 
 /// One destination of a session's messages. Its operations may be called from any thread and do not overlap:
-/// each takes the backend's own mutex, which is a leaf (no other lock of the project is taken under it, and
-/// it is never held while a server is waited for). Subclasses override the `…Locked` forms, which run under
-/// that mutex. Kept alive by its session and by posts that are under way.
+/// each takes the backend's own mutex. Under it only leaves are locked, for moments (queues, counters), and
+/// no server is waited for; a subclass that calls foreign code releases it meanwhile and says so. Subclasses
+/// override the `…Locked` forms, which run under that mutex. Kept alive by its session and by posts that are
+/// under way.
 class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBackend> {
  public:
   /// The backend that a storebag lists under `name`; nothing for a name that is not known, for a Wren backend
@@ -73,8 +73,7 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
 
   void setCorrelatedSessionID(const std::optional<std::string>& sessionID);
 
-  // --- Properties
-  // -------------------------------------------------------------------------------------------
+  // --- Properties -----------------------------------------------------------------------------------------
 
   /// Also written by the completion of a post.
   std::int32_t state() const noexcept { return _state.load(); }

@@ -88,7 +88,7 @@ TEST(JSON, StreamsADocumentPartByPart) {
   writer.beginArray();
   writer.value(event);
   writer.value(Dictionary{{"n", 2}});
-  writer.null();
+  writer.value(Value());
   writer.endArray();
   writer.key("more");
   writer.value(List{true});
@@ -107,7 +107,7 @@ TEST(JSON, FailsOnCallsOutOfOrder) {
   const auto array = [](JSONWriter& w) { w.beginArray(); };
   const auto endArray = [](JSONWriter& w) { w.endArray(); };
   const auto key = [](JSONWriter& w) { w.key("k"); };
-  const auto value = [](JSONWriter& w) { w.integer(1); };
+  const auto value = [](JSONWriter& w) { w.number(1); };
   EXPECT_TRUE(fails());
   EXPECT_TRUE(fails(object));
   EXPECT_TRUE(fails(value, value));

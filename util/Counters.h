@@ -30,8 +30,9 @@ enum class DropReason : std::uint8_t {
   NotRecorded,     ///< a local record could not be written
   AdaptorFailed,   ///< an adaptor was missing or did not take it
   ServerRefused,   ///< the server answered, neither with success (2xx) nor with an error of its own (5xx)
+                   // the last one: kDropReasonCount follows from it
 };
-inline constexpr std::size_t kDropReasonCount = 15;
+inline constexpr std::size_t kDropReasonCount = static_cast<std::size_t>(DropReason::ServerRefused) + 1;
 
 /// A word for it, for tools and logs: "state-disabled".
 std::string_view nameOfDropReason(DropReason reason) noexcept;

@@ -20,8 +20,8 @@ std::optional<Text> deviceHardwareModel();
 std::optional<Text> deviceSerialNumber();
 
 /// Writes the device's unique identifier with a terminating NUL into `buffer`, and 0 into its last byte. The
-/// buffer keeps what it held when there is no identifier. One that does not fit with its terminator must not
-/// be used: then the buffer holds as much as fits, without promise; callers pass 41 bytes, for 40 digits.
+/// buffer keeps what it held when there is no identifier. One that does not fit with its terminator leaves an
+/// empty text; callers pass 41 bytes, for 40 digits.
 void copyUniqueDeviceID(char* buffer, std::size_t size);
 
 /// True when the device runs an internal build. Found out on first use and fixed for the life of the process.

@@ -6,9 +6,8 @@
 
 namespace vesk {
 
-/// The directory that stands for "/" (without a trailing slash; "" is the real root). First use fixes it:
-/// what `setRootPrefix` set, else the environment variable VESKREPORTINGD_ROOT, else the real root.
-/// Thread-safe after start-up.
+/// The directory that stands for "/" (without a trailing slash; "" is the real root). What `setRootPrefix`
+/// set, else the environment variable VESKREPORTINGD_ROOT, else the real root. Thread-safe after start-up.
 const std::string& rootPrefix();
 
 /// Called once, first thing in `main`, before any thread starts.

@@ -214,13 +214,7 @@ void JSONWriter::text(std::string_view text) {
   _impl->value([&](Impl& impl, std::size_t) { return impl.writeText(text); });
 }
 
-void JSONWriter::integer(std::int64_t number) { value(Value(number)); }
-void JSONWriter::unsignedInteger(std::uint64_t number) { value(Value(number)); }
 void JSONWriter::number(double number) { value(Value(number)); }
-void JSONWriter::boolean(bool boolean) { value(Value(boolean)); }
-void JSONWriter::null() { value(Value()); }
-
-bool JSONWriter::good() const noexcept { return _impl->good(); }
 
 std::optional<std::string> JSONWriter::finish() {
   if (!_impl->isComplete()) return std::nullopt;

@@ -29,7 +29,7 @@ enum class JSONStyle {
 /// What JSON can't carry makes the whole document fail, which `finish` tells; calls after that do nothing. It
 /// fails on: text or a key that is not UTF-8, a double (or date) that is not finite, bytes, values nested
 /// deeper than 64, and calls out of order. Callers that would rather report something for such a value
-/// replace it first (`finiteOrMinusOne`).
+/// replace it first.
 ///
 /// Doubles are written with as few digits as read back to the same double, so that seconds since 1970 keep
 /// their microseconds. Dates are written as their seconds since 1970, the null marker as null. A key that is
@@ -55,14 +55,7 @@ class JSONWriter {
   void value(const MutableDictionary& dictionary);
 
   void text(std::string_view text);
-  void integer(std::int64_t number);
-  void unsignedInteger(std::uint64_t number);
   void number(double number);
-  void boolean(bool value);
-  void null();
-
-  /// True while everything written so far is good.
-  bool good() const noexcept;
 
   /// The text when it is good and complete, else nothing. The writer is used up.
   std::optional<std::string> finish();

@@ -19,7 +19,7 @@ class SystemLog {
  public:
   using Sink = std::function<void(LogLevel, std::string_view line)>;
 
-  /// Opens the log for a process. Before that (and after `close`) lines of level 4 and lower still appear.
+  /// Opens the log for a process. Lines appear without that (and after `close`) too, without its name.
   static void open(std::string_view processName, std::string_view facility);
   static void close() noexcept;
 

@@ -12,23 +12,19 @@
 #define VESK_CAPABILITY(x) VESK_THREAD_ANNOTATION(capability(x))
 #define VESK_SCOPED_CAPABILITY VESK_THREAD_ANNOTATION(scoped_lockable)
 #define VESK_GUARDED_BY(x) VESK_THREAD_ANNOTATION(guarded_by(x))
-#define VESK_PT_GUARDED_BY(x) VESK_THREAD_ANNOTATION(pt_guarded_by(x))
 #define VESK_REQUIRES(...) VESK_THREAD_ANNOTATION(requires_capability(__VA_ARGS__))
 #define VESK_EXCLUDES(...) VESK_THREAD_ANNOTATION(locks_excluded(__VA_ARGS__))
 #define VESK_ACQUIRE(...) VESK_THREAD_ANNOTATION(acquire_capability(__VA_ARGS__))
 #define VESK_RELEASE(...) VESK_THREAD_ANNOTATION(release_capability(__VA_ARGS__))
-#define VESK_ACQUIRED_AFTER(...) VESK_THREAD_ANNOTATION(acquired_after(__VA_ARGS__))
 #define VESK_RETURNS_CAPABILITY(x) VESK_THREAD_ANNOTATION(lock_returned(x))
-#define VESK_NO_THREAD_SAFETY_ANALYSIS VESK_THREAD_ANNOTATION(no_thread_safety_analysis)
 
 namespace vesk {
 
+/// Condition variables that wait on it are std::condition_variable_any.
 class VESK_CAPABILITY("mutex") Mutex {
  public:
   void lock() VESK_ACQUIRE() { _mutex.lock(); }
   void unlock() VESK_RELEASE() { _mutex.unlock(); }
-  /// For condition variables (std::condition_variable_any waits on the Mutex itself).
-  std::mutex& native() { return _mutex; }
 
  private:
   std::mutex _mutex;
