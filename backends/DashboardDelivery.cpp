@@ -31,7 +31,6 @@ DashboardDelivery::~DashboardDelivery() {
 }
 
 // --- Construction
-// --------------------------------------------------------------------------------------------
 
 void DashboardDelivery::useReliableUDP() {
   if (int error = _socket.bindToAnyPort()) {
@@ -63,7 +62,6 @@ bool DashboardDelivery::start(std::chrono::milliseconds tick) {
 }
 
 // --- From the session
-// ----------------------------------------------------------------------------------------
 
 void DashboardDelivery::send(std::unique_ptr<Buffer> buffer, std::uint16_t length,
                              std::uint16_t eventNumber) {
@@ -95,7 +93,6 @@ void DashboardDelivery::cleanup() {
 }
 
 // --- On the queue
-// --------------------------------------------------------------------------------------------
 
 void DashboardDelivery::sendHandedOver() {
   std::vector<HandedOver> datagrams;

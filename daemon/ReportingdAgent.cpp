@@ -34,24 +34,10 @@ std::string ReportingdAgent::description() const {
 }
 
 // --- Connections
-// --------------------------------------------------------------------------------------------
 
 bool ReportingdAgent::shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) {
-  if (SystemLog::isOn(LogLevel::Debug)) {
-    std::size_t sessions = 0;
-    std::size_t correlated = 0;
-    {
-      MutexLock lock(_sessionListMutex);
-      sessions = _sessionList.size();
-    }
-    {
-      RecursiveMutexLock lock(_monitor);
-      correlated = _correlatedSessions.size();
-    }
-    VESK_LOG_DEBUG("listener: Accepting new Orvo connection %s, %d(%d) connections.",
-                   connection->description().c_str(), static_cast<int>(sessions),
-                   static_cast<int>(correlated));
-  }
+  VESK_LOG_DEBUG("listener: Accepting new Orvo connection %s, %d(%d) connections.",
+                 connection->description().c_str(), _sessionCount.load(), _familyCount.load());
   auto session = std::make_shared<ReportingdSession>(shared_from_this(), connection, _services);
   connection->setExportedObject(std::make_shared<ClientSessionStub>(session));
   connection->setInterruptionHandler([session] {
@@ -66,6 +52,7 @@ bool ReportingdAgent::shouldAcceptNewConnection(const std::shared_ptr<IPCConnect
   {
     MutexLock lock(_sessionListMutex);
     _sessionList.push_back(session);
+    ++_sessionCount;
     if (_sessionList.size() == 1) _busyMarker.begin();
   }
   connection->resume();
@@ -81,18 +68,19 @@ void ReportingdAgent::sessionInvalidated(const std::shared_ptr<ReportingdSession
 // The caller holds a reference of its own, so neither erasure can be the session's end under a lock.
 void ReportingdAgent::removeFromSessionList(const std::shared_ptr<ReportingdSession>& session) {
   MutexLock lock(_sessionListMutex);
-  if (std::erase(_sessionList, session) > 0 && _sessionList.empty()) _busyMarker.end();
+  if (std::erase(_sessionList, session) == 0) return;
+  --_sessionCount;
+  if (_sessionList.empty()) _busyMarker.end();
 }
 
 // Its family is looked for in every list: the key of its present user info may not be the one that it joined
-// under, since a client may take its user info back, or configure its session anew.
+// under, since a client may configure its session anew.
 void ReportingdAgent::removeFromCorrelation(const std::shared_ptr<ReportingdSession>& session) {
   RecursiveMutexLock lock(_monitor);
   for (auto& [key, list] : _correlatedSessions) std::erase(list, session);
 }
 
 // --- Storebags
-// ----------------------------------------------------------------------------------------------
 
 std::optional<Dictionary> ReportingdAgent::storebagForSession(ReportingdSession& session) {
   std::int32_t clientType = clientTypeOf(session);

@@ -1,12 +1,12 @@
 // Accepts clients, keeps their sessions, and serves these as their delegate.
 #pragma once
 
+#include <atomic>
 #include <cstddef>
 #include <map>
 #include <memory>
 #include <optional>
 #include <string>
-#include <unordered_map>
 #include <vector>
 
 #include "daemon/StorebagCache.h"
@@ -32,13 +32,11 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
   ReportingdAgent(const SessionServices& services, StorebagFetcher fetchStorebag, BusyMarker& busyMarker);
 
   // --- IPCListenerDelegate
-  // ----------------------------------------------------------------------------------
   bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) override;
   /// What the end of a session's connection does: the session leaves the list and its family.
   void sessionInvalidated(const std::shared_ptr<ReportingdSession>& session);
 
   // --- ReportingdSessionDelegate
-  // ----------------------------------------------------------------------------
   std::optional<Dictionary> storebagForSession(ReportingdSession& session) override;
   std::optional<std::string> storebagVersionForSession(ReportingdSession& session) override;
   std::optional<std::string> parentSessionIDStringForSession(ReportingdSession& session) override;
@@ -67,6 +65,11 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
                                                                          const SessionList& list);
   const SessionList* correlatedSessions(const std::string& key) const VESK_REQUIRES(_monitor);
   SessionList& listForKey(const std::string& key) VESK_REQUIRES(_monitor);
+
+  // Written under the lock of what they count, and read without it: a listener's log line must not wait for a
+  // storebag.
+  std::atomic<int> _sessionCount{0};
+  std::atomic<int> _familyCount{0};
 
   // Constant after construction.
   const SessionServices& _services;

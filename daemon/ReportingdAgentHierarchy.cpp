@@ -37,19 +37,22 @@ ReportingdAgent::SessionList& ReportingdAgent::listForKey(const std::string& key
   if (_correlatedSessions.size() >= kMostKeptLists && !correlatedSessions(key)) {
     std::erase_if(_correlatedSessions, [](const auto& entry) { return entry.second.empty(); });
   }
-  return _correlatedSessions[key];
+  SessionList& list = _correlatedSessions[key];
+  _familyCount = static_cast<int>(_correlatedSessions.size());
+  return list;
 }
 
 void ReportingdAgent::userInfoUpdatedForSession(ReportingdSession& session) {
   auto userInfo = session.userInfo();
   if (!userInfo) {
     VESK_LOG_INFO("userInfoUpdatedForSession: No user info found for session %u", session.sessionID());
+    removeFromCorrelation(session.shared_from_this());  // a client may take back what it had said
     return;
   }
   auto self = session.shared_from_this();
   std::string key = correlationKeyForUserInfo(*userInfo);
   RecursiveMutexLock lock(_monitor);
-  for (auto& [otherKey, list] : _correlatedSessions) std::erase(list, self);
+  removeFromCorrelation(self);
   VESK_LOG_DEBUG("userInfoUpdatedForSession: Adding session %u to list for userInfoKey %s",
                  session.sessionID(), key.c_str());
   listForKey(key).push_back(self);

@@ -44,6 +44,7 @@ ReportingdSession::ReportingdSession(std::shared_ptr<ReportingdSessionDelegate> 
 
 ReportingdSession::~ReportingdSession() {
   VESK_LOG_DEBUG("dealloc: ReportingdSession dealloc: %u", sessionID());
+  _isEnding = true;
   // Without memory, one step's failure must neither end the process nor keep the others from being tried.
   auto attempt = [](auto step) {
     try {
@@ -63,7 +64,6 @@ ReportingdSession::~ReportingdSession() {
 }
 
 // --- Identity
-// -----------------------------------------------------------------------------------------------
 
 std::uint32_t ReportingdSession::sessionID() const {
   MutexLock lock(_mutex);
@@ -104,7 +104,6 @@ ReportingdSession::SharedBackends ReportingdSession::backends() const {
 }
 
 // --- The client's operations
-// --------------------------------------------------------------------------------
 
 void ReportingdSession::setSessionInfo(const Dictionary& sessionInfo,
                                        const std::optional<Dictionary>& userInfo,

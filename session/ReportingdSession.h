@@ -45,7 +45,6 @@ class ReportingdSession final : public ClientSessionInterface,
   ReportingdSession& operator=(const ReportingdSession&) = delete;
 
   // --- ClientSessionInterface
-  // -------------------------------------------------------------------------------
   void setSessionInfo(const Dictionary& sessionInfo, const std::optional<Dictionary>& userInfo,
                       const List& frameworksToCheck, bool hasAggregationBlock) override;
   void startConfigWithCompletionHandler(Reply<std::optional<BackendNames>> reply) override;
@@ -67,7 +66,6 @@ class ReportingdSession final : public ClientSessionInterface,
                                   Reply<std::string> reply) override;
 
   // --- Identity
-  // ---------------------------------------------------------------------------------------------
   /// The client's number for the session; 0 until configured.
   std::uint32_t sessionID() const;
   /// The session's own identity: 24 characters, made at creation.
@@ -78,7 +76,6 @@ class ReportingdSession final : public ClientSessionInterface,
   std::string description() const;
 
   // --- Relatives
-  // --------------------------------------------------------------------------------------------
   /// The level in the family: 0 at the top.
   std::int32_t getSessionHierarchy() const;
   bool hasAggregator() const;
@@ -133,6 +130,8 @@ class ReportingdSession final : public ClientSessionInterface,
   const SessionServices& _services;
   const std::string _sessionIDString;
   std::array<char, 41> _deviceid{};  // NUL-terminated; empty when the device gives no answer
+
+  bool _isEnding = false;  // by its destructor's thread alone
 
   // Guarded by _mutex.
   mutable Mutex _mutex;

@@ -63,8 +63,9 @@ void ReportingdSession::sendToAggregator(const std::optional<Dictionary>& sessio
                                          std::uint16_t category, std::uint16_t type,
                                          const std::optional<Dictionary>& payload) {
   ClientSessionReplyProxy proxy(_connection, [&](const std::string& error) {
-    // The closing message, which has no session info, says nothing that the connection's end does not.
-    if (sessionInfo) _services.backends.counters.count("session", DropReason::NotAggregated);
+    // To its own client that has gone, a session's last messages say nothing that the connection's end does
+    // not; neither does the closing one, which has no session info.
+    if (sessionInfo && !_isEnding) _services.backends.counters.count("session", DropReason::NotAggregated);
     if (!undeliveredBurstBegins()) return;
     VESK_LOG_ERROR("sendMessageWithDictionary: Failed to get remote object proxy: %s", error.c_str());
   });

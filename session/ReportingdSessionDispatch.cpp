@@ -48,7 +48,8 @@ std::optional<std::string> ReportingdSession::sendMessageWithDictionary(const Di
   auto set = backends();
   if (!set) {
     VESK_LOG_DEBUG("sendMessageWithDictionary: No backends available to send message");
-    _services.backends.counters.count("session", DropReason::NoBackend);
+    // The session's own last message has no news for a session that never had a backend.
+    if (!_isEnding) _services.backends.counters.count("session", DropReason::NoBackend);
     return std::nullopt;
   }
   auto category = unsignedForKey(parameters, kVeskReportingMessageParametersCategory);
@@ -151,6 +152,7 @@ void ReportingdSession::sendSingleMessage(const SessionServices& services,
                  static_cast<long>(integerForKey(info, kVeskReportingSessionInfoSessionID).value_or(0)));
   if (!sessionInfo || !storebag) {
     VESK_LOG_ERROR("RsendMessageWithSessionInfo: Attempted to send message with one or more nil parameters");
+    services.backends.counters.count("session", DropReason::NoBackend);
     return;
   }
   std::array<char, 41> deviceID{};
@@ -159,6 +161,7 @@ void ReportingdSession::sendSingleMessage(const SessionServices& services,
                                  services.backends);
   if (!backends) {
     VESK_LOG_ERROR("sendMessageWithSessionInfo: No backends available to send single message");
+    services.backends.counters.count("session", DropReason::NoBackend);
     return;
   }
   if (userInfo && !booleanForKey(info, kVeskReportingSessionInfoRequireUserInfo).value_or(false)) {

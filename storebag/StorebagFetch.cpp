@@ -131,7 +131,8 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryF
     VESK_LOG_INFO(
         "fetchStorebagWithName: Error resolving with lookup server %s, sendSynchronousRequest error %s",
         url.c_str(), result.error->description.c_str());
-    if (name != kFallbackName) return std::nullopt;
+    // No client of a daemon that ends should start with less than the server would give it.
+    if (name != kFallbackName || result.error->kind == HTTPError::Kind::Stopped) return std::nullopt;
     VESK_LOG_INFO("fetchStorebagWithName: Loading default storebag '%s'", std::string(name).c_str());
     return fallbackStorebag();
   }

@@ -1,6 +1,8 @@
 // Families of sessions: parents, combined IDs, reporting states, aggregation.
 #include <gtest/gtest.h>
 
+#include <future>
+#include <latch>
 #include <limits>
 
 #include "tests/support/CapturedLog.h"
@@ -79,8 +81,12 @@ TEST_F(Family, ASessionLeavesItsFamilyUnderWhateverNameItJoined) {
   std::weak_ptr<ReportingdSession> tookItBack;
   std::weak_ptr<ReportingdSession> configuredAnew;
   {
-    auto first = join(0);
+    auto first = join(0, true);
+    auto child = join(1);
     first->fetchStatesWithUserInfo(std::nullopt, {});
+    const std::size_t before = first.connection->calls.size();
+    child.send(message());
+    EXPECT_EQ(first.connection->calls.size(), before) << "its family's messages are no longer its business";
     tookItBack = first.session;
     auto second = join(0);
     second->setSessionInfo(Dictionary(), userInfo("Other"), {}, false);
@@ -88,6 +94,35 @@ TEST_F(Family, ASessionLeavesItsFamilyUnderWhateverNameItJoined) {
   }
   EXPECT_TRUE(tookItBack.expired());
   EXPECT_TRUE(configuredAnew.expired());
+}
+
+TEST_F(Family, AcceptingWaitsForNoStorebag) {
+  CapturedLog log;
+  auto top = join(0);
+  std::latch held(1), accepted(1);
+  auto fetch = std::async(std::launch::async, [&] {
+    RecursiveMutexLock lock(harness.agent->monitor());
+    held.count_down();
+    accepted.wait();
+  });
+  held.wait();
+  auto connection = std::make_shared<RecordingConnection>();
+  EXPECT_TRUE(harness.agent->shouldAcceptNewConnection(connection));
+  EXPECT_EQ(log.countContaining(7, "Accepting new Orvo connection recording connection, 0(1) connections."),
+            1);
+  accepted.count_down();
+  connection->invalidate();
+}
+
+TEST_F(Family, ClientsThatLeaveLoseNothing) {
+  { auto neverStarted = harness.newSession(); }
+  {
+    auto aggregator = join(0, true);
+    aggregator.connection->clientIsGone = true;
+  }
+  EXPECT_EQ(harness.dropped(DropReason::NoBackend) + harness.dropped(DropReason::NotAggregated), 0u);
+  harness.newSession().send(message());
+  EXPECT_EQ(harness.dropped(DropReason::NoBackend), 1u);
 }
 
 }  // namespace

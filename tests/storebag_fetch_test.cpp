@@ -242,6 +242,8 @@ TEST_F(StorebagFetch, AnUnreachableServerMeansTheBuiltInStorebagForOneNameOnly) 
   server().start();
   serve(std::string(std::size_t{5} << 20, ' '));
   EXPECT_FALSE(fetch(7)) << "an answer of any kind does not mean that";
+  http.stopAllButPosts();
+  EXPECT_FALSE(fetch(7)) << "the daemon ends, and the server is as good as ever";
 }
 
 TEST_F(StorebagFetch, AsksOnlyForWhatIsNewer) {
