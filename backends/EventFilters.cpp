@@ -23,8 +23,10 @@ std::int32_t actionFromText(const std::optional<std::string>& action) {
 
 filterTag filterFromDictionary(const Dictionary& source, std::string_view backendName) {
   filterTag filter;
-  filter.method = static_cast<std::int32_t>(profileInteger(backendName, source, "method").value_or(-1));
-  filter.status = static_cast<std::int32_t>(profileInteger(backendName, source, "status").value_or(-1));
+  filter.method =
+      static_cast<std::int32_t>(profileIntegerOrNumericText(backendName, source, "method").value_or(-1));
+  filter.status =
+      static_cast<std::int32_t>(profileIntegerOrNumericText(backendName, source, "status").value_or(-1));
   filter.action = actionFromText(profileText(backendName, source, "action"));
   if (auto key = profileText(backendName, source, "key")) {
     filter.keyIsASCII = isASCII(*key);

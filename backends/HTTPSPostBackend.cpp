@@ -9,6 +9,7 @@ namespace vesk {
 namespace {
 
 constexpr std::uint16_t kSessionTypeStop = 1;
+constexpr std::size_t kMostMethods = 65'536;
 
 }  // namespace
 
@@ -79,7 +80,10 @@ std::optional<std::string> HTTPSPostBackend::sendMessageLocked(const std::option
           : createEventDictfromPayload(payload, timestamp, method, respCode, eventID);
   prepareEventForMessage(event);
 
-  if (isOverridingSampling(flag) && state() == BackendStateOverride) setState(BackendStateEnabled);
+  if (isOverridingSampling(flag)) {
+    std::int32_t expected = BackendStateOverride;  // a completion may just switch the backend off
+    _state.compare_exchange_strong(expected, BackendStateEnabled);
+  }
   std::int32_t currentState = state();
   bool hold =
       !isRealtime(flag) && (currentState == BackendStatePending || currentState == BackendStateOverride ||
@@ -146,20 +150,19 @@ void HTTPSPostBackend::batchEvent(MutableDictionary event) {
     flushMessagesLocked();
     count = 0;
   }
-  hold(std::move(event));
-  _eventMethodCounts[method] = count + 1;
-}
-
-void HTTPSPostBackend::hold(MutableDictionary event) {
   if (!_batchedEvents) _batchedEvents.emplace(_heldBytes);
   _batchedEvents->add(std::move(event));
+  _eventMethodCounts[method] = count + 1;
   if (*_heldBytes > kMaximumHeldBytes) boundHeldEvents();
 }
 
-// Enabled, a full batch is simply sent. Otherwise nobody may be told yet, and the oldest events have to go.
+// Enabled, a full batch is simply sent. Otherwise nobody may be told yet, and the oldest events have to go:
+// an eighth at once, or the session's other backends would be at the bound with each of their events.
 void HTTPSPostBackend::boundHeldEvents() {
   if (state() == BackendStateEnabled) flushMessagesLocked();
-  if (_batchedEvents) noteDropped(_batchedEvents->dropOldest(kMaximumHeldBytes), kMaximumHeldBytes);
+  if (!_batchedEvents) return;
+  noteDropped(_batchedEvents->dropOldest(kMaximumHeldBytes / 8 * 7), kMaximumHeldBytes);
+  if (_eventMethodCounts.size() > kMostMethods) _eventMethodCounts.clear();  // user info may name any number
 }
 
 void HTTPSPostBackend::noteDropped(std::size_t count, std::size_t bound) {

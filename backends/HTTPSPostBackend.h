@@ -83,7 +83,6 @@ class HTTPSPostBackend final : public VeskReportingBackend {
       VESK_REQUIRES(_mutex);
   void prepareEventForMessage(MutableDictionary& event) const VESK_REQUIRES(_mutex);
   void batchEvent(MutableDictionary event) VESK_REQUIRES(_mutex);
-  void hold(MutableDictionary event) VESK_REQUIRES(_mutex);
   void boundHeldEvents() VESK_REQUIRES(_mutex);
   void noteDropped(std::size_t count, std::size_t bound) VESK_REQUIRES(_mutex);
   void addUserInfoToHeldEvents() VESK_REQUIRES(_mutex);

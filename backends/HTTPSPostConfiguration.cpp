@@ -1,6 +1,8 @@
 // The policy of an HTTPS backend: what the storebag's client entries make of it.
 #include <VeskReporting/VeskReportingKeys.h>
 
+#include <algorithm>
+#include <limits>
 #include <utility>
 
 #include "backends/HTTPSPostBackend.h"
@@ -20,6 +22,11 @@ std::optional<std::string_view> viewOf(const std::optional<Text>& text) {
 NameList split(const std::optional<std::string>& text) {
   if (!text) return std::nullopt;
   return componentsSeparatedByComma(*text);
+}
+
+std::int32_t clamped(std::int64_t number) {
+  using Limits = std::numeric_limits<std::int32_t>;
+  return static_cast<std::int32_t>(std::clamp<std::int64_t>(number, Limits::min(), Limits::max()));
 }
 
 std::string printed(const NameList& list) {
@@ -55,9 +62,13 @@ std::optional<std::vector<Dictionary>> HTTPSPostBackend::clientEntries() const {
 bool HTTPSPostBackend::matchClientNameAndServiceID(const Dictionary& entry,
                                                    const std::optional<Text>& clientName,
                                                    const std::optional<Text>& serviceName) const {
-  if (!matchExactStringWithList(split(profileText(_name, entry, "client")), viewOf(clientName), true))
-    return false;
-  return matchStringWithList(split(profileText(_name, entry, "service")), viewOf(serviceName), true);
+  // What restricts, and has the wrong type, must not let everybody pass.
+  const NameList clients = split(profileText(_name, entry, "client"));
+  if (!clients && entry.contains("client")) return false;
+  if (!matchExactStringWithList(clients, viewOf(clientName), true)) return false;
+  const NameList services = split(profileText(_name, entry, "service"));
+  if (!services && entry.contains("service")) return false;
+  return matchStringWithList(services, viewOf(serviceName), true);
 }
 
 std::int32_t HTTPSPostBackend::updateBackendStateLocked() {
@@ -100,7 +111,7 @@ std::int32_t HTTPSPostBackend::stateWithoutUserInfo(const std::vector<Dictionary
 }
 
 std::int32_t HTTPSPostBackend::stateForEntry(const Dictionary& entry, const std::optional<Text>& clientName) {
-  setHierarchy(static_cast<std::int32_t>(profileInteger(_name, entry, "hierarchy").value_or(0)));
+  setHierarchy(clamped(profileInteger(_name, entry, "hierarchy").value_or(0)));
   if (!consentAllows(entry) || !placeAndDeviceAllow(entry)) return BackendStateDisabled;
 
   auto filters = profileList(_name, entry, "filters");
@@ -141,6 +152,9 @@ bool HTTPSPostBackend::placeAndDeviceAllow(const Dictionary& entry) {
     return false;
   }
   NameList devices = profileTextList(_name, entry, "device_whitelist");
+  const Value* whitelist = entry.find("device_whitelist");
+  const bool namesNone = !devices || devices->empty();
+  if (whitelist && namesNone && !(whitelist->list() && whitelist->list()->empty())) devices = {{""}};
   if (!matchStringWithList(devices, _productFamily.view(), true)) {
     VESK_LOG_DEBUG("HTTPSPostBackend(updateBackendState): (%s) isn't in device list %s",
                    _productFamily.string().c_str(), printed(devices).c_str());
@@ -161,7 +175,7 @@ std::int32_t HTTPSPostBackend::stateForSampling(const Dictionary& entry) {
 
 void HTTPSPostBackend::updateEventThreshold(const Dictionary& entry) {
   if (auto threshold = profileInteger(_name, entry, "event_threshold")) {
-    _eventThreshold = static_cast<std::int32_t>(*threshold);
+    _eventThreshold = clamped(*threshold);
     VESK_LOG_DEBUG("HTTPSPostBackend(updateBackendState): event_threshold set to %d", _eventThreshold);
   } else {
     _eventThreshold = kDefaultEventThreshold;
@@ -175,7 +189,7 @@ void HTTPSPostBackend::updateEventThreshold(const Dictionary& entry) {
 void HTTPSPostBackend::updateExtrasOnInternal(const Dictionary& entry) {
   auto extras = profileInteger(_name, entry, "extras_on_internal");
   if (!extras) return;
-  _extrasOnInternal = static_cast<std::int32_t>(*extras);
+  _extrasOnInternal = clamped(*extras);
   VESK_LOG_DEBUG("HTTPSPostBackend(updateBackendState): extras on internal is set to %d", _extrasOnInternal);
 }
 

@@ -23,9 +23,14 @@ std::int32_t startOfMinute(double seconds) {
   return static_cast<std::int32_t>(std::clamp(seconds, -kLatest, kLatest)) / 60 * 60;
 }
 
-// Sets a field whose source may be unknown; then it stays out of the record.
-void setIfKnown(MutableDictionary& event, Text key, const std::optional<Text>& value) {
-  if (value) event.set(std::move(key), *value);
+// Sets a field whose source may be unknown; then it stays out of the record, also when the payload has one.
+template <class T>
+void setIfKnown(MutableDictionary& event, Text key, const std::optional<T>& value) {
+  if (value) {
+    event.set(std::move(key), *value);
+  } else {
+    event.remove(key.view());
+  }
 }
 
 }  // namespace
@@ -40,7 +45,7 @@ MutableDictionary HTTPSPostBackend::createEventDictfromPayload(const std::option
   double clientTS = finiteOrMinusOne(startTS + (secondsFromTimeval(timestamp) - _startTimeStamp));
 
   event.set(Text::literal("_startTS"), startTS);
-  if (auto sender = senderCodeForClientType(_compType)) event.set(Text::literal("_sender"), *sender);
+  setIfKnown(event, Text::literal("_sender"), senderCodeForClientType(_compType));
   event.set(Text::literal("_clientVersion"), static_cast<unsigned>(_clientVersion));
   setIfKnown(event, Text::literal("_sessionID"), _combinedSessionIDString);
   if (_extrasOnInternal != 0 && _isInternal && _compType == kClientTypeWithNumericSessionID) {

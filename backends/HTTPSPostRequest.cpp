@@ -2,6 +2,7 @@
 #include <VeskReporting/VeskReportingKeys.h>
 
 #include <algorithm>
+#include <cmath>
 
 #include "backends/HTTPSPostBackend.h"
 #include "backends/SenderCodes.h"
@@ -14,13 +15,18 @@ namespace vesk {
 
 namespace {
 
-bool fitsIntoBody(const Value& value) { return value.isNumber() || value.text() != nullptr; }
+constexpr std::size_t kLongestKeyInLog = 200;
 
-// Dates become seconds; what JSON events can't carry is removed and reported. JSON has no number that is not
-// finite, and a single one would cost the whole batch.
+// JSON has no number that is not finite.
+bool fitsIntoBody(const Value& value) {
+  if (const double* number = value.real()) return std::isfinite(*number);
+  return value.isNumber() || value.text() != nullptr;
+}
+
+// Dates become seconds; what JSON events can't carry is removed and reported, or it would cost the whole
+// batch.
 void sanitize(MutableDictionary& event) {
   std::erase_if(event.entries(), [](DictionaryEntry& entry) {
-    if (const double* number = entry.value.real()) entry.value = finiteOrMinusOne(*number);
     if (fitsIntoBody(entry.value)) return false;
     if (const Date* date = entry.value.date()) {
       entry.value = finiteOrMinusOne(date->secondsSince1970);
@@ -28,7 +34,7 @@ void sanitize(MutableDictionary& event) {
     }
     VESK_LOG_WARNING(
         "HTTPSPostBackend(createMessageForPostAndLogging): TreeWriter unable to handle key: %s, value: %s",
-        entry.key.string().c_str(), describe(entry.value).c_str());
+        std::string(entry.key.view().substr(0, kLongestKeyInLog)).c_str(), describe(entry.value).c_str());
     return true;
   });
 }
@@ -43,7 +49,7 @@ std::string headerValue(const Text& text) {
 }  // namespace
 
 std::string HTTPSPostBackend::clientIdentifier() const {
-  if (_extrasOnInternal != 0 && _isInternal) return _udid;
+  if (_extrasOnInternal != 0 && _isInternal && !_udid.empty()) return _udid;
   return _dnuType == 0 ? _uuidRespectDnu : _uuidOverrideDnu;
 }
 
@@ -131,14 +137,12 @@ void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t flag,
 void HTTPSPostBackend::postCompleted(const HTTPResult& result, std::size_t eventCount) {
   if (result.error) {
     VESK_LOG_ERROR("HTTPSPostBackend(postJsonMessage): post error: %s", result.error->description.c_str());
-    _services.counters.count(_name, DropReason::TransportError, eventCount);
-    return;
   }
-  const long status = result.response->status;
+  const long status = result.response ? result.response->status : 0;
   if (status < 500 || status > 599) {
-    if (status < 200 || status > 299) {
-      _services.counters.count(_name, DropReason::ServerRefused, eventCount);
-    }
+    if (status >= 200 && status <= 299) return;
+    const auto reason = status == 0 ? DropReason::TransportError : DropReason::ServerRefused;
+    _services.counters.count(_name, reason, eventCount);
     return;
   }
   VESK_LOG_INFO("postJSONMessage: backend %s disabled by server %ld return code", _name.c_str(), status);

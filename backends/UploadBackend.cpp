@@ -159,7 +159,7 @@ std::optional<HTTPRequest> UploadBackend::requestFor(const std::string& path,
 }
 
 bool UploadBackend::accepted(const HTTPResult& result, const std::string& uploadURL) const {
-  if (!result.response) {
+  if (result.error || !result.response) {
     VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): post %s",
                    result.error ? result.error->description.c_str() : "(null)");
     _services.counters.count(_name, DropReason::TransportError);

@@ -24,9 +24,18 @@ enum BackendState : std::int32_t {
   BackendStateOverride = 3,  ///< sampled out, inside the override band: held back until a message lifts it
 };
 
-/// A message's flag is compared with these as a whole: other bits make it an ordinary message.
-constexpr bool isRealtime(std::int32_t flag) { return flag == 1 || flag == 3; }
-constexpr bool isOverridingSampling(std::int32_t flag) { return flag == 2 || flag == 3; }
+/// A message's flag: one of these, or both; any other makes it an ordinary message.
+enum MessageFlag : std::int32_t {
+  MessageFlagRealtime = 1,
+  MessageFlagOverrideSampling = 2,
+};
+constexpr std::int32_t kMessageFlagBoth = MessageFlagRealtime | MessageFlagOverrideSampling;
+constexpr bool isRealtime(std::int32_t flag) {
+  return flag == MessageFlagRealtime || flag == kMessageFlagBoth;
+}
+constexpr bool isOverridingSampling(std::int32_t flag) {
+  return flag == MessageFlagOverrideSampling || flag == kMessageFlagBoth;
+}
 
 /// One destination of a session's messages. Its operations may be called from any thread and do not overlap:
 /// each takes the backend's own mutex. Under it only leaves are locked, for moments (queues, counters), and

@@ -102,6 +102,7 @@ TEST_F(BackendEvents, BodyLosesWhatJSONEventsCannotCarry) {
   auto backend = make();
   send(*backend, Dictionary{{"when", Date{1.5}},
                             {"never", Date{std::numeric_limits<double>::infinity()}},
+                            {"notANumber", std::numeric_limits<double>::quiet_NaN()},
                             {"nested", Dictionary{{"a", 1}}},
                             {"list", List{1}},
                             {"nothing", Value()},
@@ -111,13 +112,14 @@ TEST_F(BackendEvents, BodyLosesWhatJSONEventsCannotCarry) {
   EXPECT_EQ(event.at("when"), 1.5);
   EXPECT_EQ(event.at("never"), -1.0);
   EXPECT_EQ(event.at("flag"), true);
-  for (const char* gone : {"nested", "list", "nothing", "raw"}) EXPECT_FALSE(event.contains(gone)) << gone;
+  for (const char* gone : {"nested", "list", "nothing", "raw", "notANumber"})
+    EXPECT_FALSE(event.contains(gone)) << gone;
   EXPECT_EQ(
       log.count(4,
                 "HTTPSPostBackend(createMessageForPostAndLogging): TreeWriter unable to handle key: nested, "
                 "value: {\"a\": 1}"),
       1);
-  EXPECT_EQ(log.countContaining(4, "TreeWriter unable to handle key"), 4);
+  EXPECT_EQ(log.countContaining(4, "TreeWriter unable to handle key"), 5);
 }
 
 TEST_F(BackendEvents, StopMessageTellsHowItWasSampled) {
@@ -315,16 +317,46 @@ TEST_F(BackendEvents, ServerAnswersDecideTheState) {
   EXPECT_EQ(log.count(6, "postJSONMessage: backend httpPost disabled by server 503 return code"), 1);
   EXPECT_EQ(harness.dropped(DropReason::ServerError5xx), 3u);
   EXPECT_EQ(harness.dropped(DropReason::ServerRefused), 2u);
+  // The status decides, also when the rest of the answer does not arrive.
+  for (auto [status, stateAfter] : {std::pair{200u, 2}, {503u, 1}}) {
+    harness.answerWith(status, HTTPAnswer::Fault::CloseMidAnswer);
+    auto backend = make();
+    send(*backend, {});
+    harness.posts();
+    EXPECT_EQ(backend->state(), stateAfter);
+  }
+  EXPECT_EQ(log.countContaining(3, "HTTPSPostBackend(postJsonMessage): post error: "), 2);
+  EXPECT_EQ(harness.dropped(DropReason::ServerError5xx), 4u);
+  EXPECT_EQ(harness.dropped(DropReason::TransportError), 0u);
 }
 
-TEST_F(BackendEvents, WithoutURLNothingIsSentAndItIsCounted) {
+TEST_F(BackendEvents, WhatHasNowhereToGoIsCounted) {
   auto backend = VeskReportingBackend::newBackendWithName(kVeskReportingBackendHTTPPost2,
                                                           Dictionary{{"clients", List{Dictionary()}}},
                                                           Text("Phone"), 99, harness.services);
   backend->updateState();
   send(*backend, {}, 3, 1);
+  auto elsewhere = make(Dictionary{{"post_url", "ftp://host/"}, {"expedite", 0}});
+  for (int i = 0; i < 3; ++i) send(*elsewhere, {});
+  elsewhere->flushMessages();
   EXPECT_TRUE(harness.posts().empty());
   EXPECT_EQ(harness.dropped(DropReason::NoURL), 1u);
+  EXPECT_EQ(harness.dropped(DropReason::TransportError), 3u) << "each event of the batch";
+}
+
+TEST_F(BackendEvents, OneBackendAtTheBoundLeavesTheOthersTheirBatches) {
+  auto account = std::make_shared<std::atomic<std::size_t>>(0);
+  auto holds = make();
+  holds->setState(BackendStateOverride);
+  auto batches = make();
+  batches->setBatchEvents(true);
+  for (auto& backend : {holds, batches}) backend->setHeldBytes(account);
+  const std::string bulk(std::size_t{1} << 20, 'x');
+  for (int i = 0; i < 40; ++i) {
+    send(*holds, Dictionary{{"bulk", bulk}});
+    send(*batches, {}, static_cast<std::uint16_t>(i));
+  }
+  EXPECT_LT(harness.posts().size(), 15u);
 }
 
 TEST_F(BackendEvents, HeldEventsAreBoundedByDroppingTheOldest) {
@@ -337,6 +369,7 @@ TEST_F(BackendEvents, HeldEventsAreBoundedByDroppingTheOldest) {
   EXPECT_EQ(log.countContaining(4, "dropping its oldest events"), 1);
   std::uint64_t dropped = harness.dropped(DropReason::OverBound);
   EXPECT_GE(dropped, 24u);
+  EXPECT_LT(dropped, 30u);
   backend->updateState();
   backend->flushMessages();
   auto post = harness.posts().at(0);

@@ -179,6 +179,8 @@ TEST(HTTPClient, FollowsOnlyHTTPAndNoRedirect) {
     EXPECT_EQ(result.error->kind, Kind::BadURL) << url << ": " << result.error->description;
     EXPECT_FALSE(result.response);
   }
+  // No server is asked for a label that is too long.
+  EXPECT_EQ(client.perform(fetchFrom("http://" + std::string(64, 'a') + "/")).error->kind, Kind::Resolve);
 }
 
 TEST(HTTPClient, BadAnswersAreErrorsOfTheirKindAndOverWithTheNextRequest) {
@@ -218,6 +220,9 @@ TEST(HTTPClient, BadAnswersAreErrorsOfTheirKindAndOverWithTheNextRequest) {
       auto result = client.perform(request);
       EXPECT_EQ(server.count(), 1u);
       EXPECT_EQ(result.error.has_value(), test.kind.has_value());
+      const bool hasStatus =
+          test.fault == Fault::CloseMidAnswer || test.fault == Fault::HugeBody || !test.kind;
+      if (test.fault != Fault::ResetMidAnswer) EXPECT_EQ(result.response.has_value(), hasStatus);
       if (test.kind && result.error) {
         EXPECT_EQ(result.error->kind, *test.kind) << result.error->description;
         EXPECT_FALSE(result.error->description.empty());
@@ -229,6 +234,20 @@ TEST(HTTPClient, BadAnswersAreErrorsOfTheirKindAndOverWithTheNextRequest) {
     }
   }
   ::unsetenv("SSL_CERT_FILE");
+}
+
+TEST(HTTPClient, TakesAProxysAnswerForNoAnswer) {
+  RecordingServer proxy([](const HTTPReceived&, std::size_t) { return HTTPAnswer::text(502, "no way"); });
+  ::setenv("https_proxy", proxy.url().c_str(), 1);
+  HTTPClient client(HTTPClient::Options{.firstRetryAfter = 1ms});
+  client.start(postTo("https://collector.example/"), [](const HTTPResult& result) {
+    EXPECT_EQ(result.error.value().kind, Kind::Stopped) << "tried again until the end";
+    EXPECT_FALSE(result.response);
+  });
+  bool isIdle = false;
+  while (proxy.count() < 3 && !isIdle) isIdle = client.waitUntilIdle(1ms);
+  EXPECT_GE(proxy.count(), 3u);
+  ::unsetenv("https_proxy");
 }
 
 TEST(HTTPClient, TakesABodyUpToTheLimitAndNoEndOfHeaders) {

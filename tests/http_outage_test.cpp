@@ -96,8 +96,7 @@ TEST(HTTPOutage, WhatTheServerHasWholeIsNeverSentAgain) {
     auto post = postTo(server.url());
     if (answer.fault == Fault::Stall) post.timeout = 100ms;
     auto result = client.perform(post);
-    EXPECT_EQ(result.response.has_value(), answer.fault == Fault::None);
-    EXPECT_NE(result.response.has_value(), result.error.has_value());
+    EXPECT_EQ(result.error.has_value(), answer.fault != Fault::None);
     EXPECT_EQ(server.count(), 1u);
   }
 }

@@ -24,7 +24,7 @@ enum class DropReason : std::uint8_t {
   InvalidMessage,  ///< the message itself was refused
   NoBackend,       ///< no backend was there to take it
   UploadFailed,    ///< a file was not uploaded
-  NeverEnabled,    ///< still held when the session ended: reporting had never been enabled
+  NeverEnabled,    ///< still held when the session ended, because reporting was not enabled
   Unacknowledged,  ///< a datagram that was not sent whole or never acknowledged, and given up
   NotAggregated,   ///< the aggregating client did not take its copy: it does not read, or has gone
   NotRecorded,     ///< a local record could not be written

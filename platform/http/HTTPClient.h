@@ -38,14 +38,14 @@ struct HTTPRequest {
 struct HTTPResponse {
   long status = 0;  ///< 100 to 599
   std::vector<std::pair<std::string, std::string>> headers;
-  std::string
-      body;  ///< at most `HTTPClient::Options::maximumBody` bytes; a longer answer is a transport error
+  /// At most `HTTPClient::Options::maximumBody` bytes; a longer answer is a transport error.
+  std::string body;
 
   /// The first header of that name, compared without regard to case.
   std::optional<std::string_view> header(std::string_view name) const;
 };
 
-/// The transport failed: there is no answer at all.
+/// The transport failed: there is no whole answer.
 struct HTTPError {
   enum class Kind : unsigned char {
     Connect,
@@ -63,7 +63,8 @@ struct HTTPError {
   std::string description;
 };
 
-/// Exactly one of the two is given.
+/// Without an error, there is a response. With one there is a response, without its body, when the server's
+/// status had arrived: it decided about the request, whatever became of the rest.
 struct HTTPResult {
   std::optional<HTTPResponse> response;
   std::optional<HTTPError> error;

@@ -138,6 +138,8 @@ HTTPTransfer::HTTPTransfer(const HTTPClient::Options& options, const std::option
     set(easy, CURLOPT_CAINFO, authorities->c_str());
     set(easy, CURLOPT_CAPATH, static_cast<const char*>(nullptr));
   }
+  // A proxy's answer to CONNECT is not the server's.
+  set(easy, CURLOPT_SUPPRESS_CONNECT_HEADERS, 1L);
   set(easy, CURLOPT_PRIVATE, this);
   set(easy, CURLOPT_ERRORBUFFER, _errorText);
   set(easy, CURLOPT_HEADERFUNCTION, &HTTPTransfer::receive<&HTTPTransfer::addHeader>);
@@ -212,13 +214,15 @@ HTTPTransfer::Outcome HTTPTransfer::finish(CURLcode code) noexcept {
   Outcome outcome;
   outcome.answered = _answered;
   if (code == CURLE_OK) {
-    curl_easy_getinfo(handle(), CURLINFO_RESPONSE_CODE, &_response.status);
     outcome.answered = true;
-    outcome.result.response = std::move(_response);
   } else {
     outcome.result.error = errorFrom(code);
     outcome.mayRetry = !_answered && passes(code, handle());
+    _response.body.clear();
   }
+  curl_easy_getinfo(handle(), CURLINFO_RESPONSE_CODE, &_response.status);
+  const bool isInterim = _response.status < 200;
+  if (code == CURLE_OK || (_answered && !isInterim)) outcome.result.response = std::move(_response);
   return outcome;
 }
 

@@ -55,7 +55,10 @@ class BackendHarness {
     return _posts;
   }
   std::string url(const std::string& path = "/post") const { return _server.baseURL() + path; }
-  void answerWith(unsigned status) { _status = status; }
+  void answerWith(unsigned status, HTTPAnswer::Fault fault = HTTPAnswer::Fault::None) {
+    _status = status;
+    _fault = fault;
+  }
 
   std::uint64_t dropped(DropReason reason) const {
     std::uint64_t sum = 0;
@@ -74,12 +77,15 @@ class BackendHarness {
     ReceivedPost post{request, boost::json::parse(request.decodedBody().body.value()).as_object()};
     std::lock_guard lock(_mutex);
     _posts.push_back(std::move(post));
-    return HTTPAnswer::text(_status, "received");
+    auto answer = HTTPAnswer::text(_status, "received");
+    answer.fault = _fault;
+    return answer;
   }
 
   std::mutex _mutex;
   std::vector<ReceivedPost> _posts;
   std::atomic<unsigned> _status{200};
+  std::atomic<HTTPAnswer::Fault> _fault{HTTPAnswer::Fault::None};
 
  public:
   BackendServices services;  ///< outlives the client, whose last completions use it
