@@ -50,6 +50,16 @@ std::string decimal(Number number) {
   return error == std::errc{} ? std::string(digits, end) : std::string();
 }
 
+// With an exponent only where people would write one: who reads a value as an integer gets 100000, not 1.
+std::string decimal(double number) {
+  const double size = std::abs(number);
+  const bool isPlain = size == 0 || (size >= 1e-4 && size < 1e16);
+  char digits[64];
+  auto [end, error] = std::to_chars(digits, digits + sizeof digits, number,
+                                    isPlain ? std::chars_format::fixed : std::chars_format::scientific);
+  return error == std::errc{} ? std::string(digits, end) : std::string();
+}
+
 }  // namespace
 
 PreferencesSuite::PreferencesSuite(std::string_view suite) {
