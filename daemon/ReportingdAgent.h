@@ -55,6 +55,8 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
   /// An emptied list stays, in case that its family comes back; but a client that keeps inventing names must
   /// not fill the memory, so beyond this many lists the empty ones go.
   static constexpr std::size_t kMostKeptLists = 256;
+  /// Nor must the names themselves: an empty list with a longer key, in bytes, goes with the next new one.
+  static constexpr std::size_t kLongestKeptKey = 1024;
 
   void removeFromSessionList(const std::shared_ptr<ReportingdSession>& session) VESK_EXCLUDES(_monitor);
   void removeFromCorrelation(const std::shared_ptr<ReportingdSession>& session)

@@ -34,8 +34,11 @@ const ReportingdAgent::SessionList* ReportingdAgent::correlatedSessions(const st
 }
 
 ReportingdAgent::SessionList& ReportingdAgent::listForKey(const std::string& key) {
-  if (_correlatedSessions.size() >= kMostKeptLists && !correlatedSessions(key)) {
-    std::erase_if(_correlatedSessions, [](const auto& entry) { return entry.second.empty(); });
+  if (!correlatedSessions(key)) {
+    const bool keepsNone = _correlatedSessions.size() >= kMostKeptLists;
+    std::erase_if(_correlatedSessions, [keepsNone](const auto& entry) {
+      return entry.second.empty() && (keepsNone || entry.first.size() > kLongestKeptKey);
+    });
   }
   SessionList& list = _correlatedSessions[key];
   _familyCount = static_cast<int>(_correlatedSessions.size());
