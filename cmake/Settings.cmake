@@ -29,6 +29,10 @@ if(VESK_WARNINGS_AS_ERRORS)
 endif()
 if(VESK_SANITIZE)
   # -O1: the sanitized daemon still has to keep up with real sockets and TLS.
+  if(VESK_SANITIZE MATCHES undefined)
+    add_compile_options(-fsanitize=float-cast-overflow)  # gcc's "undefined" leaves it out
+    add_link_options(-fsanitize=float-cast-overflow)
+  endif()
   add_compile_options(-fsanitize=${VESK_SANITIZE} -fno-sanitize-recover=all -fno-omit-frame-pointer -O1 -g1)
   add_link_options(-fsanitize=${VESK_SANITIZE})
   if(VESK_SANITIZE MATCHES thread)

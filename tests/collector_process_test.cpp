@@ -39,21 +39,6 @@ class CollectorProcess : public ::testing::Test {
   Dictionary _facts;
 };
 
-TEST_F(CollectorProcess, TakesPostsAndEndsCleanly) {
-  ChildProcess collector(options());
-  waitUntilReady();
-  WebClient client(fact("authorityFile"));
-  EXPECT_EQ(client.post(fact("eventsURL"), kPost, kPostHeaders).status, 200);
-  EXPECT_EQ(client.post(fact("eventsURL"), "{}").status, 400);
-  EXPECT_TRUE(collector.waitForText("user = \"mail\""));
-  EXPECT_TRUE(collector.waitForText("(400): the header Content-Type"));
-  collector.signal(SIGTERM);
-  EXPECT_EQ(collector.wait(), 0);
-  auto line = parseJSON(_files.read("collector/events.jsonl"));
-  ASSERT_TRUE(line.value) << line.error;
-  EXPECT_EQ(line.value->dictionary()->dictionary("event")->text("user"), "mail");
-}
-
 TEST_F(CollectorProcess, WritesOneJSONLineAnEventAndNothingElseOnItsOutput) {
   ChildProcess collector(options({"--json", "--fault", "post=empty-body"}));
   waitUntilReady();

@@ -60,11 +60,6 @@ TEST(CollectorServer, RefusesWhatIsNoProtocolWithALine) {
   EXPECT_EQ(plain.connectionsOpen(), 0U);
 }
 
-TEST(CollectorServer, TurnsAThrowingHandlerInto500) {
-  HTTPServer server({}, [](const HTTPReceived&) -> HTTPAnswer { throw std::runtime_error("out of luck"); });
-  EXPECT_EQ(WebClient().get(server.baseURL()).status, 500);
-}
-
 TEST(CollectorCertificates, AreKeptAndVerifiedByNameAndAddress) {
   TempDirectory files;
   std::string authority = CertificateAuthority::openOrCreate(files.path()).certificate();

@@ -112,6 +112,11 @@ const std::vector<Value> kStrangeValues{
     Date{std::numeric_limits<double>::infinity()},
     List{1, "two"},
     Dictionary{{"a", 1}},
+    [] {
+      MutableDictionary wide;
+      for (int i = 0; i < 10'000; ++i) wide.set(std::to_string(i), i);
+      return wide.share();
+    }(),
 };
 
 Dictionary with(const Dictionary& base, const char* key, const Value& value) {

@@ -11,6 +11,7 @@
 #include "platform/ipc/UnixSocket.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/IPCHarness.h"
+#include "tests/support/ProcessFacts.h"
 
 namespace vesk::test {
 namespace {
@@ -130,22 +131,21 @@ TEST(IPCLimits, GoesOnAfterItHadNoDescriptorLeft) {
 
 const std::string kFlush = RawClient::message("flushMessagesWithReply", "", "");
 
-std::string bytesMessage(std::size_t size) {
-  return RawClient::message("sendMessageWithDictionary", "a{sv}", RawClient::bytesDictionary(size));
+std::string bytesMessage(std::size_t size, int depth = 0) {
+  return RawClient::message("sendMessageWithDictionary", "a{sv}", RawClient::bytesDictionary(size, depth));
 }
 
-constexpr std::size_t kMessage = std::size_t{1} << 16;
-
-void limitMessages(IPCListener::Options& options) { options.maximumMessage = kMessage; }
+constexpr std::size_t kMessage = std::size_t{1} << 20;
 
 TEST(IPCLimits, TakesMessagesUpToTheLimit) {
-  TestService service(limitMessages);
+  TestService service;
   RawClient client(service);
   client.authenticate();
   // Content: dictionary and value at 8 bytes each, a key of one letter.
   client.send(bytesMessage(kMessage - 17));
   EXPECT_TRUE(service.journal.waitFor("message"));
   client.send(bytesMessage(kMessage - 16));
+  client.send(bytesMessage(1, 100));
   client.send(RawClient::message("flushMessagesWithReply", "", "", {.bigEndian = true}));
   EXPECT_TRUE(service.journal.waitFor("flush")) << "the connection goes on";
   EXPECT_EQ(service.journal.count("message"), 1u);
@@ -157,7 +157,7 @@ TEST(IPCLimits, ClosesWhoSendsNoMessagesOrOneOverTheLimit) {
   for (const auto& bytes :
        {"this is no D-Bus message"s, std::string(64, '\0'), noVersion, bytesMessage(3 * kMessage)}) {
     CapturedLog log;
-    TestService service(limitMessages);
+    TestService service;
     RawClient client(service);
     client.authenticate();
     client.send(kFlush + bytes);
@@ -322,6 +322,14 @@ void sendWithDescriptors(int socket, const std::string& bytes, std::size_t count
 
 TEST(IPCLimits, ClosesWhoSendsDescriptorsOutOfPlace) {
   TestService service;
+  const ProcessFacts self(::getpid());
+  const std::size_t before = self.descriptors();
+  RawClient unasked(service);
+  unasked.authenticate();
+  sendWithDescriptors(unasked.fd(), RawClient::message("flushMessagesWithReply", "", "", {.descriptors = 1}),
+                      1);
+  EXPECT_TRUE(service.journal.waitFor("flush"));
+  unasked.close();
   RawClient many(service);
   many.authenticate();
   sendWithDescriptors(many.fd(), kFlush, 5);
@@ -334,11 +342,13 @@ TEST(IPCLimits, ClosesWhoSendsDescriptorsOutOfPlace) {
   RawClient within(service);
   within.authenticate();
   within.send(kFlush + kFlush.substr(0, 40));
-  EXPECT_TRUE(service.journal.waitFor("flush"));
+  EXPECT_TRUE(service.journal.waitFor("flush", 2));
   sendWithDescriptors(within.fd(), kFlush.substr(40), 1);
   EXPECT_TRUE(within.isClosed());
-  EXPECT_TRUE(service.journal.waitFor("destroyed", 3));
-  EXPECT_EQ(service.journal.count("flush"), 1u);
+  EXPECT_TRUE(service.journal.waitFor("destroyed", 4));
+  EXPECT_EQ(service.journal.count("flush"), 2u);
+  for (auto* client : {&many, &early, &within}) client->close();
+  EXPECT_TRUE(eventually([&] { return self.descriptors() <= before; }));
 }
 
 TEST(IPCLimits, GivesADescriptorToTheMessageThatItCameWith) {

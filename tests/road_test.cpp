@@ -65,30 +65,6 @@ action = "sha256"
   EXPECT_EQ(harness.stopDaemon(), 0);
 }
 
-TEST(Road, ABadSignatureGivesNoStorebagAndIsNotFetchedAgainAtOnce) {
-  DaemonHarness harness;
-  harness.setFault("storebag=bad-signature");
-  harness.startDaemon();
-  RoadClient first(harness);
-  EXPECT_EQ(first.enabled, std::nullopt);
-  EXPECT_TRUE(harness.daemon().waitForText("fetchStorebagWithName: Signature can not be verified, "));
-  harness.setFault("storebag=none");
-  RoadClient second(harness);
-  EXPECT_EQ(second.enabled, std::nullopt);
-  EXPECT_TRUE(harness.daemon().waitForText("must wait 900 seconds between attempts"));
-}
-
-TEST(Road, TerminationSendsWhatIsHeld) {
-  DaemonHarness harness;
-  harness.startDaemon();
-  RoadClient client(harness, Dictionary{{kVeskReportingSessionInfoBatchEvent, true}});
-  auto handedOver = client.reporting.sendMessageAndWait(message(3, Dictionary{{"held", true}}));
-  ASSERT_TRUE(handedOver) << handedOver.detail;
-  EXPECT_EQ(harness.stopDaemon(), 0);
-  harness.waitForEventsOfMethod(3, 1);
-  EXPECT_EQ(harness.waitForEventsOfMethod(0, 2).size(), 2u) << "start and end of the session";
-}
-
 TEST(Road, AStalledCollectorDoesNotHoldUpTheEndForEver) {
   DaemonHarness harness;
   harness.startDaemon();

@@ -97,9 +97,11 @@ void DaemonHarness::launchDaemon(std::vector<std::string> arguments) {
     command.insert(command.end(), {"--log-level", "7"});
   command.insert(command.end(), arguments.begin(), arguments.end());
   // A confined daemon may not be traced, which is how leaks are looked for.
+  const char* asan = std::getenv("ASAN_OPTIONS");
+  const std::string withoutLeaks = (asan ? std::string(asan) + ":" : std::string()) + "detect_leaks=0";
   _daemon = std::make_unique<ChildProcess>(ChildProcess::Options{
       .command = std::move(command),
-      .environment = {{"SSL_CERT_FILE", fact("authorityFile")}, {"ASAN_OPTIONS", "detect_leaks=0"}}});
+      .environment = {{"SSL_CERT_FILE", fact("authorityFile")}, {"ASAN_OPTIONS", withoutLeaks}}});
 }
 
 int DaemonHarness::stopDaemon() {

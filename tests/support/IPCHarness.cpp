@@ -267,13 +267,22 @@ std::string RawClient::message(const char* member, const char* signature, const 
   return whole.take();
 }
 
-std::string RawClient::bytesDictionary(std::size_t size) {
+std::string RawClient::bytesDictionary(std::size_t size, int depth) {
   Marshalled entry(false);  // stands at a multiple of 8
   entry.text("k");
   entry.signature("ay");
   entry.number(static_cast<std::uint32_t>(size));
   entry.raw(std::string(size, 'x'));
-  const std::string bytes = entry.take();
+  std::string bytes = entry.take();
+  for (; depth > 0; --depth) {
+    Marshalled outer(false);
+    outer.text("k");
+    outer.signature("a{sv}");
+    outer.number(static_cast<std::uint32_t>(bytes.size()));
+    outer.align(8);
+    outer.raw(bytes);
+    bytes = outer.take();
+  }
   Marshalled body(false);
   body.number(static_cast<std::uint32_t>(bytes.size()));
   body.align(8);

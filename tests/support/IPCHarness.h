@@ -110,7 +110,7 @@ class RawClient {
     return message(member, signature, body, {});
   }
   /// The body of an a{sv} with one byte string.
-  static std::string bytesDictionary(std::size_t size);
+  static std::string bytesDictionary(std::size_t size, int depth = 0);
 
  private:
   FileDescriptor _socket;
