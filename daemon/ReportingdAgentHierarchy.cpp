@@ -4,15 +4,10 @@
 
 #include "daemon/ReportingdAgent.h"
 #include "platform/log/SystemLog.h"
-#include "util/ReportingdUtil.h"
 
 namespace vesk {
 
 namespace {
-
-std::string keyOf(const ReportingdSession& session) {
-  return correlationKeyForUserInfo(session.userInfo().value_or(Dictionary()));
-}
 
 template <class List>
 bool contains(const List& list, const ReportingdSession& session) {
@@ -53,7 +48,8 @@ void ReportingdAgent::userInfoUpdatedForSession(ReportingdSession& session) {
     return;
   }
   auto self = session.shared_from_this();
-  std::string key = correlationKeyForUserInfo(*userInfo);
+  const auto sharedKey = session.correlationKey();
+  const std::string& key = *sharedKey;
   RecursiveMutexLock lock(_monitor);
   removeFromCorrelation(self);
   VESK_LOG_DEBUG("userInfoUpdatedForSession: Adding session %u to list for userInfoKey %s",
@@ -64,7 +60,8 @@ void ReportingdAgent::userInfoUpdatedForSession(ReportingdSession& session) {
 std::shared_ptr<ReportingdSession> ReportingdAgent::parentSessionForChild(ReportingdSession& session) {
   std::int32_t level = session.getSessionHierarchy();
   if (level == 0) return nullptr;
-  std::string key = keyOf(session);
+  const auto sharedKey = session.correlationKey();
+  const std::string& key = *sharedKey;
   VESK_LOG_DEBUG("parentSessionForChild: Checking userInfoKey '%s' for session %u", key.c_str(),
                  session.sessionID());
   const SessionList* list = correlatedSessions(key);
@@ -90,7 +87,8 @@ std::shared_ptr<ReportingdSession> ReportingdAgent::parentSessionForChild(Report
 std::optional<std::string> ReportingdAgent::parentSessionIDStringForSession(ReportingdSession& session) {
   std::int32_t level = session.getSessionHierarchy();
   if (level == 0) return std::nullopt;
-  std::string key = keyOf(session);
+  const auto sharedKey = session.correlationKey();
+  const std::string& key = *sharedKey;
   VESK_LOG_DEBUG("parentSessionIDStringForSession: Checking userInfoKey '%s' for session %u", key.c_str(),
                  session.sessionID());
   RecursiveMutexLock lock(_monitor);
@@ -131,7 +129,7 @@ std::shared_ptr<ReportingdSession> ReportingdAgent::getAncestorWithAggregatorFor
   }
   std::int32_t level = session.getSessionHierarchy();
   if (level < 1) return nullptr;
-  const SessionList* list = correlatedSessions(correlationKeyForUserInfo(*userInfo));
+  const SessionList* list = correlatedSessions(*session.correlationKey());
   if (!list) return nullptr;
   // The list is walked, not the levels: those come from outside, and may be any number.
   std::shared_ptr<ReportingdSession> ancestor;
@@ -151,7 +149,8 @@ void ReportingdAgent::updateDownstreamSessions(ReportingdSession& session) {
     VESK_LOG_INFO("updateDownstreamSessions: No user info found for session %u", session.sessionID());
     return;
   }
-  std::string key = keyOf(session);
+  const auto sharedKey = session.correlationKey();
+  const std::string& key = *sharedKey;
   std::int32_t level = session.getSessionHierarchy();
   RecursiveMutexLock lock(_monitor);
   session.updateCombinedSessionID();

@@ -35,7 +35,8 @@ ReportingdSession::ReportingdSession(std::shared_ptr<ReportingdSessionDelegate> 
     : _sessionDelegate(std::move(sessionDelegate)),
       _connection(std::move(connection)),
       _services(services),
-      _sessionIDString(freshIdentity()) {
+      _sessionIDString(freshIdentity()),
+      _correlationKey(keyFor(std::nullopt)) {
   VESK_LOG_DEBUG("initWithSessionDelegate: ReportingdSession initWithSessionDelegate:%s",
                  _sessionDelegate->description().c_str());
   copyUniqueDeviceID(_deviceid.data(), _deviceid.size());
@@ -98,6 +99,11 @@ std::string ReportingdSession::description() const {
   return text;
 }
 
+std::shared_ptr<const std::string> ReportingdSession::correlationKey() const {
+  MutexLock lock(_mutex);
+  return _correlationKey;
+}
+
 ReportingdSession::SharedBackends ReportingdSession::backends() const {
   MutexLock lock(_mutex);
   return _backends;
@@ -117,10 +123,12 @@ void ReportingdSession::setSessionInfo(const Dictionary& sessionInfo,
   if (userInfo && !requiresUserInfo(sessionInfo)) {
     VESK_LOG_WARNING("setSessionInfo: Configure session: user info provided without requiring it");
   }
+  auto key = keyFor(userInfo);
   MutexLock lock(_mutex);
   _sessionInfo = sessionInfo;
   _frameworks = frameworksToCheck;
   _userInfo = userInfo;
+  _correlationKey = std::move(key);
   _hasAggregator = hasAggregationBlock;
 }
 

@@ -73,6 +73,8 @@ class ReportingdSession final : public ClientSessionInterface,
   std::optional<std::string> storebagVersion() const;
   std::optional<Dictionary> sessionInfo() const;
   std::optional<Dictionary> userInfo() const;
+  /// `correlationKeyForUserInfo` of the present user info; made when that is set, since messages ask for it.
+  std::shared_ptr<const std::string> correlationKey() const;
   std::string description() const;
 
   // --- Relatives
@@ -118,7 +120,8 @@ class ReportingdSession final : public ClientSessionInterface,
                                 const std::optional<Dictionary>& storebag, std::uint16_t category,
                                 std::uint16_t type, const std::optional<Dictionary>& payload);
 
-  // Aggregation.
+  // Relatives.
+  static std::shared_ptr<const std::string> keyFor(const std::optional<Dictionary>& userInfo);
   bool undeliveredBurstBegins();
   void aggregateMessage(const std::optional<Dictionary>& sessionInfo, double timestamp,
                         std::uint16_t category, std::uint16_t type, const std::optional<Dictionary>& payload)
@@ -138,6 +141,7 @@ class ReportingdSession final : public ClientSessionInterface,
   std::uint32_t _sessionID VESK_GUARDED_BY(_mutex) = 0;
   std::optional<Dictionary> _sessionInfo VESK_GUARDED_BY(_mutex);
   std::optional<Dictionary> _userInfo VESK_GUARDED_BY(_mutex);
+  std::shared_ptr<const std::string> _correlationKey VESK_GUARDED_BY(_mutex);  // set along with _userInfo
   List _frameworks VESK_GUARDED_BY(_mutex);  // kept for the session's life and not consulted
   SharedBackends _backends VESK_GUARDED_BY(_mutex);
   std::optional<std::string> _storebagVersion VESK_GUARDED_BY(_mutex);

@@ -4,6 +4,7 @@
 #include "client/protocol/ClientSessionReplyProxy.h"
 #include "platform/log/SystemLog.h"
 #include "session/ReportingdSession.h"
+#include "util/ReportingdUtil.h"
 
 namespace vesk {
 
@@ -18,6 +19,10 @@ bool sameText(const std::optional<Dictionary>& a, const std::optional<Dictionary
 
 }  // namespace
 
+std::shared_ptr<const std::string> ReportingdSession::keyFor(const std::optional<Dictionary>& userInfo) {
+  return std::make_shared<const std::string>(correlationKeyForUserInfo(userInfo.value_or(Dictionary())));
+}
+
 void ReportingdSession::receivedUserInfo(const std::optional<Dictionary>& userInfo) {
   auto stored = this->userInfo();
   if (stored) {
@@ -30,8 +35,10 @@ void ReportingdSession::receivedUserInfo(const std::optional<Dictionary>& userIn
   }
   VESK_LOG_DEBUG("receivedUserInfo: Received new user info for session %u", sessionID());
   {
+    auto key = keyFor(userInfo);
     MutexLock lock(_mutex);
     _userInfo = userInfo;
+    _correlationKey = std::move(key);
   }
   updateSessionWithDefaultSessionInfo();
 }
@@ -64,8 +71,8 @@ void ReportingdSession::sendToAggregator(const std::optional<Dictionary>& sessio
                                          const std::optional<Dictionary>& payload) {
   ClientSessionReplyProxy proxy(_connection, [&](const std::string& error) {
     // To its own client that has gone, a session's last messages say nothing that the connection's end does
-    // not; neither does the closing one, which has no session info.
-    if (sessionInfo && !_isEnding) _services.backends.counters.count("session", DropReason::NotAggregated);
+    // not.
+    if (!_isEnding) _services.backends.counters.count("session", DropReason::NotAggregated);
     if (!undeliveredBurstBegins()) return;
     VESK_LOG_ERROR("sendMessageWithDictionary: Failed to get remote object proxy: %s", error.c_str());
   });

@@ -173,7 +173,11 @@ void ReportingdSession::sendSingleMessage(const SessionServices& services,
     auto answer = backend->sendMessage(payload, now, category, type, 0);
     if (answer) writeToLogFile("[%@ -> sendMessageWithSessionInfo] %@", name, *answer);
   }
-  for (const auto& [name, backend] : *backends) backend->cleanup();
+  // A storebag may have the backend hold the message for a batch, which ends here.
+  for (const auto& [name, backend] : *backends) {
+    backend->flushMessages();
+    backend->cleanup();
+  }
 }
 
 }  // namespace vesk

@@ -36,6 +36,8 @@ void ReportingdSession::cleanupBackends(const SharedBackends& backends) {
 }
 
 void ReportingdSession::updateSessionWithDefaultSessionInfo() {
+  // Until the states are decided its level is not: no relative may find it in its family before that.
+  RecursiveMutexLock monitor(_sessionDelegate->monitor());
   _sessionDelegate->userInfoUpdatedForSession(*this);
   updateReportingStates();
   _sessionDelegate->updateDownstreamSessions(*this);

@@ -96,6 +96,32 @@ TEST_F(Family, ASessionLeavesItsFamilyUnderWhateverNameItJoined) {
   EXPECT_TRUE(configuredAnew.expired());
 }
 
+TEST_F(Family, NobodyTakesASessionThatStartsForItsParent) {
+  harness.storebags[6] =
+      Dictionary{{"httpPost", Dictionary{{"clients", List{Dictionary{{"hierarchy", 1},
+                                                                     {"expedite", 1},
+                                                                     {"locale_whitelist", List{"US"}},
+                                                                     {"filters", List{Dictionary()}},
+                                                                     {"sampling_threshold", 1.0}}}}}}};
+  auto sibling = join(1);
+  auto starting = harness.newSession();
+  starting->setSessionInfo(sessionInfo(1), userInfo("MyApp"), {}, false);
+  std::future<void> refresh;
+  SystemLog::setLevel(7);
+  SystemLog::setSink([&](LogLevel, std::string_view line) {
+    // It is in its family now, and its level is not decided yet.
+    if (refresh.valid() || line.find("Store bag override") == std::string_view::npos) return;
+    refresh =
+        std::async(std::launch::async, [&] { sibling->fetchStatesWithUserInfo(userInfo("MYAPP"), {}); });
+    refresh.wait_for(std::chrono::milliseconds(100));  // it goes on, or waits for this thread
+  });
+  starting.start();
+  refresh.get();
+  SystemLog::setSink(nullptr);
+  SystemLog::setLevel(6);
+  EXPECT_EQ(sibling->fetchReportingStates(), BackendNames{"httpPost"});
+}
+
 TEST_F(Family, AcceptingWaitsForNoStorebag) {
   CapturedLog log;
   auto top = join(0);

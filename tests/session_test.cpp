@@ -219,6 +219,10 @@ TEST_F(Session, ASingleMessageNeedsItsIdentifiersAndAStorebag) {
   ASSERT_EQ(posts.size(), 1u);
   EXPECT_EQ(posts[0].event().at("_method"), 4);
   EXPECT_FALSE(posts[0].event().contains("_sessionID")) << "a temporary backend has no session identity";
+  MutableDictionary batching(id(5));
+  batching.set(kVeskReportingSessionInfoBatchEvent, true);
+  EXPECT_EQ(sendOnce(batching.share()), "finished");
+  EXPECT_EQ(harness.posts().size(), 2u) << "nothing could send it later";
 }
 
 TEST(StorebagCache, FetchesByAgeAndWaitsAfterFailures) {
