@@ -8,6 +8,7 @@
 #include <optional>
 #include <string>
 
+#include "backends/DashboardLinger.h"
 #include "backends/UploadGate.h"
 #include "platform/http/HTTPClient.h"
 #include "platform/queue/TimedQueue.h"
@@ -36,6 +37,8 @@ struct BackendServices {
   std::shared_ptr<UploadGate> uploads = std::make_shared<UploadGate>();
   /// Where power-log backends record; without one they record nothing.
   std::shared_ptr<PowerLog> powerLog = nullptr;
+  /// How many dashboards may outlive their sessions.
+  std::shared_ptr<DashboardLinger> dashboardLinger = std::make_shared<DashboardLinger>(kMaximumLingering);
 };
 
 }  // namespace vesk

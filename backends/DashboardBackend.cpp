@@ -102,8 +102,8 @@ std::shared_ptr<DashboardBackend> DashboardBackend::createConnected(
   }
   auto queue = networkQueue(services);
   if (!queue) return nullptr;
-  auto delivery =
-      std::make_shared<DashboardDelivery>(std::move(socket), std::move(queue), services.counters, name);
+  auto delivery = std::make_shared<DashboardDelivery>(std::move(socket), std::move(queue),
+                                                      services.dashboardLinger, services.counters, name);
   std::shared_ptr<DashboardBackend> backend(
       new DashboardBackend(name, profile, productFamily.value_or(Text()), delivery, services));
   if (!profile) settings = settingsFrom(serverIP, serverPort);

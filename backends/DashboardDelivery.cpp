@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <exception>
+#include <future>
 #include <new>
 #include <system_error>
 #include <utility>
@@ -19,8 +20,10 @@ constexpr std::array<std::int32_t, 4> kTicksBeforeRetransmit{2, 3, 5, 9};
 }  // namespace
 
 DashboardDelivery::DashboardDelivery(UDPSocket socket, std::shared_ptr<TimedQueue> networkProcQueue,
-                                     Counters& counters, std::string backendName)
+                                     std::shared_ptr<DashboardLinger> linger, Counters& counters,
+                                     std::string backendName)
     : _networkProcQueue(std::move(networkProcQueue)),
+      _linger(std::move(linger)),
       _counters(counters),
       _backendName(std::move(backendName)),
       _socket(std::move(socket)) {}
@@ -28,6 +31,7 @@ DashboardDelivery::DashboardDelivery(UDPSocket socket, std::shared_ptr<TimedQueu
 DashboardDelivery::~DashboardDelivery() {
   MutexLock lock(_mutex);
   countLost(DropReason::Unacknowledged, _messageQueue.size() + _handedOver.size());
+  leavePlace();
 }
 
 // --- Construction
@@ -39,7 +43,7 @@ void DashboardDelivery::useReliableUDP() {
   }
   _reliableUDP = true;
   try {
-    _readSource = _networkProcQueue->makeReadSource(_socket.descriptor(), [weak = weak_from_this()] {
+    _readSource = _networkProcQueue->makeReadSource(_socket.sharedDescriptor(), [weak = weak_from_this()] {
       if (auto self = weak.lock()) self->processSocketRead();
     });
   } catch (const std::exception&) {
@@ -85,11 +89,29 @@ void DashboardDelivery::send(std::unique_ptr<Buffer> buffer, std::uint16_t lengt
 }
 
 void DashboardDelivery::cleanup() {
-  _networkProcQueue->submit([self = shared_from_this()] {
-    if (self->_messageQueue.empty()) return self->cleanupSources();
-    if (self->_cleanupState == Running) self->_cleanupState = Requested;
-    self->keepTicking();
-  });
+  bool mayLinger = false;
+  {
+    MutexLock lock(_mutex);
+    if (_isTornDown) return;
+    _hasPlace = mayLinger = _hasPlace || _linger->try_acquire();
+  }
+  if (mayLinger) {
+    _networkProcQueue->submit([self = shared_from_this()] {
+      if (self->_messageQueue.empty()) return self->cleanupSources();
+      if (self->_cleanupState == Running) self->_cleanupState = Requested;
+      self->keepTicking();
+    });
+    return;
+  }
+  // Waited for: a client that makes deliveries faster than the queue ends them would pile up their sockets.
+  std::promise<void> ended;
+  auto end = ended.get_future();  // also ready when the queue was stopped and drops the work
+  _networkProcQueue->submit(
+      [self = shared_from_this(), ended = std::make_shared<std::promise<void>>(std::move(ended))] {
+        self->cleanupSources();
+        ended->set_value();
+      });
+  end.wait();
 }
 
 // --- On the queue
@@ -209,6 +231,13 @@ void DashboardDelivery::cleanupSources() {
   _timer.reset();
   _readSource.reset();
   _socket.close();
+  MutexLock lock(_mutex);
+  _isTornDown = true;
+  leavePlace();
+}
+
+void DashboardDelivery::leavePlace() {
+  if (std::exchange(_hasPlace, false)) _linger->release();
 }
 
 void DashboardDelivery::countLost(DropReason reason, std::size_t count) {

@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "backends/DashboardDatagram.h"
+#include "backends/DashboardLinger.h"
 #include "backends/UDPPacketToSend.h"
 #include "platform/net/UDPSocket.h"
 #include "platform/queue/Metronome.h"
@@ -26,7 +27,8 @@ namespace vesk {
 /// Life: the backend holds it, and so do the work on the queue and, while datagrams are pending, the timer;
 /// the read source and the last resort do not. So it outlives its backend until the last datagram has gone
 /// or 9.5 s are over, and then lets go of everything. When the queue's threads are stopped before, it goes
-/// with its handlers. The socket is closed by the teardown, or with the object.
+/// with its handlers. The socket is closed by the teardown, or with the object. Only so many may outlive
+/// their backends at a time; from `cleanup` to its teardown each takes a place.
 class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery> {
  public:
   using Buffer = std::array<char, kDashboardBufferSize>;
@@ -37,8 +39,8 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   static constexpr std::size_t kMaximumHandedOver = 1024;
 
   /// `socket` is open. Drops are counted in `counters` under `backendName`.
-  DashboardDelivery(UDPSocket socket, std::shared_ptr<TimedQueue> networkProcQueue, Counters& counters,
-                    std::string backendName);
+  DashboardDelivery(UDPSocket socket, std::shared_ptr<TimedQueue> networkProcQueue,
+                    std::shared_ptr<DashboardLinger> linger, Counters& counters, std::string backendName);
   ~DashboardDelivery();
   DashboardDelivery(const DashboardDelivery&) = delete;
   DashboardDelivery& operator=(const DashboardDelivery&) = delete;
@@ -60,7 +62,8 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   /// it is bounded, the excess dropped and counted, as is what there is no memory for.
   void send(std::unique_ptr<Buffer> buffer, std::uint16_t length, std::uint16_t eventNumber);
   /// Asks for the shutdown: at once when nothing is pending, else when nothing is any more, 9.5 s after the
-  /// next tick at the latest. Safe to call twice.
+  /// next tick at the latest. When no place is left, tears down at once what then counts as unacknowledged,
+  /// and waits for that. Safe to call twice; not from the queue.
   void cleanup();
 
  private:
@@ -82,10 +85,12 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   void continueShutdown();
   void keepTicking();
   void cleanupSources();
+  void leavePlace() VESK_REQUIRES(_mutex);
   void countLost(DropReason reason, std::size_t count = 1);
 
   // Constant after construction.
   const std::shared_ptr<TimedQueue> _networkProcQueue;
+  const std::shared_ptr<DashboardLinger> _linger;
   Counters& _counters;
   const std::string _backendName;
   bool _reliableUDP = false;
@@ -100,6 +105,8 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   // Guarded by _mutex, a leaf.
   Mutex _mutex;
   std::vector<HandedOver> _handedOver VESK_GUARDED_BY(_mutex);
+  bool _hasPlace VESK_GUARDED_BY(_mutex) = false;
+  bool _isTornDown VESK_GUARDED_BY(_mutex) = false;
 };
 
 }  // namespace vesk

@@ -17,6 +17,7 @@
 #include "platform/log/SystemLog.h"
 #include "platform/powerlog/PowerLog.h"
 #include "platform/queue/TimedQueuePool.h"
+#include "platform/service/DescriptorLimit.h"
 #include "util/Counters.h"
 
 namespace vesk {
@@ -46,6 +47,12 @@ PowerLog::Options powerLogOptions() {
   return options;
 }
 
+/// Connections with a dashboard each take five of eight descriptors, two more are for what they make anew.
+std::shared_ptr<DashboardLinger> dashboardLinger() {
+  return std::make_shared<DashboardLinger>(
+      static_cast<std::ptrdiff_t>(std::min(kMaximumLingering, descriptorLimit() / 8)));
+}
+
 void logLosses() {
   for (const auto& loss : Counters::shared().snapshot()) {
     VESK_LOG_INFO("main: Lost since the start: %s %s %llu", loss.backend.c_str(),
@@ -68,7 +75,8 @@ struct Daemon::Parts {
                         diagnosticsSubmissionConsent,
                         regionCode,
                         std::make_shared<UploadGate>(),
-                        std::make_shared<PowerLog>(powerLogOptions())},
+                        std::make_shared<PowerLog>(powerLogOptions()),
+                        dashboardLinger()},
         sessionServices{backendServices, clientLibraryVersion()},
         http(httpOptions()),
         agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetcher(), busyMarker)),

@@ -58,7 +58,8 @@ class Exchange {
   Exchange() : _queue(std::make_shared<test::SimulatedQueue>()) {
     UDPSocket socket;
     require(_server.open() == 0 && _server.bind({0x7F00'0001, 0}) == 0 && socket.open() == 0);
-    _delivery = std::make_shared<DashboardDelivery>(std::move(socket), _queue, _counters, "dashboard");
+    _delivery = std::make_shared<DashboardDelivery>(
+        std::move(socket), _queue, std::make_shared<DashboardLinger>(1), _counters, "dashboard");
     _delivery->useReliableUDP();
     require(_delivery->connect(*_server.localEndpoint()) && _delivery->start(std::chrono::milliseconds(10)));
   }

@@ -24,7 +24,8 @@ class Delivery : public testing::Test {
   void start(bool reliable = true, milliseconds tick = milliseconds(500)) {
     UDPSocket socket;
     ASSERT_EQ(socket.open(), 0);
-    _delivery = std::make_shared<DashboardDelivery>(std::move(socket), _queue, _counters, "dashboard");
+    _delivery =
+        std::make_shared<DashboardDelivery>(std::move(socket), _queue, _linger, _counters, "dashboard");
     if (reliable) _delivery->useReliableUDP();
     ASSERT_TRUE(_delivery->connect(_server.endpoint()));
     ASSERT_TRUE(_delivery->start(tick));
@@ -60,6 +61,7 @@ class Delivery : public testing::Test {
   Counters _counters;
   DashboardServer _server;
   std::shared_ptr<SimulatedQueue> _queue = std::make_shared<SimulatedQueue>();
+  std::shared_ptr<DashboardLinger> _linger = std::make_shared<DashboardLinger>(1);
   std::shared_ptr<DashboardDelivery> _delivery;
   CapturedLog _log;
 };
@@ -234,6 +236,7 @@ TEST_F(Delivery, CleanupEndsNineAndAHalfSecondsAfterTheNextTick) {
   EXPECT_EQ(_queue->waiting() + _queue->readers(), 0u);
   EXPECT_EQ(_log.count(7, kLastResortLine), 1);
   EXPECT_EQ(lost(DropReason::Unacknowledged), 2u) << "one was given up, one discarded";
+  EXPECT_TRUE(_linger->try_acquire()) << "its place is free again";
 }
 
 TEST_F(Delivery, GoesOnWithoutWhatItCanNotHave) {
@@ -241,7 +244,7 @@ TEST_F(Delivery, GoesOnWithoutWhatItCanNotHave) {
   {
     UDPSocket bound;
     ASSERT_EQ(bound.open() + bound.bindToAnyPort(), 0);
-    DashboardDelivery twiceBound(std::move(bound), _queue, _counters, "dashboard");
+    DashboardDelivery twiceBound(std::move(bound), _queue, _linger, _counters, "dashboard");
     twiceBound.useReliableUDP();
     EXPECT_EQ(_log.count(3, "DashboardBackend(useReliableUDP): can't bind socket, 22"), 1);
     EXPECT_FALSE(twiceBound.isReliable());
@@ -257,27 +260,37 @@ TEST_F(Delivery, GoesOnWithoutWhatItCanNotHave) {
   EXPECT_EQ(openDescriptors(), before) << "closed although no read source was there to be cancelled";
 }
 
-TEST(DeliveryOnThreads, StoppedThreadsLeaveNothingBehind) {
+TEST(DeliveryOnThreads, EndAtOnceBeyondTheirPlacesAndLeaveNothingBehindWhenStopped) {
+  constexpr int kPlaces = 8;
   const long before = openDescriptors();
   Counters counters;
+  auto linger = std::make_shared<DashboardLinger>(kPlaces);
   {
-    DashboardServer server;
+    DashboardServer server;  // that does not answer
     TimedQueuePool pool(1);
-    UDPSocket socket;
-    ASSERT_EQ(socket.open(), 0);
-    auto delivery =
-        std::make_shared<DashboardDelivery>(std::move(socket), pool.makeQueue("test"), counters, "dashboard");
-    delivery->useReliableUDP();
-    ASSERT_TRUE(delivery->connect(server.endpoint()));
-    ASSERT_TRUE(delivery->start(milliseconds(3)));
-    delivery->send(std::make_unique<DashboardDelivery::Buffer>(), kDashboardHeaderSize, 1);
-    delivery->cleanup();
-    delivery.reset();
-    EXPECT_FALSE(pool.waitUntilUnused(milliseconds(1))) << "nobody acknowledges";
+    const long started = openDescriptors();
+    for (int i = 0; i < 3 * kPlaces; ++i) {
+      UDPSocket socket;
+      ASSERT_EQ(socket.open(), 0);
+      auto delivery = std::make_shared<DashboardDelivery>(std::move(socket), pool.makeQueue("test"), linger,
+                                                          counters, "dashboard");
+      delivery->useReliableUDP();
+      ASSERT_TRUE(delivery->connect(server.endpoint()));
+      ASSERT_TRUE(delivery->start(milliseconds(500)));
+      delivery->send(std::make_unique<DashboardDelivery::Buffer>(), kDashboardHeaderSize, 1);
+      delivery->cleanup();
+      EXPECT_LE(openDescriptors(), started + kPlaces + 4) << "three are the pool's, one may be on its way";
+    }
+    EXPECT_FALSE(pool.waitUntilUnused(milliseconds(1)));
+    EXPECT_GE(server.take().size(), 3u * kPlaces) << "each went out, some maybe again";
     pool.stop();
     EXPECT_TRUE(pool.waitUntilUnused(milliseconds(1)));
   }
   EXPECT_EQ(openDescriptors(), before);
+  ASSERT_EQ(counters.snapshot().size(), 1u);
+  EXPECT_EQ(counters.snapshot()[0].reason, DropReason::Unacknowledged);
+  EXPECT_EQ(counters.snapshot()[0].count, 3u * kPlaces);
+  for (int i = 0; i < kPlaces; ++i) EXPECT_TRUE(linger->try_acquire());
 }
 
 }  // namespace

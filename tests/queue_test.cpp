@@ -126,43 +126,43 @@ TEST_F(WorkTimerTest, ManyComeAndGoFromSeveralThreads) {
 }
 
 TEST_F(ReadSourceTest, IsCalledAgainWhileAnythingIsLeft) {
-  FileDescriptor counter(::eventfd(0, EFD_SEMAPHORE));
+  auto counter = std::make_shared<const FileDescriptor>(::eventfd(0, EFD_SEMAPHORE));
   int calls = 0;
-  ReadSource source(queue, counter.get(), [&] {
+  ReadSource source(queue, counter, [&] {
     eventfd_t one = 0;
-    ASSERT_EQ(::eventfd_read(counter.get(), &one), 0);
+    ASSERT_EQ(::eventfd_read(counter->get(), &one), 0);
     if (++calls == 6) done.set_value();
   });
-  for (int i = 0; i < 2; ++i) EXPECT_EQ(::eventfd_write(counter.get(), 3), 0);
+  for (int i = 0; i < 2; ++i) EXPECT_EQ(::eventfd_write(counter->get(), 3), 0);
   done.get_future().wait();
 }
 
 TEST_F(ReadSourceTest, CancelsItselfAtTheEndOfItsStream) {
-  FileDescriptor counter(::eventfd(0, 0));
+  auto counter = std::make_shared<const FileDescriptor>(::eventfd(0, 0));
   int calls = 0;
   ReadSource source;
   queue.submit([&] {
-    source = ReadSource(queue, counter.get(), [&] {
+    source = ReadSource(queue, counter, [&] {
       ++calls;
       source.cancel();
       source.cancel();
       done.set_value();
     });
-    ::eventfd_write(counter.get(), 1);
+    ::eventfd_write(counter->get(), 1);
   });
   done.get_future().wait();
   drain(queue);
   EXPECT_EQ(calls, 1);
-  EXPECT_THROW(ReadSource(queue, -1, [] {}), std::system_error);
+  EXPECT_THROW(ReadSource(queue, std::make_shared<const FileDescriptor>(), [] {}), std::system_error);
 }
 
 TEST(WorkQueuePool, StopDestroysWhatHasNotRunAndEverythingMayOutliveIt) {
   auto token = std::make_shared<int>(1);
   auto pool = std::make_unique<WorkQueuePool>(1);
   WorkQueue queue(*pool);
-  FileDescriptor counter(::eventfd(0, 0));
+  auto counter = std::make_shared<const FileDescriptor>(::eventfd(0, 0));
   WorkTimer timer(queue, std::chrono::hours(1), milliseconds(0), [token, queue] {});
-  ReadSource source(queue, counter.get(), [token, queue] {});
+  ReadSource source(queue, counter, [token, queue] {});
   queue.submitAfter(std::chrono::hours(1), [token, queue] {});
 
   std::promise<void> running;

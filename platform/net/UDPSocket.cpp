@@ -6,6 +6,8 @@
 
 #include <cerrno>
 #include <cstring>
+#include <new>
+#include <utility>
 
 namespace vesk {
 
@@ -48,8 +50,14 @@ std::string IPv4Endpoint::text() const {
 }
 
 int UDPSocket::open() noexcept {
-  _descriptor = FileDescriptor(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
-  return _descriptor ? 0 : errno;
+  FileDescriptor descriptor(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+  if (!descriptor) return errno;
+  try {
+    _descriptor = std::make_shared<const FileDescriptor>(std::move(descriptor));
+    return 0;
+  } catch (const std::bad_alloc&) {
+    return ENOMEM;
+  }
 }
 
 int UDPSocket::bind(const IPv4Endpoint& local) noexcept {

@@ -3,6 +3,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <span>
 #include <string>
@@ -48,13 +49,15 @@ class UDPSocket {
 
   /// What it is bound to; nothing before that.
   std::optional<IPv4Endpoint> localEndpoint() const noexcept;
-  int descriptor() const noexcept { return _descriptor.get(); }
-  bool isOpen() const noexcept { return static_cast<bool>(_descriptor); }
+  int descriptor() const noexcept { return _descriptor ? _descriptor->get() : -1; }
+  /// For who watches it; the socket is closed with the last share. Null when it isn't open.
+  std::shared_ptr<const FileDescriptor> sharedDescriptor() const noexcept { return _descriptor; }
+  bool isOpen() const noexcept { return _descriptor != nullptr; }
   /// May be called twice.
   void close() noexcept { _descriptor.reset(); }
 
  private:
-  FileDescriptor _descriptor;
+  std::shared_ptr<const FileDescriptor> _descriptor;
 };
 
 }  // namespace vesk

@@ -4,6 +4,7 @@
 #include <chrono>
 #include <memory>
 
+#include "platform/files/FileDescriptor.h"
 #include "platform/queue/WorkQueue.h"
 
 namespace vesk {
@@ -30,9 +31,9 @@ class TimedQueue {
   /// Fires after `first`, then every `interval`, which is more than zero.
   virtual std::unique_ptr<Source> makeTimer(std::chrono::milliseconds first,
                                             std::chrono::milliseconds interval, Work handler) = 0;
-  /// Calls its handler whenever `descriptor` has something to read, and again while anything is left. Throws
-  /// std::system_error when it can't be watched. The descriptor may be closed at any time.
-  virtual std::unique_ptr<Source> makeReadSource(int descriptor, Work handler) = 0;
+  /// As ReadSource.
+  virtual std::unique_ptr<Source> makeReadSource(std::shared_ptr<const FileDescriptor> descriptor,
+                                                 Work handler) = 0;
 };
 
 /// Hands out queues.

@@ -37,8 +37,9 @@ class TimedQueuePool::Queue final : public TimedQueue {
                                     Work handler) override {
     return std::make_unique<Held<WorkTimer>>(WorkTimer(_queue, first, interval, std::move(handler)));
   }
-  std::unique_ptr<Source> makeReadSource(int descriptor, Work handler) override {
-    return std::make_unique<Held<ReadSource>>(ReadSource(_queue, descriptor, std::move(handler)));
+  std::unique_ptr<Source> makeReadSource(std::shared_ptr<const FileDescriptor> descriptor,
+                                         Work handler) override {
+    return std::make_unique<Held<ReadSource>>(ReadSource(_queue, std::move(descriptor), std::move(handler)));
   }
 
  private:

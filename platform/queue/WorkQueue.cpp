@@ -1,6 +1,5 @@
 #include "platform/queue/WorkQueue.h"
 
-#include <fcntl.h>
 #include <pthread.h>
 #include <signal.h>
 
@@ -13,14 +12,12 @@
 #include <boost/asio/post.hpp>
 #include <boost/asio/steady_timer.hpp>
 #include <boost/asio/strand.hpp>
-#include <cerrno>
 #include <exception>
 #include <system_error>
 #include <thread>
 #include <utility>
 #include <vector>
 
-#include "platform/files/FileDescriptor.h"
 #include "platform/log/SystemLog.h"
 #include "platform/sync/Mutex.h"
 
@@ -39,12 +36,6 @@ void run(const Work& work, const char* label) noexcept {
   } catch (...) {
     VESK_LOG_ERROR("%s: work failed", label);
   }
-}
-
-int duplicate(int descriptor) {
-  int copy = ::fcntl(descriptor, F_DUPFD_CLOEXEC, 0);
-  if (copy < 0) throw std::system_error(errno, std::generic_category(), "read source");
-  return copy;
 }
 
 }  // namespace
@@ -227,22 +218,24 @@ class WorkQueuePool::Timer : public Source, public std::enable_shared_from_this<
 /// Only its queue touches the descriptor of the context.
 class WorkQueuePool::Watch : public Source, public std::enable_shared_from_this<Watch> {
  public:
-  Watch(Core& core, const char* label, Strand strand, FileDescriptor descriptor, Work handler)
+  Watch(Core& core, const char* label, Strand strand, std::shared_ptr<const FileDescriptor> descriptor,
+        Work handler)
       : Source(core, label, std::move(handler)),
         _strand(std::move(strand)),
-        _descriptor(core.context(), descriptor.get()) {
-    [[maybe_unused]] int owned = descriptor.release();
+        _owner(std::move(descriptor)),
+        _descriptor(core.context()) {
+    boost::system::error_code error;
+    _descriptor.assign(_owner->get(), error);
+    if (error) throw std::system_error(error, "read source");
   }
+  ~Watch() override { letGo(); }
 
   void start() {
     _core.add(shared_from_this());
     _core.post(_strand, [self = shared_from_this()] { self->wait(); });
   }
   void shut() override {
-    _core.post(_strand, [self = shared_from_this()] {
-      boost::system::error_code ignored;
-      self->_descriptor.close(ignored);
-    });
+    _core.post(_strand, [self = shared_from_this()] { self->letGo(); });
   }
 
  private:
@@ -254,7 +247,14 @@ class WorkQueuePool::Watch : public Source, public std::enable_shared_from_this<
         }));
   }
 
+  /// Stops watching before the descriptor may be closed.
+  void letGo() {
+    if (_owner) _descriptor.release();
+    _owner.reset();
+  }
+
   Strand _strand;
+  std::shared_ptr<const FileDescriptor> _owner;
   asio::posix::stream_descriptor _descriptor;
 };
 
@@ -296,10 +296,11 @@ WorkTimer::WorkTimer(const WorkQueue& queue, std::chrono::milliseconds first,
   timer->start(first);
 }
 
-ReadSource::ReadSource(const WorkQueue& queue, int descriptor, Work handler) : WorkSource(queue) {
+ReadSource::ReadSource(const WorkQueue& queue, std::shared_ptr<const FileDescriptor> descriptor, Work handler)
+    : WorkSource(queue) {
   auto watch =
       std::make_shared<WorkQueuePool::Watch>(*queue._state->core, queue._state->label, queue._state->strand,
-                                             FileDescriptor(duplicate(descriptor)), std::move(handler));
+                                             std::move(descriptor), std::move(handler));
   _source = watch;
   watch->start();
 }

@@ -6,6 +6,8 @@
 #include <functional>
 #include <memory>
 
+#include "platform/files/FileDescriptor.h"
+
 namespace vesk {
 
 /// Runs on a thread of the pool; must not block for long. What it throws is logged.
@@ -93,10 +95,9 @@ class ReadSource : public WorkSource {
  public:
   /// A source that does nothing.
   ReadSource() noexcept = default;
-  /// The descriptor stays its owner's, who may close it at any time; the source watches a duplicate, which is
-  /// closed when the queue gets to know of the cancellation. Throws std::system_error for a descriptor that
-  /// can't be watched.
-  ReadSource(const WorkQueue& queue, int descriptor, Work handler);
+  /// Keeps its share of the descriptor until the queue gets to know of the cancellation, since the number of
+  /// one that is watched must not be used again. Throws std::system_error for one that can't be watched.
+  ReadSource(const WorkQueue& queue, std::shared_ptr<const FileDescriptor> descriptor, Work handler);
 };
 
 }  // namespace vesk

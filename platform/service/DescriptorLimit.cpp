@@ -11,4 +11,9 @@ void raiseDescriptorLimit() noexcept {
   ::setrlimit(RLIMIT_NOFILE, &limit);
 }
 
+std::size_t descriptorLimit() noexcept {
+  rlimit limit{};
+  return ::getrlimit(RLIMIT_NOFILE, &limit) == 0 ? limit.rlim_cur : 0;
+}
+
 }  // namespace vesk

@@ -27,10 +27,11 @@ class SimulatedQueue final : public TimedQueue, public std::enable_shared_from_t
     _entries.back()->interval = interval;
     return std::make_unique<Held>(_entries.back());
   }
-  std::unique_ptr<Source> makeReadSource(int descriptor, Work handler) override {
+  std::unique_ptr<Source> makeReadSource(std::shared_ptr<const FileDescriptor> descriptor,
+                                         Work handler) override {
     if (refusesReadSources) throw std::system_error(EMFILE, std::generic_category());
     auto entry = std::make_shared<Entry>();
-    entry->descriptor = descriptor;
+    entry->descriptor = descriptor->get();
     entry->work = std::make_shared<const Work>(std::move(handler));
     _readers.push_back(entry);
     return std::make_unique<Held>(entry);
