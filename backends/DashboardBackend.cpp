@@ -14,7 +14,9 @@ namespace vesk {
 namespace {
 
 constexpr char kQueueLabel[] = "com.corvane.VeskReporting.networkProc";
-constexpr std::int64_t kLongestTick = 3'600'000;  // ms
+/// Longer than anything lives; the clock still holds a time that far away.
+constexpr auto kLongestTick =
+    std::chrono::duration_cast<std::chrono::milliseconds>(TimedQueue::Clock::duration::max()) / 4;
 constexpr std::int64_t kMicrosecondsPerStep = 4000;
 
 /// What a profile says of the server and the delivery.
@@ -30,7 +32,7 @@ IPv4Endpoint serverAt(std::string_view ip, std::uint16_t port) {
 }
 
 std::chrono::milliseconds tickFrom(std::int64_t reliable) {
-  if (reliable > 0 && reliable <= kLongestTick) return std::chrono::milliseconds(reliable);
+  if (reliable > 0) return std::min(std::chrono::milliseconds(reliable), kLongestTick);
   VESK_LOG_WARNING("DashboardBackend(initWithName): 'reliable' can't be %lld ms, using %d ms",
                    static_cast<long long>(reliable),
                    static_cast<int>(DashboardDelivery::kDefaultTick.count()));

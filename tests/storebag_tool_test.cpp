@@ -125,7 +125,10 @@ TEST(StorebagSource, WarnsOfWhatIsProbablyAMistake) {
        {"dashboard.ip: missing", "dashboard.port: missing"}},
       {"dashboard's values",
        R"({"release": {"dashboard": {"ip": "localhost", "port": 1, "reliable": 0}}})",
-       {"dashboard.ip: not four decimal numbers", "dashboard.reliable: not 1 to 3600000 ms"}},
+       {"dashboard.ip: not four decimal numbers", "dashboard.reliable: not 1 ms or more"}},
+      {"a dashboard's haste",
+       R"({"release": {"dashboard": {"ip": "127.0.0.1", "port": 1, "reliable": true}}})",
+       {"dashboard.reliable: ticks of 1 ms"}},
   };
   TempDirectory files;
   for (const auto& test : cases) {
