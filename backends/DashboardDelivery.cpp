@@ -4,6 +4,7 @@
 #include <cerrno>
 #include <exception>
 #include <future>
+#include <iterator>
 #include <new>
 #include <system_error>
 #include <utility>
@@ -97,7 +98,7 @@ void DashboardDelivery::cleanup() {
   }
   if (mayLinger) {
     _networkProcQueue->submit([self = shared_from_this()] {
-      if (self->_messageQueue.empty()) return self->cleanupSources();
+      if (!self->isPending()) return self->cleanupSources();
       if (self->_cleanupState == Running) self->_cleanupState = Requested;
       self->keepTicking();
     });
@@ -117,20 +118,50 @@ void DashboardDelivery::cleanup() {
 // --- On the queue
 
 void DashboardDelivery::sendHandedOver() {
+  if (_waitsForRoom) return;
   std::vector<HandedOver> datagrams;
   {
     MutexLock lock(_mutex);
     datagrams.swap(_handedOver);
   }
-  for (const auto& datagram : datagrams)
-    tryToSendMsg(datagram.buffer->data(), datagram.length, datagram.eventNumber);
+  const auto rest = std::find_if_not(datagrams.begin(), datagrams.end(), [this](const auto& datagram) {
+    return tryToSendMsg(datagram.buffer->data(), datagram.length, datagram.eventNumber);
+  });
+  datagrams.erase(datagrams.begin(), rest);
+  if (!datagrams.empty()) waitForRoom(std::move(datagrams));
 }
 
-void DashboardDelivery::tryToSendMsg(const char* bytes, std::uint16_t length, std::uint16_t eventNumber) {
-  if (!_timer) return countLost(DropReason::Unacknowledged);  // torn down: nobody would try again
+/// Puts them back, before what was handed over meanwhile.
+void DashboardDelivery::waitForRoom(std::vector<HandedOver> datagrams) {
+  try {
+    _networkProcQueue->submitAfter(kRoomWait, [self = shared_from_this()] {
+      self->_waitsForRoom = false;
+      self->sendHandedOver();
+    });
+    _waitsForRoom = true;
+    MutexLock lock(_mutex);
+    const std::size_t kept = std::min(_handedOver.size(), kMaximumHandedOver - datagrams.size());
+    const auto excess = _handedOver.begin() + static_cast<std::ptrdiff_t>(kept);
+    countLost(DropReason::OverBound, _handedOver.size() - kept);
+    _handedOver.erase(excess, _handedOver.end());
+    datagrams.insert(datagrams.end(), std::make_move_iterator(_handedOver.begin()),
+                     std::make_move_iterator(_handedOver.end()));
+    _handedOver = std::move(datagrams);
+  } catch (const std::exception&) {  // no memory
+    countLost(DropReason::OverBound, datagrams.size());
+  }
+}
+
+bool DashboardDelivery::tryToSendMsg(const char* bytes, std::uint16_t length, std::uint16_t eventNumber) {
+  if (!_timer) {  // torn down: nobody would try again
+    countLost(DropReason::Unacknowledged);
+    return true;
+  }
   const std::string_view datagram(bytes, length);
-  const bool isSent = _socket.send(datagram);
-  if (isSent && !_reliableUDP) return;
+  const auto outcome = _socket.send(datagram);
+  if (outcome == UDPSocket::Outcome::WouldBlock) return false;
+  const bool isSent = outcome == UDPSocket::Outcome::Sent;
+  if (isSent && !_reliableUDP) return true;
   try {
     UDPPacketToSend packet(datagram, eventNumber);
     if (isSent) packet.setState(UDPPacketToSend::Sent);
@@ -138,6 +169,7 @@ void DashboardDelivery::tryToSendMsg(const char* bytes, std::uint16_t length, st
   } catch (const std::bad_alloc&) {
     countLost(DropReason::OverBound);
   }
+  return true;
 }
 
 void DashboardDelivery::append(UDPPacketToSend packet) {
@@ -176,7 +208,7 @@ void DashboardDelivery::walkQueue() {
     UDPPacketToSend& packet = _messageQueue[index];
     bool isDone = false;
     if (packet.state() == UDPPacketToSend::Unsent) {
-      const bool isSent = _socket.send(packet.data());
+      const bool isSent = _socket.send(packet.data()) == UDPSocket::Outcome::Sent;
       if (isSent && _reliableUDP) packet.setState(UDPPacketToSend::Sent);
       isDone = isSent && !_reliableUDP;
     } else {
@@ -200,7 +232,7 @@ bool DashboardDelivery::keepsWaiting(UDPPacketToSend& packet) {
   const std::int32_t checks = packet.numberOfChecks() + 1;
   if (checks < kTicksBeforeRetransmit[retransmits]) {
     packet.setNumberOfChecks(checks);
-  } else if (_socket.send(packet.data())) {
+  } else if (_socket.send(packet.data()) == UDPSocket::Outcome::Sent) {
     packet.setNumberOfChecks(0);
     packet.setNumberOfRetransmits(packet.numberOfRetransmits() + 1);
   }
@@ -208,7 +240,7 @@ bool DashboardDelivery::keepsWaiting(UDPPacketToSend& packet) {
 }
 
 void DashboardDelivery::continueShutdown() {
-  if (_messageQueue.empty()) {
+  if (!isPending()) {
     VESK_LOG_DEBUG("DashboardBackend(myPeriodicTask): clean up at myPeriodicTask.");
     cleanupSources();
   } else if (_cleanupState == Requested) {

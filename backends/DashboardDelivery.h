@@ -37,6 +37,8 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   static constexpr std::chrono::milliseconds kLastResort{9'500};
   static constexpr std::size_t kMaximumQueued = 50;
   static constexpr std::size_t kMaximumHandedOver = 1024;
+  /// What the system has no room for is tried again after this.
+  static constexpr std::chrono::milliseconds kRoomWait{10};
 
   /// `socket` is open. Drops are counted in `counters` under `backendName`.
   DashboardDelivery(UDPSocket socket, std::shared_ptr<TimedQueue> networkProcQueue,
@@ -76,8 +78,11 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
 
   // On the queue.
   void sendHandedOver();
-  void tryToSendMsg(const char* bytes, std::uint16_t length, std::uint16_t eventNumber);
+  void waitForRoom(std::vector<HandedOver> datagrams);
+  /// False, and nothing has happened, when the system has no room for it.
+  [[nodiscard]] bool tryToSendMsg(const char* bytes, std::uint16_t length, std::uint16_t eventNumber);
   void append(UDPPacketToSend packet);
+  bool isPending() const noexcept { return _waitsForRoom || !_messageQueue.empty(); }
   void processSocketRead();
   void myPeriodicTask();
   void walkQueue();
@@ -101,6 +106,7 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   std::unique_ptr<TimedQueue::Source> _readSource;
   std::optional<Metronome> _timer;
   CleanupState _cleanupState = Running;
+  bool _waitsForRoom = false;  ///< what is handed over, and work on the queue comes back to it
 
   // Guarded by _mutex, a leaf.
   Mutex _mutex;

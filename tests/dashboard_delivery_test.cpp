@@ -1,5 +1,6 @@
 // Retransmission, acknowledgement, bounds and shutdown of datagrams, tick by tick over real sockets.
 #include <gtest/gtest.h>
+#include <sys/socket.h>
 
 #include <numeric>
 
@@ -24,6 +25,7 @@ class Delivery : public testing::Test {
   void start(bool reliable = true, milliseconds tick = milliseconds(500)) {
     UDPSocket socket;
     ASSERT_EQ(socket.open(), 0);
+    _descriptor = socket.descriptor();
     _delivery =
         std::make_shared<DashboardDelivery>(std::move(socket), _queue, _linger, _counters, "dashboard");
     if (reliable) _delivery->useReliableUDP();
@@ -31,11 +33,14 @@ class Delivery : public testing::Test {
     ASSERT_TRUE(_delivery->start(tick));
     _queue->run();
   }
-  void send(std::uint16_t eventID) {
+  void handOver(std::uint16_t eventID) {
     auto buffer = std::make_unique<DashboardDelivery::Buffer>();
     (*buffer)[60] = static_cast<char>(eventID >> 8);
     (*buffer)[61] = static_cast<char>(eventID);
     _delivery->send(std::move(buffer), kDashboardHeaderSize, eventID);
+  }
+  void send(std::uint16_t eventID) {
+    handOver(eventID);
     _queue->run();
   }
   void cleanup() {
@@ -63,6 +68,7 @@ class Delivery : public testing::Test {
   std::shared_ptr<SimulatedQueue> _queue = std::make_shared<SimulatedQueue>();
   std::shared_ptr<DashboardLinger> _linger = std::make_shared<DashboardLinger>(1);
   std::shared_ptr<DashboardDelivery> _delivery;
+  int _descriptor = -1;  // the delivery's
   CapturedLog _log;
 };
 
@@ -163,6 +169,41 @@ TEST_F(Delivery, WhatComesFasterThanItGoesOutIsBounded) {
   EXPECT_EQ(lost(DropReason::OverBound), 6u);
   _queue->run();
   EXPECT_EQ(lost(DropReason::OverBound), 6u + 1024u - 50u);
+}
+
+TEST_F(Delivery, ABurstWaitsForRoomInTheSystem) {
+  for (const bool linkMoves : {true, false}) {
+    const long before = openDescriptors();
+    start(false);
+    {
+      // Stands in for a link that takes a few datagrams at a time.
+      int ends[2];
+      ASSERT_EQ(::socketpair(AF_UNIX, SOCK_DGRAM | SOCK_NONBLOCK, 0, ends), 0);
+      const FileDescriptor link(ends[0]), farEnd(ends[1]);
+      const int smallest = 1;
+      ASSERT_EQ(::setsockopt(link.get(), SOL_SOCKET, SO_SNDBUF, &smallest, sizeof smallest), 0);
+      ASSERT_EQ(::dup2(link.get(), _descriptor), _descriptor);
+      for (std::uint16_t id = 1; id <= 200; ++id) send(id);
+      for (std::uint16_t id = 201; id <= 300; ++id) handOver(id);
+      cleanup();
+      _delivery.reset();
+      std::vector<int> arrived, all(300);
+      std::iota(all.begin(), all.end(), 1);
+      for (int i = 0; linkMoves && i < 300; ++i) {
+        char datagram[kDashboardHeaderSize];
+        while (::recv(farEnd.get(), datagram, sizeof datagram, 0) > 0)
+          arrived.push_back(eventIDOfAcknowledgement({datagram, sizeof datagram}).value_or(0));
+        _queue->advance(DashboardDelivery::kRoomWait);
+      }
+      EXPECT_EQ(arrived == all, linkMoves) << arrived.size();
+      EXPECT_EQ(lost(DropReason::Unacknowledged), 0u);
+      _queue->advance(milliseconds(10'500));
+    }
+    EXPECT_EQ(openDescriptors(), before);
+    EXPECT_EQ(lost(DropReason::Unacknowledged) > 0, !linkMoves) << "the last resort gives them up";
+    EXPECT_EQ(lost(DropReason::OverBound), 0u);
+    EXPECT_EQ(_queue->waiting(), 0u);
+  }
 }
 
 TEST_F(Delivery, WithoutMemoryOnlyThatDatagramIsLost) {

@@ -113,7 +113,7 @@ TEST_F(DashboardRoad, TheCollectorSurvivesWhatIsNoDatagram) {
   ofHuge.length = static_cast<std::uint16_t>(huge.size());
   encodeDashboardHeader(ofHuge, huge.data());
   for (const std::string& bytes : {std::string(), std::string("x"), header, huge, std::string(3000, 'x')})
-    ASSERT_TRUE(socket.send(bytes));
+    ASSERT_EQ(socket.send(bytes), UDPSocket::Outcome::Sent);
   EXPECT_TRUE(_harness->collector().waitForText("refused a datagram of 3000 bytes from 127.0.0.1:"));
   EXPECT_EQ(_harness->collectorCount("datagramsMalformed"), 5);
 }

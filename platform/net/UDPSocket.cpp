@@ -70,8 +70,10 @@ int UDPSocket::connect(const IPv4Endpoint& peer) noexcept {
   return errorOf(::connect(descriptor(), reinterpret_cast<const sockaddr*>(&address), sizeof address));
 }
 
-bool UDPSocket::send(std::string_view datagram) noexcept {
-  return isWhole(::send(descriptor(), datagram.data(), datagram.size(), MSG_NOSIGNAL), datagram);
+UDPSocket::Outcome UDPSocket::send(std::string_view datagram) noexcept {
+  const ssize_t count = ::send(descriptor(), datagram.data(), datagram.size(), MSG_NOSIGNAL);
+  if (isWhole(count, datagram)) return Outcome::Sent;
+  return count < 0 && errno == EAGAIN ? Outcome::WouldBlock : Outcome::Failed;
 }
 
 bool UDPSocket::sendTo(const IPv4Endpoint& peer, std::string_view datagram) noexcept {

@@ -39,8 +39,13 @@ class UDPSocket {
   /// Only this peer's datagrams are received from now on.
   [[nodiscard]] int connect(const IPv4Endpoint& peer) noexcept;
 
-  /// To the connected peer; true when the whole datagram went out.
-  [[nodiscard]] bool send(std::string_view datagram) noexcept;
+  enum class Outcome : unsigned char {
+    Sent,        ///< the whole datagram
+    WouldBlock,  ///< the system has no room for it at the moment
+    Failed,
+  };
+  /// To the connected peer.
+  [[nodiscard]] Outcome send(std::string_view datagram) noexcept;
   [[nodiscard]] bool sendTo(const IPv4Endpoint& peer, std::string_view datagram) noexcept;
   /// One datagram, cut to the buffer's size; nothing when none is there or the system reports an error, which
   /// that clears. `sender` may be null.
