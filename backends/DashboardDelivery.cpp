@@ -52,7 +52,10 @@ void DashboardDelivery::useReliableUDP() {
   }
 }
 
-bool DashboardDelivery::connect(const IPv4Endpoint& server) { return _socket.connect(server) == 0; }
+bool DashboardDelivery::connect(const IPv4Endpoint& server) {
+  _server = server;
+  return _socket.connect(server) == 0;
+}
 
 bool DashboardDelivery::start(std::chrono::milliseconds tick) {
   try {
@@ -158,7 +161,7 @@ bool DashboardDelivery::tryToSendMsg(const char* bytes, std::uint16_t length, st
     return true;
   }
   const std::string_view datagram(bytes, length);
-  const auto outcome = _socket.send(datagram);
+  const auto outcome = transmit(datagram);
   if (outcome == UDPSocket::Outcome::WouldBlock) return false;
   const bool isSent = outcome == UDPSocket::Outcome::Sent;
   if (isSent && !_reliableUDP) return true;
@@ -170,6 +173,14 @@ bool DashboardDelivery::tryToSendMsg(const char* bytes, std::uint16_t length, st
     countLost(DropReason::OverBound);
   }
   return true;
+}
+
+/// The connection keeps the address that the device had when it was made. Once that is gone, another is
+/// looked for, at most once a tick.
+UDPSocket::Outcome DashboardDelivery::transmit(std::string_view datagram) {
+  const auto outcome = _socket.send(datagram);
+  if (outcome != UDPSocket::Outcome::NoRoute || std::exchange(_hasReconnected, true)) return outcome;
+  return _socket.reconnect(_server) == 0 ? _socket.send(datagram) : outcome;
 }
 
 void DashboardDelivery::append(UDPPacketToSend packet) {
@@ -195,6 +206,7 @@ void DashboardDelivery::processSocketRead() {
 }
 
 void DashboardDelivery::myPeriodicTask() {
+  _hasReconnected = false;
   walkQueue();
   if (_cleanupState != Running) {
     continueShutdown();
@@ -208,7 +220,7 @@ void DashboardDelivery::walkQueue() {
     UDPPacketToSend& packet = _messageQueue[index];
     bool isDone = false;
     if (packet.state() == UDPPacketToSend::Unsent) {
-      const bool isSent = _socket.send(packet.data()) == UDPSocket::Outcome::Sent;
+      const bool isSent = transmit(packet.data()) == UDPSocket::Outcome::Sent;
       if (isSent && _reliableUDP) packet.setState(UDPPacketToSend::Sent);
       isDone = isSent && !_reliableUDP;
     } else {
@@ -232,7 +244,7 @@ bool DashboardDelivery::keepsWaiting(UDPPacketToSend& packet) {
   const std::int32_t checks = packet.numberOfChecks() + 1;
   if (checks < kTicksBeforeRetransmit[retransmits]) {
     packet.setNumberOfChecks(checks);
-  } else if (_socket.send(packet.data()) == UDPSocket::Outcome::Sent) {
+  } else if (transmit(packet.data()) == UDPSocket::Outcome::Sent) {
     packet.setNumberOfChecks(0);
     packet.setNumberOfRetransmits(packet.numberOfRetransmits() + 1);
   }

@@ -8,6 +8,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "backends/DashboardDatagram.h"
@@ -82,6 +83,7 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   /// False, and nothing has happened, when the system has no room for it.
   [[nodiscard]] bool tryToSendMsg(const char* bytes, std::uint16_t length, std::uint16_t eventNumber);
   void append(UDPPacketToSend packet);
+  UDPSocket::Outcome transmit(std::string_view datagram);
   bool isPending() const noexcept { return _waitsForRoom || !_messageQueue.empty(); }
   void processSocketRead();
   void myPeriodicTask();
@@ -102,6 +104,8 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
 
   // On the queue only, once constructed.
   UDPSocket _socket;
+  IPv4Endpoint _server;
+  bool _hasReconnected = false;  ///< since the last tick
   std::vector<UDPPacketToSend> _messageQueue;
   std::unique_ptr<TimedQueue::Source> _readSource;
   std::optional<Metronome> _timer;

@@ -1,7 +1,13 @@
 // Retransmission, acknowledgement, bounds and shutdown of datagrams, tick by tick over real sockets.
+#include <arpa/inet.h>
 #include <gtest/gtest.h>
+#include <net/if.h>
+#include <sched.h>
+#include <sys/ioctl.h>
 #include <sys/socket.h>
+#include <sys/wait.h>
 
+#include <cstring>
 #include <numeric>
 
 #include "backends/DashboardDelivery.h"
@@ -278,6 +284,57 @@ TEST_F(Delivery, CleanupEndsNineAndAHalfSecondsAfterTheNextTick) {
   EXPECT_EQ(_log.count(7, kLastResortLine), 1);
   EXPECT_EQ(lost(DropReason::Unacknowledged), 2u) << "one was given up, one discarded";
   EXPECT_TRUE(_linger->try_acquire()) << "its place is free again";
+}
+
+/// Gives the loopback interface of this network a second address, in place of the one that it had.
+void setDeviceAddress(const char* address, const char* mask) {
+  UDPSocket socket;
+  ASSERT_EQ(socket.open(), 0);
+  ifreq request{};
+  std::strcpy(request.ifr_name, "lo");
+  request.ifr_flags = IFF_UP;
+  ASSERT_EQ(::ioctl(socket.descriptor(), SIOCSIFFLAGS, &request), 0);
+  std::strcpy(request.ifr_name, "lo:1");
+  auto set = [&](unsigned long what, const char* text) {
+    sockaddr_in value{};
+    value.sin_family = AF_INET;
+    ::inet_pton(AF_INET, text, &value.sin_addr);
+    std::memcpy(&request.ifr_addr, &value, sizeof value);
+    ASSERT_EQ(::ioctl(socket.descriptor(), what, &request), 0);
+  };
+  set(SIOCSIFADDR, address);
+  set(SIOCSIFNETMASK, mask);
+}
+
+TEST_F(Delivery, GoesOnFromTheDevicesNewAddress) {
+  constexpr int kNoNetwork = 77;
+  const pid_t child = ::fork();
+  if (child != 0) {
+    int status = 0;
+    ASSERT_EQ(::waitpid(child, &status, 0), child);
+    if (WIFEXITED(status) && WEXITSTATUS(status) == kNoNetwork) GTEST_SKIP() << "no network of its own";
+    ASSERT_EQ(status, 0);
+    return;
+  }
+  if (::unshare(CLONE_NEWUSER | CLONE_NEWNET) != 0) ::_exit(kNoNetwork);
+  for (bool reliable : {false, true}) {
+    setDeviceAddress("192.0.2.2", "255.255.255.0");
+    _server = DashboardServer(0xC0000282);  // 192.0.2.130
+    start(reliable);
+    send(1);
+    setDeviceAddress("192.0.2.129", "255.255.255.128");
+    send(2);
+    EXPECT_EQ(_server.takeEventIDs(), (std::vector{1, 2}));
+    for (std::uint16_t id : {1, 2}) _server.acknowledge(id);  // to where it is now
+    setDeviceAddress("198.51.100.1", "255.255.255.0");        // from where no way leads to the server
+    send(3);
+    _queue->advance(milliseconds(5000));
+    setDeviceAddress("192.0.2.129", "255.255.255.128");
+    _queue->advance(milliseconds(500));
+    EXPECT_EQ(_server.takeEventIDs(), std::vector{3});
+  }
+  EXPECT_TRUE(_counters.snapshot().empty());
+  ::_exit(HasFailure() ? 1 : 0);
 }
 
 TEST_F(Delivery, GoesOnWithoutWhatItCanNotHave) {

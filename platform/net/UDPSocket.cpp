@@ -33,6 +33,20 @@ bool isWhole(ssize_t count, std::string_view datagram) {
   return count >= 0 && static_cast<std::size_t>(count) == datagram.size();
 }
 
+UDPSocket::Outcome outcomeOf(int error) {
+  switch (error) {
+    case EAGAIN:
+      return UDPSocket::Outcome::WouldBlock;
+    case ENETUNREACH:
+    case EADDRNOTAVAIL:
+    case EINVAL:
+    case EDESTADDRREQ:  // a `reconnect` has failed
+      return UDPSocket::Outcome::NoRoute;
+    default:
+      return UDPSocket::Outcome::Failed;
+  }
+}
+
 }  // namespace
 
 std::optional<IPv4Endpoint> IPv4Endpoint::parse(std::string_view dotted, std::uint16_t port) {
@@ -70,10 +84,17 @@ int UDPSocket::connect(const IPv4Endpoint& peer) noexcept {
   return errorOf(::connect(descriptor(), reinterpret_cast<const sockaddr*>(&address), sizeof address));
 }
 
+int UDPSocket::reconnect(const IPv4Endpoint& peer) noexcept {
+  sockaddr nobody{};
+  nobody.sa_family = AF_UNSPEC;
+  if (::connect(descriptor(), &nobody, sizeof nobody) != 0) return errno;
+  return connect(peer);
+}
+
 UDPSocket::Outcome UDPSocket::send(std::string_view datagram) noexcept {
   const ssize_t count = ::send(descriptor(), datagram.data(), datagram.size(), MSG_NOSIGNAL);
   if (isWhole(count, datagram)) return Outcome::Sent;
-  return count < 0 && errno == EAGAIN ? Outcome::WouldBlock : Outcome::Failed;
+  return count < 0 ? outcomeOf(errno) : Outcome::Failed;
 }
 
 bool UDPSocket::sendTo(const IPv4Endpoint& peer, std::string_view datagram) noexcept {

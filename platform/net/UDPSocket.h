@@ -39,9 +39,13 @@ class UDPSocket {
   /// Only this peer's datagrams are received from now on.
   [[nodiscard]] int connect(const IPv4Endpoint& peer) noexcept;
 
+  /// Once more, from an address that the system has now: a connection keeps the one that it was made with.
+  [[nodiscard]] int reconnect(const IPv4Endpoint& peer) noexcept;
+
   enum class Outcome : unsigned char {
     Sent,        ///< the whole datagram
     WouldBlock,  ///< the system has no room for it at the moment
+    NoRoute,     ///< not from the address that the connection has; `reconnect` may find another
     Failed,
   };
   /// To the connected peer.

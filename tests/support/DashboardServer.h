@@ -14,9 +14,9 @@ constexpr std::uint32_t kLoopback = 0x7F000001;
 
 class DashboardServer {
  public:
-  DashboardServer() {
+  explicit DashboardServer(std::uint32_t address = kLoopback) {
     EXPECT_EQ(_socket.open(), 0);
-    EXPECT_EQ(_socket.bind({kLoopback, 0}), 0);
+    EXPECT_EQ(_socket.bind({address, 0}), 0);
     _endpoint = _socket.localEndpoint().value();
   }
 
