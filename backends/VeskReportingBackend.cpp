@@ -11,6 +11,7 @@
 #include "backends/WrenBackend.h"
 #include "platform/crypto/Digest.h"
 #include "platform/log/SystemLog.h"
+#include "platform/text/ASCII.h"
 #include "util/ReportingdUtil.h"
 #include "util/SamplingDraw.h"
 

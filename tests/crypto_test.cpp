@@ -8,6 +8,7 @@
 #include "platform/crypto/Digest.h"
 #include "platform/crypto/RSAPublicKey.h"
 #include "platform/crypto/UUID.h"
+#include "platform/text/ASCII.h"
 #include "tests/support/TestSigningKey.h"
 
 namespace vesk::test {

@@ -2,6 +2,9 @@
 
 #include <algorithm>
 
+#include "platform/text/ASCII.h"
+#include "platform/text/PercentCode.h"
+
 namespace vesk {
 
 namespace {
@@ -14,27 +17,13 @@ bool isIn(std::string_view set, char c) { return set.find(c) != std::string_view
 
 /// What follows the scheme when that is `scheme`, in letters of either case.
 std::string_view afterScheme(std::string_view url, std::string_view scheme) {
-  if (url.size() < scheme.size()) return {};
-  bool equal = std::equal(scheme.begin(), scheme.end(), url.begin(),
-                          [](char wanted, char c) { return wanted == c || wanted == (c | 0x20); });
-  return equal ? url.substr(scheme.size()) : std::string_view();
+  if (!equalsIgnoringASCIICase(url.substr(0, scheme.size()), scheme)) return {};
+  return url.substr(scheme.size());
 }
 
 }  // namespace
 
-std::string encodedForURLQuery(std::string_view text) {
-  constexpr char kDigits[] = "0123456789ABCDEF";
-  std::string encoded;
-  for (char c : text) {
-    if (isIn(kUnreserved, c) || isIn(kOthersInQuery, c)) {
-      encoded += c;
-    } else {
-      auto byte = static_cast<unsigned char>(c);
-      encoded += {'%', kDigits[byte >> 4], kDigits[byte & 15]};
-    }
-  }
-  return encoded;
-}
+std::string encodedForURLQuery(std::string_view text) { return percentEncoded(text, kOthersInQuery); }
 
 bool isWebURL(std::string_view url) {
   std::string_view rest = afterScheme(url, "http://");

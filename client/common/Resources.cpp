@@ -8,6 +8,7 @@
 #include "platform/files/RootPrefix.h"
 #include "platform/files/SmallFile.h"
 #include "platform/log/SystemLog.h"
+#include "platform/text/ASCII.h"
 
 namespace vesk {
 
@@ -25,13 +26,6 @@ std::optional<std::string> readResource(const char* name, std::size_t limit) {
     VESK_LOG_WARNING("VeskReporting: cannot read %s: %s", path.c_str(), file.error.c_str());
   }
   return std::move(file.bytes);
-}
-
-std::string_view trimmed(std::string_view text) {
-  constexpr char kBlank[] = " \t\r\n";
-  auto first = text.find_first_not_of(kBlank);
-  if (first == std::string_view::npos) return {};
-  return text.substr(first, text.find_last_not_of(kBlank) - first + 1);
 }
 
 // The version goes into a URL as it stands, so it has to be one printable word.

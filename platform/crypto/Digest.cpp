@@ -4,6 +4,7 @@
 
 #include <memory>
 #include <stdexcept>
+#include <string>
 
 namespace vesk {
 
@@ -47,17 +48,6 @@ SHA1Digest sha1(std::string_view bytes) {
 SHA256Digest sha256(std::string_view bytes) {
   static const EVP_MD* digest = fetchDigest("SHA256");
   return digestOf<32>(bytes, digest);
-}
-
-std::string hexLower(std::span<const unsigned char> bytes) {
-  static constexpr char kDigits[] = "0123456789abcdef";
-  std::string text(bytes.size() * 2, '\0');
-  char* out = text.data();
-  for (unsigned char byte : bytes) {
-    *out++ = kDigits[byte >> 4];
-    *out++ = kDigits[byte & 15];
-  }
-  return text;
 }
 
 }  // namespace vesk

@@ -2,8 +2,6 @@
 #pragma once
 
 #include <array>
-#include <span>
-#include <string>
 #include <string_view>
 
 namespace vesk {
@@ -15,8 +13,5 @@ using SHA256Digest = std::array<unsigned char, 32>;
 /// Throws std::runtime_error only when the library has no memory or no such digest.
 SHA1Digest sha1(std::string_view bytes);
 SHA256Digest sha256(std::string_view bytes);
-
-/// Two lower-case hexadecimal digits a byte, in order.
-std::string hexLower(std::span<const unsigned char> bytes);
 
 }  // namespace vesk

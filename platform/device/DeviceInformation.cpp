@@ -15,6 +15,7 @@
 #include "platform/preferences/PreferencesSuite.h"
 #include "platform/preferences/TomlFile.h"
 #include "platform/sync/Mutex.h"
+#include "platform/text/ASCII.h"
 #include "platform/unicode/Unicode.h"
 
 namespace vesk {

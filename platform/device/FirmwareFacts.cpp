@@ -4,6 +4,7 @@
 #include <array>
 
 #include "platform/files/SmallFile.h"
+#include "platform/text/ASCII.h"
 
 namespace vesk {
 
@@ -35,12 +36,8 @@ constexpr std::array<std::string_view, 9> kFillers = {"Default string",
                                                       "To be filled by O.E.M."};
 
 // Device-tree texts end with a NUL, and "compatible" is a row of them, the board's own first.
-std::string trimmed(std::string_view text) {
-  text = text.substr(0, text.find('\0'));
-  constexpr std::string_view kSpace = " \t\r\n";
-  std::size_t first = text.find_first_not_of(kSpace);
-  if (first == std::string_view::npos) return {};
-  return std::string(text.substr(first, text.find_last_not_of(kSpace) - first + 1));
+std::string firstText(std::string_view bytes) {
+  return std::string(trimmed(bytes.substr(0, bytes.find('\0'))));
 }
 
 }  // namespace
@@ -50,7 +47,7 @@ std::optional<std::string> firmwareFact(std::string_view key) {
     if (source.key != key) continue;
     SmallFile file = readSmallFile(source.path, 4096);
     if (!file.bytes) continue;
-    std::string fact = trimmed(*file.bytes);
+    std::string fact = firstText(*file.bytes);
     if (!fact.empty() && std::find(kFillers.begin(), kFillers.end(), fact) == kFillers.end()) return fact;
   }
   return std::nullopt;

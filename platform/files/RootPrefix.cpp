@@ -27,4 +27,9 @@ void setRootPrefix(std::string_view prefix) { storage() = normalized(prefix); }
 
 std::string pathUnderRoot(std::string_view path) { return rootPrefix() + std::string(path); }
 
+bool isPlainFileName(std::string_view name) noexcept {
+  return !name.empty() && name.front() != '.' && name.find('/') == std::string_view::npos &&
+         name.find('\0') == std::string_view::npos;
+}
+
 }  // namespace vesk

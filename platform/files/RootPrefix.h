@@ -16,4 +16,8 @@ void setRootPrefix(std::string_view prefix);
 /// `path` (absolute) under the root prefix.
 std::string pathUnderRoot(std::string_view path);
 
+/// Whether `name`, with an ending of ours behind it, names a file of the directory that it is put behind: not
+/// empty, without "/" and NUL, no leading ".".
+bool isPlainFileName(std::string_view name) noexcept;
+
 }  // namespace vesk

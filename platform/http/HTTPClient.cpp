@@ -8,17 +8,11 @@
 
 #include "platform/http/HTTPExchange.h"
 #include "platform/http/HTTPWorker.h"
+#include "platform/text/ASCII.h"
 
 namespace vesk {
 
 namespace {
-
-char lower(char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c; }
-
-bool equalsIgnoringCase(std::string_view a, std::string_view b) {
-  return std::equal(a.begin(), a.end(), b.begin(), b.end(),
-                    [](char x, char y) { return lower(x) == lower(y); });
-}
 
 std::optional<std::string> authoritiesFromEnvironment() {
   const char* file = std::getenv("SSL_CERT_FILE");
@@ -30,7 +24,7 @@ std::optional<std::string> authoritiesFromEnvironment() {
 
 std::optional<std::string_view> HTTPResponse::header(std::string_view name) const {
   for (const auto& [key, value] : headers) {
-    if (equalsIgnoringCase(key, name)) return value;
+    if (equalsIgnoringASCIICase(key, name)) return value;
   }
   return std::nullopt;
 }

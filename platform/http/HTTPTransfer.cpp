@@ -5,6 +5,8 @@
 #include <cstdio>
 #include <new>
 
+#include "platform/text/ASCII.h"
+
 namespace vesk {
 
 namespace {
@@ -18,18 +20,8 @@ void set(CURL* easy, CURLoption option, Value value) {
   if (curl_easy_setopt(easy, option, value) == CURLE_OUT_OF_MEMORY) throw std::bad_alloc();
 }
 
-bool equalsIgnoringCase(std::string_view a, std::string_view b) {
-  return a.size() == b.size() && curl_strnequal(a.data(), b.data(), a.size()) != 0;
-}
-
 bool startsWithScheme(std::string_view url, std::string_view scheme) {
-  return url.size() > scheme.size() && equalsIgnoringCase(url.substr(0, scheme.size()), scheme);
-}
-
-std::string_view trimmed(std::string_view text) {
-  auto first = text.find_first_not_of(" \t\r\n");
-  if (first == std::string_view::npos) return {};
-  return text.substr(first, text.find_last_not_of(" \t\r\n") - first + 1);
+  return url.size() > scheme.size() && equalsIgnoringASCIICase(url.substr(0, scheme.size()), scheme);
 }
 
 Kind kindOf(CURLcode code) {
@@ -192,7 +184,7 @@ void HTTPTransfer::setHeaders(const HTTPRequest& request) {
   bool hasType = false;
   for (const auto& [name, value] : request.headers) {
     _lines.add(name, value);
-    hasType = hasType || equalsIgnoringCase(name, "Content-Type");
+    hasType = hasType || equalsIgnoringASCIICase(name, "Content-Type");
   }
   _lines.suppress("Expect");
   if (!hasType) _lines.suppress("Content-Type");

@@ -10,12 +10,6 @@ namespace vesk {
 
 namespace {
 
-// A suite's name becomes a file's name: it must not lead anywhere else.
-bool isPlainName(std::string_view suite) {
-  return !suite.empty() && suite.size() <= 128 && suite.front() != '.' &&
-         suite.find('/') == std::string_view::npos && suite.find('\0') == std::string_view::npos;
-}
-
 std::optional<std::string> userConfigurationDirectory() {
   const char* config = std::getenv("XDG_CONFIG_HOME");
   if (config && config[0] == '/') return std::string(config);
@@ -63,7 +57,7 @@ std::string decimal(double number) {
 }  // namespace
 
 PreferencesSuite::PreferencesSuite(std::string_view suite) {
-  if (!isPlainName(suite)) return;
+  if (suite.size() > 128 || !isPlainFileName(suite)) return;
   _system = readSuite("/etc", suite);
   if (auto user = userConfigurationDirectory()) _user = readSuite(*user, suite);
 }

@@ -17,10 +17,6 @@ namespace {
 
 constexpr std::size_t kMaximumProfile = std::size_t{64} << 10;
 
-bool isPlainName(std::string_view name) {
-  return !name.empty() && name.front() != '.' && name.find('/') == std::string_view::npos;
-}
-
 std::optional<std::string> enter(const SandboxProfile& profile) {
   if (auto error = makeDirectories(profile.paths)) return error;
   if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) {
@@ -33,7 +29,7 @@ std::optional<std::string> enter(const SandboxProfile& profile) {
 }  // namespace
 
 std::optional<std::string> enterSandbox(std::string_view profileName) {
-  if (!isPlainName(profileName)) return "\"" + std::string(profileName) + "\" is no name of a profile";
+  if (!isPlainFileName(profileName)) return "\"" + std::string(profileName) + "\" is no name of a profile";
   std::string path = pathUnderRoot("/usr/share/veskreporting/sandbox/" + std::string(profileName) + ".toml");
   SmallFile file = readSmallFile(path, kMaximumProfile);
   if (!file.bytes) return path + ": " + (file.missing ? "no such file" : file.error);

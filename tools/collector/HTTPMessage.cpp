@@ -1,18 +1,15 @@
 #include "tools/collector/HTTPMessage.h"
 
-#include <strings.h>
 #include <zlib.h>
 
 #include <algorithm>
 #include <array>
 
+#include "platform/text/ASCII.h"
+
 namespace vesk {
 
 namespace {
-
-bool equalIgnoringCase(std::string_view a, std::string_view b) {
-  return a.size() == b.size() && ::strncasecmp(a.data(), b.data(), a.size()) == 0;
-}
 
 std::string_view reasonOf(unsigned status) {
   struct Reason {
@@ -84,7 +81,7 @@ class Inflater {
 
 std::optional<std::string_view> findHeader(const HTTPHeaderList& headers, std::string_view name) {
   for (const auto& [key, value] : headers)
-    if (equalIgnoringCase(key, name)) return value;
+    if (equalsIgnoringASCIICase(key, name)) return value;
   return std::nullopt;
 }
 
@@ -106,12 +103,12 @@ std::optional<std::string_view> HTTPReceived::query(std::string_view name) const
 
 HTTPReceived::Decoded HTTPReceived::decodedBody(std::size_t limit) const {
   auto encoding = header("Content-Encoding");
-  if (!encoding || encoding->empty() || equalIgnoringCase(*encoding, "identity")) {
+  if (!encoding || encoding->empty() || equalsIgnoringASCIICase(*encoding, "identity")) {
     if (body.size() > limit)
       return {std::nullopt, "the body has more than " + std::to_string(limit) + " bytes"};
     return {body, {}};
   }
-  if (!equalIgnoringCase(*encoding, "gzip"))
+  if (!equalsIgnoringASCIICase(*encoding, "gzip"))
     return {std::nullopt, "Content-Encoding is neither gzip nor absent: " + std::string(*encoding)};
   return Inflater().run(body, limit);
 }

@@ -2,7 +2,7 @@
 
 #include <stdexcept>
 
-#include "platform/files/FileURL.h"
+#include "platform/text/PercentCode.h"
 
 namespace vesk {
 
