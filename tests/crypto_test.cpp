@@ -74,11 +74,11 @@ TEST(UUID, IsRandomVersionFour) {
     auto text = uuidText(makeUUID());
     ASSERT_EQ(text.size(), 36u);
     EXPECT_EQ(text[14], '4');
-    EXPECT_NE(std::string("89AB").find(text[19]), std::string::npos);
+    EXPECT_NE(std::string("89ab").find(text[19]), std::string::npos);
     EXPECT_TRUE(seen.insert(text).second);
   }
   EXPECT_EQ(uuidText({0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 255}),
-            "00010203-0405-0607-0809-0A0B0C0D0EFF");
+            "00010203-0405-0607-0809-0a0b0c0d0eff");
 }
 
 TEST(RSAPublicKey, VerifiesItsSignatureFromEitherForm) {

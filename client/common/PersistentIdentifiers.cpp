@@ -1,7 +1,6 @@
 #include "client/common/PersistentIdentifiers.h"
 
 #include <fcntl.h>
-#include <sys/random.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -14,6 +13,7 @@
 #include <string_view>
 #include <system_error>
 
+#include "platform/crypto/UUID.h"
 #include "platform/files/FileDescriptor.h"
 #include "platform/files/FileLock.h"
 #include "platform/files/RootPrefix.h"
@@ -28,24 +28,6 @@ namespace {
 constexpr std::size_t kMaximumFile = 4096;
 constexpr char kRespecting[] = "respects_consent";
 constexpr char kOverriding[] = "overrides_consent";
-
-// A random UUID (version 4).
-std::string makeIdentifier() {
-  unsigned char bytes[16];
-  if (::getrandom(bytes, sizeof bytes, 0) != static_cast<ssize_t>(sizeof bytes)) {
-    throw std::system_error(errno, std::generic_category(), "getrandom");
-  }
-  bytes[6] = static_cast<unsigned char>((bytes[6] & 0x0f) | 0x40);
-  bytes[8] = static_cast<unsigned char>((bytes[8] & 0x3f) | 0x80);
-  std::string text;
-  for (std::size_t i = 0; i < sizeof bytes; ++i) {
-    if (i == 4 || i == 6 || i == 8 || i == 10) text += '-';
-    char digits[3];
-    std::snprintf(digits, sizeof digits, "%02x", bytes[i]);
-    text += digits;
-  }
-  return text;
-}
 
 bool isIdentifier(std::string_view text) {
   if (text.size() != 36) return false;
@@ -147,7 +129,9 @@ std::optional<PersistentIdentifiers::Pair> PersistentIdentifiers::parse(const st
   return pair;
 }
 
-PersistentIdentifiers::Pair PersistentIdentifiers::fresh() { return {makeIdentifier(), makeIdentifier()}; }
+PersistentIdentifiers::Pair PersistentIdentifiers::fresh() {
+  return {uuidText(makeUUID()), uuidText(makeUUID())};
+}
 
 std::string VeskReporting::getPersistentIdentifierForDNU(bool respectsConsent) noexcept {
   try {
