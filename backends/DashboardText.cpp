@@ -4,7 +4,7 @@
 #include <cstring>
 #include <vector>
 
-#include "platform/preferences/PreferencesSuite.h"
+#include "platform/values/Conversions.h"
 
 namespace vesk {
 

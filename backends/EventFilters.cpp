@@ -3,8 +3,8 @@
 #include <algorithm>
 
 #include "backends/VeskReportingBackend.h"
-#include "platform/preferences/PreferencesSuite.h"
 #include "platform/unicode/Unicode.h"
+#include "platform/values/Conversions.h"
 #include "storebag/StorebagProfile.h"
 
 namespace vesk {

@@ -6,6 +6,7 @@
 #include "backends/HTTPSPostBackend.h"
 #include "backends/SenderCodes.h"
 #include "platform/device/DeviceInformation.h"
+#include "platform/values/Conversions.h"
 #include "storebag/StorebagNaming.h"
 #include "util/ReportingdUtil.h"
 

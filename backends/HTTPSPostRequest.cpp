@@ -8,6 +8,7 @@
 #include "backends/SenderCodes.h"
 #include "platform/json/JSONWriter.h"
 #include "platform/log/SystemLog.h"
+#include "platform/values/Conversions.h"
 #include "util/Gzip.h"
 #include "util/ReportingdUtil.h"
 

@@ -2,8 +2,6 @@
 
 #include <VeskReporting/VeskReportingKeys.h>
 
-#include <cstdlib>
-
 #include "backends/DashboardBackend.h"
 #include "backends/HTTPSPostBackend.h"
 #include "backends/KilnarBackend.h"
@@ -12,6 +10,7 @@
 #include "platform/crypto/Digest.h"
 #include "platform/log/SystemLog.h"
 #include "platform/text/ASCII.h"
+#include "platform/values/Conversions.h"
 #include "util/ReportingdUtil.h"
 #include "util/SamplingDraw.h"
 
@@ -24,9 +23,7 @@ std::optional<Text> textFrom(const std::optional<std::string>& text) {
   return Text(*text);
 }
 
-std::uint8_t versionPiece(std::string_view piece) {
-  return static_cast<std::uint8_t>(std::strtol(std::string(piece).c_str(), nullptr, 10));
-}
+std::uint8_t versionPiece(std::string_view piece) { return static_cast<std::uint8_t>(leadingInteger(piece)); }
 
 }  // namespace
 

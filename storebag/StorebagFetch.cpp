@@ -9,6 +9,7 @@
 #include "platform/crypto/RSAPublicKey.h"
 #include "platform/log/SystemLog.h"
 #include "platform/plist/PropertyList.h"
+#include "platform/values/Conversions.h"
 #include "storebag/StorebagFallback.h"
 #include "storebag/StorebagNaming.h"
 #include "storebag/StorebagProfile.h"
@@ -22,20 +23,6 @@ constexpr std::chrono::seconds kTimeout{15};
 constexpr std::int32_t kLongestAge = 86400;  // seconds
 constexpr std::string_view kFallbackName = "palvo";
 constexpr std::string_view kStorebag = "storebag";  // stands for the backend in lines about its own entries
-
-/// The integer at the start of `text`, behind white space; held inside 32 bits.
-std::int32_t leadingInteger(std::string_view text) {
-  text.remove_prefix(std::min(text.find_first_not_of(" \t\n\v\f\r"), text.size()));
-  bool negative = text.starts_with('-');
-  if (negative || text.starts_with('+')) text.remove_prefix(1);
-  std::int64_t value = 0;
-  for (char c : text) {
-    if (c < '0' || c > '9') break;
-    value = std::min<std::int64_t>(value * 10 + (c - '0'), std::int64_t{1} << 31);
-  }
-  if (negative) value = -value;
-  return static_cast<std::int32_t>(std::min<std::int64_t>(value, std::numeric_limits<std::int32_t>::max()));
-}
 
 HTTPRequest requestFor(const std::string& url, const std::optional<std::string>* lastModified) {
   HTTPRequest request;
@@ -106,7 +93,11 @@ std::int32_t maxAgeFromCacheControl(std::optional<std::string_view> cacheControl
   for (bool found = false;;) {
     auto end = rest.find_first_of("= ");
     auto token = rest.substr(0, end);
-    if (found) return leadingInteger(token);
+    if (found) {
+      using Age = std::numeric_limits<std::int32_t>;
+      return static_cast<std::int32_t>(
+          std::clamp<std::int64_t>(leadingInteger(token), Age::min(), Age::max()));
+    }
     found = token == "max-age";
     if (end == std::string_view::npos) return kLongestAge;
     rest.remove_prefix(end + 1);

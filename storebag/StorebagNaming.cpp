@@ -5,6 +5,7 @@
 
 #include "platform/log/SystemLog.h"
 #include "platform/preferences/PreferencesSuite.h"
+#include "platform/values/Conversions.h"
 #include "util/ReportingdUtil.h"
 
 namespace vesk {

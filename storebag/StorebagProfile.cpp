@@ -1,7 +1,7 @@
 #include "storebag/StorebagProfile.h"
 
 #include "platform/log/SystemLog.h"
-#include "platform/preferences/PreferencesSuite.h"
+#include "platform/values/Conversions.h"
 
 namespace vesk {
 

@@ -6,6 +6,7 @@
 #include <cstdlib>
 
 #include "platform/preferences/TomlFile.h"
+#include "platform/values/Conversions.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/TestRoot.h"
 

@@ -1,7 +1,6 @@
 #include "util/ReportingdUtil.h"
 
 #include <algorithm>
-#include <cmath>
 #include <cstring>
 
 #include "client/include/VeskReporting/VeskReportingKeys.h"
@@ -56,7 +55,5 @@ std::string correlationKeyForUserInfo(const Dictionary& userInfo) {
 double secondsFromTimeval(const timeval& time) noexcept {
   return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_usec) / 1'000'000.0;
 }
-
-double finiteOrMinusOne(double value) noexcept { return std::isfinite(value) ? value : -1.0; }
 
 }  // namespace vesk

@@ -34,7 +34,4 @@ std::string correlationKeyForUserInfo(const Dictionary& userInfo);
 /// Seconds with microseconds.
 double secondsFromTimeval(const timeval& time) noexcept;
 
-/// -1 for what is NaN or infinite, else `value`: JSON has no other numbers.
-double finiteOrMinusOne(double value) noexcept;
-
 }  // namespace vesk

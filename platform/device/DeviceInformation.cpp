@@ -17,6 +17,7 @@
 #include "platform/sync/Mutex.h"
 #include "platform/text/ASCII.h"
 #include "platform/unicode/Unicode.h"
+#include "platform/values/Conversions.h"
 
 namespace vesk {
 

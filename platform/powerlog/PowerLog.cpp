@@ -1,6 +1,5 @@
 #include "platform/powerlog/PowerLog.h"
 
-#include <cmath>
 #include <exception>
 #include <utility>
 
@@ -8,14 +7,13 @@
 #include "platform/json/JSONWriter.h"
 #include "platform/log/SystemLog.h"
 #include "platform/powerlog/PowerLogStore.h"
+#include "platform/values/Conversions.h"
 
 namespace vesk {
 
 namespace {
 
 Value forJSON(const Value& value);
-
-double forJSON(double number) { return std::isfinite(number) ? number : -1; }
 
 Dictionary forJSON(const Dictionary& dictionary) {
   MutableDictionary result;
@@ -25,8 +23,8 @@ Dictionary forJSON(const Dictionary& dictionary) {
 }
 
 Value forJSON(const Value& value) {
-  if (const double* number = value.real()) return forJSON(*number);
-  if (const Date* date = value.date()) return forJSON(date->secondsSince1970);
+  if (const double* number = value.real()) return finiteOrMinusOne(*number);
+  if (const Date* date = value.date()) return finiteOrMinusOne(date->secondsSince1970);
   if (const Bytes* bytes = value.bytes()) return base64Encode(bytes->view());
   if (const Dictionary* dictionary = value.dictionary()) return forJSON(*dictionary);
   const List* list = value.list();

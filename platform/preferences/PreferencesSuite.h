@@ -29,12 +29,4 @@ class PreferencesSuite {
   Dictionary _system;
 };
 
-/// A setting as text: a text unchanged, a number as decimal text (booleans are 1 and 0), nothing for any
-/// other kind.
-std::optional<std::string> stringForm(const Value& value);
-
-/// A setting as integer: a number as such, a text by its leading integer (0 when there is none), 0 for any
-/// other kind. The result holds to the range of 64 bits.
-std::int64_t integerForm(const Value& value);
-
 }  // namespace vesk

@@ -7,7 +7,7 @@
 
 #include "client/include/VeskReporting/VeskReportingKeys.h"
 #include "platform/net/UDPSocket.h"
-#include "platform/preferences/PreferencesSuite.h"
+#include "platform/values/Conversions.h"
 
 namespace vesk {
 
