@@ -6,8 +6,6 @@
 #include <cstdio>
 #include <cstring>
 
-#include "client/common/Resources.h"
-
 namespace vesk {
 
 namespace {

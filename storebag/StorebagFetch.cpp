@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <chrono>
 #include <limits>
-#include <utility>
 
 #include "platform/crypto/Base64.h"
 #include "platform/crypto/RSAPublicKey.h"

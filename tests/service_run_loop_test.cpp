@@ -118,8 +118,6 @@ TEST_F(RunLoopTest, TellsTheManagerHowItGoes) {
   EXPECT_EQ(std::getenv("WATCHDOG_USEC"), nullptr);
   service.notifyReady();
   EXPECT_EQ(notification(), "READY=1");
-  service.notifyStatus("2 sessions");
-  EXPECT_EQ(notification(), "STATUS=2 sessions");
   RunLoop loop({}, _busy, service);
   auto outcome = std::async(std::launch::async, [&] { return loop.run(); });
   for (int ping = 0; ping < 3; ++ping) EXPECT_EQ(notification(), "WATCHDOG=1");

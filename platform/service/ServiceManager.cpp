@@ -39,10 +39,6 @@ void ServiceManager::notifyReady() const noexcept { sd_notify(0, "READY=1"); }
 
 void ServiceManager::notifyStopping() const noexcept { sd_notify(0, "STOPPING=1"); }
 
-void ServiceManager::notifyStatus(std::string_view status) const noexcept {
-  sd_notifyf(0, "STATUS=%.*s", static_cast<int>(status.size()), status.data());
-}
-
 void ServiceManager::pingWatchdog() const noexcept { sd_notify(0, "WATCHDOG=1"); }
 
 }  // namespace vesk

@@ -3,14 +3,13 @@
 
 #include <chrono>
 #include <optional>
-#include <string_view>
 #include <utility>
 
 #include "platform/files/FileDescriptor.h"
 
 namespace vesk {
 
-/// Speaks the service manager's protocol: inherited sockets, readiness, status, watchdog. Without a manager
+/// Speaks the service manager's protocol: inherited sockets, readiness, watchdog. Without a manager
 /// every notification does nothing. Construct it before the process has other threads; the notifications are
 /// thread-safe.
 class ServiceManager {
@@ -26,8 +25,6 @@ class ServiceManager {
 
   void notifyReady() const noexcept;
   void notifyStopping() const noexcept;
-  /// One line for people, shown by the manager's status command.
-  void notifyStatus(std::string_view status) const noexcept;
 
   /// How often the manager wants to hear from us; nothing when it does not watch.
   std::optional<std::chrono::milliseconds> watchdogInterval() const noexcept { return _watchdogInterval; }

@@ -1,7 +1,6 @@
 // What the collector says to the person who runs it.
 #pragma once
 
-#include <string>
 #include <string_view>
 
 #include "platform/sync/Mutex.h"

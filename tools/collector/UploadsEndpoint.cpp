@@ -1,6 +1,6 @@
 #include "tools/collector/UploadsEndpoint.h"
 
-#include <stdexcept>
+#include <exception>
 
 #include "platform/text/PercentCode.h"
 
