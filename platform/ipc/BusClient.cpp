@@ -7,7 +7,6 @@
 #include <climits>
 #include <deque>
 #include <list>
-#include <system_error>
 
 #include "platform/ipc/BusCodec.h"
 #include "platform/ipc/BusHandles.h"
@@ -29,10 +28,6 @@ constexpr int kMaximumSteps = 64;
 
 // The wire adds less than three times as much to what counts as content.
 constexpr std::size_t kSurelyShort = OneWayEncoder::kMaximumMessage / 4;
-
-void check(int result, const char* what) {
-  if (result < 0) throw std::system_error(-result, std::generic_category(), what);
-}
 
 struct SlotReleaser {
   void operator()(sd_bus_slot* slot) const noexcept { sd_bus_slot_unref(slot); }
@@ -84,7 +79,7 @@ class BusClient::Implementation {
     std::chrono::milliseconds timeout;
   };
 
-  BusMessageHandle encode(const IPCOutgoingCall& call, bool expectReply, CodecResult& result) const;
+  CodecResult addArguments(sd_bus_message* message, const IPCOutgoingCall& call) const;
   bool write(sd_bus_message* message, PendingList::iterator pending, std::chrono::milliseconds timeout);
   void sendDeferred();
   std::size_t queuedByBus() const;
@@ -106,44 +101,27 @@ BusClient::Implementation::Implementation(Options options)
     : _objectPath(std::move(options.objectPath)),
       _replies(std::make_shared<BusReplies>(nullptr)),
       _router(_objectPath, "client", _replies, {}),
+      _bus(newBus(options.connected ? std::move(options.connected) : connectUnixSocket(options.socketPath))),
       _outbox(_objectPath) {
-  FileDescriptor socket =
-      options.connected ? std::move(options.connected) : connectUnixSocket(options.socketPath);
-  sd_bus* raw = nullptr;
-  check(sd_bus_new(&raw), "sd_bus_new");
-  _bus.reset(raw);
-  check(sd_bus_set_fd(raw, socket.get(), socket.get()), "sd_bus_set_fd");
-  static_cast<void>(socket.release());
-  _replies->open(raw);
-  check(sd_bus_negotiate_fds(raw, 1), "sd_bus_negotiate_fds");
-  check(sd_bus_start(raw), "sd_bus_start");
+  _replies->open(_bus.get());
+  checkBus(sd_bus_start(_bus.get()), "sd_bus_start");
 }
 
-BusMessageHandle BusClient::Implementation::encode(const IPCOutgoingCall& call, bool expectReply,
-                                                   CodecResult& result) const {
-  sd_bus_message* raw = nullptr;
-  if (sd_bus_message_new_method_call(_bus.get(), &raw, nullptr, _objectPath.c_str(), call.interfaceName,
-                                     call.member) < 0) {
-    return {};
-  }
-  BusMessageHandle message(raw);
-  if (!expectReply) sd_bus_message_set_expect_reply(raw, 0);
-  BusEncoder encoder(raw);
-  for (const auto& argument : call.arguments) encoder.append(argument);
-  result = encoder.result();
+CodecResult BusClient::Implementation::addArguments(sd_bus_message* message,
+                                                    const IPCOutgoingCall& call) const {
+  BusEncoder encoder(message);
+  if (!encoder.append(call.arguments)) return encoder.result();
   // The daemon ends the connection of whoever sends it a message that is too long.
-  if (encoder.ok() && encoder.content() > kSurelyShort && OneWayEncoder(_objectPath).isTooLong(call)) {
-    result = CodecResult::LimitExceeded;
-  }
-  return message;
+  bool isTooLong = encoder.content() > kSurelyShort && OneWayEncoder(_objectPath).isTooLong(call);
+  return isTooLong ? CodecResult::LimitExceeded : CodecResult::Ok;
 }
 
 BusClient::SendResult BusClient::Implementation::send(const IPCOutgoingCall& call, AnswerHandler handler,
                                                       std::chrono::milliseconds timeout) {
   if (!_bus || sd_bus_is_open(_bus.get()) <= 0) return SendResult::Disconnected;
-  CodecResult result = CodecResult::Ok;
-  BusMessageHandle message = encode(call, static_cast<bool>(handler), result);
+  BusMessageHandle message = newCall(_bus.get(), _objectPath, call, static_cast<bool>(handler));
   if (!message) return SendResult::Disconnected;
+  CodecResult result = addArguments(message.get(), call);
   if (result == CodecResult::OutOfResources) return SendResult::OutOfResources;
   if (result != CodecResult::Ok) return SendResult::Refused;
 

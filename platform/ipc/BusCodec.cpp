@@ -5,15 +5,11 @@
 #include <cerrno>
 #include <cstring>
 
+#include "platform/ipc/WireFormat.h"
+
 namespace vesk {
 
 namespace {
-
-// sd-bus refuses more open containers than this (a dictionary in a dictionary is three: array, entry,
-// variant) with the same error as for broken bytes; counted here so that the caller is told what was wrong.
-constexpr std::size_t kMaximumContainers = 127;
-
-constexpr std::size_t kNodeContent = 8;
 
 CodecResult resultFor(int error) noexcept {
   switch (error) {
@@ -61,6 +57,7 @@ bool BusDecoder::count(std::size_t content) {
 
 bool BusDecoder::enter(char type, const char* contents) {
   if (!ok()) return false;
+  // Counted here so that the caller is told what was wrong.
   if (_containers >= kMaximumContainers) return fail(CodecResult::LimitExceeded);
   int r = sd_bus_message_enter_container(_message, type, contents);
   if (r <= 0) return failWith(r == 0 ? -ENXIO : r);

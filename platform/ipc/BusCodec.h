@@ -93,7 +93,7 @@ class BusEncoder {
   explicit BusEncoder(sd_bus_message* message, CodecLimits limits = {}) noexcept
       : _message(message), _limits(limits) {}
 
-  bool append(const IPCArgument& argument);
+  bool append(const std::vector<IPCArgument>& arguments);
   bool append(bool value);
   bool append(std::uint16_t value);
   bool append(double value);

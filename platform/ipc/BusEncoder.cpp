@@ -5,14 +5,9 @@
 
 #include "platform/ipc/BusCodec.h"
 #include "platform/ipc/SendableText.h"
+#include "platform/ipc/WireFormat.h"
 
 namespace vesk {
-
-namespace {
-
-constexpr std::size_t kNodeContent = 8;
-
-}  // namespace
 
 bool BusEncoder::fail(CodecResult result) noexcept {
   if (ok()) _result = result;
@@ -55,8 +50,11 @@ bool BusEncoder::variant(const char* contents, char type, const void* value) {
   return open(SD_BUS_TYPE_VARIANT, contents) && basic(type, value) && close();
 }
 
-bool BusEncoder::append(const IPCArgument& argument) {
-  return std::visit([this](const auto& value) { return append(value); }, argument);
+bool BusEncoder::append(const std::vector<IPCArgument>& arguments) {
+  for (const auto& argument : arguments) {
+    if (!std::visit([this](const auto& value) { return append(value); }, argument)) return false;
+  }
+  return true;
 }
 
 bool BusEncoder::append(bool value) {

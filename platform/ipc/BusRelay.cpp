@@ -6,6 +6,8 @@
 #include <cstring>
 #include <system_error>
 
+#include "platform/ipc/WireFormat.h"
+
 namespace vesk {
 
 namespace {
@@ -83,7 +85,7 @@ BusRelay::Outcome BusRelay::authenticate(std::vector<FileDescriptor> descriptors
   if (!write(result.passedOn)) return refuse("internal failure");
   keepFrom(result.taken);
   _hasBegun = result.verdict == AuthenticationGate::Verdict::Begun;
-  _cameWithBegin = _hasBegun && _held >= MessageGate::kFixedHeader;
+  _cameWithBegin = _hasBegun && _held >= kFixedHeader;
   if (!descriptors.empty()) {
     // They may belong to a message that was read together with BEGIN.
     if (!_hasBegun || _held == 0) return refuse("a descriptor before authentication");
@@ -96,7 +98,7 @@ BusRelay::Outcome BusRelay::authenticate(std::vector<FileDescriptor> descriptors
 std::size_t BusRelay::serveOneWayCalls() {
   std::size_t served = 0;
   // What has been handed to sd-bus before has been processed, so the order is kept.
-  while (!_messages.insideMessage() && _held - served >= MessageGate::kFixedHeader) {
+  while (!_messages.insideMessage() && _held - served >= kFixedHeader) {
     auto rest = held().substr(served);
     auto size = MessageGate::messageSize(rest);
     if (!size || *size > rest.size() || !OneWayDecoder::mayDecode(rest, *size)) break;
@@ -108,7 +110,7 @@ std::size_t BusRelay::serveOneWayCalls() {
 
 /// Whether a call is held whose end has not come yet, and which may be served without sd-bus then.
 bool BusRelay::waitsForOneWayCall() const {
-  if (_messages.insideMessage() || _held < MessageGate::kFixedHeader) return false;
+  if (_messages.insideMessage() || _held < kFixedHeader) return false;
   auto size = MessageGate::messageSize(held());
   return size && *size > _held && OneWayDecoder::mayDecode(held(), *size);
 }

@@ -22,8 +22,7 @@ void BusReplies::send(sd_bus_message* call, const std::vector<IPCArgument>& argu
   if (sd_bus_message_new_method_return(call, &raw) < 0) return;
   BusMessageHandle reply(raw);
   BusEncoder encoder(raw);
-  for (const auto& argument : arguments) encoder.append(argument);
-  if (!encoder.ok()) {
+  if (!encoder.append(arguments)) {
     VESK_LOG_ERROR("ipc: The answer to %s can't be sent: %s", sd_bus_message_get_member(call),
                    describe(encoder.result()));
     sendError(call, SD_BUS_ERROR_FAILED, "The answer can't be sent");

@@ -5,7 +5,6 @@
 #include <sys/socket.h>
 
 #include <algorithm>
-#include <system_error>
 
 #include "platform/ipc/BusCodec.h"
 #include "platform/log/SystemLog.h"
@@ -16,10 +15,6 @@ namespace {
 
 // Of answers and calls, inside the relay; the client's socket holds as much again.
 constexpr int kUnreadBytes = 128 * 1024;
-
-void check(int result, const char* what) {
-  if (result < 0) throw std::system_error(-result, std::generic_category(), what);
-}
 
 /// Milliseconds for poll() until `deadline`, rounded up so that it has passed when poll() returns.
 int untilDeadline(std::chrono::steady_clock::time_point deadline) {
@@ -35,16 +30,12 @@ int countMessage(sd_bus_message*, void* count, sd_bus_error*) {
 
 /// A server's bus on the inner end of a relay.
 BusHandle openBus(FileDescriptor socket) {
-  sd_bus* raw = nullptr;
-  check(sd_bus_new(&raw), "sd_bus_new");
-  BusHandle bus(raw);
-  check(sd_bus_set_fd(raw, socket.get(), socket.get()), "sd_bus_set_fd");
-  int inner = socket.release();
+  const int inner = socket.get();
+  BusHandle bus = newBus(std::move(socket));
   sd_id128_t identity{};
-  check(sd_id128_randomize(&identity), "sd_id128_randomize");
-  check(sd_bus_set_server(raw, 1, identity), "sd_bus_set_server");
-  check(sd_bus_negotiate_fds(raw, 1), "sd_bus_negotiate_fds");
-  check(sd_bus_start(raw), "sd_bus_start");
+  checkBus(sd_id128_randomize(&identity), "sd_id128_randomize");
+  checkBus(sd_bus_set_server(bus.get(), 1, identity), "sd_bus_set_server");
+  checkBus(sd_bus_start(bus.get()), "sd_bus_start");
   // sd-bus has asked for 8 MiB, which a client that reads nothing would fill.
   ::setsockopt(inner, SOL_SOCKET, SO_SNDBUF, &kUnreadBytes, sizeof kUnreadBytes);
   return bus;
@@ -65,7 +56,7 @@ ConnectionLoop::ConnectionLoop(int socket, const IPCPeer& peer, const std::strin
       _relay(socket, peer.user, settings.maximumMessage + kMessageOverhead,
              [this](std::string_view message) { return _router.routeOneWay(message); }),
       _bus(openBus(_relay.takeInnerEnd())) {
-  check(sd_bus_add_filter(_bus.get(), nullptr, countMessage, &_messagesSeen), "sd_bus_add_filter");
+  checkBus(sd_bus_add_filter(_bus.get(), nullptr, countMessage, &_messagesSeen), "sd_bus_add_filter");
   _replies.open(_bus.get());
 }
 
@@ -109,21 +100,15 @@ bool ConnectionLoop::sendOutgoing() {
 
 /// False when it is lost.
 bool ConnectionLoop::sendCall(const IPCOutgoingCall& call) {
-  sd_bus_message* raw = nullptr;
-  if (sd_bus_message_new_method_call(_bus.get(), &raw, nullptr, _settings.objectPath.c_str(),
-                                     call.interfaceName, call.member) < 0) {
-    return false;  // the bus has ended, which `process` will tell
-  }
-  BusMessageHandle message(raw);
-  sd_bus_message_set_expect_reply(raw, 0);
-  BusEncoder encoder(raw);
-  for (const auto& argument : call.arguments) encoder.append(argument);
-  if (!encoder.ok()) {
+  BusMessageHandle message = newCall(_bus.get(), _settings.objectPath, call, false);
+  if (!message) return false;  // the bus has ended, which `process` will tell
+  BusEncoder encoder(message.get());
+  if (!encoder.append(call.arguments)) {
     VESK_LOG_WARNING("ipc: %s: The call %s can't be sent: %s", _name.c_str(), call.member,
                      describe(encoder.result()));
     return false;
   }
-  return sd_bus_send(_bus.get(), raw, nullptr) >= 0;
+  return sd_bus_send(_bus.get(), message.get(), nullptr) >= 0;
 }
 
 void ConnectionLoop::wait(Time deadline) {

@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+#include "platform/ipc/WireFormat.h"
+
 namespace vesk {
 
 namespace {
@@ -17,15 +19,13 @@ std::uint32_t numberAt(std::string_view header, std::size_t at, bool bigEndian) 
 
 }  // namespace
 
-/// A header is: byte order, type, flags, version 1, size of the body, serial number (never 0), size of the
-/// array of header fields.
 std::optional<std::uint64_t> MessageGate::messageSize(std::string_view header) noexcept {
-  bool bigEndian = header[0] == 'B';
-  if (!bigEndian && header[0] != 'l') return std::nullopt;
-  if (header[1] == 0 || header[3] != 1) return std::nullopt;
-  if (numberAt(header, 8, bigEndian) == 0) return std::nullopt;
-  std::uint64_t fields = numberAt(header, 12, bigEndian);
-  std::uint64_t body = numberAt(header, 4, bigEndian);
+  bool bigEndian = header[0] == kBigEndian;
+  if (!bigEndian && header[0] != kLittleEndian) return std::nullopt;
+  if (header[1] == 0 || header[3] != kProtocolVersion) return std::nullopt;
+  if (numberAt(header, kSerialAt, bigEndian) == 0) return std::nullopt;
+  std::uint64_t fields = numberAt(header, kFieldsSizeAt, bigEndian);
+  std::uint64_t body = numberAt(header, kBodySizeAt, bigEndian);
   return kFixedHeader + (fields + 7) / 8 * 8 + body;
 }
 

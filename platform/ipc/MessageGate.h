@@ -21,9 +21,6 @@ class MessageGate {
     std::optional<std::size_t> lastStart;  ///< where the last message starts among them
   };
 
-  /// The part of a header that has a fixed size and tells the message's.
-  static constexpr std::size_t kFixedHeader = 16;
-
   explicit MessageGate(std::size_t maximumMessage) : _maximumMessage(maximumMessage) {}
 
   /// Size of the message whose first kFixedHeader bytes these are; nothing when they begin none.

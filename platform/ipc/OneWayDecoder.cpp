@@ -1,28 +1,21 @@
 #include "platform/ipc/OneWayDecoder.h"
 
 #include <algorithm>
-#include <bit>
 #include <cctype>
 #include <cstring>
 #include <memory>
 
-#include "platform/ipc/MessageGate.h"
 #include "platform/ipc/SendableText.h"
+#include "platform/ipc/WireFormat.h"
 
 namespace vesk {
 
 namespace {
 
-static_assert(std::endian::native == std::endian::little, "messages are read in the machine's own order");
-
-constexpr std::size_t kFieldsAt = 12;
 // Lists and dictionaries inside one another; what is deeper is rare.
 constexpr std::size_t kDeepest = 16;
-constexpr std::size_t kNodeContent = 8;
 // Of a body that all texts of a call share. One short text keeps all of it, which has to stay small.
 constexpr std::size_t kMostShared = 1024;
-
-enum Field : std::uint8_t { kPath = 1, kInterface = 2, kMember = 3, kSignature = 8 };
 
 /// Reads values under D-Bus's alignment, which counts from the first byte. Every function returns whether it
 /// found what it looks for, whole and by the rules.
@@ -256,24 +249,24 @@ bool isMemberName(std::string_view name) {
 }  // namespace
 
 bool OneWayDecoder::mayDecode(std::string_view header, std::uint64_t size) noexcept {
-  // Little-endian, a method call, without an answer.
-  return header[0] == 'l' && header[1] == 1 && header[2] == 1 && size <= kMaximumMessage;
+  return header[0] == kLittleEndian && header[1] == kMethodCall && header[2] == kNoReplyExpected &&
+         size <= kMaximumMessage;
 }
 
 /// The names, into the fields of this; nothing new when the header is the last one's.
 bool OneWayDecoder::readHeader(std::string_view message) {
   std::uint32_t bodySize = 0;
-  std::memcpy(&bodySize, message.data() + 4, sizeof bodySize);
-  if (!_header.empty() && message.size() - kFieldsAt == _header.size() + bodySize &&
-      message.substr(kFieldsAt).starts_with(_header)) {
+  std::memcpy(&bodySize, message.data() + kBodySizeAt, sizeof bodySize);
+  if (!_header.empty() && message.size() - kFieldsSizeAt == _header.size() + bodySize &&
+      message.substr(kFieldsSizeAt).starts_with(_header)) {
     return true;
   }
   auto header = message.substr(0, message.size() - bodySize);
   std::uint32_t fieldsSize = 0;
-  std::memcpy(&fieldsSize, header.data() + kFieldsAt, sizeof fieldsSize);
-  const std::size_t fieldsEnd = MessageGate::kFixedHeader + fieldsSize;
+  std::memcpy(&fieldsSize, header.data() + kFieldsSizeAt, sizeof fieldsSize);
+  const std::size_t fieldsEnd = kFixedHeader + fieldsSize;
   // Fields are aligned as the whole message is, and that part begins at a multiple of 8.
-  Reader reader(header.substr(MessageGate::kFixedHeader, fieldsSize));
+  Reader reader(header.substr(kFixedHeader, fieldsSize));
   std::string_view path;
   std::string_view interfaceName;
   std::string_view member;
@@ -294,7 +287,7 @@ bool OneWayDecoder::readHeader(std::string_view message) {
   }
   if (header.find_first_not_of('\0', fieldsEnd) != header.npos) return false;
   if (path != _objectPath || !isMemberName(member)) return false;
-  _header = header.substr(kFieldsAt);
+  _header = header.substr(kFieldsSizeAt);
   _interfaceName = interfaceName;
   _member = member;
   _signature = signature;
@@ -303,7 +296,7 @@ bool OneWayDecoder::readHeader(std::string_view message) {
 
 std::optional<OneWayCall> OneWayDecoder::decode(std::string_view message) {
   if (!readHeader(message)) return std::nullopt;
-  auto body = message.substr(kFieldsAt + _header.size());
+  auto body = message.substr(kFieldsSizeAt + _header.size());
   std::shared_ptr<const char> owner;
   if (body.size() <= kMostShared) {
     auto copy = std::make_shared_for_overwrite<char[]>(body.size());

@@ -31,7 +31,7 @@ class OneWayDecoder {
   explicit OneWayDecoder(std::string objectPath, CodecLimits limits = {})
       : _objectPath(std::move(objectPath)), _limits(limits) {}
 
-  /// Whether a message of `size` bytes that begins with these (at least MessageGate::kFixedHeader of them)
+  /// Whether a message of `size` bytes that begins with these (at least the fixed part of its header)
   /// may be one to read here.
   static bool mayDecode(std::string_view header, std::uint64_t size) noexcept;
 

@@ -1,24 +1,15 @@
 #include "platform/ipc/OneWayEncoder.h"
 
-#include <bit>
 #include <cstring>
 #include <string_view>
 #include <type_traits>
 
 #include "platform/ipc/SendableText.h"
+#include "platform/ipc/WireFormat.h"
 
 namespace vesk {
 
 namespace {
-
-static_assert(std::endian::native == std::endian::little, "messages are written in the machine's own order");
-
-constexpr std::size_t kNodeContent = 8;
-constexpr std::size_t kBodyLengthAt = 4;
-constexpr std::size_t kSerialAt = 8;
-
-// sd-bus refuses more open containers, so its receiver would too.
-constexpr std::size_t kMaximumContainers = 127;
 
 /// Appends values under D-Bus's alignment, which counts from the start of the message.
 class Writer {
@@ -189,11 +180,9 @@ void Writer::add(const Value& value) {
 constexpr const char* kSignatures[] = {"b", "q", "d", "s", "a{sv}", "av", "aa{sv}", "as", "as", "aas", "ah"};
 static_assert(std::size(kSignatures) == std::variant_size_v<IPCArgument>);
 
-enum Field : char { kPath = 1, kInterface = 2, kMember = 3, kSignature = 8 };
-
-void addField(Writer& writer, Field field, const char* type, std::string_view value) {
+void addField(Writer& writer, HeaderField field, const char* type, std::string_view value) {
   writer.align(8);
-  writer.byte(field);
+  writer.byte(static_cast<char>(field));
   writer.signature(type);
   if (field == kSignature) {
     writer.signature(value);
@@ -213,8 +202,7 @@ const std::string& OneWayEncoder::headerFor(const IPCOutgoingCall& call, const s
   }
   Header header{call.interfaceName, call.member, signature, {}};
   Writer writer(header.bytes, _limits);
-  for (char byte : {'l', '\1', '\1', '\1'})
-    writer.byte(byte);              // little-endian, method call, no answer, version 1
+  for (char byte : {kLittleEndian, kMethodCall, kNoReplyExpected, kProtocolVersion}) writer.byte(byte);
   writer.number(std::uint32_t{0});  // body length
   writer.number(std::uint32_t{0});  // serial
   writer.number(std::uint32_t{0});  // length of the fields
@@ -258,7 +246,7 @@ CodecResult OneWayEncoder::appendTo(std::string& out, std::size_t start, const I
     return result;
   }
   auto length = static_cast<std::uint32_t>(out.size() - body);
-  std::memcpy(out.data() + start + kBodyLengthAt, &length, sizeof length);
+  std::memcpy(out.data() + start + kBodySizeAt, &length, sizeof length);
   std::memcpy(out.data() + start + kSerialAt, &serial, sizeof serial);
   return CodecResult::Ok;
 }

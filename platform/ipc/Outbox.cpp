@@ -3,12 +3,11 @@
 #include <utility>
 
 #include "platform/ipc/BusCodec.h"
+#include "platform/ipc/WireFormat.h"
 
 namespace vesk {
 
 namespace {
-
-constexpr std::size_t kNodeContent = 8;
 
 std::size_t contentOf(const Dictionary& dictionary);
 
