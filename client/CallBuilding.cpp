@@ -7,37 +7,10 @@
 #include <filesystem>
 #include <string_view>
 #include <system_error>
-#include <type_traits>
 
 namespace vesk {
 
 namespace {
-
-std::size_t contentOf(const std::string& text) noexcept { return text.size(); }
-std::size_t contentOf(const Dictionary& dictionary) noexcept { return approximateMemory(dictionary); }
-std::size_t contentOf(const List& list) noexcept {
-  std::size_t size = 0;
-  for (const Value& value : list) {
-    size += sizeof(Value);
-    if (const Text* text = value.text()) size += text->size();
-    if (const Bytes* bytes = value.bytes()) size += bytes->size();
-    if (const List* nested = value.list()) size += contentOf(*nested);
-    if (const Dictionary* nested = value.dictionary()) size += contentOf(*nested);
-  }
-  return size;
-}
-std::size_t contentOf(const std::vector<std::string>& texts) noexcept {
-  std::size_t size = 0;
-  for (const auto& text : texts) size += sizeof(text) + text.size();
-  return size;
-}
-template <class T>
-std::size_t contentOf(const std::optional<T>& value) noexcept {
-  return value ? contentOf(*value) : 0;
-}
-template <class T>
-requires std::is_scalar_v<T> || std::is_same_v<T, IPCDescriptor> std::size_t contentOf(const T&)
-noexcept { return 0; }
 
 std::string urlOf(const std::string& path) {
   constexpr char kDigits[] = "0123456789ABCDEF";
@@ -55,14 +28,6 @@ std::string urlOf(const std::string& path) {
 }
 
 }  // namespace
-
-std::size_t memoryOf(const ClientCall& call) noexcept {
-  std::size_t size = sizeof(ClientCall) + call.call.arguments.size() * sizeof(IPCArgument);
-  for (const IPCArgument& argument : call.call.arguments) {
-    size += std::visit([](const auto& value) { return contentOf(value); }, argument);
-  }
-  return size;
-}
 
 FileToUpload openToUpload(const std::string& path) {
   FileToUpload file;

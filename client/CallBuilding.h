@@ -6,11 +6,9 @@
 
 #include "client/ClientCall.h"
 #include "client/protocol/WireNames.h"
+#include "platform/ipc/CallSize.h"
 
 namespace vesk {
-
-/// Roughly the memory that `call` holds.
-std::size_t memoryOf(const ClientCall& call) noexcept;
 
 /// A one-way call of the daemon's object. Throws std::bad_alloc.
 template <class... Arguments>
@@ -20,7 +18,7 @@ ClientCall makeCall(const wire::Member& member, Arguments&&... arguments) {
   call.call.member = member.name;
   call.call.arguments.reserve(sizeof...(arguments));
   (call.call.arguments.emplace_back(std::forward<Arguments>(arguments)), ...);
-  call.memory = memoryOf(call);
+  call.memory = sizeof call - sizeof call.call + approximateMemory(call.call);
   return call;
 }
 
