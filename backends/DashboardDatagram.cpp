@@ -4,7 +4,7 @@
 #include <cstdio>
 
 #include "backends/SenderCodes.h"
-#include "platform/unicode/Unicode.h"
+#include "platform/unicode/UTF8.h"
 
 namespace vesk {
 

@@ -2,7 +2,7 @@
 #include "backends/DashboardBackend.h"
 #include "platform/log/SystemLog.h"
 #include "platform/plist/KeyedArchive.h"
-#include "platform/unicode/Unicode.h"
+#include "platform/unicode/UTF8.h"
 
 namespace vesk {
 

@@ -6,7 +6,7 @@
 #include "backends/UploadGate.h"
 #include "platform/ipc/ExtensionTokens.h"
 #include "platform/log/SystemLog.h"
-#include "platform/unicode/Unicode.h"
+#include "platform/unicode/UTF8.h"
 #include "storebag/StorebagProfile.h"
 #include "util/Gzip.h"
 #include "util/URLQuery.h"

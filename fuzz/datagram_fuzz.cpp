@@ -5,7 +5,7 @@
 
 #include "backends/DashboardDelivery.h"
 #include "backends/DashboardText.h"
-#include "platform/unicode/Unicode.h"
+#include "platform/unicode/UTF8.h"
 #include "tests/support/SimulatedQueues.h"
 #include "tools/collector/ReceivedDatagram.h"
 

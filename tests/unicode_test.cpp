@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include "platform/unicode/UTF8.h"
+
 namespace vesk {
 namespace {
 

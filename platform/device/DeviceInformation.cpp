@@ -16,6 +16,7 @@
 #include "platform/preferences/TomlFile.h"
 #include "platform/sync/Mutex.h"
 #include "platform/text/ASCII.h"
+#include "platform/unicode/UTF8.h"
 #include "platform/unicode/Unicode.h"
 #include "platform/values/Conversions.h"
 

@@ -4,8 +4,8 @@
 #include <cstring>
 
 #include "platform/ipc/BusCodec.h"
-#include "platform/ipc/SendableText.h"
 #include "platform/ipc/WireFormat.h"
+#include "platform/unicode/UTF8.h"
 
 namespace vesk {
 
@@ -69,7 +69,7 @@ bool BusEncoder::append(double value) { return basic(SD_BUS_TYPE_DOUBLE, &value)
 bool BusEncoder::append(std::string_view value) {
   if (!count(value.size())) return false;
   // sd-bus does not look at the texts that it sends.
-  if (!isSendable(value)) return fail(CodecResult::Malformed);
+  if (!isValidUTF8(value, false)) return fail(CodecResult::Malformed);
   char* space = nullptr;
   int r = sd_bus_message_append_string_space(_message, value.size(), &space);
   if (r < 0) return failWith(r);

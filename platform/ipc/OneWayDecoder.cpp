@@ -5,8 +5,8 @@
 #include <cstring>
 #include <memory>
 
-#include "platform/ipc/SendableText.h"
 #include "platform/ipc/WireFormat.h"
+#include "platform/unicode/UTF8.h"
 
 namespace vesk {
 
@@ -62,7 +62,7 @@ class Reader {
   }
   bool text(Text& out) {
     std::string_view view;
-    if (!rawText(view) || !isSendable(view)) return false;
+    if (!rawText(view) || !isValidUTF8(view, false)) return false;
     _content += view.size();
     out = _owner ? Text(std::shared_ptr<const char>(_owner, view.data()), view.size()) : _arena.add(view);
     return true;

@@ -4,8 +4,8 @@
 #include <string_view>
 #include <type_traits>
 
-#include "platform/ipc/SendableText.h"
 #include "platform/ipc/WireFormat.h"
+#include "platform/unicode/UTF8.h"
 
 namespace vesk {
 
@@ -44,7 +44,7 @@ class Writer {
   void add(double value) { number(value); }
   void add(std::string_view text) {
     if (!count(text.size())) return;
-    if (!isSendable(text)) return fail(CodecResult::Malformed);
+    if (!isValidUTF8(text, false)) return fail(CodecResult::Malformed);
     rawText(text);
   }
   void add(const std::string& text) { add(std::string_view(text)); }

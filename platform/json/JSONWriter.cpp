@@ -4,7 +4,7 @@
 #include <limits>
 
 #include "platform/json/JSONOutput.h"
-#include "platform/unicode/Unicode.h"
+#include "platform/unicode/UTF8.h"
 
 namespace vesk {
 

@@ -1,7 +1,7 @@
 #include "platform/crypto/Base64.h"
 #include "platform/plist/PropertyListFormats.h"
 #include "platform/plist/PropertyListScalars.h"
-#include "platform/unicode/Unicode.h"
+#include "platform/unicode/UTF8.h"
 
 namespace vesk {
 

@@ -60,22 +60,6 @@ std::string folded(std::string_view text) {
   });
 }
 
-/// Length of the well-formed sequence at the start of `text`, 0 when there is none.
-std::size_t sequenceLength(std::string_view text) noexcept {
-  auto byte = [&](std::size_t i) { return static_cast<unsigned char>(text[i]); };
-  auto isTail = [&](std::size_t i, unsigned low = 0x80, unsigned high = 0xBF) {
-    return i < text.size() && byte(i) >= low && byte(i) <= high;
-  };
-  const unsigned lead = byte(0);
-  if (lead < 0x80) return 1;
-  if (lead < 0xC2 || lead > 0xF4) return 0;
-  if (lead < 0xE0) return isTail(1) ? 2 : 0;
-  // The second byte's range shuts out overlong forms, surrogates and what is above U+10FFFF.
-  if (lead < 0xF0)
-    return isTail(1, lead == 0xE0 ? 0xA0 : 0x80, lead == 0xED ? 0x9F : 0xBF) && isTail(2) ? 3 : 0;
-  return isTail(1, lead == 0xF0 ? 0x90 : 0x80, lead == 0xF4 ? 0x8F : 0xBF) && isTail(2) && isTail(3) ? 4 : 0;
-}
-
 }  // namespace
 
 std::string lowercase(std::string_view text) {
@@ -98,24 +82,6 @@ bool equalsIgnoringCase(std::string_view a, std::string_view b) {
 bool containsIgnoringCase(std::string_view text, std::string_view needle) {
   if (needle.empty()) return false;
   return folded(text).find(folded(needle)) != std::string::npos;
-}
-
-bool isValidUTF8(std::string_view text, bool allowNUL) noexcept {
-  if (!allowNUL && text.find('\0') != std::string_view::npos) return false;
-  while (!text.empty()) {
-    if (text.size() >= 8) {
-      std::uint64_t eight;
-      std::memcpy(&eight, text.data(), 8);
-      if (!(eight & 0x8080808080808080u)) {
-        text.remove_prefix(8);
-        continue;
-      }
-    }
-    std::size_t length = sequenceLength(text);
-    if (length == 0) return false;
-    text.remove_prefix(length);
-  }
-  return true;
 }
 
 std::optional<std::string> utf8FromUTF16BE(std::string_view bytes) {

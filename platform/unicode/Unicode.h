@@ -17,10 +17,6 @@ bool equalsIgnoringCase(std::string_view a, std::string_view b);
 /// `needle` occurs in `text`, both case-folded. An empty needle never occurs.
 bool containsIgnoringCase(std::string_view text, std::string_view needle);
 
-/// Well-formed UTF-8: no overlong forms, no surrogates, nothing above U+10FFFF. A NUL is well-formed, and
-/// refused when `allowNUL` is false.
-bool isValidUTF8(std::string_view text, bool allowNUL = true) noexcept;
-
 /// Between UTF-8 and UTF-16 in big-endian bytes; nothing for what is not well-formed.
 std::optional<std::string> utf8FromUTF16BE(std::string_view bytes);
 std::optional<std::string> utf16BEFromUTF8(std::string_view text);

@@ -2,7 +2,7 @@
 
 #include <cstdio>
 
-#include "platform/unicode/Unicode.h"
+#include "platform/unicode/UTF8.h"
 
 namespace vesk {
 

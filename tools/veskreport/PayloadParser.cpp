@@ -2,7 +2,7 @@
 
 #include <cmath>
 
-#include "platform/unicode/Unicode.h"
+#include "platform/unicode/UTF8.h"
 #include "tools/json/JSONReader.h"
 
 namespace vesk {

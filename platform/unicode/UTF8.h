@@ -1,4 +1,4 @@
-// What D-Bus takes as text.
+// Whether bytes are text.
 #pragma once
 
 #include <cstdint>
@@ -7,22 +7,24 @@
 
 namespace vesk {
 
-/// UTF-8 without NUL. The receiver of any other text would refuse the whole message.
-inline bool isSendable(std::string_view text) noexcept {
+/// Well-formed UTF-8: no overlong forms, no surrogates, nothing above U+10FFFF. A NUL is well-formed, and
+/// refused when `allowNUL` is false. Here to be inlined: every text of every message is looked at.
+inline bool isValidUTF8(std::string_view text, bool allowNUL = true) noexcept {
   const auto* at = reinterpret_cast<const unsigned char*>(text.data());
   const auto* end = at + text.size();
   while (at < end) {
     if (end - at >= 8) {
       std::uint64_t eight;
       std::memcpy(&eight, at, sizeof eight);
-      // Neither a NUL nor anything beyond ASCII among them.
-      if (((eight | (eight - 0x0101010101010101U)) & 0x8080808080808080U) == 0) {
+      // Neither anything beyond ASCII among them nor a NUL, which borrows from above.
+      const std::uint64_t borrowed = allowNUL ? 0 : eight - 0x0101010101010101U;
+      if (((eight | borrowed) & 0x8080808080808080U) == 0) {
         at += 8;
         continue;
       }
     }
     unsigned char lead = *at++;
-    if (lead == 0) return false;
+    if (lead == 0 && !allowNUL) return false;
     if (lead < 0x80) continue;
     int more = lead >= 0xF0 ? 3 : lead >= 0xE0 ? 2 : 1;
     if (lead < 0xC2 || lead > 0xF4 || end - at < more) return false;
