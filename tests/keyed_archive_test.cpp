@@ -32,7 +32,10 @@ Value sample() {
 }
 
 TEST(KeyedArchive, ReadsBackWhatWasArchived) {
-  for (const Value& value : {sample(), Value(), Value("$null"), Value(3), Value(Dictionary{{"a", 1}})}) {
+  Value deep = List{"same", "same"};
+  for (int i = 1; i < 64; ++i) deep = List{deep};
+  for (const Value& value :
+       {sample(), deep, Value(), Value("$null"), Value(3), Value(Dictionary{{"a", 1}})}) {
     const auto archive = archiveValue(value);
     ASSERT_TRUE(archive);
     const auto read = unarchiveValue(*archive);

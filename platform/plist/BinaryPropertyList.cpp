@@ -1,10 +1,8 @@
 #include <algorithm>
 #include <bit>
 #include <cstring>
-#include <unordered_map>
-#include <vector>
 
-#include "platform/plist/PropertyListFormats.h"
+#include "platform/plist/ObjectGraphReader.h"
 #include "platform/unicode/Unicode.h"
 
 namespace vesk {
@@ -47,33 +45,19 @@ std::optional<Trailer> readTrailer(std::string_view bytes) {
   return trailer;
 }
 
-/// Reads objects as they are reached from the root. Each is read once and shared from then on, but counts in
-/// full wherever it is referred to.
-class BinaryReader {
+class BinaryReader final : private ObjectGraphReader {
  public:
   BinaryReader(std::string_view bytes, const Trailer& trailer, PropertyListFlavor flavor,
                const PropertyListLimits& limits)
-      : _objects(bytes.substr(0, trailer.offsetTable)),
+      : ObjectGraphReader(limits),
+        _objects(bytes.substr(0, trailer.offsetTable)),
         _offsets(bytes.substr(trailer.offsetTable, trailer.objectCount * trailer.offsetSize)),
         _trailer(trailer),
-        _flavor(flavor),
-        _budget(limits) {}
+        _flavor(flavor) {}
 
-  PropertyListOutcome read() {
-    const Object* root = object(_trailer.rootObject, 1);
-    if (!root) return {std::nullopt, _error};
-    return {root->value, {}};
-  }
+  PropertyListOutcome read() { return readFrom(_trailer.rootObject); }
 
  private:
-  struct Object {
-    Value value;
-    bool isComplete = false;       // false while its own parts are being read
-    std::size_t height = 0;        // containers down from here, itself included
-    std::size_t nodes = 1;         // everything below and itself
-    std::size_t contentBytes = 0;  // of all texts and data in it
-  };
-
   /// Where an object's payload starts, and what its marker says.
   struct Marker {
     unsigned kind;
@@ -81,54 +65,27 @@ class BinaryReader {
     std::size_t payload;
   };
 
-  bool fail(std::string error) {
-    if (_error.empty()) _error = std::move(error);
-    return false;
-  }
-
-  const Object* failed(std::string error) {
-    fail(std::move(error));
-    return nullptr;
-  }
-
-  /// The object as it stands at `depth`, or null after a failure.
-  const Object* object(std::uint64_t index, std::size_t depth) {
-    if (index >= _trailer.objectCount) return failed("reference to no object");
-    auto [at, isNew] = _read.try_emplace(index);
-    Object& object = at->second;  // stays where it is when more are added
-    if (isNew) {
-      if (!readObject(index, depth, object)) return nullptr;
-      object.isComplete = true;
-      return &object;
-    }
-    if (!object.isComplete) return failed("a container holds itself");
-    if (!_budget.allowsDepth(depth + object.height - 1)) return failed(_budget.depthError());
-    if (!_budget.add(object.nodes, object.contentBytes)) return failed(_budget.sizeError());
-    return &object;
-  }
-
-  bool readObject(std::uint64_t index, std::size_t depth, Object& object) {
-    const std::uint64_t offset = bigEndian(_offsets.substr(index * _trailer.offsetSize, _trailer.offsetSize));
-    auto marker = readMarker(offset);
+  bool readObject(Index index, std::size_t depth, Object& object) override {
+    if (index >= _trailer.objectCount) return fail("reference to no object");
+    auto marker = readMarker(bigEndian(_offsets.substr(index * _trailer.offsetSize, _trailer.offsetSize)));
     if (!marker) return false;
+    const std::size_t count = marker->count;
+    auto referenceAt = [&](std::size_t place) {
+      const std::size_t start = marker->payload + place * _trailer.referenceSize;
+      return bigEndian(_objects.substr(start, _trailer.referenceSize));
+    };
     switch (marker->kind) {
       case 0xA:
-        return readList(*marker, depth, object);
-      case 0xD:
-        return readDictionary(*marker, depth, object);
+        return hasRoomFor(*marker, 1) && readList(count, referenceAt, depth, object);
+      case 0xD: {
+        auto itemAt = [&](std::size_t place) { return referenceAt(count + place); };
+        return hasRoomFor(*marker, 2) && readDictionary(count, referenceAt, itemAt, depth, object);
+      }
       default:
         break;
     }
-    auto value = readLeaf(*marker);
-    if (!value) return fail("an object that can't be read");
-    object.value = *std::move(value);
-    return _budget.add(1, object.contentBytes = contentBytes(object.value)) || fail(_budget.sizeError());
-  }
-
-  static std::size_t contentBytes(const Value& value) {
-    if (const Text* text = value.text()) return text->size();
-    if (const Bytes* bytes = value.bytes()) return bytes->size();
-    return 0;
+    auto value = leafAt(*marker);
+    return value ? readLeaf(*std::move(value), object) : fail("an object that can't be read");
   }
 
   std::optional<Marker> readMarker(std::uint64_t offset) {
@@ -159,7 +116,7 @@ class BinaryReader {
     return _objects.substr(start, count);
   }
 
-  std::optional<Value> readLeaf(const Marker& marker) {
+  std::optional<Value> leafAt(const Marker& marker) {
     switch (marker.kind) {
       case 0x0:
         if (marker.count == 0x0) return Value();
@@ -230,67 +187,17 @@ class BinaryReader {
     return Value(Dictionary{{Text(kUIDKey), Value(bigEndian(*bytes))}});
   }
 
-  /// Counts a container of `count` references on each of which at least a byte is spent.
-  bool beginContainer(const Marker& marker, std::uint64_t referencesPerEntry, std::size_t depth) {
-    if (!_budget.allowsDepth(depth)) return fail(_budget.depthError());
-    if (!_budget.add(1, 0)) return fail(_budget.sizeError());
+  /// Whether all references of a container are there.
+  bool hasRoomFor(const Marker& marker, std::uint64_t referencesPerEntry) {
     const std::uint64_t room = (_objects.size() - std::min(marker.payload, _objects.size())) /
                                (_trailer.referenceSize * referencesPerEntry);
     return marker.count <= room || fail("a container that reaches over the end");
-  }
-
-  /// Containers may lie across each other, so that a small document could ask for a lot of room at once.
-  static std::size_t roomFor(const Marker& marker) { return std::min<std::uint64_t>(marker.count, 1024); }
-
-  /// The `index`th object that a container refers to; its cost becomes the container's as well.
-  const Object* part(const Marker& marker, std::uint64_t index, std::size_t depth, Object& container) {
-    const std::size_t start = marker.payload + index * _trailer.referenceSize;
-    const Object* found = object(bigEndian(_objects.substr(start, _trailer.referenceSize)), depth + 1);
-    if (!found) return nullptr;
-    container.nodes += found->nodes;
-    container.contentBytes += found->contentBytes;
-    container.height = std::max(container.height, found->height + 1);
-    return found;
-  }
-
-  bool readList(const Marker& marker, std::size_t depth, Object& list) {
-    if (!beginContainer(marker, 1, depth)) return false;
-    list.height = 1;
-    std::vector<Value> values;
-    values.reserve(roomFor(marker));
-    for (std::uint64_t i = 0; i < marker.count; ++i) {
-      const Object* value = part(marker, i, depth, list);
-      if (!value) return false;
-      values.push_back(value->value);
-    }
-    list.value = List(std::move(values));
-    return true;
-  }
-
-  bool readDictionary(const Marker& marker, std::size_t depth, Object& dictionary) {
-    if (!beginContainer(marker, 2, depth)) return false;
-    dictionary.height = 1;
-    MutableDictionary entries;
-    entries.reserve(roomFor(marker));
-    for (std::uint64_t i = 0; i < marker.count; ++i) {
-      const Object* key = part(marker, i, depth, dictionary);
-      if (!key) return false;
-      if (!key->value.text()) return fail("a key that is no text");
-      const Object* value = part(marker, marker.count + i, depth, dictionary);
-      if (!value) return false;
-      entries.append(*key->value.text(), value->value);
-    }
-    dictionary.value = entries.shareUnique();
-    return true;
   }
 
   const std::string_view _objects;  // the magic number and the objects
   const std::string_view _offsets;
   const Trailer _trailer;
   const PropertyListFlavor _flavor;
-  PropertyListBudget _budget;
-  std::unordered_map<std::uint64_t, Object> _read;
-  std::string _error;
 };
 
 }  // namespace

@@ -1,47 +1,22 @@
-#include <algorithm>
-#include <unordered_map>
 #include <utility>
-#include <vector>
 
 #include "platform/plist/KeyedArchive.h"
 #include "platform/plist/KeyedArchiveFormat.h"
-#include "platform/plist/PropertyListFormats.h"
+#include "platform/plist/ObjectGraphReader.h"
 
 namespace vesk {
 
 namespace {
 
-/// Reads objects as they are reached from the root, each once; but it counts wherever it is referred to.
-class ArchiveReader {
+class ArchiveReader final : private ObjectGraphReader {
  public:
   ArchiveReader(List objects, const PropertyListLimits& limits)
-      : _objects(std::move(objects)), _budget(limits) {}
+      : ObjectGraphReader(limits), _objects(std::move(objects)) {}
 
-  PropertyListOutcome read(const Value& reference) {
-    const Object* root = object(reference, 1);
-    if (root == nullptr) return {std::nullopt, _error};
-    return {root->value, {}};
-  }
+  PropertyListOutcome read(const Value& reference) { return readFrom(indexIn(&reference)); }
 
  private:
-  struct Object {
-    Value value;
-    bool isComplete = false;  // false while its own parts are being read
-    std::size_t height = 0;   // containers down from here, itself included
-    std::size_t nodes = 1;    // everything below and itself
-    std::size_t contentBytes = 0;
-  };
-
-  bool fail(std::string error) {
-    if (_error.empty()) _error = std::move(error);
-    return false;
-  }
-  const Object* failed(std::string error) {
-    fail(std::move(error));
-    return nullptr;
-  }
-
-  std::optional<std::size_t> indexIn(const Value* reference) {
+  std::optional<Index> indexIn(const Value* reference) {
     const Dictionary* uid = reference != nullptr ? reference->dictionary() : nullptr;
     const Value* number = uid != nullptr && uid->size() == 1 ? uid->find(kUIDKey) : nullptr;
     const std::uint64_t* index = number != nullptr ? number->unsignedInteger() : nullptr;
@@ -50,60 +25,30 @@ class ArchiveReader {
     return std::nullopt;
   }
 
-  /// The object as it stands at `depth`, or null after a failure.
-  const Object* object(const Value& reference, std::size_t depth) {
-    auto index = indexIn(&reference);
-    if (!index) return nullptr;
-    auto [at, isNew] = _read.try_emplace(*index);
-    Object& object = at->second;  // stays where it is when more are added
-    if (isNew) {
-      if (!readObject(*index, depth, object)) return nullptr;
-      object.isComplete = true;
-      return &object;
-    }
-    if (!object.isComplete) return failed("an object that holds itself");
-    if (!_budget.allowsDepth(depth + std::max<std::size_t>(object.height, 1) - 1))
-      return failed(_budget.depthError());
-    if (!_budget.add(object.nodes, object.contentBytes)) return failed(_budget.sizeError());
-    return &object;
-  }
-
-  bool readObject(std::size_t index, std::size_t depth, Object& object) {
+  bool readObject(Index index, std::size_t depth, Object& object) override {
     const Value& archived = _objects[index];
     if (const Dictionary* instance = archived.dictionary()) return readInstance(*instance, depth, object);
-    if (const Text* text = archived.text()) {
-      if (index != 0) object.value = *text;
-      return add(object, index == 0 ? 0 : text->size());
-    }
-    if (!archived.isNumber()) return fail("an object that is neither text, number nor of a class");
-    object.value = archived;
-    return add(object, 0);
-  }
-
-  bool add(Object& object, std::size_t contentBytes) {
-    object.contentBytes += contentBytes;
-    return _budget.add(1, contentBytes) || fail(_budget.sizeError());
+    if (index == 0 && archived.text()) return readLeaf(Value(), object);
+    if (archived.text() || archived.isNumber()) return readLeaf(archived, object);
+    return fail("an object that is neither text, number nor of a class");
   }
 
   bool readInstance(const Dictionary& instance, std::size_t depth, Object& object) {
     const std::optional<Text> name = classOf(instance);
     if (!name) return fail("an object without a class");
-    if (*name == archive::kListClass) return readList(instance, depth, object);
-    if (*name == archive::kDictionaryClass) return readDictionary(instance, depth, object);
+    if (*name == archive::kListClass) return readItems(instance, depth, object);
+    if (*name == archive::kDictionaryClass) return readEntries(instance, depth, object);
     const Value* date = instance.find(archive::kSeconds);
     if (*name == archive::kDateClass && date != nullptr && date->real() != nullptr) {
-      object.value = Date{*date->real()};
-      return add(object, 0);
+      return readLeaf(Date{*date->real()}, object);
     }
     const Value* data = instance.find(archive::kBytes);
     if (*name == archive::kDataClass && data != nullptr && data->bytes() != nullptr) {
-      object.value = *data->bytes();
-      return add(object, data->bytes()->size());
+      return readLeaf(*data, object);
     }
     auto text = instance.text(archive::kText);
     if (*name != archive::kStringClass || !text) return fail("an object of an unknown class or form");
-    object.value = *text;
-    return add(object, text->size());
+    return readLeaf(*text, object);
   }
 
   std::optional<Text> classOf(const Dictionary& instance) {
@@ -113,59 +58,24 @@ class ArchiveReader {
     return entry != nullptr ? entry->text(archive::kClassName) : std::nullopt;
   }
 
-  /// The `index`th object that a container refers to; its cost becomes the container's as well.
-  const Object* part(const Value& reference, std::size_t depth, Object& container) {
-    const Object* found = object(reference, depth + 1);
-    if (found == nullptr) return nullptr;
-    container.nodes += found->nodes;
-    container.contentBytes += found->contentBytes;
-    container.height = std::max(container.height, found->height + 1);
-    return found;
+  PartAt referencesOf(const List& references) {
+    return [&](std::size_t place) { return indexIn(&references[place]); };
   }
 
-  bool beginContainer(std::size_t depth, Object& container) {
-    container.height = 1;
-    if (!_budget.allowsDepth(depth)) return fail(_budget.depthError());
-    return add(container, 0);
-  }
-
-  bool readList(const Dictionary& instance, std::size_t depth, Object& list) {
+  bool readItems(const Dictionary& instance, std::size_t depth, Object& list) {
     auto items = instance.list(archive::kItems);
     if (!items) return fail("a list without items");
-    if (!beginContainer(depth, list)) return false;
-    std::vector<Value> values;
-    for (const Value& reference : *items) {
-      const Object* item = part(reference, depth, list);
-      if (item == nullptr) return false;
-      values.push_back(item->value);
-    }
-    list.value = List(std::move(values));
-    return true;
+    return readList(items->size(), referencesOf(*items), depth, list);
   }
 
-  bool readDictionary(const Dictionary& instance, std::size_t depth, Object& dictionary) {
+  bool readEntries(const Dictionary& instance, std::size_t depth, Object& dictionary) {
     auto keys = instance.list(archive::kKeys);
     auto items = instance.list(archive::kItems);
     if (!keys || !items || keys->size() != items->size()) return fail("a dictionary without keys and items");
-    if (!beginContainer(depth, dictionary)) return false;
-    MutableDictionary entries;
-    for (std::size_t i = 0; i < keys->size(); ++i) {
-      const Object* key = part((*keys)[i], depth, dictionary);
-      if (key == nullptr) return false;
-      if (key->value.text() == nullptr) return fail("a key that is no text");
-      const Text name = *key->value.text();
-      const Object* item = part((*items)[i], depth, dictionary);
-      if (item == nullptr) return false;
-      entries.append(name, item->value);
-    }
-    dictionary.value = entries.shareUnique();
-    return true;
+    return readDictionary(keys->size(), referencesOf(*keys), referencesOf(*items), depth, dictionary);
   }
 
   const List _objects;
-  PropertyListBudget _budget;
-  std::unordered_map<std::size_t, Object> _read;
-  std::string _error;
 };
 
 PropertyListOutcome noArchive(std::string why) { return {std::nullopt, "no keyed archive: " + why}; }
