@@ -104,7 +104,7 @@ void SessionWorker::endEverything() noexcept {
   if (_callsInBus > 0 && _waiting.front().wantsAnswer()) frontHasLeft();
   auto close = [this](const ClientCall& call) {
     _drops.unsent();
-    end(call.end, ReportingStatus::Closed, nullptr, "");
+    finish(call.end, ReportingStatus::Closed, nullptr, "");
   };
   for (; !_waiting.empty(); frontHasLeft()) close(_waiting.front());
   for (const ClientCall& call : _taken) close(call);
@@ -142,7 +142,7 @@ void SessionWorker::tellOfDrops() noexcept {
 void SessionWorker::endOverdue(Time now) {
   std::erase_if(_requests, [&](const ConnectionRequest& request) {
     if (request.deadline > now) return false;
-    end(request.end, ReportingStatus::NotConnected, nullptr, _link.problem());
+    finish(request.end, ReportingStatus::NotConnected, nullptr, _link.problem());
     return true;
   });
 
@@ -155,12 +155,12 @@ void SessionWorker::endOverdue(Time now) {
     ++_callsGone;
     _memoryGone += call.memory;
     _drops.unsent();
-    end(call.end, status, nullptr, _link.isReady() ? "" : _link.problem());
+    finish(call.end, status, nullptr, _link.isReady() ? "" : _link.problem());
   }
 }
 
 void SessionWorker::endRequests(ReportingStatus status, std::string_view detail) {
-  for (const auto& request : std::exchange(_requests, {})) end(request.end, status, nullptr, detail);
+  for (const auto& request : std::exchange(_requests, {})) finish(request.end, status, nullptr, detail);
 }
 
 void SessionWorker::sendMessageToClient(const std::optional<Dictionary>& sessionInfo, double timestamp,
@@ -269,7 +269,7 @@ void SessionWorker::sendFront(Time now) {
     auto left = std::chrono::ceil<std::chrono::milliseconds>(front.deadline - now);
     auto handler = [this, end = front.end, deadline = front.deadline](BusAnswer& answer) {
       --_answersOwed;
-      endWithAnswer(end, deadline, answer);
+      finishWithAnswer(end, deadline, answer);
     };
     result = _link.bus().send(front.call, std::move(handler), left);
     if (result == BusClient::SendResult::Sent) ++_answersOwed;
@@ -284,11 +284,11 @@ void SessionWorker::sendFront(Time now) {
       return callsHaveLeft();
     case BusClient::SendResult::Refused:
       _drops.invalid();
-      end(front.end, ReportingStatus::InvalidArgument, nullptr, "");
+      finish(front.end, ReportingStatus::InvalidArgument, nullptr, "");
       return frontHasLeft();
     case BusClient::SendResult::OutOfResources:
       _drops.unsent();
-      end(front.end, ReportingStatus::OutOfResources, nullptr, "");
+      finish(front.end, ReportingStatus::OutOfResources, nullptr, "");
       return frontHasLeft();
     case BusClient::SendResult::Disconnected:
       return connectionBroke(now);
@@ -341,8 +341,8 @@ void SessionWorker::sayFarewell(Time now) {
   _farewell = result == BusClient::SendResult::Sent ? Farewell::Asked : Farewell::Answered;
 }
 
-void SessionWorker::end(const std::shared_ptr<CallEnd>& end, ReportingStatus status, BusAnswer* answer,
-                        std::string_view detail) noexcept {
+void SessionWorker::finish(const std::shared_ptr<CallEnd>& end, ReportingStatus status, BusAnswer* answer,
+                           std::string_view detail) noexcept {
   if (!end) return;
   try {
     (*end)(status, answer, detail);
@@ -351,17 +351,16 @@ void SessionWorker::end(const std::shared_ptr<CallEnd>& end, ReportingStatus sta
   }
 }
 
-void SessionWorker::endWithAnswer(const std::shared_ptr<CallEnd>& end, Time deadline,
-                                  BusAnswer& answer) noexcept {
-  if (!answer.isError()) return this->end(end, ReportingStatus::Done, &answer, "");
+void SessionWorker::finishWithAnswer(const std::shared_ptr<CallEnd>& end, Time deadline,
+                                     BusAnswer& answer) noexcept {
+  if (!answer.isError()) return finish(end, ReportingStatus::Done, &answer, "");
   if (answer.errorName() == "org.freedesktop.DBus.Error.Disconnected") {
     auto status = _isClosed ? ReportingStatus::Closed : ReportingStatus::NotConnected;
-    return this->end(end, status, nullptr, _isClosed ? "" : "the daemon has closed the connection");
+    return finish(end, status, nullptr, _isClosed ? "" : "the daemon has closed the connection");
   }
   // The same name stands for a time that ran out and for a daemon that gave no answer.
   bool isOverdue = answer.errorName() == "org.freedesktop.DBus.Error.NoReply" && Clock::now() >= deadline;
-  this->end(end, isOverdue ? ReportingStatus::TimedOut : ReportingStatus::Refused, nullptr,
-            answer.errorText());
+  finish(end, isOverdue ? ReportingStatus::TimedOut : ReportingStatus::Refused, nullptr, answer.errorText());
 }
 
 // --- Sleeping

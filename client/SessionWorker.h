@@ -77,9 +77,9 @@ class SessionWorker final : private ClientSessionReplyInterface {
   void frontHasLeft() noexcept;
   void giveRoomBack() noexcept;
   void sayFarewell(Time now);
-  void end(const std::shared_ptr<CallEnd>& end, ReportingStatus status, BusAnswer* answer,
-           std::string_view detail) noexcept;
-  void endWithAnswer(const std::shared_ptr<CallEnd>& end, Time deadline, BusAnswer& answer) noexcept;
+  void finish(const std::shared_ptr<CallEnd>& end, ReportingStatus status, BusAnswer* answer,
+              std::string_view detail) noexcept;
+  void finishWithAnswer(const std::shared_ptr<CallEnd>& end, Time deadline, BusAnswer& answer) noexcept;
 
   void sleep(Time now);
   Time nextDue(Time now);
@@ -111,8 +111,8 @@ class SessionWorker final : private ClientSessionReplyInterface {
   std::size_t _answersOwed = 0;
   std::size_t _callsGone = 0;  ///< whose room in the queue is not given back yet
   std::size_t _memoryGone = 0;
-  std::size_t _callsInBus =
-      0;  ///< the first of those that wait: sent, but the socket has not taken all of them yet
+  /// The first of those that wait: sent, but the socket has not taken all of them yet.
+  std::size_t _callsInBus = 0;
   bool _isNapping = false;
   bool _isHopeless = false;  ///< closing, and there never was a daemon
   bool _isClosed = false;

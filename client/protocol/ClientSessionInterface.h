@@ -1,19 +1,17 @@
 // The operations that the daemon exports to each client. The bytes on the wire: docs/wire.md.
 #pragma once
 
+#include <VeskReporting/VeskReportingTypes.h>
+
 #include <cstdint>
 #include <optional>
 #include <string>
-#include <vector>
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/ipc/Reply.h"
 #include "platform/values/Value.h"
 
 namespace vesk {
-
-/// Names of backends; nothing when there are no backends to name.
-using BackendNames = std::vector<std::string>;
 
 /// Implemented by the daemon's session. All calls of one connection arrive in order on that connection's
 /// thread. Whatever a caller may leave out is optional. Implementations must not throw.

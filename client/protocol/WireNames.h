@@ -3,7 +3,6 @@
 
 namespace vesk::wire {
 
-inline constexpr const char* kServiceName = "com.corvane.veskreportingd";
 /// The socket, as on a device.
 inline constexpr const char* kSocketPath = "/run/veskreportingd/com.corvane.veskreportingd";
 /// Of the daemon's object and of the client's.

@@ -61,7 +61,6 @@ class BusClient::Implementation {
   short events() const;
   int timeout() const;
   Progress process();
-  bool flush(std::chrono::milliseconds limit);
 
  private:
   struct Pending {
@@ -268,18 +267,6 @@ void BusClient::Implementation::end() noexcept {
   }
 }
 
-bool BusClient::Implementation::flush(std::chrono::milliseconds limit) {
-  const auto deadline = std::chrono::steady_clock::now() + limit;
-  while (_bus && queuedMessages() > 0) {
-    auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
-    if (left <= 0ms) return false;
-    pollfd poll{fd(), events(), 0};
-    ::poll(&poll, 1, static_cast<int>(std::min<long long>(left.count(), INT_MAX)));
-    if (process() == Progress::Disconnected) return false;
-  }
-  return _bus != nullptr;
-}
-
 BusClient::BusClient(Options options)
     : _implementation(std::make_unique<Implementation>(std::move(options))) {}
 
@@ -308,6 +295,5 @@ int BusClient::fd() const { return _implementation->fd(); }
 short BusClient::events() const { return _implementation->events(); }
 int BusClient::timeout() const { return _implementation->timeout(); }
 BusClient::Progress BusClient::process() { return _implementation->process(); }
-bool BusClient::flush(std::chrono::milliseconds limit) { return _implementation->flush(limit); }
 
 }  // namespace vesk

@@ -47,7 +47,7 @@ class BusAnswer {
 };
 
 /// Owned and used by one thread, whose poll loop waits for `fd` with `events` and `timeout` and then calls
-/// `process`. Nothing here waits, except `flush`. Calls made before authentication is done are queued.
+/// `process`. Nothing here waits. Calls made before authentication is done are queued.
 class BusClient {
  public:
   struct Options {
@@ -65,9 +65,8 @@ class BusClient {
 
   enum class Progress { Connected, Disconnected };
 
-  /// Called exactly once, from `process` or, when the connection ends with answers owed, from `process`,
-  /// `flush` or the destructor. May send; must
-  /// not call `process` or `flush`, destroy the client, or throw.
+  /// Called exactly once, from `process`; when the connection ends with the answer owed, it may be from
+  /// `write` or the destructor. May send; must not call `process` or `write`, destroy the client, or throw.
   using AnswerHandler = std::function<void(BusAnswer& answer)>;
 
   /// Connects. Throws std::system_error: ENOENT or ECONNREFUSED when no daemon is there, EAGAIN when too many
@@ -101,13 +100,9 @@ class BusClient {
   short events() const;
   /// For poll(): milliseconds, -1 for no limit.
   int timeout() const;
-  /// Writes what is queued, reads what has come, calls handlers and the exported object; bounded work per
-  /// call
-  /// (`timeout` is 0 when there is more).
+  /// Writes what is queued, reads what has come, calls handlers and the exported object. Does so much at
+  /// most; `timeout` is 0 when there is more.
   [[nodiscard]] Progress process();
-
-  /// Waits until everything queued is written, at most for `limit`. True when it was.
-  bool flush(std::chrono::milliseconds limit);
 
  private:
   class Implementation;

@@ -21,7 +21,6 @@ class IPCIncomingCall;
 /// Who is at the other end, as the kernel vouched for it when the connection was made.
 struct IPCPeer {
   uid_t user = static_cast<uid_t>(-1);
-  gid_t group = static_cast<gid_t>(-1);
   pid_t process = 0;
 };
 
@@ -63,7 +62,6 @@ class IPCConnection {
   virtual ~IPCConnection() = default;
 
   virtual std::string description() const = 0;
-  virtual IPCPeer peer() const = 0;
 
   /// Set before `resume`; run on the connection's thread, each at most once.
   virtual void setExportedObject(std::shared_ptr<IPCExportedObject> object) = 0;

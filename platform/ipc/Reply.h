@@ -6,8 +6,8 @@
 
 namespace vesk {
 
-/// A reply closure: called once, on the thread that serves the call. When it is destroyed without having been
-/// called, its caller gets an error reply, so that nobody waits for ever. Empty when the caller wants no
+/// A reply closure: called once, on any thread, by one owner at a time. When it is destroyed without having
+/// been called, its caller gets an error reply, so that nobody waits for ever. Empty when the caller wants no
 /// answer; calling an empty one does nothing.
 template <class... Arguments>
 class Reply {

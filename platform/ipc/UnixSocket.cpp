@@ -88,7 +88,7 @@ IPCPeer peerOfSocket(int socket) {
   ucred credentials{};
   socklen_t size = sizeof credentials;
   if (::getsockopt(socket, SOL_SOCKET, SO_PEERCRED, &credentials, &size) != 0) fail(errno, "SO_PEERCRED");
-  return {credentials.uid, credentials.gid, credentials.pid};
+  return {credentials.uid, credentials.pid};
 }
 
 }  // namespace vesk

@@ -31,7 +31,6 @@ bool areUnique(const std::vector<DictionaryEntry>& entries) noexcept {
 }  // namespace
 
 // --- List
-// ---------------------------------------------------------------------------------------------------
 
 List::List(std::vector<Value> values) {
   values.shrink_to_fit();  // few are made, and those that wait add up
@@ -50,7 +49,6 @@ bool operator==(const List& a, const List& b) noexcept {
 }
 
 // --- Dictionary
-// ---------------------------------------------------------------------------------------------
 
 struct Dictionary::Storage {
   explicit Storage(std::vector<DictionaryEntry> list) : entries(std::move(list)) {
@@ -106,7 +104,6 @@ bool operator==(const Dictionary& a, const Dictionary& b) noexcept {
 }
 
 // --- MutableDictionary
-// --------------------------------------------------------------------------------------
 
 MutableDictionary::MutableDictionary(const Dictionary& source, std::size_t extra) {
   _entries.reserve(source.size() + extra);
@@ -181,7 +178,6 @@ Dictionary MutableDictionary::shareUnique() {
 }
 
 // --- Numbers
-// ------------------------------------------------------------------------------------------------
 
 std::optional<std::int64_t> Value::asInteger() const noexcept {
   switch (kind()) {

@@ -6,8 +6,8 @@ namespace vesk {
 // Session info: what a client says about itself when it configures its session.
 inline constexpr char kVeskReportingSessionInfoSessionID[] = "sessionID";    ///< number, 32 bits, unsigned
 inline constexpr char kVeskReportingSessionInfoClientType[] = "clientType";  ///< number; selects the storebag
-inline constexpr char kVeskReportingSessionInfoClientVersion[] =
-    "clientVersion";  ///< number, 16 bits, unsigned
+/// number, 16 bits, unsigned
+inline constexpr char kVeskReportingSessionInfoClientVersion[] = "clientVersion";
 inline constexpr char kVeskReportingSessionInfoRequireUserInfo[] = "requireUserInfo";  ///< boolean
 inline constexpr char kVeskReportingSessionInfoBatchEvent[] = "batchEvent";            ///< boolean
 
@@ -16,13 +16,13 @@ inline constexpr char kVeskReportingUserInfoClientName[] = "clientName";    ///<
 inline constexpr char kVeskReportingUserInfoServiceName[] = "serviceName";  ///< text
 
 // Message parameters.
-inline constexpr char kVeskReportingMessageParametersCategory[] =
-    "category";  ///< number, 16 bits, unsigned; mandatory
-inline constexpr char kVeskReportingMessageParametersType[] =
-    "type";  ///< number, 16 bits, unsigned; mandatory
+/// number, 16 bits, unsigned; mandatory
+inline constexpr char kVeskReportingMessageParametersCategory[] = "category";
+/// number, 16 bits, unsigned; mandatory
+inline constexpr char kVeskReportingMessageParametersType[] = "type";
 inline constexpr char kVeskReportingMessageParametersPayload[] = "payload";  ///< dictionary
-inline constexpr char kVeskReportingMessageParametersFlag[] =
-    "flag";  ///< number: 1 realtime, 2 override sampling, 3 both
+/// number: 1 realtime, 2 override sampling, 3 both
+inline constexpr char kVeskReportingMessageParametersFlag[] = "flag";
 
 // Backends: the keys of a storebag's section, and the names that sessions answer with.
 inline constexpr char kVeskReportingBackendHTTPPost[] = "httpPost";
