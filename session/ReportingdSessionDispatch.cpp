@@ -1,15 +1,22 @@
 // The road of a message from its session to every backend.
 #include <VeskReporting/VeskReportingKeys.h>
 
+#include <climits>
+
 #include "platform/files/FileURL.h"
 #include "platform/log/SystemLog.h"
 #include "session/ReportingdSession.h"
 #include "util/MessageLog.h"
 #include "util/ReportingdUtil.h"
+#include "util/URLQuery.h"
 
 namespace vesk {
 
 namespace {
+
+// Of a file's URL: no file has a longer one, each byte of its path encoded.
+constexpr std::size_t kLongestURL = 3 * PATH_MAX + sizeof "file://localhost";
+constexpr std::size_t kShownOfTooLong = 256;
 
 /// The one answer that goes back to the client: the HTTP-post backend's, else the dashboard's, else none.
 class AnswerChoice {
@@ -108,8 +115,13 @@ std::optional<std::string> ReportingdSession::flushMessages() {
 void ReportingdSession::uploadFileWithURL(const std::string& fileURL, const std::string& extensionToken,
                                           Reply<bool> completionHandler) {
   std::string path = pathFromFileURL(fileURL);
+  std::string url = fileURL;
   bool succeeded = false;
-  if (auto set = backends()) {
+  if (path.size() >= PATH_MAX || url.size() > kLongestURL) {
+    // A client must not fill the logs with what it calls its file.
+    if (path.size() > kShownOfTooLong) path.resize(kShownOfTooLong);
+    url.resize(kShownOfTooLong);
+  } else if (auto set = backends()) {
     for (const auto& [name, backend] : *set) {
       if (backend->uploadFileAtPath(path, extensionToken)) succeeded = true;
     }
@@ -120,7 +132,8 @@ void ReportingdSession::uploadFileWithURL(const std::string& fileURL, const std:
     VESK_LOG_ERROR("uploadFileWithURL: File upload failed for %s", path.c_str());
     _services.backends.counters.count("session", DropReason::UploadFailed);
   }
-  writeToLogFile("[uploadFileWithURL] Upload %@ for file %@", succeeded ? "succeeded" : "failed", fileURL);
+  writeToLogFile("[uploadFileWithURL] Upload %@ for file %@", succeeded ? "succeeded" : "failed",
+                 encodedForURL(url));
   completionHandler(succeeded);
 }
 

@@ -60,6 +60,22 @@ TEST_F(Session, UnstartedAnswersNothing) {
   EXPECT_TRUE(harness.posts().empty());
 }
 
+TEST_F(Session, WhatAClientCallsItsFileFillsNoLog) {
+  CapturedLog log;
+  auto session = configured(4);
+  const std::string before = messageLog();
+  for (const std::string& url : {std::string("file:///a%20b(\n(2026) [forged] \xc3\xa9"),
+                                 "file://host" + std::string(1 << 20, '\n'), std::string(1 << 20, 'x')}) {
+    session->uploadFileAtPath(url, "", {[](const bool& reply) { EXPECT_FALSE(reply); }, nullptr});
+  }
+  const std::string written = messageLog().substr(before.size());
+  EXPECT_EQ(std::count(written.begin(), written.end(), '\n'), 3);
+  EXPECT_LT(written.size(), 2000u);
+  EXPECT_NE(written.find("Upload failed for file file:///a%20b(%0A(2026)%20[forged]%20%C3%A9\n"),
+            std::string::npos);
+  EXPECT_EQ(log.count(3, "uploadFileWithURL: File upload failed for " + std::string(256, 'x')), 1);
+}
+
 TEST_F(Session, StartTellsTheBackendsAndAnswersTheEnabledOnes) {
   auto session = configured();
   EXPECT_EQ(session.start(), BackendNames{"httpPost"});

@@ -25,6 +25,8 @@ std::string_view afterScheme(std::string_view url, std::string_view scheme) {
 
 std::string encodedForURLQuery(std::string_view text) { return percentEncoded(text, kOthersInQuery); }
 
+std::string encodedForURL(std::string_view url) { return percentEncoded(url, kOthersInURL); }
+
 bool isWebURL(std::string_view url) {
   std::string_view rest = afterScheme(url, "http://");
   if (rest.empty()) rest = afterScheme(url, "https://");

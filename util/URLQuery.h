@@ -1,4 +1,4 @@
-// Text in the query of a URL.
+// What URLs are made of.
 #pragma once
 
 #include <string>
@@ -9,6 +9,9 @@ namespace vesk {
 /// `text` with %XX for each byte that may not stand in a URL's query as it is. What separates the parts of a
 /// query ("&", "=", "?", "/") may, and stays.
 std::string encodedForURLQuery(std::string_view text);
+
+/// `url` with %XX for each byte that no URL may hold: a URL that is well-formed stays as it is.
+std::string encodedForURL(std::string_view url);
 
 /// Whether `url` is an absolute http or https URL, spelt with nothing but the characters that URLs are made
 /// of.
