@@ -94,6 +94,40 @@ TEST_F(MessageLogTest, ReplacesAFileOlderThanADay) {
             1);
 }
 
+TEST_F(MessageLogTest, WithoutABirthTimeAFileIsAsOldAsItsNameSays) {
+  struct statx status {};
+  status.stx_btime.tv_sec = 1000;
+  status.stx_mtime.tv_sec = 2000;
+  struct Case {
+    unsigned mask;
+    std::string name;
+    std::optional<WallTime> created;
+  };
+  const std::string number = "veskreportingd_1795552289_messageLog.diag";
+  const std::string late = "veskreportingd_-2147483648_messageLog.diag";
+  const std::string text = "veskreportingd_1x_messageLog.diag";
+  for (const auto& test : {Case{STATX_BTIME | STATX_MTIME, number, WallTime(seconds(1000))},
+                           Case{STATX_MTIME, number, WallTime(seconds(1'795'552'289))},
+                           Case{STATX_MTIME, late, WallTime(seconds(2'147'483'648))},
+                           Case{STATX_MTIME, text, WallTime(seconds(2000))}, Case{0, text, std::nullopt}}) {
+    status.stx_mask = test.mask;
+    EXPECT_EQ(logFileCreationDate(status, test.name), test.created) << test.mask << test.name;
+  }
+}
+
+TEST_F(MessageLogTest, AFileThatIsFullTakesNoMore) {
+  Counters counters;
+  MessageLog log(_logs.string(), _clock, {.maximumBytes = 100, .counters = &counters});
+  for (int i = 0; i < 4; ++i) log.write("a line of 20 letters");
+  const std::string name = *files().begin();
+  EXPECT_EQ(read(name).size(), 98u);
+  ASSERT_EQ(counters.snapshot().size(), 1u);
+  EXPECT_EQ(counters.snapshot()[0].reason, DropReason::NotRecorded);
+  EXPECT_EQ(counters.snapshot()[0].count, 2u);
+  EXPECT_EQ(_lines.count(4, "writeToLogFile: No room in " + path(name) + " until it expires; lines are lost"),
+            1);
+}
+
 TEST_F(MessageLogTest, KeepsTheNewestFileOnly) {
   std::string newest = "veskreportingd_9_messageLog.diag";
   _root.write("logs/" + newest, "");
@@ -146,7 +180,7 @@ TEST_F(MessageLogTest, NeitherMixesNorLosesLinesOfSeveralThreads) {
   std::vector<std::thread> threads;
   for (int i = 0; i < kThreads; ++i) {
     threads.emplace_back([&, i] {
-      const MessageLog log(_logs.string(), _clock);
+      MessageLog log(_logs.string(), _clock);
       for (int k = 0; k < kLines; ++k) log.write(std::string(2000, static_cast<char>('a' + i)));
     });
   }

@@ -4,8 +4,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <charconv>
 #include <filesystem>
-#include <optional>
 #include <system_error>
 #include <vector>
 
@@ -43,14 +43,23 @@ std::string newLogFileName(WallTime now) {
          std::string(kNameEnd);
 }
 
+/// The seconds since 1970 in a log file's name, if they are a number of 32 bits.
+std::optional<WallTime> dateInName(std::string_view name) {
+  name.remove_prefix(name.find('_') + 1);
+  name = name.substr(0, name.find('_'));
+  std::int32_t seconds = 0;
+  const auto [end, error] = std::from_chars(name.data(), name.data() + name.size(), seconds);
+  if (error != std::errc() || end != name.data() + name.size()) return std::nullopt;
+  // From 2038 on the number is negative.
+  return WallTime(std::chrono::seconds(static_cast<std::uint32_t>(seconds)));
+}
+
 std::optional<WallTime> creationDate(const std::string& path) {
   struct statx status {};
   if (::statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BTIME | STATX_MTIME, &status) != 0) {
     return std::nullopt;
   }
-  if (!(status.stx_mask & (STATX_BTIME | STATX_MTIME))) return std::nullopt;
-  const auto& when = status.stx_mask & STATX_BTIME ? status.stx_btime : status.stx_mtime;
-  return WallTime(std::chrono::seconds(when.tv_sec) + std::chrono::microseconds(when.tv_nsec / 1000));
+  return logFileCreationDate(status, std::string_view(path).substr(path.rfind('/') + 1));
 }
 
 std::string dateText(const LogFile& file) { return file.created ? logDate(*file.created) : "unknown date"; }
@@ -119,19 +128,34 @@ std::optional<LogFile> createLogFile(const std::string& directory, WallTime now)
   return created;
 }
 
-bool append(const std::string& path, std::string_view line) {
+enum class Appended : unsigned char { Yes, No, Full };
+
+Appended append(const std::string& path, std::string_view line, std::int64_t maximumBytes) {
   FileDescriptor file(::open(path.c_str(), O_WRONLY | O_APPEND | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
-  return file && writeAll(file.get(), line) == 0;
+  struct stat status {};
+  if (!file || ::fstat(file.get(), &status) != 0) return Appended::No;
+  if (status.st_size + static_cast<std::int64_t>(line.size()) > maximumBytes) return Appended::Full;
+  return writeAll(file.get(), line) == 0 ? Appended::Yes : Appended::No;
 }
 
 }  // namespace
 
 std::string logDate(WallTime time) { return civilTime(time) + " +0000"; }
 
-MessageLog::MessageLog(std::string directory, const WallClock& clock)
-    : _directory(std::move(directory)), _clock(clock) {}
+std::optional<WallTime> logFileCreationDate(const struct statx& status, std::string_view name) {
+  const bool hasBirth = status.stx_mask & STATX_BTIME;
+  if (!hasBirth) {
+    if (auto named = dateInName(name)) return named;
+    if (!(status.stx_mask & STATX_MTIME)) return std::nullopt;
+  }
+  const auto& when = hasBirth ? status.stx_btime : status.stx_mtime;
+  return WallTime(std::chrono::seconds(when.tv_sec) + std::chrono::microseconds(when.tv_nsec / 1000));
+}
 
-void MessageLog::write(std::string_view message) const try {
+MessageLog::MessageLog(std::string directory, const WallClock& clock, const Options& options)
+    : _directory(std::move(directory)), _clock(clock), _options(options) {}
+
+void MessageLog::write(std::string_view message) try {
   // One lock for all logs: two of them may stand on one directory.
   static Mutex mutex;
   MutexLock lock(mutex);
@@ -142,17 +166,27 @@ void MessageLog::write(std::string_view message) const try {
 
   std::string line = "(" + logDate(now) + ") ";
   line.append(message).append("\n");
-  if (append(file->path, line)) {
-    VESK_LOG_INFO("writeToLogFile: Saved log message to %s", file->path.c_str());
-  } else {
-    deleteLogFile(*file);
+  switch (append(file->path, line, _options.maximumBytes)) {
+    case Appended::Yes:
+      VESK_LOG_INFO("writeToLogFile: Saved log message to %s", file->path.c_str());
+      break;
+    case Appended::No:
+      deleteLogFile(*file);
+      break;
+    case Appended::Full:
+      _options.counters->count("message-log", DropReason::NotRecorded);
+      if (_full.begins()) {
+        VESK_LOG_WARNING("writeToLogFile: No room in %s until it expires; lines are lost",
+                         file->path.c_str());
+      }
+      break;
   }
 } catch (const std::exception& error) {
   VESK_LOG_ERROR("writeToLogFile: %s", error.what());
 }
 
 void writeToLogFile(std::string_view format, std::span<const LogArgument> arguments) {
-  static const auto* log =
+  static auto* const log =
       new MessageLog(pathUnderRoot("/var/mobile/Library/Logs/Dunmore/Retired"), WallClock::system());
   log->write(formatLogMessage(format, arguments));
 }

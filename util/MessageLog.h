@@ -1,11 +1,17 @@
 // The local message log: one file that tells a person at the device what was reported.
 #pragma once
 
+#include <sys/stat.h>
+
+#include <cstdint>
+#include <optional>
 #include <span>
 #include <string>
 #include <string_view>
 
+#include "platform/ipc/WarningBurst.h"
 #include "platform/time/Clock.h"
+#include "util/Counters.h"
 #include "util/LogFormat.h"
 
 namespace vesk {
@@ -16,20 +22,32 @@ namespace vesk {
 /// lines are never mixed or lost.
 ///
 /// The directory's own parents may be links, as the administrator likes; a log file may not. Files are made
-/// with mode 0640 and directories with mode 0750. A file's creation date is its birth time where the file
-/// system records one, else the time of its last change; with neither it is unknown.
+/// with mode 0640 and directories with mode 0750.
 class MessageLog {
  public:
-  /// `directory`: as it is on disk. `clock` must outlive the log.
-  MessageLog(std::string directory, const WallClock& clock);
+  struct Options {
+    std::int64_t maximumBytes = std::int64_t{64} << 20;  ///< of a file; clients decide how much is written
+    Counters* counters = &Counters::shared();
+  };
 
-  /// Writes one line: "(date) message".
-  void write(std::string_view message) const;
+  /// `directory`: as it is on disk. `clock` and the counters must outlive the log.
+  MessageLog(std::string directory, const WallClock& clock, const Options& options);
+  MessageLog(std::string directory, const WallClock& clock)
+      : MessageLog(std::move(directory), clock, Options()) {}
+
+  /// Writes one line: "(date) message". One for which the file has no room is dropped and counted.
+  void write(std::string_view message);
 
  private:
   const std::string _directory;
   const WallClock& _clock;
+  const Options _options;
+  WarningBurst _full;  // used under the lock
 };
+
+/// When the log file of that name was made: its birth time where the file system records one, else the
+/// seconds in its name, which no line that is added moves. With neither it is the time of its last change.
+std::optional<WallTime> logFileCreationDate(const struct statx& status, std::string_view name);
 
 /// A wall time as the log shows it, in UTC: "2026-11-24 20:31:29 +0000".
 std::string logDate(WallTime time);
