@@ -7,6 +7,7 @@
 #include "backends/WrenPayload.h"
 #include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
+#include "util/SamplingDraw.h"
 
 namespace vesk {
 
@@ -61,6 +62,7 @@ std::shared_ptr<WrenBackend> WrenBackend::create(const std::string& name,
   auto bundle = bundleForClientType(clientType);
   if (!bundle) {
     VESK_LOG_ERROR("WrenBackend(initWithName): No matching bundle found for client type %d", clientType);
+    nextSamplingDraw();  // one that is refused takes its place in the sequence all the same
     return nullptr;
   }
   return std::shared_ptr<WrenBackend>(new WrenBackend(

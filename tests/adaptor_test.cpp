@@ -14,6 +14,7 @@
 #include "tests/support/CapturedLog.h"
 #include "tests/support/DaemonHarness.h"
 #include "tests/support/TempDirectory.h"
+#include "util/SamplingDraw.h"
 
 namespace vesk::test {
 namespace {
@@ -70,6 +71,13 @@ TEST_F(AdaptorTest, OnlyTwoClientTypesHaveOne) {
   log.clear();
   EXPECT_FALSE(WrenBackend::create("wren", Dictionary(), Text("Phone"), harness.services));
   EXPECT_EQ(log.count(3, "WrenBackend(initWithName): No matching bundle found for client type 0"), 1);
+
+  ::srand48(1);
+  nextSamplingDraw();
+  const double second = nextSamplingDraw();
+  ::srand48(1);
+  EXPECT_FALSE(make(8));
+  EXPECT_EQ(make()->samplingFactor(), second) << "the refused one took the first";
 }
 
 TEST_F(AdaptorTest, WhatIsOfNoUseCostsALineForEachMessage) {
