@@ -1,5 +1,7 @@
 #include "storebag/StorebagFetch.h"
 
+#include <strings.h>
+
 #include <algorithm>
 #include <chrono>
 #include <limits>
@@ -33,6 +35,16 @@ HTTPRequest requestFor(const std::string& url, const std::optional<std::string>*
     request.headers.emplace_back("If-Modified-Since", **lastModified);
   }
   return request;
+}
+
+/// What the answer says in that header, on however many lines; none without it.
+std::optional<std::string> listInHeader(const HTTPResponse& response, std::string_view name) {
+  std::optional<std::string> list;
+  for (const auto& [each, value] : response.headers) {
+    if (each.size() != name.size() || ::strncasecmp(each.data(), name.data(), name.size()) != 0) continue;
+    list = list ? *list + ", " + value : value;
+  }
+  return list;
 }
 
 /// Whether the answer says that the caller's storebag is still the current one; else notes what it says about
@@ -126,7 +138,7 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryF
     VESK_LOG_INFO("fetchStorebagWithName: Loading default storebag '%s'", std::string(name).c_str());
     return fallbackStorebag();
   }
-  maxAge = maxAgeFromCacheControl(result.response->header("Cache-Control"));
+  maxAge = maxAgeFromCacheControl(listInHeader(*result.response, "Cache-Control"));
   if (hasNotChanged(*result.response, lastModified)) {
     notModified = true;
     return std::nullopt;

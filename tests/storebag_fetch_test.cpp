@@ -114,7 +114,7 @@ class StorebagFetch : public testing::Test {
 };
 
 TEST_F(StorebagFetch, ReturnsTheSectionOfTheEnvironment) {
-  serve(signedStorebag(payload()), {{"Cache-Control", "public, max-age=600"}});
+  serve(signedStorebag(payload()), {{"Cache-Control", "public"}, {"cache-control", "max-age=600"}});
   EXPECT_EQ(fetch(), kSeed);
   EXPECT_EQ(version, "2.5");
   EXPECT_EQ(maxAge, 600);
