@@ -127,8 +127,8 @@ std::optional<std::string> UploadBackend::contentsOf(const LentFile& file) const
     VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Input file was not read in time");
     return std::nullopt;
   }
-  if (reading == LentFile::Reading::Changed) {
-    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Input file was changed while it was read");
+  if (reading == LentFile::Reading::Shrank) {
+    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Input file has shrunk while it was uploaded");
     return std::nullopt;
   }
   if (reading == LentFile::Reading::Unreadable) {

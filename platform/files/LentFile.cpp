@@ -32,12 +32,10 @@ LentFile::Reading LentFile::read(std::string& bytes, const std::function<bool()>
     ssize_t count = ::pread(_descriptor.get(), bytes.data() + done, piece, static_cast<off_t>(done));
     if (count < 0 && errno == EINTR) continue;
     if (count < 0) return Reading::Unreadable;
-    if (count == 0) return Reading::Changed;
+    if (count == 0) return Reading::Shrank;
     done += static_cast<std::size_t>(count);
   }
-  struct stat now {};
-  if (::fstat(_descriptor.get(), &now) != 0) return Reading::Unreadable;
-  return isUnchanged(now) ? Reading::Whole : Reading::Changed;
+  return Reading::Whole;
 }
 
 bool LentFile::removeFrom(const std::string& path, uid_t user) const {

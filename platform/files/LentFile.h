@@ -29,12 +29,12 @@ class LentFile {
   enum class Reading : unsigned char {
     Whole,
     Unreadable,  ///< the client itself could not read it, or the device fails
-    Changed,     ///< not of one piece: it was changed while it was read
+    Shrank,      ///< it has fewer bytes than it had
     GivenUp      ///< `goOn` said so
   };
-  /// Reads all `size()` bytes; `bytes` is of no use unless they are Whole. Leaves the client's position in
-  /// the file alone. `goOn` is asked before each piece: the file's device may be as slow as its client likes.
-  /// Throws std::bad_alloc.
+  /// Reads the first `size()` bytes, however many follow by now; `bytes` is of no use unless they are Whole.
+  /// Leaves the client's position in the file alone. `goOn` is asked before each piece: the file's device may
+  /// be as slow as its client likes. Throws std::bad_alloc.
   [[nodiscard]] Reading read(std::string& bytes, const std::function<bool()>& goOn) const;
 
   /// Removes the file from `path` when that still names this very file, unchanged, and when `user` owns it or
