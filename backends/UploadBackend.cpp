@@ -17,12 +17,14 @@ namespace {
 
 constexpr char kDescription[] = "Tellvue MQRC log";
 
-// A file of the largest size may take hours on a thin line; a small one that takes so long hangs.
 constexpr std::chrono::seconds kLeastTimeout{60};
-constexpr std::size_t kLeastBytesPerSecond = std::size_t{32} << 10;
+// Others wait for the room that a file takes while it is read.
+constexpr std::size_t kLeastRead = std::size_t{32} << 10;  // bytes a second
+// A large file may take a day on a thin line, but a server that takes next to nothing hangs.
+constexpr std::size_t kLeastSent = std::size_t{1} << 10;
 
-std::chrono::milliseconds timeoutFor(std::size_t bytes) {
-  return kLeastTimeout + std::chrono::seconds(bytes / kLeastBytesPerSecond);
+std::chrono::seconds timeoutFor(std::size_t bytes, std::size_t bytesPerSecond) {
+  return kLeastTimeout + std::chrono::seconds(bytes / bytesPerSecond);
 }
 
 std::string lastComponentOf(const std::string& path) { return path.substr(path.rfind('/') + 1); }
@@ -106,7 +108,8 @@ bool UploadBackend::upload(const std::string& path, const std::string& extension
     VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Unable to create URL request");
     return false;
   }
-  request->timeout = timeoutFor(compressed->size);
+  request->timeout = timeoutFor(compressed->size, kLeastSent);
+  request->leastBytesPerSecond = kLeastSent;
   request->body.assign(compressed->bytes.get(), compressed->size);
   compressed.reset();
   pass->shrinkTo(request->body.size());
@@ -120,7 +123,7 @@ bool UploadBackend::upload(const std::string& path, const std::string& extension
 std::optional<std::string> UploadBackend::contentsOf(const LentFile& file) const {
   std::string contents;
   // A file system may be slow on purpose, and others wait for the room that its file takes.
-  const auto deadline = std::chrono::steady_clock::now() + timeoutFor(file.size());
+  const auto deadline = std::chrono::steady_clock::now() + timeoutFor(file.size(), kLeastRead);
   LentFile::Reading reading = file.read(
       contents, [&] { return _services.uploads->isOpen() && std::chrono::steady_clock::now() < deadline; });
   if (reading == LentFile::Reading::GivenUp) {

@@ -250,6 +250,28 @@ TEST(HTTPClient, TakesAProxysAnswerForNoAnswer) {
   ::unsetenv("https_proxy");
 }
 
+TEST(HTTPClient, GivesUpWhatMovesTooSlowlyAndOnlyThat) {
+  RecordingServer server([](const HTTPReceived& received, std::size_t) {
+    auto answer = faulty(received.method == "POST" ? Fault::SlowBody : Fault::Stall, "0123456789");
+    answer.pause = 150ms;
+    return answer;
+  });
+  HTTPClient client;
+  auto perform = [&](const char* method) {
+    HTTPRequest request;
+    request.url = server.url();
+    request.method = method;
+    request.leastBytesPerSecond = 1;
+    request.slowFor = 1s;
+    return std::async(std::launch::async, [&client, request] { return client.perform(request); });
+  };
+  auto steady = perform("POST");
+  const HTTPResult stalled = perform("GET").get();
+  ASSERT_TRUE(stalled.error);
+  EXPECT_EQ(stalled.error->kind, Kind::Timeout);
+  EXPECT_TRUE(steady.get().response);
+}
+
 TEST(HTTPClient, TakesABodyUpToTheLimitAndNoEndOfHeaders) {
   RecordingServer server([](const HTTPReceived& request, std::size_t) {
     HTTPAnswer answer;

@@ -32,6 +32,10 @@ struct HTTPRequest {
   std::string body;
   /// From `start` to the last byte; for a post that may be retried, from the start of each attempt.
   std::chrono::milliseconds timeout{60'000};
+  /// A request that moves fewer bytes than that, to and fro, for as long as `slowFor` is given up as timed
+  /// out. 0: it may stand still until its timeout.
+  long leastBytesPerSecond = 0;
+  std::chrono::seconds slowFor{120};
   Retry retry = Retry::Never;
 };
 

@@ -199,6 +199,8 @@ void HTTPTransfer::setTimes(const HTTPExchange& exchange, HTTPExchange::Instant 
   // libcurl takes 0 for "no limit".
   long limit = std::max<long>(static_cast<long>(timeout.count()), 1);
   set(handle(), CURLOPT_TIMEOUT_MS, limit);
+  set(handle(), CURLOPT_LOW_SPEED_LIMIT, exchange.request.leastBytesPerSecond);
+  set(handle(), CURLOPT_LOW_SPEED_TIME, static_cast<long>(exchange.request.slowFor.count()));
   set(handle(), CURLOPT_CONNECTTIMEOUT_MS, std::clamp<long>(_connectTimeout, 1, limit));
 }
 
