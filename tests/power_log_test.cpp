@@ -27,12 +27,27 @@ class PowerLogTest : public testing::Test {
     PowerLog::Options made;
     made.path = path;
     made.clock = &clock;
+    made.uptime = [this] { return uptime; };
     made.onLost = [this](std::uint64_t events) { lost += events; };
     return made;
+  }
+  void pass(std::chrono::seconds time) {
+    clock.advance(time);
+    uptime += time;
   }
   void record(PowerLog& powerLog, Dictionary dictionary = {{"k", 1}}) {
     powerLog.KLLogRegisteredEvent(28, "Rookery-Vesk", dictionary, std::nullopt);
     powerLog.flush();
+  }
+  void recordWithoutRoom(PowerLog& powerLog) {
+    rlimit before{};
+    ::getrlimit(RLIMIT_FSIZE, &before);
+    ::signal(SIGXFSZ, SIG_IGN);
+    rlimit full = before;
+    full.rlim_cur = 1;
+    ::setrlimit(RLIMIT_FSIZE, &full);
+    record(powerLog);
+    ::setrlimit(RLIMIT_FSIZE, &before);
   }
   std::vector<PowerLogEvent> events(WallTime since = {}) const {
     std::vector<PowerLogEvent> all;
@@ -48,6 +63,7 @@ class PowerLogTest : public testing::Test {
   TempDirectory directory;
   const std::string path = directory.path() / "power-log.sqlite";
   HandClock clock;
+  std::chrono::seconds uptime{60};
   std::atomic<std::uint64_t> lost{0};
 };
 
@@ -84,20 +100,38 @@ TEST_F(PowerLogTest, KeepsWhatIsYoungEnoughAndNotTooMuch) {
   PowerLog powerLog(few);
   for (int i = 0; i < 5; ++i) {
     record(powerLog, {{"i", i}});
-    clock.advance(std::chrono::days(1));
+    pass(std::chrono::days(1));
   }
   ASSERT_EQ(events().size(), 3u);
   EXPECT_EQ(events().at(0).dictionary, R"({"i":2})");
   EXPECT_EQ(events(clock.now() - std::chrono::days(2)).size(), 2u);
-  clock.advance(std::chrono::days(4));  // the last but one is 8 days old, less one
+  pass(std::chrono::days(4));  // the last but one is 8 days old, less one
   record(powerLog, {{"i", 5}});
   EXPECT_EQ(events().size(), 3u);
-  clock.advance(std::chrono::days(5));
+  pass(std::chrono::days(5));
   record(powerLog, {{"i", 6}});
   EXPECT_EQ(events().size(), 2u);
   EXPECT_EQ(lost, 0u);
   record(powerLog, {{"text", std::string(100, 'x')}});
   EXPECT_EQ(lost, 1u) << "too large";
+}
+
+TEST_F(PowerLogTest, SettingTheClockDeletesNothingOfThisRun) {
+  {
+    PowerLog powerLog(options());
+    record(powerLog);
+    clock.advance(std::chrono::days(30));
+    record(powerLog);
+    EXPECT_EQ(events().size(), 2u);
+    pass(std::chrono::days(7) + std::chrono::hours(1));
+    record(powerLog);
+    EXPECT_EQ(events().size(), 1u) << "as old as they can be";
+  }
+  uptime = std::chrono::seconds(60);  // another boot
+  clock.advance(std::chrono::days(8));
+  PowerLog powerLog(options());
+  record(powerLog);
+  EXPECT_EQ(events().size(), 1u);
 }
 
 TEST_F(PowerLogTest, BeginsADamagedFileAnewAndKeepsTheOldOne) {
@@ -125,6 +159,22 @@ TEST_F(PowerLogTest, BeginsADamagedFileAnewAndKeepsTheOldOne) {
   record(powerLog);
   EXPECT_EQ(events().size(), 1u) << "as when another daemon was the first to find the damage";
   EXPECT_EQ(lost, 0u);
+}
+
+TEST_F(PowerLogTest, DamageThatComesLaterIsMetWhereItIs) {
+  CapturedLog log;
+  for (int i = 0; i < 2; ++i) record(*std::make_unique<PowerLog>(options()), {{"k", std::string(9000, 'x')}});
+  PowerLog powerLog(options());
+  record(powerLog);
+  recordWithoutRoom(powerLog);  // which makes it open the file again
+  for (const char* suffix : {"-wal", "-shm"}) fs::remove(path + suffix);
+  const auto size = fs::file_size(path);
+  fs::resize_file(path, 4096);
+  fs::resize_file(path, size);
+  record(powerLog);
+  EXPECT_EQ(log.countContaining(3, "is damaged"), 1);
+  EXPECT_EQ(events().size(), 1u);
+  EXPECT_EQ(lost, 1u);
 }
 
 TEST_F(PowerLogTest, OneThatCanNotBeMovedAwayCostsOneLine) {
@@ -178,14 +228,7 @@ TEST_F(PowerLogTest, TwoWritersShareIt) {
 TEST_F(PowerLogTest, WithoutRoomEventsAreLostAndCounted) {
   PowerLog powerLog(options());
   record(powerLog);
-  rlimit before{};
-  ::getrlimit(RLIMIT_FSIZE, &before);
-  ::signal(SIGXFSZ, SIG_IGN);
-  rlimit full = before;
-  full.rlim_cur = 1;
-  ::setrlimit(RLIMIT_FSIZE, &full);
-  record(powerLog);
-  ::setrlimit(RLIMIT_FSIZE, &before);
+  recordWithoutRoom(powerLog);
   EXPECT_EQ(lost, 1u);
   record(powerLog);
   EXPECT_EQ(lost, 1u) << "it is over";

@@ -107,7 +107,7 @@ void PowerLog::run() noexcept {
 void PowerLog::write(PowerLogStore& store, const std::vector<PowerLogEvent>& events) noexcept {
   std::string error;
   try {
-    error = store.append(events, _options.clock->now());
+    error = store.append(events, {_options.clock->now(), _options.uptime()});
   } catch (const std::exception& exception) {
     error = exception.what();
   }

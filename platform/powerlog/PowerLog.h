@@ -14,6 +14,7 @@
 
 #include "platform/powerlog/PowerLogEvent.h"
 #include "platform/sync/Mutex.h"
+#include "platform/time/Clock.h"
 #include "platform/values/Value.h"
 
 namespace vesk {
@@ -32,6 +33,8 @@ class PowerLog {
     std::size_t maximumEvent = std::size_t{64} << 10;              ///< bytes of one event
     std::chrono::milliseconds patience = std::chrono::seconds(5);  ///< with another process that writes
     const WallClock* clock = &WallClock::system();
+    /// How long the machine has been up, asleep or not.
+    std::function<std::chrono::seconds()> uptime = &systemUptime;
     /// Told how many events were lost, on any thread; must not block or throw.
     std::function<void(std::uint64_t events)> onLost;
   };

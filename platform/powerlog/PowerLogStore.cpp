@@ -40,9 +40,12 @@ int bindText(sqlite3_stmt* statement, int index, const std::string& text) {
 
 }  // namespace
 
-std::string PowerLogStore::append(const std::vector<PowerLogEvent>& events, WallTime now) {
+std::string PowerLogStore::append(const std::vector<PowerLogEvent>& events, const Moment& now) {
   // Another process may have begun the file anew, or somebody removed it.
-  if (_database && !(fileAtPath() == _opened)) _database.reset();
+  if (!(fileAtPath() == _opened)) {
+    _database.reset();
+    _checked = {};  // a new file may get the number of the old one
+  }
   int result = openAndWrite(events, now);
   if (isDamage(result)) {
     const std::string damage = sqlite3_errstr(result);
@@ -59,7 +62,7 @@ std::string PowerLogStore::append(const std::vector<PowerLogEvent>& events, Wall
   return sqlite3_errstr(result);
 }
 
-int PowerLogStore::openAndWrite(const std::vector<PowerLogEvent>& events, WallTime now) {
+int PowerLogStore::openAndWrite(const std::vector<PowerLogEvent>& events, const Moment& now) {
   const int result = _database ? SQLITE_OK : open();
   return result == SQLITE_OK ? write(events, now) : result;
 }
@@ -81,14 +84,23 @@ int PowerLogStore::open() {
   result = execute(database, kSetUp);
   if (result != SQLITE_OK) return result;
   _opened = fileAtPath();
-  auto check = prepare(database, "PRAGMA quick_check(1)");
-  result = check ? sqlite3_step(check.get()) : sqlite3_errcode(database);
-  if (result != SQLITE_ROW) return result;
-  const auto* verdict = sqlite3_column_text(check.get(), 0);
-  return verdict && std::string(reinterpret_cast<const char*>(verdict)) == "ok" ? SQLITE_OK : SQLITE_CORRUPT;
+  // Once: it reads the whole file, and what is damaged later shows where it is come upon.
+  return _checked == _opened ? SQLITE_OK : check();
 }
 
-int PowerLogStore::write(const std::vector<PowerLogEvent>& events, WallTime now) {
+int PowerLogStore::check() {
+  auto row = prepare(_database.get(), "PRAGMA quick_check(1)");
+  const int result = row ? sqlite3_step(row.get()) : sqlite3_errcode(_database.get());
+  if (result != SQLITE_ROW) return result;
+  const auto* verdict = sqlite3_column_text(row.get(), 0);
+  if (!verdict || std::string(reinterpret_cast<const char*>(verdict)) != "ok") return SQLITE_CORRUPT;
+  _checked = _opened;
+  _found = number("SELECT max(id) FROM events");
+  _added.clear();
+  return SQLITE_OK;
+}
+
+int PowerLogStore::write(const std::vector<PowerLogEvent>& events, const Moment& now) {
   int result = execute(_database.get(), "BEGIN IMMEDIATE");
   if (result == SQLITE_OK) result = insert(events);
   if (result == SQLITE_OK) result = prune(now);
@@ -113,16 +125,31 @@ int PowerLogStore::insert(const std::vector<PowerLogEvent>& events) {
   return SQLITE_OK;
 }
 
-int PowerLogStore::prune(WallTime now) {
-  auto oldest = prepare(_database.get(), "DELETE FROM events WHERE time < ?1");
-  if (!oldest) return sqlite3_extended_errcode(_database.get());
-  sqlite3_bind_double(oldest.get(), 1, secondsOf(now - _bounds.age));
-  int result = sqlite3_step(oldest.get());
+int PowerLogStore::dropAged(const Moment& now) {
+  using std::chrono::hours;
+  auto found = prepare(_database.get(), "DELETE FROM events WHERE time < ?1 AND id <= ?2");
+  if (!found) return sqlite3_extended_errcode(_database.get());
+  sqlite3_bind_double(found.get(), 1, secondsOf(now.wall - _bounds.age));
+  sqlite3_bind_int64(found.get(), 2, _found);
+  const int result = sqlite3_step(found.get());
   if (result != SQLITE_DONE) return result;
+
+  _added[std::chrono::floor<hours>(now.uptime)] = number("SELECT max(id) FROM events");
+  std::int64_t aged = 0;
+  while (_added.begin()->first + hours(1) + _bounds.age <= now.uptime) {
+    aged = _added.begin()->second;
+    _added.erase(_added.begin());
+  }
+  return remove("DELETE FROM events WHERE id <= ?1", aged);
+}
+
+int PowerLogStore::prune(const Moment& now) {
+  int result = dropAged(now);
+  if (result != SQLITE_OK) return result;
   result = remove("DELETE FROM events WHERE id <= (SELECT max(id) FROM events) - ?1", _bounds.rows);
   if (result != SQLITE_OK) return result;
   const std::int64_t used =
-      (pragma("PRAGMA page_count") - pragma("PRAGMA freelist_count")) * pragma("PRAGMA page_size");
+      (number("PRAGMA page_count") - number("PRAGMA freelist_count")) * number("PRAGMA page_size");
   if (used <= _bounds.bytes) return SQLITE_OK;
   // Its pages are used again; a quarter at a time, so that this is seldom.
   return remove("DELETE FROM events WHERE id <= (SELECT min(id) + (max(id) - min(id)) / ?1 FROM events)", 4);
@@ -136,10 +163,10 @@ int PowerLogStore::remove(const char* statement, std::int64_t bound) {
   return result == SQLITE_DONE ? SQLITE_OK : result;
 }
 
-std::int64_t PowerLogStore::pragma(const char* name) {
-  auto statement = prepare(_database.get(), name);
-  if (!statement || sqlite3_step(statement.get()) != SQLITE_ROW) return 0;
-  return sqlite3_column_int64(statement.get(), 0);
+std::int64_t PowerLogStore::number(const char* statement) {
+  auto row = prepare(_database.get(), statement);
+  if (!row || sqlite3_step(row.get()) != SQLITE_ROW) return 0;
+  return sqlite3_column_int64(row.get(), 0);
 }
 
 bool PowerLogStore::lockOthersOut(FileDescriptor& lock) const {
@@ -149,6 +176,7 @@ bool PowerLogStore::lockOthersOut(FileDescriptor& lock) const {
 
 std::string PowerLogStore::setAside() {
   _database.reset();
+  _checked = {};
   FileDescriptor lock;
   if (!lockOthersOut(lock)) return sqlite3_errstr(SQLITE_BUSY);
   // Another process may have found the same damage first.

@@ -5,6 +5,7 @@
 
 #include <chrono>
 #include <cstdint>
+#include <map>
 #include <string>
 #include <vector>
 
@@ -26,11 +27,16 @@ class PowerLogStore {
     std::chrono::milliseconds patience = std::chrono::seconds(5);  ///< with another process, each time
   };
 
+  struct Moment {
+    WallTime wall;
+    std::chrono::seconds uptime{0};  ///< of the machine, asleep or not; nobody sets it
+  };
+
   PowerLogStore(std::string path, const Bounds& bounds) : _path(std::move(path)), _bounds(bounds) {}
 
   /// Adds all events or none, and drops what is beyond the bounds. What went wrong comes back as text; empty:
   /// nothing did.
-  [[nodiscard]] std::string append(const std::vector<PowerLogEvent>& events, WallTime now);
+  [[nodiscard]] std::string append(const std::vector<PowerLogEvent>& events, const Moment& now);
 
  private:
   /// Which file a path names.
@@ -40,13 +46,15 @@ class PowerLogStore {
     friend bool operator==(const Identity&, const Identity&) = default;
   };
 
-  int openAndWrite(const std::vector<PowerLogEvent>& events, WallTime now);
+  int openAndWrite(const std::vector<PowerLogEvent>& events, const Moment& now);
   int open();
-  int write(const std::vector<PowerLogEvent>& events, WallTime now);
+  int check();
+  int write(const std::vector<PowerLogEvent>& events, const Moment& now);
   int insert(const std::vector<PowerLogEvent>& events);
-  int prune(WallTime now);
+  int prune(const Moment& now);
+  int dropAged(const Moment& now);
   int remove(const char* statement, std::int64_t bound);
-  std::int64_t pragma(const char* name);
+  std::int64_t number(const char* statement);
   /// Why it could not; empty: it is out of the way.
   std::string setAside();
   /// Other processes neither set up the file nor put it aside while `lock` is held. False when another one
@@ -58,6 +66,11 @@ class PowerLogStore {
   const Bounds _bounds;
   SQLiteDatabase _database;
   Identity _opened;
+  Identity _checked;        ///< found whole; of this file the following is known
+  std::int64_t _found = 0;  ///< the last row that was there then: up to it, rows age by the wall clock
+  /// The last row at the end of each hour of uptime since. These rows age by the uptime: a device that starts
+  /// with a wrong time and then learns the right one must not lose what it has just recorded.
+  std::map<std::chrono::hours, std::int64_t> _added;
 };
 
 }  // namespace vesk

@@ -1,5 +1,7 @@
 #include "platform/time/Clock.h"
 
+#include <ctime>
+
 namespace vesk {
 
 namespace {
@@ -12,6 +14,12 @@ class SystemWallClock final : public WallClock {
 };
 
 }  // namespace
+
+std::chrono::seconds systemUptime() noexcept {
+  timespec time{};
+  ::clock_gettime(CLOCK_BOOTTIME, &time);
+  return std::chrono::seconds(time.tv_sec);
+}
 
 const WallClock& WallClock::system() {
   static const SystemWallClock clock;

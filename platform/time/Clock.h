@@ -19,6 +19,10 @@ class WallClock {
   static const WallClock& system();
 };
 
+/// How long the machine has been up, the time that it slept included. Goes on evenly, whatever is done to the
+/// wall clock.
+std::chrono::seconds systemUptime() noexcept;
+
 /// A wall time as POSIX has it.
 inline timeval timevalFrom(WallTime time) {
   auto seconds = std::chrono::floor<std::chrono::seconds>(time);
