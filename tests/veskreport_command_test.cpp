@@ -1,5 +1,7 @@
 // Runs the veskreport program against a daemon's end that keeps a record, and against none.
 #include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 #include <csignal>
 
@@ -190,6 +192,19 @@ TEST_F(VeskreportCommand, SaysThatNoDaemonIsThere) {
   EXPECT_EQ(outcome.errors, "veskreport: no daemon at " + root +
                                 "/run/veskreportingd/com.corvane.veskreportingd: is veskreportingd running? "
                                 "(No such file or directory)\n");
+}
+
+TEST_F(VeskreportCommand, ObeysTheEnvironmentUnlessItIsSetuid) {
+  const std::string copy = directory / "veskreport";
+  std::filesystem::copy_file(VESK_BIN_DIRECTORY "/veskreport", copy);
+  if (::chown(copy.c_str(), 65534, 65534) != 0) GTEST_SKIP() << "needs the right to give files away";
+  for (mode_t mode : {0755, 04755}) {
+    ASSERT_EQ(::chmod(copy.c_str(), mode), 0);
+    ChildProcess process(ChildProcess::Options{.command = {copy, "states", "--client-type", "5"},
+                                               .environment = {{"VESKREPORTINGD_ROOT", root}}});
+    EXPECT_EQ(process.wait(), mode == 0755 ? 0 : 1);
+    EXPECT_EQ(process.errors().find(root), std::string::npos);
+  }
 }
 
 TEST_F(VeskreportCommand, WrongUsageIsStatusTwo) {

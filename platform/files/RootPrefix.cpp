@@ -1,6 +1,6 @@
 #include "platform/files/RootPrefix.h"
 
-#include <cstdlib>
+#include <stdlib.h>
 
 namespace vesk {
 
@@ -13,7 +13,8 @@ std::string normalized(std::string_view prefix) {
 
 std::string& storage() {
   static std::string prefix = [] {
-    const char* fromEnvironment = std::getenv("VESKREPORTINGD_ROOT");
+    // The client library asks in any program: who starts a setuid one must not choose its daemon and files.
+    const char* fromEnvironment = ::secure_getenv("VESKREPORTINGD_ROOT");
     return normalized(fromEnvironment ? fromEnvironment : "");
   }();
   return prefix;

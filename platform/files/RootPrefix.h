@@ -7,7 +7,9 @@
 namespace vesk {
 
 /// The directory that stands for "/" (without a trailing slash; "" is the real root). What `setRootPrefix`
-/// set, else the environment variable VESKREPORTINGD_ROOT, else the real root. Thread-safe after start-up.
+/// set, else the environment variable VESKREPORTINGD_ROOT, else the real root. A program that runs with more
+/// rights than its caller (setuid, setgid, file capabilities) ignores the variable. Thread-safe after
+/// start-up.
 const std::string& rootPrefix();
 
 /// Called once, first thing in `main`, before any thread starts.

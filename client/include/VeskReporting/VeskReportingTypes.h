@@ -74,7 +74,7 @@ using AggregationHandler = std::function<void(const AggregatedMessage& message)>
 /// How a session behaves; the defaults suit a service that sends now and then.
 struct ReportingOptions {
   /// The daemon's socket. Empty: /run/veskreportingd/com.corvane.veskreportingd, under the directory that
-  /// VESKREPORTINGD_ROOT names when it is set.
+  /// VESKREPORTINGD_ROOT names when it is set (and the program is not a setuid one).
   std::string socketPath;
   /// What may wait to be sent, also while the daemon is away; more is dropped.
   std::size_t maximumQueuedMessages = 4096;
