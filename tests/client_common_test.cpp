@@ -81,6 +81,18 @@ TEST(ClientIdentifiers, AreOnePerConsentModeAndLast) {
   EXPECT_EQ(status.st_mode & 0777, 0600U);
 }
 
+TEST(ClientIdentifiers, BelongToTheDirectorysOwnerWhenRootAsksFirst) {
+  TempDirectory directory;
+  if (::chown(directory.path().c_str(), 65534, 65534) != 0)
+    GTEST_SKIP() << "needs the right to give files away";
+  PersistentIdentifiers(directory / "identifiers.toml").identifier(true);
+  for (const char* name : {"identifiers.toml", "identifiers.toml.lock"}) {
+    struct stat status {};
+    ASSERT_EQ(::stat((directory / name).c_str(), &status), 0) << name;
+    EXPECT_EQ(status.st_uid, 65534U) << name;
+  }
+}
+
 TEST(ClientIdentifiers, RacingFirstUsesAgree) {
   TempDirectory directory;
   std::string path = directory / "identifiers.toml";

@@ -1,6 +1,5 @@
 #include "client/common/PersistentIdentifiers.h"
 
-#include <fcntl.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -16,6 +15,7 @@
 #include "platform/crypto/UUID.h"
 #include "platform/files/FileDescriptor.h"
 #include "platform/files/FileLock.h"
+#include "platform/files/PrivateFile.h"
 #include "platform/files/RootPrefix.h"
 #include "platform/files/SmallFile.h"
 #include "platform/files/WriteAll.h"
@@ -100,7 +100,7 @@ int PersistentIdentifiers::store(const Pair& pair) const {
   // The lock's holder is alone with this name; what a crashed one left is overwritten.
   std::string temporary = _path + ".new";
   ::unlink(temporary.c_str());
-  FileDescriptor file(::open(temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600));
+  FileDescriptor file = makePrivateFile(temporary);
   if (!file) return errno;
   int cause = writeAll(file.get(), text);
   if (cause == 0 && (::fsync(file.get()) != 0 || std::rename(temporary.c_str(), _path.c_str()) != 0))

@@ -14,9 +14,10 @@ namespace vesk {
 /// which stands on the one instance for /var/lib/veskreportingd/identifiers.toml.
 ///
 /// The file is made on first use: complete or not at all (rename), mode 0600, and by one process when several
-/// race (lock file beside it, which is waited for half a second at most). One that can't be read or
-/// understood is kept aside as "<path>.bad" and new identifiers are made, with a level-4 line. Identifiers
-/// that can't be stored live as long as this object. Thread-safe.
+/// race (lock file beside it, which is waited for half a second at most). What root makes belongs to the
+/// directory's owner, the daemon's user. One that can't be read or understood is kept aside as "<path>.bad"
+/// and new identifiers are made, with a level-4 line. Identifiers that can't be stored live as long as this
+/// object. Thread-safe.
 class PersistentIdentifiers {
  public:
   explicit PersistentIdentifiers(std::string path) : _path(std::move(path)) {}

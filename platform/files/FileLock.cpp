@@ -6,6 +6,8 @@
 #include <cerrno>
 #include <thread>
 
+#include "platform/files/PrivateFile.h"
+
 namespace vesk {
 
 namespace {
@@ -16,7 +18,8 @@ constexpr std::chrono::milliseconds kBetweenAttempts{10};
 
 int lockFile(FileDescriptor& lock, const std::string& path, std::chrono::milliseconds patience) {
   lock.reset();
-  FileDescriptor file(::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
+  FileDescriptor file = makePrivateFile(path);
+  if (!file && errno == EEXIST) file = FileDescriptor(::open(path.c_str(), O_RDWR | O_CLOEXEC | O_NOFOLLOW));
   if (!file) return errno;
   const auto deadline = std::chrono::steady_clock::now() + patience;
   while (::flock(file.get(), LOCK_EX | LOCK_NB) != 0) {

@@ -8,9 +8,9 @@
 
 namespace vesk {
 
-/// Opens the file at `path`, made with mode 0600 where it is missing, and locks it until `lock` is closed,
-/// against other processes and other descriptors of this one. Waits `patience` at most for another's lock to
-/// go. 0 or the system's error number, EWOULDBLOCK when another kept the lock; `lock` is empty then.
+/// Opens the file at `path`, made as `makePrivateFile` does where it is missing, and locks it until `lock` is
+/// closed, against other processes and other descriptors of this one. Waits `patience` at most for another's
+/// lock to go. 0 or the system's error number, EWOULDBLOCK when another kept the lock; `lock` is empty then.
 [[nodiscard]] int lockFile(FileDescriptor& lock, const std::string& path, std::chrono::milliseconds patience);
 
 }  // namespace vesk

@@ -124,8 +124,8 @@ class VESK_API VeskReporting {
 
   /// A stable identifier of this device for events (UUID text): the one that respects the user's diagnostics
   /// consent when `respectsConsent`, else the one that overrides it. Made once and kept in
-  /// /var/lib/veskreportingd; one that can't be kept there is stable for the process's life. Empty only when
-  /// there is no memory.
+  /// /var/lib/veskreportingd, which belongs to the daemon: a process that is neither the daemon's user nor
+  /// root gets one of its own, stable for its life. Empty only when there is no memory.
   [[nodiscard]] static std::string getPersistentIdentifierForDNU(bool respectsConsent) noexcept;
 
   /// The version that the installed library declares; "7.0" when it declares none.
