@@ -8,6 +8,8 @@
 #include <string_view>
 #include <system_error>
 
+#include "platform/ipc/OneWayEncoder.h"
+
 namespace vesk {
 
 namespace {
@@ -28,6 +30,11 @@ std::string urlOf(const std::string& path) {
 }
 
 }  // namespace
+
+bool isEncodable(const ClientCall& call) {
+  std::string message;
+  return OneWayEncoder(wire::kObjectPath).append(call.call, 1, message) == CodecResult::Ok;
+}
 
 FileToUpload openToUpload(const std::string& path) {
   FileToUpload file;

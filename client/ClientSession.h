@@ -10,6 +10,7 @@
 
 #include "client/Answers.h"
 #include "client/BoundedWait.h"
+#include "client/CallBuilding.h"
 #include "client/ClientCall.h"
 #include "client/SessionThread.h"
 
@@ -71,6 +72,11 @@ class ClientSession {
   }
 
   ReportingStatus push(ClientCall&& call) {
+    // Told here and now: dropped on its way, it would leave the session what it was before, and nobody knew.
+    if (call.effect != CallEffect::None && !isEncodable(call)) {
+      worker().drops().invalid();
+      return ReportingStatus::InvalidArgument;
+    }
     ReportingStatus status = worker().queue().push(std::move(call));
     if (status == ReportingStatus::QueueFull && worker().drops().queueFull()) worker().queue().wake();
     return status;

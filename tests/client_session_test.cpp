@@ -152,8 +152,11 @@ TEST_F(ClientSession, RefusesWhatCannotBeSentAndGoesOn) {
             ReportingStatus::InvalidArgument)
       << "too long on the wire only";
   EXPECT_EQ(session.sendMessage(1, 1, Dictionary{{"k", "\xff"}}), ReportingStatus::Queued);
+  EXPECT_EQ(session.setSessionInfo(sessionInfo, Dictionary{{"k", "\xff"}}), ReportingStatus::InvalidArgument)
+      << "or the session would go on as what it was";
+  EXPECT_EQ(session.fetchStates(Dictionary{{"k", "\xff"}}, nullptr), ReportingStatus::InvalidArgument);
   EXPECT_EQ(session.sendMessageAndWait(1, 2).answer, "posted");
-  EXPECT_EQ(session.drops().invalid, 3U);
+  EXPECT_EQ(session.drops().invalid, 5U);
   EXPECT_EQ(session.uploadFile(directory / "missing").status, ReportingStatus::FileUnavailable);
   EXPECT_EQ(session.uploadFile(directory.path()).detail, "Is a directory");
 }

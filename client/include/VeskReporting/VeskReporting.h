@@ -41,7 +41,8 @@ class VESK_API VeskReporting {
   ReportingResult<std::monostate> connect(std::chrono::milliseconds timeout = kDefaultTimeout) noexcept;
 
   /// 1. Says who reports, on whose behalf and, with an aggregation handler, that this client wants the
-  /// messages of the sessions below its own. Replaces what an earlier call said.
+  /// messages of the sessions below its own. Replaces what an earlier call said, unless it can't be sent
+  /// (InvalidArgument).
   ReportingStatus setSessionInfo(Dictionary sessionInfo, std::optional<Dictionary> userInfo = std::nullopt,
                                  std::vector<std::string> frameworksToCheck = {},
                                  AggregationHandler aggregationHandler = nullptr) noexcept;
