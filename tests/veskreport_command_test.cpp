@@ -66,9 +66,12 @@ TEST_F(VeskreportCommand, EachCommandPrintsItsAnswer) {
                 R"(parameters {"category": 4, "type": 2, "flag": 0})"},
            Case{{"send-once", "-c", "1", "-t", "2", "k=v"}, "finished\n", "messageOnce "},
            Case{{"upload-file", file}, "uploaded " + file + "\n", "uploadFile file://" + file + " contents"},
-           Case{{"upload-log", "one", "two"},
+           Case{{"send", "-c", "5", "-t", "2", "[a=1,b]"},
+                "accepted\n",
+                R"(parameters {"category": 5, "type": 2, "payload": {"[a": "1,b]"}, "flag": 0})"},
+           Case{{"upload-log", "[a, b]", "two"},
                 "uploaded log data of 2 entries\n",
-                R"(uploadLogData ["one", "two"])"},
+                R"(uploadLogData ["[a, b]", "two"])"},
        }) {
     SCOPED_TRACE(c.arguments.front());
     auto outcome = runClient(c.arguments);
@@ -105,15 +108,21 @@ TEST_F(VeskreportCommand, AggregatePrintsWhatTheDaemonSendsAndEndsWithIt) {
 }
 
 TEST_F(VeskreportCommand, AggregateEndsWhenItIsToldTo) {
-  ChildProcess process({VESK_BIN_DIRECTORY "/veskreport", "aggregate", "--root", root, "--client-type", "5"});
-  ASSERT_TRUE(record.waitFor("startConfig"));
+  const std::vector<std::string> command{
+      VESK_BIN_DIRECTORY "/veskreport", "aggregate", "--count", "1", "--root", root, "--client-type", "5"};
+  ChildProcess process(command);
+  ASSERT_TRUE(process.waitForText("waiting for messages"));
   process.signal(SIGTERM);
   EXPECT_EQ(process.wait(), 0);
-  ChildProcess counting(
-      {VESK_BIN_DIRECTORY "/veskreport", "aggregate", "--root", root, "--client-type", "5", "--count", "1"});
+  ChildProcess counting(command);
   ASSERT_TRUE(record.waitFor("startConfig", 2));
   daemon->sendToClient(Dictionary{{"sessionID", 102}}, 1, 3, 2, std::nullopt);
   EXPECT_EQ(counting.wait(), 0);
+  record.holdsAnswers = true;
+  ChildProcess starting(command);
+  ASSERT_TRUE(record.waitFor("startConfig", 3));
+  starting.signal(SIGTERM);
+  EXPECT_EQ(starting.wait(), 128 + SIGTERM);
 }
 
 TEST_F(VeskreportCommand, IntroducesItselfAsTheOptionsSay) {
@@ -185,6 +194,17 @@ TEST_F(VeskreportCommand, SaysWhatFailed) {
   EXPECT_EQ(runClient({"flush"}).status, 1);
 }
 
+TEST_F(VeskreportCommand, SaysThatATextCannotBeSent) {
+  std::vector<std::string> tooLarge{"send", "-c", "1", "-t", "2", "--no-wait"};
+  for (char key = 'a'; key < 'l'; ++key) tooLarge.push_back(key + ("=" + std::string(100'000, 'x')));
+  for (const auto& arguments : {tooLarge, {"send", "-c", "1", "-t", "2", "--client-name", "Cam\xe9ra"}}) {
+    auto outcome = runClient(arguments);
+    EXPECT_EQ(outcome.status, 1);
+    EXPECT_EQ(outcome.errors, "veskreport: too large, nested too deeply or no valid text\n");
+    EXPECT_EQ(outcome.output, "");
+  }
+}
+
 TEST_F(VeskreportCommand, SaysThatNoDaemonIsThere) {
   daemon.reset();
   auto outcome = runClient({"states"});
@@ -217,6 +237,8 @@ TEST_F(VeskreportCommand, WrongUsageIsStatusTwo) {
            {"send", "--client-type", "5", "-c", "65536", "-t", "1"},
            {"send", "--client-type", "5", "-c", "1", "-t", "1", "no pair"},
            {"send", "--client-type", "5", "-c", "1", "-t", "1", "--stdin", "k=v"},
+           {"send", "--client-type", "5", "-c", "1", "-t", "1", "--stdin", "--no-wait"},
+           {"aggregate", "--client-type", "5", "--count", "-1"},
            {"states", "--client-type", "5", "--timeout", "0"},
            {"states", "--client-type", "5", "--timeout", "nan"},
            {"storebag", "sign"},

@@ -52,16 +52,9 @@ std::string words(const std::optional<Dictionary>& dictionary) {
 /// Prints on the session's thread and tells the main thread when there is nothing more to wait for.
 class Receiver {
  public:
-  Receiver(const Output& output, std::uint64_t enough) : _output(output), _enough(enough) {
-    sigset_t ends;
-    sigemptyset(&ends);
-    sigaddset(&ends, SIGINT);
-    sigaddset(&ends, SIGTERM);
-    ::pthread_sigmask(SIG_BLOCK, &ends, nullptr);
-    _signals = FileDescriptor(::signalfd(-1, &ends, SFD_CLOEXEC));
-    _end = FileDescriptor(::eventfd(0, EFD_CLOEXEC));
-    if (!_signals || !_end)
-      throw std::system_error(errno, std::generic_category(), "cannot wait for the end");
+  Receiver(const Output& output, std::uint64_t enough)
+      : _output(output), _enough(enough), _end(::eventfd(0, EFD_CLOEXEC)) {
+    if (!_end) throw std::system_error(errno, std::generic_category(), "eventfd");
   }
 
   void take(const AggregatedMessage& message) {
@@ -76,8 +69,17 @@ class Receiver {
     if (_received == _enough || std::ferror(stdout)) end();
   }
 
+  /// Until now, an interrupt ended the process.
   void waitForTheEnd() {
-    pollfd ends[] = {{_signals.get(), POLLIN, 0}, {_end.get(), POLLIN, 0}};
+    sigset_t interrupts;
+    sigemptyset(&interrupts);
+    sigaddset(&interrupts, SIGINT);
+    sigaddset(&interrupts, SIGTERM);
+    ::pthread_sigmask(SIG_BLOCK, &interrupts, nullptr);
+    FileDescriptor signals(::signalfd(-1, &interrupts, SFD_CLOEXEC));
+    if (!signals) throw std::system_error(errno, std::generic_category(), "signalfd");
+    if (!_output.isJSON()) _output.note("waiting for messages");
+    pollfd ends[] = {{signals.get(), POLLIN, 0}, {_end.get(), POLLIN, 0}};
     while (::poll(ends, 2, -1) < 0 && errno == EINTR) {
     }
     _ended = true;
@@ -104,8 +106,7 @@ class Receiver {
 
   const Output& _output;
   const std::uint64_t _enough;
-  FileDescriptor _signals;
-  FileDescriptor _end;
+  const FileDescriptor _end;
   std::atomic<bool> _ended{false};
   std::atomic<bool> _closed{false};
   std::atomic<std::uint64_t> _received{0};

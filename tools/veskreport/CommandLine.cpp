@@ -78,7 +78,8 @@ class Reader {
     addClient("flush", "Have the backends send what they hold back", Command::Flush);
     addClient("aggregate", "Show the messages of this session and of those below it as they are sent",
               Command::Aggregate)
-        ->add_option("--count", _invocation.aggregateCount, "End after so many messages (default: never)");
+        ->add_option("--count", _invocation.aggregateCount, "End after so many messages (default: never)")
+        ->check(CLI::NonNegativeNumber);
   }
 
   void addMessageCommands() {
@@ -88,7 +89,8 @@ class Reader {
                              : addClient("send", "Send messages in a session", Command::Send);
       auto* category = sub->add_option("-c,--category", message.category, "Category, 0 to 65535");
       auto* type = sub->add_option("-t,--type", message.type, "Type, 0 to 65535");
-      auto* payload = sub->add_option("payload", message.payload, "key=text and key:=json");
+      auto* payload = sub->add_option("payload", message.payload, "key=text and key:=json")
+                          ->allow_extra_args(false);  // or "[a,b]" counts as several
       if (isOnce) {
         category->required();
         type->required();
@@ -97,12 +99,14 @@ class Reader {
       sub->add_flag("--realtime", _realtime, "Post at once, past the batch");
       sub->add_flag("--override-sampling", _overrideSampling,
                     "Send although sampling leaves this device out");
-      sub->add_flag("--no-wait", message.noWait, "Send one way, without waiting for answers");
+      auto* noWait =
+          sub->add_flag("--no-wait", message.noWait, "Send one way, without waiting for an answer");
       sub->add_flag(
              "--stdin", message.fromStandardInput,
              "Send a message for each line of standard input: a JSON object, which is the payload when\n"
              "category and type are given, else {\"category\":…,\"type\":…,\"payload\":{…},\"flag\":…}")
-          ->excludes(payload);
+          ->excludes(payload)
+          ->excludes(noWait);
       category->needs(type);
       type->needs(category);
       sub->callback([this] {
@@ -124,7 +128,8 @@ class Reader {
       if (timeout->empty()) _timeout = kUploadTimeout;
     });
     CLI::App* log = addClient("upload-log", "Upload log data", Command::UploadLog);
-    auto* texts = log->add_option("text", upload.logData, "Entries of the log data");
+    auto* texts = log->add_option("text", upload.logData, "Entries of the log data")
+                      ->allow_extra_args(false);  // or "[a,b]" counts as several
     log->add_flag("--stdin", upload.fromStandardInput, "Take a JSON value from each line of standard input")
         ->excludes(texts);
   }

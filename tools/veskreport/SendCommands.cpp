@@ -50,6 +50,10 @@ int runSend(const Invocation& invocation, const Output& output) {
   if (message.noWait) {
     auto status = session.reporting().sendMessage(parameters);
     if (status != ReportingStatus::Queued) return session.failed(status, "");
+    // Calls keep their order: the answer to another one shows that the message has left, or never will.
+    auto next = session.reporting().fetchDisplayURL(invocation.identity.timeout);
+    if (session.reporting().drops().invalid > 0) return session.failed(ReportingStatus::InvalidArgument, "");
+    if (!next) return session.failed(next);
     return output.done("sent", {{"answer", Value()}});
   }
   auto sent = session.reporting().sendMessageAndWait(parameters, invocation.identity.timeout);
