@@ -31,7 +31,8 @@ class VESK_API VeskReporting {
   /// Starts the session's thread; the daemon is reached for with the first operation.
   explicit VeskReporting(ReportingOptions options = {}) noexcept;
   /// Waits until the daemon has taken and answered what is queued, at most for `ReportingOptions::drainTime`;
-  /// when no daemon was ever there, makes one attempt. Not from a callback.
+  /// when no daemon was ever there, makes one attempt. Waits for a callback or a handler that runs, however
+  /// long it does: not from one, and not under a lock that one wants.
   ~VeskReporting();
   VeskReporting(const VeskReporting&) = delete;
   VeskReporting& operator=(const VeskReporting&) = delete;
