@@ -126,12 +126,12 @@ TEST_F(VeskreportCommand, AggregateEndsWhenItIsToldTo) {
 }
 
 TEST_F(VeskreportCommand, IntroducesItselfAsTheOptionsSay) {
-  runClient({"states", "--client-version", "3", "--client-name", "Camera", "--service-name", "Demo",
+  runClient({"states", "--client-version", "3", "--client-name", "[Camera]", "--service-name", "Demo",
              "--user-info", "region=north", "--user-info", "floor:=2", "--require-user-info", "--batch"});
   EXPECT_EQ(
       record.lines().front(),
       R"(setSessionInfo {"sessionID": 7, "clientType": 5, "clientVersion": 3, "requireUserInfo": true, )"
-      R"("batchEvent": true} {"clientName": "Camera", "serviceName": "Demo", "region": "north", "floor": 2} [])");
+      R"("batchEvent": true} {"clientName": "[Camera]", "serviceName": "Demo", "region": "north", "floor": 2} [])");
 }
 
 TEST_F(VeskreportCommand, SendsEachLineOfStandardInput) {

@@ -3,6 +3,7 @@
 #include <CLI/CLI.hpp>
 #include <cmath>
 #include <cstdlib>
+#include <iterator>
 
 #include "tools/veskreport/Output.h"
 
@@ -18,6 +19,24 @@ std::string isNumber(const std::string& text) {
   return std::isnan(std::strtod(text.c_str(), nullptr)) ? text + " is no number" : "";
 }
 
+// Where an option or argument takes several values, "[a,b]" would be taken for two. With a mark behind it, it
+// isn't; the mark goes when the value is taken.
+constexpr char kMark = '\0';
+
+void mark(std::string& argument) {
+  if (argument.starts_with('[') && argument.ends_with(']')) argument += kMark;
+}
+
+std::string unmark(std::string& value) {
+  if (value.ends_with(kMark)) value.pop_back();
+  return "";
+}
+
+void unmarkValues(CLI::App& app) {
+  for (CLI::Option* option : app.get_options()) option->transform(CLI::Validator(unmark, ""));
+  for (CLI::App* sub : app.get_subcommands({})) unmarkValues(*sub);
+}
+
 class Reader {
  public:
   Reader() : _app("Talks to veskreportingd as a client, and makes storebags.", "veskreport") {
@@ -29,11 +48,14 @@ class Reader {
     addUploadCommands();
     addPowerLogCommand();
     addStorebagCommands();
+    unmarkValues(_app);
   }
 
   CommandLine read(int argc, char** argv) {
+    std::vector<std::string> backwards(std::reverse_iterator(argv + argc), std::reverse_iterator(argv + 1));
+    for (std::string& argument : backwards) mark(argument);
     try {
-      _app.parse(argc, argv);
+      _app.parse(backwards);
     } catch (const CLI::ParseError& error) {
       return {std::nullopt, _app.exit(error) == 0 ? kExitDone : kExitUsage};
     }
@@ -89,8 +111,7 @@ class Reader {
                              : addClient("send", "Send messages in a session", Command::Send);
       auto* category = sub->add_option("-c,--category", message.category, "Category, 0 to 65535");
       auto* type = sub->add_option("-t,--type", message.type, "Type, 0 to 65535");
-      auto* payload = sub->add_option("payload", message.payload, "key=text and key:=json")
-                          ->allow_extra_args(false);  // or "[a,b]" counts as several
+      auto* payload = sub->add_option("payload", message.payload, "key=text and key:=json");
       if (isOnce) {
         category->required();
         type->required();
@@ -128,8 +149,7 @@ class Reader {
       if (timeout->empty()) _timeout = kUploadTimeout;
     });
     CLI::App* log = addClient("upload-log", "Upload log data", Command::UploadLog);
-    auto* texts = log->add_option("text", upload.logData, "Entries of the log data")
-                      ->allow_extra_args(false);  // or "[a,b]" counts as several
+    auto* texts = log->add_option("text", upload.logData, "Entries of the log data");
     log->add_flag("--stdin", upload.fromStandardInput, "Take a JSON value from each line of standard input")
         ->excludes(texts);
   }
