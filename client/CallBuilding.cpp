@@ -9,25 +9,13 @@
 #include <system_error>
 
 #include "platform/ipc/OneWayEncoder.h"
+#include "platform/text/PercentCode.h"
 
 namespace vesk {
 
 namespace {
 
-std::string urlOf(const std::string& path) {
-  constexpr char kDigits[] = "0123456789ABCDEF";
-  constexpr std::string_view kPlain = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789-._~/";
-  std::string url = "file://";
-  for (char c : path) {
-    if (kPlain.find(c) != std::string_view::npos) {
-      url += c;
-    } else {
-      auto byte = static_cast<unsigned char>(c);
-      url += {'%', kDigits[byte >> 4], kDigits[byte & 15]};
-    }
-  }
-  return url;
-}
+std::string urlOf(const std::string& path) { return "file://" + percentEncoded(path, "/"); }
 
 }  // namespace
 

@@ -1,7 +1,5 @@
 #include "storebag/StorebagFetch.h"
 
-#include <strings.h>
-
 #include <algorithm>
 #include <chrono>
 #include <limits>
@@ -10,6 +8,7 @@
 #include "platform/crypto/RSAPublicKey.h"
 #include "platform/log/SystemLog.h"
 #include "platform/plist/PropertyList.h"
+#include "platform/text/ASCII.h"
 #include "platform/values/Conversions.h"
 #include "storebag/StorebagFallback.h"
 #include "storebag/StorebagNaming.h"
@@ -41,7 +40,7 @@ HTTPRequest requestFor(const std::string& url, const std::optional<std::string>*
 std::optional<std::string> listInHeader(const HTTPResponse& response, std::string_view name) {
   std::optional<std::string> list;
   for (const auto& [each, value] : response.headers) {
-    if (each.size() != name.size() || ::strncasecmp(each.data(), name.data(), name.size()) != 0) continue;
+    if (!equalsIgnoringASCIICase(each, name)) continue;
     list = list ? *list + ", " + value : value;
   }
   return list;

@@ -101,22 +101,5 @@ TEST_F(DashboardRoad, TerminationSendsTheEndOfTheSessionAndWaitsForNothingElse) 
   EXPECT_EQ(datagrams.back().at("payload").at("StorebagVersion"), "1");
 }
 
-TEST_F(DashboardRoad, TheCollectorSurvivesWhatIsNoDatagram) {
-  start();
-  UDPSocket socket;
-  ASSERT_EQ(socket.open(), 0);
-  auto ready = boost::json::parse(_harness->root.read("ready"));
-  ASSERT_EQ(socket.connect({kLoopback, static_cast<std::uint16_t>(ready.at("udpPort").as_int64())}), 0);
-  const std::string header = std::string("\x07\x05\x01", 3) + std::string(61, '\0');
-  std::string huge = std::string(kDashboardHeaderSize, '\0') + ' ' + std::string(60'000, '=');
-  DashboardHeader ofHuge;
-  ofHuge.length = static_cast<std::uint16_t>(huge.size());
-  encodeDashboardHeader(ofHuge, huge.data());
-  for (const std::string& bytes : {std::string(), std::string("x"), header, huge, std::string(3000, 'x')})
-    ASSERT_EQ(socket.send(bytes), UDPSocket::Outcome::Sent);
-  EXPECT_TRUE(_harness->collector().waitForText("refused a datagram of 3000 bytes from 127.0.0.1:"));
-  EXPECT_EQ(_harness->collectorCount("datagramsMalformed"), 5);
-}
-
 }  // namespace
 }  // namespace vesk::test

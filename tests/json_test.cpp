@@ -4,6 +4,7 @@
 
 #include <boost/json.hpp>
 #include <cmath>
+#include <cstdlib>
 #include <limits>
 
 namespace vesk {
@@ -24,6 +25,7 @@ TEST(JSON, WritesEveryKindOfValue) {
     const char* text;
   } cases[] = {
       {Value(), "null"},
+      {std::getenv("VESK_IS_NOT_SET"), "null"},
       {true, "true"},
       {-5, "-5"},
       {std::numeric_limits<std::int64_t>::min(), "-9223372036854775808"},
@@ -45,6 +47,8 @@ TEST(JSON, WritesEveryKindOfValue) {
        R"({"a":[1,"b",null],"c":{"d":2}})"},
   };
   for (const auto& c : cases) EXPECT_EQ(compact(c.value), c.text);
+  static_assert(!std::is_constructible_v<Value, const Value*>, "a pointer is no boolean");
+  EXPECT_EQ(Text(std::getenv("VESK_IS_NOT_SET")), "");
 }
 
 TEST(JSON, RefusesWhatItCannotCarry) {

@@ -4,6 +4,8 @@
 
 #include <algorithm>
 
+#include "platform/text/ASCII.h"
+
 namespace vesk {
 
 namespace {
@@ -11,13 +13,7 @@ namespace {
 constexpr std::string_view kLineEnd = "\r\n";
 
 std::string hexOf(std::string_view text) {
-  constexpr char kDigits[] = "0123456789abcdef";
-  std::string hex;
-  for (unsigned char byte : text) {
-    hex += kDigits[byte >> 4];
-    hex += kDigits[byte & 15];
-  }
-  return hex;
+  return hexLower({reinterpret_cast<const unsigned char*>(text.data()), text.size()});
 }
 
 }  // namespace

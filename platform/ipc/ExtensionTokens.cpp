@@ -6,6 +6,8 @@
 #include <cerrno>
 #include <system_error>
 
+#include "platform/text/ASCII.h"
+
 namespace vesk {
 
 namespace {
@@ -16,13 +18,7 @@ std::string freshToken() {
   if (::getrandom(random, sizeof random, 0) != sizeof random) {
     throw std::system_error(errno, std::generic_category(), "getrandom");
   }
-  constexpr char kDigits[] = "0123456789abcdef";
-  std::string token;
-  for (unsigned char byte : random) {
-    token += kDigits[byte >> 4];
-    token += kDigits[byte & 15];
-  }
-  return token;
+  return hexLower(random);
 }
 
 }  // namespace

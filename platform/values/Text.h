@@ -19,10 +19,11 @@ class VESK_API Text {
   Text() noexcept = default;
 
   /// Copies `text` into storage of its own.
-  Text(std::string_view
-           text);  // NOLINT(google-explicit-constructor): texts are written as literals everywhere
+  // NOLINTNEXTLINE(google-explicit-constructor): texts are written as literals everywhere
+  Text(std::string_view text);
   Text(const std::string& text) : Text(std::string_view(text)) {}
-  Text(const char* text) : Text(std::string_view(text)) {}
+  /// Null is an empty text.
+  Text(const char* text) : Text(std::string_view(text ? text : "")) {}
 
   /// Refers to characters of static storage duration; nothing is copied and no reference is counted.
   template <std::size_t N>
@@ -42,7 +43,7 @@ class VESK_API Text {
     return a._size == b._size && (a._data.get() == b._data.get() || a.view() == b.view());
   }
   friend bool operator==(const Text& a, std::string_view b) noexcept { return a.view() == b; }
-  friend bool operator==(const Text& a, const char* b) noexcept { return a.view() == b; }
+  friend bool operator==(const Text& a, const char* b) noexcept { return a.view() == (b ? b : ""); }
 
  private:
   std::shared_ptr<const char> _data;

@@ -117,13 +117,16 @@ class VESK_API Value {
   Value(unsigned long long value) noexcept : _value(static_cast<std::uint64_t>(value)) {}  // NOLINT
   Value(double value) noexcept : _value(value) {}                                          // NOLINT
   Value(vesk::Text value) noexcept : _value(std::move(value)) {}                           // NOLINT
-  Value(const char* value) : _value(vesk::Text(value)) {}                                  // NOLINT
   Value(std::string_view value) : _value(vesk::Text(value)) {}                             // NOLINT
   Value(const std::string& value) : _value(vesk::Text(value)) {}                           // NOLINT
   Value(vesk::Bytes value) noexcept : _value(std::move(value)) {}                          // NOLINT
   Value(vesk::Date value) noexcept : _value(value) {}                                      // NOLINT
   Value(vesk::List value) noexcept : _value(std::move(value)) {}                           // NOLINT
   Value(vesk::Dictionary value) noexcept : _value(std::move(value)) {}                     // NOLINT
+  /// A null `value`, as `std::getenv` may give it, is the null marker.
+  Value(const char* value) : Value(value ? Value(vesk::Text(value)) : Value()) {}  // NOLINT
+  Value(std::nullptr_t) noexcept {}                                                // NOLINT
+  Value(const void* pointer) = delete;  // or any pointer would be a boolean
 
   Kind kind() const noexcept { return static_cast<Kind>(_value.index()); }
   bool isNone() const noexcept { return kind() == Kind::None; }
