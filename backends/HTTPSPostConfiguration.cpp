@@ -124,8 +124,9 @@ std::int32_t HTTPSPostBackend::stateForEntry(const Dictionary& entry, const std:
   std::int32_t newState = stateForSampling(entry);
   updateEventThreshold(entry);
   updateExtrasOnInternal(entry);
-  VESK_LOG_DEBUG("HTTPSPostBackend(updateBackendState): %s: client found %s, state? %d, %f", _name.c_str(),
-                 clientName ? clientName->string().c_str() : "(none)", newState, samplingFactor());
+  VESK_LOG_DEBUG("HTTPSPostBackend(updateBackendState): %s: client found %.256s, state? %d, %f",
+                 _name.c_str(), clientName ? clientName->string().c_str() : "(none)", newState,
+                 samplingFactor());
   updatePostLink(entry);
   return newState;
 }

@@ -52,7 +52,7 @@ void ReportingdAgent::userInfoUpdatedForSession(ReportingdSession& session) {
   const std::string& key = *sharedKey;
   RecursiveMutexLock lock(_monitor);
   removeFromCorrelation(self);
-  VESK_LOG_DEBUG("userInfoUpdatedForSession: Adding session %u to list for userInfoKey %s",
+  VESK_LOG_DEBUG("userInfoUpdatedForSession: Adding session %u to list for userInfoKey %.256s",
                  session.sessionID(), key.c_str());
   listForKey(key).push_back(self);
 }
@@ -62,15 +62,15 @@ std::shared_ptr<ReportingdSession> ReportingdAgent::parentSessionForChild(Report
   if (level == 0) return nullptr;
   const auto sharedKey = session.correlationKey();
   const std::string& key = *sharedKey;
-  VESK_LOG_DEBUG("parentSessionForChild: Checking userInfoKey '%s' for session %u", key.c_str(),
+  VESK_LOG_DEBUG("parentSessionForChild: Checking userInfoKey '%.256s' for session %u", key.c_str(),
                  session.sessionID());
   const SessionList* list = correlatedSessions(key);
   if (!list || list->empty()) {
-    VESK_LOG_ERROR("parentSessionForChild: ERROR: No sessions found for user info key %s", key.c_str());
+    VESK_LOG_ERROR("parentSessionForChild: ERROR: No sessions found for user info key %.256s", key.c_str());
     return nullptr;
   }
   if (!contains(*list, session)) {
-    VESK_LOG_ERROR("parentSessionForChild: ERROR: Session %u not found for user info key %s",
+    VESK_LOG_ERROR("parentSessionForChild: ERROR: Session %u not found for user info key %.256s",
                    session.sessionID(), key.c_str());
     return nullptr;
   }
@@ -78,7 +78,7 @@ std::shared_ptr<ReportingdSession> ReportingdAgent::parentSessionForChild(Report
   auto parent = getFirstSessionWithHierarchy(above, *list);
   if (!parent) {
     VESK_LOG_INFO("parentSessionForChild: Unable to find session with hierarchy of %" PRId64
-                  " for userInfoKey '%s'",
+                  " for userInfoKey '%.256s'",
                   above, key.c_str());
   }
   return parent;
@@ -89,17 +89,17 @@ std::optional<std::string> ReportingdAgent::parentSessionIDStringForSession(Repo
   if (level == 0) return std::nullopt;
   const auto sharedKey = session.correlationKey();
   const std::string& key = *sharedKey;
-  VESK_LOG_DEBUG("parentSessionIDStringForSession: Checking userInfoKey '%s' for session %u", key.c_str(),
+  VESK_LOG_DEBUG("parentSessionIDStringForSession: Checking userInfoKey '%.256s' for session %u", key.c_str(),
                  session.sessionID());
   RecursiveMutexLock lock(_monitor);
   const SessionList* list = correlatedSessions(key);
   if (!list || list->empty()) {
-    VESK_LOG_ERROR("parentSessionIDStringForSession: ERROR: No sessions found for user info key %s",
+    VESK_LOG_ERROR("parentSessionIDStringForSession: ERROR: No sessions found for user info key %.256s",
                    key.c_str());
     return std::nullopt;
   }
   if (!contains(*list, session)) {
-    VESK_LOG_ERROR("parentSessionIDStringForSession: ERROR: Session %u not found for user info key %s",
+    VESK_LOG_ERROR("parentSessionIDStringForSession: ERROR: Session %u not found for user info key %.256s",
                    session.sessionID(), key.c_str());
     return std::nullopt;
   }

@@ -43,6 +43,23 @@ TEST_F(Family, AMissingParentLeavesAGap) {
     EXPECT_GE(log.count(6, line), 1) << line;
 }
 
+TEST_F(Family, LongNamesFillNoLog) {
+  CapturedLog log;
+  const std::string name(1 << 20, 'x');
+  auto child = join(1, false, name.c_str());  // without a parent
+  child->setSessionInfo(sessionInfo(1), userInfo((name + "y").c_str()), {}, false);
+  auto ask = [&] {
+    harness.agent->parentSessionIDStringForSession(*child.session);
+    RecursiveMutexLock lock(harness.agent->monitor());
+    harness.agent->parentSessionForChild(*child.session);
+  };
+  ask();  // nobody is there under that name
+  auto sibling = join(1, false, (name + "y").c_str());
+  ask();  // somebody is, but not this one
+  EXPECT_EQ(log.countContaining(3, " for user info key xxx"), 4);
+  for (const auto& [level, line] : log.lines()) EXPECT_LT(line.size(), 1024u);
+}
+
 TEST_F(Family, TheHighestAggregatorGetsTheMessages) {
   auto child = join(1, true);
   auto top = join(0, true);
