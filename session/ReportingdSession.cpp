@@ -206,6 +206,7 @@ void ReportingdSession::sendMessageWithSessionInfo(const Dictionary& sessionInfo
   if (!sessionInfo.contains(kVeskReportingSessionInfoClientType) ||
       !sessionInfo.contains(kVeskReportingSessionInfoSessionID)) {
     VESK_LOG_ERROR("sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo");
+    _services.backends.counters.count("session", DropReason::InvalidMessage);
     return;  // the reply, destroyed uncalled, tells the caller
   }
   {
@@ -217,6 +218,7 @@ void ReportingdSession::sendMessageWithSessionInfo(const Dictionary& sessionInfo
   VESK_LOG_DEBUG("sendMessageWithSessionInfo: Sending message with session info for session %u", sessionID());
   auto storebag = _sessionDelegate->storebagForSession(*this);
   if (!storebag) {
+    _services.backends.counters.count("session", DropReason::NoBackend);
     reply("storebag not available");
     return;
   }

@@ -228,7 +228,9 @@ TEST_F(Session, ASingleMessageNeedsItsIdentifiersAndAStorebag) {
   };
   EXPECT_EQ(sendOnce(Dictionary{{kVeskReportingSessionInfoSessionID, 9}}), "error");
   EXPECT_EQ(log.count(3, "sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo"), 1);
+  EXPECT_EQ(harness.dropped(DropReason::InvalidMessage), 1u);
   EXPECT_EQ(sendOnce(id(3)), "storebag not available");
+  EXPECT_EQ(harness.dropped(DropReason::NoBackend), 1u);
   EXPECT_EQ(sendOnce(id(5)), "finished");
   EXPECT_EQ(log.count(4, "sendMessageWithSessionInfo: user info provided without requiring it."), 1);
   auto posts = harness.posts();
