@@ -11,23 +11,22 @@ using namespace std::chrono_literals;
 using Instant = RetryPolicy::Instant;
 
 TEST(RetryPolicy, WaitsGrowAreSpreadAndEnd) {
-  const RetryPolicy policy{60s, 200ms, 10s, 1000};
+  const RetryPolicy policy{60s, 200ms, 10s};
   const Instant first{};
   const struct {
     unsigned failures;
     std::chrono::milliseconds since;
-    std::size_t waiting;
     double random;
     std::optional<std::chrono::milliseconds> wait;
   } cases[] = {
-      {1, 0ms, 10, 0.5, 200ms},        {2, 200ms, 10, 0.5, 400ms}, {3, 1s, 10, 0.5, 800ms},
-      {6, 10s, 10, 0.5, 6400ms},       {7, 20s, 10, 0.5, 10s},     {1000, 20s, 10, 0.5, 10s},
-      {1, 0ms, 10, 0.0, 100ms},        {7, 20s, 10, 0.0, 5s},      {7, 20s, 10, 0.75, 12500ms},
-      {7, 55s, 10, 0.5, 5s},           {7, 59999ms, 10, 0.5, 1ms}, {7, 60s, 10, 0.5, std::nullopt},
-      {1, 61s, 10, 0.5, std::nullopt}, {1, 0ms, 1000, 0.5, 200ms}, {1, 0ms, 1001, 0.5, std::nullopt},
+      {1, 0ms, 0.5, 200ms},        {2, 200ms, 0.5, 400ms}, {3, 1s, 0.5, 800ms},
+      {6, 10s, 0.5, 6400ms},       {7, 20s, 0.5, 10s},     {1000, 20s, 0.5, 10s},
+      {1, 0ms, 0.0, 100ms},        {7, 20s, 0.0, 5s},      {7, 20s, 0.75, 12500ms},
+      {7, 55s, 0.5, 5s},           {7, 59999ms, 0.5, 1ms}, {7, 60s, 0.5, std::nullopt},
+      {1, 61s, 0.5, std::nullopt},
   };
   for (const auto& test : cases) {
-    auto wait = policy.waitAfter(test.failures, first, first + test.since, test.waiting, test.random);
+    auto wait = policy.waitAfter(test.failures, first, first + test.since, test.random);
     EXPECT_EQ(wait, test.wait) << test.failures << " failures, " << test.since.count() << " ms";
   }
 }
@@ -55,6 +54,11 @@ class Schedule : public testing::Test {
   HTTPSchedule::Exchange post(const std::string& name, std::size_t size = 10,
                               const std::string& host = "https://a") {
     return exchange(name, HTTPRequest::Retry::UntilSent, size, host);
+  }
+  HTTPSchedule::Exchange postOf(std::uint32_t owner, const std::string& name, std::size_t size = 10) {
+    auto its = post(name, size);
+    its->request.owner = owner;
+    return its;
   }
   HTTPSchedule::Exchange fetch(const std::string& name) {
     return exchange(name, HTTPRequest::Retry::Never, 0);
@@ -137,6 +141,29 @@ TEST_F(Schedule, InAnOutageAtMostSoManyBytesWait) {
   EXPECT_EQ(givenUp(), "") << "another host is not down";
 }
 
+TEST_F(Schedule, AnAnswerEndsTheWaitOfAllAndTheOldestGoFirst) {
+  for (const char* name : {"1", "2", "3"}) {
+    schedule().add(post(name, 25));
+    now += 1ms;
+  }
+  EXPECT_EQ(takeReady(), "12");
+  failFirst();
+  failFirst();
+  EXPECT_EQ(takeReady(), "3");
+  failFirst();
+  schedule().add(post("4", 100));
+  schedule().add(post("5", 10));
+  EXPECT_EQ(givenUp(), "5") << "4 is about to find out whether the host is back";
+  EXPECT_EQ(takeReady(), "4");
+  answerFirst();
+  EXPECT_EQ(takeReady(), "12") << "at once";
+  failFirst();
+  schedule().retryNow();
+  answerFirst();
+  EXPECT_EQ(takeReady(), "13") << "it waits for nothing when the daemon stops";
+  EXPECT_EQ(givenUp(), "");
+}
+
 TEST_F(Schedule, PostsQueuedBehindAnOutageShareItsEnd) {
   for (const char* name : {"1", "2", "3"}) schedule().add(post(name));
   EXPECT_EQ(takeReady(), "12");
@@ -144,15 +171,42 @@ TEST_F(Schedule, PostsQueuedBehindAnOutageShareItsEnd) {
   schedule().add(post("4"));
   failFirst();
   EXPECT_EQ(givenUp(), "31");
+
+  for (const char* name : {"5", "6"}) schedule().add(post(name));
+  now += 61s;
+  answerFirst();
+  EXPECT_EQ(takeReady(), "45");
+  failFirst();
+  EXPECT_EQ(givenUp(), "") << "a post that was just begun tells nothing of one that waits for its turn";
+}
+
+TEST_F(Schedule, OwnersTakeTurnsAndShareWhatMayWait) {
+  for (const char* name : {"1", "2", "3", "4", "5"}) schedule().add(postOf(7, name));
+  schedule().add(postOf(8, "a"));
+  EXPECT_EQ(takeReady(), "1a");
+  failFirst();
+  failFirst();
+  schedule().add(postOf(7, "6", 40));
+  schedule().add(postOf(8, "b", 30));
+  EXPECT_EQ(givenUp(), "234") << "who has most waiting gives way";
+  schedule().add(postOf(8, "c", 70));
+  EXPECT_EQ(givenUp(), "c") << "nobody comes to more than that one has";
 }
 
 TEST_F(Schedule, TheMemoryOfWaitingPostsIsBounded) {
-  options.maximumQueued = 10'000;
-  for (int i = 0; i < 4; ++i) schedule().add(post("1", 4000));
-  EXPECT_EQ(givenUp(), "111");
-  EXPECT_EQ(takeReady(), "1");
-  schedule().add(post("2", 4000));
-  EXPECT_EQ(givenUp(), "");
+  options.maximumMemory = 12'000;
+  for (const char* name : {"1", "2", "3"}) {
+    auto next = post(name, 100);
+    next->request.headers = {{"X-Vesk-Client-Name", std::string(4000, 'x')}};
+    HTTPRequest request = std::move(next->request);
+    next->complete({HTTPResponse(), std::nullopt});
+    schedule().add(std::make_unique<HTTPExchange>(
+        std::move(request),
+        [this, name](const HTTPResult& result) { givenUpNames += result.error ? name : ""; }, now,
+        outstanding));
+  }
+  EXPECT_EQ(givenUp(), "3") << "headers count";
+  EXPECT_EQ(takeReady(), "12");
 }
 
 TEST_F(Schedule, AFetchThatFindsNoConnectionInTimeIsGivenUp) {

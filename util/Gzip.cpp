@@ -140,7 +140,17 @@ int deflateWhole(z_stream& stream, std::string_view data, CompressedBytes& out) 
 
 }  // namespace
 
-std::optional<CompressedBytes> compressToBuffer(bool useGzip, std::string_view data) {
+namespace {
+
+void tellFailure(int result, const char* message) {
+  VESK_LOG_ERROR(
+      "compressDataWithZlibOrGzip: zlib error while attempting compression: \"%s\" Message: \"%s\"",
+      textForDeflate(result), message);
+}
+
+}  // namespace
+
+std::optional<CompressedBytes> compressToBuffer(bool useGzip, std::string_view data) try {
   if (data.empty()) {
     VESK_LOG_ERROR("compressDataWithZlibOrGzip: Cannot compress empty ByteBlob");
     return std::nullopt;
@@ -152,28 +162,29 @@ std::optional<CompressedBytes> compressToBuffer(bool useGzip, std::string_view d
     return std::nullopt;
   }
   CompressedBytes out;
-  int result = Z_MEM_ERROR;
-  try {
-    result = deflateWhole(deflater->stream(), data, out);
-  } catch (const std::bad_alloc&) {
-    // Told below, as any other want of memory.
-  }
+  const int result = deflateWhole(deflater->stream(), data, out);
   if (result != Z_STREAM_END) {
-    VESK_LOG_ERROR(
-        "compressDataWithZlibOrGzip: zlib error while attempting compression: \"%s\" Message: \"%s\"",
-        textForDeflate(result), messageOf(deflater->stream()));
+    tellFailure(result, messageOf(deflater->stream()));
     return std::nullopt;
   }
   poolFor(useGzip).giveBack(std::move(deflater));
   VESK_LOG_DEBUG("compressDataWithZlibOrGzip: Compressed file from %u to %u",
                  static_cast<unsigned>(data.size()), static_cast<unsigned>(out.size));
   return out;
+} catch (const std::bad_alloc&) {
+  tellFailure(Z_MEM_ERROR, "(null)");
+  return std::nullopt;
 }
 
 std::optional<std::string> compressDataWithZlibOrGzip(bool useGzip, std::string_view data) {
   auto compressed = compressToBuffer(useGzip, data);
   if (!compressed) return std::nullopt;
-  return std::string(compressed->bytes.get(), compressed->size);
+  try {
+    return std::string(compressed->bytes.get(), compressed->size);
+  } catch (const std::bad_alloc&) {
+    tellFailure(Z_MEM_ERROR, "(null)");
+    return std::nullopt;
+  }
 }
 
 std::optional<std::string> gzipDeflate(std::string_view data) {

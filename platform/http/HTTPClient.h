@@ -4,6 +4,7 @@
 #include <atomic>
 #include <chrono>
 #include <cstddef>
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <optional>
@@ -37,6 +38,10 @@ struct HTTPRequest {
   long leastBytesPerSecond = 0;
   std::chrono::seconds slowFor{120};
   Retry retry = Retry::Never;
+  /// Whose post it is: a user's number, or any. Owners take turns, and share what may wait.
+  std::uint32_t owner = kNobody;
+
+  static constexpr std::uint32_t kNobody = 0xffffffff;
 };
 
 struct HTTPResponse {
@@ -84,12 +89,17 @@ class HTTPClient {
 
   struct Options {
     std::string userAgent = "veskreportingd";
-    std::size_t maximumBody = std::size_t{4} << 20;     ///< bytes of a response body
-    std::size_t maximumWaiting = std::size_t{8} << 20;  ///< bytes of post bodies that wait out an outage
-    std::size_t maximumQueued = std::size_t{64} << 20;  ///< bytes of memory for posts that wait their turn
+    std::size_t maximumBody = std::size_t{4} << 20;  ///< bytes of a response body
+    /// Bytes of post bodies that wait out an outage. When there is no more room, or too little memory, the
+    /// owner who has most waiting for a host gives way to one who has less.
+    std::size_t maximumWaiting = std::size_t{8} << 20;
+    std::size_t maximumMemory = std::size_t{64} << 20;  ///< bytes of memory for all posts that wait
     std::chrono::milliseconds retryFor{60'000};         ///< from the first attempt of a post
     std::chrono::milliseconds firstRetryAfter{200};     ///< doubled each time, up to 10 s, ±50 % jitter
     std::chrono::milliseconds connectTimeout{15'000};
+    /// A post whose bytes nobody acknowledges for so long is sent again by another connection: after a change
+    /// of network, kept connections are dead and do not tell.
+    std::chrono::milliseconds acknowledgedWithin{20'000};
     /// Further requests to that host wait in order. Posts leave one connection to the other requests, so that
     /// a fetch does not wait behind them.
     std::size_t maximumConnectionsPerHost = 6;
@@ -105,16 +115,17 @@ class HTTPClient {
   HTTPClient(const HTTPClient&) = delete;
   HTTPClient& operator=(const HTTPClient&) = delete;
 
-  /// Returns at once. Posts to one host are sent in the order of the calls as far as connections allow. When
-  /// the thread can not be started or there is no memory for the request, the completion runs within this
-  /// call.
+  /// Returns at once. An owner's posts to one host are sent in the order of the calls as far as connections
+  /// allow. When the thread can not be started or there is no memory for the request, the completion runs
+  /// within this call.
   void start(HTTPRequest request, Completion completion);
 
   /// Starts the request and blocks until it is completed. Not to be called from a completion.
   HTTPResult perform(HTTPRequest request);
 
   /// From now on fails at once, with `Stopped`, what is not to be retried, be it under way, waiting or new: a
-  /// server that hangs no longer holds up those who wait for it. Posts go on. Returns at once.
+  /// server that hangs no longer holds up those who wait for it. Posts go on, and those that wait for another
+  /// attempt have it now. Returns at once.
   void stopAllButPosts();
 
   /// Waits until nothing is outstanding, at most `timeout`; true when nothing was left.

@@ -27,6 +27,14 @@ bool isSafe(const std::pair<std::string, std::string>& header) {
          std::none_of(value.begin(), value.end(), isControl);
 }
 
+std::size_t costOf(const HTTPRequest& request) {
+  constexpr std::size_t kOverhead = 1024;
+  std::size_t cost = kOverhead + request.url.size() + request.body.size();
+  for (const auto& header : request.headers)
+    cost += sizeof header + header.first.size() + header.second.size();
+  return cost;
+}
+
 }  // namespace
 
 void HTTPOutstanding::add() noexcept {
@@ -52,6 +60,7 @@ HTTPExchange::HTTPExchange(HTTPRequest&& wanted, HTTPClient::Completion&& comple
                            HTTPOutstanding& outstanding) noexcept
     : request(std::move(wanted)),
       started(now),
+      _cost(costOf(request)),
       _completion(std::move(completion)),
       _outstanding(outstanding) {
   _outstanding.add();

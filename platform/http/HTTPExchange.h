@@ -45,8 +45,9 @@ class HTTPExchange {
   std::string_view host() const noexcept;
   /// When a request that is not retried must be over.
   Instant deadline() const noexcept { return started + request.timeout; }
+  std::size_t bodySize() const noexcept { return request.body.size(); }
   /// Memory that it holds while it waits, roughly.
-  std::size_t cost() const noexcept { return request.body.size() + 1024; }
+  std::size_t cost() const noexcept { return _cost; }
 
   void complete(HTTPResult result) noexcept;
   void fail(HTTPError error) noexcept { complete(HTTPResult{std::nullopt, std::move(error)}); }
@@ -58,6 +59,7 @@ class HTTPExchange {
   std::unique_ptr<HTTPExchange> next;  ///< in the queue that it is in
 
  private:
+  const std::size_t _cost;
   HTTPClient::Completion _completion;
   HTTPOutstanding& _outstanding;
 };

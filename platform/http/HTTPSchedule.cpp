@@ -10,6 +10,7 @@ namespace vesk {
 
 namespace {
 constexpr std::chrono::seconds kLongestWait{10};
+constexpr char kTooMany[] = "too many posts wait to be sent";
 
 /// Whether a post to the same host would fail likewise.
 bool isOfTheHost(const HTTPError& error) {
@@ -19,8 +20,9 @@ bool isOfTheHost(const HTTPError& error) {
 }  // namespace
 
 HTTPSchedule::HTTPSchedule(const HTTPClient::Options& options)
-    : _policy{options.retryFor, options.firstRetryAfter, kLongestWait, options.maximumWaiting},
-      _maximumQueued(options.maximumQueued),
+    : _policy{options.retryFor, options.firstRetryAfter, kLongestWait},
+      _maximumWaiting(options.maximumWaiting),
+      _maximumMemory(options.maximumMemory),
       _maximumActive(std::max<std::size_t>(options.maximumConnectionsPerHost, 1)),
       _maximumActivePosts(std::max<std::size_t>(_maximumActive - 1, 1)),
       _random(std::random_device{}()) {}
@@ -29,25 +31,31 @@ void HTTPSchedule::add(Exchange exchange) noexcept {
   Host* host = hostFor(*exchange);
   if (!host) {
     exchange->fail(outOfMemory());
-  } else if (!exchange->isPost()) {
+    return;
+  }
+  if (!exchange->isPost()) {
     host->requests.pushBack(std::move(exchange));
-  } else if (host->outage && waiting() + exchange->request.body.size() > _policy.maximumWaiting) {
+    return;
+  }
+  Lane& lane = laneOf(*host, *exchange);
+  // Where nothing is about to find out whether the host is back, this post does.
+  const bool mustWait = host->outage && host->activePosts + host->queuedPosts > 0;
+  if (mustWait && !makeRoom(waitingBodies, *host, lane, exchange->bodySize(), _maximumWaiting)) {
     exchange->fail(httpError(host->outage->kind, host->outage->description));
-  } else if (_queuedCost + exchange->cost() > _maximumQueued) {
-    forgetIfUnused(exchange->host());
-    exchange->fail(httpError(HTTPError::Kind::Other, "too many posts wait to be sent"));
+  } else if (!makeRoom(memory, *host, lane, exchange->cost(), _maximumMemory)) {
+    exchange->fail(httpError(HTTPError::Kind::Other, kTooMany));
   } else {
-    queuePost(*host, std::move(exchange), false);
+    lane.bodies += exchange->bodySize();
+    lane.cost += exchange->cost();
+    lane.posts.pushBack(std::move(exchange));
+    ++host->queuedPosts;
   }
 }
 
 void HTTPSchedule::advance(Instant now) noexcept {
   while (!_retries.empty() && _retries.begin()->first <= now) {
-    auto exchange = std::move(_retries.extract(_retries.begin()).mapped());
-    _retryBytes -= exchange->request.body.size();
-    Host& host = hostOf(*exchange);
-    --host.retrying;
-    queuePost(host, std::move(exchange), true);
+    Host& host = hostOf(*_retries.begin()->second);
+    queueFirst(host, std::move(_retries.extract(_retries.begin()).mapped()));
   }
   for (auto& [name, host] : _hosts) {
     HTTPQueue inTime;
@@ -60,14 +68,14 @@ void HTTPSchedule::advance(Instant now) noexcept {
     }
     host.requests.swap(inTime);
   }
+  std::erase_if(_hosts, isUnused);
 }
 
 HTTPSchedule::Exchange HTTPSchedule::next(Instant now) noexcept {
   for (auto& [name, host] : _hosts) {
     if (host.active >= _maximumActive) continue;
     Exchange exchange = host.requests.pop();
-    if (!exchange && !host.posts.empty() && host.activePosts < _maximumActivePosts) {
-      exchange = takePost(host);
+    if (!exchange && host.activePosts < _maximumActivePosts && (exchange = takePost(host))) {
       ++host.activePosts;
     }
     if (!exchange) continue;
@@ -80,19 +88,19 @@ HTTPSchedule::Exchange HTTPSchedule::next(Instant now) noexcept {
 
 void HTTPSchedule::answered(const HTTPExchange& exchange) noexcept {
   Host& host = hostOf(exchange);
-  if (host.outage) {
-    VESK_LOG_INFO("HTTPClient: %.*s answers again", static_cast<int>(exchange.host().size()),
-                  exchange.host().data());
-    host.outage.reset();
-  }
   release(host, exchange);
+  if (!host.outage) return;
+  VESK_LOG_INFO("HTTPClient: %.*s answers again", static_cast<int>(exchange.host().size()),
+                exchange.host().data());
+  host.outage.reset();
+  bringBack(host);
 }
 
 void HTTPSchedule::failed(Exchange exchange, HTTPError error, bool mayRetry, Instant now) noexcept {
   Host& host = hostOf(*exchange);
+  release(host, *exchange);
   if (exchange->isPost() && isOfTheHost(error)) beginOutage(host, *exchange, error, now);
   if (mayRetry && exchange->isPost() && keepForRetry(host, exchange, now)) return;
-  release(host, *exchange);
   exchange->fail(std::move(error));
 }
 
@@ -102,15 +110,18 @@ void HTTPSchedule::stopAllButPosts() noexcept {
   }
 }
 
+void HTTPSchedule::retryNow() noexcept {
+  for (auto& [name, host] : _hosts) bringBack(host);
+}
+
 void HTTPSchedule::stopAll() noexcept {
   stopAllButPosts();
   for (auto& [name, host] : _hosts) {
-    while (auto post = host.posts.pop()) post->fail(stopped());
+    while (auto post = takePost(host)) post->fail(stopped());
   }
   for (auto& [time, post] : _retries) post->fail(stopped());
   _hosts.clear();
   _retries.clear();
-  _retryBytes = _queuedCost = 0;
 }
 
 std::optional<HTTPSchedule::Instant> HTTPSchedule::nextAdvance() const noexcept {
@@ -126,49 +137,114 @@ std::optional<HTTPSchedule::Instant> HTTPSchedule::nextAdvance() const noexcept 
   return next;
 }
 
-HTTPSchedule::Host* HTTPSchedule::hostFor(const HTTPExchange& exchange) noexcept {
+std::size_t HTTPSchedule::memory(const Host&, const Lane& lane) noexcept { return lane.cost; }
+
+std::size_t HTTPSchedule::waitingBodies(const Host& host, const Lane& lane) noexcept {
+  return host.outage ? lane.bodies : 0;
+}
+
+bool HTTPSchedule::isUnused(const Hosts::value_type& entry) noexcept {
+  const Host& host = entry.second;
+  return host.active == 0 && host.requests.empty() &&
+         std::all_of(host.lanes.begin(), host.lanes.end(),
+                     [](const auto& lane) { return lane.second.cost == 0; });
+}
+
+HTTPSchedule::Host* HTTPSchedule::hostFor(const HTTPExchange& exchange) noexcept try {
   auto found = _hosts.find(exchange.host());
-  if (found != _hosts.end()) return &found->second;
-  try {
-    return &_hosts.try_emplace(std::string(exchange.host())).first->second;
-  } catch (const std::bad_alloc&) {
-    return nullptr;
-  }
+  if (found == _hosts.end()) found = _hosts.try_emplace(std::string(exchange.host())).first;
+  if (exchange.isPost()) found->second.lanes.try_emplace(exchange.request.owner);
+  return &found->second;
+} catch (const std::bad_alloc&) {
+  return nullptr;
 }
 
 HTTPSchedule::Host& HTTPSchedule::hostOf(const HTTPExchange& exchange) noexcept {
   return _hosts.find(exchange.host())->second;
 }
 
-void HTTPSchedule::release(Host& host, const HTTPExchange& exchange) noexcept {
-  --host.active;
-  if (exchange.isPost()) --host.activePosts;
-  forgetIfUnused(exchange.host());
+HTTPSchedule::Lane& HTTPSchedule::laneOf(Host& host, const HTTPExchange& exchange) noexcept {
+  return host.lanes.find(exchange.request.owner)->second;
 }
 
-void HTTPSchedule::forgetIfUnused(std::string_view name) noexcept {
-  auto found = _hosts.find(name);
-  const Host& host = found->second;
-  if (host.active == 0 && host.requests.empty() && host.posts.empty() && host.retrying == 0) {
-    _hosts.erase(found);
-  }
-}
-
-void HTTPSchedule::queuePost(Host& host, Exchange exchange, bool first) noexcept {
-  host.postBytes += exchange->request.body.size();
-  _queuedCost += exchange->cost();
-  if (first) {
-    host.posts.pushFront(std::move(exchange));
-  } else {
-    host.posts.pushBack(std::move(exchange));
-  }
+void HTTPSchedule::queueFirst(Host& host, Exchange post) noexcept {
+  Lane& lane = laneOf(host, *post);
+  lane.posts.pushFront(std::move(post));
+  ++host.queuedPosts;
 }
 
 HTTPSchedule::Exchange HTTPSchedule::takePost(Host& host) noexcept {
-  Exchange exchange = host.posts.pop();
-  host.postBytes -= exchange->request.body.size();
-  _queuedCost -= exchange->cost();
-  return exchange;
+  auto lane = host.lanes.upper_bound(host.lastServed);
+  for (std::size_t i = 0; i < host.lanes.size(); ++i, ++lane) {
+    if (lane == host.lanes.end()) lane = host.lanes.begin();
+    if (lane->second.posts.empty()) continue;
+    host.lastServed = lane->first;
+    return takePost(host, lane->second);
+  }
+  return nullptr;
+}
+
+HTTPSchedule::Exchange HTTPSchedule::takePost(Host& host, Lane& lane) noexcept {
+  Exchange post = lane.posts.pop();
+  if (!post) return nullptr;
+  --host.queuedPosts;
+  lane.bodies -= post->bodySize();
+  lane.cost -= post->cost();
+  return post;
+}
+
+// Waits are spread for the sake of servers with many devices; one device goes on at once, oldest first.
+void HTTPSchedule::bringBack(Host& host) noexcept {
+  Retries back;
+  for (auto each = _retries.begin(); each != _retries.end();) {
+    auto retry = each++;
+    if (&hostOf(*retry->second) != &host) continue;
+    auto node = _retries.extract(retry);
+    node.key() = node.mapped()->started;
+    back.insert(std::move(node));
+  }
+  while (!back.empty()) queueFirst(host, std::move(back.extract(std::prev(back.end())).mapped()));
+}
+
+bool HTTPSchedule::makeRoom(Measure measure, const Host& host, const Lane& lane, std::size_t size,
+                            std::size_t bound) noexcept {
+  for (;;) {
+    std::size_t all = 0;
+    std::size_t most = 0;
+    Host* hostOfFullest = nullptr;
+    Lane* fullest = nullptr;
+    for (auto& [name, each] : _hosts) {
+      for (auto& [owner, other] : each.lanes) {
+        const std::size_t held = measure(each, other);
+        all += held;
+        if (held <= most) continue;
+        most = held;
+        hostOfFullest = &each;
+        fullest = &other;
+      }
+    }
+    if (all + size <= bound) return true;
+    if (!fullest || measure(host, lane) + size > most) return false;
+    dropOne(*hostOfFullest, *fullest);
+  }
+}
+
+void HTTPSchedule::dropOne(Host& host, Lane& lane) noexcept {
+  Exchange dropped = takePost(host, lane);
+  for (auto each = _retries.begin(); !dropped; ++each) {
+    if (&laneOf(hostOf(*each->second), *each->second) != &lane) continue;
+    dropped = std::move(_retries.extract(each).mapped());
+    lane.bodies -= dropped->bodySize();
+    lane.cost -= dropped->cost();
+    break;
+  }
+  dropped->fail(host.outage ? httpError(host.outage->kind, host.outage->description)
+                            : httpError(HTTPError::Kind::Other, kTooMany));
+}
+
+void HTTPSchedule::release(Host& host, const HTTPExchange& exchange) noexcept {
+  --host.active;
+  if (exchange.isPost()) --host.activePosts;
 }
 
 void HTTPSchedule::beginOutage(Host& host, const HTTPExchange& exchange, const HTTPError& error,
@@ -178,35 +254,30 @@ void HTTPSchedule::beginOutage(Host& host, const HTTPExchange& exchange, const H
                   exchange.host().data(), error.description.c_str());
   }
   host.outage = httpError(error.kind, error.description);
+  if (exchange.firstAttempt + _policy.retryFor > now) return;
   // While a host swallows connections, few attempts fill its slots; posts behind them would wait without end.
-  while (!host.posts.empty() && host.posts.front()->started + _policy.retryFor <= now) {
-    takePost(host)->fail(httpError(error.kind, error.description));
+  for (auto& [owner, lane] : host.lanes) {
+    while (!lane.posts.empty() && lane.posts.front()->started + _policy.retryFor <= now) {
+      takePost(host, lane)->fail(httpError(error.kind, error.description));
+    }
   }
 }
 
-bool HTTPSchedule::keepForRetry(Host& host, Exchange& exchange, Instant now) noexcept {
-  const std::size_t size = exchange->request.body.size();
+bool HTTPSchedule::keepForRetry(Host& host, Exchange& exchange, Instant now) noexcept try {
   const double random = std::uniform_real_distribution<double>()(_random);
-  auto wait = _policy.waitAfter(exchange->attempts, exchange->firstAttempt, now, waiting() + size, random);
-  if (!wait) return false;
-  try {
-    Exchange& kept = _retries.emplace(now + *wait, nullptr)->second;
-    ++host.retrying;
-    release(host, *exchange);
-    _retryBytes += size;
-    kept = std::move(exchange);
-    return true;
-  } catch (const std::bad_alloc&) {
+  auto wait = _policy.waitAfter(exchange->attempts, exchange->firstAttempt, now, random);
+  Lane& lane = laneOf(host, *exchange);
+  if (!wait || !makeRoom(waitingBodies, host, lane, exchange->bodySize(), _maximumWaiting) ||
+      !makeRoom(memory, host, lane, exchange->cost(), _maximumMemory)) {
     return false;
   }
-}
-
-std::size_t HTTPSchedule::waiting() const noexcept {
-  std::size_t bytes = _retryBytes;
-  for (const auto& [name, host] : _hosts) {
-    if (host.outage) bytes += host.postBytes;
-  }
-  return bytes;
+  Exchange& kept = _retries.emplace(now + *wait, nullptr)->second;
+  lane.bodies += exchange->bodySize();
+  lane.cost += exchange->cost();
+  kept = std::move(exchange);
+  return true;
+} catch (const std::bad_alloc&) {
+  return false;
 }
 
 }  // namespace vesk

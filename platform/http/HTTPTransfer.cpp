@@ -1,5 +1,9 @@
 #include "platform/http/HTTPTransfer.h"
 
+#include <netinet/in.h>
+#include <netinet/tcp.h>
+#include <sys/socket.h>
+
 #include <algorithm>
 #include <chrono>
 #include <cstdio>
@@ -116,6 +120,7 @@ curl_slist* HTTPHeaderLines::link() {
 HTTPTransfer::HTTPTransfer(const HTTPClient::Options& options, const std::optional<std::string>& authorities)
     : _maximumBody(options.maximumBody),
       _connectTimeout(static_cast<long>(options.connectTimeout.count())),
+      _acknowledgedWithin(options.acknowledgedWithin),
       _easy(curl_easy_init()) {
   if (!_easy) throw std::bad_alloc();
   CURL* easy = _easy.get();
@@ -132,6 +137,8 @@ HTTPTransfer::HTTPTransfer(const HTTPClient::Options& options, const std::option
   }
   // A proxy's answer to CONNECT is not the server's.
   set(easy, CURLOPT_SUPPRESS_CONNECT_HEADERS, 1L);
+  set(easy, CURLOPT_SOCKOPTFUNCTION, &HTTPTransfer::prepareSocket);
+  set(easy, CURLOPT_SOCKOPTDATA, this);
   set(easy, CURLOPT_PRIVATE, this);
   set(easy, CURLOPT_ERRORBUFFER, _errorText);
   set(easy, CURLOPT_HEADERFUNCTION, &HTTPTransfer::receive<&HTTPTransfer::addHeader>);
@@ -240,6 +247,14 @@ std::size_t HTTPTransfer::receive(char* bytes, std::size_t size, std::size_t cou
     self->_outOfMemory = true;
     return 0;
   }
+}
+
+// Only posts are sent again; the others rather wait for as long as they may.
+int HTTPTransfer::prepareSocket(void* transfer, curl_socket_t socket, curlsocktype) noexcept {
+  const auto* self = static_cast<const HTTPTransfer*>(transfer);
+  const auto limit = static_cast<unsigned>(self->_acknowledgedWithin.count());
+  if (self->isPost()) (void)::setsockopt(socket, IPPROTO_TCP, TCP_USER_TIMEOUT, &limit, sizeof limit);
+  return CURL_SOCKOPT_OK;
 }
 
 bool HTTPTransfer::addHeader(std::string_view line) {

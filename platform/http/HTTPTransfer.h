@@ -3,6 +3,7 @@
 
 #include <curl/curl.h>
 
+#include <chrono>
 #include <cstddef>
 #include <memory>
 #include <optional>
@@ -65,6 +66,7 @@ class HTTPTransfer {
   using Add = bool (HTTPTransfer::*)(std::string_view);
   template <Add add>
   static std::size_t receive(char* bytes, std::size_t size, std::size_t count, void* transfer) noexcept;
+  static int prepareSocket(void* transfer, curl_socket_t socket, curlsocktype purpose) noexcept;
   bool addHeader(std::string_view line);
   bool addBody(std::string_view bytes);
 
@@ -75,6 +77,7 @@ class HTTPTransfer {
 
   const std::size_t _maximumBody;
   const long _connectTimeout;  ///< milliseconds
+  const std::chrono::milliseconds _acknowledgedWithin;
   std::unique_ptr<CURL, FreeEasy> _easy;
   char _errorText[CURL_ERROR_SIZE] = "";
   HTTPHeaderLines _lines;

@@ -114,6 +114,7 @@ void HTTPClient::Worker::stopAllButPosts() noexcept {
     _schedule.failed(std::move(exchange), stopped(), false, std::chrono::steady_clock::now());
   }
   _schedule.stopAllButPosts();
+  if (!std::exchange(_hasStoppedOthers, true)) _schedule.retryNow();
 }
 
 void HTTPClient::Worker::startReady() noexcept {

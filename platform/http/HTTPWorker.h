@@ -68,6 +68,7 @@ class HTTPClient::Worker {
   // The client's thread only.
   HTTPSchedule _schedule;
   std::vector<std::unique_ptr<HTTPTransfer>> _transfers;
+  bool _hasStoppedOthers = false;
   std::vector<HTTPTransfer*> _idle;  ///< those of `_transfers` that hold no exchange; has room for all
 
   Mutex _mutex;

@@ -5,10 +5,9 @@
 namespace vesk {
 
 std::optional<RetryPolicy::Duration> RetryPolicy::waitAfter(unsigned failures, Instant firstAttempt,
-                                                            Instant now, std::size_t waiting,
-                                                            double random) const {
+                                                            Instant now, double random) const {
   Duration left = firstAttempt + retryFor - now;
-  if (left <= Duration::zero() || waiting > maximumWaiting) return std::nullopt;
+  if (left <= Duration::zero()) return std::nullopt;
 
   Duration wait = std::min(firstWait, longestWait);
   for (unsigned i = 1; i < failures && wait < longestWait; ++i) wait = std::min(wait * 2, longestWait);

@@ -1,5 +1,6 @@
 #include "platform/json/JSONWriter.h"
 
+#include <algorithm>
 #include <array>
 #include <limits>
 
@@ -104,8 +105,11 @@ class StyledImpl final : public JSONWriter::Impl {
   bool writeText(std::string_view text) override {
     if (text.size() > kLongestText) return false;
     if (text.empty()) return _writer.String("", 0);
-    // RapidJSON validates as it goes, but would follow a sequence that is cut off over the end of the text.
-    if ((text.back() & 0x80) != 0 && !isValidUTF8(text)) return false;
+    // RapidJSON validates as it goes, but takes as many bytes as the first of a sequence announces, be they
+    // beyond the end of the text.
+    const std::string_view end = text.substr(text.size() - std::min<std::size_t>(text.size(), 3));
+    const bool mayRunOver = std::any_of(end.begin(), end.end(), [](char c) { return (c & 0x80) != 0; });
+    if (mayRunOver && !isValidUTF8(text)) return false;
     return _writer.String(text.data(), static_cast<rapidjson::SizeType>(text.size()));
   }
 
