@@ -117,6 +117,7 @@ void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t flag,
   request.method = "POST";
   request.url = *url;
   request.retry = HTTPRequest::Retry::UntilSent;
+  request.owner = _user.load();
   request.headers = postHeaders(method, responseCode);
   auto compressed = gzipDeflate(json);
   bool sendCompressed = compressed && compressed->size() < json.size();

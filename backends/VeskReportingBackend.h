@@ -118,6 +118,8 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
   void setStartTimestamp(const timeval& timestamp);
   /// Shares the account of held bytes with the session's other backends.
   void setHeldBytes(HeldBytes heldBytes);
+  /// Whose share of what may wait its posts and uploads take.
+  void setUser(uid_t user) noexcept { _user.store(user); }
 
  protected:
   VeskReportingBackend(const std::string& name, const Dictionary& profile, const Text& productFamily,
@@ -143,6 +145,7 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
   std::atomic<std::int32_t> _state{BackendStatePending};
   std::atomic<std::int32_t> _hierarchy{0};
   std::atomic<double> _samplingFactor;
+  std::atomic<uid_t> _user{UploadGate::kNobody};
 
   // Guarded by _mutex.
   mutable Mutex _mutex;

@@ -77,7 +77,8 @@ std::optional<Dictionary> profileFrom(const DictionaryEntry& entry) {
 std::optional<BackendSet> createBackends(const std::optional<Dictionary>& storebag,
                                          const std::optional<Dictionary>& sessionInfo,
                                          const std::optional<Dictionary>& userInfo, std::string_view deviceID,
-                                         const std::string& libraryVersion, const BackendServices& services) {
+                                         const std::string& libraryVersion, uid_t user,
+                                         const BackendServices& services) {
   if (!storebag) {
     VESK_LOG_ERROR("createBackends: Attempted to create backends with nil storebag");
     return std::nullopt;
@@ -96,6 +97,7 @@ std::optional<BackendSet> createBackends(const std::optional<Dictionary>& storeb
     if (!backend) continue;
     stamp(*backend, identity, userInfo, deviceID, libraryVersion);
     backend->setHeldBytes(heldBytes);
+    backend->setUser(user);
     backends.emplace_back(std::move(name), std::move(backend));
   }
   return backends;

@@ -222,7 +222,8 @@ void ReportingdSession::sendMessageWithSessionInfo(const Dictionary& sessionInfo
     reply("storebag not available");
     return;
   }
-  sendSingleMessage(_services, sessionInfo, userInfo, storebag, category, type, payload);
+  sendSingleMessage(_services, _connection->peer().user, sessionInfo, userInfo, storebag, category, type,
+                    payload);
   reply("finished");
 }
 

@@ -115,7 +115,8 @@ class ReportingdSession final : public ClientSessionInterface,
   std::optional<std::string> flushMessages();
   void uploadFileWithURL(const std::string& fileURL, const std::string& extensionToken,
                          Reply<bool> completionHandler);
-  static void sendSingleMessage(const SessionServices& services, const std::optional<Dictionary>& sessionInfo,
+  static void sendSingleMessage(const SessionServices& services, uid_t user,
+                                const std::optional<Dictionary>& sessionInfo,
                                 const std::optional<Dictionary>& userInfo,
                                 const std::optional<Dictionary>& storebag, std::uint16_t category,
                                 std::uint16_t type, const std::optional<Dictionary>& payload);

@@ -155,7 +155,7 @@ void ReportingdSession::uploadLogData(const List& logData,
   completionHandler(succeeded, std::nullopt);
 }
 
-void ReportingdSession::sendSingleMessage(const SessionServices& services,
+void ReportingdSession::sendSingleMessage(const SessionServices& services, uid_t user,
                                           const std::optional<Dictionary>& sessionInfo,
                                           const std::optional<Dictionary>& userInfo,
                                           const std::optional<Dictionary>& storebag, std::uint16_t category,
@@ -171,7 +171,7 @@ void ReportingdSession::sendSingleMessage(const SessionServices& services,
   std::array<char, 41> deviceID{};
   copyUniqueDeviceID(deviceID.data(), deviceID.size());
   auto backends = createBackends(storebag, sessionInfo, userInfo, deviceID.data(), services.libraryVersion,
-                                 services.backends);
+                                 user, services.backends);
   if (!backends) {
     VESK_LOG_ERROR("sendMessageWithSessionInfo: No backends available to send single message");
     services.backends.counters.count("session", DropReason::NoBackend);

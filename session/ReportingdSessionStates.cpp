@@ -11,7 +11,7 @@ namespace vesk {
 void ReportingdSession::createBackendsWithStorebag(const std::optional<Dictionary>& storebag) {
   VESK_LOG_DEBUG("createBackendsWithStorebag: Creating backends for session %u", sessionID());
   auto created = createBackends(storebag, sessionInfo(), userInfo(), _deviceid.data(),
-                                _services.libraryVersion, _services.backends);
+                                _services.libraryVersion, _connection->peer().user, _services.backends);
   SharedBackends next;
   if (created) {
     for (const auto& [name, backend] : *created) backend->setCombinedSessionIDString(_sessionIDString);

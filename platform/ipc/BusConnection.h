@@ -39,6 +39,7 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   void end();
 
   std::string description() const override { return _name; }
+  IPCPeer peer() const override { return _peer; }
   void setExportedObject(std::shared_ptr<IPCExportedObject> object) override;
   void setInterruptionHandler(std::function<void()> handler) override;
   void setInvalidationHandler(std::function<void()> handler) override;

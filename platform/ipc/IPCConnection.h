@@ -62,6 +62,8 @@ class IPCConnection {
   virtual ~IPCConnection() = default;
 
   virtual std::string description() const = 0;
+  /// As the kernel told when it connected.
+  virtual IPCPeer peer() const = 0;
 
   /// Set before `resume`; run on the connection's thread, each at most once.
   virtual void setExportedObject(std::shared_ptr<IPCExportedObject> object) = 0;

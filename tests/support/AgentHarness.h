@@ -12,6 +12,7 @@ namespace vesk::test {
 class RecordingConnection final : public IPCConnection {
  public:
   std::string description() const override { return "recording connection"; }
+  IPCPeer peer() const override { return {}; }
   void setExportedObject(std::shared_ptr<IPCExportedObject> object) override { _object = std::move(object); }
   void setInterruptionHandler(std::function<void()> handler) override { _interrupted = std::move(handler); }
   void setInvalidationHandler(std::function<void()> handler) override { _invalidated = std::move(handler); }
