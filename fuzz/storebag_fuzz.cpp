@@ -3,6 +3,7 @@
 #include <cstdint>
 
 #include "backends/VeskReportingBackend.h"
+#include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
 #include "platform/plist/PropertyList.h"
 #include "platform/queue/TimedQueuePool.h"
@@ -12,7 +13,10 @@ namespace {
 using namespace vesk;
 
 struct Shared {
-  Shared() { SystemLog::setLevel(static_cast<int>(LogLevel::Error)); }
+  Shared() {
+    SystemLog::setLevel(static_cast<int>(LogLevel::Error));
+    setRootPrefix("/nonexistent");  // the machine's own preferences may name a server
+  }
 
   HTTPClient http;
   Counters counters;

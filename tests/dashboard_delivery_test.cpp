@@ -329,6 +329,10 @@ TEST_F(Delivery, GoesOnFromTheDevicesNewAddress) {
     setDeviceAddress("198.51.100.1", "255.255.255.0");        // from where no way leads to the server
     send(3);
     _queue->advance(milliseconds(5000));
+    sockaddr_in local{};
+    socklen_t size = sizeof local;
+    ASSERT_EQ(::getsockname(_descriptor, reinterpret_cast<sockaddr*>(&local), &size), 0);
+    EXPECT_EQ(local.sin_port, 0) << "where anybody could acknowledge what is pending";
     setDeviceAddress("192.0.2.129", "255.255.255.128");
     _queue->advance(milliseconds(500));
     EXPECT_EQ(_server.takeEventIDs(), std::vector{3});

@@ -24,11 +24,14 @@ constexpr std::size_t kSpareDescriptors = 8;
 class Aftermath {
  public:
   explicit Aftermath(DaemonHarness& harness) : _harness(harness), _facts(harness.daemon().pid()) {
-    RoadClient client(_harness);  // so that all that is made once is there
-    EXPECT_TRUE(client.reporting.sendMessageAndWait(message(8)));
-    harness.waitForEventsOfMethod(8, 1);
-    _threads = _facts.threads() - 1;  // its own goes
-    _descriptors = _facts.descriptors();
+    {
+      RoadClient client(_harness);  // so that all that is made once is there
+      EXPECT_TRUE(client.reporting.sendMessageAndWait(message(8)));
+      harness.waitForEventsOfMethod(8, 1);
+      _threads = _facts.threads() - 1;  // its own goes
+      _descriptors = _facts.descriptors();
+    }
+    EXPECT_TRUE(eventually([&] { return _facts.threads() <= _threads; })) << "its place is free again";
   }
   void expectNothingLeft() {
     EXPECT_TRUE(eventually([&] { return _facts.threads() <= _threads; })) << _facts.threads();

@@ -216,6 +216,7 @@ TEST(IPCConnection, RunsNoHandlerWhenItIsNeverResumed) {
 }
 
 TEST(IPCListener, LeavesNeitherThreadNorDescriptorBehind) {
+  { TestService first; }  // with it comes what stays: a sanitizer's own thread
   const ProcessFacts facts(::getpid());
   const std::size_t descriptors = facts.descriptors();
   const std::size_t threads = facts.threads();
@@ -234,7 +235,8 @@ TEST(IPCListener, LeavesNeitherThreadNorDescriptorBehind) {
     for (auto& client : clients) EXPECT_TRUE(client->runToEnd());
   }
   EXPECT_EQ(facts.descriptors(), descriptors);
-  EXPECT_EQ(facts.threads(), threads);
+  // The kernel shows a thread for a moment after it was joined.
+  EXPECT_TRUE(eventually([&] { return facts.threads() <= threads; })) << facts.threads();
 }
 
 TEST(IPCListener, DoesNotWaitForEverForAHandlerThatHangs) {

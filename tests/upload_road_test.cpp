@@ -125,6 +125,7 @@ TEST_F(UploadRoad, AFileThatShrinksIsRefusedAndOneThatGrowsIsSentAndStays) {
     off_t size = static_cast<off_t>(step > 0 ? kMiB : 96 * kMiB);  // large: it must shrink while it is read
     FileDescriptor descriptor = opened(path, O_RDWR);
     ASSERT_EQ(::ftruncate(descriptor.get(), size), 0);
+    if (step > 0) harness.setFault("upload=slow");  // it must grow before the answer is there
     std::atomic<bool> stop{false};
     std::thread changing([&] {
       while (!stop) {

@@ -84,11 +84,18 @@ int UDPSocket::connect(const IPv4Endpoint& peer) noexcept {
   return errorOf(::connect(descriptor(), reinterpret_cast<const sockaddr*>(&address), sizeof address));
 }
 
-int UDPSocket::reconnect(const IPv4Endpoint& peer) noexcept {
+int UDPSocket::disconnect() noexcept {
   sockaddr nobody{};
   nobody.sa_family = AF_UNSPEC;
-  if (::connect(descriptor(), &nobody, sizeof nobody) != 0) return errno;
-  return connect(peer);
+  return errorOf(::connect(descriptor(), &nobody, sizeof nobody));
+}
+
+int UDPSocket::reconnect(const IPv4Endpoint& peer) noexcept {
+  if (int error = disconnect()) return error;
+  const int error = connect(peer);
+  // A connection that fails leaves a port behind, at which anybody's datagrams would be received.
+  if (error != 0) static_cast<void>(disconnect());
+  return error;
 }
 
 UDPSocket::Outcome UDPSocket::send(std::string_view datagram) noexcept {

@@ -40,6 +40,7 @@ class UDPSocket {
   [[nodiscard]] int connect(const IPv4Endpoint& peer) noexcept;
 
   /// Once more, from an address that the system has now: a connection keeps the one that it was made with.
+  /// After a failure nothing is received until a later one succeeds.
   [[nodiscard]] int reconnect(const IPv4Endpoint& peer) noexcept;
 
   enum class Outcome : unsigned char {
@@ -66,6 +67,9 @@ class UDPSocket {
   void close() noexcept { _descriptor.reset(); }
 
  private:
+  /// Gives up a port that the system picked, too.
+  int disconnect() noexcept;
+
   std::shared_ptr<const FileDescriptor> _descriptor;
 };
 
