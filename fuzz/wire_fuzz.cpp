@@ -1,6 +1,5 @@
 // Bytes as the body of a client's call: through sd-bus into values, back onto the wire and into values again.
 #include <cstdint>
-#include <cstring>
 #include <string>
 
 #include "platform/ipc/AuthenticationGate.h"
@@ -8,6 +7,7 @@
 #include "platform/ipc/MessageGate.h"
 #include "platform/ipc/OneWayDecoder.h"
 #include "tests/support/BusServer.h"
+#include "tests/support/WireMessage.h"
 
 namespace {
 
@@ -16,37 +16,9 @@ using test::BusServer;
 
 void require(bool condition) { BusServer::require(condition); }
 
-void appendNumber(std::string& bytes, std::size_t number) {
-  for (int i = 0; i < 4; ++i) bytes += static_cast<char>(number >> (8 * i));
-}
-
-std::string callWith(const std::string& signature, const std::string& body) {
-  std::string fields;
-  auto field = [&](char code, char type, const std::string& value) {
-    fields.resize((fields.size() + 7) / 8 * 8);
-    fields += std::string{code, 1, type, 0};
-    if (type == 'g') {
-      fields += static_cast<char>(value.size());
-    } else {
-      appendNumber(fields, value.size());
-    }
-    fields.append(value).append(1, '\0');
-  };
-  field(1, 'o', "/o");
-  field(3, 's', "m");
-  field(8, 'g', signature);
-  std::string bytes = {'l', 1, 1, 1};
-  appendNumber(bytes, body.size());
-  appendNumber(bytes, 1);
-  appendNumber(bytes, fields.size());
-  bytes += fields;
-  bytes.resize((bytes.size() + 7) / 8 * 8);
-  return bytes + body;
-}
-
 /// What is read without sd-bus is what sd-bus reads.
 void compareWays(const std::string& call, const Value& expected, bool isExpected) {
-  static OneWayDecoder decoder("/o");
+  static OneWayDecoder decoder(wire::kObjectPath);
   if (!OneWayDecoder::mayDecode(call, call.size())) return;
   auto read = decoder.decode(call);
   if (!read || read->arguments.size() != 1) return;
@@ -58,7 +30,7 @@ void compareWays(const std::string& call, const Value& expected, bool isExpected
 }
 
 void decode(BusServer& server, const std::string& signature, const std::string& body) {
-  const std::string call = callWith(signature, body);
+  const std::string call = test::wireMessage("m", signature, body);
   BusMessageHandle message = server.read(call);
   if (!message) return compareWays(call, {}, false);  // refused by sd-bus
   BusDecoder decoder(message.get());

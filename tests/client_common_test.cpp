@@ -12,31 +12,17 @@
 #include "client/common/PersistentIdentifiers.h"
 #include "client/common/Resources.h"
 #include "platform/files/FileDescriptor.h"
-#include "platform/files/RootPrefix.h"
 #include "tests/support/CapturedLog.h"
-#include "tests/support/TempDirectory.h"
+#include "tests/support/TestRoot.h"
 
 namespace vesk::test {
 namespace {
-
-class RootOfTest {
- public:
-  explicit RootOfTest(const TempDirectory& directory) : _before(rootPrefix()) {
-    setRootPrefix(directory.path().string());
-  }
-  ~RootOfTest() { setRootPrefix(_before); }
-
- private:
-  std::string _before;
-};
 
 TEST(ClientResources, TheVersionIsTheFirstLineWhenItIsAWord) {
   struct Case {
     std::string file;
     std::optional<std::string> version;
   };
-  TempDirectory directory;
-  RootOfTest root(directory);
   EXPECT_EQ(bundleVersion(), std::nullopt);
   EXPECT_EQ(clientLibraryVersion(), "7.0");
   CapturedLog log;
@@ -45,23 +31,21 @@ TEST(ClientResources, TheVersionIsTheFirstLineWhenItIsAWord) {
         Case{"7.0 beta\n", std::nullopt}, Case{"7\x01", std::nullopt},
         Case{std::string(65, '1'), std::nullopt}, Case{std::string(5000, ' '), std::nullopt}}) {
     SCOPED_TRACE(c.file);
-    directory.write("usr/share/veskreporting/version", c.file);
+    testRoot().write("usr/share/veskreporting/version", c.file);
     EXPECT_EQ(bundleVersion(), c.version);
     EXPECT_EQ(VeskReporting::version(), c.version.value_or("7.0"));
   }
 }
 
 TEST(ClientResources, ThePublicKeyIsThereOrNot) {
-  TempDirectory directory;
-  RootOfTest root(directory);
   EXPECT_EQ(VeskReporting::publicKey(), std::nullopt);
   const std::string bytes("\x30\0\x82", 3);
-  directory.write("usr/share/veskreporting/publicKey.der", bytes);
+  testRoot().write("usr/share/veskreporting/publicKey.der", bytes);
   EXPECT_EQ(publicKeyDER(), bytes);
   EXPECT_EQ(VeskReporting::publicKey(), bytes);
   CapturedLog log;
   for (std::size_t size : {std::size_t{0}, (std::size_t{64} << 10) + 1}) {
-    directory.write("usr/share/veskreporting/publicKey.der", std::string(size, 'x'));
+    testRoot().write("usr/share/veskreporting/publicKey.der", std::string(size, 'x'));
     EXPECT_EQ(publicKeyDER(), std::nullopt);
   }
 }

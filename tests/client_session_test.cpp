@@ -80,14 +80,6 @@ TEST_F(ClientSession, AnswersThroughCallbacksInTheOrderOfTheCalls) {
   EXPECT_EQ(ends, expected);
 }
 
-TEST_F(ClientSession, TellsNoStorebagFromNoEnabledBackend) {
-  VeskReporting session(options());
-  record.setBackends(std::nullopt);
-  EXPECT_EQ(session.startConfig().answer, std::nullopt);
-  record.setBackends(BackendNames{});
-  EXPECT_EQ(session.startConfig().answer, BackendNames{});
-}
-
 TEST_F(ClientSession, HandsAggregatedMessagesToTheHandler) {
   Caught<AggregatedMessage> first, closing;
   VeskReporting session(options());

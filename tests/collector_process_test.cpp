@@ -30,7 +30,7 @@ class CollectorProcess : public ::testing::Test {
   }
   /// Waits until it listens and reads where.
   void waitUntilReady() {
-    ASSERT_TRUE(test::waitForFile((_files / "ready.json").string()));
+    ASSERT_TRUE(test::eventually([&] { return std::filesystem::exists(_files / "ready.json"); }));
     _facts = *parseJSON(_files.read("ready.json")).value.value().dictionary();
   }
   std::string fact(const char* key) const { return _facts.text(key).value().string(); }

@@ -2,7 +2,6 @@
 #include <gtest/gtest.h>
 
 #include <set>
-#include <thread>
 
 #include "platform/crypto/Base64.h"
 #include "platform/crypto/Digest.h"
@@ -20,18 +19,6 @@ TEST(Digest, MatchesPublishedVectors) {
   EXPECT_EQ(hexLower(sha256("abc")), "ba7816bf8f01cfea414140de5dae2223b00361a396177a9cb410ff61f20015ad");
   EXPECT_EQ(hexLower(sha256(std::string(1'000'000, 'a'))),
             "cdc76e5c9914fb9281a1c7e284d73e67f1809a48a497200e046d39ccc7112cd0");
-}
-
-TEST(Digest, ThreadsDoNotDisturbEachOther) {
-  std::vector<std::thread> threads;
-  for (char letter = 'a'; letter < 'e'; ++letter) {
-    threads.emplace_back([letter] {
-      std::string text(100, letter);
-      auto first = sha256(text);
-      for (int i = 0; i < 200; ++i) EXPECT_EQ(sha256(text), first);
-    });
-  }
-  for (auto& thread : threads) thread.join();
 }
 
 TEST(Base64, MatchesPublishedVectorsBothWays) {

@@ -1,11 +1,9 @@
 // Dashboards on real processes: client library, daemon in its sandbox, collector; loss, outages and ends.
 #include <gtest/gtest.h>
 
-#include <csignal>
 #include <set>
 
 #include "tests/support/DaemonHarness.h"
-#include "tests/support/DashboardServer.h"
 
 namespace vesk::test {
 namespace {

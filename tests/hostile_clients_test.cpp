@@ -1,15 +1,11 @@
 // Many clients, and clients that say nonsense, against the real daemon.
 #include <gtest/gtest.h>
-#include <poll.h>
-#include <sys/socket.h>
-#include <sys/un.h>
 
-#include <cstring>
 #include <limits>
 
-#include "platform/files/FileDescriptor.h"
 #include "platform/service/DescriptorLimit.h"
 #include "tests/support/DaemonHarness.h"
+#include "tests/support/IPCHarness.h"
 #include "tests/support/ProcessFacts.h"
 
 namespace vesk::test {
@@ -50,26 +46,13 @@ class Aftermath {
   std::size_t _descriptors = 0;
 };
 
-/// An authenticated connection, or none when the daemon closed it.
-FileDescriptor connection(const std::string& path) {
-  FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-  sockaddr_un address{};
-  address.sun_family = AF_UNIX;
-  std::memcpy(address.sun_path, path.c_str(), std::min(path.size() + 1, sizeof address.sun_path - 1));
-  if (::connect(socket.get(), reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) return {};
-  constexpr auto kGreeting = "\0AUTH EXTERNAL\r\nDATA\r\nBEGIN\r\n"sv;
-  ::send(socket.get(), kGreeting.data(), kGreeting.size(), MSG_NOSIGNAL);
-  char answer[64];
-  pollfd readable{socket.get(), POLLIN, 0};
-  if (::poll(&readable, 1, 60'000) != 1 || ::recv(socket.get(), answer, sizeof answer, 0) <= 0) return {};
-  return socket;
-}
-
 /// As many as get in of `count` that `user` makes.
-void connect(const DaemonHarness& harness, uid_t user, int count, std::vector<FileDescriptor>& open) {
+void connect(const DaemonHarness& harness, uid_t user, int count, std::vector<RawClient>& open) {
   ASSERT_EQ(::seteuid(user), 0);
   for (int i = 0; i < count; ++i) {
-    if (auto made = connection(harness.socketPath())) open.push_back(std::move(made));
+    RawClient client(harness.socketPath());
+    client.send("\0AUTH EXTERNAL\r\nDATA\r\nBEGIN\r\n"sv);
+    if (!client.line().empty()) open.push_back(std::move(client));
   }
   ASSERT_EQ(::seteuid(::getuid()), 0);
 }
@@ -81,7 +64,7 @@ TEST(HostileClients, ConnectionsInExcessAreClosedAndTheOthersGoOn) {
   Aftermath aftermath(harness);
   {
     RoadClient first(harness);
-    std::vector<FileDescriptor> open;
+    std::vector<RawClient> open;
     connect(harness, ::geteuid(), 300, open);
     EXPECT_EQ(open.size(), 255u) << "256 of one user, with the first";
     EXPECT_TRUE(harness.daemon().waitForText("Refused a connection of user"));

@@ -1,12 +1,11 @@
 // Posts and servers that go away: what is tried again, what is not, and what is lost.
-#include <arpa/inet.h>
 #include <gtest/gtest.h>
-#include <sys/socket.h>
 
 #include <atomic>
+#include <boost/asio/io_context.hpp>
+#include <boost/asio/ip/tcp.hpp>
 #include <thread>
 
-#include "platform/files/FileDescriptor.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/HTTPRequests.h"
 #include "tests/support/RecordingServer.h"
@@ -103,24 +102,15 @@ TEST(HTTPOutage, WhatTheServerHasWholeIsNeverSentAgain) {
 
 TEST(HTTPOutage, AConnectionThatTakesTooLongIsTriedAgain) {
   // Connections come to be, but nobody greets them.
-  FileDescriptor listener(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
-  sockaddr_in address{};
-  address.sin_family = AF_INET;
-  address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-  socklen_t size = sizeof address;
-  auto* name = reinterpret_cast<sockaddr*>(&address);
-  ASSERT_EQ(::bind(listener.get(), name, size), 0);
-  ASSERT_EQ(::listen(listener.get(), 8), 0);
-  ASSERT_EQ(::getsockname(listener.get(), name, &size), 0);
-
+  boost::asio::io_context context;
+  boost::asio::ip::tcp::acceptor listener(context, {boost::asio::ip::address_v4::loopback(), 0});
   auto options = quick();
   options.connectTimeout = 20ms;
   HTTPClient client(options);
-  client.start(postTo("https://127.0.0.1:" + std::to_string(ntohs(address.sin_port))),
+  client.start(postTo("https://127.0.0.1:" + std::to_string(listener.local_endpoint().port())),
                [](const HTTPResult& result) { EXPECT_EQ(result.error->kind, Kind::Stopped); });
-  FileDescriptor first(::accept(listener.get(), nullptr, nullptr));
-  FileDescriptor second(::accept(listener.get(), nullptr, nullptr));
-  EXPECT_TRUE(first && second);
+  const auto first = listener.accept(), second = listener.accept();
+  EXPECT_TRUE(first.is_open() && second.is_open());
 }
 
 }  // namespace

@@ -1,13 +1,10 @@
 // What clients that break the rules, or break, can do to the daemon and to others.
 #include <gtest/gtest.h>
-#include <poll.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
 
 #include <thread>
 
-#include "platform/ipc/BusReplies.h"
-#include "platform/ipc/ConnectionLoop.h"
 #include "platform/ipc/UnixSocket.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/IPCHarness.h"
@@ -129,10 +126,10 @@ TEST(IPCLimits, GoesOnAfterItHadNoDescriptorLeft) {
   EXPECT_EQ(client.call("flushMessagesWithReply"), "posted all");
 }
 
-const std::string kFlush = RawClient::message("flushMessagesWithReply", "", "");
+const std::string kFlush = wireMessage("flushMessagesWithReply", "", "");
 
 std::string bytesMessage(std::size_t size, int depth = 0) {
-  return RawClient::message("sendMessageWithDictionary", "a{sv}", RawClient::bytesDictionary(size, depth));
+  return wireMessage("sendMessageWithDictionary", "a{sv}", RawClient::bytesDictionary(size, depth));
 }
 
 constexpr std::size_t kMessage = std::size_t{1} << 20;
@@ -146,7 +143,7 @@ TEST(IPCLimits, TakesMessagesUpToTheLimit) {
   EXPECT_TRUE(service.journal.waitFor("message"));
   client.send(bytesMessage(kMessage - 16));
   client.send(bytesMessage(1, 100));
-  client.send(RawClient::message("flushMessagesWithReply", "", "", {.bigEndian = true}));
+  client.send(wireMessage("flushMessagesWithReply", "", "", {.bigEndian = true}));
   EXPECT_TRUE(service.journal.waitFor("flush")) << "the connection goes on";
   EXPECT_EQ(service.journal.count("message"), 1u);
 }
@@ -171,9 +168,9 @@ TEST(IPCLimits, ClosesWhoSendsNoMessagesOrOneOverTheLimit) {
 
 TEST(IPCLimits, DropsWhatIsBrokenInsideWithOneLineABurst) {
   const std::string notUTF8("\1\0\0\0\xff\0\0\0\0\0\0\0", 12);
-  for (const auto& broken : {RawClient::message("uploadFileAtPath", "sah", notUTF8),
-                             RawClient::message("no member", "", "") +
-                                 RawClient::message("fetchDisplayURL", "", "", {.descriptors = 1})}) {
+  for (const auto& broken :
+       {wireMessage("uploadFileAtPath", "sah", notUTF8),
+        wireMessage("no member", "", "") + wireMessage("fetchDisplayURL", "", "", {.descriptors = 1})}) {
     CapturedLog log;
     TestService service;
     RawClient client(service);
@@ -326,8 +323,7 @@ TEST(IPCLimits, ClosesWhoSendsDescriptorsOutOfPlace) {
   const std::size_t before = self.descriptors();
   RawClient unasked(service);
   unasked.authenticate();
-  sendWithDescriptors(unasked.fd(), RawClient::message("flushMessagesWithReply", "", "", {.descriptors = 1}),
-                      1);
+  sendWithDescriptors(unasked.fd(), wireMessage("flushMessagesWithReply", "", "", {.descriptors = 1}), 1);
   EXPECT_TRUE(service.journal.waitFor("flush"));
   unasked.close();
   RawClient many(service);
@@ -354,7 +350,7 @@ TEST(IPCLimits, ClosesWhoSendsDescriptorsOutOfPlace) {
 TEST(IPCLimits, GivesADescriptorToTheMessageThatItCameWith) {
   // "file", and an array of descriptor 0.
   const std::string body("\4\0\0\0file\0\0\0\0\4\0\0\0\0\0\0\0", 20);
-  const std::string upload = RawClient::message("uploadFileAtPath", "sah", body, {.descriptors = 1});
+  const std::string upload = wireMessage("uploadFileAtPath", "sah", body, {.descriptors = 1});
   TestService service;
   RawClient client(service);
   client.send("\0AUTH EXTERNAL\r\nDATA\r\nNEGOTIATE_UNIX_FD\r\n"s);

@@ -1,8 +1,5 @@
 #include <gtest/gtest.h>
 
-#include <cmath>
-#include <numeric>
-
 #include "platform/plist/PropertyList.h"
 
 namespace vesk {

@@ -156,6 +156,27 @@ TEST_F(ReadSourceTest, CancelsItselfAtTheEndOfItsStream) {
   EXPECT_THROW(ReadSource(queue, std::make_shared<const FileDescriptor>(), [] {}), std::system_error);
 }
 
+/// Stops a pool whose only thread is in work of this queue; `atTheEnd` is the end of that work, when the pool
+/// takes no more.
+void stopAtWork(WorkQueuePool& pool, WorkQueue& queue, const std::function<void()>& atTheEnd) {
+  std::promise<void> running, gate;
+  queue.submit([&, atTheEnd] {
+    running.set_value();
+    gate.get_future().wait();
+    atTheEnd();
+  });
+  running.get_future().wait();
+  queue.submit([atTheEnd, queue] { ADD_FAILURE() << "ran after the stop"; });
+  std::thread stopper([&] { pool.stop(); });
+  for (bool taken = true; taken; std::this_thread::yield()) {
+    auto probe = std::make_shared<int>(0);
+    queue.submit([probe] {});
+    taken = probe.use_count() > 1;
+  }
+  gate.set_value();
+  stopper.join();
+}
+
 TEST(WorkQueuePool, StopDestroysWhatHasNotRunAndEverythingMayOutliveIt) {
   auto token = std::make_shared<int>(1);
   auto pool = std::make_unique<WorkQueuePool>(1);
@@ -165,23 +186,7 @@ TEST(WorkQueuePool, StopDestroysWhatHasNotRunAndEverythingMayOutliveIt) {
   ReadSource source(queue, counter, [token, queue] {});
   queue.submitAfter(std::chrono::hours(1), [token, queue] {});
 
-  std::promise<void> running;
-  std::promise<void> gate;
-  queue.submit([&] {
-    running.set_value();
-    gate.get_future().wait();
-  });
-  running.get_future().wait();
-  queue.submit([token, queue] { ADD_FAILURE() << "ran after the stop"; });
-  std::thread stopper([&] { pool->stop(); });
-  // Once the pool is being stopped, it takes no more work.
-  for (bool taken = true; taken; std::this_thread::yield()) {
-    auto probe = std::make_shared<int>(0);
-    queue.submit([probe] {});
-    taken = probe.use_count() > 1;
-  }
-  gate.set_value();
-  stopper.join();
+  stopAtWork(*pool, queue, [token] {});
   pool->stop();
   pool.reset();
   EXPECT_EQ(token.use_count(), 1);
@@ -201,23 +206,7 @@ TEST(WorkQueuePool, WhatIsMadeWhileItStopsKeepsNothingAlive) {
   const std::weak_ptr<void> watched = ring;
   WorkQueuePool pool(1);
   WorkQueue queue(pool);
-  std::promise<void> begun;
-  std::promise<void> stopping;
-  queue.submit([&, ring] {
-    begun.set_value();
-    stopping.get_future().wait();
-    ring->emplace(queue, milliseconds(0), milliseconds(1), [ring] {});
-  });
-  begun.get_future().wait();
-  std::thread stopper([&pool] { pool.stop(); });
-  for (;;) {  // a pool that is stopped takes no work
-    auto probe = std::make_shared<int>();
-    queue.submit([probe] {});
-    if (probe.use_count() == 1) break;
-    std::this_thread::yield();
-  }
-  stopping.set_value();
-  stopper.join();
+  stopAtWork(pool, queue, [&] { ring->emplace(queue, milliseconds(0), milliseconds(1), [ring] {}); });
   ring.reset();
   EXPECT_TRUE(watched.expired());
 }

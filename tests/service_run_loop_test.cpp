@@ -4,7 +4,6 @@
 #include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/time.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <cstdlib>
@@ -12,6 +11,7 @@
 #include <thread>
 
 #include "daemon/RunLoop.h"
+#include "platform/ipc/UnixSocket.h"
 #include "platform/service/SchedulingClass.h"
 #include "tests/support/TempDirectory.h"
 
@@ -25,13 +25,6 @@ class RunLoopTest : public testing::Test {
  protected:
   void TearDown() override { ::unsetenv("NOTIFY_SOCKET"); }
 
-  static void bindTo(const FileDescriptor& descriptor, const std::filesystem::path& path) {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    path.string().copy(address.sun_path, sizeof address.sun_path - 1);
-    ASSERT_EQ(::bind(descriptor.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
-  }
-
   /// What the manager is told next.
   std::string notification() const {
     char text[256];
@@ -42,7 +35,8 @@ class RunLoopTest : public testing::Test {
   const test::TempDirectory _directory;
   const FileDescriptor _manager = [this] {
     FileDescriptor manager(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
-    bindTo(manager, _directory / "notify");
+    UnixSocketAddress address(_directory / "notify");
+    EXPECT_EQ(::bind(manager.get(), address.get(), address.size()), 0);
     timeval patience{20, 0};
     ::setsockopt(manager.get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
     ::setenv("NOTIFY_SOCKET", (_directory / "notify").c_str(), 1);
@@ -126,9 +120,7 @@ TEST_F(RunLoopTest, TellsTheManagerHowItGoes) {
 }
 
 TEST_F(RunLoopTest, TakesOverTheManagersSocket) {
-  FileDescriptor listening(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-  bindTo(listening, _directory / "listen");
-  ASSERT_EQ(::listen(listening.get(), 1), 0);
+  const FileDescriptor listening = listenOnUnixSocket(_directory / "listen");
   const auto inherit = [&](int first, int second) {
     ::dup2(first, 3);
     ::dup2(second, 4);

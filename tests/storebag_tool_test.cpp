@@ -145,8 +145,6 @@ TEST(StorebagDocument, TellsEveryWayInWhichOneIsNotValid) {
   const std::string bag = writeXMLPropertyList(Dictionary{{"version", "1"}}).value();
   const std::string encoded = base64Encode(bag);
   const std::string signature = base64Encode(kKey.sign(bag));
-  std::string tampered = bag;
-  tampered[bag.find("version")] = 'V';
   const std::string noList = "no property list";
   const auto with = [](const Value& bagText, const Value& signatureText) {
     return documentOf({{"bag", bagText}, {"signature", signatureText}});
@@ -161,16 +159,13 @@ TEST(StorebagDocument, TellsEveryWayInWhichOneIsNotValid) {
       {"good", good, StorebagVerdict::Valid},
       {"line breaks", with(encoded.substr(0, 8) + "\n  " + encoded.substr(8), signature),
        StorebagVerdict::Valid},
-      {"empty", "", StorebagVerdict::NoPropertyList},
       {"HTML", "<html>404</html>", StorebagVerdict::NoPropertyList},
       {"list", writeXMLPropertyList(List{1}).value(), StorebagVerdict::NoPropertyList},
       {"no signature", documentOf({{"bag", encoded}}), StorebagVerdict::SignatureMissing},
-      {"number as signature", with(encoded, 1), StorebagVerdict::SignatureMissing},
       {"empty signature", with(encoded, ""), StorebagVerdict::SignatureNoBase64},
       {"signature cut", with(encoded, signature.substr(1)), StorebagVerdict::SignatureNoBase64},
       {"no bag", documentOf({{"signature", signature}}), StorebagVerdict::BagMissing},
       {"bag cut", with(encoded.substr(1), signature), StorebagVerdict::BagNoBase64},
-      {"tampered", with(base64Encode(tampered), signature), StorebagVerdict::SignatureMismatch},
       {"other key", good, StorebagVerdict::SignatureMismatch, SigningKey::generate().publicKeyDER()},
       {"no key", good, StorebagVerdict::PublicKeyUnusable, "no key"},
       {"badly signed", signStorebagBadly({{"version", "1"}}, kKey), StorebagVerdict::SignatureMismatch},

@@ -31,9 +31,6 @@ TEST(Unicode, ComparesWithoutCase) {
       {"[", "{", false},
       {"straße", "STRASSE", true},
       {"Kelvin", "\u212Aelvin", true},
-      {"s", "ſ", true},
-      {"É", "é", true},
-      {"é", "e", false},
       {"user é", "USER É ", false},
   };
   for (const auto& c : cases) {
@@ -52,8 +49,8 @@ TEST(Unicode, FindsFragmentsWithoutCase) {
 }
 
 TEST(Unicode, TellsWellFormedUTF8) {
-  for (const char* text : {"", "ASCII only, longer than eight", "\u00E9", "\uFFFF", "\U00010000",
-                           "\U0010FFFF", "eight bytes and then \U0001F389"}) {
+  for (const char* text : {"", "ASCII only, longer than eight", "\x7F\xC2\x80\xDF\xBF\xE0\xA0\x80", "\uFFFF",
+                           "\U00010000", "\U0010FFFF", "eight bytes and then \U0001F389"}) {
     EXPECT_TRUE(isValidUTF8(text)) << text;
   }
   for (const char* text : {"\x80", "\xC0\x80", "\xC1\xBF", "\xC3", "\xE0\x80\x80", "\xE0\x9F\xBF", "\xE2\x82",

@@ -3,7 +3,6 @@
 
 #include <cstdlib>
 #include <cstring>
-#include <ctime>
 #include <set>
 
 #include "platform/device/DeviceInformation.h"

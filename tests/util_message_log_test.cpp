@@ -165,15 +165,6 @@ TEST_F(MessageLogTest, FollowsNoLinkOutOfItsDirectory) {
   EXPECT_EQ(files().size(), 1u);
 }
 
-TEST_F(MessageLogTest, SaysWhenItHasNoDirectory) {
-  _root.write("logs", "a file");
-  _log.write("lost");
-  const std::string wanted = path(fileName(_clock.time.load()));
-  EXPECT_EQ(_lines.count(3, "writeToLogFile: Error reading from log directory: Not a directory"), 1);
-  EXPECT_EQ(_lines.count(3, "writeToLogFile: Failed to create new veskreportingd log file " + wanted), 1);
-  EXPECT_EQ(_lines.lines().size(), 2u);
-}
-
 TEST_F(MessageLogTest, NeitherMixesNorLosesLinesOfSeveralThreads) {
   constexpr int kThreads = 4;
   constexpr int kLines = 50;

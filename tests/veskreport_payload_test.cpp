@@ -13,23 +13,15 @@ TEST(PayloadParser, PairsBecomeValuesOfTheTypeThatIsWritten) {
     const char* key;
     Value value;
   };
-  for (const Case& c : {
-           Case{"k=text", "k", "text"},
-           Case{"k=", "k", ""},
-           Case{"k=1", "k", "1"},
-           Case{"k=a=b:=c", "k", "a=b:=c"},
-           Case{"a key=\xc3\xbc", "a key", "\xc3\xbc"},
-           Case{"k:=null", "k", Value()},
-           Case{"k:=true", "k", true},
-           Case{"k:=-7", "k", -7},
-           Case{"k:=9223372036854775807", "k", std::numeric_limits<std::int64_t>::max()},
-           Case{"k:=18446744073709551615", "k", std::numeric_limits<std::uint64_t>::max()},
-           Case{"k:=1.5", "k", 1.5},
-           Case{"k:=1e3", "k", 1000.0},
-           Case{R"(k:="quoted")", "k", "quoted"},
-           Case{R"(k:=[1,"a",[]])", "k", List{1, "a", List{}}},
-           Case{R"(k:={"b":{"c":1},"a":2})", "k", Dictionary{{"b", Dictionary{{"c", 1}}}, {"a", 2}}},
-       }) {
+  for (const Case& c :
+       {Case{"k=text", "k", "text"}, Case{"k=", "k", ""}, Case{"k=1", "k", "1"},
+        Case{"k=a=b:=c", "k", "a=b:=c"}, Case{"a key=\xc3\xbc", "a key", "\xc3\xbc"},
+        Case{"k:=null", "k", Value()}, Case{"k:=true", "k", true}, Case{"k:=-7", "k", -7},
+        Case{"k:=9223372036854775807", "k", std::numeric_limits<std::int64_t>::max()},
+        Case{"k:=18446744073709551615", "k", std::numeric_limits<std::uint64_t>::max()},
+        Case{"k:=1.5", "k", 1.5}, Case{"k:=1e3", "k", 1000.0}, Case{R"(k:="quoted")", "k", "quoted"},
+        Case{R"(k:=[1,"a",[]])", "k", List{1, "a", List{}}},
+        Case{R"(k:={"b":{"c":1},"a":2})", "k", Dictionary{{"b", Dictionary{{"c", 1}}}, {"a", 2}}}}) {
     SCOPED_TRACE(c.argument);
     auto parsed = parsePairs({c.argument});
     ASSERT_TRUE(parsed.value) << parsed.error;

@@ -32,13 +32,6 @@ action = "remove"
 
 }  // namespace
 
-// Server errors (5xx) are left out: they switch a backend off, and everything after that is a counted drop.
-const FaultRun::Fault FaultRun::kFaults[] = {
-    {8, &FaultRun::answerBadly},     {3, &FaultRun::stallPosts},   {4, &FaultRun::collectorAway},
-    {3, &FaultRun::freezeCollector}, {2, &FaultRun::freezeClient}, {6, &FaultRun::killClient},
-    {5, &FaultRun::terminateDaemon}, {3, &FaultRun::killDaemon},   {1, &FaultRun::terminateDaemonInOutage},
-};
-
 FaultRun::FaultRun(Options options)
     : _options(options), _random(options.seed), _page((_harness.root / "page").string()) {
   _harness.writeStorebag("zelko", kStorebag);
@@ -59,20 +52,24 @@ void FaultRun::pause(std::uint64_t least, std::uint64_t most) {
 // --- Faults
 
 void FaultRun::disturb() {
-  while (std::chrono::steady_clock::now() - _begun < _options.duration) {
+  while (std::chrono::steady_clock::now() - _begun < std::chrono::seconds(_options.seconds)) {
     pause(100, 1200);
     injectOne();
   }
 }
 
 void FaultRun::injectOne() {
-  unsigned all = 0;
-  for (const Fault& fault : kFaults) all += fault.weight;
-  auto drawn = static_cast<unsigned>(_random() % all);
-  for (const Fault& fault : kFaults) {
-    if (drawn < fault.weight) return (this->*fault.inject)();
-    drawn -= fault.weight;
-  }
+  // Server errors (5xx) are left out: they switch a backend off, and everything after that is a counted drop.
+  const auto drawn = _random() % 35;
+  if (drawn < 8) return answerBadly();
+  if (drawn < 11) return stallPosts();
+  if (drawn < 15) return collectorAway();
+  if (drawn < 18) return freeze("collector", _harness.collector());
+  if (drawn < 20) return freeze("client", *_clients[_random() % _clients.size()]);
+  if (drawn < 26) return killClient();
+  if (drawn < 31) return replaceDaemon(DaemonEnd::Terminated);
+  if (drawn < 34) return replaceDaemon(DaemonEnd::Killed);
+  terminateDaemonInOutage();
 }
 
 void FaultRun::answerBadly() {
@@ -100,19 +97,11 @@ void FaultRun::collectorAway() {
   _harness.startCollector();
 }
 
-void FaultRun::freezeCollector() {
-  say("collector frozen");
-  _harness.collector().signal(SIGSTOP);
+void FaultRun::freeze(const char* what, const ChildProcess& process) {
+  say(std::string(what) + " frozen");
+  process.signal(SIGSTOP);
   pause(200, 2000);
-  _harness.collector().signal(SIGCONT);
-}
-
-void FaultRun::freezeClient() {
-  auto& client = *_clients[_random() % _clients.size()];
-  say("client frozen");
-  client.signal(SIGSTOP);
-  pause(200, 2000);
-  client.signal(SIGCONT);
+  process.signal(SIGCONT);
 }
 
 void FaultRun::killClient() {
@@ -123,15 +112,9 @@ void FaultRun::killClient() {
   startClient(index);
 }
 
-void FaultRun::terminateDaemon() {
-  say("daemon terminated, another started");
-  endDaemon(DaemonEnd::Terminated);
-  startDaemon();
-}
-
-void FaultRun::killDaemon() {
-  say("daemon killed, another started");
-  endDaemon(DaemonEnd::Killed);
+void FaultRun::replaceDaemon(DaemonEnd end) {
+  say(end == DaemonEnd::Killed ? "daemon killed, another started" : "daemon terminated, another started");
+  endDaemon(end);
   startDaemon();
 }
 
@@ -209,13 +192,11 @@ void FaultRun::sendFreshMessage() {
   RoadClient client(_harness);
   if (!client.reporting.sendMessageAndWait(OracleMessage(kFresh).parameters(1), ChildProcess::kPatience))
     throw std::runtime_error("the daemon does not take a fresh message");
-  const auto deadline = std::chrono::steady_clock::now() + ChildProcess::kPatience;
-  while (!_ledger.hasArrived(kFresh)) {
-    if (std::chrono::steady_clock::now() > deadline)
-      throw std::runtime_error("a fresh message does not flow");
-    std::this_thread::sleep_for(20ms);  // between two looks at the file
+  const bool hasArrived = eventually([&] {
     _ledger.readEvents((_harness.root / "events.jsonl").string());
-  }
+    return _ledger.hasArrived(kFresh);
+  });
+  if (!hasArrived) throw std::runtime_error("a fresh message does not flow");
   say("a fresh message flows");
 }
 

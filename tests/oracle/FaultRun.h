@@ -22,7 +22,7 @@ class FaultRun {
  public:
   struct Options {
     std::uint64_t seed = 1;
-    std::chrono::seconds duration{25};
+    std::int64_t seconds = 25;
     std::size_t clients = 4;
   };
   /// Everything runs once it is made.
@@ -34,21 +34,13 @@ class FaultRun {
   bool judge();
 
  private:
-  struct Fault {
-    unsigned weight;
-    void (FaultRun::*inject)();
-  };
-  static const Fault kFaults[];
-
   void injectOne();
   void answerBadly();
   void stallPosts();
   void collectorAway();
-  void freezeCollector();
-  void freezeClient();
+  void freeze(const char* what, const ChildProcess& process);
   void killClient();
-  void terminateDaemon();
-  void killDaemon();
+  void replaceDaemon(DaemonEnd end);
   void terminateDaemonInOutage();
 
   void startDaemon();

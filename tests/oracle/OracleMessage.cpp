@@ -50,23 +50,18 @@ Dictionary OracleMessage::parameters(int flag) const {
 }
 
 std::string OracleMessage::changeIn(const boost::json::object& event) const {
-  auto differs = [&](const char* key, auto isRight) {
-    const auto* value = event.if_contains(key);
-    return value == nullptr || !isRight(*value);
-  };
-  using JSON = boost::json::value;
-  if (differs(kIDKey, [&](const JSON& v) { return v == _id; })) return kIDKey;
-  if (differs("oracleText", [&](const JSON& v) { return v == boost::json::string(text()); }))
-    return "oracleText";
-  if (differs("oracleNegative", [&](const JSON& v) { return v == negative(); })) return "oracleNegative";
-  if (differs("oracleLarge", [&](const JSON& v) { return v == large(); })) return "oracleLarge";
-  if (differs("oracleRatio",
-              [&](const JSON& v) { return v.is_number() && v.to_number<double>() == ratio(); }))
-    return "oracleRatio";
-  if (differs("oracleOdd", [&](const JSON& v) { return v == isOdd(); })) return "oracleOdd";
-  if (differs("oracleWhen", [&](const JSON& v) { return v.is_number() && v.to_number<double>() == ratio(); }))
-    return "oracleWhen";
-  if (differs("_method", [&](const JSON& v) { return v == category(); })) return "_method";
+  const boost::json::object expected{{kIDKey, _id},
+                                     {"oracleText", text()},
+                                     {"oracleNegative", negative()},
+                                     {"oracleLarge", large()},
+                                     {"oracleRatio", ratio()},
+                                     {"oracleOdd", isOdd()},
+                                     {"oracleWhen", ratio()},
+                                     {"_method", category()}};
+  for (const auto& [key, value] : expected) {
+    const auto* found = event.if_contains(key);
+    if (found == nullptr || *found != value) return key;
+  }
   return "";
 }
 

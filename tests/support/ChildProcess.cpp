@@ -1,19 +1,15 @@
 #include "tests/support/ChildProcess.h"
 
-#include <fcntl.h>
 #include <poll.h>
 #include <signal.h>
 #include <spawn.h>
-#include <sys/eventfd.h>
 #include <sys/mman.h>
+#include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <array>
-#include <cerrno>
 #include <cstring>
-#include <filesystem>
 #include <stdexcept>
 
 extern char** environ;
@@ -22,26 +18,20 @@ namespace vesk::test {
 
 namespace {
 
-using Clock = std::chrono::steady_clock;
-
-int millisecondsUntil(Clock::time_point end) {
-  auto left = std::chrono::ceil<std::chrono::milliseconds>(end - Clock::now()).count();
-  return static_cast<int>(std::max<long>(0, left));
-}
-
-FileDescriptor inputHolding(const std::string& text) {
-  FileDescriptor file(::memfd_create("input", MFD_CLOEXEC));
+FileDescriptor fileHolding(const std::string& text = {}) {
+  FileDescriptor file(::memfd_create("child", MFD_CLOEXEC));
   if (!file || ::write(file.get(), text.data(), text.size()) != static_cast<ssize_t>(text.size()))
-    throw std::runtime_error("no standard input for a child process");
+    throw std::runtime_error("no file for a child process");
   ::lseek(file.get(), 0, SEEK_SET);
   return file;
 }
 
-/// The reading and the writing end.
-std::array<FileDescriptor, 2> makePipe() {
-  int ends[2];
-  if (::pipe2(ends, O_CLOEXEC) != 0) throw std::runtime_error("no pipe for a child process");
-  return {FileDescriptor(ends[0]), FileDescriptor(ends[1])};
+std::string contentsOf(const FileDescriptor& file) {
+  struct stat status {};
+  ::fstat(file.get(), &status);
+  std::string text(static_cast<std::size_t>(status.st_size), '\0');
+  text.resize(static_cast<std::size_t>(::pread(file.get(), text.data(), text.size(), 0)));
+  return text;
 }
 
 std::vector<std::string> environmentWith(const std::map<std::string, std::string>& added) {
@@ -63,19 +53,14 @@ std::vector<char*> pointersTo(std::vector<std::string>& texts) {
 
 }  // namespace
 
-ChildProcess::ChildProcess(Options options) : _stop(::eventfd(0, EFD_CLOEXEC)) {
-  FileDescriptor input = inputHolding(options.input);
-  auto output = makePipe();
-  auto errors = makePipe();
+ChildProcess::ChildProcess(Options options) : _output(fileHolding()), _errors(fileHolding()) {
+  FileDescriptor input = fileHolding(options.input);
   posix_spawn_file_actions_t actions;
   ::posix_spawn_file_actions_init(&actions);
   ::posix_spawn_file_actions_adddup2(&actions, input.get(), STDIN_FILENO);
-  ::posix_spawn_file_actions_adddup2(&actions, errors[1].get(), STDERR_FILENO);
-  if (options.outputClosed) {
-    ::posix_spawn_file_actions_addclose(&actions, STDOUT_FILENO);
-  } else {
-    ::posix_spawn_file_actions_adddup2(&actions, output[1].get(), STDOUT_FILENO);
-  }
+  ::posix_spawn_file_actions_adddup2(&actions, _errors.get(), STDERR_FILENO);
+  ::posix_spawn_file_actions_adddup2(&actions, _output.get(), STDOUT_FILENO);
+  if (options.outputClosed) ::posix_spawn_file_actions_addclose(&actions, STDOUT_FILENO);
   auto environment = environmentWith(options.environment);
   auto arguments = pointersTo(options.command);
   int error = ::posix_spawnp(&_pid, arguments[0], &actions, nullptr, arguments.data(),
@@ -83,93 +68,43 @@ ChildProcess::ChildProcess(Options options) : _stop(::eventfd(0, EFD_CLOEXEC)) {
   ::posix_spawn_file_actions_destroy(&actions);
   if (error != 0) throw std::runtime_error("can't start " + options.command[0] + ": " + std::strerror(error));
   _process = FileDescriptor(static_cast<int>(::syscall(SYS_pidfd_open, _pid, 0)));
-  _output = std::move(output[0]);
-  _errors = std::move(errors[0]);
-  _collector = std::thread([this] { collect(); });
 }
 
 ChildProcess::~ChildProcess() {
-  if (!_status) {
-    signal(SIGKILL);
-    ::waitpid(_pid, nullptr, 0);
-  }
-  ::eventfd_write(_stop.get(), 1);
-  _collector.join();
+  signal(SIGKILL);
+  if (!_status) ::waitpid(_pid, nullptr, 0);
 }
 
 void ChildProcess::signal(int number) const {
   if (!_status) ::kill(_pid, number);
 }
 
-std::optional<int> ChildProcess::wait(std::chrono::milliseconds patience) {
-  if (_status) return _status;
-  auto end = Clock::now() + patience;
+bool ChildProcess::hasEnded(std::chrono::milliseconds patience) const {
   pollfd ended{_process.get(), POLLIN, 0};
-  while (::poll(&ended, 1, millisecondsUntil(end)) < 0 && errno == EINTR) {
-  }
+  return ::poll(&ended, 1, static_cast<int>(patience.count())) > 0;
+}
+
+std::optional<int> ChildProcess::wait(std::chrono::milliseconds patience) {
+  if (_status || !hasEnded(patience)) return _status;
   int status = 0;
-  if (::waitpid(_pid, &status, WNOHANG) != _pid) return std::nullopt;
-  _status = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-  std::unique_lock lock(_mutex);
-  _changed.wait_until(lock, end, [&] { return _collected; });
-  return _status;
+  ::waitpid(_pid, &status, 0);
+  return _status = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
 }
 
-std::string ChildProcess::output() const {
-  std::lock_guard lock(_mutex);
-  return _outputText;
-}
+std::string ChildProcess::output() const { return contentsOf(_output); }
 
-std::string ChildProcess::errors() const {
-  std::lock_guard lock(_mutex);
-  return _errorText;
-}
+std::string ChildProcess::errors() const { return contentsOf(_errors); }
 
-bool ChildProcess::waitForText(std::string_view text, int count, std::chrono::milliseconds patience) const {
-  auto occurrences = [&](const std::string& in) {
-    int found = 0;
-    for (std::size_t at = 0; (at = in.find(text, at)) != std::string::npos; at += text.size()) ++found;
-    return found;
-  };
-  auto seen = [&] { return occurrences(_outputText) + occurrences(_errorText) >= count; };
-  std::unique_lock lock(_mutex);
-  _changed.wait_for(lock, patience, [&] { return _collected || seen(); });
-  return seen();
-}
-
-void ChildProcess::collect() {
-  bool outputOpen = true;
-  bool errorsOpen = true;
-  while (outputOpen || errorsOpen) {
-    std::array<pollfd, 3> waits{pollfd{outputOpen ? _output.get() : -1, POLLIN, 0},
-                                pollfd{errorsOpen ? _errors.get() : -1, POLLIN, 0},
-                                pollfd{_stop.get(), POLLIN, 0}};
-    if (::poll(waits.data(), waits.size(), -1) < 0) continue;
-    if (waits[0].revents != 0) outputOpen = collectFrom(_output.get(), _outputText);
-    if (waits[1].revents != 0) errorsOpen = collectFrom(_errors.get(), _errorText);
-    if (waits[2].revents != 0) break;
-  }
-  std::lock_guard lock(_mutex);
-  _collected = true;
-  _changed.notify_all();
-}
-
-bool ChildProcess::collectFrom(int descriptor, std::string& text) {
-  std::array<char, 64 * 1024> piece;
-  ssize_t count = ::read(descriptor, piece.data(), piece.size());
-  if (count < 0) return errno == EINTR || errno == EAGAIN;
-  std::lock_guard lock(_mutex);
-  text.append(piece.data(), static_cast<std::size_t>(count));
-  _changed.notify_all();
-  return count > 0;
-}
-
-bool waitForFile(const std::string& path, std::chrono::milliseconds patience) {
-  for (auto end = Clock::now() + patience; !std::filesystem::exists(path);) {
-    if (Clock::now() > end) return false;
-    std::this_thread::sleep_for(std::chrono::milliseconds(5));  // between two looks
-  }
-  return true;
+bool ChildProcess::waitForText(std::string_view text, int count) const {
+  int found = 0;
+  eventually([&] {
+    const bool isLastLook = hasEnded({});
+    const std::string all = output() + errors();
+    found = 0;
+    for (std::size_t at = 0; (at = all.find(text, at)) != std::string::npos; at += text.size()) ++found;
+    return found >= count || isLastLook;
+  });
+  return found >= count;
 }
 
 }  // namespace vesk::test

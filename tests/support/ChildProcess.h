@@ -4,9 +4,7 @@
 #include <sys/types.h>
 
 #include <chrono>
-#include <condition_variable>
 #include <map>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -17,7 +15,7 @@
 
 namespace vesk::test {
 
-/// Starts with construction and is killed with destruction. Its output is collected all the time, so that it
+/// Starts with construction and is killed with destruction. Its output goes into files in memory, so that it
 /// never waits for its reader.
 class ChildProcess {
  public:
@@ -42,7 +40,7 @@ class ChildProcess {
   void signal(int number) const;
 
   /// The exit status once it has ended, 128 + the signal when one ended it; nothing when it still runs after
-  /// `patience`. All its output has been collected then.
+  /// `patience`.
   std::optional<int> wait(std::chrono::milliseconds patience = kPatience);
 
   /// What it wrote so far.
@@ -50,31 +48,28 @@ class ChildProcess {
   std::string errors() const;
 
   /// Waits until it has written `text` to standard output or error, `count` times in all; false when it ended
-  /// or `patience` ran out before.
-  bool waitForText(std::string_view text, int count = 1,
-                   std::chrono::milliseconds patience = kPatience) const;
+  /// or kPatience ran out before.
+  bool waitForText(std::string_view text, int count = 1) const;
 
  private:
-  void collect();
-  bool collectFrom(int descriptor, std::string& text);
+  bool hasEnded(std::chrono::milliseconds patience) const;
 
-  pid_t _pid = -1;
-  FileDescriptor _process;  // readable once the process has ended
   FileDescriptor _output;
   FileDescriptor _errors;
-  FileDescriptor _stop;
+  pid_t _pid = -1;
+  FileDescriptor _process;  // readable once the process has ended
   std::optional<int> _status;
-
-  mutable std::mutex _mutex;
-  mutable std::condition_variable _changed;
-  std::string _outputText;  // these three under _mutex
-  std::string _errorText;
-  bool _collected = false;
-
-  std::thread _collector;
 };
 
-/// Waits until the file exists (a ready file appears whole); false when `patience` ran out before.
-bool waitForFile(const std::string& path, std::chrono::milliseconds patience = ChildProcess::kPatience);
+/// Looks again and again until it is so; false when ChildProcess::kPatience ran out before.
+template <class Condition>
+bool eventually(Condition isSo) {
+  const auto deadline = std::chrono::steady_clock::now() + ChildProcess::kPatience;
+  while (!isSo()) {
+    if (std::chrono::steady_clock::now() > deadline) return false;
+    std::this_thread::sleep_for(std::chrono::milliseconds(5));  // between two looks
+  }
+  return true;
+}
 
 }  // namespace vesk::test

@@ -72,7 +72,7 @@ void DaemonHarness::startCollector(std::vector<std::string> arguments) {
   command.insert(command.end(), arguments.begin(), arguments.end());
   std::filesystem::remove(root / "ready");
   _collector = std::make_unique<ChildProcess>(std::move(command));
-  if (!waitForFile((root / "ready").string()))
+  if (!eventually([&] { return std::filesystem::exists(root / "ready"); }))
     throw std::runtime_error("no collector: " + _collector->errors());
   _facts = boost::json::parse(root.read("ready")).as_object();
 }

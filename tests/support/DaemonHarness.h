@@ -5,7 +5,6 @@
 #include <VeskReporting/VeskReportingKeys.h>
 
 #include <boost/json.hpp>
-#include <filesystem>
 #include <functional>
 #include <map>
 #include <memory>

@@ -164,7 +164,7 @@ void TestClient::post(const char* member, std::vector<IPCArgument> arguments) {
 
 // --- RawClient
 
-RawClient::RawClient(const TestService& service) : _socket(connectUnixSocket(service.path())) {}
+RawClient::RawClient(const std::string& socketPath) : _socket(connectUnixSocket(socketPath)) {}
 
 void RawClient::send(std::string_view bytes) {
   while (!bytes.empty()) {
@@ -204,67 +204,6 @@ bool RawClient::isClosed() {
     if (::poll(&poll, 1, 30'000) <= 0) return false;
     if (::recv(_socket.get(), buffer, sizeof buffer, 0) <= 0) return true;
   }
-}
-
-namespace {
-
-/// Bytes of a message in either byte order.
-class Marshalled {
- public:
-  explicit Marshalled(bool bigEndian) : _bigEndian(bigEndian) {}
-
-  void number(std::uint32_t value) {
-    align(4);
-    for (int i = 0; i < 4; ++i) _bytes += static_cast<char>(value >> (_bigEndian ? 24 - 8 * i : 8 * i));
-  }
-  void text(std::string_view value) {
-    number(static_cast<std::uint32_t>(value.size()));
-    _bytes.append(value).append(1, '\0');
-  }
-  void signature(std::string_view value) {
-    _bytes.append(1, static_cast<char>(value.size())).append(value).append(1, '\0');
-  }
-  void raw(std::string_view value) { _bytes += value; }
-  void align(std::size_t to) { _bytes.resize((_bytes.size() + to - 1) / to * to); }
-  void field(char code, const char* type, std::string_view value) {
-    align(8);
-    _bytes += code;
-    signature(type);
-    *type == 'g' ? signature(value) : text(value);
-  }
-  std::string take() { return std::move(_bytes); }
-
- private:
-  const bool _bigEndian;
-  std::string _bytes;
-};
-
-}  // namespace
-
-std::string RawClient::message(const char* member, const char* signature, const std::string& body,
-                               Header header) {
-  Marshalled fields(header.bigEndian);
-  fields.field(1, "o", wire::kObjectPath);
-  fields.field(2, "s", wire::kSessionInterface);
-  fields.field(3, "s", member);
-  fields.field(8, "g", signature);
-  if (header.descriptors > 0) {
-    fields.align(8);
-    fields.raw("\x09\1u\0"sv);
-    fields.number(header.descriptors);
-  }
-  const std::string fieldBytes = fields.take();
-
-  Marshalled whole(header.bigEndian);
-  // One-way; version 1.
-  whole.raw(header.bigEndian ? "B\1\1\1"sv : "l\1\1\1"sv);
-  whole.number(static_cast<std::uint32_t>(body.size()));
-  whole.number(1);
-  whole.number(static_cast<std::uint32_t>(fieldBytes.size()));
-  whole.raw(fieldBytes);
-  whole.align(8);
-  whole.raw(body);
-  return whole.take();
 }
 
 std::string RawClient::bytesDictionary(std::size_t size, int depth) {

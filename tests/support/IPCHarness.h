@@ -1,11 +1,11 @@
 // A listener with recording sessions behind it, and clients that are driven by hand.
 #pragma once
 
-#include "client/protocol/WireNames.h"
 #include "platform/ipc/BusClient.h"
 #include "platform/ipc/IPCListener.h"
 #include "tests/support/RecordingSession.h"
 #include "tests/support/TempDirectory.h"
+#include "tests/support/WireMessage.h"
 
 namespace vesk::test {
 
@@ -88,7 +88,8 @@ class TestClient : public IPCExportedObject {
 /// A client that writes bytes.
 class RawClient {
  public:
-  explicit RawClient(const TestService& service);
+  explicit RawClient(const TestService& service) : RawClient(service.path()) {}
+  explicit RawClient(const std::string& socketPath);
 
   int fd() const { return _socket.get(); }
   void send(std::string_view bytes);
@@ -99,16 +100,6 @@ class RawClient {
   bool isClosed();
   void close() { _socket.reset(); }
 
-  struct Header {
-    bool bigEndian = false;
-    std::uint32_t descriptors = 0;
-  };
-  /// A call as it goes over the wire.
-  static std::string message(const char* member, const char* signature, const std::string& body,
-                             Header header);
-  static std::string message(const char* member, const char* signature, const std::string& body) {
-    return message(member, signature, body, {});
-  }
   /// The body of an a{sv} with one byte string.
   static std::string bytesDictionary(std::size_t size, int depth = 0);
 

@@ -3,12 +3,9 @@
 
 #include <sys/types.h>
 
-#include <chrono>
 #include <filesystem>
-#include <fstream>
 #include <iterator>
 #include <string>
-#include <thread>
 
 #include "tests/support/ChildProcess.h"
 
@@ -34,16 +31,5 @@ class ProcessFacts {
   }
   std::string _directory;
 };
-
-/// Looks again and again until it is so; false when ChildProcess::kPatience ran out before.
-template <class Condition>
-bool eventually(Condition isSo) {
-  const auto deadline = std::chrono::steady_clock::now() + ChildProcess::kPatience;
-  while (!isSo()) {
-    if (std::chrono::steady_clock::now() > deadline) return false;
-    std::this_thread::sleep_for(std::chrono::milliseconds(5));  // between two looks
-  }
-  return true;
-}
 
 }  // namespace vesk::test

@@ -14,10 +14,15 @@ class RecordingServer {
   using Answer = std::function<HTTPAnswer(const HTTPReceived& request, std::size_t count)>;
 
   explicit RecordingServer(Answer answer = {}, HTTPServer::Options options = {})
-      : _answer(std::move(answer)), _options(std::move(options)) {
+      : _options(std::move(options)), _answer(std::move(answer)) {
     start();
   }
 
+  /// The same to all requests from now on.
+  void answerWith(HTTPAnswer next) {
+    std::lock_guard lock(_mutex);
+    _answer = [next = std::move(next)](const HTTPReceived&, std::size_t) { return next; };
+  }
   /// Goes down; its port refuses connections.
   void stop() { _server->stop(); }
   /// Comes back on the same port.
@@ -42,18 +47,17 @@ class RecordingServer {
 
  private:
   HTTPAnswer receive(const HTTPReceived& request) {
-    std::size_t before = 0;
-    {
-      std::lock_guard lock(_mutex);
-      before = _requests.size();
-      _requests.push_back(request);
-    }
-    return _answer ? _answer(request, before) : HTTPAnswer::text(200, "ok");
+    std::unique_lock lock(_mutex);
+    const std::size_t before = _requests.size();
+    _requests.push_back(request);
+    const Answer answer = _answer;
+    lock.unlock();
+    return answer ? answer(request, before) : HTTPAnswer::text(200, "ok");
   }
 
-  const Answer _answer;
   HTTPServer::Options _options;
   mutable std::mutex _mutex;
+  Answer _answer;
   std::vector<HTTPReceived> _requests;
   std::unique_ptr<HTTPServer> _server;
 };
