@@ -170,6 +170,7 @@ std::int32_t HTTPSPostBackend::stateForSampling(const Dictionary& entry) {
   double draw = samplingFactor();
   if (draw <= *_samplingThreshold->asDouble()) return BackendStateEnabled;
   _overrideSampling = profileNumber(_name, entry, "override_sampling");
+  if (!_overrideSampling && entry.contains("override_sampling")) return BackendStateDisabled;
   if (!_overrideSampling || draw <= *_overrideSampling->asDouble()) return BackendStateOverride;
   return BackendStateDisabled;
 }

@@ -88,6 +88,7 @@ TEST_F(BackendState, FollowsTheMatchingEntry) {
       {"draw above, no override", entry({{"sampling_threshold", 0.29}}), 3},
       {"draw inside override", entry({{"sampling_threshold", 0.1}, {"override_sampling", 0.30}}), 3},
       {"draw outside override", entry({{"sampling_threshold", 0.1}, {"override_sampling", 0.20}}), 1},
+      {"override of a wrong type", entry({{"sampling_threshold", 0.1}, {"override_sampling", "0.30"}}), 1},
       {"threshold of a wrong type", entry({{"sampling_threshold", "high"}}), 1},
       {"filters of a wrong type", entry({{"filters", 7}}), 1},
       {"client of a wrong type", entry({{"client", List{"Camera"}}}), 1},

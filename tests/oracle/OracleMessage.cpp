@@ -57,7 +57,8 @@ std::string OracleMessage::changeIn(const boost::json::object& event) const {
                                      {"oracleRatio", ratio()},
                                      {"oracleOdd", isOdd()},
                                      {"oracleWhen", ratio()},
-                                     {"_method", category()}};
+                                     {"_method", category()},
+                                     {"_status", type()}};
   for (const auto& [key, value] : expected) {
     const auto* found = event.if_contains(key);
     if (found == nullptr || *found != value) return key;
