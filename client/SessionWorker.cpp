@@ -149,12 +149,14 @@ void SessionWorker::endOverdue(Time now) {
   auto first = _waiting.firstDeadline();
   if (!first || *first > now) return;
   std::vector<ClientCall> overdue;
-  _waiting.moveOverdue(overdue, now);
+  _waiting.moveOverdue(overdue, now, _callsInBus == 0);
   auto status = _link.isReady() ? ReportingStatus::TimedOut : ReportingStatus::NotConnected;
   for (const ClientCall& call : overdue) {
-    ++_callsGone;
-    _memoryGone += call.memory;
-    _drops.unsent();
+    if (call.call.member) {
+      ++_callsGone;
+      _memoryGone += call.memory;
+      if (call.end) _drops.unsent();
+    }
     finish(call.end, status, nullptr, _link.isReady() ? "" : _link.problem());
   }
 }

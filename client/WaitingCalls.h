@@ -41,18 +41,28 @@ class WaitingCalls {
     _answered += answered;
   }
 
-  /// Moves those whose answer is overdue to `overdue`, in order. When it throws std::bad_alloc, all stay.
-  void moveOverdue(std::vector<ClientCall>& overdue, ClientCall::Time now) {
-    overdue.reserve(_answered);
+  /// Moves those whose answer is overdue to `overdue`, in order. What they leave behind in the daemon is
+  /// wanted all the same: such a call stays, one way, and only its end is moved (`call.member` is null). With
+  /// `mayReplace`, it takes the place of one just before it that does the same. When it throws
+  /// std::bad_alloc, all stay.
+  void moveOverdue(std::vector<ClientCall>& overdue, ClientCall::Time now, bool mayReplace) {
+    overdue.reserve(2 * _answered);
     removeGone();
     auto kept = _calls.begin();
     for (auto call = _calls.begin(); call != _calls.end(); ++call) {
       if (call->wantsAnswer() && call->deadline <= now) {
         --_answered;
-        overdue.push_back(std::move(*call));
-      } else if (kept++ != call) {
-        *std::prev(kept) = std::move(*call);
+        if (call->effect == CallEffect::None) {
+          overdue.push_back(std::move(*call));
+          continue;
+        }
+        overdue.emplace_back().end = std::move(call->end);
+        if (mayReplace && kept != _calls.begin() && std::prev(kept)->isPlain() &&
+            std::prev(kept)->effect == call->effect) {
+          overdue.push_back(std::move(*--kept));
+        }
       }
+      if (kept++ != call) *std::prev(kept) = std::move(*call);
     }
     _calls.erase(kept, _calls.end());
   }

@@ -48,6 +48,23 @@ TEST_F(ClientOutage, SendsInOrderWhatWasQueuedBeforeTheDaemonWasThere) {
   }
 }
 
+TEST_F(ClientOutage, StartsThoughItsCallerNoLongerWaits) {
+  VeskReporting session(options());
+  EXPECT_EQ(session.setSessionInfo(sessionInfo), ReportingStatus::Queued);
+  for (int i = 0; i < 3; ++i) EXPECT_FALSE(session.startConfig(1ms));
+  EXPECT_FALSE(session.fetchStates(Dictionary{{kVeskReportingUserInfoClientName, "second"}}, 1ms));
+  EXPECT_FALSE(session.fetchDisplayURL(1ms));
+  EXPECT_EQ(session.sendMessage(9, 1), ReportingStatus::Queued);
+  daemon.emplace(socket, record);
+  ASSERT_TRUE(record.waitFor("message 9 1"));
+  auto lines = record.lines();
+  ASSERT_EQ(lines.size(), 4u);
+  EXPECT_TRUE(lines[0].starts_with("setSessionInfo"));
+  EXPECT_EQ(lines[1], "startConfig");
+  EXPECT_TRUE(lines[2].starts_with("fetchStates")) << lines[2];
+  EXPECT_EQ(session.drops().total(), 1u);
+}
+
 TEST_F(ClientOutage, ConfiguresAndStartsAgainBeforeItSendsWhatIsQueued) {
   const Dictionary user{{kVeskReportingUserInfoClientName, "second"}};
   daemon.emplace(socket, record);

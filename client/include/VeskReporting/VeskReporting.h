@@ -48,13 +48,15 @@ class VESK_API VeskReporting {
                                  std::vector<std::string> frameworksToCheck = {},
                                  AggregationHandler aggregationHandler = nullptr) noexcept;
 
-  /// 2. Starts the session: the daemon fetches the storebag of the client type and makes its backends.
+  /// 2. Starts the session: the daemon fetches the storebag of the client type and makes its backends. When
+  /// the daemon is not reached in time, it is done once it is.
   ReportingResult<BackendNamesAnswer> startConfig(
       std::chrono::milliseconds timeout = kDefaultTimeout) noexcept;
   ReportingStatus startConfig(ReportingCallback<BackendNamesAnswer> callback,
                               std::chrono::milliseconds timeout = kDefaultTimeout) noexcept;
 
-  /// 3. Gives the session other user info and asks which backends are enabled for it.
+  /// 3. Gives the session other user info and asks which backends are enabled for it. When the daemon is not
+  /// reached in time, the user info is given once it is.
   ReportingResult<BackendNamesAnswer> fetchStates(
       std::optional<Dictionary> userInfo, std::chrono::milliseconds timeout = kDefaultTimeout) noexcept;
   ReportingStatus fetchStates(std::optional<Dictionary> userInfo,
