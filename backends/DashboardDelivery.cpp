@@ -43,6 +43,17 @@ void DashboardDelivery::useReliableUDP() {
     return;
   }
   _reliableUDP = true;
+}
+
+bool DashboardDelivery::connect(const IPv4Endpoint& server) {
+  _server = server;
+  if (_socket.connect(server) != 0) return false;
+  if (_reliableUDP) watchForAnswers();
+  return true;
+}
+
+// Only once it is connected: before, anybody's datagrams would be read.
+void DashboardDelivery::watchForAnswers() {
   try {
     _readSource = _networkProcQueue->makeReadSource(_socket.sharedDescriptor(), [weak = weak_from_this()] {
       if (auto self = weak.lock()) self->processSocketRead();
@@ -50,11 +61,6 @@ void DashboardDelivery::useReliableUDP() {
   } catch (const std::exception&) {
     VESK_LOG_ERROR("DashboardBackend(useReliableUDP): can't create read source");
   }
-}
-
-bool DashboardDelivery::connect(const IPv4Endpoint& server) {
-  _server = server;
-  return _socket.connect(server) == 0;
 }
 
 bool DashboardDelivery::start(std::chrono::milliseconds tick) {

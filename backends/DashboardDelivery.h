@@ -77,6 +77,8 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   };
   enum CleanupState : std::int32_t { Running = 0, Requested = 1, LastResortScheduled = 2 };
 
+  void watchForAnswers();
+
   // On the queue.
   void sendHandedOver();
   void waitForRoom(std::vector<HandedOver> datagrams);
