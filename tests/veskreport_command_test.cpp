@@ -231,7 +231,6 @@ TEST_F(VeskreportCommand, WrongUsageIsStatusTwo) {
   for (const auto& arguments : std::vector<std::vector<std::string>>{
            {},
            {"states"},
-           {"nonsense"},
            {"send", "--client-type", "5", "k=v"},
            {"send", "--client-type", "5", "-c", "1"},
            {"send", "--client-type", "5", "-c", "65536", "-t", "1"},
@@ -246,6 +245,19 @@ TEST_F(VeskreportCommand, WrongUsageIsStatusTwo) {
     auto outcome = run(arguments);
     EXPECT_EQ(outcome.status, 2) << testing::PrintToString(arguments);
     EXPECT_NE(outcome.errors, "");
+  }
+  constexpr char kHelp[] = "\nRun with --help for more information.\n";
+  for (const auto& [arguments, message] : std::vector<std::pair<std::vector<std::string>, std::string>>{
+           {{"nonsense", "--json"}, "unknown command 'nonsense'"},
+           {{"sed"}, "unknown command 'sed': did you mean 'send'?"},
+           {{"uplod-fil"}, "unknown command 'uplod-fil': did you mean 'upload-file'?"},
+           {{"storebag", "sing"}, "unknown command 'sing': did you mean 'sign'?"},
+           {{"storebag", "send"}, "unknown command 'send'"},
+           {{"\x1b[2J"}, "unknown command '\\x1b[2J'"},
+       }) {
+    auto outcome = run(arguments);
+    EXPECT_EQ(outcome.status, 2);
+    EXPECT_EQ(outcome.errors, message + kHelp);
   }
   EXPECT_EQ(run({"--help"}).status, 0);
   EXPECT_EQ(run({"send", "--help"}).status, 0);

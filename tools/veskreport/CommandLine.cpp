@@ -1,10 +1,14 @@
 #include "tools/veskreport/CommandLine.h"
 
 #include <CLI/CLI.hpp>
+#include <algorithm>
 #include <cmath>
 #include <cstdlib>
 #include <iterator>
+#include <numeric>
+#include <utility>
 
+#include "tools/text/Printable.h"
 #include "tools/veskreport/Output.h"
 
 namespace vesk {
@@ -12,6 +16,7 @@ namespace vesk {
 namespace {
 
 constexpr double kLongestTimeout = 86'400;
+constexpr std::string_view kStorebag = "storebag";
 constexpr double kUploadTimeout = 600;  // a file may be large and the line thin
 
 /// Ranges let a "nan" pass, which lies neither below nor above them.
@@ -37,6 +42,37 @@ void unmarkValues(CLI::App& app) {
   for (CLI::App* sub : app.get_subcommands({})) unmarkValues(*sub);
 }
 
+/// How many letters must be added, taken away or replaced to make one of the other.
+std::size_t editDistance(std::string_view a, std::string_view b) {
+  std::vector<std::size_t> row(b.size() + 1);
+  std::iota(row.begin(), row.end(), 0U);
+  for (std::size_t i = 1; i <= a.size(); ++i) {
+    std::size_t diagonal = std::exchange(row[0], i);
+    for (std::size_t j = 1; j <= b.size(); ++j) {
+      const std::size_t replaced = diagonal + (a[i - 1] == b[j - 1] ? 0 : 1);
+      diagonal = std::exchange(row[j], std::min({row[j] + 1, row[j - 1] + 1, replaced}));
+    }
+  }
+  return row.back();
+}
+
+/// Throws where `argument` should name a command of `app` and names none: CLI11 would only say that one is
+/// required.
+void checkCommand(const CLI::App& app, const std::string& argument) {
+  constexpr std::size_t kSimilar = 2;  // edits
+  if (argument.starts_with('-')) return;
+  const CLI::App* nearest = nullptr;
+  std::size_t distance = kSimilar + 1;
+  for (const CLI::App* sub : app.get_subcommands([](auto) { return true; })) {
+    if (sub->get_name() == argument) return;
+    const std::size_t edits = editDistance(argument.substr(0, 80), sub->get_name());
+    if (edits < distance) nearest = sub, distance = edits;
+  }
+  std::string message = "unknown command '" + printable(argument) + "'";
+  if (nearest != nullptr) message += ": did you mean '" + nearest->get_name() + "'?";
+  throw CLI::ParseError(message, CLI::ExitCodes::ExtrasError);
+}
+
 class Reader {
  public:
   Reader() : _app("Talks to veskreportingd as a client, and makes storebags.", "veskreport") {
@@ -55,6 +91,8 @@ class Reader {
     std::vector<std::string> backwards(std::reverse_iterator(argv + argc), std::reverse_iterator(argv + 1));
     for (std::string& argument : backwards) mark(argument);
     try {
+      if (argc > 1) checkCommand(_app, argv[1]);
+      if (argc > 2 && argv[1] == kStorebag) checkCommand(*_app.get_subcommand(argv[1]), argv[2]);
       _app.parse(backwards);
     } catch (const CLI::ParseError& error) {
       return {std::nullopt, _app.exit(error) == 0 ? kExitDone : kExitUsage};
@@ -166,7 +204,7 @@ class Reader {
 
   void addStorebagCommands() {
     StorebagArguments& arguments = _invocation.storebag;
-    CLI::App* storebag = _app.add_subcommand("storebag", "Make and examine storebags");
+    CLI::App* storebag = _app.add_subcommand(std::string(kStorebag), "Make and examine storebags");
     storebag->require_subcommand(1);
     CLI::App* keygen = add(*storebag, "keygen", "Make a key pair", Command::StorebagKeygen);
     keygen
