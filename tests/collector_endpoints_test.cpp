@@ -141,10 +141,14 @@ TEST_F(CollectorEndpoints, RefuseWhatIsNoPostAndSaveNothing) {
   EXPECT_EQ(_files.read("events.jsonl"), "");
 }
 
-TEST_F(CollectorEndpoints, CountEventsThatCanNotBeSaved) {
-  EventsEndpoint events({_console, _stats, _faults}, _files / "no/such/directory");
-  EXPECT_EQ(events.answer(post()).status, 200U);
-  EXPECT_EQ(_stats.eventsNotSaved, 1U);
+TEST_F(CollectorEndpoints, LeaveAPostUnansweredThatCanNotBeSaved) {
+  EventsEndpoint events({_console, _stats, _faults}, "/dev/full");
+  for (const char* fault : {"none", "answer=204", "slow", "empty-body"}) {
+    EXPECT_FALSE(_faults.add("post=" + std::string(fault)));
+    EXPECT_EQ(events.answer(post()).fault, HTTPAnswer::Fault::CloseWithoutAnswer) << fault;
+  }
+  EXPECT_FALSE(_faults.add("post=none"));
+  EXPECT_EQ(_stats.eventsNotSaved, 4U);
 
   _events.answer(post());
   rlimit before{};
@@ -153,11 +157,11 @@ TEST_F(CollectorEndpoints, CountEventsThatCanNotBeSaved) {
   rlimit full = before;
   full.rlim_cur = _files.read("events.jsonl").size() + 10;
   ::setrlimit(RLIMIT_FSIZE, &full);
-  _events.answer(post());
+  EXPECT_EQ(_events.answer(post()).fault, HTTPAnswer::Fault::CloseWithoutAnswer);
   ::setrlimit(RLIMIT_FSIZE, &before);
-  EXPECT_EQ(_stats.eventsNotSaved, 2U);
   _events.answer(post());
   EXPECT_EQ(savedLines().size(), 2U) << "and no torn line between them";
+  EXPECT_EQ(_stats.posts, 2U);
 }
 
 TEST_F(CollectorEndpoints, GiveFaultsInTheirOrderAndAsOftenAsAsked) {

@@ -1,6 +1,8 @@
 #include <gtest/gtest.h>
 #include <signal.h>
 
+#include <algorithm>
+
 #include "tests/support/ChildProcess.h"
 #include "tests/support/TempDirectory.h"
 #include "tests/support/WebRequest.h"
@@ -24,7 +26,7 @@ class CollectorProcess : public ::testing::Test {
     options.command = {VESK_COLLECTOR, "--directory", _files / "collector", "--ready-file",
                        _files / "ready.json"};
     for (const char* port : {"--https-port", "--http-port", "--udp-port"})
-      options.command.insert(options.command.end(), {port, "0"});
+      if (std::ranges::count(further, port) == 0) options.command.insert(options.command.end(), {port, "0"});
     options.command.insert(options.command.end(), further.begin(), further.end());
     return options;
   }
@@ -33,7 +35,10 @@ class CollectorProcess : public ::testing::Test {
     ASSERT_TRUE(test::eventually([&] { return std::filesystem::exists(_files / "ready.json"); }));
     _facts = *parseJSON(_files.read("ready.json")).value.value().dictionary();
   }
-  std::string fact(const char* key) const { return _facts.text(key).value().string(); }
+  std::string fact(const char* key) const {
+    auto text = _facts.text(key);
+    return text ? text->string() : describe(*_facts.find(key));
+  }
 
   TempDirectory _files;
   Dictionary _facts;
@@ -62,10 +67,12 @@ TEST_F(CollectorProcess, GoesOnWithoutAnOutput) {
 }
 
 TEST_F(CollectorProcess, TellsUsageFromFailure) {
+  ChildProcess first(options());
+  waitUntilReady();
   const struct {
     std::vector<std::string> arguments;
     int status;
-    const char* text;
+    std::string text;
   } cases[] = {
       {{"--help"}, 0, "--fault"},
       {{"--version"}, 0, "veskcollector "},
@@ -74,12 +81,15 @@ TEST_F(CollectorProcess, TellsUsageFromFailure) {
       {{"--fault", "post=often"}, 2, "unknown fault 'often'"},
       {{"--address", "192.0.2.1"}, 1, "can't listen on 192.0.2.1"},
       {{"--storebags", "/proc/none"}, 1, "/proc/none"},
+      {{"--http-port", fact("httpPort")},
+       1,
+       "can't listen on 127.0.0.1: port " + fact("httpPort") + " is in use\n"},
+      {{"--udp-port", fact("udpPort")},
+       1,
+       "can't listen on 127.0.0.1: UDP port " + fact("udpPort") + " is in use\n"},
   };
   for (const auto& test : cases) {
-    auto command = options();
-    command.command.resize(3);
-    command.command.insert(command.command.end(), test.arguments.begin(), test.arguments.end());
-    ChildProcess collector(command);
+    ChildProcess collector(options(test.arguments));
     EXPECT_EQ(collector.wait(), test.status) << test.text;
     EXPECT_NE((collector.output() + collector.errors()).find(test.text), std::string::npos) << test.text;
   }

@@ -18,7 +18,7 @@ struct CollectorStats {
 
   Counter posts{*this, "posts"};                    ///< taken
   Counter events{*this, "events"};                  ///< in the posts taken
-  Counter eventsNotSaved{*this, "eventsNotSaved"};  ///< taken, but the file could not be written
+  Counter eventsNotSaved{*this, "eventsNotSaved"};  ///< in posts left unanswered since the file failed
   Counter storebagsSent{*this, "storebagsSent"};    ///< whole, also those with a bad signature on demand
   Counter storebagsUnchanged{*this, "storebagsUnchanged"};      ///< answered with 304
   Counter datagrams{*this, "datagrams"};                        ///< of dashboards, taken

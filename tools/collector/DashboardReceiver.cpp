@@ -30,6 +30,9 @@ DashboardReceiver::DashboardReceiver(Parts parts, const std::string& address, st
   if (!endpoint) cannotListen(address, port, "datagrams come over IPv4");
   int error = _socket.open();
   if (error == 0) error = _socket.bind(*endpoint);
+  if (error == EADDRINUSE)
+    throw std::runtime_error("can't listen on " + address + ": UDP port " + std::to_string(port) +
+                             " is in use");
   if (error != 0) cannotListen(address, port, std::strerror(error));
   _port = _socket.localEndpoint().value().port;
   _stop = FileDescriptor(::eventfd(0, EFD_CLOEXEC));

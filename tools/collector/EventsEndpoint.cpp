@@ -15,17 +15,27 @@ HTTPAnswer EventsEndpoint::serve(const HTTPReceived& received, const CollectorFa
   if (received.method != "POST") return _refuse.wrongMethod(received, "POST");
   EventPostOutcome outcome = readEventPost(received);
   if (!outcome.post) return _refuse(received, 400, outcome.problem);
-  record(*outcome.post, received);
   HTTPAnswer answer;
+  if (!record(*outcome.post, received)) {
+    // The sender keeps what was not answered and sends it again; after a 4xx it would drop it, and after a
+    // 5xx stop.
+    answer.fault = HTTPAnswer::Fault::CloseWithoutAnswer;
+    return answer;
+  }
   answer.headers = {{"Content-Type", "application/json"}};
   answer.body = "{\"accepted\":" + std::to_string(outcome.post->events.size()) + "}\n";
   return answer;
 }
 
-void EventsEndpoint::record(const EventPost& post, const HTTPReceived& received) {
+bool EventsEndpoint::record(const EventPost& post, const HTTPReceived& received) {
   WallTime now = _clock.now();
   std::string lines = jsonLines(post, received, now);
-  save(lines, post.events.size());
+  if (const int error = appendLines(_file, lines)) {
+    _stats.eventsNotSaved += post.events.size();
+    _console.problem("can't save " + std::to_string(post.events.size()) + " events to " + _file.string() +
+                     ", closing the connection without an answer: " + std::strerror(error));
+    return false;
+  }
   if (_console.style() == Console::Style::JSON) {
     lines.pop_back();
     _console.event(lines);
@@ -34,14 +44,7 @@ void EventsEndpoint::record(const EventPost& post, const HTTPReceived& received)
   }
   ++_stats.posts;
   _stats.events += post.events.size();
-}
-
-void EventsEndpoint::save(const std::string& lines, std::size_t events) {
-  const int error = appendLines(_file, lines);
-  if (error == 0) return;
-  _stats.eventsNotSaved += events;
-  _console.problem("can't save " + std::to_string(events) + " events to " + _file.string() + ": " +
-                   std::strerror(error));
+  return true;
 }
 
 }  // namespace vesk

@@ -9,9 +9,10 @@
 
 namespace vesk {
 
-/// Shows every event of a good post on the console and appends it to a file of JSON lines (opened for every
-/// post, so that it may be moved away). What is no post is refused with 400 or 405. A post that meets a fault
-/// which comes instead of the answer has not been taken: it is neither shown nor saved.
+/// Appends every event of a good post to a file of JSON lines (opened for every post, so that it may be moved
+/// away), shows it on the console and answers 200. Where the file can't be written, the connection is closed
+/// without an answer and the post has not been taken. What is no post is refused with 400 or 405. A post that
+/// meets a fault which comes instead of the answer is neither shown nor saved.
 class EventsEndpoint : public FaultyEndpoint {
  public:
   EventsEndpoint(const CollectorServices& services, std::filesystem::path file,
@@ -19,8 +20,8 @@ class EventsEndpoint : public FaultyEndpoint {
 
  private:
   HTTPAnswer serve(const HTTPReceived& received, const CollectorFault* fault) override;
-  void record(const EventPost& post, const HTTPReceived& received);
-  void save(const std::string& lines, std::size_t events);
+  /// False when the events could not be saved.
+  bool record(const EventPost& post, const HTTPReceived& received);
 
   const std::filesystem::path _file;
   const WallClock& _clock;

@@ -106,9 +106,13 @@ class HTTPServer::Core : public HTTPConnection::Owner {
       _acceptor.bind(endpoint);
       _acceptor.listen();
       _port = _acceptor.local_endpoint().port();
-    } catch (const std::exception& error) {
-      throw std::runtime_error("can't listen on " + _options.address + " port " +
-                               std::to_string(_options.port) + ": " + error.what());
+    } catch (const boost::system::system_error& error) {
+      // what() would name a source file of the library.
+      const std::string port = "port " + std::to_string(_options.port);
+      throw std::runtime_error("can't listen on " + _options.address +
+                               (error.code() == asio::error::address_in_use
+                                    ? ": " + port + " is in use"
+                                    : " " + port + ": " + error.code().message()));
     }
   }
 
