@@ -37,9 +37,10 @@ constexpr bool isOverridingSampling(std::int32_t flag) {
   return flag == MessageFlagOverrideSampling || flag == kMessageFlagBoth;
 }
 
-/// One destination of a session's messages. Its operations may be called from any thread and do not overlap:
-/// each takes the backend's own mutex. Under it only leaves are locked, for moments (queues, counters), and
-/// no server is waited for; a subclass that calls foreign code releases it meanwhile and says so. Subclasses
+/// One destination of a session's messages. Its operations may be called from any thread. All but uploads and
+/// `cleanup` take the backend's own mutex and so do not overlap. Under it only leaves are locked (queues,
+/// counters, preferences), and no server is waited for; a subclass that calls foreign code releases it
+/// meanwhile and says so. Subclasses
 /// override the `…Locked` forms, which run under that mutex. Kept alive by its session and by posts that are
 /// under way.
 class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBackend> {
@@ -61,7 +62,7 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
 
   // --- What a session asks of every backend ---------------------------------------------------------------
 
-  /// Ends the backend's activity; called once, when its session ends or replaces it.
+  /// Ends the backend's activity, when its session ends or replaces it. Does nothing the second time.
   virtual void cleanup() {}
 
   /// Decides the state anew.

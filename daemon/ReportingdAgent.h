@@ -28,12 +28,13 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
                               public IPCListenerDelegate,
                               public std::enable_shared_from_this<ReportingdAgent> {
  public:
-  /// All three outlive the agent.
+  /// `services` and `busyMarker` outlive the agent.
   ReportingdAgent(const SessionServices& services, StorebagFetcher fetchStorebag, BusyMarker& busyMarker);
 
   // --- IPCListenerDelegate
   bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) override;
-  /// What the end of a session's connection does: the session leaves the list and its family.
+  /// What the end of a session's connection does: the session leaves the list and every family. The caller
+  /// holds a reference, so that the session is not destroyed under a lock.
   void sessionInvalidated(const std::shared_ptr<ReportingdSession>& session);
 
   // --- ReportingdSessionDelegate
@@ -52,8 +53,8 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
  private:
   using SessionList = std::vector<std::shared_ptr<ReportingdSession>>;
 
-  /// An emptied list stays, in case that its family comes back; but a client that keeps inventing names must
-  /// not fill the memory, so beyond this many lists the empty ones go.
+  /// An emptied list stays, in case its family comes back. A client that keeps inventing names must not fill
+  /// the memory: once there are this many lists, the empty ones go before another is made.
   static constexpr std::size_t kMostKeptLists = 256;
   /// Nor must the names themselves: an empty list with a longer key, in bytes, goes with the next new one.
   static constexpr std::size_t kLongestKeptKey = 1024;

@@ -25,10 +25,10 @@ std::int32_t maxAgeFromCacheControl(std::optional<std::string_view> cacheControl
 
 /// Fetches the storebag `name` and returns its verified payload. Blocks for the request, 15 s at most.
 ///
-/// Outputs are written only where they are known; the caller initialises them. `maxAge`: seconds, whenever
-/// there was an answer. `notModified`: set, never cleared, when the server had nothing newer than
-/// `*lastModified`; there is no result then. `lastModified`: null for an unconditional request, else the
-/// server's last "Last-Modified" value, going in and coming out.
+/// Outputs are written only where they are known; the caller initialises them. `maxAge`: seconds, whenever a
+/// whole answer came. `notModified`: set, never cleared, when the request was conditional and an answer with
+/// "Last-Modified" had no body; there is no result then. `lastModified`: null for an unconditional request,
+/// else the date to ask with, if any, replaced by that of an answer, also when its storebag proves unusable.
 ///
 /// Nothing when there is no usable storebag; the log says why. When the server can't be reached, the storebag
 /// "palvo" is the built-in one.
