@@ -54,9 +54,16 @@ function(vesk_library name)
   target_link_libraries(${name} PUBLIC ${ARG_LINK} PRIVATE ${ARG_PRIVATE})
 endfunction()
 
-# vesk_test(NAME SOURCES… LINK …): a GoogleTest program, registered test by test.
+# vesk_test(NAME [FIRST | LAST] SOURCES… LINK … [TIMEOUT …]): a GoogleTest program. In a parallel run the FIRST start before
+# all others: quick ones of what the system is for, so that a break shows at once. The LAST are slow.
 function(vesk_test name)
-  cmake_parse_arguments(ARG "" "TIMEOUT" "SOURCES;LINK" ${ARGN})
+  cmake_parse_arguments(ARG "FIRST;LAST" "TIMEOUT" "SOURCES;LINK" ${ARGN})
+  set(cost 50)
+  if(ARG_FIRST)
+    set(cost 100)
+  elseif(ARG_LAST)
+    set(cost 10)
+  endif()
   if(NOT ARG_TIMEOUT)
     set(ARG_TIMEOUT 120)
   endif()
@@ -66,5 +73,5 @@ function(vesk_test name)
   # Optimising the assertions takes longer than running them.
   target_compile_options(${name} PRIVATE -O0 -U_FORTIFY_SOURCE)
   add_test(NAME ${name} COMMAND ${name})
-  set_tests_properties(${name} PROPERTIES TIMEOUT ${ARG_TIMEOUT})
+  set_tests_properties(${name} PROPERTIES TIMEOUT ${ARG_TIMEOUT} COST ${cost})
 endfunction()
