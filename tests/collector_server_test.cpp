@@ -1,7 +1,5 @@
 #include <gtest/gtest.h>
 
-#include <thread>
-
 #include "tests/support/RecordingServer.h"
 #include "tests/support/TempDirectory.h"
 #include "tests/support/WebRequest.h"
@@ -13,28 +11,6 @@ using test::TempDirectory;
 using test::WebClient;
 
 HTTPAnswer echo(const HTTPReceived& received) { return HTTPAnswer::text(200, received.method); }
-
-TEST(CollectorServer, StopsTwiceWithAStalledConnectionAndComesBackOnItsPort) {
-  auto stalling = [](const HTTPReceived&) { return test::faulty(HTTPAnswer::Fault::Stall); };
-  auto first = std::make_unique<HTTPServer>(HTTPServer::Options{}, stalling);
-  std::uint16_t port = first->port();
-  std::string url = first->baseURL();
-  test::WebAnswer stalled;
-  std::thread asking([&] { stalled = WebClient().get(url); });
-  while (first->connectionsAccepted() < 1) std::this_thread::yield();
-  first->stop();
-  first->stop();
-  asking.join();
-  EXPECT_NE(stalled.outcome, CURLE_OK);
-  EXPECT_EQ(WebClient().get(url).outcome, CURLE_COULDNT_CONNECT);
-
-  HTTPServer::Options options;
-  options.port = port;
-  EXPECT_THROW(HTTPServer({.address = "192.0.2.1"}, echo), std::runtime_error);
-  HTTPServer second(options, echo);
-  EXPECT_EQ(second.port(), port);
-  EXPECT_EQ(WebClient().get(url).status, 200);
-}
 
 TEST(CollectorServer, RefusesWhatIsNoProtocolWithALine) {
   std::mutex mutex;

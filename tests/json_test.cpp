@@ -58,12 +58,7 @@ TEST(JSON, RefusesWhatItCannotCarry) {
       Value(Date{-std::numeric_limits<double>::infinity()}),
       Value(Bytes("data")),
       Value("cut off \xE2\x82"),
-      Value("cut off and more \xE2\x82 of it"),
-      Value(std::string(64, 'k') + "\xF0"
-                                   "a"),
-      Value("\xE2("),
-      Value("above the range \xF4\x90\x80\x80 here"),
-      Value("stray \x80 byte"),
+      Value(std::string_view("12345678é").substr(0, 9)),  // the bytes behind the end would complete it
       Value(Dictionary{{"key \xFF", 1}}),
       Value(List{1, List{Value(std::nan(""))}, 2}),
       nested(65),
@@ -75,68 +70,11 @@ TEST(JSON, RefusesWhatItCannotCarry) {
   EXPECT_NE(compact(nested(64)), "(nothing)");
 }
 
-TEST(JSON, StopsAtTheEndOfATextThatIsNotTerminated) {
-  // The bytes behind the cut would complete the character.
-  const std::string whole = "12345678é";
-  EXPECT_EQ(compact(Value(std::string_view(whole).substr(0, 9))), "(nothing)");
-  EXPECT_EQ(compact(Value(std::string_view(whole).substr(0, 8))), "\"12345678\"");
-}
-
-TEST(JSON, StreamsADocumentPartByPart) {
-  MutableDictionary event;
-  event.set("n", 1);
-  JSONWriter writer(JSONStyle::Compact, 1);
-  writer.beginObject();
-  writer.key("postTime");
-  writer.number(1.5);
-  writer.key("events");
-  writer.beginArray();
-  writer.value(event);
-  writer.value(Dictionary{{"n", 2}});
-  writer.value(Value());
-  writer.endArray();
-  writer.key("more");
-  writer.value(List{true});
-  writer.endObject();
-  EXPECT_EQ(writer.finish(), R"({"postTime":1.5,"events":[{"n":1},{"n":2},null],"more":[true]})");
-}
-
-TEST(JSON, FailsOnCallsOutOfOrder) {
-  const auto fails = [](auto... calls) {
-    JSONWriter writer(JSONStyle::Compact);
-    (calls(writer), ...);
-    return !writer.finish();
-  };
-  const auto object = [](JSONWriter& w) { w.beginObject(); };
-  const auto endObject = [](JSONWriter& w) { w.endObject(); };
-  const auto array = [](JSONWriter& w) { w.beginArray(); };
-  const auto endArray = [](JSONWriter& w) { w.endArray(); };
-  const auto key = [](JSONWriter& w) { w.key("k"); };
-  const auto value = [](JSONWriter& w) { w.number(1); };
-  EXPECT_TRUE(fails());
-  EXPECT_TRUE(fails(object));
-  EXPECT_TRUE(fails(value, value));
-  EXPECT_TRUE(fails(key));
-  EXPECT_TRUE(fails(object, value, endObject));
-  EXPECT_TRUE(fails(object, key, endObject));
-  EXPECT_TRUE(fails(object, key, key, value, endObject));
-  EXPECT_TRUE(fails(array, key, value, endArray));
-  EXPECT_TRUE(fails(array, endObject));
-  EXPECT_TRUE(fails(endArray));
-  EXPECT_FALSE(fails(object, key, value, key, array, endArray, endObject));
-}
-
-TEST(JSON, PrettyAndCompactTextSayTheSame) {
-  MutableDictionary many;
-  for (int i = 0; i < 200; ++i) {
-    many.set("key " + std::to_string(i),
-             List{i * 0.37, i, "text \"" + std::string(static_cast<std::size_t>(i), 'x')});
-  }
-  const Value value = many.share();
-  const auto pretty = toJSON(value, JSONStyle::Pretty);
-  ASSERT_TRUE(pretty);
-  EXPECT_NE(pretty->find("\n    \"key 1\": [\n        0.37,"), std::string::npos);
-  EXPECT_EQ(boost::json::parse(*pretty), boost::json::parse(compact(value)));
+TEST(JSON, PrettyTextSaysTheSameWithIndentation) {
+  const Value value = Dictionary{{"a", List{0.37, 1, "text \""}}, {"b", Dictionary{{"c", List{}}}}};
+  const auto pretty = toJSON(value, JSONStyle::Pretty).value();
+  EXPECT_EQ(pretty.substr(0, 32), "{\n    \"a\": [\n        0.37,\n    ");
+  EXPECT_EQ(boost::json::parse(pretty), boost::json::parse(compact(value)));
 }
 
 }  // namespace

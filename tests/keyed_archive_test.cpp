@@ -8,40 +8,24 @@
 namespace vesk::test {
 namespace {
 
-Value sample() {
-  const List shared{"same", 1};
-  return List{
-      "text",
-      "ä → 🎉",
-      "",
-      "$null",
-      "text",
-      -7,
-      INT64_MIN,
-      UINT64_MAX,
-      0.1,
-      true,
-      false,
-      Value(),
-      Date{1795552289.25},
-      Bytes(std::string("\0\x01\xff", 3)),
-      List{},
-      Dictionary{},
-      shared,
-      Dictionary{{"shared", shared}, {"text", "text"}, {"", List{Value(List{Value(List{Value()})})}}}};
-}
-
 TEST(KeyedArchive, ReadsBackWhatWasArchived) {
   Value deep = List{"same", "same"};
   for (int i = 1; i < 64; ++i) deep = List{deep};
-  for (const Value& value :
-       {sample(), deep, Value(), Value("$null"), Value(3), Value(Dictionary{{"a", 1}})}) {
+  std::vector<Value> many;  // more than one byte can number
+  for (int i = 0; i < 300; ++i) many.emplace_back(i);
+  const List shared{"same", 1};
+  const List texts{"text", "ä → 🎉", "", "$null", "text"};
+  const List numbers{-7, INT64_MIN, UINT64_MAX, 0.1, true, false, Value(), Date{1795552289.25}};
+  const Dictionary nested{{"shared", shared}, {"text", "text"}, {"", List{Value(List{Value()})}}};
+  const List all{texts, numbers, Bytes(std::string("\0\x01\xff", 3)), List{}, Dictionary{}, shared, nested};
+  for (const Value& value : {Value(all), deep, Value(List(many)), Value(), Value("$null"), Value(3)}) {
     const auto archive = archiveValue(value);
     ASSERT_TRUE(archive);
     const auto read = unarchiveValue(*archive);
-    ASSERT_TRUE(read.value) << read.error;
-    EXPECT_EQ(*read.value, value) << describe(*read.value);
+    EXPECT_EQ(read.value, value) << read.error;
   }
+  for (const Value& value : {Value(List{deep}), Value("\xff"), Value(Dictionary{{"a\xc0", 1}})})
+    EXPECT_FALSE(archiveValue(value));
 }
 
 TEST(KeyedArchive, ArchivesSharedObjectsOnceAndSharesThemAgain) {
@@ -52,8 +36,7 @@ TEST(KeyedArchive, ArchivesSharedObjectsOnceAndSharesThemAgain) {
   EXPECT_LT(often->size(), once->size() + 500);
   const auto read = unarchiveValue(*often);
   ASSERT_TRUE(read.value) << read.error;
-  const List& lists = *read.value->list();
-  EXPECT_EQ(lists[0].list()->begin(), lists[49].list()->begin());
+  EXPECT_EQ(read.value->list()->begin()[0].list()->begin(), read.value->list()->begin()[49].list()->begin());
 }
 
 TEST(KeyedArchive, IsAGraphOfObjectsWithClassesForOthersToo) {
@@ -85,14 +68,6 @@ print(read(document["$top"]["root"]))
             "('Date', {'seconds': 86400.5})]}), ('Data', {'bytes': b'xy'}), None]})\n");
 }
 
-TEST(KeyedArchive, RefusesWhatCanNotBeArchived) {
-  Value deep = 1;
-  for (int i = 0; i < 65; ++i) deep = List{deep};
-  for (const Value& value : {deep, Value("\xff"), Value(std::string("a\0b", 3)),
-                             Value(Dictionary{{Text(std::string("\xc0")), 1}})})
-    EXPECT_FALSE(archiveValue(value));
-}
-
 Value uid(std::uint64_t index) { return Dictionary{{"CF$UID", index}}; }
 
 std::string document(List objects, Value root = uid(1)) {
@@ -108,35 +83,32 @@ TEST(KeyedArchive, RefusesWhatIsNoArchive) {
   auto list = [](std::vector<Value> items) {
     return Value(Dictionary{{"items", List(std::move(items))}, {"$class", uid(2)}});
   };
-  // Each object holds the next twice: small to write, endless to walk.
-  std::vector<Value> doubling{"$null"};
-  for (std::uint64_t i = 1; i <= 40; ++i)
-    doubling.push_back(Dictionary{{"items", List{uid(i + 1), uid(i + 1)}}, {"$class", uid(42)}});
-  doubling.insert(doubling.end(), {Value(1), listClass});
-  std::vector<Value> deep{"$null"};
-  for (std::uint64_t i = 1; i <= 70; ++i)
-    deep.push_back(Dictionary{{"items", List{uid(i + 1)}}, {"$class", uid(72)}});
-  deep.insert(deep.end(), {Value(1), listClass});
+  // Each object holds the next `times`: small to write, endless to walk.
+  const auto chain = [&](std::uint64_t length, std::size_t times) {
+    std::vector<Value> objects{"$null"};
+    for (std::uint64_t i = 1; i <= length; ++i)
+      objects.push_back(
+          Dictionary{{"items", List(std::vector<Value>(times, uid(i + 1)))}, {"$class", uid(length + 2)}});
+    objects.insert(objects.end(), {Value(1), listClass});
+    return document(List(std::move(objects)));
+  };
   const struct {
     std::string bytes;
     const char* error;
   } cases[] = {
       {"", "no keyed archive: it is no binary property list"},
-      {"bplist00", "no valid trailer"},
       {*writeBinaryPropertyList(List{1}), "no keyed archive: its root is no dictionary"},
       {*writeBinaryPropertyList(Dictionary{}), "no keyed archive: another archiver made it"},
       {document({}), "no keyed archive: it has no objects or no root"},
       {document({"$null", 1}, uid(2)), "a reference to no object"},
-      {document({"$null", 1}, 1), "a reference to no object"},
       {document({"$null", list({uid(1)}), listClass}), "an object that holds itself"},
       {document({"$null", Dictionary{{"items", List{}}}}), "a reference to no object"},
       {document({"$null", Dictionary{{"$class", uid(0)}}}), "an object without a class"},
       {document({"$null", Dictionary{{"$class", uid(2)}}, Dictionary{{"$classname", "Bus"}}}),
        "an object of an unknown class or form"},
       {document({"$null", Dictionary{{"$class", uid(2)}}, listClass}), "a list without items"},
-      {document({"$null", List{}}), "an object that is neither text, number nor of a class"},
-      {document(List(std::move(doubling))), "more than 100000 values"},
-      {document(List(std::move(deep))), "nested deeper than 64"},
+      {chain(40, 2), "more than 100000 values"},
+      {chain(70, 1), "nested deeper than 64"},
   };
   for (const auto& test : cases) {
     const auto outcome = unarchiveValue(test.bytes);

@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <csignal>
+#include <sstream>
 
 #include "tests/support/ChildProcess.h"
 #include "tests/support/RecordingDaemon.h"
@@ -17,6 +18,11 @@ struct Outcome {
   std::string output;
   std::string errors;
 };
+
+std::vector<std::string> words(const std::string& line) {
+  std::istringstream in(line);
+  return {std::istream_iterator<std::string>(in), {}};
+}
 
 class VeskreportCommand : public testing::Test {
  protected:
@@ -47,36 +53,34 @@ TEST_F(VeskreportCommand, EachCommandPrintsItsAnswer) {
     std::string call;
   };
   for (const Case& c : {
-           Case{{"states"}, "httpPost\nwren\n", "fetchStates none"},
+           Case{{"states"}, "httpPost\nwren", "fetchStates none"},
            Case{{"states", "--json"},
-                R"({"status":"done","backends":["httpPost","wren"]})"
-                "\n",
+                R"({"status":"done","backends":["httpPost","wren"]})",
                 "fetchStates none"},
-           Case{{"display-url"}, "https://display.example/\n", "fetchDisplayURL"},
-           Case{{"flush"}, "posted all\n", "flush"},
+           Case{{"display-url"}, "https://display.example/", "fetchDisplayURL"},
+           Case{{"flush"}, "posted all", "flush"},
            Case{{"send", "-c", "1", "-t", "2", "k=v", "n:=3"},
-                "accepted\n",
+                "accepted",
                 R"(parameters {"category": 1, "type": 2, "payload": {"k": "v", "n": 3}, "flag": 0})"},
            Case{{"send", "-c", "1", "-t", "2", "--realtime", "--override-sampling", "--json"},
-                R"({"status":"done","answer":null})"
-                "\n",
+                R"({"status":"done","answer":null})",
                 R"(parameters {"category": 1, "type": 2, "flag": 3})"},
            Case{{"send", "-c", "4", "-t", "2", "--no-wait"},
-                "sent\n",
+                "sent",
                 R"(parameters {"category": 4, "type": 2, "flag": 0})"},
-           Case{{"send-once", "-c", "1", "-t", "2", "k=v"}, "finished\n", "messageOnce "},
-           Case{{"upload-file", file}, "uploaded " + file + "\n", "uploadFile file://" + file + " contents"},
+           Case{{"send-once", "-c", "1", "-t", "2", "k=v"}, "finished", "messageOnce "},
+           Case{{"upload-file", file}, "uploaded " + file, "uploadFile file://" + file + " contents"},
            Case{{"send", "-c", "5", "-t", "2", "[a=1,b]"},
-                "accepted\n",
+                "accepted",
                 R"(parameters {"category": 5, "type": 2, "payload": {"[a": "1,b]"}, "flag": 0})"},
            Case{{"upload-log", "[a, b]", "two"},
-                "uploaded log data of 2 entries\n",
+                "uploaded log data of 2 entries",
                 R"(uploadLogData ["[a, b]", "two"])"},
        }) {
     SCOPED_TRACE(c.arguments.front());
     auto outcome = runClient(c.arguments);
     EXPECT_EQ(outcome.status, 0);
-    EXPECT_EQ(outcome.output, c.output);
+    EXPECT_EQ(outcome.output, c.output + "\n");
     EXPECT_EQ(outcome.errors, "");
     EXPECT_TRUE(record.waitFor(c.call));
   }
@@ -228,34 +232,25 @@ TEST_F(VeskreportCommand, ObeysTheEnvironmentUnlessItIsSetuid) {
 }
 
 TEST_F(VeskreportCommand, WrongUsageIsStatusTwo) {
-  for (const auto& arguments : std::vector<std::vector<std::string>>{
-           {},
-           {"states"},
-           {"send", "--client-type", "5", "k=v"},
-           {"send", "--client-type", "5", "-c", "1"},
-           {"send", "--client-type", "5", "-c", "65536", "-t", "1"},
-           {"send", "--client-type", "5", "-c", "1", "-t", "1", "no pair"},
-           {"send", "--client-type", "5", "-c", "1", "-t", "1", "--stdin", "k=v"},
-           {"send", "--client-type", "5", "-c", "1", "-t", "1", "--stdin", "--no-wait"},
-           {"aggregate", "--client-type", "5", "--count", "-1"},
-           {"states", "--client-type", "5", "--timeout", "0"},
-           {"states", "--client-type", "5", "--timeout", "nan"},
-           {"storebag", "sign"},
-       }) {
-    auto outcome = run(arguments);
-    EXPECT_EQ(outcome.status, 2) << testing::PrintToString(arguments);
+  for (const std::string line :
+       {"", "states", "storebag sign", "send --client-type 5 k=v", "send --client-type 5 -c 1",
+        "send --client-type 5 -c 65536 -t 1", "send --client-type 5 -c 1 -t 1 pair",
+        "send --client-type 5 -c 1 -t 1 --stdin k=v", "send --client-type 5 -c 1 -t 1 --stdin --no-wait",
+        "aggregate --client-type 5 --count -1", "states --client-type 5 --timeout 0",
+        "states --client-type 5 --timeout nan"}) {
+    auto outcome = run(words(line));
+    EXPECT_EQ(outcome.status, 2) << line;
     EXPECT_NE(outcome.errors, "");
   }
   constexpr char kHelp[] = "\nRun with --help for more information.\n";
-  for (const auto& [arguments, message] : std::vector<std::pair<std::vector<std::string>, std::string>>{
-           {{"nonsense", "--json"}, "unknown command 'nonsense'"},
-           {{"sed"}, "unknown command 'sed': did you mean 'send'?"},
-           {{"uplod-fil"}, "unknown command 'uplod-fil': did you mean 'upload-file'?"},
-           {{"storebag", "sing"}, "unknown command 'sing': did you mean 'sign'?"},
-           {{"storebag", "send"}, "unknown command 'send'"},
-           {{"\x1b[2J"}, "unknown command '\\x1b[2J'"},
-       }) {
-    auto outcome = run(arguments);
+  for (auto [line, message] : std::initializer_list<std::pair<const char*, std::string>>{
+           {"nonsense --json", "unknown command 'nonsense'"},
+           {"sed", "unknown command 'sed': did you mean 'send'?"},
+           {"uplod-fil", "unknown command 'uplod-fil': did you mean 'upload-file'?"},
+           {"storebag sing", "unknown command 'sing': did you mean 'sign'?"},
+           {"storebag send", "unknown command 'send'"},
+           {"\x1b[2J", "unknown command '\\x1b[2J'"}}) {
+    auto outcome = run(words(line));
     EXPECT_EQ(outcome.status, 2);
     EXPECT_EQ(outcome.errors, message + kHelp);
   }
@@ -276,9 +271,6 @@ TEST_F(VeskreportCommand, MakesAndExaminesStorebags) {
             bag + ": valid, version 1.2\n");
   EXPECT_NE(run({"storebag", "show", bag}).output.find("active = true"), std::string::npos);
 
-  EXPECT_EQ(run({"storebag", "keygen", "--json", root + "/k\xff"}).output,
-            R"({"status":"done","privateKey":")" + root + R"(/k?/storebag-signing.key","publicKey":")" +
-                root + "/k?/publicKey.der\"}\n");
   auto other = root + "/other";
   run({"storebag", "keygen", other});
   auto outcome = run({"storebag", "verify", bag, "--key", other + "/publicKey.der"});
