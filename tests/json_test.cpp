@@ -73,7 +73,7 @@ TEST(JSON, RefusesWhatItCannotCarry) {
 TEST(JSON, PrettyTextSaysTheSameWithIndentation) {
   const Value value = Dictionary{{"a", List{0.37, 1, "text \""}}, {"b", Dictionary{{"c", List{}}}}};
   const auto pretty = toJSON(value, JSONStyle::Pretty).value();
-  EXPECT_EQ(pretty.substr(0, 32), "{\n    \"a\": [\n        0.37,\n    ");
+  EXPECT_TRUE(pretty.starts_with("{\n    \"a\": [\n        0.37,\n")) << pretty;
   EXPECT_EQ(boost::json::parse(pretty), boost::json::parse(compact(value)));
 }
 
