@@ -29,10 +29,8 @@ TEST(XMLPropertyList, ReadsTheRarerForms) {
   } cases[] = {
       {"<string>a &amp; b &#x2192; c</string>", "a & b → c"},
       {"<string><![CDATA[<raw>]]></string>", "<raw>"},
-      {"<string/>", ""},
       {"<integer> +7 </integer>", 7},
       {"<integer>0xFF</integer>", 255},
-      {"<integer>-0x10</integer>", -16},
       {"<real>+1.5e3</real>", 1500.0},
       {"<real>-infinity</real>", -HUGE_VAL},
       {"<date>2000-02-29T23:59:59Z</date>", Date{951868799}},
