@@ -55,7 +55,7 @@ function(vesk_library name)
 endfunction()
 
 # vesk_test(NAME [FIRST | LAST] SOURCES… LINK … [TIMEOUT …]): a GoogleTest program. In a parallel run the FIRST start before
-# all others: quick ones of what the system is for, so that a break shows at once. The LAST are slow.
+# all others: quick tests of the system's purpose, so that a break shows at once. The LAST are slow.
 function(vesk_test name)
   cmake_parse_arguments(ARG "FIRST;LAST" "TIMEOUT" "SOURCES;LINK" ${ARGN})
   set(cost 50)
