@@ -5,6 +5,7 @@
 
 # make_root: sets `root`, laid out as the daemon expects, without a key and without preferences.
 make_root() {
+  umask 022 # the daemon refuses files that others can write to
   root=$(mktemp -d "${TMPDIR:-/tmp}/veskreporting.XXXXXX")
   declare -gA processes=()
   trap clean_up EXIT
@@ -13,6 +14,7 @@ make_root() {
   chmod 0755 "$root"
   mkdir -p "$root"/{etc/veskreporting/preferences,usr/share,run,log}
   cp -r packaging/share "$root/usr/share/veskreporting"
+  chmod -R go-w "$root/usr/share/veskreporting"
 }
 
 # start NAME COMMAND…: runs it in the background with its output in $root/log/NAME.

@@ -24,18 +24,6 @@ constexpr std::int32_t kLongestAge = 86400;  // seconds
 constexpr std::string_view kFallbackName = "palvo";
 constexpr std::string_view kStorebag = "storebag";  // stands for the backend in lines about its own entries
 
-HTTPRequest requestFor(const std::string& url, const std::optional<std::string>* lastModified) {
-  HTTPRequest request;
-  request.url = url;
-  request.timeout = kTimeout;
-  if (lastModified && *lastModified) {
-    VESK_LOG_DEBUG("fetchStorebagWithName: Adding 'Last-Modified: %s' to the header",
-                   (*lastModified)->c_str());
-    request.headers.emplace_back("If-Modified-Since", **lastModified);
-  }
-  return request;
-}
-
 /// What the answer says in that header, on however many lines; none without it.
 std::optional<std::string> listInHeader(const HTTPResponse& response, std::string_view name) {
   std::optional<std::string> list;
@@ -98,6 +86,17 @@ std::optional<Dictionary> verifiedPayload(const Dictionary& document, const Libr
 
 }  // namespace
 
+HTTPRequest storebagRequest(std::string url, const std::optional<std::string>& lastModified) {
+  HTTPRequest request;
+  request.url = std::move(url);
+  request.timeout = kTimeout;
+  if (lastModified) {
+    VESK_LOG_DEBUG("fetchStorebagWithName: Adding 'Last-Modified: %s' to the header", lastModified->c_str());
+    request.headers.emplace_back("If-Modified-Since", *lastModified);
+  }
+  return request;
+}
+
 std::int32_t maxAgeFromCacheControl(std::optional<std::string_view> cacheControl) {
   std::string_view rest = cacheControl.value_or("");
   for (bool found = false;;) {
@@ -122,7 +121,7 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryF
   url += library.version;
   VESK_LOG_DEBUG("fetchStorebagWithName: Storebag Server URL: %s", url.c_str());
 
-  HTTPResult result = http.perform(requestFor(url, lastModified));
+  HTTPResult result = http.perform(storebagRequest(url, lastModified ? *lastModified : std::nullopt));
   if (result.error && result.error->kind == HTTPError::Kind::TooLarge) {
     // There is an answer, and it is no storebag.
     VESK_LOG_ERROR("fetchStorebagWithName: propertyListWithData error %s", result.error->description.c_str());

@@ -23,6 +23,10 @@ struct LibraryFacts {
 /// absent.
 std::int32_t maxAgeFromCacheControl(std::optional<std::string_view> cacheControl);
 
+/// The GET of a storebag: given up after 15 s, and conditional when the server's last "Last-Modified" value
+/// is known.
+HTTPRequest storebagRequest(std::string url, const std::optional<std::string>& lastModified);
+
 /// Fetches the storebag `name` and returns its verified payload. Blocks for the request, 15 s at most.
 ///
 /// Outputs are written only where they are known; the caller initialises them. `maxAge`: seconds, whenever a

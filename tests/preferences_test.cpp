@@ -2,9 +2,11 @@
 
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <cstdlib>
 
+#include "platform/preferences/TomlFile.h"
 #include "platform/values/Conversions.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/TestRoot.h"
@@ -47,20 +49,18 @@ key = "value"
   const struct {
     const char* key;
     Value value;
-  } cases[] = {
-      {"text", "é .......... \" .........."},
-      {"lines", "..........\" .......... \""},
-      {"literal", ".........."},
-      {"integer", -7},
-      {"real", 2.5},
-      {"boolean", true},
-      {"date", Date{1795478400}},
-      {"date with time", Date{1795548689.5}},
-      {"local date", Date{1795552289}},
-      {"time", "07:32:00"},
-      {"list", List{1, "two"}},
-      {"table", Dictionary{{"key", "value"}}},
-  };
+  } cases[] = {{"text", "é .......... \" .........."},
+               {"lines", "..........\" .......... \""},
+               {"literal", ".........."},
+               {"integer", -7},
+               {"real", 2.5},
+               {"boolean", true},
+               {"date", Date{1795478400}},
+               {"date with time", Date{1795548689.5}},
+               {"local date", Date{1795552289}},
+               {"time", "07:32:00"},
+               {"list", List{1, "two"}},
+               {"table", Dictionary{{"key", "value"}}}};
   for (const auto& c : cases) EXPECT_EQ(valueForKey(c.key), c.value) << c.key;
   EXPECT_EQ(valueForKey("key"), std::nullopt);
 }
@@ -117,6 +117,53 @@ TEST_F(Preferences, ThatAreUnusableCountAsEmptyWithOneLine) {
   }
 }
 
+TEST_F(Preferences, OfAServicesUserAreTheSystemsOnly) {
+  if (::geteuid() != 0) GTEST_SKIP() << "needs another user";
+  std::filesystem::permissions(testRoot().path(), std::filesystem::perms{0755});
+  testRoot().write(kSystemFile, "a = 1\n");
+  testRoot().write(kUserFile, "a = 2\n");
+  for (uid_t user : {1u, 54321u, 0u}) {  // without a shell, without an account
+    ASSERT_EQ(::seteuid(user), 0);
+    EXPECT_EQ(valueForKey("a"), Value(user == 0 ? 2 : 1)) << user;
+    ASSERT_EQ(::seteuid(0), 0);
+  }
+}
+
+TEST_F(Preferences, ThatOthersCanWriteToAreRefusedInOneLine) {
+  if (::geteuid() != 0) GTEST_SKIP() << "needs another user";
+  constexpr uid_t kService = 1;
+  const auto prefix = rootPrefix();
+  const auto file = testRoot().write(kSystemFile, "a = 1\n");
+  const struct {
+    uid_t owner;
+    mode_t mode;
+    bool hasPrefix;
+    TrustedOwner trusted;
+    std::string reason;
+  } cases[] = {{0, 0644, false, TrustedOwner::Root, ""},
+               {0, 0644, true, TrustedOwner::OwnUser, ""},
+               {0, 0664, true, TrustedOwner::Root, "others than its owner can write to it (mode 0664)"},
+               {0, 0646, true, TrustedOwner::OwnUser, "others than its owner can write to it (mode 0646)"},
+               {kService, 0600, true, TrustedOwner::Root, ""},
+               {kService, 0600, false, TrustedOwner::OwnUser, ""},
+               {kService, 0600, false, TrustedOwner::Root, "it belongs to user 1"},
+               {2, 0644, true, TrustedOwner::OwnUser, "it belongs to user 2"}};
+  for (const auto& test : cases) {
+    SCOPED_TRACE(testing::PrintToString(test.owner) + " " + test.reason);
+    ASSERT_EQ(::chown(file.c_str(), test.owner, 0), 0);
+    ASSERT_EQ(::chmod(file.c_str(), test.mode), 0);
+    CapturedLog log;
+    if (!test.hasPrefix) setRootPrefix("");
+    ASSERT_EQ(::seteuid(kService), 0);
+    for (int i = 0; i < 2; ++i)
+      EXPECT_EQ(readTomlFile(file.string(), test.trusted).find("a") != nullptr, test.reason.empty());
+    ASSERT_EQ(::seteuid(0), 0);
+    setRootPrefix(prefix);
+    EXPECT_EQ(log.lines().size(), test.reason.empty() ? 0u : 1u);
+    EXPECT_EQ(log.count(4, file.string() + " is refused: " + test.reason), test.reason.empty() ? 0 : 1);
+  }
+}
+
 TEST_F(Preferences, AreNotReadFromElsewhere) {
   testRoot().write("etc/veskreporting/secret.toml", "a = 1\n");
   for (std::string_view suite : {"../secret", "", ".", "..", "/etc/veskreporting/secret"}) {
@@ -129,26 +176,24 @@ TEST(PreferenceForms, AreTextAndInteger) {
     Value value;
     std::optional<std::string> text;
     std::int64_t integer;
-  } cases[] = {
-      {"text", "text", 0},
-      {"12abc", "12abc", 12},
-      {" -3", " -3", -3},
-      {"+-4", "+-4", 0},
-      {"", "", 0},
-      {"99999999999999999999", "99999999999999999999", INT64_MAX},
-      {"-99999999999999999999", "-99999999999999999999", INT64_MIN},
-      {7, "7", 7},
-      {UINT64_MAX, "18446744073709551615", -1},
-      {2.5, "2.5", 2},
-      {1e5, "100000", 100'000},
-      {-1e15, "-1000000000000000", -1'000'000'000'000'000},
-      {0.0001, "0.0001", 0},
-      {0.1 + 0.2, "0.30000000000000004", 0},
-      {1e20, "1e+20", INT64_MAX},
-      {true, "1", 1},
-      {List{1}, std::nullopt, 0},
-      {Dictionary{}, std::nullopt, 0},
-  };
+  } cases[] = {{"text", "text", 0},
+               {"12abc", "12abc", 12},
+               {" -3", " -3", -3},
+               {"+-4", "+-4", 0},
+               {"", "", 0},
+               {"99999999999999999999", "99999999999999999999", INT64_MAX},
+               {"-99999999999999999999", "-99999999999999999999", INT64_MIN},
+               {7, "7", 7},
+               {UINT64_MAX, "18446744073709551615", -1},
+               {2.5, "2.5", 2},
+               {1e5, "100000", 100'000},
+               {-1e15, "-1000000000000000", -1'000'000'000'000'000},
+               {0.0001, "0.0001", 0},
+               {0.1 + 0.2, "0.30000000000000004", 0},
+               {1e20, "1e+20", INT64_MAX},
+               {true, "1", 1},
+               {List{1}, std::nullopt, 0},
+               {Dictionary{}, std::nullopt, 0}};
   for (const auto& c : cases) {
     EXPECT_EQ(stringForm(c.value), c.text) << describe(c.value);
     EXPECT_EQ(integerForm(c.value), c.integer) << describe(c.value);

@@ -1,12 +1,15 @@
 // What a process may and may not do once it is inside the sandbox that is shipped for the daemon.
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <linux/landlock.h>
 #include <netdb.h>
 #include <netinet/in.h>
 #include <sys/ioctl.h>
 #include <sys/mman.h>
 #include <sys/mount.h>
+#include <sys/personality.h>
 #include <sys/ptrace.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
@@ -50,6 +53,7 @@ class SandboxTest : public testing::Test {
     directory.write("outside/file", "outside");
     fs::create_directories(profilePath().parent_path());
     fs::copy_file(fs::path(VESK_SANDBOX_PROFILES) / profilePath().filename(), profilePath());
+    fs::permissions(profilePath(), fs::perms{0644});
   }
 
   fs::path profilePath() const {
@@ -102,12 +106,18 @@ FileDescriptor socketBoundTo(const fs::path& path) {
   return descriptor;
 }
 
+long maps(int protection, int flags, int file) {
+  return ::mmap(nullptr, 4096, protection, flags, file, 0) == MAP_FAILED ? -1 : 0;
+}
+
 TEST_F(SandboxTest, DeniesWhatIsNotGranted) {
   pid_t parent = ::getpid();
   const std::string proc = "/proc/" + std::to_string(parent);
   const fs::path outside = root / "outside" / "file";
   const fs::path waiting = directory.write("var/spool/veskreporting/file", "to be uploaded");
-  char word[8] = {};
+  const FileDescriptor program(::open("/bin/true", O_RDONLY | O_CLOEXEC));
+  sched_param lowest{};
+  char word[8] = {1};
   iovec local{word, sizeof word};
   char noArgument[] = "true";
   char* arguments[] = {noArgument, nullptr};
@@ -128,6 +138,8 @@ TEST_F(SandboxTest, DeniesWhatIsNotGranted) {
       {"put a file with those", [&] { return opens(waiting.parent_path() / "new", O_WRONLY | O_CREAT); }},
       {"remove another file", [&] { return ::unlink(outside.c_str()); }},
       {"own another file", [&] { return ::chown(outside.c_str(), 1, 1); }},
+      {"open its files to all", [&] { return ::chmod((root / "run/veskreportingd").c_str(), 0777); }},
+      {"open a file to all", [&] { return ::fchmod(0, 0666); }},
       {"bind a socket elsewhere", [&] { return socketBoundTo(root / "outside" / "socket").get(); }},
       {"read another process's environment", [&] { return opens(proc + "/environ", O_RDONLY); }},
       {"run a program", [&] { return ::execv("/bin/true", arguments); }},
@@ -135,6 +147,12 @@ TEST_F(SandboxTest, DeniesWhatIsNotGranted) {
       {"trace a process", [&] { return ::ptrace(PTRACE_ATTACH, parent, nullptr, nullptr); }},
       {"read a process's memory", [&] { return ::process_vm_readv(parent, &local, 1, &local, 1, 0); }},
       {"signal a process", [&] { return ::kill(parent, 0); }},
+      {"schedule a process", [&] { return ::syscall(SYS_sched_setscheduler, parent, SCHED_IDLE, &lowest); }},
+      {"set a process's priority", [&] { return ::syscall(SYS_sched_setparam, parent, &lowest); }},
+      {"set a process's attributes", [&] { return ::syscall(SYS_sched_setattr, parent, &lowest, 0); }},
+      {"bind a process to a processor", [&] { return ::syscall(SYS_sched_setaffinity, parent, 8, word); }},
+      {"make a process nice", [&] { return ::setpriority(PRIO_PROCESS, static_cast<id_t>(parent), 19); }},
+      {"make a user's processes nice", [] { return ::setpriority(PRIO_USER, 0, 19); }},
       {"make a namespace", [] { return ::unshare(CLONE_NEWNET); }},
       {"mount", [] { return ::mount("none", "/", "tmpfs", 0, nullptr); }},
       {"change the root", [] { return ::chroot("/"); }},
@@ -150,19 +168,22 @@ TEST_F(SandboxTest, DeniesWhatIsNotGranted) {
       {"open a packet socket", [] { return ::socket(AF_PACKET, SOCK_DGRAM, 0); }},
       {"open a raw socket", [] { return ::socket(AF_INET, SOCK_RAW, IPPROTO_ICMP); }},
       {"make a page executable", [&] { return ::mprotect(page, 4096, PROT_READ | PROT_EXEC); }},
-      {"map writable code",
-       [] {
-         void* code = ::mmap(nullptr, 4096, PROT_WRITE | PROT_EXEC, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
-         return code == MAP_FAILED ? -1L : 0L;
-       }},
+      {"map writable code", [&] { return maps(PROT_WRITE | PROT_EXEC, MAP_PRIVATE | MAP_ANONYMOUS, -1); }},
+      {"map code that is written elsewhere", [&] { return maps(PROT_EXEC, MAP_SHARED, program.get()); }},
+      {"make a file in memory", [] { return ::memfd_create("code", 0); }},
+      {"make what it reads executable", [] { return ::personality(READ_IMPLIES_EXEC); }},
   };
   EXPECT_EQ(
       inside([&] { return faults(probes, [](int e) { return e != EPERM && e != EACCES && e != EXDEV; }); }),
       "");
+  std::ofstream(profilePath()) << "[calls]\ndeny = [\"new-code\"]";
+  const std::vector<Probe> loading = {{"", [&] { return maps(PROT_EXEC, MAP_PRIVATE, program.get()); }}};
+  EXPECT_EQ(inside([&] { return faults(loading, [](int error) { return error != EPERM; }); }), "");
   ::munmap(page, 4096);
 }
 
 TEST_F(SandboxTest, AllowsWhatTheDaemonDoes) {
+  const FileDescriptor program(::open("/bin/true", O_RDONLY | O_CLOEXEC));
   const fs::path certificates = directory.write("ca/certificates.pem", "authority");
   const fs::path replacement = directory.write("ca/replacement.pem", "authority");
   const fs::path settings = directory.write("etc/veskreporting/device.toml", "");
@@ -176,6 +197,7 @@ TEST_F(SandboxTest, AllowsWhatTheDaemonDoes) {
       {"read certificates", [] { return opens("/etc/ssl/certs", O_RDONLY); }},
       {"read other certificates", [&] { return opens(certificates, O_RDONLY); }},
       {"read what replaces them", [&] { return opens(replacement, O_RDONLY); }},
+      {"load a library late", [&] { return maps(PROT_READ | PROT_EXEC, MAP_PRIVATE, program.get()); }},
       {"read about itself", [] { return opens("/proc/self/maps", O_RDONLY); }},
       {"discard", [] { return opens("/dev/null", O_WRONLY); }},
       {"make a file", [&] { return opens(state / "new", O_WRONLY | O_CREAT | O_EXCL); }},
@@ -185,7 +207,6 @@ TEST_F(SandboxTest, AllowsWhatTheDaemonDoes) {
       {"make the log directory", [&] { return ::mkdir((logs / "Retired").c_str(), 0755); }},
       {"write the log", [&] { return opens(logs / "Retired" / "log", O_WRONLY | O_CREAT | O_APPEND); }},
       {"listen", [&] { return ::listen(socketBoundTo(socketPath).get(), 1); }},
-      {"open the socket to all", [&] { return ::chmod(socketPath.c_str(), 0666); }},
       {"remove an uploaded file", [&] { return ::unlink(waiting.c_str()); }},
       {"remove the socket", [&] { return ::unlink(socketPath.c_str()); }},
       {"look a name up",
@@ -200,10 +221,51 @@ TEST_F(SandboxTest, AllowsWhatTheDaemonDoes) {
       {"signal itself", [] { return ::raise(SIGWINCH); }},
   };
   ::setenv("SSL_CERT_FILE", certificates.c_str(), 1);
+  ::setenv("XDG_CONFIG_HOME", "relative", 1);  // is left out
   EXPECT_EQ(inside([&] { return faults(probes, [](int error) { return error != 0; }); }), "");
   ::unsetenv("SSL_CERT_FILE");
+  ::unsetenv("XDG_CONFIG_HOME");
   EXPECT_EQ(fs::status(socketPath.parent_path()).permissions(), fs::perms{0755});
   EXPECT_EQ(fs::status(state).permissions(), fs::perms{0750});
+}
+
+TEST_F(SandboxTest, DeniesPortsAndSocketsOfOthersWhereTheKernelKnowsHow) {
+  if (::syscall(SYS_landlock_create_ruleset, nullptr, 0, LANDLOCK_CREATE_RULESET_VERSION) < 6)
+    GTEST_SKIP() << "this kernel does not";
+  sockaddr_un abstract{AF_UNIX, "\0vesk-test"};
+  std::to_string(::getpid()).copy(abstract.sun_path + 10, 10);
+  const auto calls = [](auto call, int family, const auto& address) {
+    FileDescriptor socket(::socket(family, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    const int result = call(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
+    return std::pair(result == 0 ? std::string("yes ") : std::string(strerrorname_np(errno)) + " ",
+                     std::move(socket));
+  };
+  const FileDescriptor outside = calls(::bind, AF_UNIX, abstract).second;
+  ASSERT_EQ(::listen(outside.get(), 1), 0);
+  const auto loopback = [](std::uint16_t port) {
+    return sockaddr_in{AF_INET, htons(port), {htonl(INADDR_LOOPBACK)}, {}};
+  };
+  const struct {
+    const char* profile;
+    const char* manager;
+    const char* outcome;
+  } cases[] = {
+      {"", "/run/notify", "ECONNREFUSED ECONNREFUSED EACCES EPERM "},
+      {"", "@notify", "ECONNREFUSED ECONNREFUSED EACCES yes "},
+      {"[network]\nconnect = [1]\n", "", "ECONNREFUSED EACCES EACCES EPERM "},
+      {"[network]\nconnect = []\n", "", "EACCES EACCES EACCES EPERM "},
+  };
+  for (const auto& test : cases) {
+    std::ofstream(profilePath()) << test.profile;
+    ::setenv("NOTIFY_SOCKET", test.manager, 1);
+    EXPECT_EQ(inside([&] {
+                return calls(::connect, AF_INET, loopback(1)).first +
+                       calls(::connect, AF_INET, loopback(2)).first +
+                       calls(::bind, AF_INET, loopback(0)).first + calls(::connect, AF_UNIX, abstract).first;
+              }),
+              test.outcome);
+    ::unsetenv("NOTIFY_SOCKET");
+  }
 }
 
 TEST_F(SandboxTest, SaysWhyItCannotBeEntered) {
@@ -214,6 +276,7 @@ TEST_F(SandboxTest, SaysWhyItCannotBeEntered) {
     std::string error;
   } cases[] = {
       {"landlock = ", path + "line 1"},
+      {"[network]\nconnect = [0]", path + "network.connect: must be a list of ports"},
       {"landlock = \"perhaps\"", path + R"(landlock: must be "required" or "if-available")"},
       {"[machine]\nread = [\"/no/such/file\"]", "/no/such/file: No such file or directory"},
       {"[root]\nwrite = [\"/outside/file/below\"]",
@@ -223,6 +286,17 @@ TEST_F(SandboxTest, SaysWhyItCannotBeEntered) {
     std::ofstream(profilePath()) << profile;
     EXPECT_EQ(why().substr(0, error.size()), error);
   }
+  std::ofstream(profilePath()) << "";
+  EXPECT_EQ(why(), "entered");
+  EXPECT_EQ(inChild([&] {
+              setRootPrefix(root.string());
+              std::string text;
+              std::thread([&] { text = enterSandbox(kProfile).value_or("entered"); }).join();
+              return text;
+            }),
+            "threads of the process can't be confined any more");
+  fs::permissions(profilePath(), fs::perms{0664});
+  EXPECT_EQ(why(), path + "others than its owner can write to it (mode 0664)");
   fs::remove(profilePath());
   EXPECT_EQ(why(), path + "no such file");
   EXPECT_EQ(enterSandbox("../etc/passwd"), "\"../etc/passwd\" is no name of a profile");

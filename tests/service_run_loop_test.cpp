@@ -1,7 +1,5 @@
 // The run loop with its busy marker and a service manager that is a real socket of ours.
 #include <gtest/gtest.h>
-#include <sched.h>
-#include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/time.h>
 #include <unistd.h>
@@ -12,7 +10,6 @@
 
 #include "daemon/RunLoop.h"
 #include "platform/ipc/UnixSocket.h"
-#include "platform/service/SchedulingClass.h"
 #include "tests/support/TempDirectory.h"
 
 namespace vesk {
@@ -133,21 +130,6 @@ TEST_F(RunLoopTest, TakesOverTheManagersSocket) {
   };
   EXPECT_EXIT(inherit(listening.get(), 2), testing::ExitedWithCode(0), "descriptor 4 is of no use");
   EXPECT_EXIT(inherit(2, 2), testing::ExitedWithCode(1), "descriptor 3 is of no use");
-}
-
-TEST(SchedulingClassTest, UtilityYieldsToOthersInThreadsMadeLaterToo) {
-  EXPECT_EXIT(
-      {
-        enterSchedulingClass(SchedulingClass::Utility, 0);
-        int nice = 0;
-        int policy = -1;
-        std::thread([&] {
-          nice = ::getpriority(PRIO_PROCESS, 0);
-          policy = ::sched_getscheduler(0);
-        }).join();
-        ::_exit(nice >= 5 && policy == SCHED_BATCH ? 0 : 1);
-      },
-      testing::ExitedWithCode(0), "");
 }
 
 }  // namespace

@@ -243,64 +243,6 @@ TEST_F(Session, ASingleMessageNeedsItsIdentifiersAndAStorebag) {
   EXPECT_EQ(harness.posts().size(), 2u) << "nothing could send it later";
 }
 
-TEST(StorebagCache, FetchesByAgeAndWaitsAfterFailures) {
-  HandClock clock;
-  int fetches = 0;
-  std::optional<Dictionary> answer = Dictionary{{"wren", 1}};
-  std::int32_t age = 600;
-  bool unchanged = false;
-  std::vector<std::optional<std::string>> slots;
-  StorebagCache cache(
-      [&](std::int32_t, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
-          std::optional<std::string>& lastModified) {
-        ++fetches;
-        slots.push_back(lastModified);
-        lastModified = "Mon";
-        maxAge = age;
-        notModified = unchanged;
-        if (answer) version = "v" + std::to_string(fetches);
-        return answer;
-      },
-      clock);
-  auto expect = [&](int expectedFetches, bool section, const char* version) {
-    EXPECT_EQ(cache.storebagForClientType(7).has_value(), section);
-    EXPECT_EQ(fetches, expectedFetches);
-    EXPECT_EQ(cache.versionForClientType(11), version ? std::optional<std::string>(version) : std::nullopt);
-  };
-  CapturedLog log;
-  EXPECT_EQ(cache.versionForClientType(7), std::nullopt);
-  EXPECT_FALSE(cache.storebagForClientType(4));
-  EXPECT_EQ(fetches, 0) << "a client type without a storebag";
-  answer.reset();
-  expect(1, false, nullptr);
-  clock.advance(std::chrono::seconds(899));
-  expect(1, false, nullptr);
-  EXPECT_EQ(
-      log.count(6,
-                "storebagForSession: Not fetching storebag for client type 7 - must wait 900 seconds between "
-                "attempts"),
-      1);
-  clock.advance(std::chrono::seconds(2));
-  answer = Dictionary{{"wren", 1}};
-  expect(2, true, "v2");
-  EXPECT_EQ(slots.back(), "Mon");
-  expect(2, true, "v2");
-  EXPECT_EQ(log.count(7, "storebagForSession: Cached storebag found for client type 7"), 1);
-  clock.advance(std::chrono::seconds(-86'400));
-  expect(3, true, "v3");  // a clock that was set back does not freeze the configuration for a day
-  clock.advance(std::chrono::seconds(600));
-  answer.reset();
-  expect(4, true, "v3");  // the refetch failed: the old section is served, and for the next 900 seconds
-  clock.advance(std::chrono::seconds(899));
-  expect(4, true, "v3");
-  clock.advance(std::chrono::seconds(1));
-  unchanged = true;
-  age = 0;
-  expect(5, true, "v3");
-  expect(6, true, "v3");  // max age 0: every request fetches
-  EXPECT_EQ(log.countContaining(3, "fetchAndCacheStorebag: Unable to fetch storebag for client type 7"), 2);
-}
-
 TEST(Agent, TheBusyMarkerIsHeldWhileThereAreSessions) {
   CapturedLog log;
   AgentHarness harness;

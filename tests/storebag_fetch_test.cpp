@@ -3,14 +3,13 @@
 
 #include <cstdlib>
 
-#include "platform/crypto/Base64.h"
-#include "platform/plist/PropertyList.h"
 #include "storebag/StorebagFallback.h"
 #include "storebag/StorebagFetch.h"
+#include "storebag/StorebagNaming.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/RecordingServer.h"
+#include "tests/support/SignedStorebag.h"
 #include "tests/support/TestRoot.h"
-#include "tests/support/TestSigningKey.h"
 
 namespace vesk::test {
 namespace {
@@ -43,6 +42,7 @@ class StorebagFetch : public testing::Test {
     testRoot().write("etc/veskreporting/preferences/com.corvane.veskreporting.toml",
                      "veskreporting_storebag_url = '" + base() + "'\n");
     _key = new TestSigningKey;
+    ASSERT_EQ(currentEnvironmentType(), 3);
   }
   static void TearDownTestSuite() {
     delete _server;
@@ -53,14 +53,12 @@ class StorebagFetch : public testing::Test {
   static std::string url(const std::string& name) { return base() + "/" + name + "?version=7.3"; }
   static RecordingServer& server() { return *_server; }
 
-  /// The document that the server sends for a payload.
   static Dictionary document(const std::string& bag, const std::string& signedBytes) {
-    return {{"signature", base64Encode(_key->sign(signedBytes))}, {"bag", base64Encode(bag)}};
+    return storebagDocument(*_key, bag, signedBytes);
   }
   static std::string serialized(const Dictionary& dictionary) { return *writeXMLPropertyList(dictionary); }
   static std::string signedStorebag(const Dictionary& content) {
-    auto bag = serialized(content);
-    return serialized(document(bag, bag));
+    return test::signedStorebag(*_key, content);
   }
   static void serve(std::string body, HTTPHeaderList headers = {}, unsigned status = 200) {
     HTTPAnswer next;
@@ -78,12 +76,20 @@ class StorebagFetch : public testing::Test {
     return fetchStorebagForEnvironmentAndClientType(http, library, clientType, maxAge, version, notModified,
                                                     &lastModified);
   }
-  /// What the fetch logged, without the line of the URL.
+  /// What the HTTP client calls the failure to fetch that.
+  std::string errorOf(const std::string& name) {
+    return http.perform(storebagRequest(url(name), std::nullopt)).error->description;
+  }
+  /// What the fetch logged. The line of the URL, which every fetch begins with, is left out, and so is the
+  /// number of a key, which is another each time.
   Lines lines() const {
     Lines all;
-    for (auto& line : log.lines()) {
-      bool isURL = line.second.find("Storebag Server URL") != std::string::npos;
-      if (line.second.starts_with("fetchStorebag") && !isURL) all.push_back(line);
+    for (auto [level, line] : log.lines()) {
+      if (line.find("Storebag Server URL") != std::string::npos) continue;
+      const auto number = line.find("verified, 0x");
+      if (number != std::string::npos && line.find_first_not_of("0123456789abcdef", number + 12) == line.npos)
+        line.resize(number + 12);
+      all.emplace_back(level, line);
     }
     return all;
   }
@@ -108,8 +114,7 @@ TEST_F(StorebagFetch, ReturnsTheSectionOfTheEnvironment) {
   EXPECT_EQ(maxAge, 600);
   EXPECT_FALSE(notModified);
   EXPECT_FALSE(lastModified);
-  EXPECT_EQ(lines(), Lines());
-  EXPECT_EQ(log.count(7, withName("Storebag Server URL: " + url("zelko"))), 1);
+  EXPECT_EQ(log.lines(), (Lines{{7, withName("Storebag Server URL: " + url("zelko"))}}));
   auto request = server().requests().back();
   EXPECT_EQ(request.method, "GET");
   EXPECT_EQ(request.target, "/bags/sorrel/zelko?version=7.3");
@@ -147,13 +152,17 @@ TEST_F(StorebagFetch, EveryFailureSaysWhatItIs) {
   const std::pair<int, std::string> unfetched{3, forClientType("Could not fetch storebag for client type 5")};
   const std::pair<int, std::string> unsigned_{3, withName("Signature is missing")};
   const std::pair<int, std::string> invalid{3, withName("Signature can not be verified, 0x")};
-  const std::pair<int, std::string> unreadable{3, withName("propertyListWithData error ")};
+  const std::pair<int, std::string> unreadable{
+      3, withName("propertyListWithData error " + parsePropertyList("junk").error)};
   const struct {
     const char* name;
     std::string body;
     Lines lines;
   } cases[] = {
       {"no property list", "junk", {unreadable, unsigned_, unfetched}},
+      {"no content",
+       "",
+       {{3, withName("propertyListWithData error " + parsePropertyList("").error)}, unsigned_, unfetched}},
       {"a list", *writeXMLPropertyList(List{1}), {unsigned_, unfetched}},
       {"no signature", changed("signature", std::nullopt), {unsigned_, unfetched}},
       {"a number as signature", changed("signature", 1), {unsigned_, unfetched}},
@@ -161,6 +170,9 @@ TEST_F(StorebagFetch, EveryFailureSaysWhatItIs) {
       {"no bag", changed("bag", std::nullopt), {unfetched}},
       {"a bag that is no base64", changed("bag", "abcde"), {unfetched}},
       {"a signature over other bytes", serialized(document(xml, xml + " ")), {invalid, unfetched}},
+      {"a signature by another key",
+       changed("signature", base64Encode(TestSigningKey().sign(xml))),
+       {invalid, unfetched}},
       {"an empty signature", changed("signature", ""), {invalid, unfetched}},
       {"a payload that is no property list", serialized(document("junk", "junk")), {unfetched}},
       {"a payload that is a list",
@@ -174,12 +186,7 @@ TEST_F(StorebagFetch, EveryFailureSaysWhatItIs) {
     EXPECT_FALSE(version);
     EXPECT_FALSE(notModified);
     EXPECT_EQ(maxAge, 77) << "written before anything fails";
-    auto logged = lines();
-    ASSERT_EQ(logged.size(), test.lines.size());
-    for (std::size_t i = 0; i < logged.size(); ++i) {
-      EXPECT_EQ(logged[i].first, test.lines[i].first);
-      EXPECT_TRUE(logged[i].second.starts_with(test.lines[i].second)) << logged[i].second;
-    }
+    EXPECT_EQ(lines(), test.lines);
   }
 }
 
@@ -201,16 +208,16 @@ TEST_F(StorebagFetch, AClientTypeWithoutStorebagFetchesNothing) {
 }
 
 TEST_F(StorebagFetch, AnUnreachableServerMeansTheBuiltInStorebagForOneNameOnly) {
-  server().stop();
+  server().answerWith(faulty(HTTPAnswer::Fault::CloseWithoutAnswer));
   lastModified = "Mon";
   EXPECT_FALSE(fetch(5));
-  auto logged = lines();
-  ASSERT_EQ(logged.size(), 3u);
-  EXPECT_EQ(logged[0], std::pair(7, withName("Adding 'Last-Modified: Mon' to the header")));
-  EXPECT_EQ(logged[1].first, 6);
-  EXPECT_TRUE(logged[1].second.starts_with(
-      withName("Error resolving with lookup server " + url("zelko") + ", sendSynchronousRequest error ")));
-  EXPECT_EQ(logged[2], std::pair(3, forClientType("Could not fetch storebag for client type 5")));
+  const std::pair<int, std::string> unfetched{3, forClientType("Could not fetch storebag for client type 5")};
+  const auto adding = std::pair(7, withName("Adding 'Last-Modified: Mon' to the header"));
+  const auto unresolved = [&](const char* name) {
+    return std::pair(6, withName("Error resolving with lookup server " + url(name) +
+                                 ", sendSynchronousRequest error " + errorOf(name)));
+  };
+  EXPECT_EQ(lines(), (Lines{adding, unresolved("zelko"), unfetched}));
   EXPECT_EQ(maxAge, -1);
 
   for (std::int32_t clientType : {7, 11}) {
@@ -219,15 +226,25 @@ TEST_F(StorebagFetch, AnUnreachableServerMeansTheBuiltInStorebagForOneNameOnly) 
     EXPECT_EQ(maxAge, 3600);
     EXPECT_FALSE(notModified);
     EXPECT_EQ(lastModified, "Mon");
-    auto rest = lines();
-    rest.erase(rest.begin(), rest.begin() + 2);
-    EXPECT_EQ(rest, (Lines{{6, withName("Loading default storebag 'palvo'")},
-                           {4, forClientType("Seed section is missing in the storebag.")},
-                           {6, forClientType("Store bag override MaxAge=3600")}}));
+    EXPECT_EQ(lines(), (Lines{adding,
+                              unresolved("palvo"),
+                              {6, withName("Loading default storebag 'palvo'")},
+                              {4, forClientType("Seed section is missing in the storebag.")},
+                              {6, forClientType("Store bag override MaxAge=3600")}}));
   }
+  server().stop();
+  EXPECT_EQ(fetch(7), fallbackStorebag().dictionary("release"));
+  EXPECT_FALSE(fetch(8));
   server().start();
+  // An answer of any kind does not mean that.
   serve(std::string(std::size_t{5} << 20, ' '));
-  EXPECT_FALSE(fetch(7)) << "an answer of any kind does not mean that";
+  EXPECT_FALSE(fetch(7));
+  EXPECT_EQ(lines(), (Lines{adding,
+                            {3, withName("propertyListWithData error " + errorOf("palvo"))},
+                            {3, withName("Signature is missing")},
+                            {3, forClientType("Could not fetch storebag for client type 7")}}));
+  serve("", {}, 503);
+  EXPECT_FALSE(fetch(11));
   http.stopAllButPosts();
   EXPECT_FALSE(fetch(7)) << "the daemon ends, and the server is as good as ever";
 }
@@ -243,8 +260,11 @@ TEST_F(StorebagFetch, AsksOnlyForWhatIsNewer) {
   EXPECT_FALSE(fetch());
   EXPECT_FALSE(notModified);
   EXPECT_EQ(lastModified, first);
-  EXPECT_EQ(log.count(7, withName("New 'Last-Modified: " + first + "' received")), 1);
-  EXPECT_EQ(log.countContaining(3, withName("propertyListWithData error ")), 1);
+  EXPECT_EQ(maxAge, 86400);
+  EXPECT_EQ(lines(), (Lines{{7, withName("New 'Last-Modified: " + first + "' received")},
+                            {3, withName("propertyListWithData error " + parsePropertyList("").error)},
+                            {3, withName("Signature is missing")},
+                            {3, forClientType("Could not fetch storebag for client type 5")}}));
 
   serve("", {{"Last-Modified", second}, {"Cache-Control", "max-age=60"}}, 304);
   EXPECT_FALSE(fetch());
@@ -264,6 +284,12 @@ TEST_F(StorebagFetch, AsksOnlyForWhatIsNewer) {
   EXPECT_EQ(fetch(), kSeed);
   EXPECT_EQ(lastModified, second);
   EXPECT_EQ(lines(), (Lines{{7, adding}, {7, withName("New 'Last-Modified: " + second + "' received")}}));
+
+  // With content it is no answer of that kind, whatever it says of its age.
+  serve("junk", {{"Last-Modified", first}});
+  EXPECT_FALSE(fetch());
+  EXPECT_FALSE(notModified);
+  EXPECT_EQ(lastModified, first);
 
   // Without a slot nothing is conditional.
   serve(signedStorebag(payload()), {{"Last-Modified", first}});
@@ -289,41 +315,61 @@ TEST_F(StorebagFetch, TheStorebagsOwnAgeGoesBeforeTheServers) {
   EXPECT_TRUE(fetch());
   EXPECT_EQ(maxAge, 600);
   EXPECT_FALSE(version);
-  EXPECT_EQ(log.countContaining(4, "'refresh_cycle'"), 1);
-  EXPECT_EQ(log.countContaining(4, "'version'"), 1);
+  const std::string ofType = " has the wrong type and counts as absent: ";
+  EXPECT_EQ(lines(),
+            (Lines{{4, "storebag: The storebag's value for 'version'" + ofType + "3"},
+                   {4, "storebag: The storebag's value for 'refresh_cycle'" + ofType + describe("300")}}));
 }
 
 TEST_F(StorebagFetch, ASeedDeviceTakesTheReleaseSectionWhenThereIsNoOther) {
+  const std::pair<int, std::string> missing{4, forClientType("Seed section is missing in the storebag.")};
   serve(signedStorebag(payload({}, "seed")));
   EXPECT_EQ(fetch(), kRelease);
-  EXPECT_EQ(lines(), (Lines{{4, forClientType("Seed section is missing in the storebag.")}}));
+  EXPECT_EQ(lines(), Lines{missing});
   serve(signedStorebag({{"version", "1"}, {"refresh_cycle", 5}}), {{"Cache-Control", "max-age=600"}});
   EXPECT_FALSE(fetch());
   EXPECT_EQ(
       lines(),
-      (Lines{{4, forClientType("Seed section is missing in the storebag.")},
+      (Lines{missing,
              {3, forClientType("Could not find storebag for client type 5 with release environment")}}));
   EXPECT_FALSE(version);
   EXPECT_EQ(maxAge, 600);
 }
 
 TEST(StorebagSection, BelongsToItsEnvironment) {
-  const Dictionary one{{"a", Dictionary{}}};
-  const Dictionary all{{"development", one}, {"corvane_internal", one}, {"seed", one}, {"release", one}};
-  const char* names[] = {"(none)", "development", "corvane_internal", "release", "release", "(none)"};
+  const char* names[] = {"(none)", "development", "corvane_internal", "seed", "release", "(none)"};
+  MutableDictionary whole;
+  for (const char* name : names) whole.set(name, Dictionary{{"from", name}});
+  const Dictionary all = whole.share();
+  CapturedLog log;
   for (std::int32_t type = 0; type < 6; ++type) {
-    EXPECT_EQ(storebagSectionForEnvironment(all, type, 5).has_value(), type >= 1 && type <= 4) << type;
-    CapturedLog log;
+    const bool isNamed = type >= 1 && type <= 4;
+    EXPECT_EQ(storebagSectionForEnvironment(all, type, 5),
+              isNamed ? std::optional(Dictionary{{"from", names[type]}}) : std::nullopt);
+    log.clear();
     EXPECT_FALSE(storebagSectionForEnvironment({}, type, 9));
-    EXPECT_EQ(log.count(3, forClientType("Could not find storebag for client type 9 with ") + names[type] +
-                               " environment"),
-              1);
-    EXPECT_EQ(log.count(4, forClientType("Seed section is missing in the storebag.")), type == 3);
+    Lines lines;
+    if (type == 3) lines.emplace_back(4, forClientType("Seed section is missing in the storebag."));
+    lines.emplace_back(3, forClientType("Could not find storebag for client type 9 with ") +
+                              (type == 3 ? "release" : names[type]) + " environment");
+    EXPECT_EQ(log.lines(), lines);
   }
   EXPECT_FALSE(storebagSectionForEnvironment(all, -1, 5));
-  CapturedLog log;
   EXPECT_FALSE(storebagSectionForEnvironment({{"development", "text"}}, 1, 9));
-  EXPECT_EQ(log.countContaining(4, "'development'"), 1);
+  EXPECT_EQ(
+      log.count(4,
+                "storebag: The storebag's value for 'development' has the wrong type and counts as absent: " +
+                    describe("text")),
+      1);
+}
+
+TEST(StorebagRequest, IsGivenUpAfterFifteenSeconds) {
+  CapturedLog log;
+  auto plain = storebagRequest("http://a/b", std::nullopt);
+  EXPECT_EQ(plain.timeout, std::chrono::seconds(15));
+  EXPECT_EQ(plain.retry, HTTPRequest::Retry::Never);
+  EXPECT_EQ(plain.headers, decltype(plain.headers)());
+  EXPECT_EQ(log.lines(), Lines());
 }
 
 TEST(StorebagAge, IsWhatCacheControlGrants) {

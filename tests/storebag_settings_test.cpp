@@ -1,5 +1,7 @@
 // Names, settings and typed reading of storebags.
 #include <gtest/gtest.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 #include <limits>
 
@@ -8,80 +10,133 @@
 #include "storebag/StorebagProfile.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/TestRoot.h"
+#include "util/ReportingdUtil.h"
 
 namespace vesk::test {
 namespace {
+
+using Lines = std::vector<std::pair<int, std::string>>;
 
 void writePreferences(std::string_view toml) {
   testRoot().write("etc/veskreporting/preferences/com.corvane.veskreporting.toml", toml);
 }
 
-TEST(StorebagNaming, NamesTheStorebagOfAClientType) {
-  const std::optional<std::string_view> names[] = {
-      std::nullopt, std::nullopt, std::nullopt, std::nullopt, std::nullopt, "zelko",     "brannic",
-      "palvo",      "tessin",     "quimby",     "dorvel",     "palvo",      std::nullopt};
-  for (int type = 0; type < 13; ++type) EXPECT_EQ(storebagNameForClientType(type), names[type]) << type;
-  for (int type : {-1, 1000, std::numeric_limits<int>::min(), std::numeric_limits<int>::max()}) {
-    EXPECT_FALSE(storebagNameForClientType(type)) << type;
+/// What `body` returns in a process of its own, with the lines it logged before that: "<level> text". Some
+/// settings are fixed for the life of a process.
+std::string inNewProcess(const std::function<std::string()>& body) {
+  pid_t child = ::fork();
+  if (child == 0) {
+    CapturedLog log;
+    const std::string result = body();
+    std::string text;
+    for (const auto& [level, line] : log.lines()) text += "<" + std::to_string(level) + "> " + line + "\n";
+    testRoot().write("result", text + result);
+    ::_exit(0);
   }
+  int status = -1;
+  ::waitpid(child, &status, 0);
+  return status == 0 ? testRoot().read("result") : "ended with status " + std::to_string(status);
 }
 
-TEST(StorebagNaming, ReadsTheEnvironmentTypeFromASetting) {
+TEST(StorebagNaming, NamesTheStorebagOfAClientType) {
+  const std::optional<std::string_view> none;
+  const std::pair<std::int32_t, std::optional<std::string_view>> cases[] = {
+      {-1, none},
+      {0, none},
+      {1, none},
+      {2, none},
+      {3, none},
+      {4, none},
+      {5, "zelko"},
+      {6, "brannic"},
+      {7, "palvo"},
+      {8, "tessin"},
+      {9, "quimby"},
+      {10, "dorvel"},
+      {11, "palvo"},
+      {12, none},
+      {1000, none},
+      {std::numeric_limits<std::int32_t>::min(), none},
+      {std::numeric_limits<std::int32_t>::max(), none}};
+  for (const auto& [type, name] : cases) EXPECT_EQ(storebagNameForClientType(type), name) << type;
+}
+
+TEST(StorebagNaming, TheEnvironmentIsReadOnceAndSaysWhatItIs) {
   const struct {
-    std::optional<Value> setting;
+    const char* setting;
     int type;
     const char* invalid = nullptr;
   } cases[] = {
-      {std::nullopt, 3},
-      {Value(0), 0},
-      {Value(4), 4},
-      {Value(5), 2, "5"},
-      {Value(-1), 2, "4294967295"},
-      {Value("4 or so"), 4},
-      {Value("-3"), 2, "4294967293"},
-      {Value(std::int64_t{1} << 33), 2, "0"},
+      {"", 3},
+      {"environmentType = 0", 0},
+      {"environmentType = 1", 1},
+      {"environmentType = 2", 2},
+      {"environmentType = 3", 3},
+      {"environmentType = 4", 4},
+      {"environmentType = 5", 2, "5"},
+      {"environmentType = 7", 2, "7"},
+      {"environmentType = -1", 2, "4294967295"},
+      {"environmentType = 8589934592", 2, "0"},
+      {"environmentType = 4.9", 4},
+      {"environmentType = '4 or so'", 4},
+      {"environmentType = '-3'", 2, "4294967293"},
+      {"environmentType = 'release'", 0},
+      {"environmentType = [4]", 0},
+      {"environmentType = { a = 4 }", 0},
+      {"environmentType = 2026-11-24", 0},
   };
   for (const auto& test : cases) {
-    CapturedLog log;
-    EXPECT_EQ(environmentTypeForPreference(test.setting), test.type);
-    EXPECT_EQ(log.lines().size(), test.invalid ? 1u : 0u);
-    const std::string line = "userDefaultsEnvironment: Invalid environment type ";
-    EXPECT_EQ(log.count(3, line + (test.invalid ? test.invalid : "")), test.invalid ? 1 : 0);
+    writePreferences(test.setting);
+    std::string expected;
+    if (test.invalid) {
+      expected = std::string("<3> userDefaultsEnvironment: Invalid environment type ") + test.invalid + "\n";
+    }
+    const std::string type = std::to_string(test.type);
+    expected += "<6> userDefaultsEnvironment: Environment type " + type + "\n" + type + " " + type;
+    EXPECT_EQ(inNewProcess([] {
+                const auto first = currentEnvironmentType();
+                writePreferences(first == 1 ? "environmentType = 4" : "environmentType = 1");
+                return std::to_string(first) + " " + std::to_string(currentEnvironmentType());
+              }),
+              expected)
+        << test.setting;
   }
 }
 
-TEST(StorebagNaming, TheEnvironmentTypeIsReadOnceForTheProcess) {
-  CapturedLog log;
-  writePreferences("environmentType = 7\n");
-  EXPECT_EQ(currentEnvironmentType(), 2);
-  EXPECT_EQ(log.count(3, "userDefaultsEnvironment: Invalid environment type 7"), 1);
-  EXPECT_EQ(log.count(6, "userDefaultsEnvironment: Environment type 2"), 1);
-  writePreferences("environmentType = 1\n");
-  EXPECT_EQ(currentEnvironmentType(), 2);
-  EXPECT_EQ(log.countContaining(6, "userDefaultsEnvironment"), 1);
+TEST(StorebagNaming, TheServerIsReadOnceTheOverrideOrThatOfTheBuild) {
+  const struct {
+    const char* setting;
+    const char* facts;
+    const char* url;
+  } cases[] = {
+      {"", "", "https://" VESK_STOREBAG_HOST "/bags/sorrel"},
+      {"", "ReleaseType = 'Beta'", "https://" VESK_STOREBAG_HOST "/bags/sorrel"},
+      {"", "ReleaseType = 'Internal'", "https://" VESK_PARTNER_STOREBAG_HOST "/storebags/sorrel"},
+      {"veskreporting_storebag_url = 'http://here:1/x '", "", "http://here:1/x "},
+      {"veskreporting_storebag_url = 'no URL'", "ReleaseType = 'Internal'", "no URL"},
+      {"veskreporting_storebag_url = ''", "", ""},
+      {"veskreporting_storebag_url = 12", "", "12"},
+  };
+  for (const auto& test : cases) {
+    writePreferences(test.setting);
+    testRoot().write("etc/veskreporting/device.toml", test.facts);
+    EXPECT_EQ(inNewProcess([] {
+                const std::string first = storebagServerBaseURL();
+                writePreferences("veskreporting_storebag_url = 'http://later'");
+                testRoot().write("etc/veskreporting/device.toml", "");
+                return first + "|" + storebagServerBaseURL();
+              }),
+              std::string(test.url) + "|" + test.url);
+  }
 }
 
 TEST(StorebagNaming, OtherSettingsAreReadAfreshAsText) {
   writePreferences("httpsPostURL = 'https://a/'\nnumber = 12\n");
   EXPECT_EQ(preferenceStringForKey("httpsPostURL"), "https://a/");
   EXPECT_EQ(preferenceStringForKey("number"), "12");
-  EXPECT_FALSE(preferenceStringForKey("absent"));
+  EXPECT_EQ(preferenceStringForKey("absent"), std::nullopt);
   writePreferences("httpsPostURL = 'https://b/'\n");
   EXPECT_EQ(preferenceStringForKey("httpsPostURL"), "https://b/");
-}
-
-TEST(StorebagNaming, TheServerIsTheOverrideOrThatOfTheBuild) {
-  EXPECT_EQ(storebagServerBaseURLFor("http://here:1/x", true), "http://here:1/x");
-  EXPECT_EQ(storebagServerBaseURLFor("", false), "");
-  std::string partners = storebagServerBaseURLFor(std::nullopt, true);
-  std::string general = storebagServerBaseURLFor(std::nullopt, false);
-  EXPECT_TRUE(partners.starts_with("https://") && partners.ends_with("/storebags/sorrel")) << partners;
-  EXPECT_TRUE(general.starts_with("https://") && general.ends_with("/bags/sorrel")) << general;
-
-  writePreferences("veskreporting_storebag_url = 'http://first'\n");
-  EXPECT_EQ(storebagServerBaseURL(), "http://first");
-  writePreferences("veskreporting_storebag_url = 'http://second'\n");
-  EXPECT_EQ(storebagServerBaseURL(), "http://first");
 }
 
 TEST(StorebagFallback, HoldsOneBackendForEveryEnvironmentButSeed) {
@@ -93,53 +148,56 @@ TEST(StorebagFallback, HoldsOneBackendForEveryEnvironmentButSeed) {
                                             {"refresh_cycle", 3600}}));
 }
 
-TEST(StorebagProfile, ReadsValuesOfTheirTypeAndReportsTheRest) {
+TEST(StorebagProfile, ReadsValuesOfTheirType) {
   const Dictionary inner{{"a", 1}};
-  const Dictionary profile{{"text", "t"},
-                           {"whole", 3},
+  const Dictionary profile{{"text", "12 or so"},
                            {"real", 2.75},
-                           {"flag", true},
                            {"list", List{"a", "b"}},
                            {"inner", inner},
-                           {"mixed", List{"a", 1, "b", inner}},
-                           {"bytes", Bytes("x")},
-                           {"infinite", std::numeric_limits<double>::infinity()}};
+                           {"infinite", std::numeric_limits<double>::infinity()},
+                           {"mixed", List{"a", 1, "b", inner}}};
   CapturedLog log;
-  EXPECT_EQ(profileText("b", profile, "text"), "t");
+  EXPECT_EQ(profileText("b", profile, "text"), "12 or so");
   EXPECT_EQ(profileNumber("b", profile, "real"), Value(2.75));
-  EXPECT_EQ(profileNumber("b", profile, "flag"), Value(true));
   EXPECT_EQ(profileInteger("b", profile, "real"), 2);
   EXPECT_EQ(profileInteger("b", profile, "infinite"), std::numeric_limits<std::int64_t>::max());
+  EXPECT_EQ(profileIntegerOrNumericText("b", profile, "text"), 12);
+  EXPECT_EQ(profileIntegerOrNumericText("b", profile, "real"), 2);
   EXPECT_EQ(profileList("b", profile, "list"), (List{"a", "b"}));
-  EXPECT_EQ(profileTextList("b", profile, "list"), (std::vector<std::string>{"a", "b"}));
   EXPECT_EQ(profileDictionary("b", profile, "inner"), inner);
   EXPECT_FALSE(profileText("b", profile, "absent"));
   EXPECT_FALSE(profileTextList("b", profile, "absent"));
-  EXPECT_TRUE(log.lines().empty());
-
-  EXPECT_EQ(profileTextList("backend", profile, "mixed"), (std::vector<std::string>{"a", "b"}));
-  EXPECT_EQ(log.countContaining(4, "backend: "), 1);
-  EXPECT_EQ(log.countContaining(4, "'mixed'"), 1);
+  EXPECT_EQ(log.lines(), Lines());
+  EXPECT_EQ(profileTextList("b", profile, "mixed"), (std::vector<std::string>{"a", "b"}));
+  EXPECT_EQ(log.lines(),
+            (Lines{{4, "b: The storebag's value for 'mixed' has the wrong type and counts as absent: 1"}}));
 }
 
 TEST(StorebagProfile, AWrongTypeCountsAsAbsentAndCostsOneLine) {
-  const Value values[] = {Value(), "text", 1, 1.5, true, Bytes("x"), Date{1}, List{}, Dictionary{}};
+  const Value values[] = {Value(),    "text",  1,      1.5,          true,
+                          Bytes("x"), Date{1}, List{}, Dictionary{}, std::string(70, 'x')};
   for (const Value& value : values) {
     const Dictionary profile{{"the key", value}};
+    const bool isText = value.text() != nullptr;
     CapturedLog log;
     const std::pair<bool, bool> readings[] = {
-        {profileText("the backend", profile, "the key").has_value(), value.text() != nullptr},
+        {profileText("the backend", profile, "the key").has_value(), isText},
         {profileNumber("the backend", profile, "the key").has_value(), value.isNumber()},
         {profileInteger("the backend", profile, "the key").has_value(), value.isNumber()},
+        {profileIntegerOrNumericText("the backend", profile, "the key").has_value(),
+         value.isNumber() || isText},
         {profileList("the backend", profile, "the key").has_value(), value.list() != nullptr},
         {profileTextList("the backend", profile, "the key").has_value(), value.list() != nullptr},
         {profileDictionary("the backend", profile, "the key").has_value(), value.dictionary() != nullptr}};
-    int absent = 0;
+    std::size_t absent = 0;
     for (const auto& [isThere, isOfThatType] : readings) {
       EXPECT_EQ(isThere, isOfThatType);
       absent += isOfThatType ? 0 : 1;
     }
-    EXPECT_EQ(log.countContaining(4, "the backend: The storebag's value for 'the key'"), absent);
+    const std::pair<int, std::string> line{
+        4, "the backend: The storebag's value for 'the key' has the wrong type and counts as absent: " +
+               describe(value, 64)};
+    EXPECT_EQ(log.lines(), Lines(absent, line));
   }
 }
 

@@ -6,7 +6,7 @@
 #include <string_view>
 
 #include "platform/files/RootPrefix.h"
-#include "platform/files/SmallFile.h"
+#include "platform/files/TrustedFile.h"
 #include "platform/log/SystemLog.h"
 #include "platform/text/ASCII.h"
 
@@ -21,8 +21,8 @@ constexpr char kDefaultVersion[] = "7.0";
 
 std::optional<std::string> readResource(const char* name, std::size_t limit) {
   std::string path = pathUnderRoot("/usr/share/veskreporting/") + name;
-  SmallFile file = readSmallFile(path, limit);
-  if (!file.bytes && !file.missing) {
+  SmallFile file = readTrustedFile(path, limit);
+  if (!file.bytes && !file.missing && !file.reported) {
     VESK_LOG_WARNING("VeskReporting: cannot read %s: %s", path.c_str(), file.error.c_str());
   }
   return std::move(file.bytes);

@@ -18,13 +18,16 @@ SmallFile failure(int code) {
 
 }  // namespace
 
-SmallFile readSmallFile(const std::string& path, std::size_t limit) {
+SmallFile readSmallFile(const std::string& path, std::size_t limit,
+                        const std::function<std::string(const struct stat&)>& objection) {
   // Without O_NONBLOCK, opening a FIFO would wait for a writer.
   FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
   if (!file) return failure(errno);
   struct stat status {};
   if (::fstat(file.get(), &status) != 0) return failure(errno);
   if (!S_ISREG(status.st_mode)) return {std::nullopt, false, "not a regular file"};
+  if (std::string reason = objection ? objection(status) : std::string(); !reason.empty())
+    return {std::nullopt, false, std::move(reason)};
 
   // The size that the file system gives is only a hint: files of the kernel say 4096 or 0.
   std::string bytes;

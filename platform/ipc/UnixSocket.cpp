@@ -77,9 +77,12 @@ FileDescriptor listenOnUnixSocket(const std::string& path) {
   removeStaleSocket(path);
   UnixSocketAddress address(path);
   FileDescriptor socket = newSocket();
-  if (::bind(socket.get(), address.get(), address.size()) != 0) fail(errno, path);
-  // Before it listens, so that nobody is refused for want of the mode.
-  if (::chmod(path.c_str(), 0666) != 0) fail(errno, path);
+  // Clients of every user connect to it. The sandbox denies changing the mode afterwards.
+  const mode_t mask = ::umask(0111);
+  const int bound = ::bind(socket.get(), address.get(), address.size());
+  const int error = errno;
+  ::umask(mask);
+  if (bound != 0) fail(error, path);
   if (::listen(socket.get(), SOMAXCONN) != 0) fail(errno, path);
   return socket;
 }

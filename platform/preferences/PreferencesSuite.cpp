@@ -1,6 +1,12 @@
 #include "platform/preferences/PreferencesSuite.h"
 
+#include <pwd.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <cstdint>
 #include <cstdlib>
+#include <vector>
 
 #include "platform/files/RootPrefix.h"
 #include "platform/preferences/TomlFile.h"
@@ -9,7 +15,33 @@ namespace vesk {
 
 namespace {
 
+constexpr std::size_t kLongestPasswordEntry = std::size_t{16} << 10;
+
+/// Whether the account has a login shell. A service writes its state to the home of its account: if settings
+/// were read from there, a compromised daemon could redirect the next one to another server.
+bool canLogIn(uid_t user) {
+  std::vector<char> room(kLongestPasswordEntry);
+  passwd entry{};
+  passwd* found = nullptr;
+  if (::getpwuid_r(user, &entry, room.data(), room.size(), &found) != 0 || !found) return false;
+  const std::string_view shell = found->pw_shell;
+  return !shell.ends_with("/nologin") && !shell.ends_with("/false");
+}
+
+/// The same for this process's user. Looked up once: a sandbox no longer sees /etc/passwd once it is
+/// replaced.
+bool isLoginUser() {
+  constexpr std::uint64_t kKnown = 2;
+  static std::atomic<std::uint64_t> last{0};  // user << 2, known, answer
+  const std::uint64_t user = ::geteuid();
+  std::uint64_t answer = last;
+  if (answer >> 2 != user || (answer & kKnown) == 0)
+    last = answer = user << 2 | kKnown | (canLogIn(static_cast<uid_t>(user)) ? 1 : 0);
+  return (answer & 1) != 0;
+}
+
 std::optional<std::string> userConfigurationDirectory() {
+  if (!isLoginUser()) return std::nullopt;
   const char* config = std::getenv("XDG_CONFIG_HOME");
   if (config && config[0] == '/') return std::string(config);
   const char* home = std::getenv("HOME");
@@ -17,17 +49,17 @@ std::optional<std::string> userConfigurationDirectory() {
   return std::nullopt;
 }
 
-Dictionary readSuite(const std::string& directory, std::string_view suite) {
-  return readTomlFile(
-      pathUnderRoot(directory + "/veskreporting/preferences/" + std::string(suite) + ".toml"));
+Dictionary readSuite(const std::string& directory, std::string_view suite, TrustedOwner owner) {
+  return readTomlFile(pathUnderRoot(directory + "/veskreporting/preferences/" + std::string(suite) + ".toml"),
+                      owner);
 }
 
 }  // namespace
 
 PreferencesSuite::PreferencesSuite(std::string_view suite) {
   if (suite.size() > 128 || !isPlainFileName(suite)) return;
-  _system = readSuite("/etc", suite);
-  if (auto user = userConfigurationDirectory()) _user = readSuite(*user, suite);
+  _system = readSuite("/etc", suite, TrustedOwner::Root);
+  if (auto user = userConfigurationDirectory()) _user = readSuite(*user, suite, TrustedOwner::OwnUser);
 }
 
 std::optional<Value> PreferencesSuite::valueForKey(std::string_view key) const {

@@ -4,7 +4,6 @@
 #include <chrono>
 #include <sstream>
 
-#include "platform/files/SmallFile.h"
 #include "platform/log/SystemLog.h"
 #include "platform/preferences/TomlLibrary.h"
 
@@ -131,10 +130,11 @@ TomlOutcome parseToml(std::string_view text) {
   return {std::nullopt, words.str()};
 }
 
-Dictionary readTomlFile(const std::string& path) {
-  SmallFile file = readSmallFile(path, kLargestDocument);
+Dictionary readTomlFile(const std::string& path, TrustedOwner owner) {
+  SmallFile file = readTrustedFile(path, kLargestDocument, owner);
   if (!file.bytes) {
-    if (!file.missing) VESK_LOG_WARNING("%s is ignored: %s", path.c_str(), file.error.c_str());
+    if (!file.missing && !file.reported)
+      VESK_LOG_WARNING("%s is ignored: %s", path.c_str(), file.error.c_str());
     return {};
   }
   TomlOutcome outcome = parseToml(*file.bytes);

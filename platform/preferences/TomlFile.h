@@ -5,6 +5,7 @@
 #include <string>
 #include <string_view>
 
+#include "platform/files/TrustedFile.h"
 #include "platform/values/Value.h"
 
 namespace vesk {
@@ -21,9 +22,9 @@ struct TomlOutcome {
 /// parts: what reads this may stand on a small stack.
 TomlOutcome parseToml(std::string_view text);
 
-/// The document of the file at `path` (no root prefix is added). A file that is not there is an empty
-/// document without a word; one that can't be read or is no TOML costs one level-4 line that names it, and is
-/// an empty document too.
-Dictionary readTomlFile(const std::string& path);
+/// The document of the file at `path` (no root prefix is added), which has to be trusted (TrustedFile.h). A
+/// missing file is an empty document. One that is refused, can't be read or is no TOML costs one level-4 line
+/// that names it, and is an empty document too.
+Dictionary readTomlFile(const std::string& path, TrustedOwner owner = TrustedOwner::Root);
 
 }  // namespace vesk

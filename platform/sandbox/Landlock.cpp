@@ -8,6 +8,7 @@
 
 #include <cerrno>
 #include <cstdint>
+#include <cstdlib>
 #include <system_error>
 
 #include "platform/files/FileDescriptor.h"
@@ -26,6 +27,22 @@ constexpr std::uint64_t kWriteRights = kReadRights | LANDLOCK_ACCESS_FS_WRITE_FI
 constexpr std::uint64_t kFirstVersionRights = kFileRights | kWriteRights | LANDLOCK_ACCESS_FS_MAKE_SOCK |
                                               LANDLOCK_ACCESS_FS_MAKE_CHAR | LANDLOCK_ACCESS_FS_MAKE_FIFO |
                                               LANDLOCK_ACCESS_FS_MAKE_BLOCK | LANDLOCK_ACCESS_FS_MAKE_SYM;
+
+// Newer than the header of some build machines.
+constexpr int kPortRule = 2;
+constexpr std::uint64_t kBindTCP = 1 << 0;
+constexpr std::uint64_t kConnectTCP = 1 << 1;
+constexpr std::uint64_t kAbstractSockets = 1 << 0;
+constexpr std::uint64_t kSignals = 1 << 1;
+struct Ruleset {
+  std::uint64_t files = 0;
+  std::uint64_t network = 0;
+  std::uint64_t scopes = 0;
+};
+struct PortRule {
+  std::uint64_t rights = 0;
+  std::uint64_t port = 0;
+};
 
 std::uint64_t rights(SandboxPath::Access access) {
   switch (access) {
@@ -47,15 +64,30 @@ std::string failure(const std::string& what, int code) {
 
 long version() { return ::syscall(SYS_landlock_create_ruleset, nullptr, 0, LANDLOCK_CREATE_RULESET_VERSION); }
 
+/// A service manager may listen for its services' notifications on an abstract socket.
+bool hasAbstractManager() {
+  const char* socket = std::getenv("NOTIFY_SOCKET");
+  return socket && *socket == '@';
+}
+
 /// Every right that the kernel can take away and that we know by name. Moving a file to another directory
 /// (version 2) is in nobody's grant. Truncation by path became a right only with version 3: the system-call
-/// group "truncation" stands in for it on every kernel.
-FileDescriptor makeRuleset(long kernelVersion) {
-  landlock_ruleset_attr attributes{};
-  attributes.handled_access_fs = kFirstVersionRights;
-  if (kernelVersion >= 2) attributes.handled_access_fs |= LANDLOCK_ACCESS_FS_REFER;
+/// group "truncation" stands in for it on every kernel. A kernel accepts a longer ruleset than it knows when
+/// the rest is zero.
+FileDescriptor makeRuleset(long kernelVersion, bool restrictsConnections) {
+  Ruleset ruleset;
+  ruleset.files = kFirstVersionRights;
+  if (kernelVersion >= 2) ruleset.files |= LANDLOCK_ACCESS_FS_REFER;
+  if (kernelVersion >= 4) ruleset.network = kBindTCP | (restrictsConnections ? kConnectTCP : 0);
+  if (kernelVersion >= 6) ruleset.scopes = kSignals | (hasAbstractManager() ? 0 : kAbstractSockets);
   return FileDescriptor(
-      static_cast<int>(::syscall(SYS_landlock_create_ruleset, &attributes, sizeof attributes, 0)));
+      static_cast<int>(::syscall(SYS_landlock_create_ruleset, &ruleset, sizeof ruleset, 0)));
+}
+
+std::optional<std::string> addPort(int ruleset, std::uint16_t port) {
+  const PortRule rule{kConnectTCP, port};
+  if (::syscall(SYS_landlock_add_rule, ruleset, kPortRule, &rule, 0) == 0) return std::nullopt;
+  return failure("landlock_add_rule: port " + std::to_string(port), errno);
 }
 
 /// A rule binds to the inode of today. The kernel makes up those below /proc, and makes up others once nobody
@@ -87,18 +119,23 @@ std::optional<std::string> addRule(int ruleset, const SandboxPath& path) {
 
 }  // namespace
 
-std::optional<std::string> restrictFiles(const std::vector<SandboxPath>& paths, bool required) {
-  long kernelVersion = version();
+std::optional<std::string> enterLandlock(const SandboxProfile& profile) {
+  const long kernelVersion = version();
   if (kernelVersion < 1) {
     std::string error = failure("this kernel offers no Landlock", errno);
-    if (required) return error;
+    if (profile.landlockRequired) return error;
     VESK_LOG_WARNING("restrictFiles: %s; files are not restricted", error.c_str());
     return std::nullopt;
   }
-  FileDescriptor ruleset = makeRuleset(kernelVersion);
+  FileDescriptor ruleset = makeRuleset(kernelVersion, profile.connectPorts.has_value());
   if (!ruleset) return failure("landlock_create_ruleset", errno);
-  for (const SandboxPath& path : paths) {
+  for (const SandboxPath& path : profile.paths) {
     if (auto error = addRule(ruleset.get(), path)) return error;
+  }
+  if (kernelVersion >= 4 && profile.connectPorts) {
+    for (std::uint16_t port : *profile.connectPorts) {
+      if (auto error = addPort(ruleset.get(), port)) return error;
+    }
   }
   if (::syscall(SYS_landlock_restrict_self, ruleset.get(), 0) != 0) {
     return failure("landlock_restrict_self", errno);

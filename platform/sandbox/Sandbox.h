@@ -11,8 +11,8 @@ namespace vesk {
 /// calls by a seccomp filter. The profile is /usr/share/veskreporting/sandbox/<profileName>.toml under the
 /// root prefix; what it may say stands in SandboxProfile.h.
 ///
-/// Call it before the process has any other thread: Landlock holds the calling thread and every thread made
-/// later. Returns why the sandbox could not be entered; the process may be half confined then, and should
+/// Fails once the process has another thread: Landlock holds the calling thread and every thread made later.
+/// Returns why the sandbox could not be entered; the process may be half confined then, and should
 /// end.
 [[nodiscard]] std::optional<std::string> enterSandbox(std::string_view profileName);
 

@@ -92,6 +92,22 @@ bool isRequired(const Value& value) {
   fail("landlock", "must be \"required\" or \"if-available\"");
 }
 
+std::vector<std::uint16_t> connectPorts(const Dictionary& network) {
+  std::vector<std::uint16_t> ports;
+  for (const DictionaryEntry& entry : network) {
+    const std::string where = "network." + entry.key.string();
+    if (!(entry.key == "connect")) fail(where, "unknown key");
+    const List* list = entry.value.list();
+    if (!list) fail(where, "must be a list of ports");
+    for (const Value& port : *list) {
+      const std::int64_t number = port.asInteger().value_or(0);
+      if (number < 1 || number > 65535) fail(where, "must be a list of ports");
+      ports.push_back(static_cast<std::uint16_t>(number));
+    }
+  }
+  return ports;
+}
+
 std::vector<std::string> deniedCalls(const Dictionary& calls) {
   std::vector<std::string> groups;
   for (const DictionaryEntry& entry : calls) {
@@ -114,6 +130,8 @@ SandboxProfile profileFrom(const Dictionary& document) {
       for (const DictionaryEntry& paths : table(entry)) {
         addPaths(profile.paths, entry.key.string() + "." + paths.key.string(), paths, entry.key == "root");
       }
+    } else if (entry.key == "network") {
+      profile.connectPorts = connectPorts(table(entry));
     } else if (entry.key == "calls") {
       profile.deniedCalls = deniedCalls(table(entry));
     } else {

@@ -1,6 +1,7 @@
 // The profile of a sandbox: what a confined process may still do.
 #pragma once
 
+#include <cstdint>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -25,6 +26,8 @@ struct SandboxProfile {
   /// Whether a kernel without Landlock is an error. When it isn't, only the system-call filter holds there.
   bool landlockRequired = true;
   std::vector<SandboxPath> paths;
+  /// TCP ports of servers that may be connected to; nothing: all.
+  std::optional<std::vector<std::uint16_t>> connectPorts;
   std::vector<std::string> deniedCalls;  ///< names of groups that Seccomp.h knows
 };
 
@@ -44,6 +47,8 @@ struct SandboxProfileOutcome {
 ///     sockets = […]                   # likewise (0755: clients must get at the socket)
 ///     remove-if-present = […]         # files below may be removed, neither read nor written
 ///     [root]                          # the same keys, for paths under the root prefix
+///     [network]
+///     connect = [53, 443]             # TCP ports to connect to; without this key, all
 ///     [calls]
 ///     deny = […]
 ///

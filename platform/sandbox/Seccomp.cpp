@@ -6,6 +6,7 @@
 #include <seccomp.h>
 #include <sys/ioctl.h>
 #include <sys/mman.h>
+#include <sys/resource.h>
 #include <sys/shm.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -69,6 +70,10 @@ scmp_arg_cmp hasBits(unsigned argument, std::uint64_t mask, std::uint64_t bits) 
 }
 scmp_arg_cmp hasBits(unsigned argument, std::uint64_t bits) { return hasBits(argument, bits, bits); }
 
+// Of the kernel's headers, one of which is C in some versions.
+constexpr std::uint64_t kPriorityOfProcess = 1;
+constexpr std::uint64_t kAskForPersonality = 0xffffffff;
+
 void denyExecute(Filter& filter) { filter.deny({"execve", "execveat"}); }
 
 // Threads are made with clone. The flags of clone3 stand in memory, where a filter can't see them.
@@ -97,7 +102,13 @@ void denyNamespaces(Filter& filter) {
 void denyOtherProcesses(Filter& filter) {
   auto self = static_cast<std::uint64_t>(::getpid());
   filter.deny({"kill", "tgkill", "rt_sigqueueinfo", "rt_tgsigqueueinfo"}, {isOther(0, self)});
-  filter.deny({"prlimit64", "migrate_pages", "move_pages"}, {isOther(0, 0)});
+  filter.deny({"prlimit64", "migrate_pages", "move_pages", "sched_setscheduler", "sched_setparam",
+               "sched_setattr", "sched_setaffinity"},
+              {isOther(0, 0)});
+  // The first argument says whether the second is a process, a group or a user.
+  filter.deny({"setpriority", "ioprio_set"}, {isOther(1, 0)});
+  filter.deny({"setpriority"}, {isOther(0, PRIO_PROCESS)});
+  filter.deny({"ioprio_set"}, {isOther(0, kPriorityOfProcess)});
   filter.deny({"tkill", "pidfd_send_signal", "process_mrelease"});
 }
 
@@ -136,6 +147,8 @@ void denyOwnership(Filter& filter) {
                "lremovexattr"});
 }
 
+void denyModes(Filter& filter) { filter.deny({"chmod", "fchmod", "fchmodat", "fchmodat2"}); }
+
 void denyTruncation(Filter& filter) {
   filter.deny({"truncate", "truncate64"});
   // A file that is open for reading only gets truncated all the same, with no right to write.
@@ -172,9 +185,16 @@ void denySockets(Filter& filter) {
 
 void denyWritableCode(Filter& filter) {
   filter.deny({"mmap", "mmap2"}, {hasBits(2, PROT_WRITE | PROT_EXEC)});
+  // A file could be mapped twice, to write and to execute. Libraries are mapped privately.
+  filter.deny({"mmap", "mmap2"}, {hasBits(2, PROT_EXEC), hasBits(3, MAP_TYPE, MAP_SHARED)});
+  filter.deny({"mmap", "mmap2"}, {hasBits(2, PROT_EXEC), hasBits(3, MAP_TYPE, MAP_SHARED_VALIDATE)});
+  filter.deny({"memfd_create", "memfd_secret"});
+  filter.deny({"personality"}, {isOther(0, kAskForPersonality)});  // READ_IMPLIES_EXEC is one
   filter.deny({"mprotect", "pkey_mprotect"}, {hasBits(2, PROT_EXEC)});
   filter.deny({"shmat"}, {hasBits(2, SHM_EXEC)});
 }
+
+void denyNewCode(Filter& filter) { filter.deny({"mmap", "mmap2"}, {hasBits(2, PROT_EXEC)}); }
 
 struct Group {
   std::string_view name;
@@ -191,6 +211,7 @@ constexpr Group kGroups[] = {
     {"clock", denyClock},
     {"identity", denyIdentity},
     {"ownership", denyOwnership},
+    {"modes", denyModes},
     {"truncation", denyTruncation},
     {"handles", denyHandles},
     {"devices", denyDevices},
@@ -199,6 +220,7 @@ constexpr Group kGroups[] = {
     {"io-uring", denyIoUring},
     {"sockets", denySockets},
     {"writable-code", denyWritableCode},
+    {"new-code", denyNewCode},
 };
 
 const Group* groupNamed(std::string_view name) {

@@ -18,13 +18,15 @@ namespace vesk {
 [[nodiscard]] std::optional<std::string> denyCalls(const std::vector<std::string>& groups);
 
 /// Whether there is a group of that name. The groups:
-/// "execute" (run a program), "processes" (make one), "other-processes" (signal or limit another one),
-/// "trace" (look into another one), "namespaces", "mounts", "kernel" (modules, kexec, BPF, tuning), "clock",
-/// "identity" (user, group, capabilities), "ownership" (owner and extended attributes of files), "truncation"
-/// (of files by path, which Landlock's first versions don't restrict), "handles" (open files by handle),
-/// "devices" (make device nodes, push input into a terminal), "keys" (kernel key rings), "faults"
-/// (userfaultfd), "io-uring", "sockets" (all but Unix, IP and routing sockets; raw sockets) and
-/// "writable-code" (memory that is both writable and executable).
+/// "execute" (run a program), "processes" (make one), "other-processes" (signal, limit or schedule another
+/// one), "trace" (look into another one), "namespaces", "mounts", "kernel" (modules, kexec, BPF, tuning),
+/// "clock", "identity" (user, group, capabilities), "ownership" (owner and extended attributes of files),
+/// "modes" (who may use a file), "truncation" (of files by path, which Landlock's first versions don't
+/// restrict), "handles" (open files by handle), "devices" (make device nodes, push input into a terminal),
+/// "keys" (kernel key rings), "faults" (userfaultfd), "io-uring", "sockets" (all but Unix, IP and routing
+/// sockets; raw sockets), "writable-code" (memory that is both writable and executable, files in memory) and
+/// "new-code" (anything executable that is not mapped yet: no bundle and no name-service plug-in can be
+/// loaded any more).
 bool isCallGroup(std::string_view name);
 
 }  // namespace vesk

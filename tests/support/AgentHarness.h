@@ -16,7 +16,7 @@ class RecordingConnection final : public IPCConnection {
   void setExportedObject(std::shared_ptr<IPCExportedObject> object) override { _object = std::move(object); }
   void setInterruptionHandler(std::function<void()> handler) override { _interrupted = std::move(handler); }
   void setInvalidationHandler(std::function<void()> handler) override { _invalidated = std::move(handler); }
-  void setLossHandler(std::function<void(std::size_t)>) override {}
+  void setLossHandler(std::function<void(std::size_t)> handler) override { lose = std::move(handler); }
   void resume() override {}
   void invalidate() override {
     if (auto handler = std::exchange(_invalidated, nullptr)) handler();
@@ -32,6 +32,7 @@ class RecordingConnection final : public IPCConnection {
   }
 
   std::vector<IPCOutgoingCall> calls;
+  std::function<void(std::size_t)> lose;  ///< tells of calls that were never sent
   bool clientIsGone = false;
   std::function<void(const IPCOutgoingCall&)> onCall;  ///< by the sender, who may hold the agent's monitor
 

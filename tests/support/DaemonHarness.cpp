@@ -28,7 +28,9 @@ std::string quoted(const std::string& text) { return "\"" + text + "\""; }
 
 std::string tomlLines(const std::map<std::string, std::string>& entries) {
   std::string lines;
-  for (const auto& [key, value] : entries) lines += key + " = " + value + "\n";
+  for (const auto& [key, value] : entries) {
+    if (!value.empty()) lines += key + " = " + value + "\n";
+  }
   return lines;
 }
 
@@ -38,6 +40,10 @@ DaemonHarness::DaemonHarness(std::vector<std::string> collectorArguments) {
   std::filesystem::create_directories(root / "usr/share");
   std::filesystem::copy(VESK_SHARE_DIRECTORY, root / "usr/share/veskreporting",
                         std::filesystem::copy_options::recursive);
+  for (const auto& file : std::filesystem::recursive_directory_iterator(root / "usr/share")) {
+    using std::filesystem::perms;  // of a checkout, whose group may write to it
+    permissions(file.path(), perms::group_write | perms::others_write, std::filesystem::perm_options::remove);
+  }
   for (const char* directory :
        {"run", "var/lib/veskreportingd", "var/mobile/Library/Logs/Dunmore", "storebags"}) {
     std::filesystem::create_directories(root / directory);

@@ -40,7 +40,7 @@ class DaemonHarness {
   /// Writes a storebag source; the text may say @EVENTS@, @LOGDATA@ and @UDPPORT@ for the collector's
   /// HTTPS URLs of events and log data and its port for datagrams.
   void writeStorebag(const std::string& name, std::string source);
-  /// A line of the daemon's preferences or of the device's facts; `value` as TOML writes it.
+  /// A line of the daemon's preferences or of the device's facts; `value` as TOML writes it, "" for no line.
   void setPreference(const std::string& key, const std::string& value) { _preferences[key] = value; }
   void setDeviceFact(const std::string& key, const std::string& value) { _deviceFacts[key] = value; }
 

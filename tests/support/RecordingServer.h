@@ -18,10 +18,13 @@ class RecordingServer {
     start();
   }
 
+  void answerWith(Answer next) {
+    std::lock_guard lock(_mutex);
+    _answer = std::move(next);
+  }
   /// The same to all requests from now on.
   void answerWith(HTTPAnswer next) {
-    std::lock_guard lock(_mutex);
-    _answer = [next = std::move(next)](const HTTPReceived&, std::size_t) { return next; };
+    answerWith([next = std::move(next)](const HTTPReceived&, std::size_t) { return next; });
   }
   /// Goes down; its port refuses connections.
   void stop() { _server->stop(); }

@@ -1,6 +1,8 @@
 // A directory that goes away with the test.
 #pragma once
 
+#include <sys/stat.h>
+
 #include <filesystem>
 #include <fstream>
 #include <iterator>
@@ -13,6 +15,7 @@ namespace vesk::test {
 class TempDirectory {
  public:
   TempDirectory() {
+    ::umask(022);  // the system refuses files that others can write to
     std::string pattern = (std::filesystem::temp_directory_path() / "vesk-test-XXXXXX").string();
     if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no directory " + pattern);
     _path = pattern;

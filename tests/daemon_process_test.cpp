@@ -1,0 +1,219 @@
+// The daemon as a process: its command line, how it starts and ends, and the storebags that it fetches.
+#include <gtest/gtest.h>
+#include <sched.h>
+#include <sys/resource.h>
+#include <sys/socket.h>
+
+#include "platform/files/FileDescriptor.h"
+#include "platform/ipc/UnixSocket.h"
+#include "tests/support/DaemonHarness.h"
+#include "tests/support/RecordingServer.h"
+#include "tests/support/SignedStorebag.h"
+
+namespace vesk::test {
+namespace {
+
+constexpr char kDaemon[] = VESK_BIN_DIRECTORY "/veskreportingd";
+const std::string kVersion = VESK_VERSION;
+constexpr char kProfile[] = "usr/share/veskreporting/sandbox/com.corvane.veskreportingd.toml";
+
+/// Lines of the log without what comes before their level.
+std::string withoutTime(const std::string& log) {
+  std::string lines;
+  for (std::size_t at = 0, end; at < log.size() && (end = log.find('\n', at)) != log.npos; at = end + 1) {
+    const std::string line = log.substr(at, end - at);
+    lines += line.substr(std::min(line.size(), line.find('<'))) + "\n";
+  }
+  return lines;
+}
+
+TEST(DaemonCommandLine, IsUnderstoodOrSaysWhyNot) {
+  const TempDirectory root;
+  const std::string nowhere = root.path().string();
+  const std::string help =
+      "Usage: veskreportingd [--root DIR] [--log-level N] [--idle-exit SECONDS] [--no-sandbox]\n";
+  const std::string tryHelp = "Try: veskreportingd --help\n";
+  const auto isNot = [](const std::string& option, const std::string& value, const std::string& wanted) {
+    return "veskreportingd: " + option + ": \"" + value + "\" is not " + wanted + "\n";
+  };
+  // Where its options are understood, the daemon comes as far as its sandbox, whose profile is not there.
+  const std::string unconfined =
+      "<3> main: confine_enter() fails: " + nowhere + "/" + kProfile + ": no such file\n";
+  struct Case {
+    std::vector<std::string> arguments;
+    int status;
+    std::string output;
+    std::string errors;
+  };
+  std::vector<Case> cases = {
+      {{"--help"}, 0, help, ""},
+      {{"--version", "--bogus"}, 0, "veskreportingd " + kVersion + "\n", ""},
+      {{"--bogus"}, 2, "", kDaemon + std::string(": unrecognized option '--bogus'\n") + tryHelp},
+      {{"--root"}, 2, "", kDaemon + std::string(": option '--root' requires an argument\n") + tryHelp},
+      {{"--no-sandbox", "now"}, 2, "", "veskreportingd: unexpected argument \"now\"\n" + tryHelp},
+      {{"--root", "here"}, 2, "", isNot("--root", "here", "an absolute path")},
+      {{"--root", nowhere}, 255, "", unconfined},
+      {{"--root", nowhere + "/", "--log-level", "3"}, 255, "", unconfined},
+      {{"--log-level=7", "--root", nowhere, "--idle-exit", "1"}, 255, "", unconfined},
+      {{"--root", nowhere, "--idle-exit", "86400"}, 255, "", unconfined},
+  };
+  for (const char* level : {"2", "5", "8", "6x", ""})
+    cases.push_back({{"--log-level", level}, 2, "", isNot("--log-level", level, "3, 4, 6 or 7")});
+  for (const char* time : {"0", "86401"})
+    cases.push_back(
+        {{"--idle-exit", time}, 2, "", isNot("--idle-exit", time, "a number of seconds from 1 to 86400")});
+  for (const auto& test : cases) {
+    std::vector<std::string> command{kDaemon};
+    command.insert(command.end(), test.arguments.begin(), test.arguments.end());
+    SCOPED_TRACE(command.at(1));
+    ChildProcess daemon(command);
+    EXPECT_EQ(daemon.wait(), test.status);
+    EXPECT_EQ(daemon.output().substr(0, test.output.size()), test.output);
+    EXPECT_EQ(daemon.output().empty(), test.output.empty());
+    EXPECT_EQ(test.status == 255 ? withoutTime(daemon.errors()) : daemon.errors(), test.errors);
+  }
+  EXPECT_TRUE(std::filesystem::is_empty(root.path())) << "nothing has been started";
+}
+
+/// A daemon whose storebags come from a server of the test's own, which takes its posts, too.
+class DaemonProcess : public testing::Test {
+ protected:
+  DaemonProcess() {
+    harness.root.write("usr/share/veskreporting/publicKey.der", key.publicKeyInfo());
+    harness.root.write("usr/share/veskreporting/version", "7.4\n");
+    harness.setPreference("veskreporting_storebag_url", "'" + server.url("/bags") + "'");
+  }
+  void serve(HTTPAnswer storebag) {
+    server.answerWith([storebag](const HTTPReceived& request, std::size_t) {
+      return request.method == "GET" ? storebag : HTTPAnswer::text(200, "ok");
+    });
+  }
+  /// A section whose backend posts there.
+  Dictionary section(const std::string& path) const {
+    return {{"httpPost", Dictionary{{"clients", List{Dictionary{{"post_url", server.url(path)}}}}}}};
+  }
+  std::vector<HTTPReceived> requests(const std::string& method) const {
+    std::vector<HTTPReceived> all;
+    for (auto& each : server.requests()) {
+      if (each.method == method) all.push_back(each);
+    }
+    return all;
+  }
+
+  DaemonHarness harness;
+  TestSigningKey key;
+  RecordingServer server;
+};
+
+TEST_F(DaemonProcess, FetchesForTheEnvironmentOfItsDevice) {
+  const std::string environment = "userDefaultsEnvironment: Environment type ";
+  const struct {
+    const char* setting;
+    std::optional<std::string> section;
+    std::string lines;
+  } cases[] = {
+      {"", "/seed", "<6> " + environment + "3\n"},
+      {"0", {}, "<6> " + environment + "0\n"},
+      {"1", "/development", "<6> " + environment + "1\n"},
+      {"2", "/corvane_internal", "<6> " + environment + "2\n"},
+      {"4", "/release", "<6> " + environment + "4\n"},
+      {"-1", "/corvane_internal",
+       "<3> userDefaultsEnvironment: Invalid environment type 4294967295\n<6> " + environment + "2\n"},
+  };
+  MutableDictionary payload(Dictionary{{"version", "1"}});
+  for (const char* name : {"development", "corvane_internal", "seed", "release"})
+    payload.set(name, section(std::string("/") + name));
+  HTTPAnswer storebag;
+  storebag.body = signedStorebag(key, payload.share());
+  serve(storebag);
+  for (const auto& test : cases) {
+    SCOPED_TRACE(test.setting);
+    harness.setPreference("environmentType", test.setting);
+    harness.startDaemon();
+    EXPECT_EQ(RoadClient(harness).enabled.has_value(), test.section.has_value());
+    EXPECT_EQ(harness.stopDaemon(), 0);
+    if (test.section) {
+      ASSERT_FALSE(requests("POST").empty());
+      EXPECT_EQ(requests("POST").back().path(), *test.section);
+    }
+    EXPECT_NE(withoutTime(harness.daemon().errors()).find(test.lines), std::string::npos);
+  }
+}
+
+TEST_F(DaemonProcess, AsksOnlyForWhatIsNewer) {
+  const std::string time = "Tue,  24 Nov 2026 20:00:00 GMT+1";  // sent back as it came
+  HTTPAnswer storebag;
+  storebag.headers = {{"Last-Modified", time}, {"Cache-Control", "public, max-age=600"}};
+  storebag.body = signedStorebag(key, Dictionary{{"refresh_cycle", 0}, {"release", section("/post")}});
+  serve(storebag);
+  harness.startDaemon();
+  EXPECT_EQ(RoadClient(harness).enabled, BackendNames{"httpPost"});
+  HTTPAnswer unchanged;
+  unchanged.status = 304;
+  unchanged.headers = {{"Last-Modified", "Wed, 25 Nov 2026 20:00:00 GMT"}, {"Cache-Control", "max-age=600"}};
+  serve(unchanged);
+  for (int i = 0; i < 2; ++i) EXPECT_EQ(RoadClient(harness).enabled, BackendNames{"httpPost"});
+  auto fetches = requests("GET");
+  ASSERT_EQ(fetches.size(), 2u) << "then it is fresh for 600 s";
+  EXPECT_FALSE(fetches[0].header("If-Modified-Since"));
+  EXPECT_EQ(fetches[1].header("If-Modified-Since"), time);
+  for (const auto& fetch : fetches) {
+    EXPECT_EQ(fetch.target, "/bags/zelko?version=7.4");
+    EXPECT_EQ(fetch.header("User-Agent"), "veskreportingd/" + kVersion);
+  }
+  EXPECT_EQ(harness.stopDaemon(), 0);
+}
+
+TEST_F(DaemonProcess, OwnsItsSocketAndStopsOnASignal) {
+  harness.startDaemon();
+  const pid_t pid = harness.daemon().pid();
+  EXPECT_GE(::getpriority(PRIO_PROCESS, static_cast<id_t>(pid)), 5);
+  for (const auto& task : std::filesystem::directory_iterator("/proc/" + std::to_string(pid) + "/task")) {
+    EXPECT_EQ(::sched_getscheduler(std::stoi(task.path().filename())), SCHED_BATCH);
+    const std::string status = harness.root.read((task.path() / "status").string());
+    EXPECT_NE(status.find("\nNoNewPrivs:\t1\nSeccomp:\t2\n"), std::string::npos) << "in the sandbox";
+  }
+  rlimit descriptors{};
+  EXPECT_EQ(::prlimit(pid, RLIMIT_NOFILE, nullptr, &descriptors), 0);
+  EXPECT_EQ(descriptors.rlim_cur, descriptors.rlim_max);
+  ChildProcess second({kDaemon, "--root", harness.root.path().string()});
+  EXPECT_EQ(second.wait(), 1);
+  EXPECT_EQ(withoutTime(second.errors()),
+            "<3> main: Another daemon answers on " + harness.socketPath() + ": Address already in use\n");
+  EXPECT_EQ(harness.stopDaemon(), 0);
+  const std::string log = harness.daemon().errors();
+  EXPECT_TRUE(withoutTime(log).starts_with("<6> main: Listener resumes with sandbox, start loop.\n")) << log;
+  EXPECT_NE(log.find(" veskreportingd[" + std::to_string(pid) + "] <6>"), std::string::npos);
+}
+
+TEST_F(DaemonProcess, WithoutItsSandboxSaysSoAndEndsWhenIdle) {
+  harness.startDaemon({"--no-sandbox", "--idle-exit", "1", "--log-level", "6"});
+  EXPECT_EQ(harness.daemon().wait(), 0);
+  EXPECT_EQ(withoutTime(harness.daemon().errors()),
+            "<6> main: Listener resumes without sandbox, start loop.\n");
+}
+
+TEST_F(DaemonProcess, TellsItsManagerHowItGoesAndWhatWasLost) {
+  FileDescriptor manager(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+  UnixSocketAddress address(harness.root / "notify");
+  ASSERT_EQ(::bind(manager.get(), address.get(), address.size()), 0);
+  const auto notification = [&] {
+    char text[64];
+    const ssize_t size = ::recv(manager.get(), text, sizeof text, 0);
+    return std::string(text, static_cast<std::size_t>(std::max<ssize_t>(size, 0)));
+  };
+  ::setenv("NOTIFY_SOCKET", (harness.root / "notify").c_str(), 1);
+  harness.startDaemon();
+  ::unsetenv("NOTIFY_SOCKET");
+  EXPECT_EQ(notification(), "READY=1");
+  // A client type without a storebag has no backend.
+  RoadClient client(harness, {{kVeskReportingSessionInfoClientType, 4}});
+  EXPECT_TRUE(client.reporting.sendMessageAndWait(message(3)));
+  EXPECT_EQ(harness.stopDaemon(), 0);
+  EXPECT_EQ(notification(), "STOPPING=1");
+  const std::string log = withoutTime(harness.daemon().errors());
+  EXPECT_TRUE(log.ends_with("\n<6> main: Lost since the start: session no-backend 1\n")) << log;
+}
+
+}  // namespace
+}  // namespace vesk::test
