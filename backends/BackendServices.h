@@ -9,6 +9,8 @@
 #include <string>
 
 #include "backends/DashboardLinger.h"
+#include "backends/HeldBytes.h"
+#include "backends/RefusedPosts.h"
 #include "backends/UploadGate.h"
 #include "platform/http/HTTPClient.h"
 #include "platform/queue/TimedQueue.h"
@@ -39,6 +41,10 @@ struct BackendServices {
   std::shared_ptr<PowerLog> powerLog = nullptr;
   /// How many dashboards may outlive their sessions.
   std::shared_ptr<DashboardLinger> dashboardLinger = std::make_shared<DashboardLinger>(kMaximumLingering);
+  /// How many bytes of events may be held back.
+  std::shared_ptr<HeldBudget> heldBudget = std::make_shared<HeldBudget>();
+  /// What servers refused.
+  std::shared_ptr<RefusedPosts> refusedPosts = std::make_shared<RefusedPosts>();
 };
 
 }  // namespace vesk

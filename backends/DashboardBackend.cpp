@@ -142,9 +142,26 @@ DashboardBackend::~DashboardBackend() {
   }
 }
 
-void DashboardBackend::cleanup() { _delivery->cleanup(); }
+DashboardHeader DashboardBackend::headerFor(const timeval& timestamp, std::uint16_t method,
+                                            std::uint16_t respCode, std::uint16_t eventID) const {
+  DashboardHeader header;
+  header.subsecond = static_cast<std::uint8_t>(timestamp.tv_usec / kMicrosecondsPerStep);
+  header.seconds = static_cast<std::uint32_t>(timestamp.tv_sec);
+  header.method = method;
+  header.respCode = respCode;
+  header.eventID = eventID;
+  header.isReliable = _delivery->isReliable();
+  header.isWithoutProfile = !_usingProfile;
+  MutexLock lock(_mutex);
+  header.libraryVersionMajor = _selfVersionMajor;
+  header.clientType = static_cast<std::uint8_t>(_compType);
+  header.sessionID = _sessionID;
+  header.clientVersion = _clientVersion;
+  std::copy_n(_udid.begin(), std::min(_udid.size(), header.deviceID.size()), header.deviceID.begin());
+  return header;
+}
 
-std::optional<std::string> DashboardBackend::sendMessageLocked(const std::optional<Dictionary>& payload,
+std::optional<std::string> DashboardBackend::sendMessageInTurn(const std::optional<Dictionary>& payload,
                                                                const timeval& timestamp, std::uint16_t method,
                                                                std::uint16_t respCode, std::uint16_t eventID,
                                                                std::int32_t) {
@@ -153,19 +170,7 @@ std::optional<std::string> DashboardBackend::sendMessageLocked(const std::option
     VESK_LOG_ERROR("DashboardBackend(sendMessage): can't malloc.");
     return std::nullopt;
   }
-  DashboardHeader header;
-  header.libraryVersionMajor = _selfVersionMajor;
-  header.clientType = static_cast<std::uint8_t>(_compType);
-  header.subsecond = static_cast<std::uint8_t>(timestamp.tv_usec / kMicrosecondsPerStep);
-  header.seconds = static_cast<std::uint32_t>(timestamp.tv_sec);
-  header.sessionID = _sessionID;
-  header.clientVersion = _clientVersion;
-  header.method = method;
-  header.respCode = respCode;
-  std::copy_n(_udid.begin(), std::min(_udid.size(), header.deviceID.size()), header.deviceID.begin());
-  header.eventID = eventID;
-  header.isReliable = _delivery->isReliable();
-  header.isWithoutProfile = !_usingProfile;
+  DashboardHeader header = headerFor(timestamp, method, respCode, eventID);
   const std::size_t textLength =
       payload ? writePayloadText(*payload, buffer->data() + kDashboardHeaderSize, kDashboardTextArea) : 0;
   header.length = static_cast<std::uint16_t>(kDashboardHeaderSize + textLength);

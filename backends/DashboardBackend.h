@@ -27,7 +27,6 @@ class DashboardBackend final : public VeskReportingBackend {
                                                   const BackendServices& services);
   ~DashboardBackend() override;
 
-  void cleanup() override;
   /// Uploads `logData` as keyed archive and announces where the server put it; waits for its turn among the
   /// uploads (UploadGate.h) and then for the server, 120 s at most, without any lock.
   bool uploadLogData(const List& logData) override;
@@ -35,10 +34,12 @@ class DashboardBackend final : public VeskReportingBackend {
   bool isReliable() const noexcept { return _delivery->isReliable(); }
 
  protected:
-  std::optional<std::string> sendMessageLocked(const std::optional<Dictionary>& payload,
+  std::optional<std::string> sendMessageInTurn(const std::optional<Dictionary>& payload,
                                                const timeval& timestamp, std::uint16_t method,
                                                std::uint16_t respCode, std::uint16_t eventID,
-                                               std::int32_t flag) override VESK_REQUIRES(_mutex);
+                                               std::int32_t flag) override VESK_REQUIRES(_sendMutex)
+      VESK_EXCLUDES(_mutex);
+  void cleanupInTurn() override VESK_REQUIRES(_sendMutex) { _delivery->cleanup(); }
 
  private:
   DashboardBackend(const std::string& name, const std::optional<Dictionary>& profile,
@@ -51,6 +52,10 @@ class DashboardBackend final : public VeskReportingBackend {
                                                            std::uint16_t serverPort,
                                                            const std::optional<Text>& productFamily,
                                                            const BackendServices& services);
+
+  /// All but the length.
+  DashboardHeader headerFor(const timeval& timestamp, std::uint16_t method, std::uint16_t respCode,
+                            std::uint16_t eventID) const VESK_EXCLUDES(_mutex);
 
   // Constant after construction.
   const bool _usingProfile;

@@ -1,18 +1,15 @@
 // The events that an HTTPS backend holds for its next post.
 #pragma once
 
-#include <atomic>
 #include <cstddef>
 #include <deque>
-#include <memory>
 #include <optional>
+#include <utility>
 
+#include "backends/HeldBytes.h"
 #include "platform/values/Value.h"
 
 namespace vesk {
-
-/// Bytes of events that are held back, of all backends of a session.
-using HeldBytes = std::shared_ptr<std::atomic<std::size_t>>;
 
 /// Oldest first. What its events take is part of the session's account from when they are added until they
 /// are dropped or the batch is destroyed. Not thread-safe, but for the account.
@@ -31,14 +28,24 @@ class EventBatch {
 
   void add(MutableDictionary event);
 
-  /// Drops the oldest while the account is above `bound` bytes, but not the newest; returns how many.
-  std::size_t dropOldest(std::size_t bound);
+  struct Dropped {
+    std::size_t count = 0;
+    const HeldAccount* account = nullptr;  ///< the one above its limit; the session's or a wider one
+    std::size_t bound = 0;                 ///< bytes that it was held to
+  };
+
+  /// Where an account is above its limit, drops the oldest until it is an eighth below; the newest one goes
+  /// only for the sake of others than the session.
+  Dropped dropOldest();
 
   /// Adds what is not empty to the events that came before it was known: its first key tells which have it
-  /// already. Where the account would come above `bound`, the older ones are dropped; returns how many.
-  std::size_t addUserInfo(const Dictionary& userInfo, std::size_t bound);
+  /// already. Where an account would come above twice its limit, the older ones are dropped.
+  Dropped addUserInfo(const Dictionary& userInfo);
 
   void setSessionID(const std::optional<Text>& sessionID);
+
+  /// True once: the line about dropped events is written once a batch.
+  bool beginsToDrop() noexcept { return !std::exchange(_isDropping, true); }
 
   std::size_t size() const noexcept { return _events.size(); }
   Events& events() noexcept { return _events; }
@@ -48,6 +55,7 @@ class EventBatch {
 
   const HeldBytes _account;
   Events _events;
+  bool _isDropping = false;
 };
 
 }  // namespace vesk

@@ -50,8 +50,7 @@ HTTPSPostBackend::HTTPSPostBackend(const std::string& name, const Dictionary& pr
 HTTPSPostBackend::~HTTPSPostBackend() {
   MutexLock lock(_mutex);
   // Events that never found the backend enabled leave no other trace.
-  const std::size_t unsent = endBatch();
-  if (unsent > 0) _services.counters.count(_name, DropReason::NeverEnabled, unsent);
+  if (holdsEvents()) _services.counters.count(_name, DropReason::NeverEnabled, _batchedEvents->size());
 }
 
 std::optional<std::string> HTTPSPostBackend::postURL() const {
@@ -66,7 +65,7 @@ void HTTPSPostBackend::setPostURL(const std::optional<std::string>& url) {
 
 // --- One message
 
-std::optional<std::string> HTTPSPostBackend::sendMessageLocked(const std::optional<Dictionary>& payload,
+std::optional<std::string> HTTPSPostBackend::sendMessageInTurn(const std::optional<Dictionary>& payload,
                                                                const timeval& timestamp, std::uint16_t method,
                                                                std::uint16_t respCode, std::uint16_t eventID,
                                                                std::int32_t flag) {
@@ -74,27 +73,51 @@ std::optional<std::string> HTTPSPostBackend::sendMessageLocked(const std::option
     _services.counters.count(_name, DropReason::StateDisabled);
     return std::nullopt;
   }
-  MutableDictionary event =
-      respCode == kSessionTypeStop
-          ? createEventDictfromPayload(payloadWithStopEntries(payload), timestamp, method, respCode, eventID)
-          : createEventDictfromPayload(payload, timestamp, method, respCode, eventID);
-  prepareEventForMessage(event);
-
-  if (isOverridingSampling(flag)) {
-    std::int32_t expected = BackendStateOverride;  // a completion may just switch the backend off
-    _state.compare_exchange_strong(expected, BackendStateEnabled);
+  // The event gets its place before the lock is released: what relatives change while a body is built then
+  // reaches it among the held events.
+  PostToBuild earlier;
+  PostToBuild own;
+  bool batchEvents = false;
+  bool requireUserInfo = false;
+  {
+    MutexLock lock(_mutex);
+    MutableDictionary event = respCode == kSessionTypeStop
+                                  ? createEventDictfromPayload(payloadWithStopEntries(payload), timestamp,
+                                                               method, respCode, eventID)
+                                  : createEventDictfromPayload(payload, timestamp, method, respCode, eventID);
+    prepareEventForMessage(event);
+    if (isOverridingSampling(flag)) {
+      std::int32_t expected = BackendStateOverride;  // a completion may just switch the backend off
+      _state.compare_exchange_strong(expected, BackendStateEnabled);
+    }
+    batchEvents = _batchEvents;
+    requireUserInfo = _requireUserInfo;
+    if (mustHold(flag)) {
+      earlier = batchEvent(std::move(event));
+    } else {
+      earlier = takeBatchBeforeSingleEvent();
+      own = takeSingleEvent(std::move(event), method, respCode, flag);
+    }
   }
-  std::int32_t currentState = state();
-  bool hold =
+  if (earlier) buildAndPost(std::move(earlier));
+  if (!own) {
+    boundHeldEvents();
+    return std::nullopt;
+  }
+  VESK_LOG_DEBUG("HTTPSPostBackend(sendMessage): Sending %d, %d, %d", state(), batchEvents, requireUserInfo);
+  return buildAndPost(std::move(own));
+}
+
+bool HTTPSPostBackend::mustHold(std::int32_t flag) const {
+  const std::int32_t currentState = state();
+  const bool hold =
       !isRealtime(flag) && (currentState == BackendStatePending || currentState == BackendStateOverride ||
                             _batchEvents || (_requireUserInfo && !_userInfoDict));
   if (hold) {
     VESK_LOG_DEBUG("HTTPSPostBackend(sendMessage): Batching %d, %d, %d", currentState, _batchEvents,
                    _requireUserInfo);
-    batchEvent(std::move(event));
-    return std::nullopt;
   }
-  return postNow(std::move(event), method, respCode, flag);
+  return hold;
 }
 
 std::optional<Dictionary> HTTPSPostBackend::payloadWithStopEntries(
@@ -108,105 +131,118 @@ std::optional<Dictionary> HTTPSPostBackend::payloadWithStopEntries(
   }
   MutableDictionary extended(*payload, 4);
   extended.set(Text::literal("Opt"), _dnuType);
-  extended.set(Text::literal("SamplingThreshold"), _samplingThreshold.value_or(Value(-1)));
+  extended.set(Text::literal("SamplingThreshold"), samplingThreshold().value_or(Value(-1)));
   extended.set(Text::literal("OverrideSampling"), _overrideSampling.value_or(Value(-1)));
   extended.set(Text::literal("Batch"), _batchEvents ? 1 : 0);
   return extended.share();
 }
 
-std::optional<std::string> HTTPSPostBackend::postNow(MutableDictionary event, std::uint16_t method,
-                                                     std::uint16_t respCode, std::int32_t flag) {
-  if (state() == BackendStateEnabled && !_batchEvents && _batchedEvents) {
-    VESK_LOG_DEBUG(
-        "HTTPSPostBackend(sendMessage): Backend has changed its state to 'Enabled', batching is not "
-        "requested and some events have already been batched. Forcing Flush here to keep events in order.");
-    flushMessagesLocked();
-  }
-  VESK_LOG_DEBUG("HTTPSPostBackend(sendMessage): Sending %d, %d, %d", state(), _batchEvents,
-                 _requireUserInfo);
-  Events single;
-  single.push_back({std::move(event), 0});
-  std::optional<std::string> pretty;
-  auto body = createMessageForPostAndLogging(single, &pretty);
-  if (!body) {
-    _services.counters.count(_name, DropReason::BodyNotBuilt);
-    return std::nullopt;
-  }
-  postJSONMessage(std::move(*body), flag, method, respCode, 1);
-  return pretty;
-}
-
 // --- Batches
 
-void HTTPSPostBackend::batchEvent(MutableDictionary event) {
+HTTPSPostBackend::PostToBuild HTTPSPostBackend::batchEvent(MutableDictionary event) {
   const Value* methodValue = event.find("_method");
   std::int64_t method = methodValue ? methodValue->asInteger().value_or(0) : 0;
   std::int32_t count = _eventMethodCounts[method];
+  PostToBuild full;
   if (count > _eventThreshold) {
     VESK_LOG_DEBUG(
         "HTTPSPostBackend(batchEvent): Flushing all batched events as we reached event threshold for method "
         "%d",
         static_cast<int>(method));
-    flushMessagesLocked();
+    full = takeBatch();
     count = 0;
   }
-  if (!_batchedEvents) _batchedEvents.emplace(_heldBytes);
+  if (!_batchedEvents) _batchedEvents = std::make_unique<EventBatch>(_heldBytes);
   _batchedEvents->add(std::move(event));
   _eventMethodCounts[method] = count + 1;
-  if (*_heldBytes > kMaximumHeldBytes) boundHeldEvents();
+  return full;
 }
 
-// Enabled, a full batch is simply sent. Otherwise nobody may be told yet, and the oldest events have to go:
-// an eighth at once, or the session's other backends would be at the bound with each of their events.
+bool HTTPSPostBackend::holdsEvents() const { return _batchedEvents && _batchedEvents->size() > 0; }
+
+// Enabled, a full batch is simply sent. Otherwise nobody may be told yet, and the oldest events have to go.
 void HTTPSPostBackend::boundHeldEvents() {
-  if (state() == BackendStateEnabled) flushMessagesLocked();
-  if (!_batchedEvents) return;
-  noteDropped(_batchedEvents->dropOldest(kMaximumHeldBytes / 8 * 7), kMaximumHeldBytes);
-  if (_eventMethodCounts.size() > kMostMethods) _eventMethodCounts.clear();  // user info may name any number
+  if (!_heldBytes->exceeded()) return;
+  PostToBuild full;
+  {
+    MutexLock lock(_mutex);
+    if (state() == BackendStateEnabled) full = takeBatch();
+    if (_batchedEvents) noteDropped(*_batchedEvents, _batchedEvents->dropOldest());
+    if (_eventMethodCounts.size() > kMostMethods)
+      _eventMethodCounts.clear();  // user info may name any number
+  }
+  if (full) buildAndPost(std::move(full));
 }
 
-void HTTPSPostBackend::noteDropped(std::size_t count, std::size_t bound) {
-  if (count == 0) return;
-  _services.counters.count(_name, DropReason::OverBound, count);
-  if (std::exchange(_droppingBurst, true)) return;
-  VESK_LOG_WARNING(
-      "HTTPSPostBackend(batchEvent): backend %s holds more than %zu bytes: dropping its oldest events",
-      _name.c_str(), bound);
+void HTTPSPostBackend::noteDropped(EventBatch& batch, const EventBatch::Dropped& dropped) const {
+  if (dropped.count == 0) return;
+  _services.counters.count(_name, DropReason::OverBound, dropped.count);
+  if (!batch.beginsToDrop()) return;
+  if (dropped.account->isOfSession()) {
+    VESK_LOG_WARNING(
+        "HTTPSPostBackend(batchEvent): backend %s holds more than %zu bytes: dropping its oldest events",
+        _name.c_str(), dropped.bound);
+  } else {
+    VESK_LOG_WARNING(
+        "HTTPSPostBackend(batchEvent): %s holds more than %zu bytes: dropping the oldest events of backend "
+        "%s",
+        dropped.account->holder().c_str(), dropped.bound, _name.c_str());
+  }
 }
 
-/// How many events it had.
-std::size_t HTTPSPostBackend::endBatch() {
-  const std::size_t count = _batchedEvents ? _batchedEvents->size() : 0;
-  _batchedEvents.reset();
-  _eventMethodCounts.clear();
-  _droppingBurst = false;
-  return count;
+std::optional<std::string> HTTPSPostBackend::flushMessagesInTurn() {
+  PostToBuild held;
+  {
+    MutexLock lock(_mutex);
+    held = takeBatch();
+  }
+  if (!held) return std::nullopt;
+  return buildAndPost(std::move(held));
 }
 
-std::optional<std::string> HTTPSPostBackend::flushMessagesLocked() {
-  if (!_batchedEvents || state() != BackendStateEnabled || (_requireUserInfo && !_userInfoDict)) {
-    return std::nullopt;
+// --- Taking events out to be posted
+
+HTTPSPostBackend::PostToBuild HTTPSPostBackend::takeBatch() {
+  if (!holdsEvents() || state() != BackendStateEnabled || (_requireUserInfo && !_userInfoDict)) {
+    return nullptr;
   }
   VESK_LOG_DEBUG("HTTPSPostBackend(flushMessages): called");
-  addUserInfoToHeldEvents();
-  std::optional<std::string> pretty;
-  auto body = createMessageForPostAndLogging(_batchedEvents->events(), &pretty);
-  const std::size_t eventCount = endBatch();
-  if (!body) {
-    _services.counters.count(_name, DropReason::BodyNotBuilt, eventCount);
-    return std::nullopt;
+  PostToBuild post = makePost(std::move(_batchedEvents), 0, std::nullopt, std::nullopt);
+  _eventMethodCounts.clear();
+  if (_userInfoDict) {
+    MutableDictionary filtered(*_userInfoDict);
+    _filters.filterEvent(filtered);
+    if (!filtered.empty()) post->lateUserInfo = filtered.share();
   }
-  postJSONMessage(std::move(*body), 0, std::nullopt, std::nullopt, eventCount);
-  return pretty;
+  return post;
 }
 
-// Events held before the user info arrived get it now.
-void HTTPSPostBackend::addUserInfoToHeldEvents() {
-  if (!_userInfoDict) return;
-  MutableDictionary filtered(*_userInfoDict);
-  _filters.filterEvent(filtered);
-  if (filtered.empty()) return;
-  noteDropped(_batchedEvents->addUserInfo(filtered.share(), kMaximumFlushBytes), kMaximumFlushBytes);
+HTTPSPostBackend::PostToBuild HTTPSPostBackend::takeBatchBeforeSingleEvent() {
+  if (state() != BackendStateEnabled || _batchEvents || !holdsEvents()) return nullptr;
+  VESK_LOG_DEBUG(
+      "HTTPSPostBackend(sendMessage): Backend has changed its state to 'Enabled', batching is not "
+      "requested and some events have already been batched. Forcing Flush here to keep events in order.");
+  return takeBatch();
+}
+
+HTTPSPostBackend::PostToBuild HTTPSPostBackend::takeSingleEvent(MutableDictionary event, std::uint16_t method,
+                                                                std::uint16_t respCode, std::int32_t flag) {
+  auto single = std::make_unique<EventBatch>(_heldBytes);
+  single->add(std::move(event));
+  return makePost(std::move(single), flag, method, respCode);
+}
+
+HTTPSPostBackend::PostToBuild HTTPSPostBackend::makePost(std::unique_ptr<EventBatch> events,
+                                                         std::int32_t flag,
+                                                         std::optional<std::uint16_t> method,
+                                                         std::optional<std::uint16_t> responseCode) const {
+  auto post = std::make_unique<Post>();
+  post->events = std::move(events);
+  post->url = isRealtime(flag) ? _realtimePostURL : _postURL;
+  post->clientID = clientIdentifier();
+  post->headers = postHeaders(method, responseCode);
+  post->isPrintable = _dnuType == 0 && _dnuEnabled;
+  return post;
 }
 
 void HTTPSPostBackend::setCorrelatedSessionIDLocked(const std::optional<Text>& sessionID) {

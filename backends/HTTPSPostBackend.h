@@ -20,12 +20,6 @@ namespace vesk {
 /// HTTPSPostRequest.cpp (JSON body and post).
 class HTTPSPostBackend final : public VeskReportingBackend {
  public:
-  /// Bytes of events that the backends of one session may hold while reporting is not enabled. Above it the
-  /// oldest are dropped, and counted.
-  static constexpr std::size_t kMaximumHeldBytes = std::size_t{16} << 20;
-  /// The same while they are sent and get user info that came later than they did.
-  static constexpr std::size_t kMaximumFlushBytes = 2 * kMaximumHeldBytes;
-
   /// Nothing when profile or product family are missing, or when the profile has no `clients`.
   static std::shared_ptr<HTTPSPostBackend> create(const std::string& name,
                                                   const std::optional<Dictionary>& profile,
@@ -41,19 +35,32 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   std::int32_t updateBackendState();
 
  protected:
-  void updateStateLocked() override VESK_REQUIRES(_mutex);
-  std::optional<std::string> sendMessageLocked(const std::optional<Dictionary>& payload,
+  std::optional<std::string> sendMessageInTurn(const std::optional<Dictionary>& payload,
                                                const timeval& timestamp, std::uint16_t method,
                                                std::uint16_t respCode, std::uint16_t eventID,
-                                               std::int32_t flag) override VESK_REQUIRES(_mutex);
-  std::optional<std::string> flushMessagesLocked() override VESK_REQUIRES(_mutex);
+                                               std::int32_t flag) override VESK_REQUIRES(_sendMutex)
+      VESK_EXCLUDES(_mutex);
+  std::optional<std::string> flushMessagesInTurn() override VESK_REQUIRES(_sendMutex) VESK_EXCLUDES(_mutex);
+  void updateStateLocked() override VESK_REQUIRES(_mutex);
   void setCorrelatedSessionIDLocked(const std::optional<Text>& sessionID) override VESK_REQUIRES(_mutex);
 
  private:
   /// Messages of one method that a batch takes beyond the first.
   static constexpr std::int32_t kDefaultEventThreshold = 49;
 
-  using Events = EventBatch::Events;
+  using Headers = std::vector<std::pair<std::string, std::string>>;
+
+  /// Events that were taken to be posted, and all that their post is made of: later changes of the backend
+  /// don't concern them.
+  struct Post {
+    std::unique_ptr<EventBatch> events;
+    std::optional<Dictionary> lateUserInfo;  ///< filtered, not empty; for events from before it was known
+    std::optional<std::string> url;
+    std::string clientID;
+    Headers headers;
+    bool isPrintable = false;  ///< the local message log may get its text
+  };
+  using PostToBuild = std::unique_ptr<Post>;
 
   HTTPSPostBackend(const std::string& name, const Dictionary& profile, const Text& productFamily,
                    const BackendServices& services);
@@ -82,23 +89,28 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   std::optional<Dictionary> payloadWithStopEntries(const std::optional<Dictionary>& payload) const
       VESK_REQUIRES(_mutex);
   void prepareEventForMessage(MutableDictionary& event) const VESK_REQUIRES(_mutex);
-  void batchEvent(MutableDictionary event) VESK_REQUIRES(_mutex);
-  void boundHeldEvents() VESK_REQUIRES(_mutex);
-  void noteDropped(std::size_t count, std::size_t bound) VESK_REQUIRES(_mutex);
-  void addUserInfoToHeldEvents() VESK_REQUIRES(_mutex);
-  std::size_t endBatch() VESK_REQUIRES(_mutex);
-  std::optional<std::string> postNow(MutableDictionary event, std::uint16_t method, std::uint16_t respCode,
-                                     std::int32_t flag) VESK_REQUIRES(_mutex);
+  bool mustHold(std::int32_t flag) const VESK_REQUIRES(_mutex);
+  bool holdsEvents() const VESK_REQUIRES(_mutex);
+  PostToBuild batchEvent(MutableDictionary event) VESK_REQUIRES(_sendMutex, _mutex);
+  void boundHeldEvents() VESK_REQUIRES(_sendMutex) VESK_EXCLUDES(_mutex);
+  void noteDropped(EventBatch& batch, const EventBatch::Dropped& dropped) const;
 
-  // Body and post.
-  std::string clientIdentifier() const VESK_REQUIRES(_mutex);
-  std::optional<std::string> createMessageForPostAndLogging(
-      Events& events, std::optional<std::string>* prettyJsonString) const VESK_REQUIRES(_mutex);
-  void postJSONMessage(std::string json, std::int32_t flag, std::optional<std::uint16_t> method,
-                       std::optional<std::uint16_t> responseCode, std::size_t eventCount)
+  // Taking events out to be posted; null: there are none, or they may not go yet.
+  PostToBuild takeBatch() VESK_REQUIRES(_mutex);
+  PostToBuild takeBatchBeforeSingleEvent() VESK_REQUIRES(_mutex);
+  PostToBuild takeSingleEvent(MutableDictionary event, std::uint16_t method, std::uint16_t respCode,
+                              std::int32_t flag) VESK_REQUIRES(_sendMutex, _mutex);
+  PostToBuild makePost(std::unique_ptr<EventBatch> events, std::int32_t flag,
+                       std::optional<std::uint16_t> method, std::optional<std::uint16_t> responseCode) const
       VESK_REQUIRES(_mutex);
-  std::vector<std::pair<std::string, std::string>> postHeaders(
-      std::optional<std::uint16_t> method, std::optional<std::uint16_t> responseCode) const
+
+  // Body and post: without _mutex, since a body may be large.
+  std::optional<std::string> buildAndPost(PostToBuild post) VESK_REQUIRES(_sendMutex) VESK_EXCLUDES(_mutex);
+  std::optional<std::string> createMessageForPostAndLogging(
+      Post& post, std::optional<std::string>* prettyJsonString) const;
+  void postJSONMessage(Post post, std::string json, std::size_t eventCount);
+  std::string clientIdentifier() const VESK_REQUIRES(_mutex);
+  Headers postHeaders(std::optional<std::uint16_t> method, std::optional<std::uint16_t> responseCode) const
       VESK_REQUIRES(_mutex);
   void postCompleted(const HTTPResult& result, std::size_t eventCount);
 
@@ -114,9 +126,7 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   // Whether they come from the preferences.
   bool _useDefaultPostURL VESK_GUARDED_BY(_mutex) = false;
   bool _useDefaultRealtimePostURL VESK_GUARDED_BY(_mutex) = false;
-  std::optional<EventBatch> _batchedEvents VESK_GUARDED_BY(_mutex);
-  // The line about dropped events is written once a batch.
-  bool _droppingBurst VESK_GUARDED_BY(_mutex) = false;
+  std::unique_ptr<EventBatch> _batchedEvents VESK_GUARDED_BY(_mutex);
   EventFilters _filters VESK_GUARDED_BY(_mutex);
   // 0 consent respected; overridden: 1 without it, 2 with it.
   std::int32_t _dnuType VESK_GUARDED_BY(_mutex) = 0;

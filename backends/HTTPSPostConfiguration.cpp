@@ -165,10 +165,11 @@ bool HTTPSPostBackend::placeAndDeviceAllow(const Dictionary& entry) {
 }
 
 std::int32_t HTTPSPostBackend::stateForSampling(const Dictionary& entry) {
-  _samplingThreshold = profileNumber(_name, entry, "sampling_threshold");
-  if (!_samplingThreshold) return BackendStateDisabled;
+  const auto threshold = profileNumber(_name, entry, "sampling_threshold");
+  setSamplingThreshold(threshold);
+  if (!threshold) return BackendStateDisabled;
   double draw = samplingFactor();
-  if (draw <= *_samplingThreshold->asDouble()) return BackendStateEnabled;
+  if (draw <= *threshold->asDouble()) return BackendStateEnabled;
   _overrideSampling = profileNumber(_name, entry, "override_sampling");
   if (!_overrideSampling && entry.contains("override_sampling")) return BackendStateDisabled;
   if (!_overrideSampling || draw <= *_overrideSampling->asDouble()) return BackendStateOverride;

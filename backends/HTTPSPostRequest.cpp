@@ -54,11 +54,36 @@ std::string HTTPSPostBackend::clientIdentifier() const {
   return _dnuType == 0 ? _uuidRespectDnu : _uuidOverrideDnu;
 }
 
+std::optional<std::string> HTTPSPostBackend::buildAndPost(PostToBuild post) {
+  EventBatch& events = *post->events;
+  std::size_t eventCount = events.size();
+  try {
+    // Events held before the user info arrived get it now.
+    if (post->lateUserInfo) {
+      noteDropped(events, events.addUserInfo(*post->lateUserInfo));
+      eventCount = events.size();
+    }
+    std::optional<std::string> pretty;
+    auto body = createMessageForPostAndLogging(*post, &pretty);
+    post->events.reset();
+    if (body) {
+      postJSONMessage(std::move(*post), std::move(*body), eventCount);
+      return pretty;
+    }
+  } catch (...) {
+    // No memory for it, and the events are given up already.
+    _services.counters.count(_name, DropReason::BodyNotBuilt, eventCount);
+    throw;
+  }
+  _services.counters.count(_name, DropReason::BodyNotBuilt, eventCount);
+  return std::nullopt;
+}
+
 std::optional<std::string> HTTPSPostBackend::createMessageForPostAndLogging(
-    Events& events, std::optional<std::string>* prettyJsonString) const {
+    Post& post, std::optional<std::string>* prettyJsonString) const {
   double postTime = finiteOrMinusOne(secondsFromTimeval(timevalFrom(_services.clock.now())));
+  auto& events = post.events->events();
   for (auto& held : events) sanitize(held.event);
-  std::string clientId = clientIdentifier();
 
   auto serialize = [&](JSONStyle style) {
     constexpr std::size_t kExpectedEventSize = 768;
@@ -67,7 +92,7 @@ std::optional<std::string> HTTPSPostBackend::createMessageForPostAndLogging(
     writer.key("postTime");
     writer.number(postTime);
     writer.key("clientId");
-    writer.text(clientId);
+    writer.text(post.clientID);
     writer.key("events");
     writer.beginArray();
     for (const auto& held : events) writer.value(held.event);
@@ -77,14 +102,13 @@ std::optional<std::string> HTTPSPostBackend::createMessageForPostAndLogging(
   };
 
   auto body = serialize(JSONStyle::Compact);
-  if (body && prettyJsonString && _dnuType == 0 && _dnuEnabled)
-    *prettyJsonString = serialize(JSONStyle::Pretty);
+  if (body && prettyJsonString && post.isPrintable) *prettyJsonString = serialize(JSONStyle::Pretty);
   return body;
 }
 
-std::vector<std::pair<std::string, std::string>> HTTPSPostBackend::postHeaders(
-    std::optional<std::uint16_t> method, std::optional<std::uint16_t> responseCode) const {
-  std::vector<std::pair<std::string, std::string>> headers;
+HTTPSPostBackend::Headers HTTPSPostBackend::postHeaders(std::optional<std::uint16_t> method,
+                                                        std::optional<std::uint16_t> responseCode) const {
+  Headers headers;
   headers.reserve(10);
   if (_userInfoDict) {
     if (auto name = _userInfoDict->text(kVeskReportingUserInfoClientName)) {
@@ -104,21 +128,17 @@ std::vector<std::pair<std::string, std::string>> HTTPSPostBackend::postHeaders(
   return headers;
 }
 
-void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t flag,
-                                       std::optional<std::uint16_t> method,
-                                       std::optional<std::uint16_t> responseCode,
-                                       std::size_t eventCount) try {
-  const auto& url = isRealtime(flag) ? _realtimePostURL : _postURL;
-  if (!url) {
+void HTTPSPostBackend::postJSONMessage(Post post, std::string json, std::size_t eventCount) {
+  if (!post.url) {
     _services.counters.count(_name, DropReason::NoURL, eventCount);
     return;
   }
   HTTPRequest request;
   request.method = "POST";
-  request.url = *url;
+  request.url = std::move(*post.url);
   request.retry = HTTPRequest::Retry::UntilSent;
   request.owner = _user.load();
-  request.headers = postHeaders(method, responseCode);
+  request.headers = std::move(post.headers);
   auto compressed = gzipDeflate(json);
   bool sendCompressed = compressed && compressed->size() < json.size();
   request.body = sendCompressed ? std::move(*compressed) : std::move(json);
@@ -130,10 +150,6 @@ void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t flag,
   _services.http.start(std::move(request), [self, eventCount](const HTTPResult& result) {
     self->postCompleted(result, eventCount);
   });
-} catch (...) {
-  // No memory for it, and the batch is given up already.
-  _services.counters.count(_name, DropReason::BodyNotBuilt, eventCount);
-  throw;
 }
 
 void HTTPSPostBackend::postCompleted(const HTTPResult& result, std::size_t eventCount) {
@@ -145,6 +161,7 @@ void HTTPSPostBackend::postCompleted(const HTTPResult& result, std::size_t event
     if (status >= 200 && status <= 299) return;
     const auto reason = status == 0 ? DropReason::TransportError : DropReason::ServerRefused;
     _services.counters.count(_name, reason, eventCount);
+    if (status != 0) _services.refusedPosts->note(_name, status, eventCount);
     return;
   }
   VESK_LOG_INFO("postJSONMessage: backend %s disabled by server %ld return code", _name.c_str(), status);

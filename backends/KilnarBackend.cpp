@@ -19,7 +19,7 @@ std::shared_ptr<KilnarBackend> KilnarBackend::create(const std::string& name,
       new KilnarBackend(name, profile.value_or(Dictionary()), productFamily.value_or(Text()), services));
 }
 
-std::optional<std::string> KilnarBackend::sendMessageLocked(const std::optional<Dictionary>& payload,
+std::optional<std::string> KilnarBackend::sendMessageInTurn(const std::optional<Dictionary>& payload,
                                                             const timeval&, std::uint16_t method,
                                                             std::uint16_t respCode, std::uint16_t eventID,
                                                             std::int32_t) {

@@ -21,10 +21,11 @@ class KilnarBackend final : public VeskReportingBackend {
  private:
   using VeskReportingBackend::VeskReportingBackend;
 
-  std::optional<std::string> sendMessageLocked(const std::optional<Dictionary>& payload,
+  std::optional<std::string> sendMessageInTurn(const std::optional<Dictionary>& payload,
                                                const timeval& timestamp, std::uint16_t method,
                                                std::uint16_t respCode, std::uint16_t eventID,
-                                               std::int32_t flag) override VESK_REQUIRES(_mutex);
+                                               std::int32_t flag) override VESK_REQUIRES(_sendMutex)
+      VESK_EXCLUDES(_mutex);
 };
 
 }  // namespace vesk

@@ -56,9 +56,14 @@ VeskReportingBackend::VeskReportingBackend(const std::string& name, const Dictio
       _productFamily(productFamily),
       _services(services),
       _samplingFactor(nextSamplingDraw()),
-      _heldBytes(std::make_shared<std::atomic<std::size_t>>(0)) {}
+      _heldBytes(std::make_shared<HeldAccount>(HeldBudget::Limits().ofSession)) {}
 
 std::string VeskReportingBackend::convertIntoSHA256(std::string_view text) { return hexLower(sha256(text)); }
+
+void VeskReportingBackend::cleanup() {
+  MutexLock sending(_sendMutex);
+  cleanupInTurn();
+}
 
 void VeskReportingBackend::updateState() {
   MutexLock lock(_mutex);
@@ -68,12 +73,12 @@ void VeskReportingBackend::updateState() {
 std::optional<std::string> VeskReportingBackend::sendMessage(const std::optional<Dictionary>& payload,
                                                              const timeval& timestamp, std::uint16_t method,
                                                              std::uint16_t respCode, std::int32_t flag) {
-  MutexLock lock(_mutex);
+  MutexLock sending(_sendMutex);
   ++_eventID;
-  return sendMessageLocked(payload, timestamp, method, respCode, _eventID, flag);
+  return sendMessageInTurn(payload, timestamp, method, respCode, _eventID, flag);
 }
 
-std::optional<std::string> VeskReportingBackend::sendMessageLocked(const std::optional<Dictionary>&,
+std::optional<std::string> VeskReportingBackend::sendMessageInTurn(const std::optional<Dictionary>&,
                                                                    const timeval&, std::uint16_t,
                                                                    std::uint16_t, std::uint16_t,
                                                                    std::int32_t) {
@@ -81,8 +86,8 @@ std::optional<std::string> VeskReportingBackend::sendMessageLocked(const std::op
 }
 
 std::optional<std::string> VeskReportingBackend::flushMessages() {
-  MutexLock lock(_mutex);
-  return flushMessagesLocked();
+  MutexLock sending(_sendMutex);
+  return flushMessagesInTurn();
 }
 
 bool VeskReportingBackend::uploadFileAtPath(const std::string&, const std::string&) { return false; }
@@ -92,16 +97,6 @@ bool VeskReportingBackend::uploadLogData(const List&) { return false; }
 void VeskReportingBackend::setCorrelatedSessionID(const std::optional<std::string>& sessionID) {
   MutexLock lock(_mutex);
   setCorrelatedSessionIDLocked(textFrom(sessionID));
-}
-
-std::optional<Value> VeskReportingBackend::samplingThreshold() const {
-  MutexLock lock(_mutex);
-  return _samplingThreshold;
-}
-
-void VeskReportingBackend::setSamplingThreshold(const std::optional<Value>& threshold) {
-  MutexLock lock(_mutex);
-  _samplingThreshold = threshold;
 }
 
 std::optional<std::string> VeskReportingBackend::displayURL() const {
@@ -192,7 +187,7 @@ void VeskReportingBackend::setStartTimestamp(const timeval& timestamp) {
 }
 
 void VeskReportingBackend::setHeldBytes(HeldBytes heldBytes) {
-  MutexLock lock(_mutex);
+  MutexLock sending(_sendMutex);
   _heldBytes = std::move(heldBytes);
 }
 

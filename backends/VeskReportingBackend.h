@@ -13,6 +13,7 @@
 #include "backends/BackendServices.h"
 #include "backends/EventBatch.h"
 #include "platform/sync/Mutex.h"
+#include "platform/sync/Snapshot.h"
 #include "platform/values/Value.h"
 
 namespace vesk {
@@ -37,12 +38,19 @@ constexpr bool isOverridingSampling(std::int32_t flag) {
   return flag == MessageFlagOverrideSampling || flag == kMessageFlagBoth;
 }
 
-/// One destination of a session's messages. Its operations may be called from any thread. All but uploads and
-/// `cleanup` take the backend's own mutex and so do not overlap. Under it only leaves are locked (queues,
-/// counters, preferences), and no server is waited for; a subclass that calls foreign code releases it
-/// meanwhile and says so. Subclasses
-/// override the `…Locked` forms, which run under that mutex. Kept alive by its session and by posts that are
-/// under way.
+/// One destination of a session's messages. Its operations may be called from any thread.
+///
+/// Those that send (sendMessage, flushMessages, cleanup) do not overlap: each holds _sendMutex from the first
+/// look at the backend until its post or datagram is on its way, however long the body takes to build. So
+/// messages leave, are logged and are answered in the order in which they were numbered, and cleanup waits
+/// for a body that is under construction. They must not be called under the agent's monitor. Subclasses
+/// override the `…InTurn` forms.
+///
+/// All other operations, which relatives call under the monitor, take only _mutex. It is a leaf and held for
+/// moments: never while a body is built or compressed, while foreign code runs or while a server is waited
+/// for. Subclasses override the `…Locked` forms.
+///
+/// Kept alive by its session and by posts that are under way.
 class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBackend> {
  public:
   /// The backend that a storebag lists under `name`; nothing for a name that is not known, for a Wren backend
@@ -63,18 +71,19 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
   // --- What a session asks of every backend ---------------------------------------------------------------
 
   /// Ends the backend's activity, when its session ends or replaces it. Does nothing the second time.
-  virtual void cleanup() {}
+  void cleanup() VESK_EXCLUDES(_sendMutex, _mutex);
 
   /// Decides the state anew.
-  void updateState();
+  void updateState() VESK_EXCLUDES(_mutex);
 
   /// Numbers the message with the backend's next event ID (1 after construction, 0 after 65535) and sends it.
   /// Gives the text for the local message log, or nothing.
   std::optional<std::string> sendMessage(const std::optional<Dictionary>& payload, const timeval& timestamp,
-                                         std::uint16_t method, std::uint16_t respCode, std::int32_t flag);
+                                         std::uint16_t method, std::uint16_t respCode, std::int32_t flag)
+      VESK_EXCLUDES(_sendMutex, _mutex);
 
   /// Sends what is held back, where that is allowed; gives the text for the local message log, or nothing.
-  std::optional<std::string> flushMessages();
+  std::optional<std::string> flushMessages() VESK_EXCLUDES(_sendMutex, _mutex);
 
   /// `extensionToken` names the descriptor that the client passed. May block for a server's answer.
   virtual bool uploadFileAtPath(const std::string& path, const std::string& extensionToken);
@@ -96,8 +105,9 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
   std::int32_t hierarchy() const noexcept { return _hierarchy.load(); }
   void setHierarchy(std::int32_t hierarchy) noexcept { _hierarchy.store(hierarchy); }
 
-  std::optional<Value> samplingThreshold() const;
-  void setSamplingThreshold(const std::optional<Value>& threshold);
+  /// A number.
+  std::optional<Value> samplingThreshold() const { return _samplingThreshold.load(); }
+  void setSamplingThreshold(const std::optional<Value>& threshold) { _samplingThreshold.store(threshold); }
   std::optional<std::string> displayURL() const;
   std::optional<std::string> combinedSessionIDString() const;
   void setCombinedSessionIDString(const std::optional<std::string>& sessionID);
@@ -126,12 +136,16 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
   VeskReportingBackend(const std::string& name, const Dictionary& profile, const Text& productFamily,
                        const BackendServices& services);
 
-  virtual void updateStateLocked() VESK_REQUIRES(_mutex) { setState(BackendStateEnabled); }
-  virtual std::optional<std::string> sendMessageLocked(const std::optional<Dictionary>& payload,
+  virtual std::optional<std::string> sendMessageInTurn(const std::optional<Dictionary>& payload,
                                                        const timeval& timestamp, std::uint16_t method,
                                                        std::uint16_t respCode, std::uint16_t eventID,
-                                                       std::int32_t flag) VESK_REQUIRES(_mutex);
-  virtual std::optional<std::string> flushMessagesLocked() VESK_REQUIRES(_mutex) { return std::nullopt; }
+                                                       std::int32_t flag) VESK_REQUIRES(_sendMutex)
+      VESK_EXCLUDES(_mutex);
+  virtual std::optional<std::string> flushMessagesInTurn() VESK_REQUIRES(_sendMutex) VESK_EXCLUDES(_mutex) {
+    return std::nullopt;
+  }
+  virtual void cleanupInTurn() VESK_REQUIRES(_sendMutex) VESK_EXCLUDES(_mutex) {}
+  virtual void updateStateLocked() VESK_REQUIRES(_mutex) { setState(BackendStateEnabled); }
   virtual void setCorrelatedSessionIDLocked(const std::optional<Text>& sessionID) VESK_REQUIRES(_mutex) {
     _combinedSessionIDString = sessionID;
   }
@@ -147,9 +161,15 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
   std::atomic<std::int32_t> _hierarchy{0};
   std::atomic<double> _samplingFactor;
   std::atomic<uid_t> _user{UploadGate::kNobody};
+  Snapshot<std::optional<Value>> _samplingThreshold;  // a number
+
+  // Guarded by _sendMutex.
+  Mutex _sendMutex;
+  std::uint16_t _eventID VESK_GUARDED_BY(_sendMutex) = 0;
+  HeldBytes _heldBytes VESK_GUARDED_BY(_sendMutex);
 
   // Guarded by _mutex.
-  mutable Mutex _mutex;
+  mutable Mutex _mutex VESK_ACQUIRED_AFTER(_sendMutex);
   std::optional<Text> _productVersion VESK_GUARDED_BY(_mutex);
   std::optional<Text> _buildVersion VESK_GUARDED_BY(_mutex);
   std::optional<Text> _hardwareType VESK_GUARDED_BY(_mutex);
@@ -158,7 +178,6 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
   std::optional<Text> _combinedSessionIDString VESK_GUARDED_BY(_mutex);
   std::int32_t _compType VESK_GUARDED_BY(_mutex) = 0;
   std::uint16_t _clientVersion VESK_GUARDED_BY(_mutex) = 0;
-  std::uint16_t _eventID VESK_GUARDED_BY(_mutex) = 0;
   std::uint8_t _selfVersionMajor VESK_GUARDED_BY(_mutex) = 0;
   std::uint8_t _selfVersionMinor VESK_GUARDED_BY(_mutex) = 0;
   bool _isInternal VESK_GUARDED_BY(_mutex) = false;
@@ -168,8 +187,6 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
   // A copy: a post that is under way may outlive the session that owns the buffer it came from.
   std::string _udid VESK_GUARDED_BY(_mutex);
   std::optional<std::string> _displayURL VESK_GUARDED_BY(_mutex);
-  std::optional<Value> _samplingThreshold VESK_GUARDED_BY(_mutex);  // a number
-  HeldBytes _heldBytes VESK_GUARDED_BY(_mutex);
 };
 
 }  // namespace vesk

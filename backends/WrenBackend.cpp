@@ -111,7 +111,7 @@ void WrenBackend::makeAdaptor() noexcept {
   }
 }
 
-std::optional<std::string> WrenBackend::sendMessageLocked(const std::optional<Dictionary>& payload,
+std::optional<std::string> WrenBackend::sendMessageInTurn(const std::optional<Dictionary>& payload,
                                                           const timeval&, std::uint16_t method,
                                                           std::uint16_t respCode, std::uint16_t,
                                                           std::int32_t) {
@@ -122,12 +122,7 @@ std::optional<std::string> WrenBackend::sendMessageLocked(const std::optional<Di
     _services.counters.count(_name, DropReason::AdaptorFailed);
     return std::nullopt;
   }
-  // An adaptor may take its time. Whoever else wants something of this backend, the agent with its monitor
-  // among them, must not wait for that.
-  _mutex.unlock();
-  auto problem = forwardTo(forward, method, respCode, payload);
-  _mutex.lock();
-  if (problem) {
+  if (auto problem = forwardTo(forward, method, respCode, payload)) {
     VESK_LOG_ERROR("WrenBackend(sendMessage): Wren adaptor %s failed: %s", adaptorDescription(),
                    problem->c_str());
     _services.counters.count(_name, DropReason::AdaptorFailed);
@@ -138,7 +133,6 @@ std::optional<std::string> WrenBackend::sendMessageLocked(const std::optional<Di
 std::optional<std::string> WrenBackend::forwardTo(VeskWrenSendMessage forward, std::uint16_t method,
                                                   std::uint16_t respCode,
                                                   const std::optional<Dictionary>& payload) noexcept {
-  MutexLock lock(_adaptorMutex);
   return guarded([&] {
     const Dictionary dictionary = payload.value_or(Dictionary());
     WrenPayload view(dictionary);

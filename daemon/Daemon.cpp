@@ -32,9 +32,10 @@ IPCListener::Options listenerOptions(ServiceManager& serviceManager) {
   return options;
 }
 
-HTTPClient::Options httpOptions() {
+HTTPClient::Options httpOptions(BusyMarker& busyMarker) {
   HTTPClient::Options options;
   options.userAgent = "veskreportingd/" VESK_VERSION;
+  options.onIdle = [&busyMarker] { busyMarker.touch(); };
   return options;
 }
 
@@ -78,7 +79,7 @@ struct Daemon::Parts {
                         std::make_shared<PowerLog>(powerLogOptions()),
                         dashboardLinger()},
         sessionServices{backendServices, clientLibraryVersion()},
-        http(httpOptions()),
+        http(httpOptions(busyMarker)),
         agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetcher(), busyMarker)),
         listener(listenerOptions(serviceManager)) {
     listener.setDelegate(agent.get());

@@ -13,6 +13,8 @@ namespace vesk {
 
 namespace {
 
+constexpr int kMostLooks = 10;
+
 sigset_t stopSignals() {
   sigset_t signals;
   ::sigemptyset(&signals);
@@ -56,6 +58,7 @@ RunLoop::Outcome RunLoop::run() {
     auto now = Clock::now();
     if (events[2].revents != 0) noteBusyMarker(now);
     pingWatchdog(now);
+    lookForPause(now);
     if (_idleDeadline && now >= *_idleDeadline && !_busyMarker.isBusy()) return Outcome::Idle;
   }
 }
@@ -75,10 +78,27 @@ void RunLoop::pingWatchdog(Clock::time_point now) {
   _nextPing = now + *interval;
 }
 
+void RunLoop::lookForPause(Clock::time_point now) {
+  if (!_options.onPause) return;
+  if (!_nextLook) {
+    _looks = 0;
+    if (_busyMarker.isTouched()) _nextLook = now + _options.pause;
+    return;
+  }
+  if (now < *_nextLook) return;
+  if (_busyMarker.takeTouch() && ++_looks < kMostLooks) {
+    _nextLook = now + _options.pause;
+    return;
+  }
+  _nextLook.reset();
+  _options.onPause();
+}
+
 int RunLoop::pollTimeout(Clock::time_point now) const {
   auto next = Clock::time_point::max();
   if (_idleDeadline) next = std::min(next, *_idleDeadline);
   if (_nextPing) next = std::min(next, *_nextPing);
+  if (_nextLook) next = std::min(next, *_nextLook);
   if (next == Clock::time_point::max()) return -1;
   auto wait = std::chrono::ceil<std::chrono::milliseconds>(next - now).count();
   return static_cast<int>(std::clamp<decltype(wait)>(wait, 0, INT_MAX));

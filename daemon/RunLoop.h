@@ -2,6 +2,7 @@
 #pragma once
 
 #include <chrono>
+#include <functional>
 #include <optional>
 
 #include <signal.h>
@@ -13,7 +14,7 @@
 namespace vesk {
 
 /// Runs on the main thread for the life of the process; the work is done by other threads. It sleeps until
-/// something happens: no wake-ups but the watchdog's.
+/// something happens: no wake-ups but the watchdog's, and after work those that look for a pause.
 class RunLoop {
  public:
   enum class Outcome {
@@ -24,7 +25,11 @@ class RunLoop {
 
   struct Options {
     /// How long the process may be idle; nothing: for ever.
-    std::optional<std::chrono::milliseconds> idleExit;
+    std::optional<std::chrono::milliseconds> idleExit{};
+    /// Called on this thread once work has paused for that long, or has gone on for ten times as long: then
+    /// nobody is disturbed, or it can't be put off any more.
+    std::function<void()> onPause = nullptr;
+    std::chrono::milliseconds pause{3000};
   };
 
   /// Both outlive the loop. From here on SIGTERM and SIGINT wait for `run`, in this thread and in every
@@ -48,6 +53,7 @@ class RunLoop {
 
   void noteBusyMarker(Clock::time_point now);
   void pingWatchdog(Clock::time_point now);
+  void lookForPause(Clock::time_point now);
   int pollTimeout(Clock::time_point now) const;
 
   const Options _options;
@@ -61,6 +67,8 @@ class RunLoop {
   // Used by `run` alone.
   std::optional<Clock::time_point> _idleDeadline;
   std::optional<Clock::time_point> _nextPing;
+  std::optional<Clock::time_point> _nextLook;  // whether work has paused
+  int _looks = 0;
 };
 
 }  // namespace vesk

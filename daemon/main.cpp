@@ -35,6 +35,7 @@ int run(const vesk::DaemonOptions& options) {
   vesk::BusyMarker busyMarker;
   vesk::RunLoop::Options loopOptions{options.idleExit};
   if (!options.idleExit && serviceManager.isSocketActivated()) loopOptions.idleExit = kIdleExitWhenActivated;
+  loopOptions.onPause = vesk::releaseFreePages;
   vesk::RunLoop loop(loopOptions, busyMarker, serviceManager);
 
   vesk::Daemon daemon(serviceManager, busyMarker);

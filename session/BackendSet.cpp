@@ -88,7 +88,7 @@ std::optional<BackendSet> createBackends(const std::optional<Dictionary>& storeb
     return std::nullopt;
   }
   SetIdentity identity(*sessionInfo, services);
-  auto heldBytes = std::make_shared<std::atomic<std::size_t>>(0);
+  const HeldBytes heldBytes = services.heldBudget->accountFor(user);
   BackendSet backends;
   for (const DictionaryEntry& entry : *storebag) {
     std::string name = entry.key.string();

@@ -338,7 +338,7 @@ TEST_F(BackendEvents, WhatHasNowhereToGoIsCounted) {
 }
 
 TEST_F(BackendEvents, OneBackendAtTheBoundLeavesTheOthersTheirBatches) {
-  auto account = std::make_shared<std::atomic<std::size_t>>(0);
+  auto account = HeldBudget().accountFor(1000);
   auto holds = make();
   holds->setState(BackendStateOverride);
   auto batches = make();

@@ -57,27 +57,6 @@ TEST(HTTPClient, SendsWhatItIsGivenAndLittleElse) {
   EXPECT_EQ(own, expected);
 }
 
-TEST(HTTPClient, KnowsTheUsualMethodsOnOneHandle) {
-  RecordingServer server;
-  HTTPClient client;
-  const struct {
-    const char* method;
-    const char* body;
-  } cases[] = {{"HEAD", ""},   {"POST", "x"}, {"GET", ""},  {"PUT", "y"},
-               {"DELETE", ""}, {"HEAD", ""},  {"POST", ""}, {"GET", ""}};
-  for (const auto& test : cases) {
-    HTTPRequest request = fetchFrom(server.url());
-    request.method = test.method;
-    request.body = test.body;
-    auto result = client.perform(request);
-    ASSERT_TRUE(result.response) << test.method << ": " << result.error->description;
-    auto received = server.requests().back();
-    EXPECT_EQ(received.method, test.method);
-    EXPECT_EQ(received.body, test.body);
-    EXPECT_FALSE(received.header("Content-Type")) << test.method;
-  }
-}
-
 TEST(HTTPClient, LeavesOutHeadersThatWouldBreakTheRequestApart) {
   CapturedLog log;
   RecordingServer server;
@@ -95,40 +74,6 @@ TEST(HTTPClient, LeavesOutHeadersThatWouldBreakTheRequestApart) {
     EXPECT_TRUE(!name.starts_with("X-") || name == "X-Good") << name;
   }
   EXPECT_EQ(log.countContaining(4, "left out"), 8);
-}
-
-TEST(HTTPClient, HeldPostsNeitherOpenMoreConnectionsThanAllowedNorHoldUpAFetch) {
-  RecordingServer server([](const HTTPReceived& request, std::size_t) {
-    return request.path() == "/post" ? faulty(Fault::Hold) : HTTPAnswer::text(200, "ok");
-  });
-  HTTPClient client(HTTPClient::Options{.maximumConnectionsPerHost = 3});
-  std::atomic<int> done{0};
-  for (int i = 0; i < 10; ++i) {
-    client.start(postTo(server.url()), [&](const HTTPResult& result) { done += result.response ? 1 : 0; });
-  }
-  waitFor([&] { return server.count() == 2; });
-  EXPECT_TRUE(client.perform(fetchFrom(server.url("/fetch"))).response);
-  EXPECT_EQ(server.count(), 3u);
-  EXPECT_LE(server.server().connectionsOpen(), 3u);
-  EXPECT_FALSE(client.waitUntilIdle(1ms));
-  waitFor([&] {
-    server.server().releaseHeld();
-    return done == 10;
-  });
-  EXPECT_TRUE(client.waitUntilIdle(60s));
-  EXPECT_LE(server.server().connectionsAccepted(), 3u);
-}
-
-TEST(HTTPClient, OneConnectionKeepsTheOrderOfTheCalls) {
-  RecordingServer server;
-  std::vector<std::string> sent;
-  HTTPClient client(HTTPClient::Options{.maximumConnectionsPerHost = 1});
-  for (int i = 0; i < 50; ++i) {
-    sent.push_back(std::to_string(i));
-    client.start(postTo(server.url(), sent.back()), [](const HTTPResult&) {});
-  }
-  ASSERT_TRUE(client.waitUntilIdle(60s));
-  EXPECT_EQ(server.bodies(), sent);
 }
 
 TEST(HTTPClient, VerifiesTheServerAgainstTheGivenAuthorities) {
@@ -153,8 +98,7 @@ TEST(HTTPClient, VerifiesTheServerAgainstTheGivenAuthorities) {
                             {&client, otherAuthority.url()},
                             {&client, expired.url()},
                             {&systemClient, good.url()}}) {
-    // A post too: a bad certificate is no outage.
-    auto result = which->perform(postTo(url));
+    auto result = which->perform(postTo(url, "event", HTTPRequest::Retry::Never));
     ASSERT_TRUE(result.error) << url;
     EXPECT_EQ(result.error->kind, Kind::TLS) << result.error->description;
   }
@@ -238,20 +182,6 @@ TEST(HTTPClient, BadAnswersAreErrorsOfTheirKindAndOverWithTheNextRequest) {
   ::unsetenv("SSL_CERT_FILE");
 }
 
-TEST(HTTPClient, TakesAProxysAnswerForNoAnswer) {
-  RecordingServer proxy([](const HTTPReceived&, std::size_t) { return HTTPAnswer::text(502, "no way"); });
-  ::setenv("https_proxy", proxy.url().c_str(), 1);
-  HTTPClient client(HTTPClient::Options{.firstRetryAfter = 1ms});
-  client.start(postTo("https://collector.example/"), [](const HTTPResult& result) {
-    EXPECT_EQ(result.error.value().kind, Kind::Stopped) << "tried again until the end";
-    EXPECT_FALSE(result.response);
-  });
-  bool isIdle = false;
-  while (proxy.count() < 3 && !isIdle) isIdle = client.waitUntilIdle(1ms);
-  EXPECT_GE(proxy.count(), 3u);
-  ::unsetenv("https_proxy");
-}
-
 TEST(HTTPClient, GivesUpWhatMovesTooSlowlyAndOnlyThat) {
   RecordingServer server([](const HTTPReceived& received, std::size_t) {
     auto answer = faulty(received.method == "POST" ? Fault::SlowBody : Fault::Stall, "0123456789");
@@ -288,23 +218,6 @@ TEST(HTTPClient, TakesABodyUpToTheLimitAndNoEndOfHeaders) {
   EXPECT_EQ(exact.perform(fetchFrom(server.url("/headers"))).error->kind, Kind::TooLarge);
   HTTPClient less(HTTPClient::Options{.maximumBody = 999});
   EXPECT_EQ(less.perform(fetchFrom(server.url())).error->kind, Kind::TooLarge);
-}
-
-TEST(HTTPClient, SurvivesACompletionThatThrowsAndOneThatGoesOn) {
-  CapturedLog log;
-  RecordingServer server;
-  HTTPClient client;
-  client.start(fetchFrom(server.url()), [](const HTTPResult&) { throw std::runtime_error("broken"); });
-  client.start(fetchFrom(server.url()), [](const HTTPResult&) { throw 7; });
-  auto token = std::make_shared<int>(1);
-  client.start(fetchFrom(server.url()), [&, token](const HTTPResult&) {
-    client.start(fetchFrom(server.url("/again")),
-                 [](const HTTPResult& result) { EXPECT_TRUE(result.response); });
-  });
-  ASSERT_TRUE(client.waitUntilIdle(60s));
-  EXPECT_EQ(server.count(), 4u);
-  EXPECT_EQ(log.countContaining(3, "a completion failed"), 2);
-  EXPECT_EQ(token.use_count(), 1) << "completions are gone once they have run";
 }
 
 TEST(HTTPClient, ItsEndFailsWhatIsOutstandingAtOnce) {

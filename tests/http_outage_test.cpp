@@ -9,6 +9,7 @@
 #include "tests/support/CapturedLog.h"
 #include "tests/support/HTTPRequests.h"
 #include "tests/support/RecordingServer.h"
+#include "tests/support/TempDirectory.h"
 
 namespace vesk::test {
 namespace {
@@ -68,6 +69,27 @@ TEST(HTTPOutage, NothingIsLostWhileTheServerIsDown) {
   std::sort(expected.begin(), expected.end());
   EXPECT_EQ(bodies, expected);
   EXPECT_EQ(log.countContaining(6, server.server().baseURL() + " answers again"), 1);
+}
+
+TEST(HTTPOutage, APostWaitsUntilTheCertificateCanBeVerified) {
+  CapturedLog log;
+  TempDirectory directory;
+  const auto authority = CertificateAuthority::generate();
+  ::setenv("SSL_CERT_FILE", directory.write("ca.pem", authority.certificate()).c_str(), 1);
+  HTTPClient client(quick());
+  ::unsetenv("SSL_CERT_FILE");
+  RecordingServer portal({}, {.tls = CertificateAuthority::generate().issueServerIdentity()});
+  const std::string url = portal.url();
+  HTTPResult result;
+  client.start(postTo(url), [&](HTTPResult outcome) { result = std::move(outcome); });
+  EXPECT_EQ(client.perform(postTo(url, "upload", HTTPRequest::Retry::Never)).error->kind, Kind::TLS);
+  while (log.countContaining(6, "no answer from") == 0) std::this_thread::yield();
+  portal.stop();
+  RecordingServer server({}, {.port = portal.server().port(), .tls = authority.issueServerIdentity()});
+  ASSERT_TRUE(client.waitUntilIdle(60s));
+  EXPECT_TRUE(result.response) << result.error->description;
+  EXPECT_EQ(portal.count(), 0u);
+  EXPECT_EQ(server.bodies(), Bodies{"event"});
 }
 
 TEST(HTTPOutage, AnUploadOrFetchIsSentOnceEvenOnAKeptConnection) {

@@ -219,16 +219,5 @@ TEST_F(Schedule, AFetchThatFindsNoConnectionInTimeIsGivenUp) {
   EXPECT_EQ(givenUp(), "i");
 }
 
-TEST(HTTPExchange, ItsCompletionRunsEvenWhenNobodyEndsIt) {
-  std::vector<HTTPError::Kind> kinds;
-  auto note = [&](const HTTPResult& result) { kinds.push_back(result.error->kind); };
-  HTTPOutstanding outstanding;
-  auto exchange = std::make_unique<HTTPExchange>(HTTPRequest{}, note, Instant{}, outstanding);
-  EXPECT_FALSE(outstanding.waitUntilNone(0ms));
-  exchange.reset();
-  EXPECT_EQ(kinds, std::vector{HTTPError::Kind::Other});
-  EXPECT_TRUE(outstanding.waitUntilNone(0ms));
-}
-
 }  // namespace
 }  // namespace vesk

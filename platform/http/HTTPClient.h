@@ -22,7 +22,7 @@ struct HTTPRequest {
   enum class Retry : unsigned char {
     Never,      ///< uploads and storebag fetches
     UntilSent,  ///< posts: again with growing, jittered waits, for at most 60 s and while fewer than 8 MiB
-                ///< wait
+                ///< wait; also when the server's certificate could not be verified
   };
 
   std::string method = "GET";
@@ -103,6 +103,8 @@ class HTTPClient {
     /// Further requests to that host wait in order. Posts leave one connection to the other requests, so that
     /// a fetch does not wait behind them.
     std::size_t maximumConnectionsPerHost = 6;
+    /// Called whenever the last outstanding request has ended, on any thread; must neither block nor throw.
+    std::function<void()> onIdle = nullptr;
   };
 
   /// The thread and the libraries under it, which are large, start with the first request: a daemon that has

@@ -44,7 +44,9 @@ void HTTPOutstanding::add() noexcept {
 
 void HTTPOutstanding::remove() noexcept {
   MutexLock lock(_mutex);
-  if (--_count == 0) _becameNone.notify_all();
+  if (--_count > 0) return;
+  if (_whenNone) _whenNone();
+  _becameNone.notify_all();
 }
 
 bool HTTPOutstanding::waitUntilNone(std::chrono::milliseconds timeout) {

@@ -4,6 +4,7 @@
 #include <chrono>
 #include <condition_variable>
 #include <cstddef>
+#include <functional>
 #include <memory>
 #include <string_view>
 #include <utility>
@@ -16,12 +17,15 @@ namespace vesk {
 /// How many exchanges there are. Thread-safe.
 class HTTPOutstanding {
  public:
+  /// `becameNone`: as HTTPClient::Options::onIdle.
+  explicit HTTPOutstanding(std::function<void()> becameNone = nullptr) : _whenNone(std::move(becameNone)) {}
   void add() noexcept;
   void remove() noexcept;
   /// At most `timeout`; true when there are none.
   bool waitUntilNone(std::chrono::milliseconds timeout);
 
  private:
+  const std::function<void()> _whenNone;
   Mutex _mutex;
   std::condition_variable_any _becameNone;
   std::size_t _count VESK_GUARDED_BY(_mutex) = 0;

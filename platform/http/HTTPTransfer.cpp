@@ -69,8 +69,10 @@ bool passes(CURLcode code, CURL* easy) {
     case Kind::Interrupted:
       return true;
     case Kind::TLS:
-      // A server that goes down in the middle of the handshake; a bad certificate has codes of its own.
-      return code == CURLE_SSL_CONNECT_ERROR;
+      // A server that goes down in the middle of the handshake, or a certificate that can't be verified: a
+      // captive portal shows its own until somebody has logged in.
+      return code == CURLE_SSL_CONNECT_ERROR || code == CURLE_PEER_FAILED_VERIFICATION ||
+             code == CURLE_SSL_ISSUER_ERROR || code == CURLE_SSL_INVALIDCERTSTATUS;
     case Kind::Timeout: {
       // Only when the request was not even sent: a server that has it may still be at work on it.
       curl_off_t sent = 0;

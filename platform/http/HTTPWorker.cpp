@@ -48,6 +48,7 @@ HTTPClient::Worker::Worker(Options options, std::optional<std::string> authoriti
       _authorities(std::move(authorities)),
       _multi(makeMulti(std::max<std::size_t>(_options.maximumConnectionsPerHost, 1))),
       _postsOnly(postsOnly),
+      _outstanding(_options.onIdle),
       _schedule(_options),
       _thread([this] { run(); }) {}
 

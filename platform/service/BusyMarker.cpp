@@ -16,7 +16,13 @@ void BusyMarker::begin() noexcept {
 }
 
 void BusyMarker::end() noexcept {
-  if (_count.fetch_sub(1) == 1) noteChange();
+  if (_count.fetch_sub(1) != 1) return;
+  _touched = true;
+  noteChange();
+}
+
+void BusyMarker::touch() noexcept {
+  if (!_touched.exchange(true)) noteChange();
 }
 
 void BusyMarker::acknowledge() noexcept {

@@ -19,7 +19,15 @@ class BusyMarker {
   void end() noexcept;
   bool isBusy() const noexcept { return _count.load() > 0; }
 
-  /// Readable since the process last became busy or idle; for the run loop, which then calls `acknowledge`.
+  /// Notes that work was done, which may have left memory behind that is free. Costs a wake-up of the run
+  /// loop only when none is due for that anyway.
+  void touch() noexcept;
+  /// Whether there was any since the last `takeTouch`.
+  bool isTouched() const noexcept { return _touched.load(); }
+  bool takeTouch() noexcept { return _touched.exchange(false); }
+
+  /// Readable since the process last became busy or idle, or did work; for the run loop, which then calls
+  /// `acknowledge`.
   int descriptor() const noexcept { return _changed.get(); }
   void acknowledge() noexcept;
 
@@ -28,6 +36,7 @@ class BusyMarker {
 
   const FileDescriptor _changed;
   std::atomic<unsigned> _count{0};
+  std::atomic<bool> _touched{false};
 };
 
 }  // namespace vesk

@@ -35,6 +35,8 @@ void setUpAllocator() noexcept {
   ::mallopt(M_ARENA_MAX, kMostArenas);
 }
 
+void releaseFreePages() noexcept { ::malloc_trim(0); }
+
 void releaseStartUpPages() noexcept { ::dl_iterate_phdr(&releaseObject, nullptr); }
 
 }  // namespace vesk

@@ -13,4 +13,8 @@ void setUpAllocator() noexcept;
 /// on any thread, at any time.
 void releaseStartUpPages() noexcept;
 
+/// Gives the pages of freed memory back to the kernel, those between used ones too. Takes some milliseconds
+/// after a busy time, during which threads that allocate may have to wait; safe on any thread, at any time.
+void releaseFreePages() noexcept;
+
 }  // namespace vesk

@@ -12,6 +12,7 @@
 #define VESK_CAPABILITY(x) VESK_THREAD_ANNOTATION(capability(x))
 #define VESK_SCOPED_CAPABILITY VESK_THREAD_ANNOTATION(scoped_lockable)
 #define VESK_GUARDED_BY(x) VESK_THREAD_ANNOTATION(guarded_by(x))
+#define VESK_ACQUIRED_AFTER(...) VESK_THREAD_ANNOTATION(acquired_after(__VA_ARGS__))
 #define VESK_REQUIRES(...) VESK_THREAD_ANNOTATION(requires_capability(__VA_ARGS__))
 #define VESK_EXCLUDES(...) VESK_THREAD_ANNOTATION(locks_excluded(__VA_ARGS__))
 #define VESK_ACQUIRE(...) VESK_THREAD_ANNOTATION(acquire_capability(__VA_ARGS__))

@@ -1,0 +1,71 @@
+// How many bytes of events are held back: by a session, by its user, by the whole process.
+#pragma once
+
+#include <sys/types.h>
+
+#include <atomic>
+#include <cstddef>
+#include <map>
+#include <memory>
+#include <string>
+
+#include "platform/sync/Mutex.h"
+
+namespace vesk {
+
+/// A sum with a limit; what is added counts in the wider accounts as well, which it keeps alive. It never
+/// refuses: who adds asks `exceeded` afterwards and gives something up. Thread-safe.
+class HeldAccount {
+ public:
+  /// `holder`: whose it is, for the log; empty: a session's.
+  explicit HeldAccount(std::size_t limit, std::string holder = {},
+                       std::shared_ptr<HeldAccount> wider = nullptr);
+  HeldAccount(const HeldAccount&) = delete;
+  HeldAccount& operator=(const HeldAccount&) = delete;
+
+  void add(std::size_t bytes) noexcept;
+  void remove(std::size_t bytes) noexcept;
+
+  std::size_t bytes() const noexcept { return _bytes.load(); }
+  std::size_t limit() const noexcept { return _limit; }
+  const std::string& holder() const noexcept { return _holder; }
+  bool isOfSession() const noexcept { return _holder.empty(); }
+  const HeldAccount* wider() const noexcept { return _wider.get(); }
+
+  /// The narrowest account that would be above so many times its limit if `growth` were added; null when none
+  /// would.
+  const HeldAccount* exceeded(std::size_t growth = 0, std::size_t times = 1) const noexcept;
+
+ private:
+  const std::size_t _limit;
+  const std::string _holder;
+  const std::shared_ptr<HeldAccount> _wider;
+  std::atomic<std::size_t> _bytes{0};
+};
+
+using HeldBytes = std::shared_ptr<HeldAccount>;
+
+/// Gives each session its account. Thread-safe.
+class HeldBudget {
+ public:
+  /// Bytes.
+  struct Limits {
+    std::size_t ofSession = std::size_t{16} << 20;
+    std::size_t ofUser = std::size_t{64} << 20;
+    std::size_t ofAll = std::size_t{256} << 20;
+  };
+
+  HeldBudget() : HeldBudget(Limits{}) {}
+  explicit HeldBudget(const Limits& limits);
+
+  /// A new one, for all backends of one session or single message of that user.
+  HeldBytes accountFor(uid_t user);
+
+ private:
+  const Limits _limits;
+  const HeldBytes _all;
+  Mutex _mutex;
+  std::map<uid_t, std::weak_ptr<HeldAccount>> _users VESK_GUARDED_BY(_mutex);  ///< of those with sessions
+};
+
+}  // namespace vesk

@@ -1,0 +1,35 @@
+// Tells in the log of the events that servers refuse.
+#pragma once
+
+#include <chrono>
+#include <cstddef>
+#include <map>
+#include <string>
+
+#include "platform/ipc/WarningBurst.h"
+#include "platform/sync/Mutex.h"
+
+namespace vesk {
+
+/// One line a burst of each backend name, of all sessions together: a server that moved refuses every post of
+/// each of them. Thread-safe.
+class RefusedPosts {
+ public:
+  using Instant = std::chrono::steady_clock::time_point;
+
+  /// A server answered `status`, and that many events are lost. The line counts them, and those of the burst
+  /// before that came after its line.
+  void note(const std::string& backend, long status, std::size_t events,
+            Instant now = std::chrono::steady_clock::now());
+
+ private:
+  struct OfBackend {
+    WarningBurst burst;
+    std::size_t untold = 0;
+  };
+
+  Mutex _mutex;
+  std::map<std::string, OfBackend> _backends VESK_GUARDED_BY(_mutex);
+};
+
+}  // namespace vesk
