@@ -2,10 +2,10 @@
 
 #include <algorithm>
 
+#include "backends/FilterCompiler.h"
 #include "backends/VeskReportingBackend.h"
 #include "platform/unicode/Unicode.h"
 #include "platform/values/Conversions.h"
-#include "storebag/StorebagProfile.h"
 
 namespace vesk {
 
@@ -13,26 +13,6 @@ namespace {
 
 bool isASCII(std::string_view text) {
   return std::all_of(text.begin(), text.end(), [](char c) { return static_cast<unsigned char>(c) < 0x80; });
-}
-
-std::int32_t actionFromText(const std::optional<std::string>& action) {
-  if (action == "remove") return filterTag::Remove;
-  if (action == "sha256") return filterTag::Digest;
-  return filterTag::Leave;
-}
-
-filterTag filterFromDictionary(const Dictionary& source, std::string_view backendName) {
-  filterTag filter;
-  filter.method =
-      static_cast<std::int32_t>(profileIntegerOrNumericText(backendName, source, "method").value_or(-1));
-  filter.status =
-      static_cast<std::int32_t>(profileIntegerOrNumericText(backendName, source, "status").value_or(-1));
-  filter.action = actionFromText(profileText(backendName, source, "action"));
-  if (auto key = profileText(backendName, source, "key")) {
-    filter.keyIsASCII = isASCII(*key);
-    filter.key = Text(*key);
-  }
-  return filter;
 }
 
 // A key in ASCII is met by keys of the same length, or by longer ones that are not in ASCII themselves (the
@@ -46,13 +26,15 @@ bool matchesKey(const filterTag& filter, std::string_view key) {
 
 std::int32_t numberIn(const MutableDictionary& event, std::string_view key) {
   const Value* value = event.find(key);
-  return value ? static_cast<std::int32_t>(value->asInteger().value_or(0)) : 0;
+  return value ? static_cast<std::int32_t>(integerForm(*value)) : 0;
 }
 
-// Texts are digested as they are and numbers as their decimal text; of anything else there is no text to
-// digest, and a value that was to be hidden must not leave in the clear.
+// Texts are digested as they are, numbers and dates as the decimal text of the number that the body would
+// carry; of anything else there is no text to digest, and a value that was to be hidden must not leave in the
+// clear.
 std::optional<Value> digested(const Value& value) {
   if (const Text* text = value.text()) return Value(VeskReportingBackend::convertIntoSHA256(text->view()));
+  if (const Date* date = value.date()) return digested(finiteOrMinusOne(date->secondsSince1970));
   if (value.isNumber()) return Value(VeskReportingBackend::convertIntoSHA256(*stringForm(value)));
   return std::nullopt;
 }
@@ -61,14 +43,8 @@ std::optional<Value> digested(const Value& value) {
 
 void EventFilters::createFiltersFromArray(const List& filters, std::string_view backendName) {
   if (filters.empty()) return;
-  std::vector<filterTag> table;
-  table.reserve(filters.size());
-  for (const Value& element : filters) {
-    const Dictionary* source = element.dictionary();
-    if (!source) reportWrongType(backendName, "filters", element);
-    table.push_back(source ? filterFromDictionary(*source, backendName) : filterTag{});
-  }
-  _filters = std::move(table);
+  _filters = compileFilters(filters, backendName);
+  for (filterTag& filter : _filters) filter.keyIsASCII = filter.key && isASCII(filter.key->view());
 }
 
 const filterTag* EventFilters::decidingFilter(const Text& key, std::int32_t method,

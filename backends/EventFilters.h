@@ -27,7 +27,7 @@ class EventFilters {
   EventFilters() = default;
 
   /// Replaces the table by one record per element; an empty array leaves the table as it is. `backendName` is
-  /// named in the log lines about values of a wrong type, which count as absent.
+  /// named in the log lines about filters that can't be read.
   void createFiltersFromArray(const List& filters, std::string_view backendName);
 
   /// Applies the table in place. The first record that matches a key decides about that key.

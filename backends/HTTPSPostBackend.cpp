@@ -11,12 +11,23 @@ namespace {
 constexpr std::uint16_t kSessionTypeStop = 1;
 constexpr std::size_t kMostMethods = 65'536;
 
+// The device's facts hold for all sessions alike, so one line a process is enough.
+void noteMissingFamily(const std::string& name) {
+  static std::atomic<bool> noted{false};
+  if (noted.exchange(true)) return;
+  VESK_LOG_WARNING(
+      "HTTPSPostBackend(initWithName): the device has no product family (DeviceName), so there is no backend "
+      "%s",
+      name.c_str());
+}
+
 }  // namespace
 
 std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::create(const std::string& name,
                                                            const std::optional<Dictionary>& profile,
                                                            const std::optional<Text>& productFamily,
                                                            const BackendServices& services) {
+  if (!productFamily) noteMissingFamily(name);
   if (!profile || !productFamily) return nullptr;
   if (!profileList(name, *profile, "clients")) {
     VESK_LOG_ERROR("HTTPSPostBackend(initWithName): can't find the client list.");

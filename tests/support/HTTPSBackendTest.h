@@ -1,0 +1,116 @@
+// HTTPS backends that a test builds from client entries, and what arrives of their events.
+#pragma once
+
+#include <gtest/gtest.h>
+
+#include "backends/HTTPSPostBackend.h"
+#include "tests/support/BackendHarness.h"
+#include "tests/support/CapturedLog.h"
+
+namespace vesk::test {
+
+using Lines = std::vector<std::string>;
+
+inline timeval at(double seconds) {
+  return timevalFrom(WallTime(std::chrono::microseconds(static_cast<std::int64_t>(seconds * 1e6))));
+}
+
+inline Dictionary userNamed(const char* client, const char* service = "MyCallService") {
+  return {{kVeskReportingUserInfoClientName, client}, {kVeskReportingUserInfoServiceName, service}};
+}
+
+/// What a session tells a backend.
+struct Stamp {
+  bool requireUserInfo = true;
+  std::optional<Dictionary> userInfo = userNamed("Camera");
+  bool batchEvents = false;
+  bool isInternal = false;
+  std::int32_t clientType = 5;
+};
+
+class HTTPSBackendTest : public ::testing::Test {
+ protected:
+  static constexpr double kStart = 1'000'000'019.7;
+
+  /// A client entry by which everything is reported, with `changes`, and without one key.
+  Dictionary entry(const Dictionary& changes = {}, std::string_view without = "") const {
+    MutableDictionary whole(Dictionary{{"post_url", harness.url()},
+                                       {"realtime_post_url", harness.url("/realtime")},
+                                       {"locale_whitelist", List{"us"}},
+                                       {"filters", List{Dictionary{{"key", "unused"}}}},
+                                       {"sampling_threshold", 1.0}});
+    whole.setAll(changes);
+    whole.remove(without);
+    return whole.share();
+  }
+  std::shared_ptr<HTTPSPostBackend> make(List clients, const Stamp& stamp = {}) {
+    auto backend = std::static_pointer_cast<HTTPSPostBackend>(VeskReportingBackend::newBackendWithName(
+        kVeskReportingBackendHTTPPost, Dictionary{{"clients", std::move(clients)}}, Text("Phone"), 5,
+        harness.services));
+    backend->setSessionID(4'000'000'000);
+    backend->setCompType(stamp.clientType);
+    backend->setClientVersion(3);
+    backend->setUdid("the-udid");
+    backend->setProductVersion(Text("12.1"));
+    backend->setHardwareType(Text("Phone7,2"));
+    backend->setIsInternal(stamp.isInternal);
+    backend->setRequireUserInfo(stamp.requireUserInfo);
+    backend->setBatchEvents(stamp.batchEvents);
+    backend->setSelfVersion("7.2.9");
+    backend->setStartTimestamp(at(kStart));
+    backend->setCombinedSessionIDString("session-text");
+    backend->setSamplingFactor(0.30);
+    update(*backend, stamp.userInfo);
+    return backend;
+  }
+  std::shared_ptr<HTTPSPostBackend> make(const Dictionary& only, const Stamp& stamp = {}) {
+    return make(List{only}, stamp);
+  }
+  static void update(VeskReportingBackend& backend, const std::optional<Dictionary>& userInfo) {
+    backend.setUserInfoDict(userInfo);
+    backend.updateState();
+  }
+  static std::optional<std::string> send(VeskReportingBackend& backend,
+                                         const std::optional<Dictionary>& payload = Dictionary(),
+                                         int method = 3, std::int32_t flag = 0, std::uint16_t status = 2) {
+    return backend.sendMessage(payload, at(kStart + 5.25), static_cast<std::uint16_t>(method), status, flag);
+  }
+  /// The message that ends a session.
+  static std::optional<std::string> sendStop(VeskReportingBackend& backend,
+                                             const std::optional<Dictionary>& payload = Dictionary()) {
+    return send(backend, payload, 0, 0, 1);
+  }
+
+  /// The posts since the last time.
+  std::vector<ReceivedPost> takeAll() {
+    auto posts = harness.posts();
+    const std::size_t taken = std::exchange(_taken, posts.size());
+    return {posts.begin() + static_cast<std::ptrdiff_t>(taken), posts.end()};
+  }
+  ReceivedPost take() { return takeAll().at(0); }
+  /// Where the posts since the last time went, and how many events they had: "/post 1".
+  Lines takeTargets() {
+    Lines all;
+    for (const auto& post : takeAll())
+      all.push_back(post.request.target + " " + std::to_string(post.events().size()));
+    std::sort(all.begin(), all.end());
+    return all;
+  }
+  /// The lines of HTTPS backends and the factory, behind their levels and without what all `begin` with.
+  static Lines linesOf(const CapturedLog& log, std::string_view begin = "") {
+    Lines all;
+    for (const auto& [level, line] : log.lines())
+      for (auto source : {"HTTPSPostBackend(", "VeskReportingBackend(", "postJSONMessage: "})
+        if (line.starts_with(source))
+          all.push_back(std::to_string(level) + " " +
+                        line.substr(line.starts_with(begin) ? begin.size() : 0));
+    return all;
+  }
+
+  BackendHarness harness;
+
+ private:
+  std::size_t _taken = 0;
+};
+
+}  // namespace vesk::test
