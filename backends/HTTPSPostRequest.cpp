@@ -17,6 +17,7 @@ namespace vesk {
 namespace {
 
 constexpr std::size_t kLongestKeyInLog = 200;
+constexpr std::size_t kLongestValueInLog = 100;
 
 // JSON has no number that is not finite.
 bool fitsIntoBody(const Value& value) {
@@ -35,7 +36,8 @@ void sanitize(MutableDictionary& event) {
     }
     VESK_LOG_WARNING(
         "HTTPSPostBackend(createMessageForPostAndLogging): TreeWriter unable to handle key: %s, value: %s",
-        std::string(entry.key.view().substr(0, kLongestKeyInLog)).c_str(), describe(entry.value).c_str());
+        std::string(entry.key.view().substr(0, kLongestKeyInLog)).c_str(),
+        describe(entry.value, kLongestValueInLog).c_str());
     return true;
   });
 }

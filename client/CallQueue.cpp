@@ -1,15 +1,18 @@
 #include "client/CallQueue.h"
 
-#include <sys/eventfd.h>
+#include <sys/socket.h>
 
 #include <utility>
 
 namespace vesk {
 
 CallQueue::CallQueue(std::size_t maximumCalls, std::size_t maximumMemory) noexcept
-    : _maximumCalls(maximumCalls),
-      _maximumMemory(maximumMemory),
-      _event(::eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC)) {}
+    : _maximumCalls(maximumCalls), _maximumMemory(maximumMemory) {
+  int ends[2];
+  if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends) != 0) return;
+  _readEnd = GuardedDescriptor(FileDescriptor(ends[0]));
+  _writeEnd = GuardedDescriptor(FileDescriptor(ends[1]));
+}
 
 ReportingStatus CallQueue::push(ClientCall&& call) {
   bool mustWake = false;
@@ -32,7 +35,10 @@ ReportingStatus CallQueue::push(ClientCall&& call) {
   return ReportingStatus::Queued;
 }
 
-void CallQueue::wake() noexcept { ::eventfd_write(_event.get(), 1); }
+void CallQueue::wake() noexcept {
+  // A full socket has woken the thread already. send() writes into no file of the host's.
+  if (_writeEnd.isOurs()) ::send(_writeEnd.get(), "", 1, MSG_DONTWAIT | MSG_NOSIGNAL);
+}
 
 void CallQueue::close() noexcept {
   {
@@ -67,8 +73,10 @@ void CallQueue::awake(bool descriptorIsReadable) noexcept {
     MutexLock lock(_mutex);
     _wakeFor = WakeFor::NothingQueued;
   }
-  eventfd_t ignored = 0;
-  if (descriptorIsReadable) ::eventfd_read(_event.get(), &ignored);
+  char ignored[64];
+  while (descriptorIsReadable && _readEnd.isOurs() &&
+         ::recv(_readEnd.get(), ignored, sizeof ignored, MSG_DONTWAIT) == sizeof ignored) {
+  }
 }
 
 }  // namespace vesk

@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "client/ClientCall.h"
-#include "platform/files/FileDescriptor.h"
+#include "platform/files/GuardedDescriptor.h"
 #include "platform/sync/Mutex.h"
 
 namespace vesk {
@@ -22,7 +22,9 @@ class CallQueue {
   CallQueue(std::size_t maximumCalls, std::size_t maximumMemory) noexcept;
 
   /// False when no descriptor was left to make the queue with.
-  bool isUsable() const noexcept { return static_cast<bool>(_event); }
+  bool isUsable() const noexcept { return _readEnd && _writeEnd; }
+  /// False once the host has closed the queue's descriptors: it wakes nobody any more.
+  bool ownsItsDescriptors() const noexcept { return _readEnd.isOurs() && _writeEnd.isOurs(); }
 
   /// Queued, QueueFull or Closed. Throws std::bad_alloc, and then nothing was queued.
   ReportingStatus push(ClientCall&& call);
@@ -40,15 +42,17 @@ class CallQueue {
   void leave(std::size_t calls, std::size_t memory) noexcept;
   /// Says what a push from now on has to wake for. False when such a call is queued already: don't sleep.
   bool prepareToSleep(WakeFor what) noexcept;
-  /// Readable once something has woken the thread.
-  int descriptor() const noexcept { return _event.get(); }
+  /// Readable once something has woken the thread, or the host has closed the other end.
+  int descriptor() const noexcept { return _readEnd.get(); }
   /// After waking: pushes need not wake any more, and the descriptor is quiet again.
   void awake(bool descriptorIsReadable) noexcept;
 
  private:
   const std::size_t _maximumCalls;
   const std::size_t _maximumMemory;
-  const FileDescriptor _event;
+  // Sockets, which unlike an eventfd have an identity.
+  GuardedDescriptor _readEnd;
+  GuardedDescriptor _writeEnd;
 
   Mutex _mutex;
   std::vector<ClientCall> _queued VESK_GUARDED_BY(_mutex);

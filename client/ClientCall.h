@@ -9,7 +9,7 @@
 #include <memory>
 #include <string_view>
 
-#include "platform/files/FileDescriptor.h"
+#include "platform/files/GuardedDescriptor.h"
 #include "platform/ipc/IPCConnection.h"
 
 namespace vesk {
@@ -27,7 +27,7 @@ struct ClientCall {
   using Time = std::chrono::steady_clock::time_point;
 
   IPCOutgoingCall call{nullptr, nullptr, {}};
-  FileDescriptor descriptor;                              ///< the one that the arguments borrow
+  GuardedDescriptor descriptor;                           ///< the one that the arguments borrow
   std::shared_ptr<CallEnd> end;                           ///< null: the call is one way
   Time deadline{};                                        ///< of the answer
   std::size_t memory = 0;                                 ///< bytes that it counts in the queue

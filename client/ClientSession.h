@@ -61,8 +61,9 @@ class ClientSession {
 
   ReportingResult<std::monostate> connect(Timeout timeout) noexcept {
     return waitFor<std::monostate>(timeout, [&](ReportingCallback<std::monostate> callback) {
-      worker().requestConnection(endFor<std::monostate>(std::move(callback)), deadlineAfter(timeout));
-      return ReportingStatus::Queued;
+      auto end = endFor<std::monostate>(std::move(callback));
+      bool isAsked = worker().requestConnection(std::move(end), deadlineAfter(timeout));
+      return isAsked ? ReportingStatus::Queued : ReportingStatus::Closed;
     });
   }
 

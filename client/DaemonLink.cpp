@@ -42,6 +42,7 @@ DaemonLink::Change DaemonLink::reach(Time now, Urgency urgency) {
     _since = now;
     return Change::None;
   } catch (const std::system_error& error) {
+    if (error.code().value() == EUSERS) return turnedAway(now);
     lose(now, std::strerror(error.code().value()));
     return Change::Lost;
   }
@@ -50,6 +51,7 @@ DaemonLink::Change DaemonLink::reach(Time now, Urgency urgency) {
 DaemonLink::Change DaemonLink::process(Time now) {
   if (!_bus) return Change::None;
   if (_bus->process() == BusClient::Progress::Disconnected) {
+    if (_bus->wasTurnedAway()) return turnedAway(now);
     lose(now, _isReady ? "the daemon has closed the connection" : "the daemon does not let us in");
     return Change::Lost;
   }
@@ -64,7 +66,13 @@ DaemonLink::Change DaemonLink::process(Time now) {
   return Change::Lost;
 }
 
-void DaemonLink::lose(Time now, const char* cause) noexcept {
+DaemonLink::Change DaemonLink::turnedAway(Time now) noexcept {
+  lose(now, "the daemon takes no more", ReportingStatus::TooManyConnections);
+  return Change::Lost;
+}
+
+void DaemonLink::lose(Time now, const char* cause, ReportingStatus status) noexcept {
+  _problemStatus = status;
   if (_isReady && now - _since >= kShortestVisit) {
     _policy.succeeded();
   } else {

@@ -1,6 +1,8 @@
 // The connection to the daemon, made again whenever it is lost.
 #pragma once
 
+#include <VeskReporting/VeskReportingTypes.h>
+
 #include <chrono>
 #include <memory>
 #include <optional>
@@ -34,6 +36,8 @@ class DaemonLink {
   bool wasEverReady() const noexcept { return _wasEverReady; }
   /// For a person: the socket's path and what is wrong with it; empty when there was no memory for it.
   const std::string& problem() const noexcept { return _problem; }
+  /// The same as a status: NotConnected or TooManyConnections.
+  ReportingStatus problemStatus() const noexcept { return _problemStatus; }
 
   /// Only when ready. After SendResult::Disconnected call `lose`.
   BusClient& bus() noexcept { return *_bus; }
@@ -43,7 +47,7 @@ class DaemonLink {
   /// Does what the socket is ready for.
   [[nodiscard]] Change process(Time now);
   /// Gives the connection up. Handlers of answers still owed run before this returns.
-  void lose(Time now, const char* cause) noexcept;
+  void lose(Time now, const char* cause, ReportingStatus status = ReportingStatus::NotConnected) noexcept;
 
   /// For poll(); -1 when away.
   int descriptor() const { return _bus ? _bus->fd() : -1; }
@@ -54,11 +58,14 @@ class DaemonLink {
   bool mayReachEarly() const noexcept { return !_bus && _policy.mayTryEarly(); }
 
  private:
+  Change turnedAway(Time now) noexcept;
+
   const std::string _socketPath;
   const std::shared_ptr<IPCExportedObject> _receiver;
   ReconnectPolicy _policy;
   std::unique_ptr<BusClient> _bus;
   std::string _problem;
+  ReportingStatus _problemStatus = ReportingStatus::NotConnected;
   Time _since{};  ///< of knocking, then of being ready
   bool _isReady = false;
   bool _wasEverReady = false;

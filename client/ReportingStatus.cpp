@@ -28,6 +28,8 @@ const char* describe(ReportingStatus status) noexcept {
       return "the session was closed";
     case ReportingStatus::OutOfResources:
       return "out of memory, descriptors or threads";
+    case ReportingStatus::TooManyConnections:
+      return "too many connections";
   }
   return "unknown";
 }

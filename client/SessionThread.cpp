@@ -2,10 +2,13 @@
 
 #include <pthread.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <system_error>
 
+#include "client/BoundedWait.h"
+#include "client/DrainBudget.h"
 #include "client/ProcessMark.h"
 #include "platform/log/SystemLog.h"
 
@@ -40,22 +43,29 @@ std::thread startThread(const std::shared_ptr<SessionWorker>& worker) {
 
 std::shared_ptr<SessionWorker> makeWorker(const ReportingOptions& options) {
   auto worker = std::make_shared<SessionWorker>(options);
-  if (!worker->queue().isUsable()) throw std::system_error(errno, std::generic_category(), "eventfd");
+  if (!worker->queue().isUsable()) throw std::system_error(errno, std::generic_category(), "socketpair");
   return worker;
 }
 
 }  // namespace
 
 SessionThread::SessionThread(const ReportingOptions& options)
-    : _mark(processMark()), _worker(makeWorker(options)), _thread(startThread(_worker)) {}
+    : _mark(processMark()),
+      _drainTime(boundedWait(options.drainTime)),
+      _worker(makeWorker(options)),
+      _thread(startThread(_worker)) {}
 
 SessionThread::~SessionThread() {
-  _worker->stop();
+  const auto begun = std::chrono::steady_clock::now();
+  const auto granted = DrainBudget::shared().grant(_drainTime, begun);
+  _worker->stop(begun + granted);
   if (isCurrent()) {
     VESK_LOG_ERROR("VeskReporting: a session was destroyed by one of its callbacks");
     _thread.detach();
   } else {
     _thread.join();
+    const auto now = std::chrono::steady_clock::now();
+    DrainBudget::shared().spend(std::min<std::chrono::steady_clock::duration>(now - begun, granted), now);
   }
 }
 

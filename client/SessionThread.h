@@ -1,6 +1,7 @@
 // Owns the thread of one session.
 #pragma once
 
+#include <chrono>
 #include <cstdint>
 #include <memory>
 #include <thread>
@@ -26,6 +27,7 @@ class SessionThread {
 
  private:
   const std::uint64_t _mark;
+  const std::chrono::milliseconds _drainTime;
   const std::shared_ptr<SessionWorker> _worker;
   std::thread _thread;
 };

@@ -8,7 +8,6 @@
 #include <utility>
 
 #include "client/AggregationReceiver.h"
-#include "client/BoundedWait.h"
 #include "client/protocol/WireNames.h"
 #include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
@@ -39,31 +38,32 @@ std::string socketOf(const ReportingOptions& options) {
 }  // namespace
 
 SessionWorker::SessionWorker(const ReportingOptions& options)
-    : _drainTime(boundedWait(options.drainTime)),
-      _queue(options.maximumQueuedMessages, options.maximumQueuedBytes),
+    : _queue(options.maximumQueuedMessages, options.maximumQueuedBytes),
       _link(socketOf(options), ReconnectPolicy(options.firstReconnectWait, options.lastReconnectWait),
             std::make_shared<AggregationReceiver>(static_cast<ClientSessionReplyInterface&>(*this))) {}
 
-void SessionWorker::requestConnection(std::shared_ptr<CallEnd> end, ClientCall::Time deadline) {
+bool SessionWorker::requestConnection(std::shared_ptr<CallEnd> end, ClientCall::Time deadline) {
   {
     MutexLock lock(_mutex);
+    if (_hasEnded) return false;
     _newRequests.push_back({std::move(end), deadline});
   }
   _queue.wake();
+  return true;
 }
 
-void SessionWorker::stop() noexcept {
+void SessionWorker::stop(ClientCall::Time deadline) noexcept {
   // Closed first: once the thread knows that it has to end, nothing can get in behind its last look.
   _queue.close();
   {
     MutexLock lock(_mutex);
-    _newDrainDeadline = Clock::now() + _drainTime;
+    _newDrainDeadline = deadline;
   }
   _queue.wake();
 }
 
 void SessionWorker::run() noexcept {
-  while (!isFinished(Clock::now())) {
+  while (!isFinished(Clock::now()) && _queue.ownsItsDescriptors()) {
     try {
       step();
     } catch (const std::exception& error) {
@@ -73,6 +73,10 @@ void SessionWorker::run() noexcept {
     } catch (...) {
       VESK_LOG_ERROR("VeskReporting: an unknown exception");
     }
+  }
+  if (!_queue.ownsItsDescriptors()) {
+    VESK_LOG_ERROR("VeskReporting: the session has ended: its process has closed its descriptors");
+    _queue.close();
   }
   endEverything();
 }
@@ -112,6 +116,13 @@ void SessionWorker::endEverything() noexcept {
   _queue.takeAll(last);
   for (const ClientCall& call : last) close(call);
   endRequests(ReportingStatus::Closed, "");
+  std::vector<ConnectionRequest> late;
+  {
+    MutexLock lock(_mutex);
+    _hasEnded = true;
+    late.swap(_newRequests);
+  }
+  for (const ConnectionRequest& request : late) finish(request.end, ReportingStatus::Closed, nullptr, "");
 }
 
 // --- What comes in
@@ -142,7 +153,7 @@ void SessionWorker::tellOfDrops() noexcept {
 void SessionWorker::endOverdue(Time now) {
   std::erase_if(_requests, [&](const ConnectionRequest& request) {
     if (request.deadline > now) return false;
-    finish(request.end, ReportingStatus::NotConnected, nullptr, _link.problem());
+    finish(request.end, _link.problemStatus(), nullptr, _link.problem());
     return true;
   });
 
@@ -150,7 +161,7 @@ void SessionWorker::endOverdue(Time now) {
   if (!first || *first > now) return;
   std::vector<ClientCall> overdue;
   _waiting.moveOverdue(overdue, now, _callsInBus == 0);
-  auto status = _link.isReady() ? ReportingStatus::TimedOut : ReportingStatus::NotConnected;
+  auto status = _link.isReady() ? ReportingStatus::TimedOut : _link.problemStatus();
   for (const ClientCall& call : overdue) {
     if (call.call.member) {
       ++_callsGone;
@@ -204,7 +215,7 @@ void SessionWorker::linkHasChanged(DaemonLink::Change change) {
   if (_callsInBus > 0 && _waiting.front().wantsAnswer()) frontWasSent();
   _callsInBus = 0;
   _isHopeless = _drainDeadline && !_link.wasEverReady();
-  endRequests(ReportingStatus::NotConnected, _link.problem());
+  endRequests(_link.problemStatus(), _link.problem());
 }
 
 // A daemon that does not know who we are must not get a message: without memory to tell it, try again later.
@@ -267,6 +278,11 @@ void SessionWorker::sendTogether(Time now) {
 void SessionWorker::sendFront(Time now) {
   ClientCall& front = _waiting.front();
   BusClient::SendResult result;
+  if (front.descriptor && !front.descriptor.isOurs()) {
+    _drops.unsent();
+    finish(front.end, ReportingStatus::FileUnavailable, nullptr, "");
+    return frontHasLeft();
+  }
   if (front.wantsAnswer()) {
     auto left = std::chrono::ceil<std::chrono::milliseconds>(front.deadline - now);
     auto handler = [this, end = front.end, deadline = front.deadline](BusAnswer& answer) {

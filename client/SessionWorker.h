@@ -32,11 +32,12 @@ class SessionWorker final : private ClientSessionReplyInterface {
   CallQueue& queue() noexcept { return _queue; }
   DropCounters& drops() noexcept { return _drops; }
   bool isConnected() const noexcept { return _isConnected.load(std::memory_order_relaxed); }
-  /// Has the daemon reached now; `end` learns the outcome (Done or NotConnected). Throws std::bad_alloc.
-  void requestConnection(std::shared_ptr<CallEnd> end, ClientCall::Time deadline);
-  /// Lets `run` return once everything is sent, answered and taken by the daemon, at the latest after the
-  /// drain time. No further call gets into the queue.
-  void stop() noexcept;
+  /// Has the daemon reached now; `end` learns the outcome. False, and `end` learns nothing, when the thread
+  /// has ended. Throws std::bad_alloc.
+  [[nodiscard]] bool requestConnection(std::shared_ptr<CallEnd> end, ClientCall::Time deadline);
+  /// Lets `run` return once everything is sent, answered and taken by the daemon, at the latest at
+  /// `deadline`. No further call gets into the queue.
+  void stop(ClientCall::Time deadline) noexcept;
 
   /// The thread's body.
   void run() noexcept;
@@ -89,8 +90,6 @@ class SessionWorker final : private ClientSessionReplyInterface {
                            std::uint16_t category, std::uint16_t type,
                            const std::optional<Dictionary>& payload) override;
 
-  const std::chrono::milliseconds _drainTime;
-
   // Safe from any thread by themselves.
   CallQueue _queue;
   DropCounters _drops;
@@ -99,6 +98,7 @@ class SessionWorker final : private ClientSessionReplyInterface {
   Mutex _mutex;
   std::vector<ConnectionRequest> _newRequests VESK_GUARDED_BY(_mutex);
   std::optional<Time> _newDrainDeadline VESK_GUARDED_BY(_mutex);
+  bool _hasEnded VESK_GUARDED_BY(_mutex) = false;
 
   // The thread's own.
   DaemonLink _link;

@@ -79,7 +79,7 @@ ReportingStatus statusOf(const FileToUpload& file) noexcept {
 
 ClientCall makeUpload(FileToUpload& file) {
   ClientCall call = makeCall(wire::kUploadFile, std::move(file.url), IPCDescriptor{file.descriptor.get()});
-  call.descriptor = std::move(file.descriptor);
+  call.descriptor = GuardedDescriptor(std::move(file.descriptor));
   call.memory = std::max(call.memory, kMemoryOfDescriptor);
   return call;
 }

@@ -18,14 +18,36 @@
 #include "platform/powerlog/PowerLog.h"
 #include "platform/queue/TimedQueuePool.h"
 #include "platform/service/DescriptorLimit.h"
+#include "storebag/StorebagNaming.h"
 #include "util/Counters.h"
 
 namespace vesk {
 
 namespace {
 
+// A connection takes four descriptors, its dashboard one more; these are for posts, files and the rest.
+constexpr std::size_t kDescriptorsOfConnection = 4;
+constexpr std::size_t kOtherDescriptors = 256;
+
+// Lines of one place for one user in ten seconds.
+constexpr std::uint64_t kLogRateLimit = 200;
+
+/// As many connections as are wanted, or as the process's descriptors allow.
+std::size_t maximumConnections(std::size_t wanted) {
+  const std::size_t limit = descriptorLimit();
+  const std::size_t fitting = std::max<std::size_t>(
+      limit > kOtherDescriptors ? (limit - kOtherDescriptors) / kDescriptorsOfConnection : 0, 16);
+  if (limit == 0 || wanted <= fitting) return wanted;
+  VESK_LOG_WARNING("main: %zu descriptors are enough for %zu connections only", limit, fitting);
+  return fitting;
+}
+
 IPCListener::Options listenerOptions(ServiceManager& serviceManager) {
   IPCListener::Options options;
+  options.maximumConnections =
+      maximumConnections(preferenceNumberForKey("maxConnections", 1).value_or(options.maximumConnections));
+  options.maximumConnectionsPerUser =
+      preferenceNumberForKey("maxConnectionsPerUser", 1).value_or(options.maximumConnectionsPerUser);
   options.socketPath = pathUnderRoot(wire::kSocketPath);
   options.objectPath = wire::kObjectPath;
   options.inherited = serviceManager.takeListeningSocket();
@@ -105,7 +127,9 @@ struct Daemon::Parts {
 };
 
 Daemon::Daemon(ServiceManager& serviceManager, BusyMarker& busyMarker)
-    : _parts(std::make_unique<Parts>(serviceManager, busyMarker)) {}
+    : _parts(std::make_unique<Parts>(serviceManager, busyMarker)) {
+  SystemLog::setRateLimit(preferenceNumberForKey("logRateLimit", 0).value_or(kLogRateLimit));
+}
 
 Daemon::~Daemon() {
   if (!stop()) _parts->listener.stop();

@@ -1,6 +1,7 @@
 #include "storebag/StorebagNaming.h"
 
 #include <atomic>
+#include <charconv>
 #include <mutex>
 
 #include "platform/log/SystemLog.h"
@@ -79,6 +80,17 @@ std::optional<std::string> preferenceStringForKey(std::string_view key) {
   auto value = PreferencesSuite(kSuite).valueForKey(key);
   if (!value) return std::nullopt;
   return stringForm(*value);
+}
+
+std::optional<std::uint64_t> preferenceNumberForKey(std::string_view key, std::uint64_t least) {
+  auto text = preferenceStringForKey(key);
+  if (!text) return std::nullopt;
+  std::uint64_t number = 0;
+  auto [end, error] = std::from_chars(text->data(), text->data() + text->size(), number);
+  if (error == std::errc() && end == text->data() + text->size() && number >= least) return number;
+  VESK_LOG_WARNING("main: The preference %.*s is no number from %llu on and counts as absent",
+                   static_cast<int>(key.size()), key.data(), static_cast<unsigned long long>(least));
+  return std::nullopt;
 }
 
 std::string storebagServerBaseURLFor(const std::optional<std::string>& override, bool internalBuild) {

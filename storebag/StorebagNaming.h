@@ -33,6 +33,9 @@ std::int32_t currentEnvironmentType();
 /// A setting of the daemon's preferences suite as text (a number as decimal text), read afresh on each call.
 std::optional<std::string> preferenceStringForKey(std::string_view key);
 
+/// A setting that is a whole number from `least` on; logs an unusable one, which counts as absent.
+std::optional<std::uint64_t> preferenceNumberForKey(std::string_view key, std::uint64_t least);
+
 /// Where storebags are fetched from, without a trailing slash: `override`, verbatim, or the server for the
 /// kind of build.
 std::string storebagServerBaseURLFor(const std::optional<std::string>& override, bool internalBuild);

@@ -22,9 +22,7 @@ const Value* find(std::string_view backendName, const Dictionary& profile, std::
 }  // namespace
 
 void reportWrongType(std::string_view backendName, std::string_view key, const Value& value) {
-  if (!SystemLog::isOn(LogLevel::Warning)) return;
-  SystemLog::write(LogLevel::Warning,
-                   "%.*s: The storebag's value for '%.*s' has the wrong type and counts as absent: %s",
+  VESK_LOG_WARNING("%.*s: The storebag's value for '%.*s' has the wrong type and counts as absent: %s",
                    static_cast<int>(backendName.size()), backendName.data(), static_cast<int>(key.size()),
                    key.data(), describe(value, kShown).c_str());
 }

@@ -1,11 +1,14 @@
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <csignal>
 #include <future>
 
+#include "client/DrainBudget.h"
 #include "client/ReconnectPolicy.h"
+#include "platform/ipc/UnixSocket.h"
 #include "tests/support/ClientHarness.h"
 
 namespace vesk::test {
@@ -202,6 +205,89 @@ TEST_F(ClientOutage, AForkedProcessIsRefusedAndHarmsNothing) {
   EXPECT_EQ(session->sendMessageAndWait(7, 7).answer, "posted");
   EXPECT_EQ(record.count("message 6 6"), 0U);
   EXPECT_EQ(record.count("message 8 8"), kMayStartThreadsAfterFork ? 1U : 0U);
+}
+
+TEST_F(ClientOutage, SaysThatTheDaemonHasTooManyConnections) {
+  daemon.emplace(socket, record, 1);
+  std::optional<VeskReporting> first(std::in_place, options());
+  ASSERT_TRUE(first->connect());
+  VeskReporting second(options());
+  auto refused = second.connect();
+  EXPECT_EQ(refused.status, ReportingStatus::TooManyConnections);
+  EXPECT_EQ(refused.detail, socket + ": the daemon takes no more");
+  EXPECT_EQ(second.fetchDisplayURL(10ms).status, ReportingStatus::TooManyConnections);
+  first.reset();
+  EXPECT_TRUE(second.fetchDisplayURL()) << "by itself, once there is room";
+}
+
+/// Runs `body` in a process of its own, which has a minute.
+void expectToEnd(const std::function<bool()>& body) {
+  if (!kMayStartThreadsAfterFork) GTEST_SKIP();
+  const pid_t child = ::fork();
+  if (child == 0) {
+    ::alarm(60);
+    ::_exit(body() ? 0 : 1);
+  }
+  int status = -1;
+  ASSERT_EQ(::waitpid(child, &status, 0), child);
+  EXPECT_EQ(status, 0);
+}
+
+TEST_F(ClientOutage, AHostThatClosesAllDescriptorsNeitherHangsNorGetsAnythingInItsFiles) {
+  daemon.emplace(socket, record);
+  record.holdsAnswers = true;
+  const std::string file = directory.write("uploaded", "contents");
+  expectToEnd([&] {
+    auto session = std::make_unique<VeskReporting>(options());
+    VeskReporting idle(options());
+    if (!session->connect() || !idle.connect()) return false;
+    auto answer = std::async(std::launch::async, [&] { return session->fetchDisplayURL(1h); });
+    while (!session->isConnected()) std::this_thread::yield();
+    if (session->uploadFile(file, nullptr) != ReportingStatus::Queued) return false;
+    ::closefrom(3);
+    std::vector<FileDescriptor> own;
+    for (int i = 0; i < 20; ++i) {
+      own.emplace_back(::open((directory / ("own" + std::to_string(i))).c_str(), O_RDWR | O_CREAT, 0600));
+    }
+    std::ignore = idle.sendMessage(1, 1);
+    std::ignore = session->sendMessage(1, 1);
+    bool areRefused = answer.get().status == ReportingStatus::Closed &&
+                      session->fetchDisplayURL(1h).status == ReportingStatus::Closed &&
+                      session->connect(1h).status == ReportingStatus::Closed;
+    session.reset();
+    bool areUntouched = std::all_of(own.begin(), own.end(), [](const FileDescriptor& descriptor) {
+      struct stat status {};
+      return ::fstat(descriptor.get(), &status) == 0 && status.st_size == 0;
+    });
+    return areRefused && areUntouched;
+  });
+}
+
+TEST_F(ClientOutage, ManySessionsOfAProcessShareOneDrainTime) {
+  DrainBudget budget;
+  const DrainBudget::Clock::time_point now{1h};
+  EXPECT_EQ(budget.grant(2s, now), 2s);
+  budget.spend(2s, now);
+  for (int i = 0; i < 20; ++i) {
+    EXPECT_EQ(budget.grant(2s, now), DrainBudget::kLeast);
+    budget.spend(DrainBudget::kLeast, now);
+  }
+  EXPECT_EQ(budget.grant(2s, now + 1500ms), 1500ms);
+  EXPECT_EQ(budget.grant(2s, now + 2s), 2s);
+  EXPECT_EQ(budget.grant(0s, now), 0s);
+
+  FileDescriptor hung(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));  // accepts nobody
+  UnixSocketAddress address(directory / "hung");
+  ASSERT_EQ(::bind(hung.get(), address.get(), address.size()), 0);
+  ASSERT_EQ(::listen(hung.get(), 8), 0);
+  expectToEnd([&] {
+    auto patient = options();
+    patient.socketPath = directory / "hung";
+    patient.drainTime = 1h;
+    DrainBudget::shared().spend(1h, DrainBudget::Clock::now());
+    VeskReporting session(patient);
+    return session.sendMessage(1, 1) == ReportingStatus::Queued;
+  });
 }
 
 TEST(ReconnectPolicy, WaitsTwiceAsLongAfterEachFailureAndAllowsOneEarlyAttemptAWait) {

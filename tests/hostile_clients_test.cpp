@@ -52,7 +52,7 @@ void connect(const DaemonHarness& harness, uid_t user, int count, std::vector<Ra
   for (int i = 0; i < count; ++i) {
     RawClient client(harness.socketPath());
     client.send("\0AUTH EXTERNAL\r\nDATA\r\nBEGIN\r\n"sv);
-    if (!client.line().empty()) open.push_back(std::move(client));
+    if (client.line() == "DATA") open.push_back(std::move(client));
   }
   ASSERT_EQ(::seteuid(::getuid()), 0);
 }
@@ -65,19 +65,44 @@ TEST(HostileClients, ConnectionsInExcessAreClosedAndTheOthersGoOn) {
   {
     RoadClient first(harness);
     std::vector<RawClient> open;
-    connect(harness, ::geteuid(), 300, open);
-    EXPECT_EQ(open.size(), 255u) << "256 of one user, with the first";
-    EXPECT_TRUE(harness.daemon().waitForText("Refused a connection of user"));
+    raiseDescriptorLimit();
+    connect(harness, ::geteuid(), kIsSanitized ? 63 : 1100, open);
+    EXPECT_EQ(open.size(), kIsSanitized ? 63u : 1023u) << "1,024 of one user, with the first";
+    EXPECT_TRUE(kIsSanitized || harness.daemon().waitForText("Refused a connection of user"));
     // As somebody else one can come only from the superuser; the sanitizers need too much for each thread.
     if (::geteuid() == 0 && !kIsSanitized) {
-      raiseDescriptorLimit();
+      open.erase(open.begin(), open.begin() + 100);
       for (uid_t user = 60'001; user <= 60'020; ++user) connect(harness, user, 250, open);
-      EXPECT_EQ(open.size(), 4095u);
+      EXPECT_EQ(open.size(), 4079u);
+      connect(harness, ::geteuid(), 50, open);
+      EXPECT_EQ(open.size(), 4095u) << "the last sixteen are root's";
     }
     EXPECT_TRUE(first.reporting.sendMessageAndWait(message(3)));
     harness.waitForEventsOfMethod(3, 1);
   }
   aftermath.expectNothingLeft();
+}
+
+TEST(HostileClients, AFloodOfWarningsIsCutShortWithTheNumberLeftOut) {
+  for (std::size_t limit : {200, 0, 7}) {
+    DaemonHarness harness;
+    if (limit != 200) harness.setPreference("logRateLimit", std::to_string(limit));
+    harness.startDaemon({"--log-level", "6"});
+    {
+      RoadClient client(harness);
+      MutableDictionary wide;
+      for (int i = 0; i < 1000; ++i) wide.append(Text(std::to_string(i)), Bytes(std::string(1, 'x')));
+      EXPECT_TRUE(client.reporting.sendMessageAndWait(message(3, wide.share())));
+      harness.waitForEventsOfMethod(3, 1);
+    }
+    EXPECT_EQ(harness.stopDaemon(), 0);
+    const std::string log = harness.daemon().errors();
+    std::size_t lines = 0;
+    for (std::size_t at = 0; (at = log.find("unable to handle key: ", at)) != log.npos; ++at) ++lines;
+    EXPECT_EQ(lines, limit > 0 ? limit + 1 : 1000) << "with the one that tells the number";
+    const std::string last = "log: Left out " + std::to_string(1000 - limit) + " lines of user ";
+    EXPECT_EQ(log.find(last) != log.npos, limit > 0);
+  }
 }
 
 const std::vector<Value> kStrangeValues{

@@ -77,17 +77,6 @@ TEST(IPCConnection, DropsWrongOneWayCallsWithOneLineABurst) {
   EXPECT_EQ(service.journal.count("message"), 0u);
 }
 
-TEST(IPCConnection, TakesAnAnswerFromAnotherThread) {
-  TestService service;
-  TestClient client(service);
-  std::thread other([&] {
-    ASSERT_TRUE(service.journal.waitFor("message 4"));
-    service.session()->kept(std::string("later"));
-  });
-  EXPECT_EQ(client.call("sendMessageWithDictionary", message(4, "keep")), "later");
-  other.join();
-}
-
 TEST(IPCConnection, TellsWhatThereIs) {
   TestService service;
   TestClient client(service);
@@ -201,20 +190,6 @@ TEST(IPCConnection, GivesTheClientTheLastWordOfASessionThatIsSentAway) {
   EXPECT_EQ(service.journal.lines().back(), "destroyed");
 }
 
-TEST(IPCConnection, RunsNoHandlerWhenItIsNeverResumed) {
-  for (auto accept : {TestService::Accept::Refuse, TestService::Accept::NotResume}) {
-    TestService service;
-    service.accept = accept;
-    RawClient client(service);
-    EXPECT_TRUE(service.journal.waitFor("accepted"));
-    service.listener().stop();
-    EXPECT_TRUE(client.isClosed());
-    EXPECT_EQ(service.journal.count("destroyed"), 1u);
-    EXPECT_EQ(service.journal.count("invalidated"), 0u);
-    EXPECT_EQ(service.listener().connectionCount(), 0u);
-  }
-}
-
 TEST(IPCListener, LeavesNeitherThreadNorDescriptorBehind) {
   { TestService first; }  // with it comes what stays: a sanitizer's own thread
   const ProcessFacts facts(::getpid());
@@ -286,15 +261,6 @@ TEST(IPCListener, ServesAnInheritedSocketAndAPathLongerThanAnAddress) {
     EXPECT_EQ(client.call("flushMessagesWithReply"), "posted all");
   }
   EXPECT_TRUE(std::filesystem::exists(path)) << "it is the service manager's";
-}
-
-TEST(IPCReply, ThatCanNotBeSentIsAbandoned) {
-  bool abandoned = false;
-  {
-    Reply<int> reply([](int) { throw std::bad_alloc(); }, [&] { abandoned = true; });
-    EXPECT_THROW(reply(1), std::bad_alloc);
-  }
-  EXPECT_TRUE(abandoned);
 }
 
 }  // namespace

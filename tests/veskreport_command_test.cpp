@@ -6,6 +6,7 @@
 #include <csignal>
 #include <sstream>
 
+#include "platform/ipc/UnixSocket.h"
 #include "tests/support/ChildProcess.h"
 #include "tests/support/RecordingDaemon.h"
 #include "tests/support/TempDirectory.h"
@@ -216,6 +217,16 @@ TEST_F(VeskreportCommand, SaysThatNoDaemonIsThere) {
   EXPECT_EQ(outcome.errors, "veskreport: no daemon at " + root +
                                 "/run/veskreportingd/com.corvane.veskreportingd: is veskreportingd running? "
                                 "(No such file or directory)\n");
+}
+
+TEST_F(VeskreportCommand, SaysThatTheDaemonHasTooManyConnections) {
+  const std::string socket = root + "/run/veskreportingd/com.corvane.veskreportingd";
+  daemon.reset();
+  daemon.emplace(socket, record, 1);
+  const FileDescriptor first = connectUnixSocket(socket);
+  auto outcome = runClient({"states"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.errors, "veskreport: too many connections: " + socket + ": the daemon takes no more\n");
 }
 
 TEST_F(VeskreportCommand, ObeysTheEnvironmentUnlessItIsSetuid) {

@@ -5,6 +5,7 @@
 #include <new>
 #include <string>
 
+#include "platform/log/LogUser.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
@@ -63,6 +64,7 @@ HTTPExchange::HTTPExchange(HTTPRequest&& wanted, HTTPClient::Completion&& comple
     : request(std::move(wanted)),
       started(now),
       _cost(costOf(request)),
+      _user(LogUser::current()),
       _completion(std::move(completion)),
       _outstanding(outstanding) {
   _outstanding.add();
@@ -82,6 +84,7 @@ std::string_view HTTPExchange::host() const noexcept {
 
 void HTTPExchange::complete(HTTPResult result) noexcept {
   // What it captured is destroyed with it, here.
+  LogUser onBehalfOf(_user);
   auto completion = std::exchange(_completion, nullptr);
   if (completion) runCompletion(completion, std::move(result));
 }

@@ -64,6 +64,7 @@ class HTTPExchange {
 
  private:
   const std::size_t _cost;
+  const std::uint32_t _user;  // on whose behalf it was made
   HTTPClient::Completion _completion;
   HTTPOutstanding& _outstanding;
 };

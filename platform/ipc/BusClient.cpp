@@ -1,19 +1,24 @@
 #include "platform/ipc/BusClient.h"
 
+#include <fcntl.h>
 #include <poll.h>
 #include <sys/socket.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <climits>
 #include <deque>
 #include <list>
+#include <system_error>
 
+#include "platform/files/GuardedDescriptor.h"
 #include "platform/ipc/BusCodec.h"
 #include "platform/ipc/BusHandles.h"
 #include "platform/ipc/BusReplies.h"
 #include "platform/ipc/CallRouter.h"
 #include "platform/ipc/OneWayOutbox.h"
 #include "platform/ipc/UnixSocket.h"
+#include "platform/ipc/WireFormat.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
@@ -28,6 +33,15 @@ constexpr int kMaximumSteps = 64;
 
 // The wire adds less than three times as much to what counts as content.
 constexpr std::size_t kSurelyShort = OneWayEncoder::kMaximumMessage / 4;
+
+/// Whether the daemon has said on `socket`, in place of authentication, that it has too many connections.
+/// Takes nothing from the socket. `isSilent` when nothing is there to read.
+bool isTurnedAway(int socket, bool& isSilent) {
+  char line[kTooManyConnections.size()];
+  const ssize_t size = ::recv(socket, line, sizeof line, MSG_PEEK | MSG_DONTWAIT);
+  isSilent = size < 0 && errno == EAGAIN;
+  return size > 0 && std::string_view(line, static_cast<std::size_t>(size)) == kTooManyConnections;
+}
 
 struct SlotReleaser {
   void operator()(sd_bus_slot* slot) const noexcept { sd_bus_slot_unref(slot); }
@@ -57,6 +71,7 @@ class BusClient::Implementation {
   std::size_t addedBytes() const { return _outbox.bytes(); }
   std::size_t queuedMessages() const;
   bool isReady() const { return _bus && sd_bus_is_ready(_bus.get()) > 0; }
+  bool wasTurnedAway() const { return _wasTurnedAway; }
   int fd() const { return _bus ? sd_bus_get_fd(_bus.get()) : -1; }
   short events() const;
   int timeout() const;
@@ -82,18 +97,22 @@ class BusClient::Implementation {
   bool write(sd_bus_message* message, PendingList::iterator pending, std::chrono::milliseconds timeout);
   void sendDeferred();
   std::size_t queuedByBus() const;
+  bool step(int& result);
   static int answered(sd_bus_message* message, void* pending, sd_bus_error* error) noexcept;
   static void call(AnswerHandler& handler, BusAnswer answer) noexcept;
+  bool hasEnded() const { return !_bus || !_socket.isAt(fd()) || sd_bus_is_open(_bus.get()) <= 0; }
   void end() noexcept;
 
   const std::string _objectPath;
   const std::shared_ptr<BusReplies> _replies;
   CallRouter _router;
   BusHandle _bus;  // none once the connection has ended
+  const DescriptorIdentity _socket;
   PendingList _pending;
   std::deque<Deferred> _deferred;
   OneWayOutbox _outbox;
   bool _hasMore = false;
+  bool _wasTurnedAway = false;
 };
 
 BusClient::Implementation::Implementation(Options options)
@@ -101,9 +120,17 @@ BusClient::Implementation::Implementation(Options options)
       _replies(std::make_shared<BusReplies>(nullptr)),
       _router(_objectPath, "client", _replies, {}),
       _bus(newBus(options.connected ? std::move(options.connected) : connectUnixSocket(options.socketPath))),
+      _socket(fd()),
       _outbox(_objectPath) {
   _replies->open(_bus.get());
-  checkBus(sd_bus_start(_bus.get()), "sd_bus_start");
+  // sd-bus closes its own when the daemon has closed the other end already.
+  const FileDescriptor socket(::fcntl(fd(), F_DUPFD_CLOEXEC, 0));
+  const int started = sd_bus_start(_bus.get());
+  bool isSilent = false;
+  if (started < 0 && isTurnedAway(socket.get(), isSilent)) {
+    throw std::system_error(EUSERS, std::generic_category(), "connect");
+  }
+  checkBus(started, "sd_bus_start");
 }
 
 CodecResult BusClient::Implementation::addArguments(sd_bus_message* message,
@@ -117,7 +144,7 @@ CodecResult BusClient::Implementation::addArguments(sd_bus_message* message,
 
 BusClient::SendResult BusClient::Implementation::send(const IPCOutgoingCall& call, AnswerHandler handler,
                                                       std::chrono::milliseconds timeout) {
-  if (!_bus || sd_bus_is_open(_bus.get()) <= 0) return SendResult::Disconnected;
+  if (hasEnded()) return SendResult::Disconnected;
   BusMessageHandle message = newCall(_bus.get(), _objectPath, call, static_cast<bool>(handler));
   if (!message) return SendResult::Disconnected;
   CodecResult result = addArguments(message.get(), call);
@@ -159,7 +186,7 @@ BusClient::SendResult BusClient::Implementation::add(const IPCOutgoingCall& call
 BusClient::Progress BusClient::Implementation::writeAdded() {
   if (!_bus) return Progress::Disconnected;
   if (_outbox.empty() || queuedByBus() > 0) return Progress::Connected;
-  if (!_outbox.write(fd())) {
+  if (hasEnded() || !_outbox.write(fd())) {
     end();
     return Progress::Disconnected;
   }
@@ -229,19 +256,41 @@ int BusClient::Implementation::timeout() const {
   return static_cast<int>(std::clamp<long long>(left, 0, INT_MAX));
 }
 
+/// False when the connection has ended. `result`: 0 when there was nothing to do.
+bool BusClient::Implementation::step(int& result) {
+  if (!isReady()) {
+    // sd-bus would take an answer that it does not know and say nothing of it.
+    bool isSilent = false;
+    _wasTurnedAway = isTurnedAway(fd(), isSilent);
+    if (_wasTurnedAway) return false;
+    if (isSilent && (events() & POLLOUT) == 0) return true;
+  }
+  const bool wasReady = isReady();
+  const int socket = fd();
+  sd_bus_message* raw = nullptr;
+  result = sd_bus_process(_bus.get(), &raw);
+  BusMessageHandle message(raw);
+  if (message) _router.route(raw);
+  if (result >= 0 && sd_bus_is_open(_bus.get()) > 0) return true;
+  bool isSilent = false;
+  _wasTurnedAway = !wasReady && isTurnedAway(socket, isSilent);
+  return false;
+}
+
 BusClient::Progress BusClient::Implementation::process() {
   if (!_bus) return Progress::Disconnected;
+  if (hasEnded()) {
+    end();
+    return Progress::Disconnected;
+  }
   _hasMore = false;
   if (writeAdded() == Progress::Disconnected) return Progress::Disconnected;
   // In the middle of a message nothing else may be written. sd-bus itself writes only what we ask for and
   // answers to calls that want one, which the daemon does not make.
   if (!_outbox.insideMessage()) _replies->sendWaiting();
-  for (int step = 0; step < kMaximumSteps; ++step) {
-    sd_bus_message* raw = nullptr;
-    int result = sd_bus_process(_bus.get(), &raw);
-    BusMessageHandle message(raw);
-    if (message) _router.route(raw);
-    if (result < 0 || sd_bus_is_open(_bus.get()) <= 0) {
+  for (int steps = 0; steps < kMaximumSteps; ++steps) {
+    int result = 0;
+    if (!step(result)) {
       end();
       return Progress::Disconnected;
     }
@@ -260,7 +309,14 @@ void BusClient::Implementation::end() noexcept {
   for (auto& pending : owed) pending.slot.reset();
   // A process forked from this one may hold the socket too, and would keep the session alive in the daemon.
   // In that process sd-bus gives no descriptor.
-  if (int socket = fd(); socket >= 0) ::shutdown(socket, SHUT_RDWR);
+  const int socket = fd();
+  if (socket >= 0 && !_socket.isAt(socket)) {
+    // The host has closed the socket, and the number may be its own by now: sd-bus would close that, so it is
+    // never let go.
+    static_cast<void>(_bus.release());
+  } else if (socket >= 0) {
+    ::shutdown(socket, SHUT_RDWR);
+  }
   _bus.reset();
   for (auto& pending : owed) {
     call(pending.handler, BusAnswer(SD_BUS_ERROR_DISCONNECTED, "The connection has ended"));
@@ -291,6 +347,7 @@ std::size_t BusClient::addedBytes() const { return _implementation->addedBytes()
 
 std::size_t BusClient::queuedMessages() const { return _implementation->queuedMessages(); }
 bool BusClient::isReady() const { return _implementation->isReady(); }
+bool BusClient::wasTurnedAway() const { return _implementation->wasTurnedAway(); }
 int BusClient::fd() const { return _implementation->fd(); }
 short BusClient::events() const { return _implementation->events(); }
 int BusClient::timeout() const { return _implementation->timeout(); }

@@ -70,7 +70,7 @@ class BusClient {
   using AnswerHandler = std::function<void(BusAnswer& answer)>;
 
   /// Connects. Throws std::system_error: ENOENT or ECONNREFUSED when no daemon is there, EAGAIN when too many
-  /// others wait to be accepted.
+  /// others wait to be accepted, EUSERS when too many are connected.
   explicit BusClient(Options options);
   ~BusClient();
 
@@ -95,6 +95,8 @@ class BusClient {
   std::size_t queuedMessages() const;
   /// Whether authentication is done.
   bool isReady() const;
+  /// Disconnected because the daemon has too many connections.
+  bool wasTurnedAway() const;
 
   int fd() const;
   short events() const;

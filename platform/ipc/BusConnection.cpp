@@ -1,6 +1,7 @@
 #include "platform/ipc/BusConnection.h"
 
 #include "platform/ipc/ExtensionTokens.h"
+#include "platform/log/LogUser.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
@@ -77,6 +78,7 @@ void BusConnection::end() {
     if (std::exchange(_started, true)) return;
   }
   _outbox.close();
+  LogUser onBehalfOf(_peer.user);
   dropHandlers();
   close();
 }
@@ -91,6 +93,7 @@ void BusConnection::callRemoteObject(IPCOutgoingCall call,
 }
 
 void BusConnection::run() noexcept {
+  LogUser onBehalfOf(_peer.user);
   try {
     ConnectionLoop loop(_socket.get(), _peer, _name, _settings, _outbox, *_wakeup, *_replies, _router);
     finish(loop.serve(_invalidated), &loop);

@@ -6,6 +6,7 @@
 #include <cstring>
 #include <system_error>
 
+#include "platform/ipc/DescriptorCall.h"
 #include "platform/ipc/WireFormat.h"
 
 namespace vesk {
@@ -31,8 +32,15 @@ std::vector<FileDescriptor> takeDescriptors(msghdr& header) {
 
 }  // namespace
 
-BusRelay::BusRelay(int socket, uid_t peer, std::size_t maximumMessage, OneWayHandler oneWay)
-    : _socket(socket), _authentication(peer), _messages(maximumMessage), _oneWay(std::move(oneWay)) {
+static_assert(kMaximumDescriptorCall <= BusRelay::kPiece, "such a call is held whole");
+
+BusRelay::BusRelay(int socket, uid_t peer, std::string objectPath, std::size_t maximumMessage,
+                   OneWayHandler oneWay)
+    : _socket(socket),
+      _objectPath(std::move(objectPath)),
+      _authentication(peer),
+      _messages(maximumMessage),
+      _oneWay(std::move(oneWay)) {
   int ends[2];
   if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends) != 0) {
     throw std::system_error(errno, std::generic_category(), "socketpair");
@@ -68,38 +76,54 @@ BusRelay::Outcome BusRelay::receive(Received& received) {
 }
 
 BusRelay::Outcome BusRelay::takeIn() {
-  // What came together with BEGIN is looked at before more is read.
-  if (hasHeldMessages()) return passMessages(std::exchange(_early, {}));
+  // What is held unseen is looked at before more is read.
+  if (hasHeldMessages()) return passMessages();
   Received received;
   auto outcome = receive(received);
   if (outcome != Outcome::Fed) return outcome;
-  _held += received.bytes;
+  const std::size_t heldBefore = std::exchange(_held, _held + received.bytes);
   _received += received.bytes;
-  return _hasBegun ? passMessages(std::move(received.descriptors))
-                   : authenticate(std::move(received.descriptors));
+  if (!_hasBegun) {
+    outcome = authenticate();
+    // A message that was read together with BEGIN may have brought descriptors.
+    bool isEarly = !received.descriptors.empty() && (!_hasBegun || _held == 0);
+    if (isEarly) return refuse("a descriptor before authentication");
+    return attach(std::move(received.descriptors), 0) ? outcome : refuse("descriptors within a message");
+  }
+  if (!attach(std::move(received.descriptors), heldBefore)) return refuse("descriptors within a message");
+  return passMessages();
 }
 
-BusRelay::Outcome BusRelay::authenticate(std::vector<FileDescriptor> descriptors) {
+BusRelay::Outcome BusRelay::authenticate() {
   auto result = _authentication.pass(held());
   if (result.verdict == AuthenticationGate::Verdict::Refused) return refuse("no D-Bus authentication");
   if (!write(result.passedOn)) return refuse("internal failure");
   keepFrom(result.taken);
   _hasBegun = result.verdict == AuthenticationGate::Verdict::Begun;
-  _cameWithBegin = _hasBegun && _held >= kFixedHeader;
-  if (!descriptors.empty()) {
-    // They may belong to a message that was read together with BEGIN.
-    if (!_hasBegun || _held == 0) return refuse("a descriptor before authentication");
-    (hasHeldMessages() ? _early : _descriptors) = std::move(descriptors);
-  }
+  _hasUnseen = _hasBegun && _held >= kFixedHeader;
   return result.passedOn.empty() ? Outcome::Nothing : Outcome::Fed;
 }
 
+/// A read ends with the piece that descriptors came with, and every D-Bus library sends them along with the
+/// first byte of their message: so it is the last message that has begun. False when none has begun in that
+/// read.
+bool BusRelay::attach(std::vector<FileDescriptor> descriptors, std::size_t heldBefore) {
+  if (descriptors.empty()) return true;
+  MessageGate ahead = _messages;
+  auto result = ahead.pass(held());
+  if (result.passed == _held && !result.lastStart) return false;
+  const std::size_t start = result.passed < _held ? result.passed : *result.lastStart;
+  if (start < heldBefore) return false;
+  _attached.push_back({start, std::move(descriptors)});
+  return true;
+}
+
 /// How many bytes at the front have been served.
-std::size_t BusRelay::serveOneWayCalls() {
+std::size_t BusRelay::serveOneWayCalls(std::string_view messages) {
   std::size_t served = 0;
   // What has been handed to sd-bus before has been processed, so the order is kept.
-  while (!_messages.insideMessage() && _held - served >= kFixedHeader) {
-    auto rest = held().substr(served);
+  while (!_messages.insideMessage() && messages.size() - served >= kFixedHeader) {
+    auto rest = messages.substr(served);
     auto size = MessageGate::messageSize(rest);
     if (!size || *size > rest.size() || !OneWayDecoder::mayDecode(rest, *size)) break;
     if (!_oneWay(rest.substr(0, *size))) break;
@@ -115,47 +139,48 @@ bool BusRelay::waitsForOneWayCall() const {
   return size && *size > _held && OneWayDecoder::mayDecode(held(), *size);
 }
 
-BusRelay::Outcome BusRelay::passMessages(std::vector<FileDescriptor> descriptors) {
-  _cameWithBegin = false;
-  bool hasServed = false;
-  if (descriptors.empty() && _descriptors.empty()) {
-    std::size_t served = serveOneWayCalls();
-    hasServed = served > 0;
-    keepFrom(served);
-    if (_held == 0 || waitsForOneWayCall()) return hasServed ? Outcome::Served : Outcome::Nothing;
-  }
-  auto result = _messages.pass(held());
-  std::size_t split = result.passed;
-  auto now = std::exchange(_descriptors, {});
-  if (!now.empty()) {
-    // They belong to the message whose header was held until now, at the front.
-    if (!descriptors.empty()) return refuse("descriptors within a message");
-    if (!result.lastStart) {
-      _descriptors.swap(now);
-    } else {
-      split = 0;
-    }
-  } else if (!descriptors.empty()) {
-    // A read ends with the piece that descriptors came with, and every D-Bus library sends them along with
-    // the first byte of their message: so it is the last message that has begun.
-    if (result.passed < _held) {
-      _descriptors = std::move(descriptors);
-    } else if (result.lastStart) {
-      split = *result.lastStart;
-      now = std::move(descriptors);
-    } else {
-      return refuse("descriptors within a message");
-    }
-  }
-  auto passed = held().substr(0, result.passed);
-  if (!write(passed.substr(0, split)) || !write(passed.substr(split), std::move(now))) {
-    return refuse("internal failure");
-  }
+BusRelay::Outcome BusRelay::passMessages() {
+  _hasUnseen = false;
+  if (_attached.empty()) return passOrdinary(_held);
+  if (_attached.front().start == 0) return passDescriptorCall();
+  auto outcome = passOrdinary(_attached.front().start);
+  _hasUnseen = outcome != Outcome::BrokenOff;
+  return outcome;
+}
+
+/// Passes what is held up to `end`, where a message starts that comes with descriptors, or all of it.
+BusRelay::Outcome BusRelay::passOrdinary(std::size_t end) {
+  const std::size_t served = serveOneWayCalls(held().substr(0, end));
+  keepFrom(served);
+  end -= served;
+  const auto idle = served > 0 ? Outcome::Served : Outcome::Nothing;
+  if (end == 0 || waitsForOneWayCall()) return idle;
+  auto result = _messages.pass(held().substr(0, end));
+  if (!write(held().substr(0, result.passed))) return refuse("internal failure");
   keepFrom(result.passed);
   if (result.verdict == MessageGate::Verdict::TooLarge) return refuse("a message over the size limit");
   if (result.verdict == MessageGate::Verdict::Malformed) return refuse("no D-Bus message");
-  if (result.passed > 0) return Outcome::Fed;
-  return hasServed ? Outcome::Served : Outcome::Nothing;
+  return result.passed > 0 ? Outcome::Fed : idle;
+}
+
+/// The message at the front came with descriptors: passes it once it is held whole.
+BusRelay::Outcome BusRelay::passDescriptorCall() {
+  if (_held < kFixedHeader) return Outcome::Nothing;
+  auto size = MessageGate::messageSize(held());
+  if (!size) return refuse("no D-Bus message");
+  if (*size > kMaximumDescriptorCall) return refuse("a message with descriptors over the size limit");
+  if (*size > _held) return Outcome::Nothing;
+  auto message = held().substr(0, *size);
+  auto descriptors = std::move(_attached.front().descriptors);
+  _attached.erase(_attached.begin());
+  if (!isDescriptorCall(message, _objectPath, descriptors.size())) {
+    return refuse("descriptors that its call does not take");
+  }
+  _messages.pass(message);
+  if (!write(message, std::move(descriptors))) return refuse("internal failure");
+  keepFrom(*size);
+  _hasUnseen = _held > 0;
+  return Outcome::Fed;
 }
 
 bool BusRelay::write(std::string_view data, std::vector<FileDescriptor> descriptors) {
@@ -206,6 +231,7 @@ bool BusRelay::passOut() {
 
 void BusRelay::keepFrom(std::size_t offset) {
   _held -= offset;
+  for (Attached& attached : _attached) attached.start -= offset;
   if (_held > 0) std::memmove(_buffer.data(), _buffer.data() + offset, _held);
 }
 

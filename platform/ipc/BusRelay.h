@@ -4,6 +4,7 @@
 #include <array>
 #include <cstddef>
 #include <functional>
+#include <string>
 #include <string_view>
 #include <vector>
 
@@ -15,10 +16,11 @@
 namespace vesk {
 
 /// sd-bus takes messages of up to 128 MiB, any number of descriptors along with each, and drops a broken
-/// message without a word to read on at once, all of that within one call; and an answer that finds its
-/// client gone takes the messages with it that the client had sent before it went. So sd-bus does not have a
-/// client's socket but the inner end of a socket pair. What has passed the gates is written into it, and what
-/// sd-bus answers is taken out of it. Many small messages cross in one read and one write. For the
+/// message without a word, and its descriptors stay open for good; it reads on at once, all of that within
+/// one call; and an answer that finds its client gone takes the messages with it that the client had sent
+/// before it went. So sd-bus does not have a client's socket but the inner end of a socket pair. What has
+/// passed the gates is written into it, and what sd-bus answers is taken out of it. Descriptors pass only
+/// with a whole call that takes them. Many small messages cross in one read and one write. For the
 /// connection's thread.
 class BusRelay {
  public:
@@ -39,8 +41,9 @@ class BusRelay {
     BrokenOff  ///< it broke off, or was refused: see `complaint`
   };
 
-  /// Borrows `socket` (not blocking). Throws std::system_error.
-  BusRelay(int socket, uid_t peer, std::size_t maximumMessage, OneWayHandler oneWay);
+  /// Borrows `socket` (not blocking). Descriptors are for the object at `objectPath`. Throws
+  /// std::system_error.
+  BusRelay(int socket, uid_t peer, std::string objectPath, std::size_t maximumMessage, OneWayHandler oneWay);
 
   /// The end for sd-bus; to be taken once.
   FileDescriptor takeInnerEnd() { return std::move(_inner); }
@@ -56,7 +59,7 @@ class BusRelay {
   /// Whether the client has said BEGIN: all that follows are messages.
   bool hasBegun() const noexcept { return _hasBegun; }
   /// Whether `takeIn` has work although the socket may have nothing to read.
-  bool hasHeldMessages() const noexcept { return _cameWithBegin; }
+  bool hasHeldMessages() const noexcept { return _hasUnseen; }
   bool insideMessage() const noexcept { return _held > 0 || _messages.insideMessage(); }
   /// Messages handed to sd-bus so far, whole.
   std::uint64_t finishedMessages() const noexcept { return _messages.finished(); }
@@ -71,10 +74,19 @@ class BusRelay {
     std::vector<FileDescriptor> descriptors{};
   };
 
+  /// Descriptors, and where the message that they came with starts in the buffer.
+  struct Attached {
+    std::size_t start;
+    std::vector<FileDescriptor> descriptors;
+  };
+
   Outcome receive(Received& received);
-  Outcome authenticate(std::vector<FileDescriptor> descriptors);
-  Outcome passMessages(std::vector<FileDescriptor> descriptors);
-  std::size_t serveOneWayCalls();
+  Outcome authenticate();
+  bool attach(std::vector<FileDescriptor> descriptors, std::size_t heldBefore);
+  Outcome passMessages();
+  Outcome passOrdinary(std::size_t end);
+  Outcome passDescriptorCall();
+  std::size_t serveOneWayCalls(std::string_view messages);
   bool waitsForOneWayCall() const;
   Outcome refuse(const char* complaint);
   bool write(std::string_view data, std::vector<FileDescriptor> descriptors = {});
@@ -82,16 +94,16 @@ class BusRelay {
   std::string_view held() const { return {_buffer.data(), _held}; }
 
   const int _socket;
+  const std::string _objectPath;
   FileDescriptor _inner;
   FileDescriptor _outer;
   AuthenticationGate _authentication;
   MessageGate _messages;
   const OneWayHandler _oneWay;
   bool _hasBegun = false;
-  bool _cameWithBegin = false;  // what is held has not been looked at
+  bool _hasUnseen = false;  // what is held has not been looked at
   const char* _complaint = nullptr;
-  std::vector<FileDescriptor> _early;        // came with the messages that are held behind BEGIN
-  std::vector<FileDescriptor> _descriptors;  // of the message whose header is held
+  std::vector<Attached> _attached;  // in the order of their messages
   std::size_t _received = 0;
   std::size_t _held = 0;  // bytes at the front of the buffer that wait for more
   std::array<char, kPiece> _buffer;

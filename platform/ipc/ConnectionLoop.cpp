@@ -53,7 +53,7 @@ ConnectionLoop::ConnectionLoop(int socket, const IPCPeer& peer, const std::strin
       _wakeup(wakeup),
       _replies(replies),
       _router(router),
-      _relay(socket, peer.user, settings.maximumMessage + kMessageOverhead,
+      _relay(socket, peer.user, settings.objectPath, settings.maximumMessage + kMessageOverhead,
              [this](std::string_view message) { return _router.routeOneWay(message); }),
       _bus(openBus(_relay.takeInnerEnd())) {
   checkBus(sd_bus_add_filter(_bus.get(), nullptr, countMessage, &_messagesSeen), "sd_bus_add_filter");

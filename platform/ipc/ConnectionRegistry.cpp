@@ -4,7 +4,7 @@ namespace vesk {
 
 ConnectionRegistry::Admission ConnectionRegistry::admit(uid_t user) {
   MutexLock lock(_mutex);
-  if (_count >= _maximum) return Admission::TooMany;
+  if (_count >= (user == 0 ? _maximum : _maximumOfOthers)) return Admission::TooMany;
   auto& ofUser = _countOfUser[user];
   if (ofUser >= _maximumPerUser) return Admission::TooManyOfUser;
   ++ofUser;

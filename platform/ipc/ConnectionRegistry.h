@@ -3,6 +3,7 @@
 
 #include <sys/types.h>
 
+#include <algorithm>
 #include <chrono>
 #include <condition_variable>
 #include <cstddef>
@@ -21,11 +22,14 @@ namespace vesk {
 class BusConnection;
 
 /// Shared by the listener and its connections, of which some may outlive it. Thread-safe. A connection counts
-/// from `admit` until its thread has let it go, or until it is released when it never had one.
+/// from `admit` until its thread has let it go, or until it is released when it never had one. The last few
+/// of `maximum` are kept for root, so that an operator gets in when others have used up the rest.
 class ConnectionRegistry {
  public:
   ConnectionRegistry(std::size_t maximum, std::size_t maximumPerUser)
-      : _maximum(maximum), _maximumPerUser(maximumPerUser) {}
+      : _maximum(maximum),
+        _maximumOfOthers(maximum - std::min(kKeptForRoot, maximum / 8)),
+        _maximumPerUser(maximumPerUser) {}
 
   enum class Admission { Admitted, TooMany, TooManyOfUser };
   [[nodiscard]] Admission admit(uid_t user);
@@ -49,7 +53,10 @@ class ConnectionRegistry {
  private:
   void finish(std::uint64_t thread) noexcept;
 
+  static constexpr std::size_t kKeptForRoot = 16;
+
   const std::size_t _maximum;
+  const std::size_t _maximumOfOthers;
   const std::size_t _maximumPerUser;
   Wakeup _threadEnded;
 

@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <poll.h>
 #include <sys/eventfd.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
 
 #include <atomic>
@@ -15,6 +16,7 @@
 #include "platform/ipc/UnixSocket.h"
 #include "platform/ipc/Wakeup.h"
 #include "platform/ipc/WarningBurst.h"
+#include "platform/ipc/WireFormat.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
@@ -167,6 +169,8 @@ void IPCListener::Implementation::admit(FileDescriptor socket) {
   }
   auto admission = _registry->admit(peer.user);
   if (admission == ConnectionRegistry::Admission::Admitted) return introduce(std::move(socket), peer);
+  // It never blocks: the socket is new, and a line fits.
+  ::send(socket.get(), kTooManyConnections.data(), kTooManyConnections.size(), MSG_NOSIGNAL | MSG_DONTWAIT);
   if (_refusals.begins()) {
     VESK_LOG_WARNING("ipc: Refused a connection of user %u: too many are open%s", peer.user,
                      admission == ConnectionRegistry::Admission::TooManyOfUser ? " for that user" : "");

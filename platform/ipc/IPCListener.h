@@ -25,8 +25,8 @@ class IPCListener {
     std::string socketPath;    ///< made (mode 0666, its directory 0755) unless `inherited` is given
     FileDescriptor inherited;  ///< a listening socket from the service manager
     std::string objectPath;    ///< where a connection's exported object stands
-    std::size_t maximumConnections = 4096;
-    std::size_t maximumConnectionsPerUser = 256;
+    std::size_t maximumConnections = 4096;  ///< the last sixteen (of few, an eighth) are kept for root
+    std::size_t maximumConnectionsPerUser = 1024;
     std::size_t maximumMessage = std::size_t{1} << 20;  ///< bytes
     std::size_t maximumOutbox = 256;                    ///< calls to one client that wait
     std::chrono::milliseconds authenticationTimeout{5'000};

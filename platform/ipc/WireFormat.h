@@ -4,6 +4,7 @@
 #include <bit>
 #include <cstddef>
 #include <cstdint>
+#include <string_view>
 
 namespace vesk {
 
@@ -23,7 +24,10 @@ inline constexpr char kMethodCall = 1;
 inline constexpr char kNoReplyExpected = 1;
 inline constexpr char kProtocolVersion = 1;
 
-enum HeaderField : std::uint8_t { kPath = 1, kInterface = 2, kMember = 3, kSignature = 8 };
+enum HeaderField : std::uint8_t { kPath = 1, kInterface = 2, kMember = 3, kSignature = 8, kDescriptors = 9 };
+
+/// What a client in excess is told, in place of an answer to its authentication.
+inline constexpr std::string_view kTooManyConnections = "ERROR too many connections\r\n";
 
 /// sd-bus refuses more open containers, with the same error as for broken bytes, so its receiver would too. A
 /// dictionary in a dictionary is three: array, entry, variant.

@@ -14,6 +14,8 @@
 #include <string>
 #include <vector>
 
+#include "platform/log/LogRateLimit.h"
+#include "platform/log/LogUser.h"
 #include "platform/log/StandardError.h"
 #include "platform/sync/Mutex.h"
 #include "platform/time/CivilTime.h"
@@ -87,6 +89,31 @@ std::string withHead(const LogState& log, LogLevel level, const std::string& lin
   return head + line;
 }
 
+void emit(LogLevel level, std::string_view text, std::chrono::milliseconds patience) {
+  const std::string line = printable(text);
+  const LogState* log = state().load();
+  if (log->sink) {
+    log->sink(level, line);
+  } else if (log->toJournal) {
+    sd_journal_send("MESSAGE=%s", line.c_str(), "PRIORITY=%i", static_cast<int>(level),
+                    "SYSLOG_IDENTIFIER=%s", log->processName.c_str(), "VESK_FACILITY=%s",
+                    log->facility.c_str(), nullptr);
+  } else {
+    writeToStandardError(withHead(*log, level, line), patience);
+  }
+}
+
+void emitLeftOut(const std::vector<LogRateLimit::LeftOut>& all, std::chrono::milliseconds patience) {
+  for (const auto& leftOut : all) {
+    std::string line = "log: Left out " + std::to_string(leftOut.lines) + " lines";
+    if (leftOut.user != LogUser::kNobody) line += " of user " + std::to_string(leftOut.user);
+    emit(leftOut.level, line + " like: " + leftOut.format, patience);
+  }
+}
+
+// None without a limit. Kept for ever, as states are.
+std::atomic<LogRateLimit*> rateLimit{nullptr};
+
 }  // namespace
 
 std::atomic<int> SystemLog::_level{static_cast<int>(LogLevel::Info)};
@@ -100,8 +127,16 @@ void SystemLog::open(std::string_view processName, std::string_view facility) {
   });
 }
 
+void SystemLog::setRateLimit(std::uint64_t lines) {
+  static auto* mutex = new Mutex;
+  static auto* kept = new std::vector<std::unique_ptr<LogRateLimit>>;
+  MutexLock lock(*mutex);
+  rateLimit = lines > 0 ? kept->emplace_back(std::make_unique<LogRateLimit>(lines)).get() : nullptr;
+}
+
 void SystemLog::close() noexcept {
   try {
+    if (auto* limit = rateLimit.load()) emitLeftOut(limit->takeAll(), patience());
     changeState([](LogState& log) { log = LogState{{}, {}, log.sink, false}; });
   } catch (...) {
     // Out of memory while stopping: the old state serves as well.
@@ -112,8 +147,13 @@ void SystemLog::setSink(Sink sink) {
   changeState([&](LogState& log) { log.sink = std::move(sink); });
 }
 
-void SystemLog::write(LogLevel level, const char* format, ...) noexcept {
+void SystemLog::write(LogLevel level, const char& site, const char* format, ...) noexcept {
   try {
+    if (auto* limit = rateLimit.load(std::memory_order_acquire); limit && level != LogLevel::Error) {
+      auto verdict = limit->admit(&site, LogUser::current(), level, format, std::chrono::steady_clock::now());
+      emitLeftOut(verdict.leftOut, patience());
+      if (!verdict.mayWrite) return;
+    }
     char shortLine[512];
     va_list arguments;
     va_start(arguments, format);
@@ -130,19 +170,7 @@ void SystemLog::write(LogLevel level, const char* format, ...) noexcept {
       line.assign(shortLine, static_cast<std::size_t>(size));
     }
     va_end(again);
-    line = printable(line);
-
-    const LogState* log = state().load();
-    if (log->sink) {
-      log->sink(level, line);
-    } else if (log->toJournal) {
-      sd_journal_send("MESSAGE=%s", line.c_str(), "PRIORITY=%i", static_cast<int>(level),
-                      "SYSLOG_IDENTIFIER=%s", log->processName.c_str(), "VESK_FACILITY=%s",
-                      log->facility.c_str(), nullptr);
-    } else {
-      writeToStandardError(withHead(*log, level, line),
-                           std::chrono::milliseconds(_patience.load(std::memory_order_relaxed)));
-    }
+    emit(level, line, patience());
   } catch (...) {
     // A line that can't be formatted for want of memory is lost; the caller goes on.
   }

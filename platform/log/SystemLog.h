@@ -3,18 +3,18 @@
 
 #include <atomic>
 #include <chrono>
+#include <cstdint>
 #include <functional>
 #include <string_view>
 
+#include "platform/log/LogLevel.h"
+
 namespace vesk {
 
-/// Levels are the syslog priorities of the same numbers.
-enum class LogLevel : int { Error = 3, Warning = 4, Info = 6, Debug = 7 };
-
 /// Writes the process's log lines. Lines go to the journal when stderr is connected to it, else to stderr as
-/// "2026-11-24 20:31:29.123 name[pid] <level> text", in UTC. Safe from any thread; takes no lock of the
-/// project's own; never throws, raises no SIGPIPE. Control characters in a line are shown as \xNN, so that
-/// text from outside can't forge a line.
+/// "2026-11-24 20:31:29.123 name[pid] <level> text", in UTC. Safe from any thread, also
+/// under other locks (it takes none but the rate limit's, for a look-up); never throws, raises no SIGPIPE.
+/// Control characters in a line are shown as \xNN, so that text from outside can't forge a line.
 class SystemLog {
  public:
   using Sink = std::function<void(LogLevel, std::string_view line)>;
@@ -40,19 +40,32 @@ class SystemLog {
   /// their own. The sink is called on the logging thread and must not log.
   static void setSink(Sink sink);
 
-  static void write(LogLevel level, const char* format, ...) noexcept __attribute__((format(printf, 2, 3)));
+  /// From now on, of the lines of one VESK_LOG for one user (LogUser) only the first `lines` in ten seconds
+  /// are written, and then one that gives the number of those left out. Level 3 is never limited. 0: no
+  /// limit, which is the default.
+  static void setRateLimit(std::uint64_t lines);
+
+  /// `site` tells calls apart by its address. `format` lives as long as the process.
+  static void write(LogLevel level, const char& site, const char* format, ...) noexcept
+      __attribute__((format(printf, 3, 4)));
 
  private:
   static std::atomic<int> _level;
   static std::atomic<int> _patience;  ///< milliseconds
+  static std::chrono::milliseconds patience() noexcept {
+    return std::chrono::milliseconds(_patience.load(std::memory_order_relaxed));
+  }
 };
 
 }  // namespace vesk
 
 /// Evaluates and formats its arguments only when the level is on.
-#define VESK_LOG(level, ...)                                                          \
-  do {                                                                                \
-    if (::vesk::SystemLog::isOn(level)) ::vesk::SystemLog::write(level, __VA_ARGS__); \
+#define VESK_LOG(level, ...)                                     \
+  do {                                                           \
+    if (::vesk::SystemLog::isOn(level)) {                        \
+      static const char veskLogSite = 0;                         \
+      ::vesk::SystemLog::write(level, veskLogSite, __VA_ARGS__); \
+    }                                                            \
   } while (false)
 
 #define VESK_LOG_ERROR(...) VESK_LOG(::vesk::LogLevel::Error, __VA_ARGS__)

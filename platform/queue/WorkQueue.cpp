@@ -18,6 +18,7 @@
 #include <utility>
 #include <vector>
 
+#include "platform/log/LogUser.h"
 #include "platform/log/SystemLog.h"
 #include "platform/sync/Mutex.h"
 
@@ -51,6 +52,7 @@ class WorkQueuePool::Source {
 
   /// Runs the handler unless it was taken away; whether it is still there afterwards.
   bool call() noexcept {
+    LogUser onBehalfOf(_user);
     if (auto handler = current()) run(*handler, _label);
     return current() != nullptr;
   }
@@ -67,6 +69,8 @@ class WorkQueuePool::Source {
   const char* const _label;
 
  private:
+  const std::uint32_t _user = LogUser::current();  // of its maker
+
   std::shared_ptr<const Work> current() {
     MutexLock lock(_mutex);
     return _handler;
@@ -176,7 +180,11 @@ WorkQueue::WorkQueue(WorkQueuePool& pool, const char* label)
     : _state(std::make_shared<State>(pool._core, label)) {}
 
 void WorkQueue::submit(Work work) {
-  _state->core->post(_state->strand, [work = std::move(work), label = _state->label] { run(work, label); });
+  _state->core->post(_state->strand,
+                     [work = std::move(work), label = _state->label, user = LogUser::current()] {
+                       LogUser onBehalfOf(user);
+                       run(work, label);
+                     });
 }
 
 /// Only its queue touches the timer of the context.

@@ -9,7 +9,7 @@
 
 namespace vesk::test {
 
-/// A message's "do" decides what becomes of it: "throw", "abandon", "keep" (answered later, by the test),
+/// A message's "do" decides what becomes of it: "throw", "abandon",
 /// "farewell" (the destruction calls the client); else it is answered with its "n" and as many dots as its
 /// "pad" says. Tokens are left to the test.
 class ActingSession final : public RecordingSession {
@@ -23,8 +23,6 @@ class ActingSession final : public RecordingSession {
   void uploadFileAtPath(const std::string& fileURL, const std::string& extensionToken,
                         Reply<bool> completionHandler) override;
 
-  Reply<std::optional<std::string>> kept;
-
  private:
   const std::shared_ptr<IPCConnection> _connection;
   bool _saysFarewell = false;
@@ -33,8 +31,6 @@ class ActingSession final : public RecordingSession {
 /// The daemon's side. `adjust` changes the listener's options.
 class TestService : public IPCListenerDelegate {
  public:
-  enum class Accept { Resume, NotResume, Refuse };
-
   explicit TestService(const std::function<void(IPCListener::Options&)>& adjust = {});
 
   bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) override;
@@ -45,7 +41,6 @@ class TestService : public IPCListenerDelegate {
   std::shared_ptr<IPCConnection> connection(std::size_t index = 0);
   std::shared_ptr<ActingSession> session(std::size_t index = 0);
 
-  Accept accept = Accept::Resume;
   std::function<void()> onInvalidation;
   Record journal;
 

@@ -6,11 +6,13 @@
 
 namespace vesk::test {
 
-RecordingDaemon::RecordingDaemon(const std::string& socketPath, Record& record)
+RecordingDaemon::RecordingDaemon(const std::string& socketPath, Record& record,
+                                 std::size_t maximumConnections)
     : _record(record), _listener([&] {
         IPCListener::Options options;
         options.socketPath = socketPath;
         options.objectPath = wire::kObjectPath;
+        options.maximumConnections = maximumConnections;
         return options;
       }()) {
   _listener.setDelegate(this);

@@ -8,7 +8,7 @@ namespace vesk::test {
 
 class RecordingDaemon : private IPCListenerDelegate {
  public:
-  RecordingDaemon(const std::string& socketPath, Record& record);
+  RecordingDaemon(const std::string& socketPath, Record& record, std::size_t maximumConnections = 4096);
   /// Ends all connections.
   ~RecordingDaemon() override;
 

@@ -27,8 +27,9 @@ enum class [[nodiscard]] ReportingStatus : std::uint8_t{
     ForkedProcess,    ///< the session belongs to the process that this one was forked from
     OnSessionThread,  ///< a call that waits, made from a callback, would wait for ever
     Closed,           ///< the session was destroyed before the answer
-    OutOfResources    ///< no memory, no descriptor or no thread
-};
+    OutOfResources,   ///< no memory, no descriptor or no thread
+    /// as NotConnected, because the daemon has as many connections as it takes, of this user or in all
+    TooManyConnections};
 
 /// A few words for a log line.
 VESK_API const char* describe(ReportingStatus status) noexcept;

@@ -1,0 +1,9 @@
+// The levels of log lines.
+#pragma once
+
+namespace vesk {
+
+/// Levels are the syslog priorities of the same numbers.
+enum class LogLevel : int { Error = 3, Warning = 4, Info = 6, Debug = 7 };
+
+}  // namespace vesk

@@ -1,0 +1,103 @@
+// The rate limit of the system log.
+#include <gtest/gtest.h>
+
+#include <future>
+
+#include "platform/log/LogRateLimit.h"
+#include "platform/log/LogUser.h"
+#include "platform/queue/WorkQueue.h"
+#include "tests/support/CapturedLog.h"
+
+namespace vesk::test {
+namespace {
+
+using namespace std::chrono_literals;
+
+class RateLimit : public testing::Test {
+ protected:
+  /// How many of `lines` may be written.
+  int written(const char& site, std::uint32_t user, int lines) {
+    int count = 0;
+    for (int i = 0; i < lines; ++i) {
+      auto verdict = limit.admit(&site, user, LogLevel::Warning, "format", now);
+      count += verdict.mayWrite ? 1 : 0;
+      leftOut.insert(leftOut.end(), verdict.leftOut.begin(), verdict.leftOut.end());
+    }
+    return count;
+  }
+
+  LogRateLimit limit{3};
+  LogRateLimit::Time now{1h};
+  std::vector<LogRateLimit::LeftOut> leftOut;
+  const char sites[5000] = {};
+};
+
+TEST_F(RateLimit, CountsEachSiteAndUserByItselfAndTellsWhatItLeftOutOnce) {
+  EXPECT_EQ(written(sites[0], 1, 10), 3);
+  EXPECT_EQ(written(sites[0], 2, 2), 2);
+  EXPECT_EQ(written(sites[1], 1, 5), 3);
+  now += 10s - 1ns;
+  EXPECT_EQ(written(sites[0], 1, 1), 0);
+  EXPECT_TRUE(leftOut.empty());
+  now += 1ns;
+  EXPECT_EQ(written(sites[2], 3, 1), 1) << "any line brings the news";
+  using LeftOut = LogRateLimit::LeftOut;
+  EXPECT_EQ(leftOut,
+            (std::vector<LeftOut>{{LogLevel::Warning, 1, "format", 8}, {LogLevel::Warning, 1, "format", 2}}));
+  EXPECT_EQ(written(sites[0], 1, 5), 3);
+  EXPECT_EQ(limit.takeAll(), (std::vector<LeftOut>{{LogLevel::Warning, 1, "format", 2}}));
+  EXPECT_TRUE(limit.takeAll().empty());
+}
+
+TEST_F(RateLimit, KeepsABoundedTableWhoseExcessSharesOneEntry) {
+  for (std::uint32_t user = 0; user < LogRateLimit::kMaximumEntries; ++user)
+    EXPECT_EQ(written(sites[0], user, 1), 1);
+  EXPECT_EQ(written(sites[0], 5000, 2), 2);
+  EXPECT_EQ(written(sites[1], 5001, 2), 1);
+  EXPECT_EQ(written(sites[0], 7, 3), 2) << "those in the table are not touched";
+  now += 10s;
+  EXPECT_EQ(written(sites[1], 5001, 3), 3);
+}
+
+TEST(SystemLog, LimitsAllButErrorsForEachUserOnWhoseBehalfAThreadWorks) {
+  CapturedLog log;
+  auto flood = [](const char* who) {
+    for (int i = 0; i < 5; ++i) {
+      VESK_LOG_ERROR("error %s", who);
+      VESK_LOG_WARNING("warning %s", who);
+      VESK_LOG_INFO("info %s", who);
+      VESK_LOG_DEBUG("debug %s", who);
+    }
+  };
+  SystemLog::setRateLimit(2);
+  flood("daemon");
+  {
+    LogUser user(7);
+    flood("client");
+    WorkQueuePool pool(1);
+    WorkQueue queue(pool);
+    std::promise<void> done;
+    queue.submit([&] { flood("queue"); });
+    queue.submitAfter(0ms, [&] {
+      flood("timer");
+      done.set_value();
+    });
+    done.get_future().wait();
+  }
+  flood("daemon");
+  SystemLog::close();
+  SystemLog::setRateLimit(0);
+  flood("free");
+  for (int level : {4, 6, 7}) {
+    EXPECT_EQ(log.countContaining(level, "daemon"), 2);
+    EXPECT_EQ(log.countContaining(level, "client"), 2);
+    EXPECT_EQ(log.countContaining(level, "queue") + log.countContaining(level, "timer"), 0);
+    EXPECT_EQ(log.countContaining(level, "free"), 5);
+  }
+  EXPECT_EQ(log.countContaining(3, ""), 6 * 5);
+  EXPECT_EQ(log.count(4, "log: Left out 8 lines like: warning %s"), 1);
+  EXPECT_EQ(log.count(6, "log: Left out 13 lines of user 7 like: info %s"), 1);
+}
+
+}  // namespace
+}  // namespace vesk::test
