@@ -9,10 +9,8 @@
 #include "backends/VeskReportingBackend.h"
 #include "platform/files/FileDescriptor.h"
 #include "platform/files/RootPrefix.h"
-#include "platform/ipc/BusCodec.h"
-#include "platform/ipc/BusHandles.h"
-#include "platform/ipc/OneWayDecoder.h"
-#include "platform/ipc/OneWayEncoder.h"
+#include "platform/ipc/MessageReader.h"
+#include "platform/ipc/MessageWriter.h"
 #include "platform/json/JSONWriter.h"
 #include "platform/queue/TimedQueuePool.h"
 #include "util/Gzip.h"
@@ -72,37 +70,37 @@ class Services {
   TimedQueuePool _queues{1};
 };
 
-void decode(benchmark::State& state) {
-  int ends[2];
-  if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) std::abort();
-  FileDescriptor peer(ends[1]);
-  sd_bus* raw = nullptr;
-  if (sd_bus_new(&raw) < 0 || sd_bus_set_fd(raw, ends[0], ends[0]) < 0 || sd_bus_start(raw) < 0) std::abort();
-  BusHandle bus(raw);
-  sd_bus_message* rawMessage = nullptr;
-  if (sd_bus_message_new_method_call(raw, &rawMessage, nullptr, "/o", "i.f", "m") < 0) std::abort();
-  BusMessageHandle message(rawMessage);
-  BusEncoder encoder(rawMessage);
-  if (!encoder.append(payload()) || sd_bus_message_seal(rawMessage, 1, 0) < 0) std::abort();
+/// A whole message as a client sends it.
+std::string call() {
+  std::string message;
+  CallWriter writer("/o");
+  if (writer.append({"i.f", "m", {payload()}}, 1, false, message) != CodecResult::Ok) std::abort();
+  return message;
+}
+
+void readCall(benchmark::State& state) {
+  const std::string message = call();
+  HeaderParser parser;
   for (auto _ : state) {
-    sd_bus_message_rewind(rawMessage, 1);
-    BusDecoder decoder(rawMessage);
+    const auto* header = parser.parse(message);
+    MessageReader reader({header, 1, std::string_view(message).substr(parser.headerSize()), {}});
     Dictionary dictionary;
-    if (!decoder.read(dictionary)) std::abort();
+    if (!reader.read(dictionary)) std::abort();
     benchmark::DoNotOptimize(dictionary);
   }
 }
-BENCHMARK(decode);
+BENCHMARK(readCall);
 
-/// A whole message as a client sends it, the way it comes in without sd-bus.
-void decodeOneWay(benchmark::State& state) {
-  std::string message;
-  OneWayEncoder encoder("/o");
-  if (encoder.append({"i.f", "m", {payload()}}, 1, message) != CodecResult::Ok) std::abort();
-  OneWayDecoder decoder("/o");
-  for (auto _ : state) benchmark::DoNotOptimize(decoder.decode(message));
+void writeCall(benchmark::State& state) {
+  CallWriter writer("/o");
+  const Dictionary message = payload();
+  std::string out;
+  for (auto _ : state) {
+    out.clear();
+    benchmark::DoNotOptimize(writer.append({"i.f", "m", {message}}, 1, false, out));
+  }
 }
-BENCHMARK(decodeOneWay);
+BENCHMARK(writeCall);
 
 /// Record, user info, filters and the place in the batch; the batch is given up every 50 events.
 void recordAndFilter(benchmark::State& state) {

@@ -8,7 +8,7 @@
 #include <string_view>
 #include <system_error>
 
-#include "platform/ipc/OneWayEncoder.h"
+#include "platform/ipc/MessageWriter.h"
 #include "platform/text/PercentCode.h"
 
 namespace vesk {
@@ -21,7 +21,7 @@ std::string urlOf(const std::string& path) { return "file://" + percentEncoded(p
 
 bool isEncodable(const ClientCall& call) {
   std::string message;
-  return OneWayEncoder(wire::kObjectPath).append(call.call, 1, message) == CodecResult::Ok;
+  return CallWriter(wire::kObjectPath).append(call.call, 1, false, message) == CodecResult::Ok;
 }
 
 FileToUpload openToUpload(const std::string& path) {

@@ -1,11 +1,10 @@
-// Bytes as the body of a client's call: through sd-bus into values, back onto the wire and into values again.
+// Bytes as a client may send them: as the body of a call, as a whole message, as authentication.
 #include <cstdint>
 #include <string>
 
-#include "platform/ipc/AuthenticationGate.h"
-#include "platform/ipc/BusCodec.h"
-#include "platform/ipc/MessageGate.h"
-#include "platform/ipc/OneWayDecoder.h"
+#include "platform/ipc/MessageReader.h"
+#include "platform/ipc/MessageWriter.h"
+#include "platform/ipc/Sasl.h"
 #include "tests/support/BusServer.h"
 #include "tests/support/WireMessage.h"
 
@@ -16,51 +15,52 @@ using test::BusServer;
 
 void require(bool condition) { BusServer::require(condition); }
 
-/// What is read without sd-bus is what sd-bus reads.
-void compareWays(const std::string& call, const Value& expected, bool isExpected) {
-  static OneWayDecoder decoder(wire::kObjectPath);
-  if (!OneWayDecoder::mayDecode(call, call.size())) return;
-  auto read = decoder.decode(call);
-  if (!read || read->arguments.size() != 1) return;
-  const auto* dictionary = std::get_if<Dictionary>(&read->arguments.front());
-  const auto* list = std::get_if<List>(&read->arguments.front());
-  if (!dictionary && !list) return;
-  Value value = dictionary ? Value(*dictionary) : Value(*list);
-  require(isExpected && describe(value, 1 << 20) == describe(expected, 1 << 20));
+/// Not a number is not equal to itself, so equal descriptions will do.
+std::string described(const Value& value) { return describe(value, 1 << 20); }
+
+bool readHere(const std::string& bytes, Value& value) {
+  HeaderParser parser;
+  const auto* header = parser.parse(bytes);
+  if (!header) return false;
+  MessageReader reader({header, parser.serial(), std::string_view(bytes).substr(parser.headerSize()), {}});
+  return reader.read(value) && reader.finish();
 }
 
-void decode(BusServer& server, const std::string& signature, const std::string& body) {
+/// What is read here is what sd-bus reads, and stays the same when it is written and read again.
+void readBody(BusServer& server, const std::string& signature, const std::string& body) {
   const std::string call = test::wireMessage("m", signature, body);
-  BusMessageHandle message = server.read(call);
-  if (!message) return compareWays(call, {}, false);  // refused by sd-bus
-  BusDecoder decoder(message.get());
   Value value;
-  bool isRead = decoder.read(value);
-  compareWays(call, value, isRead);
-  if (!isRead) return;
+  if (!readHere(call, value)) return;
+  std::vector<Value> bySdBus;
+  const auto message = server.read(call);
+  require(message && test::readBySdBus(message.get(), bySdBus) &&
+          described(bySdBus.at(0)) == described(value));
 
-  sd_bus_message* raw = nullptr;
-  require(sd_bus_message_new_method_call(server.bus(), &raw, nullptr, "/o", "i.f", "m") >= 0);
-  BusMessageHandle again(raw);
-  BusEncoder encoder(raw);
-  if (!encoder.append(value)) {
-    // What was read is valid text within the limits; only nesting takes more room as variants.
-    require(encoder.result() == CodecResult::LimitExceeded);
-    return;
-  }
-  require(sd_bus_message_seal(raw, 1, 0) >= 0);
-  BusDecoder second(raw);
+  std::string again;
+  const auto result = appendMessage({.path = "/o", .member = "m"}, 1, {List{value}}, again);
+  // What was read is valid text within the limits; only nesting takes more room as variants.
+  if (result != CodecResult::Ok) return require(result == CodecResult::LimitExceeded);
   Value same;
-  // Not a number is not equal to itself, so equal descriptions will do.
-  require(second.read(same) && describe(same, 1 << 20) == describe(value, 1 << 20));
+  require(readHere(again, same) && described(same) == described(List{value}));
 }
 
-void passGates(const std::string& bytes) {
-  MessageGate messages(4096);
-  auto passed = messages.pass(bytes);
-  require(passed.passed <= bytes.size() && (!passed.lastStart || *passed.lastStart < passed.passed + 1));
-  AuthenticationGate authentication(1000);
-  require(authentication.pass(bytes).taken <= bytes.size());
+void readMessage(std::string_view bytes) {
+  if (bytes.size() < kFixedHeader || messageSize(bytes) != bytes.size()) return;
+  HeaderParser parser;
+  const auto* header = parser.parse(bytes);
+  if (!header) return;
+  require(parser.parse(bytes) == header);  // from what was kept
+  MessageReader reader({header, parser.serial(), bytes.substr(parser.headerSize()), {}});
+  Value value;
+  while (reader.read(value)) {
+  }
+}
+
+void authenticate(std::string_view bytes) {
+  SaslServer server(1000);
+  SaslClient client;
+  require(server.step(bytes).taken <= bytes.size());
+  require(client.step(bytes).taken <= bytes.size());
 }
 
 }  // namespace
@@ -69,8 +69,9 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   static BusServer server;
   static const char* const kSignatures[] = {"v", "a{sv}", "av", "aa{sv}", "a(sv)", "(yv)", "as"};
   if (size < 1 || size > 65'536) return 0;
-  std::string body(reinterpret_cast<const char*>(data + 1), size - 1);
-  decode(server, kSignatures[data[0] % std::size(kSignatures)], body);
-  passGates(body);
+  const std::string body(reinterpret_cast<const char*>(data + 1), size - 1);
+  readBody(server, kSignatures[data[0] % std::size(kSignatures)], body);
+  readMessage({reinterpret_cast<const char*>(data), size});
+  authenticate(body);
   return 0;
 }

@@ -4,25 +4,28 @@
 #include <chrono>
 #include <cstddef>
 #include <functional>
+#include <map>
 #include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
 
-#include "platform/files/FileDescriptor.h"
+#include "platform/files/GuardedDescriptor.h"
+#include "platform/ipc/Answers.h"
+#include "platform/ipc/CallRouter.h"
+#include "platform/ipc/Channel.h"
 #include "platform/ipc/IPCConnection.h"
-
-struct sd_bus_message;
+#include "platform/ipc/MessageReader.h"
+#include "platform/ipc/MessageWriter.h"
+#include "platform/ipc/Sasl.h"
 
 namespace vesk {
-
-class BusDecoder;
 
 /// The answer to a call: its arguments, or an error. Lives while its handler runs.
 class BusAnswer {
  public:
   /// Answered with arguments.
-  explicit BusAnswer(BusDecoder& arguments) noexcept : _arguments(&arguments) {}
+  explicit BusAnswer(MessageReader& arguments) noexcept : _arguments(&arguments) {}
   /// Answered with an error, whose texts outlive this.
   BusAnswer(std::string_view errorName, std::string_view errorText) noexcept
       : _errorName(errorName), _errorText(errorText) {}
@@ -33,15 +36,14 @@ class BusAnswer {
   std::string_view errorName() const noexcept { return _errorName; }
   std::string_view errorText() const noexcept { return _errorText; }
 
-  /// Reads the next argument (the types: BusDecoder::read). False for an error and for a wrong type.
-  bool read(bool& out);
-  bool read(std::string& out);
-  bool read(std::optional<std::string>& out);
-  bool read(std::optional<std::vector<std::string>>& out);
-  bool read(std::optional<Dictionary>& out);
+  /// Reads the next argument (the types: MessageReader::read). False for an error and for a wrong type.
+  template <class T>
+  bool read(T& out) {
+    return _arguments && _arguments->read(out);
+  }
 
  private:
-  BusDecoder* _arguments = nullptr;
+  MessageReader* _arguments = nullptr;
   std::string_view _errorName;
   std::string_view _errorText;
 };
@@ -70,35 +72,36 @@ class BusClient {
   using AnswerHandler = std::function<void(BusAnswer& answer)>;
 
   /// Connects. Throws std::system_error: ENOENT or ECONNREFUSED when no daemon is there, EAGAIN when too many
-  /// others wait to be accepted, EUSERS when too many are connected.
+  /// others wait to be accepted.
   explicit BusClient(Options options);
-  ~BusClient();
+  ~BusClient() { end(); }
+  BusClient(const BusClient&) = delete;
+  BusClient& operator=(const BusClient&) = delete;
 
   /// Receives the daemon's calls, from `process`. Its `IPCIncomingCall`s may be answered.
-  void setExportedObject(std::shared_ptr<IPCExportedObject> object);
+  void setExportedObject(std::shared_ptr<IPCExportedObject> object) {
+    _router.setExportedObject(std::move(object));
+  }
 
-  /// One-way.
-  [[nodiscard]] SendResult send(const IPCOutgoingCall& call);
-  /// A one-way call without a descriptor, put with those that `write` writes together: the cheap way to send
-  /// many. Once the socket is full they wait here; a sender that must not lose them with the connection keeps
-  /// its own until `queuedMessages` says that they have left.
-  [[nodiscard]] SendResult add(const IPCOutgoingCall& call);
+  /// Sends at once what the socket takes. A `handler` gets the answer, or an error after `timeout`; without
+  /// one the call is one-way. The handler is dropped unless the call was sent.
+  [[nodiscard]] SendResult send(const IPCOutgoingCall& call, AnswerHandler handler = nullptr,
+                                std::chrono::milliseconds timeout = {});
+  /// A one-way call, put with those that `write` writes together: the cheap way to send many. Once the socket
+  /// is full they wait here; a sender that must not lose them with the connection keeps its own until
+  /// `queuedMessages` says that they have left.
+  [[nodiscard]] SendResult add(const IPCOutgoingCall& call) { return append(call, false); }
   [[nodiscard]] Progress write();
-  /// Bytes added that the socket has not taken.
-  std::size_t addedBytes() const;
-  /// With an answer, or an error after `timeout`. The handler is dropped unless the call was sent.
-  [[nodiscard]] SendResult send(const IPCOutgoingCall& call, AnswerHandler handler,
-                                std::chrono::milliseconds timeout);
-
-  /// Messages that the socket has not taken yet. A sender holds back when there are many: sd-bus would queue
-  /// without end.
-  std::size_t queuedMessages() const;
+  /// Bytes and messages that the socket has not taken. Nothing bounds them here: a sender holds back when
+  /// there are many.
+  std::size_t addedBytes() const noexcept { return _channel.unsentBytes(); }
+  std::size_t queuedMessages() const noexcept { return _channel.unsentMessages(); }
   /// Whether authentication is done.
-  bool isReady() const;
+  bool isReady() const noexcept { return _isReady; }
   /// Disconnected because the daemon has too many connections.
-  bool wasTurnedAway() const;
+  bool wasTurnedAway() const noexcept { return _sasl.refusal() == kTooManyConnections; }
 
-  int fd() const;
+  int fd() const { return isOurs() ? _socket.get() : -1; }
   short events() const;
   /// For poll(): milliseconds, -1 for no limit.
   int timeout() const;
@@ -107,8 +110,37 @@ class BusClient {
   [[nodiscard]] Progress process();
 
  private:
-  class Implementation;
-  std::unique_ptr<Implementation> _implementation;
+  using Time = std::chrono::steady_clock::time_point;
+
+  struct Owed {
+    AnswerHandler handler;
+    Time deadline;
+  };
+  using OwedAnswers = std::map<std::uint32_t, Owed>;  // by the number of the call
+
+  SendResult append(const IPCOutgoingCall& call, bool expectsReply);
+  /// A process forked from this one has the socket too, but the connection is not its own.
+  bool isOurs() const;
+  bool hasEnded() const { return !_socket || !_socket.isOurs(); }
+  bool authenticate();
+  bool serve();
+  void deliver(Message& message);
+  void expire();
+  void settle(OwedAnswers::iterator owed, BusAnswer answer);
+  Progress disconnected();
+  void end() noexcept;
+
+  const pid_t _process;
+  GuardedDescriptor _socket;  // none once the connection has ended
+  const std::shared_ptr<Answers> _answers = std::make_shared<Answers>(nullptr);
+  CallRouter _router;
+  CallWriter _writer;
+  SaslClient _sasl;
+  Channel _channel;
+  OwedAnswers _owed;
+  std::uint32_t _lastSerial = 0;
+  bool _isReady = false;
+  bool _hasMore = false;
 };
 
 }  // namespace vesk

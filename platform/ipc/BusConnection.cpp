@@ -28,10 +28,10 @@ BusConnection::BusConnection(FileDescriptor socket, const IPCPeer& peer, const C
       _name(nameFor(_serial, peer)),
       _registry(std::move(registry)),
       _wakeup(std::make_shared<Wakeup>()),
-      _replies(std::make_shared<BusReplies>([wakeup = _wakeup] { wakeup->signal(); })),
+      _answers(std::make_shared<Answers>([wakeup = _wakeup] { wakeup->signal(); })),
       _outbox(settings.maximumOutbox),
       _socket(std::move(socket)),
-      _router(settings.objectPath, _name, _replies, {_serial, _peer.user},
+      _router(settings.objectPath, _name, _answers, {_serial, _peer.user},
               {.content = settings.maximumMessage}) {}
 
 BusConnection::~BusConnection() { close(); }
@@ -95,7 +95,7 @@ void BusConnection::callRemoteObject(IPCOutgoingCall call,
 void BusConnection::run() noexcept {
   LogUser onBehalfOf(_peer.user);
   try {
-    ConnectionLoop loop(_socket.get(), _peer, _name, _settings, _outbox, *_wakeup, *_replies, _router);
+    ConnectionLoop loop(_socket.get(), _peer, _name, _settings, _outbox, *_wakeup, *_answers, _router);
     finish(loop.serve(_invalidated), &loop);
   } catch (const std::exception& error) {
     VESK_LOG_ERROR("ipc: %s: Closed: %s", _name.c_str(), error.what());

@@ -8,7 +8,7 @@
 #include <string>
 
 #include "platform/files/FileDescriptor.h"
-#include "platform/ipc/BusReplies.h"
+#include "platform/ipc/Answers.h"
 #include "platform/ipc/CallRouter.h"
 #include "platform/ipc/ConnectionLoop.h"
 #include "platform/ipc/ConnectionRegistry.h"
@@ -63,7 +63,7 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   const std::string _name;
   const std::shared_ptr<ConnectionRegistry> _registry;
   const std::shared_ptr<Wakeup> _wakeup;
-  const std::shared_ptr<BusReplies> _replies;
+  const std::shared_ptr<Answers> _answers;
 
   // Synchronised by themselves.
   Outbox _outbox;

@@ -1,6 +1,8 @@
 #include "platform/ipc/CallRouter.h"
 
-#include <cstring>
+#include <algorithm>
+#include <fstream>
+#include <iterator>
 
 #include "platform/ipc/IPCIncomingCall.h"
 #include "platform/log/SystemLog.h"
@@ -9,7 +11,13 @@ namespace vesk {
 
 namespace {
 
+constexpr const char* kPeer = "org.freedesktop.DBus.Peer";
 constexpr const char* kIntrospectable = "org.freedesktop.DBus.Introspectable";
+constexpr const char* kProperties = "org.freedesktop.DBus.Properties";
+
+constexpr const char* kNoSuchMethod = "The interface has no such method";
+constexpr const char* kNoSuchInterface = "The object has no such interface";
+constexpr const char* kNoSuchObject = "There is no such object";
 
 constexpr const char* kDoctype =
     "<!DOCTYPE node PUBLIC \"-//freedesktop//DTD D-BUS Object Introspection 1.0//EN\"\n"
@@ -22,6 +30,12 @@ constexpr const char* kStandardInterfaces =
     "  </interface>\n"
     "  <interface name=\"org.freedesktop.DBus.Introspectable\">\n"
     "    <method name=\"Introspect\"><arg type=\"s\" direction=\"out\"/></method>\n"
+    "  </interface>\n"
+    "  <interface name=\"org.freedesktop.DBus.Properties\">\n"
+    "    <method name=\"Get\"><arg type=\"s\"/><arg type=\"s\"/><arg type=\"v\" "
+    "direction=\"out\"/></method>\n"
+    "    <method name=\"GetAll\"><arg type=\"s\"/><arg type=\"a{sv}\" direction=\"out\"/></method>\n"
+    "    <method name=\"Set\"><arg type=\"s\"/><arg type=\"s\"/><arg type=\"v\"/></method>\n"
     "  </interface>\n";
 
 /// The name of the next node on the way from `path` to `target`; empty when `target` is not below `path`.
@@ -32,16 +46,25 @@ std::string_view childTowards(std::string_view path, std::string_view target) {
   return rest.substr(0, rest.find('/'));
 }
 
+/// 32 hexadecimal digits, or nothing where the machine has none or the sandbox hides it.
+std::string machineID() {
+  std::string line;
+  for (const char* path : {"/etc/machine-id", "/var/lib/dbus/machine-id"}) {
+    std::ifstream file(path);
+    if (std::getline(file, line) && line.size() == 32) return line;
+  }
+  return {};
+}
+
 }  // namespace
 
-CallRouter::CallRouter(std::string objectPath, std::string connectionName,
-                       std::shared_ptr<BusReplies> replies, const ExtensionOwner& owner, CodecLimits limits)
+CallRouter::CallRouter(std::string objectPath, std::string connectionName, std::shared_ptr<Answers> answers,
+                       const ExtensionOwner& owner, CodecLimits limits)
     : _objectPath(std::move(objectPath)),
       _connectionName(std::move(connectionName)),
-      _replies(std::move(replies)),
+      _answers(std::move(answers)),
       _owner(owner),
-      _limits(limits),
-      _decoder(_objectPath, limits) {}
+      _limits(limits) {}
 
 void CallRouter::warn(std::string_view member, const char* what) {
   if (_warnings.begins()) {
@@ -50,62 +73,59 @@ void CallRouter::warn(std::string_view member, const char* what) {
   }
 }
 
-void CallRouter::refuse(sd_bus_message* message, const char* errorName, const char* text) {
-  if (sd_bus_message_get_expect_reply(message) <= 0) warn(sd_bus_message_get_member(message), text);
-  _replies->sendError(message, errorName, text);
-}
-
-void CallRouter::route(sd_bus_message* message) {
-  std::uint8_t type = 0;
-  if (sd_bus_message_get_type(message, &type) < 0 || type != SD_BUS_MESSAGE_METHOD_CALL) return;
-  const char* interface = sd_bus_message_get_interface(message);
-  const std::string_view path = sd_bus_message_get_path(message);
-  if (interface && std::strcmp(interface, kIntrospectable) == 0) return introspect(message, path);
-  if (path != _objectPath || !_object) {
-    return refuse(message, SD_BUS_ERROR_UNKNOWN_OBJECT, "There is no such object");
+void CallRouter::route(Message& message) {
+  const MessageHeader& header = *message.header;
+  if (header.type != MessageType::Call) return;
+  IPCIncomingCall call(message, _answers, _owner, _limits);
+  if (header.interfaceName == kPeer) {
+    servePeer(call);
+  } else if (header.interfaceName == kIntrospectable) {
+    serveIntrospectable(call, header.path);
+  } else if (header.path != _objectPath || !_object) {
+    call.refuse(kErrorUnknownObject, kNoSuchObject);
+  } else if (header.interfaceName == kProperties) {
+    serveProperties(call);
+  } else if (!header.interfaceName.empty() && header.interfaceName != _object->interfaceName()) {
+    call.refuse(kErrorUnknownInterface, kNoSuchInterface);
+  } else {  // D-Bus lets a caller leave the interface out
+    serveObject(call);
   }
-  // D-Bus lets a caller leave the interface out.
-  if (interface && std::strcmp(interface, _object->interfaceName()) != 0) {
-    return refuse(message, SD_BUS_ERROR_UNKNOWN_INTERFACE, "The object has no such interface");
-  }
-  IPCIncomingCall call(message, _replies, _owner, _limits);
-  serve(call);
+  if (call.complaint()) warn(call.member(), call.complaint());
 }
 
-bool CallRouter::routeOneWay(std::string_view message) {
-  if (!_object) return false;
-  auto oneWay = _decoder.decode(message);
-  if (!oneWay) return false;
-  if (!oneWay->interfaceName.empty() && oneWay->interfaceName != _object->interfaceName()) return false;
-  IPCIncomingCall call(*oneWay, _replies, _limits);
-  serve(call);
-  return true;
-}
-
-void CallRouter::serve(IPCIncomingCall& call) {
+void CallRouter::serveObject(IPCIncomingCall& call) {
   // The object stays alive during its call, also when the call makes the connection drop it.
   auto object = _object;
   auto fail = [&](const char* what) {
     VESK_LOG_ERROR("ipc: %s: %.*s failed%s", _connectionName.c_str(), static_cast<int>(call.member().size()),
                    call.member().data(), what);
-    call.refuse(SD_BUS_ERROR_FAILED, "The call failed");
+    if (call.expectsReply()) call.refuse(kErrorFailed, "The call failed");
   };
   try {
     object->handle(call);
-    if (call.expectsReply() && !call.isSettled())
-      call.refuse(SD_BUS_ERROR_FAILED, "The call was not answered");
+    if (call.expectsReply() && !call.isSettled()) call.refuse(kErrorFailed, "The call was not answered");
   } catch (const std::exception& error) {
-    return fail((std::string(": ") + error.what()).c_str());
+    fail((std::string(": ") + error.what()).c_str());
   } catch (...) {
-    return fail("");
+    fail("");
   }
-  if (call.complaint()) warn(call.member(), call.complaint());
 }
 
-void CallRouter::introspect(sd_bus_message* message, std::string_view path) {
-  if (std::strcmp(sd_bus_message_get_member(message), "Introspect") != 0) {
-    return refuse(message, SD_BUS_ERROR_UNKNOWN_METHOD, "The interface has no such method");
+void CallRouter::servePeer(IPCIncomingCall& call) {
+  if (call.member() == "Ping") {
+    if (call.read("")) call.answer();
+  } else if (call.member() == "GetMachineId") {
+    if (!call.read("")) return;
+    std::string id = machineID();
+    if (id.empty()) return call.refuse(kErrorFailed, "The machine has no ID");
+    call.answer({IPCArgument(std::move(id))});
+  } else {
+    call.refuse(kErrorUnknownMethod, kNoSuchMethod);
   }
+}
+
+void CallRouter::serveIntrospectable(IPCIncomingCall& call, std::string_view path) {
+  if (call.member() != "Introspect") return call.refuse(kErrorUnknownMethod, kNoSuchMethod);
   std::string xml = kDoctype;
   xml += "<node>\n";
   if (path == _objectPath && _object) {
@@ -114,10 +134,35 @@ void CallRouter::introspect(sd_bus_message* message, std::string_view path) {
   } else if (auto child = childTowards(path, _objectPath); !child.empty()) {
     xml.append("  <node name=\"").append(child).append("\"/>\n");
   } else {
-    return refuse(message, SD_BUS_ERROR_UNKNOWN_OBJECT, "There is no such object");
+    return call.refuse(kErrorUnknownObject, kNoSuchObject);
   }
   xml += "</node>\n";
-  _replies->send(message, {IPCArgument(std::move(xml))});
+  call.answer({IPCArgument(std::move(xml))});
+}
+
+bool CallRouter::knowsInterface(std::string_view name) const {
+  constexpr std::string_view kStandard[] = {kPeer, kIntrospectable, kProperties};
+  return name.empty() || name == _object->interfaceName() ||
+         std::find(std::begin(kStandard), std::end(kStandard), name) != std::end(kStandard);
+}
+
+/// No interface here has a property.
+void CallRouter::serveProperties(IPCIncomingCall& call) {
+  std::string interfaceName;
+  std::string property;
+  Value value;
+  if (call.member() == "GetAll") {
+    if (!call.read("s", interfaceName)) return;
+  } else if (call.member() == "Get") {
+    if (!call.read("ss", interfaceName, property)) return;
+  } else if (call.member() == "Set") {
+    if (!call.read("ssv", interfaceName, property, value)) return;
+  } else {
+    return call.refuse(kErrorUnknownMethod, kNoSuchMethod);
+  }
+  if (!knowsInterface(interfaceName)) return call.refuse(kErrorUnknownInterface, kNoSuchInterface);
+  if (call.member() == "GetAll") return call.answer({IPCArgument(Dictionary())});
+  call.refuse(kErrorUnknownProperty, "The interface has no such property");
 }
 
 }  // namespace vesk

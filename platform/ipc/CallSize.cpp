@@ -1,6 +1,6 @@
 #include "platform/ipc/CallSize.h"
 
-#include "platform/ipc/WireFormat.h"
+#include "platform/ipc/Codec.h"
 
 namespace vesk {
 

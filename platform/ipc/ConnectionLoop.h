@@ -7,12 +7,13 @@
 #include <optional>
 #include <string>
 
-#include "platform/ipc/BusHandles.h"
-#include "platform/ipc/BusRelay.h"
-#include "platform/ipc/BusReplies.h"
+#include "platform/ipc/Answers.h"
 #include "platform/ipc/CallRouter.h"
+#include "platform/ipc/Channel.h"
 #include "platform/ipc/IPCConnection.h"
+#include "platform/ipc/MessageWriter.h"
 #include "platform/ipc/Outbox.h"
+#include "platform/ipc/Sasl.h"
 #include "platform/ipc/Wakeup.h"
 #include "platform/ipc/WarningBurst.h"
 
@@ -25,13 +26,16 @@ struct ConnectionSettings {
   std::chrono::milliseconds authenticationTimeout{0};
 };
 
-/// Owns the bus. Made, used and destroyed on the connection's thread, which it stays on its stack of: what it
-/// refers to belongs to the connection and outlives it.
+/// Lives on the stack of the connection's thread. What it refers to belongs to the connection and outlives
+/// it.
 class ConnectionLoop {
  public:
   /// The content of a message is limited to `maximumMessage`, with an error that names the limit; the bytes
   /// around it, by closing the connection, to this much more.
   static constexpr std::size_t kMessageOverhead = 64 * 1024;
+  /// Answers and calls that wait for the client to read beyond what its socket holds. Beyond that nothing
+  /// more is served, so a client that calls without reading its answers waits itself.
+  static constexpr std::size_t kMaximumUnsent = 224 * 1024;
   /// What a client had sent when its connection was invalidated is still served, for this long.
   static constexpr std::chrono::milliseconds kDrainTime{1'000};
 
@@ -42,46 +46,44 @@ class ConnectionLoop {
     NotAuthenticated,  ///< before a call could be received
   };
 
-  /// Throws std::system_error.
   ConnectionLoop(int socket, const IPCPeer& peer, const std::string& name, const ConnectionSettings& settings,
-                 Outbox& outbox, const Wakeup& wakeup, BusReplies& replies, CallRouter& router);
-  /// Closes the replies, which can go nowhere without the bus.
+                 Outbox& outbox, const Wakeup& wakeup, Answers& answers, CallRouter& router) noexcept;
+  /// Closes the answers, which can go nowhere without the channel.
   ~ConnectionLoop();
 
   End serve(const std::atomic<bool>& invalidated);
 
-  /// Sends what is in the outbox and what the bus has queued, as far as the client takes it within `limit`.
+  /// Sends what is in the outbox and the channel, as far as the client takes it within `limit`.
   void flush(std::chrono::milliseconds limit);
 
  private:
   using Time = std::chrono::steady_clock::time_point;
 
-  bool isReady() const;
-  /// Whether what the client has not read has filled the sockets. Then nothing more is served or sent, so
-  /// that one that calls without reading its answers waits itself, and costs no more than one message.
-  bool isBackedUp() const;
-  bool sendOutgoing();
-  bool sendCall(const IPCOutgoingCall& call);
+  bool isBackedUp() const noexcept { return _channel.unsentBytes() > 0; }
+  bool mayRead() const noexcept { return !isBackedUp(); }
+  void sendOutgoing();
+  bool appendCall(const IPCOutgoingCall& call);
   void wait(Time deadline);
-  bool mayRead() const;
   std::optional<End> advance();
-  bool process();
-  bool processWaiting();
-  void noteBrokenMessages();
+  std::optional<End> authenticate();
+  std::optional<End> serveMessages();
+  End closeFor(const char* complaint);
   End drain();
-  End endOfBus() const;
 
   const int _socket;
   const std::string& _name;
   const ConnectionSettings& _settings;
   Outbox& _outbox;
   const Wakeup& _wakeup;
-  BusReplies& _replies;
+  Answers& _answers;
   CallRouter& _router;
-  BusRelay _relay;
-  BusHandle _bus;
-  bool _peerGone = false;
-  std::uint64_t _messagesSeen = 0;
+  CallWriter _writer;
+  SaslServer _sasl;
+  Channel _channel;
+  std::uint32_t _lastSerial = 0;
+  bool _isReady = false;   // the client has authenticated itself and begun
+  bool _hasMore = false;   // messages have come that are not served yet
+  bool _peerGone = false;  // nothing can be sent any more
   WarningBurst _brokenMessages;
 };
 

@@ -9,51 +9,42 @@
 #include <vector>
 
 #include "platform/files/FileDescriptor.h"
-#include "platform/ipc/BusCodec.h"
+#include "platform/ipc/Answers.h"
 #include "platform/ipc/ExtensionTokens.h"
 #include "platform/ipc/IPCConnection.h"
-#include "platform/ipc/OneWayDecoder.h"
+#include "platform/ipc/MessageReader.h"
 #include "platform/ipc/Reply.h"
 
 namespace vesk {
-
-class BusReplies;
 
 /// Given to IPCExportedObject::handle and gone when that returns; used on the connection's thread. A call
 /// ends in one of four ways: `answer`, `takeReply`, a failed `read` (which has told the caller) or `refuse`;
 /// a call that expects an answer and is left in none of them gets an error.
 class IPCIncomingCall {
  public:
-  /// `owner`: whose the descriptors are that `grant` keeps.
-  IPCIncomingCall(sd_bus_message* message, const std::shared_ptr<BusReplies>& replies,
-                  const ExtensionOwner& owner, const CodecLimits& limits);
+  /// `owner`: whose the descriptors are that `grant` keeps. All outlive the call.
+  IPCIncomingCall(Message& message, const std::shared_ptr<Answers>& answers, const ExtensionOwner& owner,
+                  const CodecLimits& limits) noexcept
+      : _message(message), _answers(answers), _owner(owner), _limits(limits) {}
 
-  /// A one-way call that was read already. Its arguments are moved out by `read`.
-  IPCIncomingCall(OneWayCall& call, const std::shared_ptr<BusReplies>& replies, const CodecLimits& limits);
-
-  std::string_view member() const noexcept { return _member; }
+  std::string_view member() const noexcept { return _message.header->member; }
   /// False for a one-way call: nothing that is answered goes anywhere.
-  bool expectsReply() const noexcept { return _expectsReply; }
+  bool expectsReply() const noexcept { return _message.header->expectsReply; }
 
   /// Reads all arguments, which must be exactly of `signature`. When they are not, tells the caller what is
   /// wrong (or the log, for a one-way call) and returns false: the handler is done with the call. A
-  /// FileDescriptor receives a duplicate of the one descriptor of an `ah`, or none.
+  /// FileDescriptor receives the one descriptor of an `ah`, or none.
   template <class... Arguments>
   [[nodiscard]] bool read(const char* signature, Arguments&... arguments) {
-    if (!checkSignature(signature)) return false;
-    if (_oneWay) {
-      [[maybe_unused]] std::size_t next = 0;
-      return (takeOne(_oneWay->arguments[next++], arguments) && ...) ||
-             refuseArguments(CodecResult::WrongType);
-    }
-    BusDecoder decoder(_message, _limits);
-    return (readOne(decoder, arguments) && ...) || refuseArguments(decoder.result());
+    if (_message.header->signature != signature) return refuseArguments(CodecResult::WrongType);
+    MessageReader reader(_message, _limits);
+    return ((readOne(reader, arguments) && ...) && reader.finish()) || refuseArguments(reader.result());
   }
 
   /// Keeps a descriptor that came with the call until its token is consumed or the connection ends.
   std::string grant(FileDescriptor descriptor);
 
-  void answer(std::vector<IPCArgument> arguments = {});
+  void answer(const std::vector<IPCArgument>& arguments = {});
   /// Both texts are constants.
   void refuse(const char* errorName, const char* text);
 
@@ -61,16 +52,15 @@ class IPCIncomingCall {
   /// for a one-way call. Abandoned, it sends an error.
   template <class... Arguments>
   [[nodiscard]] Reply<Arguments...> takeReply() {
-    std::uint64_t ticket = 0;
-    if (!keep(ticket)) return {};
-    auto send = [replies = _replies, ticket](const Arguments&... values) {
+    if (!owe()) return {};
+    auto send = [answers = _answers, call = _message.serial](const Arguments&... values) {
       std::vector<IPCArgument> arguments;
       arguments.reserve(sizeof...(values));
       (arguments.emplace_back(std::in_place_type<Arguments>, values), ...);
-      sendKept(*replies, ticket, std::move(arguments));
+      answers->settle(call, arguments);
     };
     return Reply<Arguments...>(std::move(send),
-                               [replies = _replies, ticket] { abandonKept(*replies, ticket); });
+                               [answers = _answers, call = _message.serial] { abandon(*answers, call); });
   }
 
   /// Whether it has ended in one of the four ways.
@@ -80,35 +70,19 @@ class IPCIncomingCall {
 
  private:
   template <class T>
-  static bool readOne(BusDecoder& decoder, T& out) {
-    return decoder.read(out);
+  bool readOne(MessageReader& reader, T& out) {
+    return reader.read(out);
   }
-  static bool readOne(BusDecoder& decoder, FileDescriptor& out);
-  template <class T>
-  static bool takeOne(IPCArgument& argument, T& out) {
-    if constexpr (!std::is_same_v<T, FileDescriptor>) {
-      if (T* value = std::get_if<T>(&argument)) {
-        out = std::move(*value);
-        return true;
-      }
-    }
-    return false;  // one-way calls are read without those
-  }
+  bool readOne(MessageReader& reader, FileDescriptor& out);
 
-  bool checkSignature(const char* signature);
   bool refuseArguments(CodecResult result);
-  bool keep(std::uint64_t& ticket);
-  static void sendKept(BusReplies& replies, std::uint64_t ticket,
-                       std::vector<IPCArgument> arguments) noexcept;
-  static void abandonKept(BusReplies& replies, std::uint64_t ticket) noexcept;
+  bool owe();
+  static void abandon(Answers& answers, std::uint32_t call) noexcept;
 
-  sd_bus_message* const _message;  // null for a one-way call that was read already
-  OneWayCall* const _oneWay = nullptr;
-  const std::shared_ptr<BusReplies>& _replies;
-  const ExtensionOwner _owner;
+  Message& _message;
+  const std::shared_ptr<Answers>& _answers;
+  const ExtensionOwner& _owner;
   const CodecLimits& _limits;
-  const std::string_view _member;
-  const bool _expectsReply;
   bool _settled = false;
   const char* _complaint = nullptr;
 };

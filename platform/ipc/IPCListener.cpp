@@ -170,7 +170,8 @@ void IPCListener::Implementation::admit(FileDescriptor socket) {
   auto admission = _registry->admit(peer.user);
   if (admission == ConnectionRegistry::Admission::Admitted) return introduce(std::move(socket), peer);
   // It never blocks: the socket is new, and a line fits.
-  ::send(socket.get(), kTooManyConnections.data(), kTooManyConnections.size(), MSG_NOSIGNAL | MSG_DONTWAIT);
+  const std::string line = std::string(kTooManyConnections) + "\r\n";
+  ::send(socket.get(), line.data(), line.size(), MSG_NOSIGNAL | MSG_DONTWAIT);
   if (_refusals.begins()) {
     VESK_LOG_WARNING("ipc: Refused a connection of user %u: too many are open%s", peer.user,
                      admission == ConnectionRegistry::Admission::TooManyOfUser ? " for that user" : "");

@@ -2,8 +2,8 @@
 
 #include <utility>
 
-#include "platform/ipc/BusCodec.h"
 #include "platform/ipc/CallSize.h"
+#include "platform/ipc/Codec.h"
 
 namespace vesk {
 

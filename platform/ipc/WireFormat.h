@@ -1,4 +1,4 @@
-// The layout of D-Bus messages, and how what they hold is counted. Private to platform/ipc.
+// The layout of D-Bus messages. Private to platform/ipc.
 #pragma once
 
 #include <bit>
@@ -8,11 +8,11 @@
 
 namespace vesk {
 
-static_assert(std::endian::native == std::endian::little,
-              "messages are read and written in the machine's own order");
+static_assert(std::endian::native == std::endian::little, "messages are written in little-endian order");
 
 // The fixed part of a header: byte order, type, flags, version, then three numbers of 32 bits. The fields
-// come behind it, filled up to a multiple of 8, and then the body.
+// follow, padded to a multiple of 8, and then the body.
+inline constexpr std::size_t kFlagsAt = 2;
 inline constexpr std::size_t kBodySizeAt = 4;
 inline constexpr std::size_t kSerialAt = 8;  // never 0
 inline constexpr std::size_t kFieldsSizeAt = 12;
@@ -20,20 +20,35 @@ inline constexpr std::size_t kFixedHeader = 16;
 
 inline constexpr char kLittleEndian = 'l';
 inline constexpr char kBigEndian = 'B';
-inline constexpr char kMethodCall = 1;
 inline constexpr char kNoReplyExpected = 1;
 inline constexpr char kProtocolVersion = 1;
 
-enum HeaderField : std::uint8_t { kPath = 1, kInterface = 2, kMember = 3, kSignature = 8, kDescriptors = 9 };
+enum HeaderField : std::uint8_t {
+  kPath = 1,
+  kInterface = 2,
+  kMember = 3,
+  kErrorName = 4,
+  kReplySerial = 5,
+  kDestination = 6,
+  kSender = 7,
+  kSignature = 8,
+  kUnixDescriptors = 9
+};
+
+/// Descriptors along with one message; no member takes more than one.
+inline constexpr std::size_t kMaximumDescriptors = 4;
 
 /// What a client in excess is told, in place of an answer to its authentication.
-inline constexpr std::string_view kTooManyConnections = "ERROR too many connections\r\n";
+inline constexpr std::string_view kTooManyConnections = "ERROR too many connections";
 
-/// sd-bus refuses more open containers, with the same error as for broken bytes, so its receiver would too. A
-/// dictionary in a dictionary is three: array, entry, variant.
-inline constexpr std::size_t kMaximumContainers = 127;
-
-/// What a value counts for in `CodecLimits::content` besides its text or bytes.
-inline constexpr std::size_t kNodeContent = 8;
+inline constexpr const char* kErrorFailed = "org.freedesktop.DBus.Error.Failed";
+inline constexpr const char* kErrorNoReply = "org.freedesktop.DBus.Error.NoReply";
+inline constexpr const char* kErrorDisconnected = "org.freedesktop.DBus.Error.Disconnected";
+inline constexpr const char* kErrorInvalidArguments = "org.freedesktop.DBus.Error.InvalidArgs";
+inline constexpr const char* kErrorLimitsExceeded = "org.freedesktop.DBus.Error.LimitsExceeded";
+inline constexpr const char* kErrorUnknownObject = "org.freedesktop.DBus.Error.UnknownObject";
+inline constexpr const char* kErrorUnknownInterface = "org.freedesktop.DBus.Error.UnknownInterface";
+inline constexpr const char* kErrorUnknownMethod = "org.freedesktop.DBus.Error.UnknownMethod";
+inline constexpr const char* kErrorUnknownProperty = "org.freedesktop.DBus.Error.UnknownProperty";
 
 }  // namespace vesk

@@ -1,16 +1,24 @@
-// A server's sd-bus that is fed with bytes.
+// A server's sd-bus that is fed with bytes, and its view of what a message says.
 #pragma once
 
 #include <sys/socket.h>
 #include <systemd/sd-bus.h>
 
 #include <cstdlib>
+#include <cstring>
+#include <memory>
 #include <string>
+#include <vector>
 
 #include "platform/files/FileDescriptor.h"
-#include "platform/ipc/BusHandles.h"
+#include "platform/values/Value.h"
 
 namespace vesk::test {
+
+struct BusMessageReleaser {
+  void operator()(sd_bus_message* message) const noexcept { sd_bus_message_unref(message); }
+};
+using BusMessageHandle = std::unique_ptr<sd_bus_message, BusMessageReleaser>;
 
 /// Its client is authenticated and may send descriptors. Aborts on what can't happen.
 class BusServer {
@@ -23,7 +31,7 @@ class BusServer {
     sd_bus* raw = nullptr;
     require(sd_bus_new(&raw) >= 0 && sd_bus_set_fd(raw, ends[0], ends[0]) >= 0);
     _bus.reset(raw);
-    require(sd_bus_set_server(raw, 1, sd_id128_t{{1}}) >= 0);
+    require(sd_bus_negotiate_fds(raw, 1) >= 0 && sd_bus_set_server(raw, 1, sd_id128_t{{1}}) >= 0);
     require(sd_bus_start(raw) >= 0);
     write("\0AUTH EXTERNAL\r\nDATA\r\nNEGOTIATE_UNIX_FD\r\nBEGIN\r\n"s);
     receive();
@@ -34,8 +42,6 @@ class BusServer {
     if (!condition) std::abort();
   }
 
-  sd_bus* bus() { return _bus.get(); }
-
   /// The message that `bytes` are to sd-bus; null when they are none.
   BusMessageHandle read(const std::string& bytes) {
     write(bytes);
@@ -43,6 +49,10 @@ class BusServer {
   }
 
  private:
+  struct Closer {
+    void operator()(sd_bus* bus) const noexcept { sd_bus_close_unref(bus); }
+  };
+
   void write(const std::string& bytes) {
     require(::send(_client.get(), bytes.data(), bytes.size(), 0) == static_cast<ssize_t>(bytes.size()));
   }
@@ -54,7 +64,83 @@ class BusServer {
   }
 
   FileDescriptor _client;
-  BusHandle _bus;
+  std::unique_ptr<sd_bus, Closer> _bus;
 };
+
+/// What is left of the container that `message` is in, as our values; false when sd-bus finds a fault.
+inline bool readBySdBus(sd_bus_message* message, std::vector<Value>& out) {
+  for (;;) {
+    char type = 0;
+    const char* contents = nullptr;
+    const int found = sd_bus_message_peek_type(message, &type, &contents);
+    if (found <= 0) return found == 0;
+    if (type == 'h') return false;
+    if (std::strchr("vare", type)) {
+      const std::string inside = contents;
+      std::vector<Value> values;
+      if (sd_bus_message_enter_container(message, type, contents) < 0) return false;
+      if (!readBySdBus(message, values) || sd_bus_message_exit_container(message) < 0) return false;
+      if (type == 'v') {
+        out.push_back(values.at(0));
+      } else if (type == 'r' && inside == "d") {
+        out.emplace_back(Date{*values.at(0).real()});
+      } else if (type == 'a' && inside.starts_with("{s")) {
+        MutableDictionary dictionary;
+        for (const Value& entry : values) dictionary.append(*(*entry.list())[0].text(), (*entry.list())[1]);
+        out.emplace_back(dictionary.shareUnique());
+      } else if (type == 'a' && inside == "y") {
+        std::string bytes;
+        for (const Value& byte : values) bytes += static_cast<char>(*byte.unsignedInteger());
+        out.emplace_back(Bytes(bytes));
+      } else {
+        out.emplace_back(List(std::move(values)));
+      }
+      continue;
+    }
+    union {
+      std::uint8_t y;
+      std::int16_t n;
+      std::uint16_t q;
+      std::int32_t i;
+      std::uint32_t u;
+      std::int64_t x;
+      std::uint64_t t;
+      double d;
+      const char* s;
+    } raw{};
+    if (sd_bus_message_read_basic(message, type, &raw) <= 0) return false;
+    switch (type) {
+      case 'b':
+        out.emplace_back(raw.i != 0);
+        break;
+      case 'y':
+        out.emplace_back(std::uint64_t{raw.y});
+        break;
+      case 'n':
+        out.emplace_back(std::int64_t{raw.n});
+        break;
+      case 'q':
+        out.emplace_back(std::uint64_t{raw.q});
+        break;
+      case 'i':
+        out.emplace_back(std::int64_t{raw.i});
+        break;
+      case 'u':
+        out.emplace_back(std::uint64_t{raw.u});
+        break;
+      case 'x':
+        out.emplace_back(raw.x);
+        break;
+      case 't':
+        out.emplace_back(raw.t);
+        break;
+      case 'd':
+        out.emplace_back(raw.d);
+        break;
+      default:
+        out.push_back(type == 'g' && *raw.s == '\0' ? Value() : Value(std::string(raw.s)));
+    }
+  }
+}
 
 }  // namespace vesk::test

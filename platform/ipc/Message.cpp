@@ -1,0 +1,179 @@
+#include "platform/ipc/Message.h"
+
+#include <algorithm>
+#include <cstring>
+
+#include "platform/ipc/MessageReader.h"
+#include "platform/ipc/Signature.h"
+#include "platform/ipc/WireCursor.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::size_t kMaximumName = 255;
+
+bool isNameCharacter(char c, bool isFirst) {
+  return c == '_' || (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z') || (!isFirst && c >= '0' && c <= '9');
+}
+
+/// Characters of a member, or of one element of a longer name.
+bool isElement(std::string_view element, bool mayStartWithDigit = false) {
+  if (element.empty()) return false;
+  for (std::size_t i = 0; i < element.size(); ++i) {
+    if (!isNameCharacter(element[i], i == 0 && !mayStartWithDigit)) return false;
+  }
+  return true;
+}
+
+bool isMember(std::string_view name) { return name.size() <= kMaximumName && isElement(name); }
+
+/// Of an interface or an error: two elements at least.
+bool isInterface(std::string_view name) {
+  if (name.size() > kMaximumName || name.find('.') == name.npos) return false;
+  for (;;) {
+    const auto dot = name.find('.');
+    if (!isElement(name.substr(0, dot))) return false;
+    if (dot == name.npos) return true;
+    name.remove_prefix(dot + 1);
+  }
+}
+
+/// As other peers name themselves; messages here need none.
+bool isBusName(std::string_view name) {
+  const bool isUnique = name.starts_with(':');
+  if (isUnique) name.remove_prefix(1);
+  return !name.empty() && name.size() <= kMaximumName && name.find('.') != name.npos &&
+         std::all_of(name.begin(), name.end(),
+                     [](char c) { return c == '.' || c == '-' || isNameCharacter(c, false); }) &&
+         !name.starts_with('.') && !name.ends_with('.') && name.find("..") == name.npos;
+}
+
+/// What a call, an answer, an error or a signal can't do without.
+bool isComplete(const MessageHeader& header) {
+  switch (header.type) {
+    case MessageType::Call:
+      return !header.path.empty() && !header.member.empty();
+    case MessageType::Signal:
+      return !header.path.empty() && !header.interfaceName.empty() && !header.member.empty();
+    case MessageType::Answer:
+      return header.replySerial != 0;
+    case MessageType::Error:
+      return header.replySerial != 0 && !header.errorName.empty();
+  }
+  return true;
+}
+
+class FieldReader {
+ public:
+  FieldReader(std::string_view bytes, MessageHeader& header) noexcept
+      : _cursor(bytes, header.isBigEndian), _header(header) {}
+
+  bool readAll() {
+    while (!_cursor.atEnd()) {
+      std::uint8_t field = 0;
+      std::string_view type;
+      if (!_cursor.align(8) || !_cursor.number(field) || !_cursor.signature(type)) return false;
+      if (field == 0 || completeTypeLength(type) != type.size()) return false;
+      if (field <= kUnixDescriptors) {
+        const unsigned bit = 1U << field;
+        if ((_seen & bit) != 0) return false;
+        _seen |= bit;
+        if (!readKnown(field, type)) return false;
+      } else if (!skip(type)) {
+        return false;
+      }
+    }
+    return true;
+  }
+
+ private:
+  bool readKnown(std::uint8_t field, std::string_view type) {
+    std::string other;
+    switch (field) {
+      case kPath:
+        return type == "o" && text(_header.path, isObjectPath);
+      case kInterface:
+        return type == "s" && text(_header.interfaceName, isInterface);
+      case kMember:
+        return type == "s" && text(_header.member, isMember);
+      case kErrorName:
+        return type == "s" && text(_header.errorName, isInterface);
+      case kDestination:
+      case kSender:
+        return type == "s" && text(other, isBusName);
+      case kReplySerial:
+        return type == "u" && _cursor.number(_header.replySerial) && _header.replySerial != 0;
+      case kUnixDescriptors:
+        return type == "u" && _cursor.number(_header.descriptors);
+      default: {
+        std::string_view signature;
+        if (type != "g" || !_cursor.signature(signature) || !isValidSignature(signature)) return false;
+        _header.signature = signature;
+        return true;
+      }
+    }
+  }
+
+  bool text(std::string& out, bool (*isValid)(std::string_view)) {
+    std::string_view bytes;
+    if (!_cursor.text(bytes) || !isValid(bytes)) return false;
+    out = bytes;
+    return true;
+  }
+
+  /// Fields of later versions of the format are ignored, but their values have to be well-formed.
+  bool skip(std::string_view type) {
+    MessageReader reader(_cursor, type);
+    Value ignored;
+    if (!reader.read(ignored)) return false;
+    _cursor = reader.cursor();
+    return true;
+  }
+
+  WireCursor _cursor;
+  MessageHeader& _header;
+  unsigned _seen = 0;
+};
+
+std::uint32_t numberAt(std::string_view bytes, std::size_t at) noexcept {
+  WireCursor cursor(bytes.substr(at, 4), bytes[0] == kBigEndian);
+  std::uint32_t number = 0;
+  cursor.number(number);
+  return number;
+}
+
+}  // namespace
+
+std::optional<std::uint64_t> messageSize(std::string_view bytes) noexcept {
+  if (bytes[0] != kLittleEndian && bytes[0] != kBigEndian) return std::nullopt;
+  if (bytes[1] == 0 || bytes[3] != kProtocolVersion || numberAt(bytes, kSerialAt) == 0) return std::nullopt;
+  const std::uint64_t fields = numberAt(bytes, kFieldsSizeAt);
+  return kFixedHeader + (fields + 7) / 8 * 8 + numberAt(bytes, kBodySizeAt);
+}
+
+const MessageHeader* HeaderParser::parse(std::string_view bytes) {
+  const std::size_t bodySize = numberAt(bytes, kBodySizeAt);
+  _serial = numberAt(bytes, kSerialAt);
+  const auto fields = bytes.substr(kFieldsSizeAt, bytes.size() - kFieldsSizeAt - bodySize);
+  const bool isLast = !_fields.empty() && fields == _fields && bytes.starts_with({_start, sizeof _start});
+  if (isLast && (bodySize == 0 || !_header.signature.empty())) return &_header;
+
+  _fields.clear();
+  _header = {};
+  _header.type = static_cast<MessageType>(bytes[1]);
+  _header.isBigEndian = bytes[0] == kBigEndian;
+  _header.expectsReply = _header.type == MessageType::Call && (bytes[kFlagsAt] & kNoReplyExpected) == 0;
+  const std::size_t fieldsSize = numberAt(bytes, kFieldsSizeAt);
+  // Fields are aligned as the whole message is, and they begin at a multiple of 8.
+  const auto contents = bytes.substr(kFixedHeader, fieldsSize);
+  const auto padding = fields.substr(kFixedHeader - kFieldsSizeAt + fieldsSize);
+  if (padding.find_first_not_of('\0') != padding.npos) return nullptr;
+  if (!FieldReader(contents, _header).readAll() || !isComplete(_header)) return nullptr;
+  if (bodySize > 0 && _header.signature.empty()) return nullptr;
+  std::memcpy(_start, bytes.data(), sizeof _start);
+  _fields = fields;
+  return &_header;
+}
+
+}  // namespace vesk

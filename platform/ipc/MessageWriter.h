@@ -1,0 +1,59 @@
+// D-Bus messages, in bytes. Private to platform/ipc.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/ipc/Codec.h"
+#include "platform/ipc/IPCConnection.h"
+#include "platform/ipc/Message.h"
+
+namespace vesk {
+
+/// What a message to be written says in its header; empty texts and zeros are left out.
+struct OutgoingHeader {
+  MessageType type = MessageType::Call;
+  bool expectsReply = false;
+  std::string_view path{};
+  std::string_view interfaceName{};
+  std::string_view member{};
+  std::string_view errorName{};
+  std::uint32_t replySerial = 0;
+};
+
+/// Longer messages are refused, as they are by the receiver.
+inline constexpr std::size_t kMaximumMessageSize = std::size_t{1} << 20;
+
+/// Appends a message to `out`, in little-endian order. Unless it returns Ok, `out` is as before, also when it
+/// throws. `serial` is not 0. Descriptors among the arguments are counted; the caller sends them along.
+CodecResult appendMessage(const OutgoingHeader& header, std::uint32_t serial,
+                          const std::vector<IPCArgument>& arguments, std::string& out,
+                          CodecLimits limits = {});
+
+/// Writes calls of one object, and keeps the header of each member that it has called. For one thread.
+class CallWriter {
+ public:
+  explicit CallWriter(std::string objectPath) : _objectPath(std::move(objectPath)) {}
+
+  /// As `appendMessage`. The call's names are constants.
+  CodecResult append(const IPCOutgoingCall& call, std::uint32_t serial, bool expectsReply, std::string& out);
+
+ private:
+  struct Kept {
+    const char* interfaceName;
+    const char* member;
+    std::string signature;
+    std::string bytes;  ///< of a one-way call, without body size and serial
+  };
+
+  const std::string& headerFor(const IPCOutgoingCall& call, const std::string& signature);
+
+  const std::string _objectPath;
+  std::vector<Kept> _kept;
+  std::string _signature;
+};
+
+}  // namespace vesk

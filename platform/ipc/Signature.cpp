@@ -1,0 +1,76 @@
+#include "platform/ipc/Signature.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::string_view kBasicTypes = "ybnqiuxtdsogh";
+constexpr int kMaximumNesting = 32;
+
+std::size_t typeLength(std::string_view signature, int arrays, int structures) noexcept {
+  if (signature.empty()) return 0;
+  const char type = signature[0];
+  if (type == 'v' || kBasicTypes.find(type) != std::string_view::npos) return 1;
+  if (type == 'a') {
+    if (arrays == kMaximumNesting) return 0;
+    auto element = signature.substr(1);
+    if (!element.starts_with('{')) {
+      const std::size_t length = typeLength(element, arrays + 1, structures);
+      return length == 0 ? 0 : 1 + length;
+    }
+    // A dictionary: a basic key and one value.
+    if (structures == kMaximumNesting || element.size() < 2) return 0;
+    if (kBasicTypes.find(element[1]) == std::string_view::npos) return 0;
+    const std::size_t value = typeLength(element.substr(2), arrays + 1, structures + 1);
+    if (value == 0 || 2 + value >= element.size() || element[2 + value] != '}') return 0;
+    return 1 + 2 + value + 1;
+  }
+  if (type != '(' || structures == kMaximumNesting) return 0;
+  std::size_t at = 1;
+  while (at < signature.size() && signature[at] != ')') {
+    const std::size_t member = typeLength(signature.substr(at), arrays, structures + 1);
+    if (member == 0) return 0;
+    at += member;
+  }
+  return at == 1 || at == signature.size() ? 0 : at + 1;
+}
+
+}  // namespace
+
+std::size_t completeTypeLength(std::string_view signature) noexcept { return typeLength(signature, 0, 0); }
+
+bool isValidSignature(std::string_view signature) noexcept {
+  if (signature.size() > 255) return false;
+  while (!signature.empty()) {
+    const std::size_t length = completeTypeLength(signature);
+    if (length == 0) return false;
+    signature.remove_prefix(length);
+  }
+  return true;
+}
+
+std::size_t alignmentOf(char type) noexcept {
+  switch (type) {
+    case 'n':
+    case 'q':
+      return 2;
+    case 'b':
+    case 'i':
+    case 'u':
+    case 's':
+    case 'o':
+    case 'a':
+    case 'h':
+      return 4;
+    case 'x':
+    case 't':
+    case 'd':
+    case '(':
+    case '{':
+      return 8;
+    default:
+      return 1;
+  }
+}
+
+}  // namespace vesk

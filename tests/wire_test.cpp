@@ -1,0 +1,550 @@
+// D-Bus messages: what arrives, what is refused, and whether other implementations agree.
+#include <gtest/gtest.h>
+#include <malloc.h>
+#include <poll.h>
+
+#include <future>
+#include <limits>
+
+#include "platform/ipc/BusClient.h"
+#include "platform/ipc/IPCIncomingCall.h"
+#include "platform/ipc/IPCListener.h"
+#include "platform/ipc/MessageWriter.h"
+#include "platform/ipc/Sasl.h"
+#include "platform/ipc/Signature.h"
+#include "tests/support/BusServer.h"
+#include "tests/support/ChildProcess.h"
+#include "tests/support/TempDirectory.h"
+#include "tests/support/WireMessage.h"
+
+namespace vesk::test {
+namespace {
+
+using namespace std::string_literals;
+
+constexpr char kObjectPath[] = "/test";
+constexpr char kInterface[] = "test.Interface";
+constexpr std::size_t kShown = 1 << 20;
+
+// Inside a dictionary: any more, and the receiver refuses the message.
+constexpr int kDeepest = 41;
+
+Value nested(int depth) {
+  Value value = 1;
+  for (int i = 0; i < depth; ++i) value = Dictionary{{"d", value}};
+  return value;
+}
+
+/// A value of every kind, and the extremes of some.
+Dictionary mixed() {
+  return {{"none", Value()},
+          {"no", false},
+          {"yes", true},
+          {"least", std::numeric_limits<std::int64_t>::min()},
+          {"most", std::numeric_limits<std::uint64_t>::max()},
+          {"real", -0.1},
+          {"infinite", std::numeric_limits<double>::infinity()},
+          {"text", "h\xc3\xa9llo"},
+          {"", ""},
+          {"bytes", Bytes(std::string("\0\xff", 2))},
+          {"no bytes", Bytes()},
+          {"date", Date{-12.25}},
+          {"list", List{1, "a", List{}, Dictionary{{"ü", 1}}, Dictionary{}}},
+          {"mixed", Dictionary{{"x", Dictionary{{"y", List{Date{1}, true}}}}}}};
+}
+
+/// Every type of argument, with and without what may be absent.
+std::vector<IPCArgument> arguments(bool full) {
+  using Texts = std::vector<std::string>;
+  if (!full) {
+    return {false,
+            std::uint16_t{0},
+            0.0,
+            ""s,
+            Dictionary{},
+            List{},
+            std::optional<Dictionary>(),
+            std::optional<std::string>(),
+            Texts{},
+            std::optional<Texts>()};
+  }
+  return {true,
+          std::uint16_t{65535},
+          -1.5,
+          "h\xc3\xa9llo, longer than eight"s,
+          Dictionary{{"mixed", mixed()}, {"deepest", nested(kDeepest)}},
+          List{"a", 2U, Bytes("b")},
+          std::optional<Dictionary>(Dictionary{{"k", "v"}}),
+          std::optional<std::string>("t"),
+          Texts{"a", "", "bcd"},
+          std::optional<Texts>(Texts{"x", "y"})};
+}
+
+const OutgoingHeader kHeader{.path = kObjectPath, .interfaceName = kInterface, .member = "m"};
+
+std::string message(const OutgoingHeader& header, const std::vector<IPCArgument>& arguments) {
+  std::string bytes;
+  EXPECT_EQ(appendMessage(header, 7, arguments, bytes), CodecResult::Ok);
+  return bytes;
+}
+
+/// Serves "take" (every type of argument) and "echo" (any value), and ends a wait with "done".
+class Echo final : public IPCExportedObject, public IPCListenerDelegate {
+ public:
+  Echo() {
+    IPCListener::Options options;
+    options.socketPath = socket();
+    options.objectPath = kObjectPath;
+    _listener = std::make_unique<IPCListener>(std::move(options));
+    _listener->setDelegate(this);
+    _listener->resume();
+  }
+  std::string socket() const { return _directory / "run/socket"; }
+  const char* interfaceName() const override { return kInterface; }
+  const char* introspection() const override { return "<interface name=\"test.Interface\"/>\n"; }
+  void handle(IPCIncomingCall& call) override {
+    if (call.member() == "echo") {
+      Value value;
+      if (call.read("v", value)) call.answer({List{value}});
+      return;
+    }
+    bool flag = false;
+    std::uint16_t number = 0;
+    double real = 0;
+    std::string text;
+    Dictionary dictionary;
+    List list;
+    std::optional<Dictionary> maybeDictionary;
+    std::optional<std::string> maybeText;
+    std::vector<std::string> texts;
+    std::optional<std::vector<std::string>> maybeTexts;
+    EXPECT_TRUE(call.read("bqdsa{sv}avaa{sv}asasaas", flag, number, real, text, dictionary, list,
+                          maybeDictionary, maybeText, texts, maybeTexts));
+    taken.set_value(
+        {flag, number, real, text, dictionary, list, maybeDictionary, maybeText, texts, maybeTexts});
+    call.answer();
+  }
+  bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) override {
+    connection->setExportedObject(std::shared_ptr<IPCExportedObject>(this, [](auto*) {}));
+    connection->resume();
+    return true;
+  }
+
+  std::promise<std::vector<IPCArgument>> taken;
+
+ private:
+  TempDirectory _directory;
+  std::unique_ptr<IPCListener> _listener;
+};
+
+TEST(Wire, CarriesEveryArgument) {
+  for (bool full : {false, true}) {
+    for (bool expectsReply : {false, true}) {
+      Echo echo;
+      BusClient::Options options;
+      options.socketPath = echo.socket();
+      options.objectPath = kObjectPath;
+      BusClient client(std::move(options));
+      const IPCOutgoingCall call{kInterface, "take", arguments(full)};
+      bool isAnswered = !expectsReply;
+      auto answered = [&](BusAnswer& answer) { isAnswered = !answer.isError(); };
+      auto result = expectsReply ? client.send(call, answered, std::chrono::seconds(60)) : client.send(call);
+      ASSERT_EQ(result, BusClient::SendResult::Sent) << "it waits until the client has been let in";
+      auto taken = echo.taken.get_future();
+      while (!isAnswered || taken.wait_for(std::chrono::seconds(0)) != std::future_status::ready) {
+        pollfd poll{client.fd(), client.events(), 0};
+        ::poll(&poll, 1, isAnswered ? 10 : client.timeout());
+        ASSERT_EQ(client.process(), BusClient::Progress::Connected);
+      }
+      EXPECT_EQ(client.queuedMessages(), 0U);
+      EXPECT_EQ(message(kHeader, taken.get()), message(kHeader, arguments(full)));
+    }
+  }
+}
+
+// GIO and libdbus send each type in both byte orders, and compare what comes back.
+TEST(Wire, UnderstandsOtherImplementations) {
+  Echo echo;
+  ChildProcess peers({VESK_PYTHON, VESK_WIRE_PEERS, echo.socket()});
+  EXPECT_EQ(peers.wait(), 0) << peers.output() << peers.errors();
+}
+
+// --- Against sd-bus
+
+std::string described(std::vector<Value> values) { return describe(List(std::move(values)), kShown); }
+
+/// All arguments of the message that `bytes` are; "refused" when they are none, or when bytes are left behind
+/// the arguments and `toTheEnd`.
+std::string readHere(const std::string& bytes, bool toTheEnd = true) {
+  HeaderParser parser;
+  const auto* header = parser.parse(bytes);
+  if (!header || header->descriptors > 0) return "refused";
+  MessageReader reader({header, parser.serial(), std::string_view(bytes).substr(parser.headerSize()), {}});
+  std::vector<Value> values;
+  for (std::string_view types = header->signature; !types.empty();
+       types.remove_prefix(completeTypeLength(types))) {
+    if (!reader.read(values.emplace_back())) return "refused";
+  }
+  return !toTheEnd || reader.finish() ? described(std::move(values)) : "refused";
+}
+
+std::string readBySdBus(BusServer& server, const std::string& bytes) {
+  BusMessageHandle message = server.read(bytes);
+  std::vector<Value> values;
+  return message && test::readBySdBus(message.get(), values) ? described(std::move(values)) : "refused";
+}
+
+/// A call with values of several forms, in either byte order.
+std::string handMade(bool bigEndian) {
+  Marshalled texts(bigEndian);
+  texts.text("a");
+  texts.align(4);
+  texts.text("h\xc3\xa9");
+  const std::string elements = texts.take();
+  Marshalled body(bigEndian);
+  body.number(5);
+  body.number(1);
+  body.number(static_cast<std::uint32_t>(elements.size()));
+  body.raw(elements);
+  body.signature("(s)");
+  body.align(8);
+  body.text("v");
+  body.signature("as");
+  body.align(4);
+  body.text("/a/b");
+  return wireMessage("m", "ubasvgo", body.take(), {.bigEndian = bigEndian});
+}
+
+TEST(Wire, IsReadBySdBusAsItWasWritten) {
+  BusServer server;
+  for (const OutgoingHeader& header : {
+           OutgoingHeader{.path = "/o", .interfaceName = "i.f", .member = "m"},
+           OutgoingHeader{.expectsReply = true, .path = "/", .member = "m"},
+           OutgoingHeader{.type = MessageType::Answer, .replySerial = 9},
+           OutgoingHeader{.type = MessageType::Error, .errorName = "e.E", .replySerial = 9},
+           OutgoingHeader{.type = MessageType::Signal, .path = "/o", .interfaceName = "i.f", .member = "m"},
+       }) {
+    for (bool full : {false, true}) {
+      const std::string bytes = message(header, arguments(full));
+      EXPECT_EQ(readHere(bytes), readBySdBus(server, bytes));
+      EXPECT_NE(readHere(bytes), "refused");
+      BusMessageHandle read = server.read(bytes);
+      ASSERT_TRUE(read);
+      std::uint64_t number = 0;
+      EXPECT_GE(sd_bus_message_get_cookie(read.get(), &number), 0);
+      EXPECT_EQ(number, 7U);
+      EXPECT_EQ(sd_bus_message_get_expect_reply(read.get()) > 0, header.expectsReply);
+      if (header.replySerial != 0) {
+        EXPECT_GE(sd_bus_message_get_reply_cookie(read.get(), &number), 0);
+        EXPECT_EQ(number, 9U);
+      }
+    }
+  }
+}
+
+// sd-bus takes four kinds of message that break the format's rules.
+enum class SdBusIsLax { No, BodyWithoutSignature, BytesBehindTheArguments, BooleanBeyondOne, Padding };
+
+/// Why sd-bus reads `bytes`, of which the byte `at` was changed, when we don't.
+SdBusIsLax whySdBusReads(const std::string& bytes, std::size_t at, const std::string& there) {
+  if (there == "[]") return SdBusIsLax::BodyWithoutSignature;
+  if (readHere(bytes, false) == there) return SdBusIsLax::BytesBehindTheArguments;
+  std::string padding = bytes;
+  padding[at] = '\0';
+  if (readHere(padding) == there) return SdBusIsLax::Padding;
+  std::string boolean = bytes;
+  const char one[] = {bytes[0] == 'l', 0, 0, bytes[0] == 'B'};
+  boolean.replace(at / 4 * 4, 4, one, 4);
+  return readHere(boolean) == there ? SdBusIsLax::BooleanBeyondOne : SdBusIsLax::No;
+}
+
+// Whatever bit of a message is wrong, both readers refuse it, or read the same.
+TEST(Wire, AgreesWithSdBusOnBrokenMessages) {
+  BusServer server;
+  int read = 0;
+  int refused = 0;
+  int lax = 0;
+  auto compare = [&](const std::string& bytes, std::size_t at) {
+    const auto size = messageSize(bytes);
+    if (!size || *size != bytes.size()) return;  // another frame: both wait for more, or end the connection
+    const std::string here = readHere(bytes);
+    const std::string there = readBySdBus(server, bytes);
+    ++(here == "refused" ? refused : read);
+    if (here == there) return;
+    ++lax;
+    EXPECT_TRUE(here == "refused" && whySdBusReads(bytes, at, there) != SdBusIsLax::No)
+        << "byte " << at << "\n"
+        << here << "\n"
+        << there;
+  };
+  const std::string ordinary =
+      message(kHeader, {mixed(), std::optional<Dictionary>(Dictionary{{"k", "v"}}), List{"a", 2U}, true,
+                        std::uint16_t{9}, "text"s, std::vector<std::string>{"a"}});
+  for (const std::string& whole : {ordinary, handMade(false), handMade(true)}) {
+    EXPECT_NE(readHere(whole), "refused");
+    compare(whole, 0);
+    for (std::size_t at = 0; at < whole.size() && !HasFailure(); ++at) {
+      for (int bit = 0; bit < 8; ++bit) {
+        std::string bytes = whole;
+        bytes[at] = static_cast<char>(bytes[at] ^ (1 << bit));
+        compare(bytes, at);
+      }
+    }
+    for (std::size_t length = kFixedHeader; length < whole.size(); ++length) {
+      EXPECT_GT(messageSize(whole.substr(0, length)), length) << "cut at " << length;
+    }
+  }
+  EXPECT_GT(read, 1000);
+  EXPECT_GT(refused, 1000);
+  EXPECT_LT(lax, 300);
+}
+
+/// The body of one text-like value, and its message.
+std::string single(const char* type, const std::string& text) {
+  Marshalled body(false);
+  *type == 'g' ? body.signature(text) : body.text(text);
+  return wireMessage("m", type, body.take());
+}
+
+TEST(Wire, AgreesWithSdBusOnNamesAndTypes) {
+  struct Case {
+    const char* type;
+    std::string text;
+    bool isValid;
+    bool sdBusIsLax = false;
+  };
+  BusServer server;
+  for (const Case& c : {
+           Case{"o", "/", true},
+           Case{"o", "/a_1/B", true},
+           Case{"o", "", false},
+           Case{"o", "a", false},
+           Case{"o", "/a/", false},
+           Case{"o", "/a//b", false},
+           Case{"o", "/a-b", false},
+           Case{"g", "", true},
+           Case{"g", "ybnqiuxtdsogv", true},
+           Case{"g", "a{sa(iv)}(s(b)ay)", true},
+           Case{"g", std::string(32, 'a') + "y", true},
+           Case{"g", std::string(33, 'a') + "y", false},
+           Case{"g", std::string(32, '(') + "y" + std::string(32, ')'), true},
+           Case{"g", std::string(33, '(') + "y" + std::string(33, ')'), false},
+           Case{"g", "a", false},
+           Case{"g", "()", false},
+           Case{"g", "(i", false},
+           Case{"g", "i)", false},
+           Case{"g", "{sv}", false, true},
+           Case{"g", "a{vs}", false},
+           Case{"g", "a{s}", false},
+           Case{"g", "a{sss}", false},
+           Case{"g", "a{sv", false},
+           Case{"g", "z", false},
+           Case{"s", "a\xc2\xa0z", true},
+           Case{"s", "a\0b"s, false},
+           Case{"s", "\xed\xa0\x80", false},
+           Case{"s", "\xc0\x80", false},
+       }) {
+    SCOPED_TRACE(std::string(c.type) + " " + ::testing::PrintToString(c.text));
+    const std::string bytes = single(c.type, c.text);
+    EXPECT_EQ(readHere(bytes) != "refused", c.isValid);
+    EXPECT_EQ(readBySdBus(server, bytes) != "refused", c.isValid || c.sdBusIsLax);
+  }
+}
+
+/// A header of these fields, each a code, a type and a value, with nothing behind it.
+std::string headerOnly(char type, const std::vector<std::tuple<char, const char*, std::string>>& list) {
+  Marshalled fields(false);
+  for (const auto& [code, signature, value] : list) {
+    if (*signature == 'u') {
+      fields.align(8);
+      fields.raw(std::string(1, code) + "\1u\0"s);
+      fields.number(static_cast<std::uint32_t>(std::stoul(value)));
+    } else {
+      fields.field(code, signature, value);
+    }
+  }
+  const std::string bytes = fields.take();
+  Marshalled whole(false);
+  whole.raw(std::string("l") + type + "\1\1");
+  whole.number(0);
+  whole.number(1);
+  whole.number(static_cast<std::uint32_t>(bytes.size()));
+  whole.raw(bytes);
+  whole.align(8);
+  return whole.take();
+}
+
+TEST(Wire, AgreesWithSdBusOnHeaders) {
+  using Fields = std::vector<std::tuple<char, const char*, std::string>>;
+  const std::tuple<char, const char*, std::string> path{1, "o", "/o"};
+  const std::tuple<char, const char*, std::string> member{3, "s", "m"};
+  struct Case {
+    const char* what;
+    char type;
+    Fields fields;
+    bool isValid;
+    bool sdBusIsLax = false;
+  };
+  BusServer server;
+  for (const Case& c : {
+           Case{"a call", 1, {path, member}, true},
+           Case{"fields in another order", 1, {member, path}, true},
+           Case{"a call without a path", 1, {member}, false},
+           Case{"a call without a member", 1, {path}, false},
+           Case{"a signal without an interface", 4, {path, member}, false},
+           Case{"an answer to no call", 2, {}, false},
+           Case{"an answer", 2, {{5, "u", "3"}}, true},
+           Case{"an answer to call 0", 2, {{5, "u", "0"}}, false},
+           Case{"an error without a name", 3, {{5, "u", "3"}}, false},
+           Case{"an error", 3, {{5, "u", "3"}, {4, "s", "a.B"}}, true},
+           Case{"a field twice", 1, {path, member, member}, false},
+           Case{"a field of another type", 1, {{1, "s", "/o"}, member}, false},
+           Case{"no path", 1, {{1, "o", "o"}, member}, false},
+           Case{"no member", 1, {path, {3, "s", "m.n"}}, false},
+           Case{"a member that begins with a digit", 1, {path, {3, "s", "1m"}}, false, true},
+           Case{"a long member", 1, {path, {3, "s", std::string(256, 'm')}}, false},
+           Case{"an interface of one word", 1, {path, member, {2, "s", "i"}}, false},
+           Case{"an interface with an empty word", 1, {path, member, {2, "s", "i..f"}}, false},
+           Case{"an interface", 1, {path, member, {2, "s", "i.f_1.g"}}, true},
+           Case{"an error of one word", 3, {{5, "u", "3"}, {4, "s", "a"}}, false},
+           Case{"a sender", 1, {path, member, {7, "s", ":1.5"}}, true},
+           Case{"a sender without a name", 1, {path, member, {7, "s", ":"}}, false},
+           Case{"a destination", 1, {path, member, {6, "s", "a-b.c"}}, true},
+           Case{"a destination of one word", 1, {path, member, {6, "s", "ab"}}, false},
+           Case{"a field of a later version", 1, {path, member, {42, "s", "x"}}, true},
+           Case{"one that is broken", 1, {path, member, {42, "s", "\xff"}}, false},
+           Case{"a signature of half a type", 1, {path, member, {8, "g", "a"}}, false},
+           Case{"a signature that a body lacks", 1, {path, member, {8, "g", "s"}}, false},
+       }) {
+    SCOPED_TRACE(c.what);
+    const std::string bytes = headerOnly(c.type, c.fields);
+    EXPECT_EQ(readHere(bytes) != "refused", c.isValid);
+    EXPECT_EQ(readBySdBus(server, bytes) != "refused", c.isValid || c.sdBusIsLax);
+  }
+}
+
+// --- Limits
+
+TEST(Wire, WritesNothingThatNoReceiverTakes) {
+  struct Case {
+    const char* what;
+    Value value;
+    CodecResult result;
+  };
+  Value lists = 1;
+  for (int i = 0; i < 63; ++i) lists = List{lists};
+  for (const Case& c : {
+           Case{"not UTF-8", "\xff", CodecResult::Malformed},
+           Case{"a NUL", std::string("12345678\0", 9), CodecResult::Malformed},
+           Case{"a bad key", Dictionary{{"\xff", 1}}, CodecResult::Malformed},
+           Case{"100,000 values", List(std::vector<Value>(100'000)), CodecResult::LimitExceeded},
+           Case{"1 MiB", std::string(std::size_t{1} << 20, 'x'), CodecResult::LimitExceeded},
+           Case{"too many containers", nested(kDeepest + 1), CodecResult::LimitExceeded},
+           Case{"too many lists", lists, CodecResult::LimitExceeded},
+           Case{"too long a message", List(std::vector<Value>(90'000, Date{})), CodecResult::LimitExceeded},
+           Case{"the deepest", nested(kDeepest), CodecResult::Ok},
+           Case{"text", "\x01 \u00e9", CodecResult::Ok},
+       }) {
+    SCOPED_TRACE(c.what);
+    CallWriter writer(kObjectPath);
+    std::string out = "before";
+    EXPECT_EQ(writer.append({kInterface, "m", {Dictionary{{"k", c.value}}}}, 1, false, out), c.result);
+    EXPECT_EQ(out == "before", c.result != CodecResult::Ok);
+  }
+}
+
+#if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
+TEST(Wire, AnEventKeepsLittleMoreThanWhatIsCounted) {
+  const Dictionary payload{{"a", "b"}, {"l", List{Dictionary{{"c", 1}}}}};
+  const std::string bytes =
+      message(kHeader, {Dictionary{{"payload", payload}, {"stray", std::string(7'900, 'x')}}});
+  HeaderParser parser;
+  std::vector<Dictionary> kept;
+  const std::size_t before = ::mallinfo2().uordblks;
+  for (int i = 0; i < 1000; ++i) {
+    const auto* header = parser.parse(bytes);
+    MessageReader reader({header, 1, std::string_view(bytes).substr(parser.headerSize()), {}});
+    Dictionary whole;
+    ASSERT_TRUE(reader.read(whole));
+    kept.push_back(*whole.dictionary("payload"));
+  }
+  EXPECT_EQ(kept.back(), payload);
+  EXPECT_LT(::mallinfo2().uordblks - before, 1000 * (approximateMemory(kept[0]) + 1024) * 11 / 10);
+}
+#endif
+
+// --- Authentication
+
+TEST(Sasl, ServesLines) {
+  struct Case {
+    const char* said;
+    const char* answers;  ///< the first word of each line
+    SaslServer::Verdict verdict;
+  };
+  using V = SaslServer::Verdict;
+  for (const Case& c : {
+           Case{"AUTH EXTERNAL 31303030\r\nNEGOTIATE_UNIX_FD\r\nBEGIN\r\n", "OK AGREE_UNIX_FD ", V::Begun},
+           Case{"AUTH EXTERNAL\r\nDATA\r\nBEGIN\r\n", "DATA OK ", V::Begun},
+           Case{"AUTH EXTERNAL\r\nDATA 31303030\r\nBEGIN\r\n", "DATA OK ", V::Begun},
+           Case{"AUTH\r\nAUTH ANONYMOUS\r\nAUTH DBUS_COOKIE_SHA1 00\r\n", "REJECTED REJECTED REJECTED ",
+                V::Continue},
+           Case{"AUTH EXTERNAL 31303031\r\nBEGIN\r\n", "REJECTED ", V::Refused},
+           Case{"AUTH EXTERNAL\r\nDATA 31\r\nDATA\r\n", "DATA REJECTED ERROR ", V::Continue},
+           Case{"AUTH EXTERNAL\r\nCANCEL\r\nAUTH EXTERNAL 31303030\r\nERROR\r\n",
+                "DATA REJECTED OK REJECTED ", V::Continue},
+           Case{"AUTH EXTERNAL\r\nBEGIN\r\n", "DATA ", V::Refused},
+           Case{"BEGIN\r\n", "", V::Refused},
+           Case{"NEGOTIATE_UNIX_FD\r\nDATA\r\nHELLO\r\n\r\n", "ERROR ERROR ERROR ERROR ", V::Continue},
+           Case{"AUTH EXTERNAL 31303030\r\nDATA BEGIN\r\n", "OK ERROR ", V::Continue},
+       }) {
+    for (bool atOnce : {true, false}) {
+      SCOPED_TRACE(c.said);
+      SaslServer server(1000);
+      const std::string data = "\0"s + c.said;
+      std::string answers;
+      SaslServer::Step step;
+      std::size_t taken = 0;
+      for (std::size_t end = atOnce ? data.size() : 1; end <= data.size(); ++end) {
+        step = server.step(std::string_view(data).substr(taken, end - taken));
+        taken += step.taken;
+        answers += step.answer;
+        if (step.verdict != V::Continue) break;
+      }
+      std::string words;
+      for (std::size_t at = 0; at < answers.size(); at = answers.find('\n', at) + 1) {
+        words += answers.substr(at, answers.find_first_of(" \r", at) - at) + " ";
+      }
+      EXPECT_EQ(step.verdict, c.verdict);
+      if (c.verdict != V::Refused || !atOnce) {
+        EXPECT_EQ(words, c.answers);
+      }
+    }
+  }
+  EXPECT_EQ(SaslServer(1000).step("AUTH").verdict, V::Refused) << "without the first NUL";
+  EXPECT_EQ(SaslServer(1000).step("\0"s + std::string(1025, 'x')).verdict, V::Refused);
+  std::string many(1, '\0');
+  for (int i = 0; i < 33; ++i) many += "AUTH\r\n";
+  EXPECT_EQ(SaslServer(1000).step(many).verdict, V::Refused);
+}
+
+TEST(Sasl, ClientReadsAnswers) {
+  using V = SaslClient::Verdict;
+  struct Case {
+    const char* heard;
+    V verdict;
+    const char* refusal;
+  };
+  for (const Case& c :
+       {Case{"DATA\r\nOK 12\r\nAGREE_UNIX_FD\r\n", V::Accepted, ""},
+        Case{"DATA\r\nOK 12\r\n", V::Continue, ""},
+        Case{"REJECTED EXTERNAL\r\n", V::Refused, "REJECTED EXTERNAL"},
+        Case{"DATA\r\nOKAY\r\n", V::Refused, "OKAY"}, Case{"DATA\r\nOK\r\nERROR\r\n", V::Refused, "ERROR"}}) {
+    SaslClient client;
+    EXPECT_EQ(client.step(c.heard).verdict, c.verdict) << c.heard;
+    EXPECT_EQ(client.refusal(), c.refusal);
+  }
+  EXPECT_EQ(SaslClient().step(std::string(1025, 'x')).verdict, V::Refused);
+}
+
+}  // namespace
+}  // namespace vesk::test
