@@ -42,6 +42,7 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
   std::optional<std::string> storebagVersionForSession(ReportingdSession& session) override;
   std::optional<std::string> parentSessionIDStringForSession(ReportingdSession& session) override;
   void userInfoUpdatedForSession(ReportingdSession& session) override;
+  bool mayHaveAncestor(ReportingdSession& session) const override;
   std::shared_ptr<ReportingdSession> getAncestorWithAggregatorForSession(ReportingdSession& session) override
       VESK_REQUIRES(_monitor);
   void updateDownstreamSessions(ReportingdSession& session) override;

@@ -119,16 +119,19 @@ std::optional<std::string> ReportingdAgent::parentSessionIDStringForSession(Repo
   return chain;
 }
 
-std::shared_ptr<ReportingdSession> ReportingdAgent::getAncestorWithAggregatorForSession(
-    ReportingdSession& session) {
-  auto userInfo = session.userInfo();
-  if (!userInfo) {
+bool ReportingdAgent::mayHaveAncestor(ReportingdSession& session) const {
+  if (!session.userInfo()) {
     VESK_LOG_INFO("getAncestorWithAggregatorForSession: No user info found for session %u",
                   session.sessionID());
-    return nullptr;
+    return false;
   }
-  std::int32_t level = session.getSessionHierarchy();
-  if (level < 1) return nullptr;
+  return session.getSessionHierarchy() >= 1;
+}
+
+std::shared_ptr<ReportingdSession> ReportingdAgent::getAncestorWithAggregatorForSession(
+    ReportingdSession& session) {
+  if (!mayHaveAncestor(session)) return nullptr;
+  const std::int32_t level = session.getSessionHierarchy();
   const SessionList* list = correlatedSessions(*session.correlationKey());
   if (!list) return nullptr;
   // The list is walked, not the levels: those come from outside, and may be any number.

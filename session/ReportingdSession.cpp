@@ -23,6 +23,18 @@ std::uint32_t sessionIDIn(const Dictionary& sessionInfo) {
       integerForKey(sessionInfo, kVeskReportingSessionInfoSessionID).value_or(0));
 }
 
+// The messages of the batch are posted by now: an answer that can't be sent would make the client send them
+// again.
+std::optional<std::string> fittingAnswer(std::optional<std::string> answer) {
+  if (!answer || answer->size() <= kMaxAnswerBytes) return answer;
+  const std::string notice = "\n[cut: this answer has " + std::to_string(answer->size()) + " bytes]";
+  std::size_t end = kMaxAnswerBytes - notice.size();
+  while (end > 0 && (static_cast<unsigned char>((*answer)[end]) & 0xC0) == 0x80) --end;
+  answer->resize(end);
+  *answer += notice;
+  return answer;
+}
+
 bool requiresUserInfo(const Dictionary& sessionInfo) {
   return booleanForKey(sessionInfo, kVeskReportingSessionInfoRequireUserInfo).value_or(false);
 }
@@ -61,7 +73,9 @@ ReportingdSession::~ReportingdSession() {
   });
   attempt([this] { flushMessages(); });
   attempt([this] { shutdownSessionAggregation(); });
-  attempt([this] { cleanupBackends(backends()); });
+  attempt([this] {
+    if (auto set = backends()) cleanupBackends(*set);
+  });
 }
 
 // --- Identity
@@ -86,11 +100,6 @@ std::optional<Dictionary> ReportingdSession::sessionInfo() const {
 std::optional<Dictionary> ReportingdSession::userInfo() const {
   MutexLock lock(_mutex);
   return _userInfo;
-}
-
-bool ReportingdSession::hasAggregator() const {
-  MutexLock lock(_mutex);
-  return _hasAggregator;
 }
 
 std::string ReportingdSession::description() const {
@@ -178,18 +187,18 @@ void ReportingdSession::sendMessageWithCategory(std::uint16_t category, std::uin
                                                 const std::optional<Dictionary>& payload,
                                                 Reply<std::optional<std::string>> reply) {
   VESK_LOG_DEBUG("sendMessageWithCategory: Sending message for session %u", sessionID());
-  reply(sendMessageWithCategory(category, type, payload));
+  reply(fittingAnswer(sendMessageWithCategory(category, type, payload)));
 }
 
 void ReportingdSession::sendMessageWithDictionary(const Dictionary& parameters,
                                                   Reply<std::optional<std::string>> reply) {
   VESK_LOG_DEBUG("sendMessageWithCategory: Sending message for session %u", sessionID());
-  reply(sendMessageWithDictionary(parameters));
+  reply(fittingAnswer(sendMessageWithDictionary(parameters)));
 }
 
 void ReportingdSession::flushMessagesWithReply(Reply<std::optional<std::string>> reply) {
   VESK_LOG_DEBUG("flushMessagesWithReply: Flushing messages for session %u", sessionID());
-  reply(flushMessages());
+  reply(fittingAnswer(flushMessages()));
 }
 
 void ReportingdSession::uploadFileAtPath(const std::string& fileURL, const std::string& extensionToken,
@@ -203,8 +212,8 @@ void ReportingdSession::sendMessageWithSessionInfo(const Dictionary& sessionInfo
                                                    std::uint16_t category, std::uint16_t type,
                                                    const std::optional<Dictionary>& payload,
                                                    Reply<std::string> reply) {
-  if (!sessionInfo.contains(kVeskReportingSessionInfoClientType) ||
-      !sessionInfo.contains(kVeskReportingSessionInfoSessionID)) {
+  if (!integerForKey(sessionInfo, kVeskReportingSessionInfoClientType) ||
+      !integerForKey(sessionInfo, kVeskReportingSessionInfoSessionID)) {
     VESK_LOG_ERROR("sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo");
     _services.backends.counters.count("session", DropReason::InvalidMessage);
     return;  // the reply, destroyed uncalled, tells the caller

@@ -4,6 +4,7 @@
 #include <sys/time.h>
 
 #include <array>
+#include <atomic>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -65,6 +66,13 @@ class ReportingdSession final : public ClientSessionInterface,
                                   const std::optional<Dictionary>& payload,
                                   Reply<std::string> reply) override;
 
+  /// What `sendMessageWithSessionInfo` does with its storebag: sends one message through backends of its own.
+  static void sendSingleMessage(const SessionServices& services, uid_t user,
+                                const std::optional<Dictionary>& sessionInfo,
+                                const std::optional<Dictionary>& userInfo,
+                                const std::optional<Dictionary>& storebag, std::uint16_t category,
+                                std::uint16_t type, const std::optional<Dictionary>& payload);
+
   // --- Identity
   /// The client's number for the session; 0 until configured.
   std::uint32_t sessionID() const;
@@ -80,7 +88,7 @@ class ReportingdSession final : public ClientSessionInterface,
   // --- Relatives
   /// The level in the family: 0 at the top.
   std::int32_t getSessionHierarchy() const;
-  bool hasAggregator() const;
+  bool hasAggregator() const noexcept { return _hasAggregator.load(); }
   void updateCombinedSessionID() VESK_EXCLUDES(_mutex);
   void syncReportingStates() VESK_EXCLUDES(_mutex);
   void shutdownSessionAggregation() VESK_EXCLUDES(_mutex);
@@ -100,7 +108,7 @@ class ReportingdSession final : public ClientSessionInterface,
   void updateSessionWithDefaultSessionInfo() VESK_EXCLUDES(_mutex);
   void updateReportingStates() VESK_EXCLUDES(_mutex);
   void receivedUserInfo(const std::optional<Dictionary>& userInfo) VESK_EXCLUDES(_mutex);
-  static void cleanupBackends(const SharedBackends& backends);
+  static void cleanupBackends(const BackendSet& backends);
   SharedBackends backends() const;
   std::string displayURLText() const;
 
@@ -113,13 +121,9 @@ class ReportingdSession final : public ClientSessionInterface,
                                              std::uint32_t flag);
   void internalSendMessage(const Dictionary& payload, std::uint16_t method, std::uint16_t respCode);
   std::optional<std::string> flushMessages();
+  static std::optional<std::string> flushBackends(const BackendSet& backends);
   void uploadFileWithURL(const std::string& fileURL, const std::string& extensionToken,
                          Reply<bool> completionHandler);
-  static void sendSingleMessage(const SessionServices& services, uid_t user,
-                                const std::optional<Dictionary>& sessionInfo,
-                                const std::optional<Dictionary>& userInfo,
-                                const std::optional<Dictionary>& storebag, std::uint16_t category,
-                                std::uint16_t type, const std::optional<Dictionary>& payload);
 
   // Relatives.
   static std::shared_ptr<const std::string> keyFor(const std::optional<Dictionary>& userInfo);
@@ -137,6 +141,9 @@ class ReportingdSession final : public ClientSessionInterface,
 
   bool _isEnding = false;  // by its destructor's thread alone
 
+  // Read for every message of the session, and changed by the session's relatives.
+  std::atomic<bool> _hasAggregator{false};
+
   // Guarded by _mutex.
   mutable Mutex _mutex;
   std::uint32_t _sessionID VESK_GUARDED_BY(_mutex) = 0;
@@ -146,7 +153,6 @@ class ReportingdSession final : public ClientSessionInterface,
   List _frameworks VESK_GUARDED_BY(_mutex);  // kept for the session's life and not consulted
   SharedBackends _backends VESK_GUARDED_BY(_mutex);
   std::optional<std::string> _storebagVersion VESK_GUARDED_BY(_mutex);
-  bool _hasAggregator VESK_GUARDED_BY(_mutex) = false;
   WarningBurst _undelivered VESK_GUARDED_BY(_mutex);  // of messages to this session's client
 };
 

@@ -52,7 +52,9 @@ std::int32_t ReportingdSession::getSessionHierarchy() const {
 void ReportingdSession::aggregateMessage(const std::optional<Dictionary>& sessionInfo, double timestamp,
                                          std::uint16_t category, std::uint16_t type,
                                          const std::optional<Dictionary>& payload) {
-  {
+  // A message at the top of its family does not wait for the monitor, which is held across a storebag's
+  // fetch.
+  if (_sessionDelegate->mayHaveAncestor(*this)) {
     // Declared outside the lock's scope: the last holder of a session destroys it, and must not do so under
     // the lock.
     std::shared_ptr<ReportingdSession> ancestor;
@@ -86,12 +88,7 @@ bool ReportingdSession::undeliveredBurstBegins() {
 
 void ReportingdSession::shutdownSessionAggregation() {
   VESK_LOG_DEBUG("shutdownSessionAggregation: Disable aggregation module for session %u", sessionID());
-  bool wasOn;
-  {
-    MutexLock lock(_mutex);
-    wasOn = std::exchange(_hasAggregator, false);
-  }
-  if (wasOn) sendToAggregator(std::nullopt, 0, 0, 0, std::nullopt);
+  if (_hasAggregator.exchange(false)) sendToAggregator(std::nullopt, 0, 0, 0, std::nullopt);
 }
 
 void ReportingdSession::updateCombinedSessionID() {

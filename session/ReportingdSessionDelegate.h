@@ -26,6 +26,9 @@ class ReportingdSessionDelegate {
   virtual std::optional<std::string> parentSessionIDStringForSession(ReportingdSession& session) = 0;
   /// Groups the session anew by its current user info.
   virtual void userInfoUpdatedForSession(ReportingdSession& session) = 0;
+  /// False when the session has no user info or is at the top of its family: then it has no ancestor. Takes
+  /// no lock, so that a message of such a session never waits for a storebag.
+  virtual bool mayHaveAncestor(ReportingdSession& session) const = 0;
   /// The highest ancestor that aggregates. The caller holds the monitor.
   virtual std::shared_ptr<ReportingdSession> getAncestorWithAggregatorForSession(ReportingdSession& session)
       VESK_REQUIRES(monitor()) = 0;

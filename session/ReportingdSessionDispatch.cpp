@@ -103,8 +103,12 @@ std::optional<std::string> ReportingdSession::flushMessages() {
     VESK_LOG_DEBUG("flushMessages: No backends available to send message");
     return std::nullopt;
   }
+  return flushBackends(*set);
+}
+
+std::optional<std::string> ReportingdSession::flushBackends(const BackendSet& backends) {
   AnswerChoice answers;
-  for (const auto& [name, backend] : *set) {
+  for (const auto& [name, backend] : backends) {
     auto answer = backend->flushMessages();
     if (answer) writeToLogFile("[%@ -> flushMessages] %@", name, *answer);
     answers.offer(name, answer);
@@ -187,10 +191,8 @@ void ReportingdSession::sendSingleMessage(const SessionServices& services, uid_t
     if (answer) writeToLogFile("[%@ -> sendMessageWithSessionInfo] %@", name, *answer);
   }
   // A storebag may have the backend hold the message for a batch, which ends here.
-  for (const auto& [name, backend] : *backends) {
-    backend->flushMessages();
-    backend->cleanup();
-  }
+  flushBackends(*backends);
+  cleanupBackends(*backends);
 }
 
 }  // namespace vesk

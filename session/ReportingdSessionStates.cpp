@@ -24,15 +24,14 @@ void ReportingdSession::createBackendsWithStorebag(const std::optional<Dictionar
   }
   // A second start: what the first one's backends hold is sent where it may be, then they end.
   if (previous) {
-    for (const auto& [name, backend] : *previous) backend->flushMessages();
-    cleanupBackends(previous);
+    flushBackends(*previous);
+    cleanupBackends(*previous);
   }
   internalSendMessage(deviceDictionary(_services.libraryVersion, _services.backends.regionCode()), 0, 0);
 }
 
-void ReportingdSession::cleanupBackends(const SharedBackends& backends) {
-  if (!backends) return;
-  for (const auto& [name, backend] : *backends) backend->cleanup();
+void ReportingdSession::cleanupBackends(const BackendSet& backends) {
+  for (const auto& [name, backend] : backends) backend->cleanup();
 }
 
 void ReportingdSession::updateSessionWithDefaultSessionInfo() {

@@ -52,17 +52,14 @@ class Member {
   std::string problem() const { return _problem; }
   int number() const { return _number; }
   std::uint64_t aggregated() const { return _aggregated; }
-  void leave() {
-    _operation = "disconnect";
-    _reporting.reset();
-  }
+  void leave() { _reporting.reset(); }
 
  private:
   bool chance(int of) { return std::uniform_int_distribution(0, of - 1)(_random) == 0; }
   template <class Result>
-  void expect(const Result& result) {
+  void expect(const char* operation, const Result& result) {
     if (result || !_problem.empty()) return;
-    _problem = std::string(_operation) + ": " + describe(result.status) + " " + result.detail;
+    _problem = std::string(operation) + ": " + describe(result.status) + " " + result.detail;
     if (result.status == ReportingStatus::TimedOut) _problem += ": the daemon does not answer, a DEADLOCK";
   }
 
@@ -75,10 +72,9 @@ class Member {
                                                         {kVeskReportingSessionInfoBatchEvent, chance(2)}},
                                              familyName(_family), {}, std::move(handler));
     if (status != ReportingStatus::Queued) _problem = describe(status);
-    expect(_reporting->startConfig(kPatience));
+    expect("start", _reporting->startConfig(kPatience));
   }
   void connect(bool aggregates) {
-    _operation = "connect and start";
     auto options = _harness.clientOptions();
     options.maximumQueuedMessages = 64;
     options.drainTime = 2s;
@@ -87,37 +83,17 @@ class Member {
   }
 
   void step() {
-    ++_steps;
-    const Dictionary payload{{"n", _steps}};
-    switch (std::uniform_int_distribution(0, 19)(_random)) {
-      case 0:
-        leave();
-        return connect(chance(2));
-      case 1:
-        _operation = "configure and start anew";
-        return configure(chance(2));
-      case 2:
-        _operation = "move to the other family";
-        _family = 1 - _family;
-        return expect(_reporting->fetchStates(familyName(_family), kPatience));
-      case 3:
-      case 4:
-        _operation = "fetch states";
-        return expect(_reporting->fetchStates(familyName(_family), kPatience));
-      case 5:
-      case 6:
-        _operation = "flush";
-        return expect(_reporting->flushMessagesAndWait(kPatience));
-      case 7:
-      case 8:
-        _operation = "send and wait";
-        return expect(_reporting->sendMessageAndWait(3, 2, payload, kPatience));
-      default:
-        _operation = "send";
-        if (auto status = _reporting->sendMessage(3, 1, payload);
-            status != ReportingStatus::Queued && status != ReportingStatus::QueueFull)
-          _problem = describe(status);
-    }
+    const Dictionary payload{{"n", ++_steps}};
+    const int choice = std::uniform_int_distribution(0, 19)(_random);
+    if (choice == 0) return leave(), connect(chance(2));
+    if (choice == 1) return configure(chance(2));
+    if (choice == 2) _family = 1 - _family;
+    if (choice <= 4) return expect("fetch states", _reporting->fetchStates(familyName(_family), kPatience));
+    if (choice <= 6) return expect("flush", _reporting->flushMessagesAndWait(kPatience));
+    if (choice <= 8) return expect("send and wait", _reporting->sendMessageAndWait(3, 2, payload, kPatience));
+    const auto status = _reporting->sendMessage(3, 1, payload);
+    if (status != ReportingStatus::Queued && status != ReportingStatus::QueueFull)
+      _problem = describe(status);
   }
 
   const DaemonHarness& _harness;
@@ -128,7 +104,6 @@ class Member {
   std::string _problem;
   std::uint64_t _steps = 0;
   std::atomic<std::uint64_t> _aggregated{0};
-  const char* _operation = "";
   std::optional<VeskReporting> _reporting;
 };
 

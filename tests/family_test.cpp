@@ -5,6 +5,7 @@
 #include <future>
 #include <latch>
 #include <limits>
+#include <sstream>
 
 #include "tests/support/CapturedLog.h"
 #include "tests/support/FamilyHarness.h"
@@ -14,67 +15,180 @@ namespace {
 
 using Family = FamilyHarness;
 
-TEST_F(Family, ChildrenCarryTheirAncestorsAndCopyTheirStates) {
-  CapturedLog log;
-  auto top = join(0);
-  auto child = join(1);
-  EXPECT_EQ(names, BackendNames{"httpPost"}) << "sampled out by itself, enabled by its parent";
-  auto grandchild = join(2, false, "MYAPP");
-  grandchild.send(message());
-  EXPECT_EQ(lastSessionID(),
-            top->sessionIDString() + "." + child->sessionIDString() + "." + grandchild->sessionIDString());
-  EXPECT_EQ(harness.agent->parentSessionIDStringForSession(*top.session), std::nullopt);
-  RecursiveMutexLock lock(harness.agent->monitor());
-  EXPECT_EQ(harness.agent->parentSessionForChild(*grandchild.session), child.session);
-  EXPECT_EQ(child->samplingThresholdWithBackendName("httpPost"), Value(1.0));
+std::string without(std::string places, const std::string& others) {
+  std::erase_if(places, [&](char place) { return others.find(place) != std::string::npos; });
+  return places;
 }
 
-TEST_F(Family, AMissingParentLeavesAGap) {
-  CapturedLog log;
-  auto top = join(0);
-  auto grandchild = join(2);
-  EXPECT_EQ(names, BackendNames{});
-  EXPECT_EQ(harness.agent->parentSessionIDStringForSession(*grandchild.session), std::nullopt);
-  for (const char* line :
-       {"parentSessionIDStringForSession: Found a gap in hierarchy (one of parents missing): incomplete "
-        "parentSessionID is ''",
-        "parentSessionForChild: Unable to find session with hierarchy of 1 for userInfoKey 'myapp:calls'",
-        "syncReportingStates: child session 102 (backend httpPost) is missing its parent"})
-    EXPECT_GE(log.count(6, line), 1) << line;
+TEST_F(Family, EveryWalkTakesTheFirstOfEachLevel) {
+  struct Row {
+    const char* what;
+    std::string levels;       // in the order of joining; sessions are named by their place in it
+    std::string aggregating;  // which have aggregation on when all have joined
+    char asking;
+    std::string parent;
+    std::string chain;     // from the top
+    std::string ancestor;  // the one that aggregates
+    std::string left;      // which aggregate once `asking` has refreshed those below
+  };
+  const Row rows[] = {
+      {"the top", "0123", "0123", '0', "", "", "", "0"},
+      {"a top that does not aggregate", "012", "12", '0', "", "", "", "12"},
+      {"a child", "0123", "", '1', "0", "0", "", ""},
+      {"a child that aggregates", "012", "12", '1', "0", "0", "", "1"},
+      {"a child below one that aggregates", "012", "02", '1', "0", "0", "0", "0"},
+      {"three levels down", "0123", "023", '3', "2", "012", "0", "02"},
+      {"joined the other way round", "3210", "012", '0', "1", "321", "2", "12"},
+      {"the highest that aggregates", "0123", "12", '3', "2", "012", "1", "12"},
+      {"two at the top", "001", "01", '2', "0", "0", "0", "01"},
+      {"two at the top, of which the second aggregates", "001", "12", '2', "0", "0", "", "12"},
+      {"two in the middle", "0112", "12", '3', "1", "01", "1", "12"},
+      {"two in the middle, of which the second aggregates", "0112", "2", '3', "1", "01", "", "2"},
+      {"the first of two in the middle", "0112", "123", '1', "0", "0", "", "12"},
+      {"a gap right above", "02", "0", '1', "", "", "0", "0"},
+      {"a gap further up", "023", "1", '2', "1", "1", "1", "1"},
+      {"nothing at the top", "12", "", '1', "0", "0", "", ""},
+      {"alone", "2", "0", '0', "", "", "", "0"},
+  };
+  for (const Row& row : rows) {
+    std::map<char, DrivenSession> members;
+    std::map<std::shared_ptr<ReportingdSession>, std::string> places{{nullptr, ""}};
+    for (char level : row.levels) {
+      const char place = static_cast<char>('0' + members.size());
+      auto member = members.emplace(place, join(level - '0')).first;
+      places.emplace(member->second.session, std::string(1, place));
+    }
+    for (auto& [place, member] : members) {
+      if (row.aggregating.find(place) == std::string::npos) continue;
+      member->setSessionInfo(member->sessionInfo().value(), userInfo("MyApp"), {}, true);
+    }
+    DrivenSession& asking = members.at(row.asking);
+    std::string chain;
+    for (char place : row.chain) chain += (chain.empty() ? "" : ".") + members.at(place)->sessionIDString();
+    EXPECT_EQ(harness.agent->parentSessionIDStringForSession(*asking.session).value_or(""), chain)
+        << row.what;
+    {
+      RecursiveMutexLock lock(harness.agent->monitor());
+      EXPECT_EQ(places.at(harness.agent->parentSessionForChild(*asking.session)), row.parent) << row.what;
+      EXPECT_EQ(places.at(harness.agent->getAncestorWithAggregatorForSession(*asking.session)), row.ancestor)
+          << row.what;
+    }
+    // A message goes to the ancestor or to the sender's own client, never to both.
+    std::string told, closed, left;
+    auto listen = [&](std::string& list, const std::string& expected) {
+      for (auto& [place, member] : members) {
+        member.connection->calls.clear();
+        member.connection->onCall = [&, expected, place = place,
+                                     connection = member.connection.get()](const auto&) {
+          list += place;
+          EXPECT_EQ(connection->told().back(), expected) << row.what;
+        };
+      }
+    };
+    listen(told, std::to_string(asking->sessionID()) + R"(: 1700000000.000000 3/2 {"a": "text"})");
+    asking.send(message());
+    const bool isOwn = row.aggregating.find(row.asking) != std::string::npos;
+    EXPECT_EQ(told, !row.ancestor.empty() ? row.ancestor : std::string(isOwn, row.asking)) << row.what;
+
+    listen(closed, "closing: 0.000000 0/0");
+    harness.agent->updateDownstreamSessions(*asking.session);
+    for (auto& [place, member] : members) {
+      if (member->hasAggregator()) left += place;
+      member.connection->onCall = nullptr;
+    }
+    EXPECT_EQ(left, row.left) << row.what;
+    EXPECT_EQ(closed, without(row.aggregating, row.left)) << row.what;
+  }
+}
+
+TEST_F(Family, ArrivalsRefreshThoseBelowInTheOrderOfJoining) {
+  struct Row {
+    std::vector<int> levels;
+    bool isEnabled;  // the session of level 2, in the end
+  };
+  // A session is enabled by the state that its parent has at that moment.
+  for (const Row& row : {Row{{0, 1, 2}, true}, {{0, 2, 1}, true}, {{1, 2, 0}, true}, {{2, 1, 0}, false}}) {
+    std::map<int, DrivenSession> members;
+    for (int level : row.levels) members.emplace(level, join(level, false, level == 2 ? "MYAPP" : "MyApp"));
+    const auto& last = members.at(2);
+    EXPECT_EQ(last->fetchReportingStates(), row.isEnabled ? BackendNames{"httpPost"} : BackendNames{});
+    if (!row.isEnabled) continue;
+    EXPECT_EQ(last->samplingThresholdWithBackendName("httpPost"), Value(1.0)) << "the parent's";
+    harness.posts();
+    members.at(2).send(message());
+    EXPECT_EQ(lastSessionID(), members.at(0)->sessionIDString() + "." + members.at(1)->sessionIDString() +
+                                   "." + last->sessionIDString());
+  }
+}
+
+TEST_F(Family, AChildCopiesItsParentsStatesButAnOverride) {
+  // A backend with its sampling threshold; a dashboard has none. Without `override_sampling` a backend that
+  // is sampled out is in state 3.
+  auto storebag = [&](int level, const std::string& backends) {
+    MutableDictionary section;
+    std::istringstream words(backends);
+    for (std::string name, threshold; words >> name >> threshold;) {
+      MutableDictionary entry(
+          *profile(level, std::atof(threshold.c_str())).list("clients")->begin()->dictionary());
+      if (threshold == "override") entry.remove("override_sampling");
+      section.set(Text(name), Dictionary{{"ip", "127.0.0.1"}, {"port", 9}, {"clients", List{entry.share()}}});
+    }
+    return section.share();
+  };
+  struct Row {
+    const char* parent;
+    const char* child;
+    BackendNames enabled;
+  };
+  const Row rows[] = {
+      {"httpPost 1", "httpPost 0", {"httpPost"}},
+      {"httpPost 1", "httpPost 0 dashboard -", {"httpPost"}},
+      {"dashboard - httpPost2 1.5 httpPost 1",
+       "httpPost 0 httpPost2 0 dashboard -",
+       {"httpPost", "httpPost2", "dashboard"}},
+      {"httpPost 0", "httpPost 1", {}},
+      {"httpPost 1", "httpPost override", {}},
+  };
+  for (const Row& row : rows) {
+    harness.storebags[5] = storebag(0, row.parent);
+    harness.storebags[6] = storebag(1, row.child);
+    harness.clock.advance(std::chrono::hours(2));
+    auto parent = join(0), child = join(1);
+    EXPECT_EQ(names, row.enabled) << row.child;
+    for (const std::string& name : row.enabled)
+      EXPECT_EQ(child->samplingThresholdWithBackendName(name),
+                parent->samplingThresholdWithBackendName(name));
+    child.send(message(2));  // lifts an override
+    const bool isLifted = std::string_view(row.child).ends_with("override");
+    EXPECT_EQ(child->fetchReportingStates(), isLifted ? BackendNames{"httpPost"} : row.enabled);
+  }
+}
+
+TEST_F(Family, GroupedAnewASessionIsTheLast) {
+  auto first = join(0);
+  auto second = join(0);
+  auto child = join(1);
+  auto parent = [&] { return harness.agent->parentSessionIDStringForSession(*child.session); };
+  EXPECT_EQ(parent(), first->sessionIDString());
+  first.states(userInfo("MYAPP"));  // the same family
+  EXPECT_EQ(parent(), second->sessionIDString());
+  second.states(userInfo("Other"));
+  EXPECT_EQ(parent(), first->sessionIDString());
+  first.states(std::nullopt);
+  EXPECT_EQ(parent(), std::nullopt);
+  second.states(userInfo("myapp"));
+  EXPECT_EQ(parent(), second->sessionIDString());
 }
 
 TEST_F(Family, LongNamesFillNoLog) {
-  CapturedLog log;
   const std::string name(1 << 20, 'x');
-  auto child = join(1, false, name.c_str());  // without a parent
-  child->setSessionInfo(sessionInfo(1), userInfo((name + "y").c_str()), {}, false);
-  auto ask = [&] {
-    harness.agent->parentSessionIDStringForSession(*child.session);
-    RecursiveMutexLock lock(harness.agent->monitor());
-    harness.agent->parentSessionForChild(*child.session);
-  };
-  ask();  // nobody is there under that name
-  auto sibling = join(1, false, (name + "y").c_str());
-  ask();  // somebody is, but not this one
-  EXPECT_EQ(log.countContaining(3, " for user info key xxx"), 4);
+  auto sibling = join(1, false, name.c_str());
+  CapturedLog log;
+  auto child = join(1, false, (name + "y").c_str());
+  child->setSessionInfo(sessionInfo(1), userInfo(name.c_str()), {}, false);
+  harness.agent->updateDownstreamSessions(*child.session);
+  EXPECT_EQ(log.countContaining(3, " not found for user info key xxx"), 2);
   for (const auto& [level, line] : log.lines()) EXPECT_LT(line.size(), 1024u);
-}
-
-TEST_F(Family, TheHighestAggregatorGetsTheMessages) {
-  auto child = join(1, true);
-  auto top = join(0, true);
-  EXPECT_FALSE(child->hasAggregator()) << "shut down by the arrival above it";
-  ASSERT_EQ(child.connection->calls.size(), 2u) << "its own start message and the closing one";
-  EXPECT_FALSE(std::get<std::optional<Dictionary>>(child.connection->calls.back().arguments.at(0)));
-  auto grandchild = join(2);
-  grandchild.send(message());
-  ASSERT_FALSE(top.connection->calls.empty());
-  const auto& call = top.connection->calls.back();
-  EXPECT_STREQ(call.member, "sendMessageToClient");
-  auto info = std::get<std::optional<Dictionary>>(call.arguments.at(0));
-  EXPECT_EQ(info->find(kVeskReportingSessionInfoSessionID)->asInteger(), 102);
-  EXPECT_EQ(std::get<std::uint16_t>(call.arguments.at(2)), 3);
-  EXPECT_EQ(child.connection->calls.size(), 2u);
 }
 
 TEST_F(Family, LevelsMayBeAnyNumber) {
@@ -91,21 +205,12 @@ TEST_F(Family, LevelsMayBeAnyNumber) {
 }
 
 TEST_F(Family, ASessionLeavesItsFamilyUnderWhateverNameItJoined) {
-  std::weak_ptr<ReportingdSession> tookItBack;
   std::weak_ptr<ReportingdSession> configuredAnew;
   {
-    auto first = join(0, true);
-    auto child = join(1);
-    first->fetchStatesWithUserInfo(std::nullopt, {});
-    const std::size_t before = first.connection->calls.size();
-    child.send(message());
-    EXPECT_EQ(first.connection->calls.size(), before) << "its family's messages are no longer its business";
-    tookItBack = first.session;
-    auto second = join(0);
-    second->setSessionInfo(Dictionary(), userInfo("Other"), {}, false);
-    configuredAnew = second.session;
+    auto session = join(0);
+    session->setSessionInfo(Dictionary(), userInfo("Other"), {}, false);
+    configuredAnew = session.session;
   }
-  EXPECT_TRUE(tookItBack.expired());
   EXPECT_TRUE(configuredAnew.expired());
 }
 
@@ -136,9 +241,13 @@ TEST_F(Family, NobodyTakesASessionThatStartsForItsParent) {
   EXPECT_EQ(sibling->fetchReportingStates(), BackendNames{"httpPost"});
 }
 
-TEST_F(Family, AcceptingWaitsForNoStorebag) {
+TEST_F(Family, AtTheTopNothingWaitsForAStorebag) {
   CapturedLog log;
   auto top = join(0);
+  auto child = join(1);
+  auto unrelated = harness.newSession();  // without user info
+  unrelated->setSessionInfo(sessionInfo(0), std::nullopt, {}, true);
+  unrelated.start();
   std::latch held(1), accepted(1);
   auto fetch = std::async(std::launch::async, [&] {
     RecursiveMutexLock lock(harness.agent->monitor());
@@ -150,7 +259,15 @@ TEST_F(Family, AcceptingWaitsForNoStorebag) {
   EXPECT_TRUE(harness.agent->shouldAcceptNewConnection(connection));
   EXPECT_EQ(log.countContaining(7, "Accepting new Orvo connection recording connection, 0(1) connections."),
             1);
+  EXPECT_TRUE(top.send(message()));
+  unrelated.connection->calls.clear();
+  unrelated.send(message());
+  EXPECT_EQ(unrelated.connection->calls.size(), 1u);
+  EXPECT_EQ(log.count(6, "getAncestorWithAggregatorForSession: No user info found for session 100"), 2)
+      << "with its start";
   accepted.count_down();
+  fetch.get();
+  EXPECT_TRUE(child.send(message()));
   connection->invalidate();
 }
 
@@ -161,6 +278,76 @@ TEST_F(Family, ClientsThatLeaveLoseNothing) {
     aggregator.connection->clientIsGone = true;
   }
   EXPECT_EQ(harness.dropped(DropReason::NoBackend) + harness.dropped(DropReason::NotAggregated), 0u);
+}
+
+/// True when another thread can take the agent's monitor now.
+bool monitorIsFree(AgentHarness& harness) {
+  auto taken = std::make_shared<std::promise<void>>();
+  std::thread([taken, agent = harness.agent] {
+    RecursiveMutexLock lock(agent->monitor());
+    taken->set_value();
+  }).detach();
+  return taken->get_future().wait_for(std::chrono::seconds(10)) == std::future_status::ready;
+}
+
+TEST_F(Family, AnAncestorThatEndsWhileAChildSendsIsDestroyedByTheChildOutsideTheMonitor) {
+  CapturedLog log;
+  auto top = join(0, true);
+  auto child = join(1);
+  auto connection = top.connection;
+  std::weak_ptr<ReportingdSession> watched = top.session;
+  std::optional<bool> freeAtTheEnd;
+  connection->onCall = [&](const IPCOutgoingCall& call) {
+    if (!std::get<std::optional<Dictionary>>(call.arguments.at(0))) {
+      freeAtTheEnd = monitorIsFree(harness);  // the closing message: this is the session's destruction
+    } else if (top.session) {
+      harness.agent->sessionInvalidated(top.session);  // its connection ends in the middle of the delivery
+      top.session.reset();
+    }
+  };
+  child.send(message());
+  EXPECT_TRUE(watched.expired());
+  EXPECT_EQ(freeAtTheEnd, true);
+  EXPECT_EQ(harness.agent->parentSessionIDStringForSession(*child.session), std::nullopt)
+      << "left its family";
+  connection->onCall = nullptr;
+}
+
+TEST_F(Family, ManyInventedNamesDoNotFillTheMemory) {
+  auto session = join(0);
+  auto families = [&] {
+    CapturedLog log;
+    auto connection = std::make_shared<RecordingConnection>();
+    harness.agent->shouldAcceptNewConnection(connection);
+    connection->invalidate();
+    const std::string line = log.lines().at(0).second;
+    return std::stoi(line.substr(line.find('(') + 1));
+  };
+  auto rename = [&](const std::string& name) {
+    session->fetchStatesWithUserInfo(userInfo(name.c_str()), {});
+  };
+  for (int i = 0; i < 600; ++i) rename(std::to_string(i));
+  const int before = families();
+  EXPECT_GT(before, 1);
+  EXPECT_LE(before, 256);
+  for (int i = 0; i < 9; ++i) rename(std::string(2000, 'x') + std::to_string(i));
+  EXPECT_LE(families(), before + 2) << "the present one and the one before";
+}
+
+TEST_F(Family, AClientThatTakesNoMessagesCostsOneLineAndNobodyElse) {
+  CapturedLog log;
+  auto parent = join(0, true);
+  auto child = join(1, false, "MyApp", true);
+  parent.connection->clientIsGone = true;
+  for (int i = 0; i < 100; ++i) child.send(message(0));
+  child->flushMessagesWithReply({});
+  std::size_t posted = 0;
+  for (const auto& post : harness.posts()) {
+    for (const auto& event : post.events()) posted += event.at("_method") == 3;
+  }
+  EXPECT_EQ(posted, 100u) << "the sender does not notice";
+  EXPECT_EQ(harness.dropped(DropReason::NotAggregated), 100u);
+  EXPECT_EQ(log.count(3, "sendMessageWithDictionary: Failed to get remote object proxy: gone"), 1);
 }
 
 }  // namespace

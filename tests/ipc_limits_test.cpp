@@ -225,21 +225,43 @@ TEST(IPCLimits, StopsReadingFromAClientThatDoesNotReadItsAnswers) {
 }
 
 TEST(IPCLimits, TellsTheCallerWhenAClientsOutboxIsFull) {
-  // The sockets hold some 500 KiB, the bus one call, and the outbox 10 calls.
-  TestService service([&](IPCListener::Options& options) { options.maximumOutbox = 10; });
-  std::optional<TestClient> client(std::in_place, service);
-  ASSERT_EQ(client->call("flushMessagesWithReply"), "posted all");
-  auto connection = service.connection();
-  const IPCOutgoingCall call{wire::kReplyInterface, "sendMessageToClient", {std::string(30'000, 'x')}};
-  std::string error;
-  int taken = 0;
-  // Before it stays full it is full only until the connection's thread comes to empty it.
-  for (int refused = 0; refused < 100;) {
-    error.clear();
-    connection->callRemoteObject(call, [&](const std::string& text) { error = text; });
-    taken += error.empty() ? 1 : 0;
-    refused = error.empty() ? 0 : refused + 1;
-    if (refused > 0) std::this_thread::sleep_for(1ms);
+  struct Case {
+    std::size_t outbox;
+    std::size_t size;
+    int most;  // calls that are taken
+  };
+  // The sockets hold some 500 KiB, the bus one call, and the outbox 10 calls or 4 MiB.
+  for (const auto& test : {Case{10, 30'000, 40}, Case{256, 900'000, 6}}) {
+    TestService service([&](IPCListener::Options& options) { options.maximumOutbox = test.outbox; });
+    std::optional<TestClient> client(std::in_place, service);
+    ASSERT_EQ(client->call("flushMessagesWithReply"), "posted all");
+    auto connection = service.connection();
+    const IPCOutgoingCall call{wire::kReplyInterface, "sendMessageToClient", {std::string(test.size, 'x')}};
+    std::string error;
+    int taken = 0;
+    // Before it stays full it is full only until the connection's thread comes to empty it.
+    for (int refused = 0; refused < 100;) {
+      error.clear();
+      connection->callRemoteObject(call, [&](const std::string& text) { error = text; });
+      taken += error.empty() ? 1 : 0;
+      refused = error.empty() ? 0 : refused + 1;
+      if (refused > 0) std::this_thread::sleep_for(1ms);
+    }
+    EXPECT_EQ(error, "too many calls wait for the client");
+    EXPECT_LE(taken, test.most);
+    MutableDictionary wide;  // within the limit of bytes, not of values
+    for (int i = 0; i < 50'000; ++i) wide.append(Text(std::to_string(i)), 0);
+    const Dictionary tooWide = wide.share();
+    for (const IPCArgument& argument :
+         {IPCArgument(std::string(std::size_t{1} << 20, 'x')), IPCArgument(tooWide),
+          IPCArgument(List{tooWide}), IPCArgument(std::optional(tooWide))}) {
+      error.clear();
+      connection->callRemoteObject({wire::kReplyInterface, "m", {argument}},
+                                   [&](const std::string& text) { error = text; });
+      EXPECT_EQ(error, "the call is too large");
+    }
+    client.reset();
+    EXPECT_TRUE(service.journal.waitFor("lost ")) << "and what became of those that it took";
   }
   EXPECT_EQ(error, "too many calls wait for the client");
   EXPECT_LE(taken, 40);
@@ -255,9 +277,9 @@ TEST(IPCLimits, ACallThatCanNotBeSentIsCounted) {
   TestService service;
   std::optional<TestClient> client(std::in_place, service);
   ASSERT_EQ(client->call("flushMessagesWithReply"), "posted all");
-  MutableDictionary wide;  // within the limit of bytes, not of values
-  for (int i = 0; i < 60'000; ++i) wide.append(Text(std::to_string(i)), 0);
-  service.connection()->callRemoteObject({wire::kReplyInterface, "m", {wide.share()}}, nullptr);
+  Dictionary deep;
+  for (int i = 0; i < 70; ++i) deep = Dictionary{{"a", deep}};
+  service.connection()->callRemoteObject({wire::kReplyInterface, "m", {deep}}, nullptr);
   client.reset();
   EXPECT_TRUE(service.journal.waitFor("lost 1"));
 }

@@ -77,5 +77,21 @@ TEST(Road, AStalledCollectorDoesNotHoldUpTheEndForEver) {
       "<4> main: Stopping although posts are still outstanding after 10 seconds."));
 }
 
+TEST(Road, AnAnswerThatNoMessageHoldsComesCut) {
+  DaemonHarness harness;
+  harness.startDaemon();
+  RoadClient client(harness, Dictionary{{kVeskReportingSessionInfoBatchEvent, true}});
+  for (const char* letter : {"a", "b"}) {
+    ASSERT_TRUE(queued(
+        client.reporting.sendMessage(message(3, Dictionary{{letter, std::string(700'000, *letter)}}))));
+  }
+  const auto flushed = client.reporting.flushMessagesAndWait();
+  ASSERT_TRUE(flushed) << flushed.detail;
+  ASSERT_TRUE(flushed.answer) << "or the client would send them again";
+  EXPECT_EQ(flushed.answer->size(), std::size_t{1} << 20);
+  EXPECT_NE(flushed.answer->find("\n[cut: this answer has 1"), std::string::npos);
+  EXPECT_EQ(harness.waitForEventsOfMethod(3, 2).size(), 2u);
+}
+
 }  // namespace
 }  // namespace vesk::test

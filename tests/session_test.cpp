@@ -1,33 +1,88 @@
 // Sessions driven by hand: configuration, dispatch, answers, and their end.
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <unistd.h>
 
+#include <sstream>
+
+#include "platform/ipc/ExtensionTokens.h"
+#include "platform/unicode/UTF8.h"
 #include "tests/support/AgentHarness.h"
 #include "tests/support/CapturedLog.h"
+#include "tests/support/RecordingServer.h"
 #include "tests/support/TestRoot.h"
 
 namespace vesk::test {
 namespace {
 
+const Dictionary kCamera{{kVeskReportingUserInfoClientName, "Camera"},
+                         {kVeskReportingUserInfoServiceName, "Clips"}};
+
+bool contains(std::string_view text, std::string_view part) { return text.find(part) != text.npos; }
+
 class Session : public ::testing::Test {
  protected:
   Session() {
-    testRoot().write("etc/veskreporting/device.toml", "DeviceName = \"Phone\"\nProductType = \"Phone7,2\"\n");
-    harness.storebags[5] = Dictionary{{"httpPost", profile("/post")}};
+    writeFacts("DeviceName = \"Phone\"\nProductType = \"Phone7,2\"\n");
+    harness.storebags[5] = storebag("httpPost");
   }
-  Dictionary profile(const char* path) {
-    return Dictionary{{"clients", List{Dictionary{{"post_url", harness.url(path)}}}}};
+  static void writeFacts(const std::string& facts) {
+    testRoot().write("etc/veskreporting/device.toml", facts);
   }
-  DrivenSession configured(int clientType = 5) {
+  /// A section with the backends named; "+" gives one a display URL (http:// and its name), "~" has it hold
+  /// its messages for a batch. A name may come twice.
+  Dictionary storebag(const std::string& backends) const {
+    MutableDictionary section;
+    std::istringstream words(backends);
+    for (std::string name; words >> name;) {
+      const std::string marks = name.substr(std::min(name.size(), name.find_first_of("+~")));
+      name.resize(name.size() - marks.size());
+      Dictionary entry{{"post_url", harness.url()}, {"ip", "127.0.0.1"}, {"port", 9}};
+      if (contains(marks, "~")) entry = merged(entry, Dictionary{{"expedite", 0}});
+      MutableDictionary profile(merged(entry, Dictionary{{"clients", List{entry}}}));
+      if (contains(marks, "+")) profile.set("display_url", "http://" + name);
+      section.append(Text(name), profile.share());
+    }
+    return section.share();
+  }
+  DrivenSession configured(const Dictionary& info = {},
+                           const std::optional<Dictionary>& userInfo = std::nullopt) {
     auto session = harness.newSession();
-    session->setSessionInfo(Dictionary{{kVeskReportingSessionInfoSessionID, 77},
-                                       {kVeskReportingSessionInfoClientType, clientType}},
-                            std::nullopt, {}, false);
+    session->setSessionInfo(merged(identified(5), info), userInfo, {}, false);
     return session;
+  }
+  DrivenSession started(const Dictionary& section, const Dictionary& info = {}) {
+    harness.storebags[5] = section;
+    harness.clock.advance(std::chrono::hours(2));
+    auto session = configured(info);
+    session.start();
+    harness.posts();
+    return session;
+  }
+  static Dictionary identified(Value clientType, Value sessionID = 77) {
+    return Dictionary{{kVeskReportingSessionInfoSessionID, sessionID},
+                      {kVeskReportingSessionInfoClientType, clientType}};
   }
   static Dictionary message(Value category, Value type, Dictionary payload = {}) {
     return Dictionary{{"category", category}, {"type", type}, {"payload", payload}};
   }
-  static std::string messageLog() { return testRoot().readAll("var/mobile/Library/Logs/Dunmore/Retired"); }
+  static std::string sendOnce(DrivenSession& session, const Dictionary& info,
+                              const std::optional<Dictionary>& userInfo = std::nullopt) {
+    std::string answer;
+    session->sendMessageWithSessionInfo(
+        info, userInfo, 4, 5, Dictionary{{"a", 1}},
+        {[&](const std::string& reply) { answer = reply; }, [&] { answer = "no answer"; }});
+    return answer;
+  }
+  boost::json::object lastEvent() { return harness.posts().back().event(); }
+  /// What `act` adds to the message log.
+  template <class Act>
+  static std::string logged(Act act) {
+    constexpr char kDirectory[] = "var/mobile/Library/Logs/Dunmore/Retired";
+    std::filesystem::remove_all(testRoot() / kDirectory);
+    act();
+    return testRoot().readAll(kDirectory);
+  }
 
   AgentHarness harness;
 };
@@ -39,228 +94,365 @@ std::string displayURL(DrivenSession& session) {
 }
 
 TEST_F(Session, UnstartedAnswersNothing) {
-  CapturedLog log;
-  auto session = configured(4);
+  auto session = configured(identified(4));
   EXPECT_EQ(session->sessionIDString().size(), 24u);
   EXPECT_TRUE(session->sessionIDString().ends_with("=="));
   EXPECT_EQ(session.start(), std::nullopt) << "no storebag for this client type";
   EXPECT_EQ(session.send(message(1, 2)), std::nullopt);
-  EXPECT_EQ(log.count(7, "sendMessageWithDictionary: No backends available to send message"), 1);
-  EXPECT_EQ(harness.dropped(DropReason::NoBackend), 1u);
+  EXPECT_EQ(session.states(kCamera), std::nullopt);
   EXPECT_EQ(displayURL(session), "URL not available");
-  bool uploaded = true;
-  session->uploadFileAtPath("file:///tmp/a%20b", "", {[&](const bool& reply) { uploaded = reply; }, nullptr});
-  EXPECT_FALSE(uploaded);
-  EXPECT_EQ(log.count(3, "uploadFileWithURL: File upload failed for /tmp/a b"), 1);
-  session->uploadLogData({1, 2}, {[&](const bool& reply, const auto&) { uploaded = reply; }, nullptr});
-  EXPECT_EQ(log.count(7, "uploadLogData: Uploading log data array: [1, 2]"), 1);
-  EXPECT_EQ(log.count(3, "uploadLogData: Log data array upload failed"), 1);
-  EXPECT_EQ(harness.dropped(DropReason::UploadFailed), 2u);
-  session.session.reset();
-  EXPECT_TRUE(harness.posts().empty());
+  EXPECT_EQ(harness.dropped(DropReason::NoBackend), 1u);
 }
 
 TEST_F(Session, WhatAClientCallsItsFileFillsNoLog) {
   CapturedLog log;
-  auto session = configured(4);
-  const std::string before = messageLog();
-  for (const std::string& url : {std::string("file:///a%20b(\n(2026) [forged] \xc3\xa9"),
-                                 "file://host" + std::string(1 << 20, '\n'), std::string(1 << 20, 'x')}) {
-    session->uploadFileAtPath(url, "", {[](const bool& reply) { EXPECT_FALSE(reply); }, nullptr});
-  }
-  const std::string written = messageLog().substr(before.size());
+  auto session = configured(identified(4));
+  const std::string written = logged([&] {
+    for (const std::string& url : {std::string("file:///a%20b(\n(2026) [forged] \xc3\xa9"),
+                                   "file://host" + std::string(1 << 20, '\n'), std::string(1 << 20, 'x')}) {
+      session->uploadFileAtPath(url, "", {[](const bool& reply) { EXPECT_FALSE(reply); }, nullptr});
+    }
+  });
   EXPECT_EQ(std::count(written.begin(), written.end(), '\n'), 3);
   EXPECT_LT(written.size(), 2000u);
-  EXPECT_NE(written.find("Upload failed for file file:///a%20b(%0A(2026)%20[forged]%20%C3%A9\n"),
-            std::string::npos);
+  EXPECT_TRUE(contains(written, "Upload failed for file file:///a%20b(%0A(2026)%20[forged]%20%C3%A9\n"));
   EXPECT_EQ(log.count(3, "uploadFileWithURL: File upload failed for " + std::string(256, 'x')), 1);
+  EXPECT_EQ(harness.dropped(DropReason::UploadFailed), 3u);
 }
 
-TEST_F(Session, StartTellsTheBackendsAndAnswersTheEnabledOnes) {
-  auto session = configured();
-  EXPECT_EQ(session.start(), BackendNames{"httpPost"});
-  session.session.reset();
-  auto posts = harness.posts();
-  ASSERT_EQ(posts.size(), 2u);
-  // The posts travel on several connections and may arrive in either order.
-  for (const auto& post : posts) {
-    bool isStart = post.event().at("_status") == 0;
-    EXPECT_EQ(post.event().at("_method"), 0);
-    EXPECT_EQ(post.event().contains("AutomaticTimeSet"), isStart);
-    EXPECT_EQ(post.event().contains("SerialNum"), false) << "no internal build";
-    if (!isStart) {
-      EXPECT_EQ(post.event().at("StorebagVersion"), "bag-1");
+TEST_F(Session, BackendsAreStampedWithTheDeviceAndTheClient) {
+  writeFacts(
+      "DeviceName = \"Phone\"\nProductType = \"Phone7,2\"\nProductVersion = \"12.4\"\nBuildVersion = "
+      "\"16G77\"\n"
+      "UniqueDeviceID = \"0123456789abcdef0123456789abcdef01234567\"\n");
+  harness.sessionServices.libraryVersion = "300.260.5";
+  harness.clock.set(1'700'000'050.25);
+  harness.storebags[5] = storebag("httpPost dashboard");
+  const Dictionary info =
+      merged(identified(5, 4'000'000'001), Dictionary{{kVeskReportingSessionInfoClientVersion, 70'000}});
+  for (const bool single : {false, true}) {
+    auto session = configured(info, kCamera);
+    const std::string lines = logged([&] {
+      if (single) {
+        EXPECT_EQ(sendOnce(session, info, kCamera), "finished");
+      } else {
+        EXPECT_EQ(session.start(), (BackendNames{"httpPost", "dashboard"}));
+        harness.posts();
+        session.send(message(4, 5, Dictionary{{"a", 1}}));
+      }
+    });
+    const std::string line =
+        std::string("[dashboard -> sendMessageWith") + (single ? "SessionInfo" : "Dictionary") +
+        "] 1700000050.248 0123456789abcdef0123456789abcdef01234567 127.0.0.1 HD  4464 4000000001 ";
+    EXPECT_TRUE(contains(lines, line + (single ? "    1     4     5  a=1\n" : "    2     4     5  a=1\n")))
+        << lines;
+    const auto event = lastEvent();
+    const boost::json::object fields = boost::json::parse(R"({"_startTS": 1700000040, "_clientVersion": 4464,
+        "_productFamily": "Phone", "_productModel": "Phone7,2", "_osVersion": "12.4", "_build": "16G77",
+        "_reportVers": "44.4", "_sender": "HD", "clientName": "Camera", "_method": 4, "_status": 5})")
+                                           .as_object();
+    for (const auto& [key, value] : fields) EXPECT_EQ(event.at(key), value) << key;
+    const auto* identity = event.if_contains("_sessionID");
+    if (single) {
+      EXPECT_FALSE(identity) << "a temporary backend has no session identity";
+    } else {
+      EXPECT_EQ(identity->as_string(), session->sessionIDString()) << "its own, before there is a family";
     }
   }
 }
 
+TEST_F(Session, AStorebagNamesTheBackends) {
+  harness.storebags[7] = storebag("wren nonsense httpPost");
+  for (const char* product : {"Phone7,2", "Bramble"}) {
+    CapturedLog log;
+    writeFacts("DeviceName = \"Phone\"\nProductType = \"" + std::string(product) + "\"\n");
+    const bool hasAdaptors = std::string_view(product) != "Bramble";
+    auto session = configured(identified(7));
+    EXPECT_EQ(session.start(), hasAdaptors ? BackendNames({"wren", "httpPost"}) : BackendNames{"httpPost"});
+    EXPECT_EQ(log.count(3, "VeskReportingBackend(newBackendWithName): wren"), hasAdaptors ? 0 : 1);
+    EXPECT_EQ(log.count(3, "VeskReportingBackend(newBackendWithName): nonsense"), 1);
+  }
+}
+
+TEST_F(Session, StartAndEndAreTold) {
+  const std::pair<std::string, bool> settings[] = {
+      {"", true}, {" = false", false}, {" = 0", false}, {" = 1", true}};
+  for (const auto& [setting, isAutomatic] : settings) {
+    testRoot().write("etc/veskreporting/preferences/com.corvane.timed.toml",
+                     setting.empty() ? "" : "TMAutomaticTimeZoneEnabled" + setting);
+    EXPECT_EQ(deviceDictionary("7.3", "US"), (Dictionary{{"AutomaticTimeSet", isAutomatic}})) << setting;
+    auto session = configured();
+    EXPECT_EQ(session.start(), BackendNames{"httpPost"});
+    EXPECT_EQ(session->storebagVersion(), "bag-1");
+    const std::size_t before = harness.posts().size();
+    session.session.reset();
+    const auto posts = harness.posts();
+    ASSERT_EQ(posts.size(), before + 2);
+    // They travel on two connections and may arrive in either order.
+    const bool inOrder = posts[before].event().at("_status") == 0;
+    const auto start = posts[before + !inOrder].event(), end = posts[before + inOrder].event();
+    EXPECT_EQ(start.at("AutomaticTimeSet"), isAutomatic);
+    EXPECT_EQ(end.at("_status"), 1);
+    EXPECT_EQ(end.at("StorebagVersion"), "bag-1");
+    for (const auto& event : {start, end}) EXPECT_EQ(event.at("_method"), 0);
+  }
+}
+
 TEST_F(Session, ParametersAreCheckedAndCut) {
-  CapturedLog log;
-  auto session = configured();
-  session.start();
-  session->flushMessagesWithReply({});
+  auto session = started(storebag("httpPost"));
   EXPECT_EQ(session.send(Dictionary{{"payload", Dictionary()}}), std::nullopt);
   EXPECT_EQ(session.send(Dictionary{{"category", 1}}), std::nullopt);
   EXPECT_EQ(session.send(message("one", 2)), std::nullopt) << "a text is no category";
-  EXPECT_EQ(log.count(7, "sendMessageWithDictionary: Missing mandatory parameter 'category'"), 2);
-  EXPECT_EQ(log.count(7, "sendMessageWithDictionary: Missing mandatory parameter 'type'"), 1);
-  EXPECT_EQ(harness.dropped(DropReason::InvalidMessage), 3u);
-  std::size_t before = harness.posts().size();
-  struct Case {
-    Value category;
-    int expected;
-  };
-  for (const auto& test :
-       {Case{65537, 1}, Case{-1, 65535}, Case{2.9, 2}, Case{true, 1},
-        Case{std::numeric_limits<double>::quiet_NaN(), 0}, Case{Value(~std::uint64_t{0}), 65535}}) {
-    session.send(message(test.category, 8));
-    EXPECT_EQ(harness.posts().back().event().at("_method"), test.expected);
+  EXPECT_EQ(session.send(message(1, nullptr)), std::nullopt);
+  EXPECT_EQ(harness.dropped(DropReason::InvalidMessage), 4u);
+  constexpr double kNaN = std::numeric_limits<double>::quiet_NaN();
+  const std::pair<Value, int> numbers[] = {{65537, 1}, {-1, 65535}, {2.9, 2}, {true, 1}, {kNaN, 0}};
+  for (const auto& [number, expected] : numbers) {
+    session.send(message(number, 8));
+    EXPECT_EQ(lastEvent().at("_method"), expected);
+    EXPECT_EQ(lastEvent().at("_status"), 8);
+    session.send(message(8, number));
+    EXPECT_EQ(lastEvent().at("_status"), expected);
   }
-  EXPECT_EQ(harness.posts().size(), before + 6);
+  EXPECT_EQ(harness.posts().size(), 1u + 10u);
+  session->sendMessageWithCategory(6, 7, Dictionary{{"a", "b"}}, {});
+  EXPECT_EQ(lastEvent().at("_method"), 6);
+  EXPECT_EQ(lastEvent().at("_status"), 7);
+  EXPECT_EQ(lastEvent().at("a"), "b");
+
+  auto holding = started(storebag("httpPost~"));
+  const std::pair<Value, bool> flags[] = {{0, false},   {1, true},        {2, false},           {3, true},
+                                          {"1", false}, {nullptr, false}, {4'294'967'297, true}};
+  for (const auto& [flag, isRealtime] : flags) {
+    EXPECT_EQ(holding.send(merged(message(3, 2), Dictionary{{"flag", flag}})).has_value(), isRealtime)
+        << describe(flag);
+  }
+  EXPECT_EQ(holding.send(message(3, 2)), std::nullopt);
 }
 
-TEST_F(Session, TheAnswerIsTheHTTPPostBackends) {
-  harness.storebags[5] = Dictionary{{"httpPost2", profile("/second")}, {"httpPost", profile("/first")}};
-  auto both = configured();
-  both.start();
-  auto answer = both.send(message(3, 2, Dictionary{{"word", "unique-1"}}));
-  ASSERT_TRUE(answer);
-  EXPECT_NE(answer->find("unique-1"), std::string::npos);
-  EXPECT_NE(messageLog().find(" [httpPost2 -> sendMessageWithDictionary] {"), std::string::npos);
-  EXPECT_NE(messageLog().find(" [httpPost -> sendMessageWithDictionary] {"), std::string::npos);
-
-  harness.storebags[6] = Dictionary{{"httpPost2", profile("/second")}};
-  auto second = configured(6);
-  second.start();
-  EXPECT_EQ(second.send(message(3, 2)), std::nullopt) << "a second HTTP backend never answers";
+TEST_F(Session, TheAnswerIsTheHTTPPostBackendsOrTheDashboards) {
+  struct Row {
+    const char* backends;
+    std::string sent;          // whose answer: P of httpPost, D of the dashboard
+    std::string loggedBySend;  // from whom the message log has one; 2: httpPost2
+    std::string flushed;       // and the same of a flush
+    std::string loggedByFlush;
+  };
+  const Row rows[] = {
+      {"httpPost dashboard", "P", "PD", "", ""},
+      {"dashboard httpPost", "P", "PD", "", ""},
+      {"httpPost~ dashboard", "D", "D", "P", "P"},
+      {"dashboard httpPost~", "D", "D", "P", "P"},
+      {"httpPost2", "", "2", "", ""},
+      {"httpPost2 dashboard", "D", "2D", "", ""},
+      {"dashboard httpPost2~", "D", "D", "", "2"},
+      {"httpPost~ httpPost2", "", "2", "P", "P"},
+      {"", "", "", "", ""},
+  };
+  auto whose = [](const std::optional<std::string>& answer) {
+    return !answer ? "" : answer->starts_with("{") ? "P" : "D";
+  };
+  for (const Row& row : rows) {
+    auto session = started(storebag(row.backends));
+    auto check = [&](const std::string& operation, const std::string& expected, const std::string& log,
+                     auto act) {
+      std::optional<std::string> answer;
+      const std::string lines = logged([&] { answer = act(); });
+      EXPECT_EQ(whose(answer), expected) << row.backends << operation;
+      std::string from;
+      for (const char* name : {"Post", "Post2", "dashboard"}) {
+        if (contains(lines, name + (" -> " + operation + "] ")))
+          from += name == std::string("dashboard") ? 'D' : name == std::string("Post") ? 'P' : '2';
+      }
+      EXPECT_EQ(from, log) << row.backends << lines;
+    };
+    check("sendMessageWithDictionary", row.sent, row.loggedBySend,
+          [&] { return session.send(message(3, 2)); });
+    check("flushMessages", row.flushed, row.loggedByFlush, [&] { return session.flush(); });
+  }
 }
 
-TEST_F(Session, WithoutConsentNothingIsAnsweredOrLogged) {
-  harness.consent = false;
-  auto session = configured();
-  session.start();
-  EXPECT_EQ(session.send(message(3, 2, Dictionary{{"word", "unique-2"}})), std::nullopt);
-  EXPECT_EQ(harness.posts().size(), 2u);
-  EXPECT_EQ(messageLog().find("unique-2"), std::string::npos);
+TEST_F(Session, AnAnswerIsCutToWhatFitsIntoAMessage) {
+  auto session = started(storebag("httpPost~"));
+  session.flush();
+  auto answerTo = [&](const std::string& text) {
+    session.send(message(3, 2, Dictionary{{"a", text}}));
+    return session.flush().value();
+  };
+  const std::size_t rest = answerTo("").size();
+  EXPECT_EQ(answerTo(std::string(kMaxAnswerBytes - rest, 'x')).size(), kMaxAnswerBytes);
+  for (std::size_t shift = 0; shift < 4; ++shift) {
+    std::string text(shift, 'x');
+    while (text.size() <= kMaxAnswerBytes) text += "\xF0\x9F\x90\x8B";
+    std::string answer;
+    const std::string lines = logged([&] { answer = answerTo(text); });
+    EXPECT_LE(answer.size(), kMaxAnswerBytes);
+    EXPECT_GT(answer.size(), kMaxAnswerBytes - 4);
+    EXPECT_TRUE(isValidUTF8(answer)) << shift;
+    const std::string last = "\n[cut: this answer has " + std::to_string(rest + text.size()) + " bytes]";
+    ASSERT_TRUE(answer.ends_with(last)) << answer.substr(answer.size() - 60);
+    EXPECT_TRUE(contains(lines, answer.substr(0, answer.size() - last.size())));
+    EXPECT_TRUE(contains(lines, text)) << "the message log has all of it";
+  }
 }
 
 TEST_F(Session, DisplayURLComesFromTheFirstBackendThatHasOne) {
-  auto with = [&](const char* url) {
-    MutableDictionary changed(profile("/post"));
-    changed.set("display_url", url);
-    return changed.share();
+  const std::pair<const char*, const char*> cases[] = {
+      {"httpPost", "URL not available"},
+      {"uploadServer+", "URL not available"},
+      {"dashboard+ httpPost2+ httpPost+", "http://httpPost?sequences=77&override=yes"},
+      {"dashboard+ httpPost2+ httpPost", "http://httpPost2?sequences=77&override=yes"},
+      {"httpPost httpPost2 dashboard+", "http://dashboard?sequences=77&override=yes"},
+      {"dashboard", "URL not available"},
   };
-  const struct {
-    Dictionary storebag;
-    const char* expected;
-  } cases[] = {
-      {Dictionary{{"httpPost", profile("/")}}, "URL not available"},
-      {Dictionary{{"httpPost2", with("http://b")}, {"httpPost", with("http://a")}},
-       "http://a?sequences=77&override=yes"},
-      {Dictionary{{"httpPost2", with("http://b")}, {"httpPost", profile("/")}},
-       "http://b?sequences=77&override=yes"},
-  };
-  for (const auto& test : cases) {
-    harness.storebags[5] = test.storebag;
-    harness.clock.advance(std::chrono::hours(2));
-    auto session = configured();
-    session.start();
-    EXPECT_EQ(displayURL(session), test.expected);
+  for (const auto& [backends, expected] : cases) {
+    auto session = started(storebag(backends));
+    EXPECT_EQ(displayURL(session), expected) << backends;
   }
+  auto session = started(storebag("httpPost+"), identified(5, 3'000'000'000));
+  EXPECT_EQ(displayURL(session), "http://httpPost?sequences=-1294967296&override=yes");
+}
+
+TEST_F(Session, UploadsAreOfferedToEveryBackend) {
+  RecordingServer server([](const HTTPReceived&, std::size_t) { return HTTPAnswer::text(200, "success"); });
+  CapturedLog log;
+  std::optional<bool> uploaded;
+  auto twice = [&](const char* name, bool first, bool second) {
+    MutableDictionary section;
+    for (const bool takes : {first, second}) {
+      Dictionary profile{{"ip", "127.0.0.1"}, {"port", 9}};
+      section.append(Text(name), takes ? merged(profile, Dictionary{{"post_url", server.url()}}) : profile);
+    }
+    return section.share();
+  };
+  {
+    // The first one takes the descriptor, which leaves the second none.
+    auto session = started(twice("uploadServer", true, true));
+    const std::string path = testRoot().write("a.log", "text").string();
+    FileDescriptor file(::open(path.c_str(), O_RDONLY));
+    const std::string token = ExtensionTokens::shared().add({1, ::getuid()}, std::move(file));
+    const std::string lines = logged([&] {
+      session->uploadFileAtPath("file://" + path, token,
+                                {[&](const bool& reply) { uploaded = reply; }, nullptr});
+    });
+    EXPECT_EQ(uploaded, true);
+    EXPECT_TRUE(contains(lines, ") [uploadFileWithURL] Upload succeeded for file file://" + path + "\n"));
+    EXPECT_EQ(log.count(7, "UploadBackend(uploadFileAtPath): Uploading file " + path), 2);
+    EXPECT_EQ(log.count(7, "uploadFileWithURL: File upload successful for " + path), 1);
+  }
+  for (const auto& [first, second] : {std::pair{true, true}, {true, false}, {false, true}, {false, false}}) {
+    const std::size_t before = server.count();
+    auto session = started(twice("dashboard", first, second));
+    session->uploadLogData(
+        {1}, {[&](const bool& reply, const auto& error) { uploaded = !error && reply; }, nullptr});
+    EXPECT_EQ(uploaded, first || second);
+    EXPECT_EQ(server.count() - before, std::size_t{first} + std::size_t{second}) << "each is asked";
+  }
+  EXPECT_EQ(log.count(7, "uploadLogData: Log data array upload successful"), 3);
+  EXPECT_EQ(harness.dropped(DropReason::UploadFailed), 1u);
 }
 
 TEST_F(Session, ASecondStartReplacesTheBackendsWithoutLosingWhatTheyHeld) {
-  auto session = configured();
-  session->setSessionInfo(
-      Dictionary{{kVeskReportingSessionInfoClientType, 5}, {kVeskReportingSessionInfoBatchEvent, true}},
-      std::nullopt, {}, false);
+  auto session = configured(Dictionary{{kVeskReportingSessionInfoBatchEvent, true}});
   session.start();
   session.send(message(3, 2, Dictionary{{"word", "held"}}));
   EXPECT_TRUE(harness.posts().empty());
-  session.start();
+  const std::string lines = logged([&] { session.start(); });
   auto posts = harness.posts();
   ASSERT_EQ(posts.size(), 1u);
   EXPECT_EQ(posts[0].events().size(), 2u) << "the start message and the held one";
+  EXPECT_TRUE(contains(lines, ") [httpPost -> flushMessages] {")) << lines;
+  EXPECT_TRUE(contains(lines, "\"word\": \"held\""));
 }
 
 TEST_F(Session, UserInfoDecidesPendingBackends) {
-  CapturedLog log;
-  MutableDictionary entry(Dictionary{{"post_url", harness.url()},
-                                     {"locale_whitelist", List{"US"}},
-                                     {"filters", List{Dictionary()}},
-                                     {"sampling_threshold", 1.0}});
-  harness.storebags[5] = Dictionary{{"httpPost", Dictionary{{"clients", List{entry.share()}}}}};
-  auto session = harness.newSession();
-  session->setSessionInfo(
-      Dictionary{{kVeskReportingSessionInfoClientType, 5}, {kVeskReportingSessionInfoRequireUserInfo, true}},
-      std::nullopt, {}, false);
+  const Dictionary entry{{"post_url", harness.url()},
+                         {"locale_whitelist", List{"US"}},
+                         {"filters", List{Dictionary()}},
+                         {"sampling_threshold", 1.0}};
+  harness.storebags[5] = Dictionary{{"httpPost", Dictionary{{"clients", List{entry}}}}};
+  auto session = configured(Dictionary{{kVeskReportingSessionInfoRequireUserInfo, true}});
   EXPECT_EQ(session.start(), BackendNames{});
-  auto states = [&](std::optional<Dictionary> userInfo) {
-    std::optional<BackendNames> names;
-    session->fetchStatesWithUserInfo(userInfo, {[&](const auto& reply) { names = reply; }, nullptr});
-    return names;
+  const Dictionary otherService = merged(kCamera, Dictionary{{kVeskReportingUserInfoServiceName, "Other"}});
+  const Dictionary otherClient = merged(kCamera, Dictionary{{kVeskReportingUserInfoClientName, "Other"}});
+  const Dictionary nameless{{kVeskReportingUserInfoServiceName, "Clips"}};
+  const Dictionary more = merged(kCamera, Dictionary{{"more", 1}});
+  struct Row {
+    std::optional<Dictionary> given;
+    bool isNews;
   };
-  const Dictionary camera{{kVeskReportingUserInfoClientName, "Camera"},
-                          {kVeskReportingUserInfoServiceName, "s"}};
-  EXPECT_EQ(states(std::nullopt), BackendNames{});
-  EXPECT_EQ(states(camera), BackendNames{"httpPost"});
-  MutableDictionary extra(camera);
-  extra.set("more", 1);
-  states(extra.share());
-  EXPECT_EQ(log.count(7, "receivedUserInfo: Received new user info for session 0"), 1)
-      << "same names: no change";
-  EXPECT_EQ(states(std::nullopt), BackendNames{}) << "nothing replaces what was known";
+  const Row rows[] = {{std::nullopt, false}, {kCamera, true},      {more, false},
+                      {otherService, true},  {otherClient, true},  {nameless, true},
+                      {nameless, true},      {std::nullopt, true}, {more, true}};
+  std::optional<Dictionary> kept;
+  for (const Row& row : rows) {
+    CapturedLog log;
+    const std::string what = row.given ? describe(*row.given) : "none";
+    if (row.isNews) kept = row.given;
+    EXPECT_EQ(session.states(row.given), kept ? BackendNames{"httpPost"} : BackendNames{}) << what;
+    EXPECT_EQ(log.count(7, "receivedUserInfo: Received new user info for session 77"), row.isNews) << what;
+    EXPECT_EQ(session->userInfo(), kept) << what;
+    harness.posts();
+    if (!session.send(message(3, 2))) continue;
+    const auto event = lastEvent();
+    for (const char* key : {kVeskReportingUserInfoClientName, kVeskReportingUserInfoServiceName, "more"})
+      EXPECT_EQ(event.contains(key), kept->contains(key)) << what << key;
+  }
 }
 
 TEST_F(Session, ASingleMessageNeedsItsIdentifiersAndAStorebag) {
   CapturedLog log;
-  auto session = harness.newSession();
-  auto sendOnce = [&](Dictionary info) {
-    std::string answer = "no reply";
-    session->sendMessageWithSessionInfo(
-        info, Dictionary{{kVeskReportingUserInfoClientName, "Camera"}}, 4, 5, Dictionary{{"a", 1}},
-        {[&](const std::string& reply) { answer = reply; }, [&] { answer = "error"; }});
-    return answer;
-  };
-  const auto id = [](int clientType) {
-    return Dictionary{{kVeskReportingSessionInfoSessionID, 9},
-                      {kVeskReportingSessionInfoClientType, clientType}};
-  };
-  EXPECT_EQ(sendOnce(Dictionary{{kVeskReportingSessionInfoSessionID, 9}}), "error");
-  EXPECT_EQ(log.count(3, "sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo"), 1);
-  EXPECT_EQ(harness.dropped(DropReason::InvalidMessage), 1u);
-  EXPECT_EQ(sendOnce(id(3)), "storebag not available");
+  auto session = configured();
+  const Dictionary before = session->sessionInfo().value();
+  const Dictionary noID{{kVeskReportingSessionInfoClientType, 5}};
+  const Dictionary noType{{kVeskReportingSessionInfoSessionID, 9}};
+  const Dictionary refused[] = {
+      noID, noType, identified("5", 9), identified(5, "9"), identified(nullptr, 9), identified(5, nullptr)};
+  for (const auto& info : refused) {
+    EXPECT_EQ(sendOnce(session, info, kCamera), "no answer") << describe(info);
+    EXPECT_EQ(session->sessionID(), 77u);
+    EXPECT_EQ(session->sessionInfo(), before);
+    EXPECT_EQ(session->userInfo(), std::nullopt);
+  }
+  EXPECT_EQ(log.count(3, "sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo"), 6);
+  EXPECT_EQ(harness.dropped(DropReason::InvalidMessage), 6u);
+  EXPECT_EQ(sendOnce(session, identified(3, 8)), "storebag not available");
+  EXPECT_EQ(session->sessionID(), 8u) << "taken all the same";
   EXPECT_EQ(harness.dropped(DropReason::NoBackend), 1u);
-  EXPECT_EQ(sendOnce(id(5)), "finished");
-  EXPECT_EQ(log.count(4, "sendMessageWithSessionInfo: user info provided without requiring it."), 1);
-  auto posts = harness.posts();
-  ASSERT_EQ(posts.size(), 1u);
-  EXPECT_EQ(posts[0].event().at("_method"), 4);
-  EXPECT_FALSE(posts[0].event().contains("_sessionID")) << "a temporary backend has no session identity";
-  MutableDictionary batching(id(5));
-  batching.set(kVeskReportingSessionInfoBatchEvent, true);
-  EXPECT_EQ(sendOnce(batching.share()), "finished");
-  EXPECT_EQ(harness.posts().size(), 2u) << "nothing could send it later";
+  EXPECT_TRUE(harness.posts().empty());
+
+  const Dictionary batching =
+      merged(identified(5, 9), Dictionary{{kVeskReportingSessionInfoBatchEvent, true}});
+  const std::string lines = logged([&] { EXPECT_EQ(sendOnce(session, batching, kCamera), "finished"); });
+  EXPECT_EQ(session->sessionID(), 9u);
+  EXPECT_EQ(session->sessionInfo(), batching);
+  EXPECT_EQ(session->userInfo(), kCamera);
+  EXPECT_EQ(harness.posts().size(), 1u) << "nothing could send it later";
+  EXPECT_TRUE(contains(lines, ") [httpPost -> flushMessages] {")) << lines;
+  EXPECT_FALSE(contains(lines, "sendMessageWithSessionInfo")) << "held, since its flag is 0";
+  EXPECT_EQ(session->fetchReportingStates(), std::nullopt) << "its backends are gone";
 }
 
-TEST(Agent, TheBusyMarkerIsHeldWhileThereAreSessions) {
-  CapturedLog log;
-  AgentHarness harness;
-  auto first = std::make_shared<RecordingConnection>();
-  auto second = std::make_shared<RecordingConnection>();
-  harness.agent->shouldAcceptNewConnection(first);
-  EXPECT_EQ(log.count(7, "listener: Accepting new Orvo connection recording connection, 0(0) connections."),
-            1);
-  harness.agent->shouldAcceptNewConnection(second);
-  first->interrupt();
-  EXPECT_EQ(log.countContaining(7, "was interrupted"), 1);
-  first->invalidate();
-  first->invalidate();
-  EXPECT_TRUE(harness.busyMarker.isBusy());
-  second->invalidate();
-  EXPECT_FALSE(harness.busyMarker.isBusy());
-  EXPECT_EQ(log.countContaining(7, "was invalidated"), 2);
-  EXPECT_EQ(log.countContaining(7, "dealloc: ReportingdSession dealloc: 0"), 2);
+TEST_F(Session, AggregationFollowsTheLastConfigurationAndTheEndComesInOrder) {
+  auto session = configured(Dictionary{{kVeskReportingSessionInfoBatchEvent, true}});
+  session.start();
+  const Dictionary info = session->sessionInfo().value();
+  for (const bool wanted : {true, false, true}) {
+    session->setSessionInfo(info, std::nullopt, {}, wanted);
+    EXPECT_EQ(session->hasAggregator(), wanted);
+    session.send(message(3, 2, Dictionary{{"wanted", wanted}}));
+  }
+  std::vector<std::size_t> posts;
+  session.connection->onCall = [&](const IPCOutgoingCall&) { posts.push_back(harness.posts().size()); };
+  session.session.reset();
+  EXPECT_EQ(
+      session.connection->told(),
+      (std::vector<std::string>{
+          R"(77: 1700000000.000000 3/2 {"wanted": true})", R"(77: 1700000000.000000 3/2 {"wanted": true})",
+          R"(77: 1700000000.000000 0/1 {"StorebagVersion": "bag-1"})", "closing: 0.000000 0/0"}));
+  EXPECT_EQ(posts, (std::vector<std::size_t>{0, 1}))
+      << "the flush is between the last message and the closing one";
+  session.connection->onCall = nullptr;
 }
 
 }  // namespace

@@ -3,6 +3,7 @@
 
 #include <VeskReporting/VeskReportingTypes.h>
 
+#include <cstddef>
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -12,6 +13,10 @@
 #include "platform/values/Value.h"
 
 namespace vesk {
+
+/// A longer text would not fit into a D-Bus message: what answers a message or a flush is cut to this, at a
+/// whole character, and says so in its last line.
+inline constexpr std::size_t kMaxAnswerBytes = std::size_t{1} << 20;
 
 /// Implemented by the daemon's session. All calls of one connection arrive in order on that connection's
 /// thread. Whatever a caller may leave out is optional. Implementations must not throw.

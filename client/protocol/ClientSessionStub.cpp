@@ -5,6 +5,8 @@
 
 namespace vesk {
 
+static_assert(kMaxAnswerBytes <= CodecLimits{}.content);
+
 struct ClientSessionStub::Handler {
   const wire::Member& member;
   void (ClientSessionStub::*handle)(IPCIncomingCall& call);

@@ -7,10 +7,13 @@
 
 namespace vesk {
 
+struct CodecLimits;
+
 /// Memory that a call holds, its own size included, roughly, in bytes.
 std::size_t approximateMemory(const IPCOutgoingCall& call) noexcept;
 
-/// What a call comes to as `CodecLimits::content` counts it, roughly; not less.
-std::size_t approximateContent(const IPCOutgoingCall& call) noexcept;
+/// Whether a call holds more bytes or more values than `limits` lets a message have. Its bytes are counted
+/// roughly, and not as fewer than they are.
+bool isTooLarge(const IPCOutgoingCall& call, const CodecLimits& limits) noexcept;
 
 }  // namespace vesk

@@ -8,7 +8,7 @@
 namespace vesk {
 
 const char* Outbox::put(IPCOutgoingCall call) {
-  if (approximateContent(call) > CodecLimits{}.content) return "the call is too large";
+  if (isTooLarge(call, CodecLimits{})) return "the call is too large";
   const std::size_t memory = approximateMemory(call);
   MutexLock lock(_mutex);
   if (_closed) return "the connection has ended";

@@ -24,6 +24,20 @@ class RecordingConnection final : public IPCConnection {
     _object.reset();
   }
   void interrupt() { _interrupted(); }
+  /// The messages that its client was handed, each as "102: 1700000000.000000 3/2 {a: text}" (who sent it,
+  /// when, what), or "closing: 0.000000 0/0".
+  std::vector<std::string> told() const {
+    std::vector<std::string> lines;
+    for (const auto& call : calls) {
+      const auto at = [&]<class T>(std::size_t i, T) { return std::get<T>(call.arguments.at(i)); };
+      const auto from = at(0, std::optional<Dictionary>()), payload = at(4, std::optional<Dictionary>());
+      std::string line = from ? describe(*from->find(kVeskReportingSessionInfoSessionID)) : "closing";
+      line += ": " + std::to_string(at(1, 0.0)) + " ";
+      line += std::to_string(at(2, std::uint16_t())) + "/" + std::to_string(at(3, std::uint16_t()));
+      lines.push_back(line + (payload ? " " + describe(*payload) : ""));
+    }
+    return lines;
+  }
   void callRemoteObject(IPCOutgoingCall call,
                         const std::function<void(const std::string& error)>& errorHandler) override {
     if (clientIsGone) return errorHandler("gone");
@@ -64,6 +78,18 @@ struct DrivenSession {
         {[&](const std::optional<BackendNames>& reply) { names = reply; }, nullptr});
     return names;
   }
+  std::optional<BackendNames> states(const std::optional<Dictionary>& userInfo) {
+    std::optional<BackendNames> names;
+    session->fetchStatesWithUserInfo(
+        userInfo, {[&](const std::optional<BackendNames>& reply) { names = reply; }, nullptr});
+    return names;
+  }
+  std::optional<std::string> flush() {
+    std::optional<std::string> answer;
+    session->flushMessagesWithReply(
+        {[&](const std::optional<std::string>& reply) { answer = reply; }, nullptr});
+    return answer;
+  }
   std::optional<std::string> send(Dictionary parameters) {
     std::optional<std::string> answer;
     session->sendMessageWithDictionary(
@@ -71,6 +97,12 @@ struct DrivenSession {
     return answer;
   }
 };
+
+inline Dictionary merged(const Dictionary& base, const Dictionary& more) {
+  MutableDictionary all(base);
+  all.setAll(more);
+  return all.share();
+}
 
 class AgentHarness : public BackendHarness {
  public:
@@ -88,6 +120,13 @@ class AgentHarness : public BackendHarness {
             busyMarker)) {}
 
   DrivenSession newSession() { return DrivenSession(*this); }
+  /// What sessions lost, as they count it; backends count under their own names.
+  std::uint64_t dropped(DropReason reason) const {
+    std::uint64_t sum = 0;
+    for (const auto& count : counters.snapshot())
+      sum += count.backend == "session" && count.reason == reason ? count.count : 0;
+    return sum;
+  }
 
   SessionServices sessionServices{services, "7.3"};
   BusyMarker busyMarker;

@@ -8,12 +8,12 @@
 
 namespace vesk::test {
 
-/// Client types 5, 6, 7 are levels 0, 1, 2 of one family.
+/// Client types 5 to 8 are levels 0 to 3 of one family.
 class FamilyHarness : public ::testing::Test {
  protected:
   FamilyHarness() {
     testRoot().write("etc/veskreporting/device.toml", "DeviceName = \"Phone\"\n");
-    for (int level = 0; level < 3; ++level) {
+    for (int level = 0; level < 4; ++level) {
       harness.storebags[5 + level] = Dictionary{{"httpPost", profile(level, level == 0 ? 1.0 : 0.0)}};
     }
   }
