@@ -28,7 +28,7 @@ class DashboardBackend final : public VeskReportingBackend {
   ~DashboardBackend() override;
 
   /// Uploads `logData` as keyed archive and announces where the server put it; waits for its turn among the
-  /// uploads (UploadGate.h) and then for the server, 120 s at most, without any lock.
+  /// uploads of its size (UploadGate.h) and then for the server, 120 s at most, without any lock.
   bool uploadLogData(const List& logData) override;
 
   bool isReliable() const noexcept { return _delivery->isReliable(); }

@@ -8,11 +8,14 @@
 #include "backends/HTTPSPostBackend.h"
 #include "backends/ListMatching.h"
 #include "platform/log/SystemLog.h"
+#include "platform/unicode/UTF8.h"
 #include "storebag/StorebagProfile.h"
 
 namespace vesk {
 
 namespace {
+
+constexpr std::size_t kLongestNameInLog = 256;
 
 std::optional<std::string_view> viewOf(const std::optional<Text>& text) {
   if (!text) return std::nullopt;
@@ -124,9 +127,9 @@ std::int32_t HTTPSPostBackend::stateForEntry(const Dictionary& entry, const std:
   std::int32_t newState = stateForSampling(entry);
   updateEventThreshold(entry);
   updateExtrasOnInternal(entry);
-  VESK_LOG_DEBUG("HTTPSPostBackend(updateBackendState): %s: client found %.256s, state? %d, %f",
-                 _name.c_str(), clientName ? clientName->string().c_str() : "(none)", newState,
-                 samplingFactor());
+  VESK_LOG_DEBUG("HTTPSPostBackend(updateBackendState): %s: client found %s, state? %d, %f", _name.c_str(),
+                 clientName ? cutToWholeCharacters(clientName->view(), kLongestNameInLog).c_str() : "(none)",
+                 newState, samplingFactor());
   updatePostLink(entry);
   return newState;
 }

@@ -8,6 +8,7 @@
 #include "backends/SenderCodes.h"
 #include "platform/json/JSONWriter.h"
 #include "platform/log/SystemLog.h"
+#include "platform/unicode/UTF8.h"
 #include "platform/values/Conversions.h"
 #include "util/Gzip.h"
 #include "util/ReportingdUtil.h"
@@ -36,7 +37,7 @@ void sanitize(MutableDictionary& event) {
     }
     VESK_LOG_WARNING(
         "HTTPSPostBackend(createMessageForPostAndLogging): TreeWriter unable to handle key: %s, value: %s",
-        std::string(entry.key.view().substr(0, kLongestKeyInLog)).c_str(),
+        cutToWholeCharacters(entry.key.view(), kLongestKeyInLog).c_str(),
         describe(entry.value, kLongestValueInLog).c_str());
     return true;
   });

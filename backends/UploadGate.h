@@ -3,6 +3,7 @@
 
 #include <sys/types.h>
 
+#include <array>
 #include <chrono>
 #include <condition_variable>
 #include <cstddef>
@@ -19,32 +20,41 @@ namespace vesk {
 /// taking all memory, and all connections to a server that others need as well. Thread-safe; its lock is a
 /// leaf, and no other lock may be held by who waits here.
 class UploadGate {
+  enum Kind : std::size_t { File, SmallLogData };
+
  public:
   struct Limits {
-    std::size_t uploads = 3;                     ///< of the six connections to a host
+    std::size_t uploads = 3;                     ///< of the eight connections to a host
     std::size_t bytes = std::size_t{768} << 20;  ///< of files and compressed files in memory
     /// A user whose files or servers hang leaves this much to the others.
     std::size_t uploadsOfUser = 2;
     std::size_t bytesOfUser = std::size_t{512} << 20;
+    /// Small log data has places of its own, so that neither waits for the other's slow servers.
+    std::size_t smallUploads = 3;
+    std::size_t smallUploadsOfUser = 2;
     std::chrono::milliseconds patience = std::chrono::minutes(1);  ///< how long one waits to be let in
   };
 
   /// The right to have an upload under way. Must not outlive the gate.
   class Pass {
    public:
-    Pass(UploadGate& gate, uid_t user, std::size_t bytes) noexcept
-        : _gate(&gate), _user(user), _bytes(bytes) {}
+    Pass(UploadGate& gate, Kind kind, uid_t user, std::size_t bytes) noexcept
+        : _gate(&gate), _kind(kind), _user(user), _bytes(bytes) {}
     Pass(Pass&& other) noexcept
-        : _gate(std::exchange(other._gate, nullptr)), _user(other._user), _bytes(other._bytes) {}
+        : _gate(std::exchange(other._gate, nullptr)),
+          _kind(other._kind),
+          _user(other._user),
+          _bytes(other._bytes) {}
     Pass& operator=(Pass&&) = delete;
     ~Pass() {
-      if (_gate) _gate->leave(_user, {1, _bytes});
+      if (_gate) _gate->leave(_kind, _user, {1, _bytes});
     }
     /// It needs no more than that from now on.
     void shrinkTo(std::size_t bytes);
 
    private:
     UploadGate* _gate;
+    Kind _kind;
     uid_t _user;
     std::size_t _bytes;
   };
@@ -61,6 +71,11 @@ class UploadGate {
   /// none in time, or the gate is closed. Throws std::bad_alloc.
   [[nodiscard]] std::optional<Pass> enter(uid_t user, std::size_t bytes);
 
+  /// Log data of fewer bytes counts as small.
+  static constexpr std::size_t kSmallLogData = std::size_t{1} << 20;
+  /// The same for log data: beside the files when it is small, otherwise as a file.
+  [[nodiscard]] std::optional<Pass> enterWithLogData(uid_t user, std::size_t bytes);
+
   /// Sends the request and waits for its end, which comes at once when the client no longer serves uploads.
   static HTTPResult perform(HTTPClient& http, HTTPRequest request);
 
@@ -73,14 +88,20 @@ class UploadGate {
     std::size_t uploads = 0;
     std::size_t bytes = 0;
   };
-  void leave(uid_t user, Share share);
-  bool hasRoomFor(std::size_t bytes, const Share& ofUser) const VESK_REQUIRES(_mutex);
+  /// Uploads that share their places.
+  struct Lane {
+    Share limit, limitOfUser;
+    Share all{};
+    std::map<uid_t, Share> ofUser{};  ///< those who have some
+  };
+  std::optional<Pass> enter(Kind kind, uid_t user, std::size_t bytes);
+  void leave(Kind kind, uid_t user, Share share);
+  static bool hasRoom(const Share& taken, const Share& limit, std::size_t bytes);
 
-  const Limits _limits;
+  const std::chrono::milliseconds _patience;
   mutable Mutex _mutex;
   std::condition_variable_any _changed;
-  Share _all VESK_GUARDED_BY(_mutex);
-  std::map<uid_t, Share> _ofUser VESK_GUARDED_BY(_mutex);  ///< those who have some
+  std::array<Lane, 2> _lanes VESK_GUARDED_BY(_mutex);  ///< by their kind
   bool _closed VESK_GUARDED_BY(_mutex) = false;
 };
 

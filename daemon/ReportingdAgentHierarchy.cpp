@@ -4,10 +4,14 @@
 
 #include "daemon/ReportingdAgent.h"
 #include "platform/log/SystemLog.h"
+#include "platform/unicode/UTF8.h"
 
 namespace vesk {
 
 namespace {
+
+/// A key comes from a client, which must not fill the log with it.
+std::string shown(const std::string& key) { return cutToWholeCharacters(key, 256); }
 
 template <class List>
 bool contains(const List& list, const ReportingdSession& session) {
@@ -52,8 +56,8 @@ void ReportingdAgent::userInfoUpdatedForSession(ReportingdSession& session) {
   const std::string& key = *sharedKey;
   RecursiveMutexLock lock(_monitor);
   removeFromCorrelation(self);
-  VESK_LOG_DEBUG("userInfoUpdatedForSession: Adding session %u to list for userInfoKey %.256s",
-                 session.sessionID(), key.c_str());
+  VESK_LOG_DEBUG("userInfoUpdatedForSession: Adding session %u to list for userInfoKey %s",
+                 session.sessionID(), shown(key).c_str());
   listForKey(key).push_back(self);
 }
 
@@ -62,24 +66,25 @@ std::shared_ptr<ReportingdSession> ReportingdAgent::parentSessionForChild(Report
   if (level == 0) return nullptr;
   const auto sharedKey = session.correlationKey();
   const std::string& key = *sharedKey;
-  VESK_LOG_DEBUG("parentSessionForChild: Checking userInfoKey '%.256s' for session %u", key.c_str(),
+  VESK_LOG_DEBUG("parentSessionForChild: Checking userInfoKey '%s' for session %u", shown(key).c_str(),
                  session.sessionID());
   const SessionList* list = correlatedSessions(key);
   if (!list || list->empty()) {
-    VESK_LOG_ERROR("parentSessionForChild: ERROR: No sessions found for user info key %.256s", key.c_str());
+    VESK_LOG_ERROR("parentSessionForChild: ERROR: No sessions found for user info key %s",
+                   shown(key).c_str());
     return nullptr;
   }
   if (!contains(*list, session)) {
-    VESK_LOG_ERROR("parentSessionForChild: ERROR: Session %u not found for user info key %.256s",
-                   session.sessionID(), key.c_str());
+    VESK_LOG_ERROR("parentSessionForChild: ERROR: Session %u not found for user info key %s",
+                   session.sessionID(), shown(key).c_str());
     return nullptr;
   }
   const std::int64_t above = std::int64_t{level} - 1;
   auto parent = getFirstSessionWithHierarchy(above, *list);
   if (!parent) {
     VESK_LOG_INFO("parentSessionForChild: Unable to find session with hierarchy of %" PRId64
-                  " for userInfoKey '%.256s'",
-                  above, key.c_str());
+                  " for userInfoKey '%s'",
+                  above, shown(key).c_str());
   }
   return parent;
 }
@@ -89,18 +94,18 @@ std::optional<std::string> ReportingdAgent::parentSessionIDStringForSession(Repo
   if (level == 0) return std::nullopt;
   const auto sharedKey = session.correlationKey();
   const std::string& key = *sharedKey;
-  VESK_LOG_DEBUG("parentSessionIDStringForSession: Checking userInfoKey '%.256s' for session %u", key.c_str(),
-                 session.sessionID());
+  VESK_LOG_DEBUG("parentSessionIDStringForSession: Checking userInfoKey '%s' for session %u",
+                 shown(key).c_str(), session.sessionID());
   RecursiveMutexLock lock(_monitor);
   const SessionList* list = correlatedSessions(key);
   if (!list || list->empty()) {
-    VESK_LOG_ERROR("parentSessionIDStringForSession: ERROR: No sessions found for user info key %.256s",
-                   key.c_str());
+    VESK_LOG_ERROR("parentSessionIDStringForSession: ERROR: No sessions found for user info key %s",
+                   shown(key).c_str());
     return std::nullopt;
   }
   if (!contains(*list, session)) {
-    VESK_LOG_ERROR("parentSessionIDStringForSession: ERROR: Session %u not found for user info key %.256s",
-                   session.sessionID(), key.c_str());
+    VESK_LOG_ERROR("parentSessionIDStringForSession: ERROR: Session %u not found for user info key %s",
+                   session.sessionID(), shown(key).c_str());
     return std::nullopt;
   }
   if (level < 0) return std::nullopt;

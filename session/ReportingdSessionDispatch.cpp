@@ -5,6 +5,7 @@
 
 #include "platform/files/FileURL.h"
 #include "platform/log/SystemLog.h"
+#include "platform/unicode/UTF8.h"
 #include "session/ReportingdSession.h"
 #include "util/MessageLog.h"
 #include "util/ReportingdUtil.h"
@@ -123,8 +124,8 @@ void ReportingdSession::uploadFileWithURL(const std::string& fileURL, const std:
   bool succeeded = false;
   if (path.size() >= PATH_MAX || url.size() > kLongestURL) {
     // A client must not fill the logs with what it calls its file.
-    if (path.size() > kShownOfTooLong) path.resize(kShownOfTooLong);
-    url.resize(kShownOfTooLong);
+    path = cutToWholeCharacters(path, kShownOfTooLong);
+    url = cutToWholeCharacters(url, kShownOfTooLong);
   } else if (auto set = backends()) {
     for (const auto& [name, backend] : *set) {
       if (backend->uploadFileAtPath(path, extensionToken)) succeeded = true;

@@ -8,10 +8,14 @@
 #include "tests/support/CapturedLog.h"
 #include "tests/support/DashboardServer.h"
 #include "tests/support/RecordingServer.h"
+#include "tests/support/ScarceMemory.h"
 #include "tests/support/SimulatedQueues.h"
+#include "tests/support/SocketFaults.h"
 
 namespace vesk::test {
 namespace {
+
+using namespace std::string_literals;
 
 constexpr char kUdid[] = "0123456789abcdef0123456789abcdef01234567";
 constexpr timeval kWhen{1'700'000'001, 999'999};
@@ -62,59 +66,147 @@ TEST_F(Dashboard, EncodesAMessageToTheByte) {
   EXPECT_EQ(backend->state(), BackendStateEnabled);
   const auto line = backend->sendMessage(Dictionary{{"b", "xx"}, {"a", "y"}}, kWhen, 0x0708, 0x090A, 0);
   _queues.queue->run();
-  const auto datagrams = _server.take();
-  ASSERT_EQ(datagrams.size(), 1u);
-  using namespace std::string_literals;
-  EXPECT_EQ(datagrams[0],
-            "\x07\x05\x01\xf9\x65\x53\xf1\x01\xfe\xfd\xfc\xfb\xfa\xf9\xff\xb6\x07\x08\x09\x0a"s + kUdid +
-                "\0\x01\0\0 a=y b=xx"s);
+  EXPECT_EQ(_server.take(),
+            std::vector{"\x07\x05\x01\xf9\x65\x53\xf1\x01\xfe\xfd\xfc\xfb\xfa\xf9\xff\xb6\x07\x08\x09\x0a"s +
+                        kUdid + "\0\x01\0\0 a=y b=xx"s});
   EXPECT_EQ(line, "1700000001.996 "s + kUdid + " 127.0.0.1 HD  1286 16909060     1  1800  2314  a=y b=xx");
 }
 
+TEST_F(Dashboard, HeadersCarryWhatFitsIntoThem) {
+  auto carries = [this](timeval when, std::int32_t clientType, std::uint32_t session, std::uint16_t version,
+                        std::string udid, const std::string& first, const std::string& line) {
+    SCOPED_TRACE(line);
+    auto backend = make(profile());
+    backend->setCompType(clientType);
+    backend->setSessionID(session);
+    backend->setClientVersion(version);
+    backend->setUdid(udid);
+    EXPECT_EQ(backend->sendMessage(std::nullopt, when, 0, 0xFFFF, 3), line + "     1     0 65535 ");
+    _queues.queue->run();
+    udid.resize(40);
+    EXPECT_EQ(_server.take(), std::vector{first + "\xFF\xBF"s + "\0\0\xFF\xFF"s + udid + "\0\1\0\0"s});
+  };
+  carries({0, 0}, 0, 0, 0, "", "\7\0\1\0\0\0\0\0\xFF\xFF\xFF\xFF\xFF\xFF"s,
+          "0.000  127.0.0.1 QX     0     0");
+  carries({0x1'8000'0002, 3999}, 12, 0, 0, "", "\7\x0C\1\0\x80\0\0\2\xFF\xFF\xFF\xFF\xFF\xFF"s,
+          "2147483650.000  127.0.0.1 -     0     0");
+  carries({1, 4000}, -1, 0, 0, "short", "\7\xFF\1\1\0\0\0\1\xFF\xFF\xFF\xFF\xFF\xFF"s,
+          "1.004 short 127.0.0.1 -     0     0");
+  carries({-1, 7999}, 0x705, UINT32_MAX, UINT16_MAX, kUdid + "89"s, "\7\5\1\1\xFF\xFF\xFF\xFF\0\0\0\0\0\0"s,
+          "4294967295.004 "s + kUdid + " 127.0.0.1 HD 65535 4294967295");
+}
+
+TEST_F(Dashboard, NumbersItsMessagesAndNamesTheirSenders) {
+  auto backend = make(profile());
+  backend->setSelfVersion("263.1");
+  const char* const codes[] = {"QX", "WB", "JYP", "KF", "UZ", "HD", "EP", "YW", "BQ", "FX", "DJ", "OZ", "-"};
+  for (int i = 1; i < 0x1234; ++i) {
+    backend->setCompType(i % 13);
+    const auto line = backend->sendMessage(std::nullopt, kWhen, 0, 0, 0).value();
+    ASSERT_NE(line.find(" 127.0.0.1 "s + codes[i % 13] + "  1286 "), std::string::npos) << line;
+  }
+  _queues.queue->run();
+  _server.take();
+  const auto datagram = datagramOf(*backend, std::nullopt);
+  EXPECT_EQ(datagram.substr(60, 2), "\x12\x34");
+  EXPECT_EQ(datagram[0], 7);
+}
+
 TEST_F(Dashboard, TellsDeliveryAndOriginInItsFlags) {
+  const Dictionary reliable{{"reliable", 500}};
   const struct {
-    std::shared_ptr<VeskReportingBackend> backend;
+    std::optional<Dictionary> profile;
+    int bindError;
     char flags;
   } cases[] = {
-      {make(profile()), 0},
-      {make(profile(Dictionary{{"reliable", 500}})), 1},
-      {stamped(DashboardBackend::create("dashboard", std::string("127.0.0.1"), _server.endpoint().port,
-                                        Text("Phone"), _services)),
-       3},
+      {profile(), 0, 0},    {profile(reliable), 0, 1},     {profile(reliable), EADDRINUSE, 0},
+      {std::nullopt, 0, 3}, {std::nullopt, EADDRINUSE, 2},
   };
   for (const auto& test : cases) {
-    ASSERT_TRUE(test.backend);
-    const auto datagram = datagramOf(*test.backend, std::nullopt);
-    EXPECT_EQ(datagram.size(), 64u);
-    EXPECT_EQ(datagram.back(), test.flags);
-    EXPECT_EQ(static_cast<unsigned char>(datagram[15]), 0xFF - 64);
+    SocketFaults::bindError = test.bindError;
+    auto backend = test.profile
+                       ? make(test.profile)
+                       : stamped(DashboardBackend::create("dashboard", std::string("127.0.0.1"),
+                                                          _server.endpoint().port, Text("Phone"), _services));
+    SocketFaults::bindError = 0;
+    ASSERT_TRUE(backend);
+    _queues.queue->run();
+    EXPECT_EQ(datagramOf(*backend, std::nullopt).substr(62), (std::string{'\0', test.flags}));
+    EXPECT_EQ(backend->displayURL(), std::nullopt);
+    _queues.queue->advance(std::chrono::milliseconds(999));
+    EXPECT_EQ(_server.take().size(), 0u);
+    _queues.queue->advance(std::chrono::milliseconds(1));
+    EXPECT_EQ(_server.take().size(), test.flags % 2 == 1 ? 1u : 0u) << "sent again at the second tick";
+    backend.reset();
+    _queues.queue->advance(std::chrono::seconds(20));
+    _server.take();
   }
-  // The profile's other entries.
   EXPECT_EQ(make(profile(Dictionary{{"display_url", "http://d"}}))->displayURL(), "http://d");
+}
+
+TEST_F(Dashboard, FindsItsServerByAnyNumber) {
+  const int port = _server.endpoint().port;
+  const std::string text = std::to_string(port);
+  for (const Value& value : {Value(port), Value(static_cast<std::uint64_t>(port)), Value(port + 0.75),
+                             Value(port + 65536), Value(port - 65536), Value(text), Value("+" + text),
+                             Value(" " + text + "th"), Value(std::to_string(port + 3 * 65536))}) {
+    SCOPED_TRACE(describe(value));
+    auto backend = make(Dictionary{{"ip", "127.0.0.1"}, {"port", value}});
+    ASSERT_TRUE(backend);
+    EXPECT_EQ(datagramOf(*backend, std::nullopt).size(), 64u);
+  }
 }
 
 TEST_F(Dashboard, WritesPayloadsShortestValueFirst) {
   auto backend = make(profile());
   const std::string big(2000, 'x');
   const struct {
-    Dictionary payload;
+    std::optional<Dictionary> payload;
     std::string text;
   } cases[] = {
-      {{}, ""},
-      {{{"list", List{}}, {"none", Value()}, {"date", Date{1}}}, " list=null none=null date=null"},
-      {{{"t", true}, {"i", -12}, {"u", UINT64_MAX}, {"d", 0.25}}, " t=1 i=-12 d=0.25 u=18446744073709551615"},
-      {{{"empty", ""}, {"lines", "\n\n"}}, " empty=empty lines=empty"},
-      {{{"x", "a=b"}, {"y", "\\=\n\\\\"}}, " x=a\\=b y=\\\\\\=\\\\\\\\"},
-      {{{"k=1 2", "v"}}, " k=1 2=v"},
-      // Two UTF-16 units, though one character; and one unit, though three bytes.
-      {{{"party", "🎉"}, {"arrow", "→"}, {"a", "abc"}}, " arrow=→ party=🎉 a=abc"},
-      {{{"big", big}, {"more", big}}, " big=" + big.substr(0, 1018)},
-      {{{"k", std::string(1018, 'x')}, {"next", big}}, " k=" + std::string(1018, 'x') + " n"},
+      {std::nullopt, ""},
+      {Dictionary{}, ""},
+      {Dictionary{{"list", List{"a"}}, {"none", Value()}, {"date", Date{1}}, {"bytes", Bytes("b")}},
+       " list=null none=null date=null bytes=null"},
+      {Dictionary{{"dictionary", Dictionary{{"a", 1}}}}, " dictionary=null"},
+      {Dictionary{{"t", true}, {"f", false}, {"i", -12}, {"u", UINT64_MAX}, {"d", 0.25}, {"b", 1e20}},
+       " t=1 f=0 i=-12 d=0.25 b=1e+20 u=18446744073709551615"},
+      {Dictionary{{"empty", ""}, {"line", "\n"}, {"lines", "\n\n"}}, " empty=empty line=empty lines=empty"},
+      {Dictionary{{"x", "a=b"}, {"y", "\\=\n\\\\"}}, " x=a\\=b y=\\\\\\=\\\\\\\\"},
+      {Dictionary{{"x", "==\r\t a"}, {"y", "1\n2\n"}}, " y=12 x=\\=\\=\r\t a"},
+      {Dictionary{{"k=1\n\\ 2", "v"}, {"", "w"}}, " k=1\n\\ 2=v =w"},
+      // Two UTF-16 units, though one character; and one unit, though two and three bytes.
+      {Dictionary{{"party", "🎉"}, {"arrow", "→"}, {"u", "üü"}, {"a", "abc"}}, " arrow=→ party=🎉 u=üü a=abc"},
+      // Their lengths before they are written count, and "null" has one, too.
+      {Dictionary{{"none", Value()}, {"e", ""}, {"x", "===="}, {"abc", "abc"}},
+       " e=empty abc=abc none=null x=\\=\\=\\=\\="},
+      {Dictionary{{"big", big}, {"more", big}}, " big=" + big.substr(0, 1018)},
+      {Dictionary{{"k", std::string(1018, 'x')}, {"next", big}}, " k=" + std::string(1018, 'x') + " n"},
+      {Dictionary{{"k", std::string(1020, 'x')}, {"next", big}}, " k=" + std::string(1020, 'x')},
+      {Dictionary{{"k", std::string(1021, 'x')}}, " k=" + std::string(1020, 'x')},
   };
   for (const auto& test : cases) {
     const auto datagram = datagramOf(*backend, test.payload);
     EXPECT_EQ(datagram.substr(64), test.text);
     EXPECT_EQ(decodeDashboardHeader(datagram)->length, 64 + test.text.size());
+  }
+  EXPECT_EQ(descriptionForObject(std::nullopt), "null");
+}
+
+TEST_F(Dashboard, ReadsWholeDatagramsOnly) {
+  auto backend = make(profile(Dictionary{{"reliable", 500}}));
+  const auto datagram = datagramOf(*backend, Dictionary{{"a", "y"}});
+  const auto header = decodeDashboardHeader(datagram);
+  ASSERT_TRUE(header);
+  EXPECT_TRUE(header->isReliable);
+  EXPECT_FALSE(header->isWithoutProfile);
+  EXPECT_EQ(header->deviceIDText(), kUdid);
+  auto otherFormat = datagram;
+  otherFormat[2] = 2;
+  for (const auto& bytes :
+       {std::string(), datagram.substr(0, 63), datagram.substr(0, 64), datagram + "x", otherFormat}) {
+    EXPECT_EQ(decodeDashboardHeader(bytes), std::nullopt);
+    EXPECT_EQ(writeLocalLog(bytes), std::nullopt);
   }
 }
 
@@ -129,48 +221,118 @@ TEST_F(Dashboard, ACutCharacterCostsTheLineOnly) {
   EXPECT_EQ(datagrams[0].back(), '\xc3');
 }
 
-TEST_F(Dashboard, LinesStandInForWhatIsMissing) {
-  auto backend = make(profile());
-  backend->setCompType(12);
-  backend->setUdid("short");
-  const auto line = backend->sendMessage(std::nullopt, {0, 0}, 0, 0, 0);
-  EXPECT_EQ(line, "0.000 short 127.0.0.1 -  1286 16909060     1     0     0 ");
-}
-
-struct ProfileCase {
-  const char* description;
-  std::optional<Dictionary> profile;
-  const char* line;
-};
-
-TEST_F(Dashboard, RefusesProfilesThatNameNoServer) {
-  const char* const noIP = "DashboardBackend(initWithName): can't resolve server IP";
-  const char* const noPort = "DashboardBackend(initWithName): can't resolve server port";
-  const char* const unreachable = "DashboardBackend(initWithName): socket connect() failed.";
-  const ProfileCase cases[] = {
-      {"no profile", std::nullopt, "DashboardBackend(initWithName): initWitName with all null params."},
-      {"no ip", Dictionary{{"port", 1}}, noIP},
-      {"ip of a wrong type", Dictionary{{"ip", 1}, {"port", 1}}, noIP},
-      {"ip too long", Dictionary{{"ip", "255.255.255.2555"}, {"port", 1}}, unreachable},
-      {"ip is a name", Dictionary{{"ip", "localhost"}, {"port", 1}}, unreachable},
-      {"no port", Dictionary{{"ip", "127.0.0.1"}}, noPort},
-      {"a server that nobody may send to", Dictionary{{"ip", "255.255.255.255"}, {"port", 1}}, unreachable},
-      {"reliable, to the same", Dictionary{{"ip", "255.255.255.255"}, {"port", 1}, {"reliable", 1}},
-       unreachable},
+TEST_F(Dashboard, SaysWhatItDoesInTheSystemLog) {
+  using Lines = std::vector<std::pair<int, std::string>>;
+  const std::string start = "DashboardBackend(initWithName): ",
+                    type = "dashboard: The storebag's value for '",
+                    absent = "' has the wrong type and counts as absent: ",
+                    upload = "DashboardBackend(uploadLogData): ";
+  const std::pair<int, std::string> noIP{3, start + "can't resolve server IP"},
+      noPort{3, start + "can't resolve server port"}, unreachable{3, start + "socket connect() failed."},
+      noTimer{3, start + "can't create timer source."};
+  auto refuses = [this](const std::optional<Dictionary>& profile) {
+    return [this, profile] {
+      const long before = openDescriptors();
+      EXPECT_FALSE(make(profile));
+      _queues.queue->run();
+      EXPECT_EQ(openDescriptors(), before);
+      EXPECT_EQ(_queues.queue->waiting() + _queues.queue->readers(), 0u);
+    };
   };
-  const long before = openDescriptors();
+  auto takes = [this](const Dictionary& more) {
+    return [this, more] {
+      const long before = openDescriptors();
+      EXPECT_TRUE(make(profile(more)));
+      _queues.queue->run();
+      EXPECT_EQ(openDescriptors(), before) << "it goes without cleanup, too";
+    };
+  };
+  auto with = [](auto& fault, auto value, auto act) {
+    return [&fault, value, act] {
+      const auto usual = std::exchange(fault, value);
+      act();
+      fault = usual;
+    };
+  };
+  auto at = [](const char* ip, Value port, Value reliable) {
+    return Dictionary{{"ip", ip}, {"port", port}, {"reliable", reliable}};
+  };
+  const Dictionary reliable{{"reliable", 500}};
+  const struct {
+    const char* description;
+    std::function<void()> act;
+    Lines lines;
+  } cases[] = {
+      {"no profile", refuses(std::nullopt), {{3, start + "initWitName with all null params."}}},
+      {"nothing in it", refuses(Dictionary{}), {noIP}},
+      {"no ip", refuses(Dictionary{{"port", 1}}), {noIP}},
+      {"no port", refuses(Dictionary{{"ip", "127.0.0.1"}}), {noPort}},
+      {"ip of a wrong type", refuses(Dictionary{{"ip", 1}}), {{4, type + "ip" + absent + "1"}, noIP}},
+      {"port of a wrong type",
+       refuses(at("127.0.0.1", List{}, 1)),
+       {{4, type + "port" + absent + "[]"}, noPort}},
+      {"reliable of a wrong type",
+       takes(Dictionary{{"reliable", List{}}}),
+       {{4, type + "reliable" + absent + "[]"}}},
+      {"ip is a name", refuses(at("localhost", 1, 1)), {unreachable}},
+      {"ip with a NUL",
+       refuses(Dictionary{{"ip", Text(std::string_view("127.0.0.1\0", 10))}, {"port", 1}}),
+       {unreachable}},
+      {"ip is for all", refuses(at("255.255.255.255", 1, 1)), {unreachable}},
+      {"reliable is 0",
+       takes(Dictionary{{"reliable", 0}}),
+       {{4, start + "'reliable' can't be 0 ms, using 500 ms"}}},
+      {"reliable longer than anything lives", takes(Dictionary{{"reliable", INT64_MAX}}), {}},
+      {"no socket",
+       with(SocketFaults::socketError, EMFILE, refuses(profile())),
+       {{3, start + "socket() failed (24)"}}},
+      {"no port of its own",
+       with(SocketFaults::bindError, EADDRINUSE, takes(reliable)),
+       {{3, "DashboardBackend(useReliableUDP): can't bind socket, 98"}}},
+      {"no read source",
+       with(_queues.queue->refusesReadSources, true, takes(reliable)),
+       {{3, "DashboardBackend(useReliableUDP): can't create read source"}}},
+      {"no queue", with(_queues.refusesQueues, true, refuses(profile(reliable))), {noTimer}},
+      {"no timer",
+       with(_queues.queue->refusesWork, true, [&] { EXPECT_FALSE(make(profile(reliable))); }),
+       {noTimer}},
+      {"no buffer",
+       [&] {
+         auto backend = make(profile());
+         ScarceMemory scarce(1);
+         EXPECT_EQ(backend->sendMessage(std::nullopt, kWhen, 0, 0, 0), std::nullopt);
+       },
+       {{3, "DashboardBackend(sendMessage): can't malloc."}}},
+      {"cleanup, answered late, twice",
+       [&] {
+         auto backend = make(profile(reliable));
+         _queues.queue->run();
+         datagramOf(*backend, std::nullopt);
+         backend->cleanup();
+         backend->cleanup();
+         _queues.queue->advance(std::chrono::milliseconds(1500));
+         _server.acknowledge(1);
+         _queues.queue->advance(std::chrono::milliseconds(500));
+         backend->cleanup();
+         _queues.queue->advance(std::chrono::milliseconds(30'000));
+         _server.take();
+       },
+       {{7, "DashboardBackend(myPeriodicTask): scheduled last resort clean-up in 9500 ms."},
+        {7, "DashboardBackend(myPeriodicTask): clean up at myPeriodicTask."}}},
+      {"no post_url",
+       [&] { EXPECT_FALSE(make(profile())->uploadLogData(List{1})); },
+       {{3, upload + "Post URL for log data array is nil"}}},
+  };
   for (const auto& test : cases) {
     SCOPED_TRACE(test.description);
     _log.clear();
-    EXPECT_FALSE(make(test.profile));
-    EXPECT_EQ(_log.count(3, test.line), 1);
-    EXPECT_EQ(_log.countContaining(3, ""), 1) << "one line of level 3";
-    _queues.queue->run();
-    EXPECT_EQ(openDescriptors(), before);
-    EXPECT_EQ(_queues.queue->waiting() + _queues.queue->readers(), 0u);
+    test.act();
+    EXPECT_EQ(_log.lines(), test.lines);
   }
+  _log.clear();
   EXPECT_FALSE(
       DashboardBackend::create("dashboard", std::optional<std::string>(), 1, Text("Phone"), _services));
+  EXPECT_EQ(_log.lines(), Lines{});
 }
 
 TEST_F(Dashboard, TakesTheTickFromItsProfile) {
@@ -195,48 +357,38 @@ TEST_F(Dashboard, TakesTheTickFromItsProfile) {
     _queues.queue->advance(std::chrono::hours(48));
     _server.take();
   }
-  auto backend = make(profile(Dictionary{{"reliable", INT64_MAX}}));
-  _queues.queue->run();
-  datagramOf(*backend, std::nullopt);
-  _queues.queue->advance(std::chrono::years(50));
-  EXPECT_TRUE(_server.take().empty()) << "as long as the clock can hold";
 }
 
-TEST_F(Dashboard, GoesWithItsSessionEvenWithoutCleanup) {
-  const long before = openDescriptors();
-  for (bool hasMemory : {true, false}) {
-    auto backend = make(profile(Dictionary{{"reliable", 10}}));
-    _queues.queue->refusesWork = !hasMemory;
-    backend.reset();
-    _queues.queue->refusesWork = false;
-    _queues.queue->run();
-    EXPECT_EQ(openDescriptors(), before);
-  }
-}
-
-TEST_F(Dashboard, AnnouncesWhereLogDataWent) {
+TEST_F(Dashboard, UploadsLogDataAndAnnouncesWhereItWent) {
+  const std::string upload = "DashboardBackend(uploadLogData): ";
+  const std::string failed = upload + "Error uploading log data array (";
   const List logData{Dictionary{{"when", Date{12.5}}, {"text", "ä"}}, Bytes("\x01")};
   const struct {
     unsigned status;
-    const char* answer;
+    std::string answer;
     const char* text;  // of the announcement; null: none
-    const char* problem;
+    std::string line;
   } cases[] = {
-      {200, "http://d/7?a=b", " LogDataUploadLocation=http://d/7?a\\=b", nullptr},
-      {404, "not here", " LogDataUploadLocation=not here", nullptr},
-      {200, "", nullptr, "(null)"},
-      {200, "\xff", nullptr, "the answer is not UTF-8"},
+      {200, "http://d/7?a=b", " LogDataUploadLocation=http://d/7?a\\=b",
+       "Log data uploaded to http://d/7?a=b"},
+      {404, "not here", " LogDataUploadLocation=not here", "Log data uploaded to not here"},
+      {503, "ü", " LogDataUploadLocation=ü", "Log data uploaded to ü"},
+      {200, "", nullptr, "Error uploading log data array ((null))"},
+      {200, "\xFF", nullptr, "Error uploading log data array (the answer is not UTF-8)"},
+      {200, "a\0b"s, nullptr, "Error uploading log data array (the answer is not UTF-8)"},
   };
-  for (const auto& test : cases) {
-    SCOPED_TRACE(test.answer);
-    RecordingServer server([&](const HTTPReceived&, std::size_t) {
-      HTTPAnswer answer;
-      answer.status = test.status;
-      answer.body = test.answer;
-      return answer;
-    });
-    auto backend = make(profile(Dictionary{{"post_url", server.url("/log?x")}}));
+  RecordingServer server;
+  auto backend = make(profile(Dictionary{{"post_url", server.url("/log?x")}}));
+  _harness.clock.set(1'234.5);
+  for (std::uint16_t event = 0; const auto& test : cases) {
+    SCOPED_TRACE(test.line);
+    HTTPAnswer answer;
+    answer.status = test.status;
+    answer.body = test.answer;
+    server.answerWith(answer);
+    _log.clear();
     EXPECT_EQ(backend->uploadLogData(logData), test.text != nullptr);
+    EXPECT_EQ(_log.lines(), std::vector{std::pair(test.text ? 7 : 3, upload + test.line)});
     _queues.queue->run();
     const auto datagrams = _server.take();
     ASSERT_EQ(datagrams.size(), test.text ? 1u : 0u);
@@ -245,42 +397,49 @@ TEST_F(Dashboard, AnnouncesWhereLogDataWent) {
       const auto header = decodeDashboardHeader(datagrams[0]);
       EXPECT_EQ(header->method, 0);
       EXPECT_EQ(header->respCode, 2);
-      EXPECT_EQ(
-          _log.count(7, std::string("DashboardBackend(uploadLogData): Log data uploaded to ") + test.answer),
-          1);
-    } else {
-      EXPECT_EQ(
-          _log.count(3, std::string("DashboardBackend(uploadLogData): Error uploading log data array (") +
-                            test.problem + ")"),
-          1);
+      EXPECT_EQ(header->eventID, ++event);
+      EXPECT_EQ(header->seconds, 1'234u);
+      EXPECT_EQ(header->milliseconds(), 500u);
     }
-    const auto request = server.requests().at(0);
+    const auto request = server.requests().back();
     EXPECT_EQ(request.method, "POST");
     EXPECT_EQ(request.target, "/log?x");
     EXPECT_EQ(request.header("Content-Type"), "application/octet-stream");
     EXPECT_EQ(unarchiveValue(request.body).value, Value(logData));
   }
-}
+  EXPECT_EQ(server.count(), std::size(cases)) << "nothing is sent again";
 
-TEST_F(Dashboard, RefusesLogDataThatCanNotGo) {
-  EXPECT_FALSE(make(profile())->uploadLogData(List{1}));
-  EXPECT_EQ(_log.count(3, "DashboardBackend(uploadLogData): Post URL for log data array is nil"), 1);
-  auto backend = make(profile(Dictionary{{"post_url", "http://127.0.0.1:1/"}}));
+  // What can't go, and what may not go.
+  auto refused = [&](const std::string& line) {
+    EXPECT_EQ(_log.lines(), (std::vector{std::pair(3, line)}));
+    _log.clear();
+  };
+  _log.clear();
   EXPECT_FALSE(backend->uploadLogData(List{"\xff"}));
-  EXPECT_EQ(_log.count(3, "DashboardBackend(uploadLogData): Failed to serialize log data array for upload"),
-            1);
+  refused(upload + "Failed to serialize log data array for upload");
+  EXPECT_FALSE(make(profile(Dictionary{{"post_url", "ftp://127.0.0.1/"}}))->uploadLogData(List{1}));
+  refused(failed + "not an http or https URL)");
+  server.answerWith(HTTPAnswer::text(200, "kept"));
+  const List large{std::string(UploadGate::kSmallLogData, 'x')};
+  _services.uploads = std::make_shared<UploadGate>(UploadGate::Limits{
+      .uploads = 1, .uploadsOfUser = 1, .smallUploads = 2, .smallUploadsOfUser = 1, .patience = {}});
+  for (const bool isSmall : {false, true}) {
+    auto limited = make(profile(Dictionary{{"post_url", server.url("/log")}}));
+    limited->setUser(7);
+    auto another = isSmall ? _services.uploads->enterWithLogData(7, 0) : _services.uploads->enter(7, 0);
+    EXPECT_TRUE(limited->uploadLogData(isSmall ? large : List{1})) << "each kind has places of its own";
+    _log.clear();
+    EXPECT_FALSE(limited->uploadLogData(isSmall ? List{1} : large));
+    refused(failed + "too many uploads are under way)");
+    limited->setUser(8);
+    EXPECT_EQ(limited->uploadLogData(isSmall ? List{1} : large), isSmall) << "another user's place";
+    another.reset();
+    EXPECT_TRUE(limited->uploadLogData(isSmall ? List{1} : large));
+    _log.clear();
+  }
+  _services.http.stopAllButPosts();
   EXPECT_FALSE(backend->uploadLogData(List{1}));
-  EXPECT_EQ(_log.countContaining(3, "DashboardBackend(uploadLogData): Error uploading log data array ("), 1);
-  EXPECT_FALSE(make(profile(Dictionary{{"post_url", "nowhere"}}))->uploadLogData(List{1}));
-  _services.uploads =
-      std::make_shared<UploadGate>(UploadGate::Limits{.uploads = 0, .bytes = 0, .patience = {}});
-  EXPECT_FALSE(backend->uploadLogData(List{1}));
-  EXPECT_EQ(_log.count(3,
-                       "DashboardBackend(uploadLogData): Error uploading log data array "
-                       "(too many uploads are under way)"),
-            1);
-  _queues.queue->run();
-  EXPECT_TRUE(_server.take().empty());
+  refused(failed + "the daemon stops)");
 }
 
 }  // namespace

@@ -1,13 +1,6 @@
 // Retransmission, acknowledgement, bounds and shutdown of datagrams, tick by tick over real sockets.
-#include <arpa/inet.h>
 #include <gtest/gtest.h>
-#include <net/if.h>
-#include <sched.h>
-#include <sys/ioctl.h>
-#include <sys/socket.h>
-#include <sys/wait.h>
 
-#include <cstring>
 #include <numeric>
 
 #include "backends/DashboardDelivery.h"
@@ -15,6 +8,7 @@
 #include "tests/support/CapturedLog.h"
 #include "tests/support/DashboardServer.h"
 #include "tests/support/SimulatedQueues.h"
+#include "tests/support/SocketFaults.h"
 
 namespace vesk::test {
 namespace {
@@ -78,17 +72,50 @@ class Delivery : public testing::Test {
   CapturedLog _log;
 };
 
-TEST_F(Delivery, SendsAgainFourTimesAndThenGivesUp) {
-  for (int tick : {500, 1, 40}) {
-    SCOPED_TRACE(tick);
-    start(true, milliseconds(tick));
+TEST_F(Delivery, SendsUntilItArrivesOrIsGivenUp) {
+  constexpr int kShort = SocketFaults::kShort, kNoRoute = ENETUNREACH;
+  const struct {
+    const char* description;
+    bool reliable;
+    std::deque<int> sends;  // what becomes of the first ones
+    std::vector<int> arrivals;
+    int lostAt;  // -1: never
+  } cases[] = {
+      {"nothing fails", true, {}, {0, 1000, 2500, 5000, 9500}, 10'000},
+      {"first send", true, {EPERM}, {500, 1500, 3000, 5500, 10'000}, 10'500},
+      {"short first send", true, {kShort}, {500, 1500, 3000, 5500, 10'000}, 10'500},
+      {"two sends", true, {kShort, ECONNREFUSED}, {1000, 2000, 3500, 6000, 10'500}, 11'000},
+      {"first again", true, {0, EPERM}, {0, 1500, 3000, 5500, 10'000}, 10'500},
+      {"short again", true, {0, kShort, EAGAIN}, {0, 2000, 3500, 6000, 10'500}, 11'000},
+      {"last again", true, {0, 0, 0, 0, EPERM, kShort}, {0, 1000, 2500, 5000, 10'500}, 11'000},
+      {"no room", true, {EAGAIN, EAGAIN}, {20, 1000, 2500, 5000, 9500}, 10'000},
+      {"no way, and another", true, {kNoRoute}, {0, 1000, 2500, 5000, 9500}, 10'000},
+      {"unreliable: nothing fails", false, {}, {0}, -1},
+      {"unreliable: first send", false, {EPERM}, {500}, -1},
+      {"unreliable: short sends", false, {kShort, EPERM, kShort}, {1500}, -1},
+      {"unreliable: no room", false, {EAGAIN}, {10}, -1},
+      {"unreliable: no room later", false, {EPERM, EAGAIN}, {1000}, -1},
+      {"unreliable: no way", false, {EADDRNOTAVAIL, EINVAL, kNoRoute, EDESTADDRREQ}, {1000}, -1},
+      {"unreliable: no other way", false, {kNoRoute, kNoRoute}, {500}, -1},
+  };
+  for (const auto& test : cases) {
+    SCOPED_TRACE(test.description);
+    start(test.reliable);
     const auto lostBefore = lost(DropReason::Unacknowledged);
+    SocketFaults::sends = test.sends;
     send(7);
-    EXPECT_EQ(arrivalsDuring(19 * tick, tick),
-              (Arrivals{{0, 7}, {2 * tick, 7}, {5 * tick, 7}, {10 * tick, 7}, {19 * tick, 7}}));
-    EXPECT_EQ(lost(DropReason::Unacknowledged), lostBefore);
-    EXPECT_EQ(arrivalsDuring(100 * tick, tick), Arrivals{});
-    EXPECT_EQ(lost(DropReason::Unacknowledged), lostBefore + 1);
+    std::vector<int> arrivals;
+    int lostAt = -1;
+    for (int at = 0; at <= 25'000; at += 10) {
+      if (at > 0) _queue->advance(milliseconds(10));
+      arrivals.insert(arrivals.end(), _server.take().size(), at);
+      if (lostAt < 0 && lost(DropReason::Unacknowledged) > lostBefore) lostAt = at;
+    }
+    EXPECT_EQ(arrivals, test.arrivals);
+    EXPECT_EQ(lostAt, test.lostAt);
+    EXPECT_TRUE(SocketFaults::sends.empty());
+    EXPECT_EQ(_queue->waiting(), 0u);
+    EXPECT_EQ(lost(DropReason::OverBound), 0u);
   }
 }
 
@@ -110,26 +137,54 @@ TEST_F(Delivery, AnAcknowledgedDatagramIsNeverSentAgain) {
   EXPECT_EQ(arrivalsDuring(2500), (Arrivals{{2500, 1}}));
 }
 
-TEST_F(Delivery, IgnoresWhatAcknowledgesNothing) {
-  start();
-  send(0);
-  _server.take();
-  _server.acknowledge(9);
-  _server.acknowledge(0, 61);  // a byte too short
-  _server.send("");
-  EXPECT_EQ(arrivalsDuring(1000), (Arrivals{{1000, 0}}));
-  _server.send(std::string(2000, '\0'));  // longer than any datagram, and carries 0
-  EXPECT_EQ(arrivalsDuring(9000), Arrivals{});
-}
-
-TEST_F(Delivery, OneAcknowledgementTakesOneOfTwoDatagramsWithItsEventID) {
-  start();
-  send(5);
-  _queue->advance(milliseconds(500));
-  send(5);
-  _server.take();
-  _server.acknowledge(5);
-  EXPECT_EQ(arrivalsDuring(1000), (Arrivals{{1000, 5}})) << "the older one is gone, which was due after 500";
+TEST_F(Delivery, AnAcknowledgementTakesTheFirstDatagramWithItsEventID) {
+  auto carrying = [](std::uint16_t id, std::size_t size) {
+    std::string bytes(2000, '\x7F');
+    bytes[60] = static_cast<char>(id >> 8);
+    bytes[61] = static_cast<char>(id);
+    return bytes.substr(0, size);
+  };
+  const std::uint16_t ids[] = {5, 0x1234, 5, 0x127F, 0x1200};
+  const struct {
+    const char* description;
+    std::vector<std::string> answers;
+    std::vector<int> others;  // which are sent again
+  } cases[] = {
+      {"unknown", {carrying(9, 64)}, {0, 1, 2, 3, 4}},
+      {"little-endian", {carrying(0x3412, 64)}, {0, 1, 2, 3, 4}},
+      {"nothing in it", {"", "x"}, {0, 1, 2, 3, 4}},
+      // The second finds what the first left in the buffer; with it, it would be 0x1234.
+      {"a byte too short", {carrying(0xFF34, 1088), carrying(0x1200, 61)}, {0, 1, 2, 3, 4}},
+      {"just long enough", {carrying(0x1234, 62)}, {0, 2, 3, 4}},
+      {"longer than any datagram", {carrying(0x1200, 2000)}, {0, 1, 2, 3}},
+      {"one of two", {carrying(5, 64)}, {1, 2, 3, 4}},
+      {"both", {carrying(5, 64), carrying(5, 64)}, {1, 3, 4}},
+      {"all, in another order",
+       {carrying(0x127F, 62), carrying(5, 62), carrying(0x1200, 62), carrying(0x1234, 62), carrying(5, 62)},
+       {}},
+  };
+  for (const auto& test : cases) {
+    SCOPED_TRACE(test.description);
+    start();
+    for (std::size_t i = 0; i < std::size(ids); ++i) {
+      auto buffer = std::make_unique<DashboardDelivery::Buffer>();
+      (*buffer)[0] = static_cast<char>(i);
+      _delivery->send(std::move(buffer), kDashboardHeaderSize, ids[i]);
+    }
+    _queue->run();
+    EXPECT_EQ(_server.take().size(), std::size(ids));
+    for (const auto& answer : test.answers) _server.send(answer);
+    _queue->advance(milliseconds(1000));
+    std::vector<int> others;
+    for (const auto& datagram : _server.take()) others.push_back(datagram[0]);
+    EXPECT_EQ(others, test.others);
+    _delivery->cleanup();
+    _queue->advance(milliseconds(30'000));
+    _server.take();
+  }
+  for (std::size_t size : {0u, 1u, 60u, 61u}) {  // of more that can be read
+    EXPECT_EQ(eventIDOfAcknowledgement(std::string_view(carrying(5, 64)).substr(0, size)), std::nullopt);
+  }
 }
 
 TEST_F(Delivery, TheOldestOfFiftyOneGoes) {
@@ -141,31 +196,6 @@ TEST_F(Delivery, TheOldestOfFiftyOneGoes) {
   std::vector<int> others(50);
   std::iota(others.begin(), others.end(), 2);
   EXPECT_EQ(_server.takeEventIDs(), others);
-}
-
-TEST_F(Delivery, WithoutReliabilityOnlyWhatCouldNotBeSentWaits) {
-  start(false);
-  send(1);
-  EXPECT_EQ(arrivalsDuring(20'000), (Arrivals{{0, 1}}));
-  EXPECT_EQ(_queue->readers(), 0u);
-  _server.stop();
-  send(2);  // goes out, and its refusal comes back
-  send(3);  // is told of it
-  EXPECT_EQ(_queue->waiting(), 1u) << "3 waits for the next tick";
-  _queue->advance(milliseconds(500));  // goes out
-  _queue->advance(milliseconds(500));
-  EXPECT_EQ(_queue->waiting(), 0u);
-  EXPECT_EQ(lost(DropReason::Unacknowledged), 0u);
-}
-
-TEST_F(Delivery, AServerThatIsGoneCostsFiftyDatagramsAtMost) {
-  start();
-  _server.stop();
-  for (int i = 0; i < 1000; ++i) send(static_cast<std::uint16_t>(i));
-  EXPECT_EQ(lost(DropReason::OverBound), 950u);
-  _queue->advance(milliseconds(60'000));
-  EXPECT_EQ(lost(DropReason::Unacknowledged), 50u);
-  EXPECT_EQ(_queue->waiting(), 0u);
 }
 
 TEST_F(Delivery, WhatComesFasterThanItGoesOutIsBounded) {
@@ -181,51 +211,30 @@ TEST_F(Delivery, ABurstWaitsForRoomInTheSystem) {
   for (const bool linkMoves : {true, false}) {
     const long before = openDescriptors();
     start(false);
-    {
-      // Stands in for a link that takes a few datagrams at a time.
-      int ends[2];
-      ASSERT_EQ(::socketpair(AF_UNIX, SOCK_DGRAM | SOCK_NONBLOCK, 0, ends), 0);
-      const FileDescriptor link(ends[0]), farEnd(ends[1]);
-      const int smallest = 1;
-      ASSERT_EQ(::setsockopt(link.get(), SOL_SOCKET, SO_SNDBUF, &smallest, sizeof smallest), 0);
-      ASSERT_EQ(::dup2(link.get(), _descriptor), _descriptor);
-      for (std::uint16_t id = 1; id <= 200; ++id) send(id);
-      for (std::uint16_t id = 201; id <= 300; ++id) handOver(id);
-      cleanup();
-      _delivery.reset();
-      std::vector<int> arrived, all(300);
-      std::iota(all.begin(), all.end(), 1);
-      for (int i = 0; linkMoves && i < 300; ++i) {
-        char datagram[kDashboardHeaderSize];
-        while (::recv(farEnd.get(), datagram, sizeof datagram, 0) > 0)
-          arrived.push_back(eventIDOfAcknowledgement({datagram, sizeof datagram}).value_or(0));
-        _queue->advance(DashboardDelivery::kRoomWait);
-      }
-      EXPECT_EQ(arrived == all, linkMoves) << arrived.size();
-      EXPECT_EQ(lost(DropReason::Unacknowledged), 0u);
-      _queue->advance(milliseconds(10'500));
-    }
+    for (int i = 0; i < 3000; ++i) SocketFaults::sends.push_back(linkMoves && i % 4 < 3 ? 0 : EAGAIN);
+    for (std::uint16_t id = 1; id <= 200; ++id) send(id);
+    for (std::uint16_t id = 201; id <= 300; ++id) handOver(id);
+    cleanup();
+    _delivery.reset();
+    std::vector<int> arrived, all(300);
+    std::iota(all.begin(), all.end(), 1);
+    for (const auto& [at, id] : arrivalsDuring(3000, 10)) arrived.push_back(id);
+    EXPECT_EQ(arrived, linkMoves ? all : std::vector<int>{});
+    EXPECT_EQ(lost(DropReason::Unacknowledged), 0u);
+    _queue->advance(milliseconds(10'500));
     EXPECT_EQ(openDescriptors(), before);
-    EXPECT_EQ(lost(DropReason::Unacknowledged) > 0, !linkMoves) << "the last resort gives them up";
+    EXPECT_EQ(lost(DropReason::Unacknowledged), linkMoves ? 0u : 300u) << "the last resort gives them up";
     EXPECT_EQ(lost(DropReason::OverBound), 0u);
     EXPECT_EQ(_queue->waiting(), 0u);
+    SocketFaults::sends.clear();
   }
 }
 
-TEST_F(Delivery, WithoutMemoryOnlyThatDatagramIsLost) {
-  start();
-  _queue->refusesWork = true;
-  send(1);
-  EXPECT_EQ(lost(DropReason::OverBound), 1u);
-  _queue->refusesWork = false;
-  send(2);
-  EXPECT_EQ(arrivalsDuring(0), (Arrivals{{0, 2}}));
-}
-
 TEST_F(Delivery, CleanupGivesEverythingBackOnce) {
-  for (bool reliable : {true, false}) {
+  for (const int variant : {0, 1, 2}) {
     const long before = openDescriptors();
-    start(reliable);
+    _queue->refusesReadSources = variant == 2;  // reliable all the same
+    start(variant != 0);
     _queue->advance(milliseconds(700));
     cleanup();
     EXPECT_EQ(openDescriptors(), before);
@@ -286,80 +295,51 @@ TEST_F(Delivery, CleanupEndsNineAndAHalfSecondsAfterTheNextTick) {
   EXPECT_TRUE(_linger->try_acquire()) << "its place is free again";
 }
 
-/// Gives the loopback interface of this network a second address, in place of the one that it had.
-void setDeviceAddress(const char* address, const char* mask) {
+TEST(UDPSocketTest, FindsAnotherWayOrReceivesNothing) {
+  DashboardServer server;
   UDPSocket socket;
-  ASSERT_EQ(socket.open(), 0);
-  ifreq request{};
-  std::strcpy(request.ifr_name, "lo");
-  request.ifr_flags = IFF_UP;
-  ASSERT_EQ(::ioctl(socket.descriptor(), SIOCSIFFLAGS, &request), 0);
-  std::strcpy(request.ifr_name, "lo:1");
-  auto set = [&](unsigned long what, const char* text) {
-    sockaddr_in value{};
-    value.sin_family = AF_INET;
-    ::inet_pton(AF_INET, text, &value.sin_addr);
-    std::memcpy(&request.ifr_addr, &value, sizeof value);
-    ASSERT_EQ(::ioctl(socket.descriptor(), what, &request), 0);
-  };
-  set(SIOCSIFADDR, address);
-  set(SIOCSIFNETMASK, mask);
+  EXPECT_EQ(socket.reconnect(server.endpoint()), EBADF);
+  ASSERT_EQ(socket.open() + socket.bindToAnyPort(), 0);
+  EXPECT_EQ(socket.reconnect({0xFFFF'FFFF, 1}), EACCES);
+  EXPECT_EQ(socket.localEndpoint(), std::nullopt) << "a port at which anybody could acknowledge";
+  EXPECT_EQ(socket.send("x"), UDPSocket::Outcome::NoRoute);
+  EXPECT_EQ(socket.reconnect(server.endpoint()), 0);
+  EXPECT_EQ(socket.send("y"), UDPSocket::Outcome::Sent);
+  EXPECT_EQ(server.take(), std::vector<std::string>{"y"});
 }
 
-TEST_F(Delivery, GoesOnFromTheDevicesNewAddress) {
-  constexpr int kNoNetwork = 77;
-  const pid_t child = ::fork();
-  if (child != 0) {
-    int status = 0;
-    ASSERT_EQ(::waitpid(child, &status, 0), child);
-    if (WIFEXITED(status) && WEXITSTATUS(status) == kNoNetwork) GTEST_SKIP() << "no network of its own";
-    ASSERT_EQ(status, 0);
-    return;
-  }
-  if (::unshare(CLONE_NEWUSER | CLONE_NEWNET) != 0) ::_exit(kNoNetwork);
-  for (bool reliable : {false, true}) {
-    setDeviceAddress("192.0.2.2", "255.255.255.0");
-    _server = DashboardServer(0xC0000282);  // 192.0.2.130
-    start(reliable);
-    send(1);
-    setDeviceAddress("192.0.2.129", "255.255.255.128");
-    send(2);
-    EXPECT_EQ(_server.takeEventIDs(), (std::vector{1, 2}));
-    for (std::uint16_t id : {1, 2}) _server.acknowledge(id);  // to where it is now
-    setDeviceAddress("198.51.100.1", "255.255.255.0");        // from where no way leads to the server
-    send(3);
-    _queue->advance(milliseconds(5000));
-    sockaddr_in local{};
-    socklen_t size = sizeof local;
-    ASSERT_EQ(::getsockname(_descriptor, reinterpret_cast<sockaddr*>(&local), &size), 0);
-    EXPECT_EQ(local.sin_port, 0) << "where anybody could acknowledge what is pending";
-    setDeviceAddress("192.0.2.129", "255.255.255.128");
-    _queue->advance(milliseconds(500));
-    EXPECT_EQ(_server.takeEventIDs(), std::vector{3});
-  }
-  EXPECT_TRUE(_counters.snapshot().empty());
-  ::_exit(HasFailure() ? 1 : 0);
+/// In real time, towards `server`.
+std::shared_ptr<DashboardDelivery> reliableOn(TimedQueuePool& pool, const DashboardServer& server,
+                                              std::shared_ptr<DashboardLinger> linger, Counters& counters,
+                                              milliseconds tick) {
+  UDPSocket socket;
+  EXPECT_EQ(socket.open(), 0);
+  auto delivery = std::make_shared<DashboardDelivery>(std::move(socket), pool.makeQueue("test"),
+                                                      std::move(linger), counters, "dashboard");
+  delivery->useReliableUDP();
+  EXPECT_TRUE(delivery->connect(server.endpoint()));
+  EXPECT_TRUE(delivery->start(tick));
+  return delivery;
 }
 
-TEST_F(Delivery, GoesOnWithoutWhatItCanNotHave) {
+TEST(DeliveryOnThreads, SendsAgainUntilAnsweredInRealTime) {
   const long before = openDescriptors();
+  Counters counters;
+  DashboardServer server;
   {
-    UDPSocket bound;
-    ASSERT_EQ(bound.open() + bound.bindToAnyPort(), 0);
-    DashboardDelivery twiceBound(std::move(bound), _queue, _linger, _counters, "dashboard");
-    twiceBound.useReliableUDP();
-    EXPECT_EQ(_log.count(3, "DashboardBackend(useReliableUDP): can't bind socket, 22"), 1);
-    EXPECT_FALSE(twiceBound.isReliable());
+    TimedQueuePool pool(1);
+    auto delivery =
+        reliableOn(pool, server, std::make_shared<DashboardLinger>(1), counters, milliseconds(10));
+    delivery->send(std::make_unique<DashboardDelivery::Buffer>(), kDashboardHeaderSize, 0);
+    const auto first = server.next();
+    EXPECT_EQ(server.next(), first);
+    server.send(first);
+    delivery->cleanup();
+    delivery.reset();
+    EXPECT_TRUE(pool.waitUntilUnused(std::chrono::minutes(1)));
   }
-  _queue->refusesReadSources = true;
-  start();
-  EXPECT_EQ(_log.count(3, "DashboardBackend(useReliableUDP): can't create read source"), 1);
-  EXPECT_TRUE(_delivery->isReliable());
-  send(1);
-  cleanup();
-  _delivery.reset();
-  _queue->advance(milliseconds(10'000));
-  EXPECT_EQ(openDescriptors(), before) << "closed although no read source was there to be cancelled";
+  EXPECT_EQ(openDescriptors(), before + 1) << "the server's";
+  EXPECT_TRUE(counters.snapshot().empty());
 }
 
 TEST(DeliveryOnThreads, EndAtOnceBeyondTheirPlacesAndLeaveNothingBehindWhenStopped) {
@@ -372,13 +352,7 @@ TEST(DeliveryOnThreads, EndAtOnceBeyondTheirPlacesAndLeaveNothingBehindWhenStopp
     TimedQueuePool pool(1);
     const long started = openDescriptors();
     for (int i = 0; i < 3 * kPlaces; ++i) {
-      UDPSocket socket;
-      ASSERT_EQ(socket.open(), 0);
-      auto delivery = std::make_shared<DashboardDelivery>(std::move(socket), pool.makeQueue("test"), linger,
-                                                          counters, "dashboard");
-      delivery->useReliableUDP();
-      ASSERT_TRUE(delivery->connect(server.endpoint()));
-      ASSERT_TRUE(delivery->start(milliseconds(500)));
+      auto delivery = reliableOn(pool, server, linger, counters, milliseconds(500));
       delivery->send(std::make_unique<DashboardDelivery::Buffer>(), kDashboardHeaderSize, 1);
       delivery->cleanup();
       EXPECT_LE(openDescriptors(), started + kPlaces + 4) << "three are the pool's, one may be on its way";

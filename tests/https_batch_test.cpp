@@ -178,19 +178,6 @@ TEST_F(HTTPSBatch, LargeUserInfoThatComesLateGoesWithTheNewestEvents) {
   EXPECT_EQ(post.event(sent - 1).at("clientName"), "Camera");
 }
 
-TEST_F(HTTPSBatch, OneBackendAtTheBoundLeavesTheOthersTheirBatches) {
-  auto account = std::make_shared<std::atomic<std::size_t>>(0);
-  auto holds = make(entry());
-  holds->setState(BackendStateOverride);
-  auto batches = make(entry(), {.batchEvents = true});
-  for (auto& backend : {holds, batches}) backend->setHeldBytes(account);
-  for (int i = 0; i < 40; ++i) {
-    send(*holds, Dictionary{{"bulk", kMebibyte}});
-    send(*batches, Dictionary(), i);
-  }
-  EXPECT_LT(takeAll().size(), 15u);
-}
-
 TEST_F(HTTPSBatch, HeldEventsAreBoundedByDroppingTheOldest) {
   CapturedLog log;
   auto backend = make(entry());

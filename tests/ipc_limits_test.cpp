@@ -263,14 +263,6 @@ TEST(IPCLimits, TellsTheCallerWhenAClientsOutboxIsFull) {
     client.reset();
     EXPECT_TRUE(service.journal.waitFor("lost ")) << "and what became of those that it took";
   }
-  EXPECT_EQ(error, "too many calls wait for the client");
-  EXPECT_LE(taken, 40);
-  error.clear();
-  connection->callRemoteObject({wire::kReplyInterface, "m", {std::string(std::size_t{1} << 20, 'x')}},
-                               [&](const std::string& text) { error = text; });
-  EXPECT_EQ(error, "the call is too large");
-  client.reset();
-  EXPECT_TRUE(service.journal.waitFor("lost ")) << "and what became of those that it took";
 }
 
 TEST(IPCLimits, ACallThatCanNotBeSentIsCounted) {

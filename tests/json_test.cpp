@@ -41,6 +41,7 @@ TEST(JSON, WritesEveryKindOfValue) {
       {"back\\slash and tab\t", R"("back\\slash and tab\t")"},
       {std::string("\x00\x1f\x7f", 3), "\"\\u0000\\u001F\x7f\""},
       {"äöü → 🎉 and more ASCII after it", "\"äöü → 🎉 and more ASCII after it\""},
+      {"\uFDD0\uFFFE\uFFFF\U0010FFFF", "\"\uFDD0\uFFFE\uFFFF\U0010FFFF\""},  // valid, though no characters
       {List{}, "[]"},
       {Dictionary{}, "{}"},
       {Dictionary{{"a", List{1, "b", Value()}}, {"c", Dictionary{{"d", 2u}}}},

@@ -35,6 +35,7 @@ TEST(XMLPropertyList, ReadsTheRarerForms) {
       {"<real>-infinity</real>", -HUGE_VAL},
       {"<date>2000-02-29T23:59:59Z</date>", Date{951868799}},
       {"<dict><key>k</key><integer>1</integer><key>k</key><integer>2</integer></dict>", Dictionary{{"k", 2}}},
+      {"<string>\uFDD0\U0010FFFF</string>", "\uFDD0\U0010FFFF"},
       {" <!-- a note --> <array> <true/> </array> ", List{true}},
   };
   for (const auto& c : cases) {
@@ -49,7 +50,10 @@ TEST(XMLPropertyList, ReadsTheRarerForms) {
 TEST(XMLPropertyList, RefusesWhatIsWrong) {
   std::vector<std::string> cases = {
       "", "\xEF\xBB\xBF", "not XML", "<plist/>", "<string>no plist around</string>",
-      document("<string>a</string>") + "trailing", document(std::string("<string>\0</string>", 18)),
+      document("<string>a</string>") + "trailing",
+      // Valid UTF-8, but XML has no way to write them.
+      document("<string>\uFFFE</string>"), document("<string>&#xFFFE;</string>"),
+      document(std::string("<string>\0</string>", 18)),
       // What is declared elsewhere is never fetched, so nobody knows what this stands for.
       "<!DOCTYPE plist SYSTEM \"file:///etc/passwd\">" + document("<string>&undefined;</string>"),
       "<!DOCTYPE plist [<!ENTITY a \"b\">]>" + document("<string>&a;</string>"),

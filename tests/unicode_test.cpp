@@ -51,8 +51,9 @@ TEST(Unicode, FindsFragmentsWithoutCase) {
 }
 
 TEST(Unicode, TellsWellFormedUTF8) {
-  for (const char* text : {"", "ASCII only, longer than eight", "\x7F\xC2\x80\xDF\xBF\xE0\xA0\x80", "\uFFFF",
-                           "\U00010000", "\U0010FFFF", "eight bytes and then \U0001F389"}) {
+  for (const char* text :
+       {"", "ASCII only, longer than eight", "\x7F\xC2\x80\xDF\xBF\xE0\xA0\x80", "\uFDD0\uFFFE\uFFFF",
+        "\U00010000", "\U0010FFFF", "eight bytes and then \U0001F389"}) {
     EXPECT_TRUE(isValidUTF8(text)) << text;
   }
   for (const char* text : {"\x80", "\xC0\x80", "\xC1\xBF", "\xC3", "\xE0\x80\x80", "\xE0\x9F\xBF", "\xE2\x82",
@@ -63,6 +64,13 @@ TEST(Unicode, TellsWellFormedUTF8) {
   const std::string_view withNUL("a\0b", 3);
   EXPECT_TRUE(isValidUTF8(withNUL));
   EXPECT_FALSE(isValidUTF8(withNUL, false));
+}
+
+TEST(Unicode, CutsBetweenCharacters) {
+  const std::string text = "aé→🎉b";
+  const std::size_t ends[] = {0, 1, 1, 3, 3, 3, 6, 6, 6, 6, 10, 11, 11};
+  for (std::size_t size = 0; size < std::size(ends); ++size)
+    EXPECT_EQ(cutToWholeCharacters(text, size), text.substr(0, ends[size])) << size;
 }
 
 }  // namespace

@@ -189,7 +189,7 @@ TEST_F(VeskreportCommand, SaysWhatFailed) {
   EXPECT_EQ(runClient({"upload-file", root + "/missing"}).errors,
             "veskreport: the file can't be opened: No such file or directory\n");
 
-  for (const std::string command : {"flush --client-type 5 --root " + root, "storebag keygen " + root}) {
+  for (const std::string& command : {"flush --client-type 5 --root " + root, "storebag keygen " + root}) {
     ChildProcess full({"/bin/sh", "-c", "exec " VESK_BIN_DIRECTORY "/veskreport " + command + " >/dev/full"});
     EXPECT_EQ(full.wait(), 1) << command;
     EXPECT_EQ(full.errors(), "veskreport: cannot write to standard output\n");

@@ -102,7 +102,7 @@ class HTTPClient {
     std::chrono::milliseconds acknowledgedWithin{20'000};
     /// Further requests to that host wait in order. Posts leave one connection to the other requests, so that
     /// a fetch does not wait behind them.
-    std::size_t maximumConnectionsPerHost = 6;
+    std::size_t maximumConnectionsPerHost = 8;
     /// Called whenever the last outstanding request has ended, on any thread; must neither block nor throw.
     std::function<void()> onIdle = nullptr;
   };

@@ -8,6 +8,8 @@
 #include <climits>
 #include <csignal>
 
+#include "platform/unicode/UTF8.h"
+
 namespace vesk {
 
 namespace {
@@ -57,8 +59,7 @@ bool hasRoom(std::chrono::milliseconds patience) noexcept {
 void writeToStandardError(std::string line, std::chrono::milliseconds patience) {
   constexpr char kCut[] = "...";
   if (patience <= patience.zero() && line.size() >= PIPE_BUF) {
-    line.resize(PIPE_BUF - sizeof kCut);
-    line += kCut;
+    line = cutToWholeCharacters(line, PIPE_BUF - sizeof kCut) + kCut;
   }
   line += '\n';
   if (!hasRoom(patience)) return;

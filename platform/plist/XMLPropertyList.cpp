@@ -9,10 +9,13 @@
 #include "platform/crypto/Base64.h"
 #include "platform/plist/PropertyListFormats.h"
 #include "platform/plist/PropertyListScalars.h"
+#include "platform/unicode/UTF8.h"
 
 namespace vesk {
 
 namespace {
+
+constexpr std::size_t kShown = 64;  // bytes of what is wrong
 
 enum class Element { Unknown, PList, Dict, Array, Key, String, Integer, Real, True, False, Date, Data };
 
@@ -82,7 +85,8 @@ class XMLReader {
 
   void start(std::string_view name) {
     const Element element = elementNamed(name);
-    if (element == Element::Unknown) return fail("unknown element <" + std::string(name.substr(0, 64)) + ">");
+    if (element == Element::Unknown)
+      return fail("unknown element <" + cutToWholeCharacters(name, kShown) + ">");
     if (!mayStart(element)) return fail("element <" + std::string(name) + "> may not stand here");
     // The plist element itself is no container of the value.
     if (isContainer(element) && !_budget.allowsDepth(_frames.size())) return fail(_budget.depthError());
@@ -129,7 +133,7 @@ class XMLReader {
     if (value) {
       place(*std::move(value));
     } else {
-      fail("not a valid value: " + frame.text.substr(0, 64));
+      fail("not a valid value: " + cutToWholeCharacters(frame.text, kShown));
     }
   }
 

@@ -1,8 +1,10 @@
-// Whether bytes are text.
+// Whether bytes are text, and where its characters end.
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <cstring>
+#include <string>
 #include <string_view>
 
 namespace vesk {
@@ -38,6 +40,14 @@ inline bool isValidUTF8(std::string_view text, bool allowNUL = true) noexcept {
     at += more;
   }
   return true;
+}
+
+/// The start of `text` that fits into `size` bytes, in whole characters when the text is UTF-8. For texts
+/// that are shown.
+inline std::string cutToWholeCharacters(std::string_view text, std::size_t size) {
+  if (text.size() <= size) return std::string(text);
+  for (int i = 0; i < 3 && size > 0 && (static_cast<unsigned char>(text[size]) & 0xC0) == 0x80; ++i) --size;
+  return std::string(text.substr(0, size));
 }
 
 }  // namespace vesk

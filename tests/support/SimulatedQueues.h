@@ -119,7 +119,11 @@ class SimulatedQueue final : public TimedQueue, public std::enable_shared_from_t
 class SimulatedQueues final : public TimedQueueMaker {
  public:
   ~SimulatedQueues() override { queue->stop(); }
-  std::shared_ptr<TimedQueue> makeQueue(const char*) override { return queue; }
+  std::shared_ptr<TimedQueue> makeQueue(const char*) override {
+    if (refusesQueues) throw std::system_error(EAGAIN, std::generic_category());
+    return queue;
+  }
+  bool refusesQueues = false;
   std::shared_ptr<SimulatedQueue> queue = std::make_shared<SimulatedQueue>();
 };
 
