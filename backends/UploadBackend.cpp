@@ -27,6 +27,11 @@ std::chrono::seconds timeoutFor(std::size_t bytes, std::size_t bytesPerSecond) {
   return kLeastTimeout + std::chrono::seconds(bytes / bytesPerSecond);
 }
 
+/// Slashes behind a path belong to no component of it.
+std::string withoutTrailingSlashes(const std::string& path) {
+  return path.substr(0, path.find_last_not_of('/') + 1);
+}
+
 std::string lastComponentOf(const std::string& path) { return path.substr(path.rfind('/') + 1); }
 
 }  // namespace
@@ -67,7 +72,7 @@ bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string&
   auto url = uploadURL();
   if (!url) return false;
   try {
-    return upload(path, extensionToken, *url);
+    return upload(withoutTrailingSlashes(path), extensionToken, *url);
   } catch (const std::bad_alloc&) {
     VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Not enough memory for the input file");
     return false;

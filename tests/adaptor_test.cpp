@@ -25,6 +25,8 @@ constexpr char kLibrary[] =
     "System/Library/PrivateFrameworks/ZelkoServices.framework/Frameworks/ZKSPerformance.framework/"
     "ZKSPerformance.so";
 
+using Line = std::pair<int, std::string>;
+
 void install(const fs::path& root, const fs::path& library) {
   fs::create_directories((root / kLibrary).parent_path());
   fs::copy_file(library, root / kLibrary, fs::copy_options::overwrite_existing);
@@ -58,20 +60,22 @@ class AdaptorTest : public testing::Test {
 };
 
 TEST_F(AdaptorTest, OnlyTwoClientTypesHaveOne) {
-  for (std::int32_t type : {0, 7, 8, 11, -7}) {
+  const std::string unit = "WrenBackend(initWithName): ";
+  for (std::int32_t type : {1, 6, 7, 8, 10, 11, 12, -7, 1 << 30, 0}) {
     log.clear();
-    bool has = type == 7 || type == 11;
-    EXPECT_EQ(make(type) != nullptr, has) << type;
-    const std::string number = std::to_string(type);
-    EXPECT_EQ(log.count(6, "WrenBackend(initWithName): Loading Wren adaptor class for client type " + number),
-              1);
-    EXPECT_EQ(log.count(3, "WrenBackend(initWithName): No matching bundle found for client type " + number),
-              has ? 0 : 1);
+    const bool has = type == 7 || type == 11;
+    EXPECT_EQ((type == 0 ? WrenBackend::create("wren", Dictionary(), Text("Phone"), harness.services)
+                         : make(type)) != nullptr,
+              has)
+        << type;
+    std::vector<Line> lines = log.lines();
+    if (has) lines.resize(1);
+    std::vector<Line> expected{
+        {6, unit + "Loading Wren adaptor class for client type " + std::to_string(type)},
+        {3, unit + "No matching bundle found for client type " + std::to_string(type)}};
+    if (has) expected.pop_back();
+    EXPECT_EQ(lines, expected);
   }
-  log.clear();
-  EXPECT_FALSE(WrenBackend::create("wren", Dictionary(), Text("Phone"), harness.services));
-  EXPECT_EQ(log.count(3, "WrenBackend(initWithName): No matching bundle found for client type 0"), 1);
-
   ::srand48(1);
   nextSamplingDraw();
   const double second = nextSamplingDraw();
@@ -81,38 +85,60 @@ TEST_F(AdaptorTest, OnlyTwoClientTypesHaveOne) {
 }
 
 TEST_F(AdaptorTest, WhatIsOfNoUseCostsALineForEachMessage) {
-  struct Case {
-    const char* library;  // null: there is none
-    std::string line;
-    std::string later;  // for method 1
-  };
   const std::string failed = "WrenBackend(sendMessage): Wren adaptor Bad failed: ";
+  const std::string init = "WrenBackend(initWithName): ";
+  const std::string none = missing("(null)");
+  // The library, the line when it is loaded ("@": its path), the line for a message and that for one of
+  // type 1.
+  using Case = std::tuple<const char*, int, std::string, std::string, std::string>;
   const Case cases[] = {
-      {nullptr, missing("(null)"), missing("(null)")},
-      {"/etc/passwd", missing("(null)"), missing("(null)")},
-      {VESK_WITHOUT_FACTORY, missing("(null)"), missing("(null)")},
-      {VESK_WITHOUT_OPERATION, missing("Bad"), missing("Bad")},
-      {VESK_THROWING_FACTORY, missing("(null)"), missing("(null)")},
-      {VESK_THROWING_OPERATION, failed + "out of order", failed + "an exception of its own"},
+      {nullptr, 7, "@: cannot open shared object file: No such file or directory", none, none},
+      {"/etc/passwd", 7, "@: invalid ELF header", none, none},
+      {VESK_WITHOUT_FACTORY, 7, "@ exports no WrenAdaptor", none, none},
+      {VESK_OTHER_VERSION, 7, "@ is made for version 2", none, none},
+      {VESK_THROWING_FACTORY, 3, "Wren adaptor could not be made: no antenna", none, none},
+      {VESK_WITHOUT_OPERATIONS, 0, "", none, none},
+      {VESK_WITHOUT_OPERATION, 0, "", missing("Bad"), missing("Bad")},
+      {VESK_THROWING_OPERATION, 0, "", failed + "out of order", failed + "an exception of its own"},
   };
-  int number = 0;
-  for (const auto& test : cases) {
-    SCOPED_TRACE(test.library ? test.library : "none");
+  std::uint64_t number = 0;
+  for (auto [library, level, line, sent, sentWithType1] : cases) {
+    SCOPED_TRACE(library ? library : "none");
     // A path of its own: a library that was loaded once stays.
     const fs::path root = directory / std::to_string(++number);
     fs::create_directories(root);
     setRootPrefix(root.string());
-    if (test.library) install(root, test.library);
+    if (library) install(root, library);
     log.clear();
     auto backend = make();
     ASSERT_TRUE(backend);
     send(*backend, Dictionary{{"k", 1}});
     backend->sendMessage(Dictionary(), timeval{}, 3, 1, 0);
-    EXPECT_EQ(log.count(3, test.line) + (test.later == test.line ? 0 : log.count(3, test.later)), 2);
     backend.reset();
-    EXPECT_EQ(harness.dropped(DropReason::AdaptorFailed), static_cast<std::uint64_t>(2 * number));
+    std::vector<Line> expected{{6, init + "Loading Wren adaptor class for client type 7"}};
+    if (line.starts_with('@')) line.replace(0, 1, (root / kLibrary).string());
+    if (level > 0) expected.push_back({level, init + line});
+    expected.insert(expected.end(), {{3, sent}, {3, sentWithType1}});
+    if (sent.find("Bad") != std::string::npos) {
+      expected.push_back({3, "WrenBackend(dealloc): Wren adaptor failed: an exception of its own"});
+    }
+    std::vector<Line> lines = log.lines();
+    std::erase_if(lines, [](const Line& each) { return each.second.starts_with("WrenAdaptor: "); });
+    EXPECT_EQ(lines, expected);
+    EXPECT_EQ(harness.dropped(DropReason::AdaptorFailed), 2 * number);
   }
-  EXPECT_EQ(log.count(3, "WrenBackend(dealloc): Wren adaptor failed: an exception of its own"), 1);
+  EXPECT_EQ(harness.counters.snapshot().at(0).backend, "wren");
+}
+
+TEST_F(AdaptorTest, WritesToTheLogWithALevelOfItsOwn) {
+  install(directory.path(), VESK_WITHOUT_OPERATION);
+  auto backend = make();
+  std::vector<int> levels;
+  for (const auto& [level, line] : log.lines()) {
+    if (line == "WrenAdaptor: made") levels.push_back(level);
+  }
+  EXPECT_EQ(levels, (std::vector<int>{3, 4, 6, 7, 7, 7}));
+  EXPECT_EQ(log.lines().back(), Line(6, "WrenAdaptor: "));
 }
 
 TEST_F(AdaptorTest, OneThatHangsHoldsUpNothingButMessages) {

@@ -14,7 +14,7 @@ TEST(KeyedArchive, ReadsBackWhatWasArchived) {
   std::vector<Value> many;  // more than one byte can number
   for (int i = 0; i < 300; ++i) many.emplace_back(i);
   const List shared{"same", 1};
-  const List texts{"text", "ä → 🎉", "", "$null", "text"};
+  const List texts{"text", "ä → 🎉", "\uFDD0\uFFFE\U0010FFFF", "", "$null", "text"};
   const List numbers{-7, INT64_MIN, UINT64_MAX, 0.1, true, false, Value(), Date{1795552289.25}};
   const Dictionary nested{{"shared", shared}, {"text", "text"}, {"", List{Value(List{Value()})}}};
   const List all{texts, numbers, Bytes(std::string("\0\x01\xff", 3)), List{}, Dictionary{}, shared, nested};

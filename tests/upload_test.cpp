@@ -1,43 +1,63 @@
 // The file upload backend against a real server: what it sends, what it refuses, what it removes.
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sched.h>
+#include <sys/mount.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 
 #include <filesystem>
 #include <fstream>
 #include <functional>
 #include <future>
+#include <thread>
 
 #include "backends/UploadBackend.h"
 #include "platform/ipc/ExtensionTokens.h"
 #include "platform/queue/TimedQueuePool.h"
 #include "tests/support/CapturedLog.h"
+#include "tests/support/ProcessFacts.h"
 #include "tests/support/RecordingServer.h"
 #include "tests/support/TempDirectory.h"
-#include "util/URLQuery.h"
 
 namespace vesk::test {
 namespace {
 
 namespace fs = std::filesystem;
+using Line = std::pair<int, std::string>;
 
-constexpr char kNotRegular[] = "UploadBackend(uploadFileAtPath): Only upload a regular file.";
-constexpr char kEmpty[] = "UploadBackend(uploadFileAtPath): Input file is empty";
+const std::string kUnit = "UploadBackend(uploadFileAtPath): ";
 
 FileDescriptor opened(const std::string& path, int flags = O_RDONLY) {
   return FileDescriptor(::open(path.c_str(), flags | O_CLOEXEC | O_NONBLOCK));
 }
 
 std::string token(FileDescriptor descriptor, uid_t user = ::getuid()) {
-  return ExtensionTokens::shared().add({1, user}, std::move(descriptor));
+  static std::uint64_t connection = 0;  // which may have few of them
+  return ExtensionTokens::shared().add({++connection, user}, std::move(descriptor));
+}
+
+HTTPAnswer says(const char* text, unsigned status = 200) {
+  auto answer = faulty(HTTPAnswer::Fault::None, text);
+  answer.status = status;
+  return answer;
+}
+
+/// How many descriptors of this process are that file, whatever it is called by now.
+int openCount(const struct stat& file) {
+  int count = 0;
+  struct stat status {};
+  for (int i = 0; i < 1024; ++i)
+    count += ::fstat(i, &status) == 0 && status.st_dev == file.st_dev && status.st_ino == file.st_ino;
+  return count;
 }
 
 class UploadTest : public testing::Test {
  protected:
-  std::shared_ptr<VeskReportingBackend> make(const std::string& url) {
-    auto made = VeskReportingBackend::newBackendWithName(
+  std::shared_ptr<UploadBackend> make(const std::string& url) {
+    auto made = std::dynamic_pointer_cast<UploadBackend>(VeskReportingBackend::newBackendWithName(
         "uploadServer", Dictionary{{"post_url", url}, {"display_url", "https://show"}}, std::nullopt, 5,
-        services);
+        services));
     made->setUdid("udid");
     made->setSessionID(4'000'000'000);
     return made;
@@ -46,61 +66,73 @@ class UploadTest : public testing::Test {
   std::string file(const std::string& name = "a.log", const std::string& contents = "contents") {
     return directory.write(name, contents).string();
   }
+  Line started(const std::string& path) const { return {7, kUnit + "Uploading file " + path}; }
+  Line answered(const std::string& text) const {
+    return {7, kUnit + "sending to |" + *backend->uploadURL() + "|, Json output: " + text};
+  }
 
   TempDirectory directory;
   CapturedLog log;
   Counters counters;
-  std::function<HTTPAnswer()> answer = [] { return HTTPAnswer::text(200, "success"); };
+  std::function<HTTPAnswer()> answer = [] { return says("success"); };
   RecordingServer server{[this](const HTTPReceived&, std::size_t) { return answer(); }};
   HTTPClient http;
   TimedQueuePool queues{1};
   BackendServices services{http, WallClock::system(), counters, queues, {}, {}, {}};
-  std::shared_ptr<VeskReportingBackend> backend = make(server.url("/upload"));
+  std::shared_ptr<UploadBackend> backend = make(server.url("/upload"));
 };
 
-TEST_F(UploadTest, SendsTheWholeFileUnderItsNameAndRemovesIt) {
-  const std::string contents(300'000, 'x');
-  auto path = file("x y.log", contents);
-  FileDescriptor descriptor = opened(path);
-  ::lseek(descriptor.get(), 100, SEEK_SET);
-  EXPECT_TRUE(backend->uploadFileAtPath(path, token(std::move(descriptor))));
-  ASSERT_EQ(server.count(), 1u);
-  const HTTPReceived request = server.requests().at(0);
-  EXPECT_EQ(request.method, "POST");
-  EXPECT_EQ(request.target,
-            "/upload?uuid=udid&sequence=4000000000&description=Tellvue%20MQRC%20log%20(Uploaded%20by%20ZKS)"
-            "&filename=x%20y.log.gz&raw=true");
-  EXPECT_EQ(request.header("Content-Type"), "application/octet-stream");
-  EXPECT_EQ(request.header("Content-Encoding"), "gzip");
-  EXPECT_LT(request.body.size(), 2000u);
-  EXPECT_EQ(request.decodedBody().body, contents);
-  EXPECT_FALSE(fs::exists(path));
-  EXPECT_EQ(log.count(7, "UploadBackend(uploadFileAtPath): Uploading file " + path), 1);
-  EXPECT_EQ(log.countContaining(7, "/upload|, Json output: success"), 1);
+TEST_F(UploadTest, SendsTheWholeFileUnderItsName) {
+  using Case = std::tuple<std::string, const char*, std::uint32_t, const char*>;
+  std::size_t count = 0;
+  for (const auto& [name, sent, sessionID, behind] :
+       {Case{"x y.log", "x%20y.log.gz", 4'000'000'000, ""}, Case{"a&b=c?d+e;f", "a&b=c?d+e;f.gz", 7, ""},
+        Case{"100%#[\"]\xc3\xa9", "100%25%23%5B%22%5D%C3%A9.gz", 0, ""},
+        Case{"slash.log", "slash.log.gz", 1, "//"}}) {
+    const std::string contents(300'000, 'x');
+    const std::string path = file(name, contents) + behind;
+    FileDescriptor descriptor = opened(directory / name);
+    ::lseek(descriptor.get(), 100, SEEK_SET);
+    backend->setSessionID(sessionID);
+    log.clear();
+    EXPECT_TRUE(backend->uploadFileAtPath(path, token(std::move(descriptor))));
+    const HTTPReceived request = server.requests().at(count++);
+    EXPECT_EQ(request.method, "POST");
+    EXPECT_EQ(request.target,
+              "/upload?uuid=udid&sequence=" + std::to_string(sessionID) +
+                  "&description=Tellvue%20MQRC%20log%20(Uploaded%20by%20ZKS)&filename=" + sent + "&raw=true");
+    EXPECT_EQ(request.header("Content-Type"), "application/octet-stream");
+    EXPECT_EQ(request.header("Content-Encoding"), "gzip");
+    EXPECT_LT(request.body.size(), 2000u);
+    EXPECT_EQ(request.decodedBody().body, contents);
+    EXPECT_FALSE(fs::exists(directory / name));
+    const std::vector<Line> lines = {started(path),
+                                     {7, "compressDataWithZlibOrGzip: Compressed file from 300000 to " +
+                                             std::to_string(request.body.size())},
+                                     answered("success")};
+    EXPECT_EQ(log.lines(), lines);
+  }
   EXPECT_EQ(backend->displayURL(), "https://show");
 }
 
 TEST_F(UploadTest, RemovesTheFileOnlyWhenTheAnswerSaysSuccess) {
-  struct Case {
-    unsigned status;
-    const char* answer;
-    bool removed;
-  };
-  for (const auto& test :
-       {Case{200, "unsuccessful", true}, Case{500, "{\"success\":0}", true}, Case{200, "success \xff", false},
-        Case{200, "Success", false}, Case{200, "", false}, Case{503, "busy", false}}) {
+  using Case = std::tuple<unsigned, const char*, bool, const char*>;
+  for (const auto& [status, text, removed, shown] :
+       {Case{200, "unsuccessful", true, "unsuccessful"}, Case{404, "\"success\"", true, "\"success\""},
+        Case{500, "{\"success\":0}", true, "{\"success\":0}"}, Case{200, "success \xff", false, "(null)"},
+        Case{200, "Success", false, "Success"}, Case{200, "succes", false, "succes"},
+        Case{200, "", false, ""}, Case{503, "busy", false, "busy"}}) {
     auto path = file();
-    answer = [&] {
-      auto made = faulty(HTTPAnswer::Fault::None, test.answer);
-      made.status = test.status;
-      return made;
-    };
+    answer = [code = status, body = text] { return says(body, code); };
     EXPECT_TRUE(upload(path));
-    EXPECT_EQ(fs::exists(path), !test.removed) << test.answer;
+    EXPECT_EQ(fs::exists(path), !removed) << text;
+    EXPECT_EQ(log.lines().back(), answered(shown));
   }
 }
 
-TEST_F(UploadTest, RefusesWhatIsNoWholeReadableFile) {
+TEST_F(UploadTest, RefusesWhatIsNoWholeReadableFileAndKeepsNothingOfIt) {
+  const char* const notRegular = "Only upload a regular file.";
+  const char* const isEmpty = "Input file is empty";
   const std::string plain = file();
   const std::string used = token(opened(plain));
   ExtensionTokens::shared().consume(used);
@@ -111,65 +143,91 @@ TEST_F(UploadTest, RefusesWhatIsNoWholeReadableFile) {
   const std::string large = file("large");
   fs::resize_file(large, UploadBackend::kMaximumFile + 1);
   const std::string empty = file("empty", "");
-  struct Case {
-    const char* what;
-    std::string path;
-    std::string token;
-    std::string line;
-  };
+  const std::string removed = file("removed");
+  FileDescriptor nameless = opened(removed);
+  fs::remove(removed);
+  using Case = std::tuple<const char*, std::string, std::string, std::string>;
   const Case cases[] = {
-      {"a directory", directory.path(), token(opened(directory.path())), kNotRegular},
-      {"a FIFO", fifo, token(opened(fifo)), kNotRegular},
-      {"a device", "/dev/zero", token(opened("/dev/zero")), kNotRegular},
-      {"a regular file under the path of another kind", link, token(opened(link)), kNotRegular},
-      {"a URL that names no path", "", token(opened(plain)), kNotRegular},
-      {"no token", plain, "", kNotRegular},
-      {"a token of nobody", plain, std::string(32, 'a'), kNotRegular},
-      {"a token used before", plain, used, kNotRegular},
-      {"an empty file", empty, token(opened(empty)), kEmpty},
-      {"a file that the client can't read", plain, token(opened(plain, O_WRONLY)), kEmpty},
-      {"a file that the client can only name", plain, token(opened(plain, O_PATH)), kEmpty},
+      {"a directory", directory.path(), token(opened(directory.path())), notRegular},
+      {"a directory instead of the file", directory.path(), token(opened(plain)), notRegular},
+      {"a FIFO", fifo, token(opened(fifo)), notRegular},
+      {"a regular file under the path of another kind", link, token(opened(link)), notRegular},
+      {"a URL that names no path", "", token(opened(plain)), notRegular},
+      {"nothing but slashes", "//", token(opened(plain)), notRegular},
+      {"no token", plain, "", notRegular},
+      {"a token of nobody", plain, std::string(32, 'a'), notRegular},
+      {"a token used before", plain, used, notRegular},
+      {"a file that was removed", removed, token(std::move(nameless)), notRegular},
+      {"a name that is not there", directory.path() / "nothing", token(opened(plain)), notRegular},
+      {"an empty file", empty, token(opened(empty)), isEmpty},
+      {"a file that the client can't read", plain, token(opened(plain, O_WRONLY)), isEmpty},
+      {"a file that the client can only name", plain, token(opened(plain, O_PATH)), isEmpty},
       {"a file that is too large", large, token(opened(large)),
-       "UploadBackend(uploadFileAtPath): Input file has 268435457 bytes, more than the 268435456 that can be "
-       "uploaded"},
+       "Input file has 268435457 bytes, more than the 268435456 that can be uploaded"},
   };
-  for (const auto& test : cases) {
+  struct stat plainFile {};
+  ASSERT_EQ(::stat(plain.c_str(), &plainFile), 0);
+  for (const auto& [what, path, lent, line] : cases) {
     log.clear();
-    EXPECT_FALSE(backend->uploadFileAtPath(test.path, test.token)) << test.what;
-    EXPECT_EQ(log.count(3, test.line), 1) << test.what;
+    EXPECT_FALSE(backend->uploadFileAtPath(path, lent)) << what;
+    EXPECT_EQ(log.lines(), (std::vector<Line>{started(path), {3, kUnit + line}})) << what;
+    EXPECT_FALSE(ExtensionTokens::shared().consume(lent)) << what;
   }
+  EXPECT_EQ(openCount(plainFile), 0);
   EXPECT_EQ(server.count(), 0u);
   EXPECT_TRUE(fs::exists(plain) && fs::exists(empty) && fs::exists(large));
+
+  backend->setUploadURL(std::nullopt);
+  log.clear();
+  const std::string unused = token(opened(plain));
+  EXPECT_FALSE(backend->uploadFileAtPath(plain, unused));
+  EXPECT_EQ(log.lines(), std::vector<Line>{started(plain)});
+  EXPECT_TRUE(ExtensionTokens::shared().consume(unused)) << "without a server there is no use for it";
+}
+
+TEST_F(UploadTest, BelievesAPathThatItCanNotSee) {
+  const std::string path = file("hidden/a.log");
+  EXPECT_TRUE(backend->uploadFileAtPath("/nowhere/at/all/b.log", token(opened(path))));
+  EXPECT_EQ(*server.requests().at(0).query("filename"), "b.log.gz");
+  struct stat hidden {};
+  ASSERT_EQ(::stat(path.c_str(), &hidden), 0);
+  EXPECT_EQ(openCount(hidden), 0);
+  // A thread with mounts of its own, as a service with PrivateTmp= has them.
+  std::thread([&] {
+    const std::string covered = directory.path() / "hidden";
+    const std::string seen = token(opened(path));
+    const std::string other = token(opened(path));
+    if (::unshare(CLONE_NEWNS) != 0 || ::mount("none", "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0 ||
+        ::mount("tmpfs", covered.c_str(), "tmpfs", 0, nullptr) != 0) {
+      GTEST_SKIP() << "needs the right to mount";
+    }
+    EXPECT_TRUE(backend->uploadFileAtPath(covered + "/./a.log", seen));
+    EXPECT_FALSE(backend->uploadFileAtPath(covered + "/other.log", other));
+  }).join();
+  EXPECT_TRUE(fs::exists(path));
 }
 
 TEST_F(UploadTest, LeavesWhatIsNotTheFileThatWasSent) {
   const std::string path = directory.path() / "a.log";
   const std::string other = file("other", "of somebody else");
-  struct Case {
-    const char* what;
-    std::function<void()> meanwhile;
+  const std::function<void()> cases[] = {
+      [&] { std::ofstream(path, std::ios::app) << "more"; },
+      [&] { fs::rename(file("new"), path); },
+      [&] { fs::remove(path), fs::create_symlink(other, path); },
   };
-  const Case cases[] = {
-      {"written to", [&] { std::ofstream(path, std::ios::app) << "more"; }},
-      {"replaced by another file", [&] { fs::rename(file("new"), path); }},
-      {"replaced by a symbolic link",
-       [&] {
-         fs::remove(path);
-         fs::create_symlink(other, path);
-       }},
-  };
-  for (const auto& test : cases) {
+  for (const auto& meanwhile : cases) {
     fs::remove(path);
     file();
     answer = [&] {
-      test.meanwhile();
-      return HTTPAnswer::text(200, "success");
+      meanwhile();
+      return says("success");
     };
     EXPECT_TRUE(upload(path));
-    EXPECT_TRUE(fs::is_symlink(path) || fs::exists(path)) << test.what;
-    EXPECT_TRUE(fs::exists(other)) << test.what;
+    EXPECT_TRUE(fs::is_symlink(path) || fs::exists(path));
+    EXPECT_TRUE(fs::exists(other));
+    EXPECT_EQ(log.lines().back(), Line(7, kUnit + "Left in its place: " + path));
   }
-  answer = [] { return HTTPAnswer::text(200, "success"); };
+  answer = [] { return says("success"); };
   fs::remove(path);
   file();
   EXPECT_TRUE(backend->uploadFileAtPath(path, token(opened(path), ::getuid() + 1)));
@@ -180,19 +238,36 @@ TEST_F(UploadTest, LeavesWhatIsNotTheFileThatWasSent) {
 
 TEST_F(UploadTest, AServerThatCanNotBeReachedCostsNothing) {
   auto path = file();
+  const std::string empty = file("empty", "");
   server.stop();
+  HTTPRequest request;
+  request.url = server.url("/upload");
+  std::string expected = kUnit + "post " + http.perform(std::move(request)).error->description;
   EXPECT_TRUE(upload(path));
   EXPECT_TRUE(fs::exists(path));
-  EXPECT_EQ(log.countContaining(3, "UploadBackend(uploadFileAtPath): post "), 1);
-  EXPECT_EQ(counters.snapshot().at(0).reason, DropReason::TransportError);
+  auto [level, line] = log.lines().back();
+  // It says how many milliseconds it took.
+  for (std::string* text : {&expected, &line})
+    std::erase_if(*text, [](char c) { return c >= '0' && c <= '9'; });
+  EXPECT_EQ(level, 3);
+  EXPECT_EQ(line, expected);
+  ASSERT_EQ(counters.snapshot().size(), 1u);
+  EXPECT_EQ(counters.snapshot()[0].backend, "uploadServer");
+  EXPECT_EQ(counters.snapshot()[0].reason, DropReason::TransportError);
   for (const char* url : {"ftp://host/x", "https://", "http://ho st/", "nowhere"}) {
-    log.clear();
     EXPECT_FALSE(make(url)->uploadFileAtPath(path, token(opened(path)))) << url;
-    EXPECT_EQ(log.count(3, "UploadBackend(uploadFileAtPath): Unable to create URL request"), 1) << url;
+    EXPECT_EQ(log.lines().back(), Line(3, kUnit + "Unable to create URL request")) << url;
+    EXPECT_FALSE(make(url)->uploadFileAtPath(empty, token(opened(empty))));
+    EXPECT_EQ(log.lines().back(), Line(3, kUnit + "Input file is empty")) << "which is looked at first";
   }
-  EXPECT_FALSE(
-      VeskReportingBackend::newBackendWithName("uploadServer", Dictionary(), Text("Phone"), 5, services));
-  EXPECT_EQ(log.count(3, "UploadBackend(initWithName): can't resolve upload post URL."), 1);
+  const std::optional<Dictionary> profiles[] = {std::nullopt, Dictionary{{"display_url", "https://show"}}};
+  for (const auto& profile : profiles) {
+    log.clear();
+    EXPECT_FALSE(
+        VeskReportingBackend::newBackendWithName("uploadServer", profile, Text("Phone"), 5, services));
+    EXPECT_EQ(log.lines(),
+              (std::vector<Line>{{3, "UploadBackend(initWithName): can't resolve upload post URL."}}));
+  }
 }
 
 TEST_F(UploadTest, AServerThatHangsHoldsUpNobodyElse) {
@@ -203,15 +278,53 @@ TEST_F(UploadTest, AServerThatHangsHoldsUpNobodyElse) {
   };
   auto path = file();
   auto uploaded = std::async(std::launch::async, [&] { return upload(path); });
-  arrived.get_future().wait();
+  ASSERT_EQ(arrived.get_future().wait_for(std::chrono::seconds(30)), std::future_status::ready);
   backend->updateState();  // these wait for the backend's own mutex
   backend->setUserInfoDict(std::nullopt);
   EXPECT_EQ(backend->state(), BackendStateEnabled);
   services.http.stopAllButPosts();
   services.uploads->close();
   EXPECT_TRUE(uploaded.get()) << "it was sent";
+  EXPECT_EQ(log.count(3, kUnit + "post the daemon stops"), 1);
   EXPECT_FALSE(upload(path)) << "nothing more is let in";
-  EXPECT_EQ(log.count(3, "UploadBackend(uploadFileAtPath): Too many uploads are under way"), 1);
+  EXPECT_EQ(log.count(3, kUnit + "Too many uploads are under way"), 1);
+}
+
+TEST_F(UploadTest, TakesItsUsersShareForTheFileAndItsCompressedForm) {
+  using std::chrono::milliseconds;
+  const std::string contents(100'000, 'x');
+  const std::string path = file("a.log", contents);
+  const uid_t user = ::getuid();
+  bool hasRoomMeanwhile = false;
+  answer = [&] {
+    // What the compressed form takes is little, but it is one upload of this user's.
+    hasRoomMeanwhile = services.uploads->enter(user + 1, 190'000) && !services.uploads->enter(user, 0);
+    return says("received");
+  };
+  for (std::size_t bytes : {199'999u, 200'000u}) {
+    services.uploads = std::make_shared<UploadGate>(UploadGate::Limits{
+        .bytes = bytes, .uploadsOfUser = 1, .bytesOfUser = bytes, .patience = milliseconds(0)});
+    backend = make(server.url("/upload"));
+    EXPECT_EQ(upload(path), bytes == 200'000);
+    EXPECT_EQ(log.count(3, kUnit + "Too many uploads are under way"), 1);
+  }
+  EXPECT_TRUE(hasRoomMeanwhile);
+  EXPECT_TRUE(services.uploads->enter(user, 200'000)) << "all of it is free again";
+}
+
+TEST_F(UploadTest, AFileThatFindsNoMemoryIsRefused) {
+  if (kIsSanitized) GTEST_SKIP() << "the sanitizer takes all addresses";
+  const std::string path = file();
+  fs::resize_file(path, UploadBackend::kMaximumFile);
+  rlimit before{};
+  ::getrlimit(RLIMIT_AS, &before);
+  const rlimit scarce{std::uint64_t{128} << 20, before.rlim_max};
+  const std::string lent = token(opened(path));
+  ::setrlimit(RLIMIT_AS, &scarce);
+  EXPECT_FALSE(backend->uploadFileAtPath(path, lent));
+  ::setrlimit(RLIMIT_AS, &before);
+  EXPECT_EQ(log.lines().back(), Line(3, kUnit + "Not enough memory for the input file"));
+  EXPECT_TRUE(fs::exists(path));
 }
 
 TEST(UploadGateTest, LetsInWhatThereIsRoomForAndLeavesSomeToOthers) {
@@ -236,20 +349,19 @@ TEST(UploadGateTest, LetsInWhatThereIsRoomForAndLeavesSomeToOthers) {
   EXPECT_TRUE(gate.enter(1, 50));
 }
 
-TEST(LentFileTest, IsReadOnlyAsLongAsItsReaderWants) {
-  TempDirectory directory;
-  const std::string path = directory.write("file", std::string(3 << 20, 'x')).string();
-  const LentFile lent(FileDescriptor(::open(path.c_str(), O_RDONLY | O_CLOEXEC)));
-  std::string bytes;
-  int pieces = 0;
-  EXPECT_EQ(lent.read(bytes, [&] { return ++pieces < 3; }), LentFile::Reading::GivenUp);
-  EXPECT_EQ(lent.read(bytes, [] { return true; }), LentFile::Reading::Whole);
-  EXPECT_EQ(bytes, std::string(3 << 20, 'x'));
-}
-
-TEST(URLQueryTest, EncodesWhatAQueryMayNotHold) {
-  EXPECT_EQ(encodedForURLQuery("az09-._~!$&'()*+,;=:@/?"), "az09-._~!$&'()*+,;=:@/?");
-  EXPECT_EQ(encodedForURLQuery(" #%[]\"\\\n\xc3\xa9"), "%20%23%25%5B%5D%22%5C%0A%C3%A9");
+TEST(UploadGateTest, LetsThoseInWhoWaitAndNobodyAfterTheEnd) {
+  UploadGate gate(UploadGate::Limits{.uploads = 1});
+  auto wait = [&] { return std::async(std::launch::async, [&] { return gate.enter(2, 20).has_value(); }); };
+  auto first = gate.enter(1, 10);
+  auto second = wait();
+  first.reset();
+  EXPECT_TRUE(second.get() && gate.isOpen());
+  auto last = gate.enter(1, 10);
+  auto third = wait();
+  gate.close();
+  EXPECT_FALSE(third.get() || gate.isOpen());
+  last.reset();
+  EXPECT_FALSE(gate.enter(1, 0));
 }
 
 }  // namespace

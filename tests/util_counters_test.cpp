@@ -50,8 +50,14 @@ TEST(Counters, LoseNothingBetweenThreads) {
 }
 
 TEST(Counters, HaveANameForEveryReason) {
-  for (std::size_t i = 0; i < kDropReasonCount; ++i)
-    EXPECT_NE(nameOfDropReason(static_cast<DropReason>(i)), "unknown");
+  const std::string_view names[] = {
+      "state-disabled", "transport-error", "no-url",       "server-error-5xx", "over-bound",
+      "body-not-built", "invalid-message", "no-backend",   "upload-failed",    "never-enabled",
+      "unacknowledged", "not-aggregated",  "not-recorded", "adaptor-failed",   "server-refused",
+  };
+  ASSERT_EQ(std::size(names), kDropReasonCount);
+  for (std::size_t i = 0; i <= kDropReasonCount; ++i)
+    EXPECT_EQ(nameOfDropReason(static_cast<DropReason>(i)), i < kDropReasonCount ? names[i] : "unknown");
 }
 
 TEST(SamplingDraw, FollowsTheDefaultSequence) {

@@ -1,13 +1,16 @@
 // The device-information query and what is built on it.
 #include <gtest/gtest.h>
 
+#include <cmath>
 #include <cstdlib>
-#include <cstring>
-#include <set>
+#include <map>
 
 #include "platform/device/DeviceInformation.h"
+#include "platform/device/FirmwareFacts.h"
+#include "platform/values/Conversions.h"
 #include "tests/support/TestRoot.h"
 #include "util/ReportingdUtil.h"
+#include "util/URLQuery.h"
 
 namespace vesk::test {
 namespace {
@@ -17,77 +20,130 @@ constexpr char kFacts[] = "etc/veskreporting/device.toml";
 class Device : public testing::Test {
  protected:
   void SetUp() override {
-    std::filesystem::remove_all(testRoot() / "etc");
+    for (const char* directory : {"etc", "usr"}) std::filesystem::remove_all(testRoot() / directory);
     for (const char* name : {"XDG_CONFIG_HOME", "HOME", "LC_ALL", "LC_MESSAGES", "LANG"}) ::unsetenv(name);
   }
 };
 
-TEST_F(Device, SaysWhatItsFactsFileSays) {
-  testRoot().write(
-      kFacts,
-      "ProductVersion = \"7.1\"\nBuildVersion = 2210\nProductType = \"Sorrel3,1\"\nDeviceName = \"Küche\"\n"
-      "HWModelStr = \"S31\"\nSerialNumber = \"X1\"\n");
-  EXPECT_EQ(deviceProductVersion(), Text("7.1"));
-  EXPECT_EQ(deviceBuildVersion(), Text("2210"));
-  EXPECT_EQ(deviceProductType(), Text("Sorrel3,1"));
-  EXPECT_EQ(deviceName(), Text("Küche"));
-  EXPECT_EQ(deviceHardwareModel(), Text("S31"));
-  EXPECT_EQ(deviceSerialNumber(), Text("X1"));
-  EXPECT_EQ(QNCopyAnswer("ReleaseType"), std::nullopt);
+TEST_F(Device, EachFactHasAKeyAndSourcesInOrder) {
+  struct Fact {
+    const char* key;
+    std::optional<Text> (*getter)();
+    const char* system;                 // os-release, where the firmware says nothing
+    std::vector<std::string> firmware;  // in order
+  };
+  const std::string dmi = "sys/class/dmi/id/";
+  const std::string tree = "proc/device-tree/";
+  const Fact facts[] = {
+      {"ProductVersion", deviceProductVersion, "12", {}},
+      {"BuildVersion", deviceBuildVersion, "22F82", {}},
+      {"ProductType", deviceProductType, nullptr, {dmi + "product_name", tree + "model"}},
+      {"DeviceName", deviceName, "Debian", {dmi + "product_family", dmi + "product_name", tree + "model"}},
+      {"HWModelStr", deviceHardwareModel, nullptr, {dmi + "board_name", tree + "compatible"}},
+      {"SerialNumber", deviceSerialNumber, nullptr, {dmi + "product_serial", tree + "serial-number"}},
+  };
+  for (const Fact& fact : facts) {
+    SCOPED_TRACE(fact.key);
+    testRoot().write("etc/os-release",
+                     "XNAME=x\nNAME=\"Debian\" \nNAME=second\nVERSION_ID=\"12\"\nBUILD_ID='22F82'\n");
+    testRoot().write(kFacts, std::string(fact.key) + "X = \"other\"\n");
+    auto expected = firmwareFact(fact.key);  // this machine's own
+    if (!expected && fact.system) expected = fact.system;
+    EXPECT_EQ(QNCopyAnswer(fact.key), expected);
+    EXPECT_EQ(fact.getter(), expected ? std::optional<Text>(*expected) : std::nullopt);
+    testRoot().write(kFacts, std::string(fact.key) + " = \"Küche 3,1\"\n");
+    EXPECT_EQ(fact.getter(), Text("Küche 3,1"));
+
+    TempDirectory machine;
+    const std::string root = machine.path();
+    EXPECT_EQ(firmwareFact(fact.key, root), std::nullopt);
+    for (auto source = fact.firmware.rbegin(); source != fact.firmware.rend(); ++source) {
+      const std::string below = firmwareFact(fact.key, root).value_or("");
+      for (const char* filler : {"", " \n", "Default string", "Not Applicable", "Not Specified", "None",
+                                 "O.E.M.", "System Product Name", "System Serial Number",
+                                 "To Be Filled By O.E.M.", "To be filled by O.E.M.\n"}) {
+        machine.write(*source, filler);
+        EXPECT_EQ(firmwareFact(fact.key, root).value_or(""), below) << filler;
+      }
+      machine.write(*source, *source + ' ' + '\0' + "next");
+      EXPECT_EQ(firmwareFact(fact.key, root), *source);
+    }
+  }
+  testRoot().write(kFacts, "");
+  for (const char* other : {"ReleaseType", "RegionCode", "NAME", "productVersion"})
+    EXPECT_EQ(QNCopyAnswer(other), std::nullopt) << other;
 }
 
-TEST_F(Device, FallsBackOnTheOperatingSystem) {
-  testRoot().write("etc/os-release", "ID=debian\nVERSION_ID=\"12\"\nVERSION=\"12 \\\"bookworm\\\"\"\n");
-  EXPECT_EQ(QNCopyAnswer("ProductVersion"), "12");
-  EXPECT_EQ(QNCopyAnswer("BuildVersion"), "12 \"bookworm\"");
-  testRoot().write("etc/os-release", "BUILD_ID='22F82'\nVERSION=x");
-  EXPECT_EQ(QNCopyAnswer("BuildVersion"), "22F82");
-  EXPECT_EQ(QNCopyAnswer("ProductVersion"), std::nullopt);
+TEST_F(Device, ReadsOSReleaseAsAShellWould) {
+  using Case = std::tuple<const char*, const char*, std::optional<std::string>, std::optional<std::string>>;
+  for (const auto& [file, text, version, build] :
+       {Case{"etc", "ID=debian\nVERSION_ID=\"12\"\nVERSION=\"12 \\\"x\\\"\"\n", "12", "12 \"x\""},
+        Case{"etc", "BUILD_ID='22\\F82'\nVERSION=x", std::nullopt, "22\\F82"},
+        Case{"etc", "VERSION_ID\nVERSION_ID=\"1\nBUILD_ID='\nVERSION=x", "\"1", "'"},
+        Case{"etc", "VERSION_ID=\"1'\nVERSION=\"\"", "\"1'", std::nullopt},
+        Case{"usr/lib", "VERSION_ID=12\r\nBUILD_ID=\"2\\\"", "12", "2\\"}}) {
+    SetUp();
+    testRoot().write(file + std::string("/os-release"), text);
+    EXPECT_EQ(QNCopyAnswer("ProductVersion"), version) << text;
+    EXPECT_EQ(QNCopyAnswer("BuildVersion"), build) << text;
+  }
+  testRoot().write("etc/os-release", "ID=x\n");
+  EXPECT_EQ(QNCopyAnswer("ProductVersion"), std::nullopt) << "the first of both files counts";
 }
 
 TEST_F(Device, IgnoresFactsThatAreNone) {
   testRoot().write("etc/os-release", "VERSION_ID=12\n");
-  for (const std::string& fact :
-       {std::string(), std::string(129, 'x'), std::string("a\\nb"), std::string("a\\u0000")}) {
-    testRoot().write(kFacts, "ProductVersion = \"" + fact + "\"\n");
-    EXPECT_EQ(QNCopyAnswer("ProductVersion"), "12") << fact;
+  for (const auto& [fact, answer] :
+       std::map<std::string, std::string>{{"\"\"", "12"},
+                                          {'"' + std::string(129, 'x') + '"', "12"},
+                                          {'"' + std::string(128, 'x') + '"', std::string(128, 'x')},
+                                          {"\"a\\nb\"", "12"},
+                                          {"\"a\\u0000\"", "12"},
+                                          {"\"\\u001f\"", "12"},
+                                          {"\"\\u007f\"", "12"},
+                                          {"\" \"", " "},
+                                          {"2210", "2210"},
+                                          {"[1]", "12"}}) {
+    testRoot().write(kFacts, "ProductVersion = " + fact + "\n");
+    EXPECT_EQ(QNCopyAnswer("ProductVersion"), answer) << fact;
   }
-  testRoot().write(kFacts, "ProductVersion = \"" + std::string(128, 'x') + "\"\n");
-  EXPECT_EQ(QNCopyAnswer("ProductVersion"), std::string(128, 'x'));
 }
 
 TEST_F(Device, HasAnIdentifierThatIsDerivedFromItsMachineID) {
-  std::set<std::string> identifiers;
-  for (const char* machineID : {"0123456789abcdef0123456789abcdef\n", "0123456789abcdef0123456789abcdee\n"}) {
+  // The first 20 bytes of SHA-256 over the label "com.corvane.veskreportingd device identifier 1\n" and the
+  // ID.
+  const std::pair<const char*, std::optional<std::string>> cases[] = {
+      {"0123456789abcdef0123456789abcdef\n", "eb6b97fad7d9e901b07a262443f0076e84220993"},
+      {"0123456789ABCDEF0123456789abcdef", "eb6b97fad7d9e901b07a262443f0076e84220993"},
+      {"0123456789abcdef0123456789abcdee\n", "fb732696786bcd01ab8992021762846055100372"},
+      {"uninitialized\n", std::nullopt},
+      {"", std::nullopt},
+      {"0123456789abcdef0123456789abcde\n", std::nullopt},
+      {"0123456789abcdef0123456789abcdefa\n", std::nullopt},
+      {"0123456789abcdef0123456789abcdeg\n", std::nullopt},
+  };
+  for (const auto& [machineID, identifier] : cases) {
     testRoot().write("etc/machine-id", machineID);
-    const std::string identifier = QNCopyAnswer("UniqueDeviceID").value_or("");
-    EXPECT_EQ(identifier.size(), 40u);
-    EXPECT_EQ(identifier.find_first_not_of("0123456789abcdef"), std::string::npos);
-    EXPECT_EQ(QNCopyAnswer("UniqueDeviceID"), identifier);
-    EXPECT_EQ(identifier.find("0123456789abcd"), std::string::npos);
-    identifiers.insert(identifier);
-  }
-  EXPECT_EQ(identifiers.size(), 2u);
-  for (const char* none : {"uninitialized\n", "", "0123456789abcdef\n"}) {
-    testRoot().write("etc/machine-id", none);
-    EXPECT_EQ(QNCopyAnswer("UniqueDeviceID"), std::nullopt) << none;
+    EXPECT_EQ(QNCopyAnswer("UniqueDeviceID"), identifier) << machineID;
   }
 }
 
 TEST_F(Device, CopiesItsIdentifierIntoABuffer) {
-  char buffer[41] = "untouched";
-  copyUniqueDeviceID(buffer, sizeof buffer);
-  EXPECT_STREQ(buffer, "untouched");
+  const std::string kept(50, 'x');
   const std::string identifier(40, 'a');
-  testRoot().write(kFacts, "UniqueDeviceID = \"" + identifier + "\"\n");
-  std::memset(buffer, 'x', sizeof buffer);
-  copyUniqueDeviceID(buffer, sizeof buffer);
-  EXPECT_EQ(buffer, identifier);
-  char cramped[] = "12345678|behind";
-  copyUniqueDeviceID(cramped, 8);
-  EXPECT_STREQ(cramped, "");
-  EXPECT_STREQ(cramped + 8, "|behind");
-  copyUniqueDeviceID(nullptr, 0);
+  const std::string facts = "UniqueDeviceID = \"" + identifier + "\"\n";
+  // The buffer to its own end and one byte more.
+  using Case = std::tuple<std::string, std::size_t, std::string>;
+  for (const auto& [fact, size, after] :
+       {Case{"", 41, kept.substr(0, 42)}, Case{facts, 41, identifier + '\0' + 'x'},
+        Case{facts, 43, identifier + '\0' + 'x' + '\0' + 'x'},
+        Case{facts, 40, '\0' + kept.substr(0, 38) + '\0' + 'x'}, Case{facts, 1, std::string("\0x", 2)},
+        Case{facts, 0, "x"}}) {
+    testRoot().write(kFacts, fact);
+    std::string buffer = kept;
+    copyUniqueDeviceID(buffer.data(), size);
+    EXPECT_EQ(buffer.substr(0, size + 1), after) << size;
+  }
 }
 
 TEST_F(Device, KnowsItsRegion) {
@@ -126,15 +182,12 @@ TEST_F(Device, KnowsItsOffsetFromGMT) {
 }
 
 TEST_F(Device, HasNoConsentUnlessItWasGiven) {
-  const auto consent = [](const char* preference) {
-    testRoot().write("etc/veskreporting/preferences/com.corvane.veskreporting.toml", preference);
-    return diagnosticsSubmissionConsent();
-  };
-  EXPECT_FALSE(diagnosticsSubmissionConsent());
-  EXPECT_TRUE(consent("diagnosticsSubmission = true\n"));
-  EXPECT_FALSE(consent("diagnosticsSubmission = false\n"));
-  EXPECT_FALSE(consent("diagnosticsSubmission = \"true\"\n"));
-  EXPECT_FALSE(consent("diagnosticsSubmission = 1\n"));
+  for (const auto& [preference, consents] : std::map<const char*, bool>{
+           {"", false}, {"= true", true}, {"= false", false}, {"= \"true\"", false}, {"= 1", false}}) {
+    testRoot().write("etc/veskreporting/preferences/com.corvane.veskreporting.toml",
+                     *preference ? std::string("diagnosticsSubmission ") + preference + "\n" : "");
+    EXPECT_EQ(diagnosticsSubmissionConsent(), consents) << preference;
+  }
 }
 
 TEST_F(Device, RunsAnInternalBuildOnlyWhenItSaysSoAndForGood) {
@@ -153,10 +206,44 @@ TEST_F(Device, RunsAnInternalBuildOnlyWhenItSaysSoAndForGood) {
 }
 
 TEST(ReportingdUtil, BuildsTheCorrelationKey) {
-  EXPECT_EQ(correlationKeyForUserInfo({{"clientName", "MyApp"}, {"serviceName", "Calls"}}), "myapp:calls");
-  EXPECT_EQ(correlationKeyForUserInfo({{"serviceName", "ÄCalls"}}), ":äcalls");
-  EXPECT_EQ(correlationKeyForUserInfo({{"clientName", 5}, {"other", "x"}}), ":");
-  EXPECT_EQ(correlationKeyForUserInfo({}), ":");
+  const std::pair<Dictionary, const char*> cases[] = {
+      {{{"clientName", "MyApp"}, {"serviceName", "Calls"}}, "myapp:calls"},
+      {{{"serviceName", "ÄCalls"}}, ":äcalls"},
+      {{{"clientName", "ΑΣ"}, {"serviceName", "İ:ẞ"}}, "ας:i̇:ß"},
+      {{{"clientName", ""}}, ":"},
+      {{{"clientName", 5}, {"serviceName", Value()}, {"ClientName", "x"}}, ":"},
+      {{}, ":"},
+  };
+  for (const auto& [userInfo, key] : cases) EXPECT_EQ(correlationKeyForUserInfo(userInfo), key);
+}
+
+TEST(ReportingdUtil, ConvertsTimesAndNumbers) {
+  const std::pair<timeval, double> times[] = {{{1, 500'000}, 1.5},
+                                              {{0, 1}, 1e-6},
+                                              {{-2, 250'000}, -1.75},
+                                              {{2'147'483'647, 999'999}, 2147483647.999999}};
+  for (const auto& [time, seconds] : times) EXPECT_EQ(secondsFromTimeval(time), seconds);
+  const std::pair<double, double> numbers[] = {{NAN, -1.0},  {HUGE_VAL, -1.0}, {-HUGE_VAL, -1.0},
+                                               {3.25, 3.25}, {-1.0, -1.0},     {0.0, 0.0}};
+  for (const auto& [number, shown] : numbers) EXPECT_EQ(finiteOrMinusOne(number), shown) << number;
+}
+
+TEST(ReportingdUtil, EncodesWhatAQueryMayNotHold) {
+  const std::string unreserved =
+      "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789-._~!$&'()*+,;=:@/?";
+  EXPECT_EQ(encodedForURLQuery(unreserved), unreserved);
+  EXPECT_EQ(encodedForURLQuery(" #%[]\"\\\n<>^`{|}\x7f\xc3\xa9"),
+            "%20%23%25%5B%5D%22%5C%0A%3C%3E%5E%60%7B%7C%7D%7F%C3%A9");
+  EXPECT_EQ(encodedForURL(unreserved + "#[]%20 \"\xc3\xa9"), unreserved + "#[]%20%20%22%C3%A9");
+}
+
+TEST(ReportingdUtil, KnowsWebURLs) {
+  for (const char* url : {"http://h", "HTTPS://[::1]:8443/a?b=c#d", "https://user@h/%20(-._~!$&'*+,;=)"})
+    EXPECT_TRUE(isWebURL(url)) << url;
+  for (const char* url :
+       {"", "http://", "https://", "http:///x", "http://?x", "http://#", "http://:80/", "ftp://h", "//h",
+        "https//h", "http://h/a b", "http://h/\"", "http://h/\xc3\xa9", "xhttp://h"})
+    EXPECT_FALSE(isWebURL(url)) << url;
 }
 
 }  // namespace

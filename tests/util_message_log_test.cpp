@@ -1,214 +1,401 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 
-#include <atomic>
+#include <csignal>
+#include <functional>
+#include <map>
 #include <set>
 #include <thread>
 
 #include "tests/support/CapturedLog.h"
-#include "tests/support/TempDirectory.h"
+#include "tests/support/TestRoot.h"
 #include "util/MessageLog.h"
 
 namespace vesk::test {
 namespace {
 
+namespace fs = std::filesystem;
+using std::chrono::hours;
 using std::chrono::microseconds;
 using std::chrono::seconds;
+using Names = std::set<std::string>;
+using Lines = std::vector<std::pair<int, std::string>>;
+
+constexpr char kFirst[] = "veskreportingd_1795552289_messageLog.diag";
 
 class SetClock final : public WallClock {
  public:
-  WallTime now() const override { return time.load(); }
-  std::atomic<WallTime> time{WallTime(seconds(1'795'552'289))};
+  WallTime now() const override { return time; }
+  WallTime time{seconds(1'795'552'289)};
 };
 
-WallTime birth(const std::filesystem::path& path) {
+WallTime birth(const fs::path& path) {
   struct statx status {};
-  EXPECT_EQ(::statx(AT_FDCWD, path.c_str(), 0, STATX_BTIME, &status), 0);
+  EXPECT_EQ(::statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BTIME, &status), 0);
   return WallTime(seconds(status.stx_btime.tv_sec) + microseconds(status.stx_btime.tv_nsec / 1000));
 }
 
 class MessageLogTest : public testing::Test {
  protected:
-  std::set<std::string> files() const {
-    std::set<std::string> names;
-    for (const auto& entry : std::filesystem::directory_iterator(_logs))
-      names.insert(entry.path().filename());
+  Names files() const {
+    Names names;
+    for (const auto& entry : fs::directory_iterator(_logs)) names.insert(entry.path().filename());
     return names;
   }
   std::string path(const std::string& name) const { return (_logs / name).string(); }
   std::string read(const std::string& name) const { return _root.read("logs/" + name); }
-  static std::string fileName(WallTime time) {
-    return "veskreportingd_" + std::to_string(std::chrono::floor<seconds>(time).time_since_epoch().count()) +
-           "_messageLog.diag";
-  }
-  /// An empty log file that is younger than `than`.
-  std::string makeYounger(const std::string& name, WallTime than) const {
+  void make(const std::string& name) const { _root.write("logs/" + name, "before\n"); }
+  /// Makes the file again until it is born that way compared to `other`.
+  void makeUntil(const std::string& name, const std::string& other, bool isYounger) const {
     do {
-      std::filesystem::remove(_logs / name);
-      _root.write("logs/" + name, "");
-    } while (birth(_logs / name) <= than);
-    return name;
+      fs::remove(_logs / (isYounger ? name : other));
+      fs::remove(_logs / name);
+      if (!isYounger) make(other);
+      make(name);
+    } while (isYounger == (birth(_logs / name) == birth(_logs / other)));
+  }
+  std::string deleted(const std::string& name, const std::string& date) const {
+    return "writeToLogFile: Deleted expired veskreportingd log file " + path(name) + " (" + date + ")";
+  }
+  /// The directory looks as if its last change had been that long ago.
+  void setAge(seconds age) const {
+    const auto when = std::chrono::system_clock::now() - age;
+    const timespec time{std::chrono::system_clock::to_time_t(when), 0};
+    const timespec times[] = {time, time};
+    ASSERT_EQ(::utimensat(AT_FDCWD, _logs.c_str(), times, 0), 0);
+  }
+  bool isOpen(const std::string& name) const {
+    std::error_code gone;
+    for (const auto& entry : fs::directory_iterator("/proc/self/fd"))
+      if (fs::read_symlink(entry, gone) == path(name)) return true;
+    return false;
+  }
+  std::uint64_t lost() const {
+    std::uint64_t sum = 0;
+    for (const auto& count : _counters.snapshot())
+      if (count.backend == "message-log" && count.reason == DropReason::NotRecorded) sum += count.count;
+    return sum;
+  }
+  /// Files take no more than 20 bytes meanwhile.
+  void writeWithoutRoom(MessageLog& log) const {
+    ::signal(SIGXFSZ, SIG_IGN);
+    rlimit before{};
+    ::getrlimit(RLIMIT_FSIZE, &before);
+    const rlimit full{20, before.rlim_max};
+    ::setrlimit(RLIMIT_FSIZE, &full);
+    log.write("this line is lost");
+    ::setrlimit(RLIMIT_FSIZE, &before);
   }
 
   TempDirectory _root;
-  std::filesystem::path _logs = _root / "logs";
+  fs::path _logs = _root / "logs";
   SetClock _clock;
-  MessageLog _log{_logs.string(), _clock};
+  Counters _counters;
+  MessageLog _log{_logs.string(), _clock, {.maximumBytes = 1000, .counters = &_counters}};
   CapturedLog _lines;
 };
 
 TEST_F(MessageLogTest, StartsOneFileAndAppendsToIt) {
   _log.write("first");
-  _clock.time = _clock.time.load() + seconds(90);
+  _clock.time += seconds(90);
   _log.write("second\nwith two lines");
-  const std::string name = "veskreportingd_1795552289_messageLog.diag";
-  EXPECT_EQ(files(), std::set<std::string>{name});
-  EXPECT_EQ(read(name),
+  EXPECT_EQ(files(), Names{kFirst});
+  EXPECT_EQ(read(kFirst),
             "(2026-11-24 20:31:29 +0000) first\n(2026-11-24 20:32:59 +0000) second\nwith two lines\n");
-  const std::string created = logDate(birth(_logs / name));
-  const std::vector<std::pair<int, std::string>> expected = {
-      {6, "writeToLogFile: Creating veskreportingd log directory at " + _logs.string()},
-      {6, "writeToLogFile: Created new veskreportingd log file " + path(name) + " (" + created + ")"},
-      {6, "writeToLogFile: Saved log message to " + path(name)},
-      {6, "writeToLogFile: Saved log message to " + path(name)},
-  };
-  EXPECT_EQ(_lines.lines(), expected);
-  struct stat status {};
-  ASSERT_EQ(::stat(path(name).c_str(), &status), 0);
-  EXPECT_EQ(status.st_mode & 0137, 0u);
+  const std::string created = path(kFirst) + " (" + logDate(birth(_logs / kFirst)) + ")";
+  EXPECT_EQ(_lines.lines(),
+            (Lines{{6, "writeToLogFile: Creating veskreportingd log directory at " + _logs.string()},
+                   {6, "writeToLogFile: Created new veskreportingd log file " + created},
+                   {6, "writeToLogFile: Saved log message to " + path(kFirst)},
+                   {6, "writeToLogFile: Saved log message to " + path(kFirst)}}));
+  EXPECT_EQ(fs::status(_logs).permissions(), fs::perms(0750) & ~fs::perms(0022));
+  EXPECT_EQ(fs::status(_logs / kFirst).permissions(), fs::perms(0640) & ~fs::perms(0022));
+}
+
+TEST_F(MessageLogTest, NamesAFileAfterTheSecondIn32Bits) {
+  for (const auto& [time, number] :
+       std::map<microseconds, const char*>{{microseconds(1'999'999), "1"},
+                                           {microseconds(-1'999'999), "-1"},
+                                           {seconds(2'147'483'647), "2147483647"},
+                                           {seconds(2'147'483'648), "-2147483648"},
+                                           {seconds(4'294'967'301), "5"}}) {
+    fs::remove_all(_logs);
+    _clock.time = WallTime(time);
+    _log.write("message");
+    EXPECT_EQ(files(), Names{std::string("veskreportingd_") + number + "_messageLog.diag"});
+  }
 }
 
 TEST_F(MessageLogTest, ReplacesAFileOlderThanADay) {
   const std::string old = "veskreportingd_whatever_messageLog.diag";
-  _root.write("logs/" + old, "kept so far\n");
-  const WallTime created = birth(_logs / old);
-  _clock.time = created + seconds(86'400);
-  _log.write("on the edge");
-  EXPECT_EQ(files(), std::set<std::string>{old});
-  _clock.time = created + seconds(86'400) + microseconds(1);
-  _log.write("beyond it");
-  EXPECT_EQ(files(), std::set<std::string>{fileName(_clock.time.load())});
-  EXPECT_EQ(_lines.count(6, "writeToLogFile: Deleted expired veskreportingd log file " + path(old) + " (" +
-                                logDate(created) + ")"),
-            1);
+  for (bool staysOpen : {false, true}) {
+    fs::remove_all(_logs);
+    make(old);
+    const WallTime created = birth(_logs / old);
+    setAge(staysOpen ? hours(1) : hours(-1));
+    _clock.time = created + seconds(86'400);
+    _log.write("on the edge");
+    EXPECT_EQ(isOpen(old), staysOpen);
+    EXPECT_EQ(files(), Names{old});
+    EXPECT_EQ(read(old), "before\n(" + logDate(_clock.time) + ") on the edge\n");
+    _clock.time += microseconds(1);
+    _lines.clear();
+    _log.write("beyond it");
+    const auto second = std::chrono::floor<seconds>(_clock.time).time_since_epoch().count();
+    EXPECT_EQ(files(), Names{"veskreportingd_" + std::to_string(second) + "_messageLog.diag"});
+    EXPECT_EQ(_lines.lines().at(0), std::make_pair(6, deleted(old, logDate(created))));
+  }
+}
+
+TEST_F(MessageLogTest, KeepsTheNewestOfItsFiles) {
+  const std::string names[] = {"veskreportingd_9_messageLog.diag", "veskreportingd_5_messageLog.diag",
+                               "veskreportingd__messageLog.diag"};
+  make(names[0]);
+  makeUntil(names[1], names[0], true);
+  makeUntil(names[2], names[1], true);
+  _clock.time = birth(_logs / names[2]);
+  const std::string dates[] = {logDate(birth(_logs / names[0])), logDate(birth(_logs / names[1]))};
+  _log.write("message");
+  EXPECT_EQ(files(), Names{names[2]});
+  for (int i : {0, 1}) EXPECT_EQ(_lines.count(6, deleted(names[i], dates[i])), 1);
+
+  fs::remove_all(_logs);
+  makeUntil(names[1], names[0], false);
+  const std::string listed = fs::directory_iterator(_logs)->path().filename();
+  _log.write("message");
+  EXPECT_EQ(files(), Names{listed}) << "of two that are as old as each other, the one that is listed first";
+}
+
+TEST_F(MessageLogTest, AFileOfUnknownDateGivesWay) {
+  // A path that is too long hides a file's date from the log, and keeps the log from deleting the file.
+  fs::path deep = _root.path();
+  while (deep.native().size() < 3800) deep /= std::string(100, 'd');
+  deep /= std::string(4094 - deep.native().size() - sizeof kFirst, 'd');
+  fs::create_directories(deep);
+  const int directory = ::open(deep.c_str(), O_DIRECTORY | O_CLOEXEC);
+  MessageLog log(deep.string(), _clock, {.counters = &_counters});
+  for (const char* middle : {"a", "b", "c", "d", "", "e", "f", "g"}) {
+    const std::string name =
+        *middle ? "veskreportingd_" + std::string(90, 'x') + middle + "_messageLog.diag" : kFirst;
+    ::close(::openat(directory, name.c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, 0600));
+  }
+  long behind = -1;
+  for (const auto& entry : fs::directory_iterator(deep))
+    if (behind >= 0 || entry.path().filename() == kFirst) ++behind;
+  for (int i = 1; i <= 2; ++i) {
+    log.write("message");
+    EXPECT_EQ(_lines.countContaining(6, "(unknown date)"), i * behind);
+    EXPECT_EQ(_lines.count(6, "writeToLogFile: Saved log message to " + (deep / kFirst).string()), i);
+  }
+  ::unlinkat(directory, kFirst, 0);
+  _lines.clear();
+  log.write("message");
+  EXPECT_EQ(_lines.countContaining(6, "_messageLog.diag (unknown date)"), 1) << "the last, which fails";
+  EXPECT_EQ(_lines.lines().size(), 1u);
+  EXPECT_EQ(lost(), 1u);
+  ::close(directory);
 }
 
 TEST_F(MessageLogTest, WithoutABirthTimeAFileIsAsOldAsItsNameSays) {
   struct statx status {};
-  status.stx_btime.tv_sec = 1000;
-  status.stx_mtime.tv_sec = 2000;
-  struct Case {
-    unsigned mask;
-    std::string name;
-    std::optional<WallTime> created;
-  };
-  const std::string number = "veskreportingd_1795552289_messageLog.diag";
-  const std::string late = "veskreportingd_-2147483648_messageLog.diag";
-  const std::string text = "veskreportingd_1x_messageLog.diag";
-  for (const auto& test : {Case{STATX_BTIME | STATX_MTIME, number, WallTime(seconds(1000))},
-                           Case{STATX_MTIME, number, WallTime(seconds(1'795'552'289))},
-                           Case{STATX_MTIME, late, WallTime(seconds(2'147'483'648))},
-                           Case{STATX_MTIME, text, WallTime(seconds(2000))}, Case{0, text, std::nullopt}}) {
-    status.stx_mask = test.mask;
-    EXPECT_EQ(logFileCreationDate(status, test.name), test.created) << test.mask << test.name;
+  status.stx_btime = {1000, 2'999, 0};
+  status.stx_mtime = {2000, 0, 0};
+  using Case = std::tuple<unsigned, const char*, std::optional<WallTime>>;
+  for (const auto& [mask, middle, created] :
+       {Case{STATX_BTIME | STATX_MTIME, "1", WallTime(seconds(1000) + microseconds(2))},
+        Case{STATX_MTIME, "1795552289", WallTime(seconds(1'795'552'289))},
+        Case{STATX_MTIME, "-2147483648", WallTime(seconds(2'147'483'648))},
+        Case{STATX_MTIME, "x", WallTime(seconds(2000))}, Case{STATX_MTIME, "1x", WallTime(seconds(2000))},
+        Case{0, "1x", std::nullopt}}) {
+    status.stx_mask = mask;
+    const std::string name = "veskreportingd_" + std::string(middle) + "_messageLog.diag";
+    EXPECT_EQ(logFileCreationDate(status, name), created) << mask << middle;
   }
+}
+
+TEST_F(MessageLogTest, TouchesNothingElse) {
+  const Names others = {"veskreportingd_messageLog.diag",
+                        "veskreportingd_1_2_messageLog.diag",
+                        "x_1_messageLog.diag",
+                        "veskreportingd",
+                        "veskreportingd_1_messageLog.txt",
+                        "veskreportingd_1_messageLog.diag_",
+                        "xveskreportingd_1_messageLog.diag"};
+  for (const auto& name : others) make(name);
+  fs::create_directory(_logs / "veskreportingd_1_messageLog.diag");
+  for (int i = 0; i < 2; ++i) _log.write("message");
+  for (const auto& name : others) EXPECT_EQ(read(name), "before\n");
+  EXPECT_TRUE(fs::is_directory(_logs / "veskreportingd_1_messageLog.diag")) << "no file of the log's";
+  EXPECT_EQ(files().size(), others.size() + 2);
+  EXPECT_EQ(_lines.countContaining(6, "Deleted"), 0);
+  EXPECT_EQ(_lines.count(6, "writeToLogFile: Saved log message to " + path(kFirst)), 2);
+}
+
+TEST_F(MessageLogTest, SeesWhatHappensToItsFileBetweenTwoLines) {
+  const std::string other = "veskreportingd_2_messageLog.diag";
+  const std::string one = "before\n(2026-11-24 20:31:29 +0000) one\n";
+  struct Case {
+    std::function<void()> happens;
+    std::string file;   // that gets the next line
+    std::string start;  // of that file
+  };
+  const Case cases[] = {
+      {[] {}, kFirst, one},
+      {[&] { fs::remove(_logs / kFirst); }, kFirst, ""},
+      {[&] { fs::rename(_logs / kFirst, _logs / other); }, other, one},
+      {[&] { fs::rename(_root.write("new", "new\n"), _logs / kFirst); }, kFirst, "new\n"},
+      {[&] { makeUntil(other, kFirst, true); }, other, "before\n"},
+      {[&] { fs::remove_all(_logs); }, kFirst, ""},
+      {[&] {
+         fs::remove_all(_root / "elsewhere");
+         fs::rename(_logs, _root / "elsewhere");
+         make(other);
+       },
+       other, "before\n"},
+      {[&] { writeWithoutRoom(_log); }, kFirst, ""},
+  };
+  int number = 0;
+  for (const auto& test : cases) {
+    for (bool staysOpen : {true, false}) {
+      SCOPED_TRACE(number++);
+      fs::remove_all(_logs);
+      make(kFirst);
+      setAge(staysOpen ? hours(1) : hours(-1));
+      _log.write("one");
+      EXPECT_EQ(isOpen(kFirst), staysOpen);
+      test.happens();
+      _log.write("two");
+      EXPECT_EQ(files(), Names{test.file});
+      EXPECT_EQ(read(test.file), test.start + "(2026-11-24 20:31:29 +0000) two\n");
+    }
+  }
+  EXPECT_EQ(lost(), 2u) << "without room";
+}
+
+TEST_F(MessageLogTest, EveryLineThatIsLostIsCountedAndSaidWhy) {
+  const std::string failed = "writeToLogFile: Failed to create new veskreportingd log file ";
+  const std::string notHere = _root.write("file", "untouched").string();
+  FileDescriptor reader;
+  struct Case {
+    std::string directory;
+    std::function<void()> prepare;
+    Lines lines;  // none: the file is deleted
+  };
+  const Case cases[] = {
+      {notHere,
+       [] {},
+       {{3, "writeToLogFile: Error reading from log directory: Not a directory"},
+        {3, failed + notHere + "/" + kFirst}}},
+      {"/proc/vesk/logs",
+       [] {},
+       {{6, "writeToLogFile: Creating veskreportingd log directory at /proc/vesk/logs"},
+        {3, failed + "/proc/vesk/logs/" + kFirst}}},
+      {_logs, [&] { fs::create_directories(_logs / kFirst); }, {{3, failed + path(kFirst)}}},
+      {_logs, [&] { fs::create_symlink(notHere, _logs / kFirst); }, {}},
+      {_logs, [&] { fs::create_symlink(_root.path(), _logs / kFirst); }, {}},
+      {_logs, [&] { ::mkfifo(path(kFirst).c_str(), 0600); }, {}},
+      {_logs,
+       [&] {
+         ::mkfifo(path(kFirst).c_str(), 0600);
+         reader = FileDescriptor(::open(path(kFirst).c_str(), O_RDWR | O_CLOEXEC));
+       },
+       {}},
+      {_logs, [&] { make(kFirst); }, {}},
+  };
+  std::uint64_t count = 0;
+  for (const auto& test : cases) {
+    SCOPED_TRACE(++count);
+    fs::remove_all(_logs);
+    fs::create_directory(_logs);
+    test.prepare();
+    Lines lines = test.lines;
+    if (lines.empty()) lines = {{6, deleted(kFirst, logDate(birth(_logs / kFirst)))}};
+    _lines.clear();
+    MessageLog log(test.directory, _clock, {.counters = &_counters});
+    writeWithoutRoom(log);
+    EXPECT_EQ(_lines.lines(), lines);
+    EXPECT_EQ(lost(), count);
+    if (test.lines.empty()) EXPECT_EQ(files(), Names{});
+  }
+  EXPECT_EQ(_root.read("file"), "untouched");
 }
 
 TEST_F(MessageLogTest, AFileThatIsFullTakesNoMore) {
-  Counters counters;
-  MessageLog log(_logs.string(), _clock, {.maximumBytes = 100, .counters = &counters});
+  MessageLog log(_logs.string(), _clock, {.maximumBytes = 98, .counters = &_counters});
   for (int i = 0; i < 4; ++i) log.write("a line of 20 letters");
-  const std::string name = *files().begin();
-  EXPECT_EQ(read(name).size(), 98u);
-  ASSERT_EQ(counters.snapshot().size(), 1u);
-  EXPECT_EQ(counters.snapshot()[0].reason, DropReason::NotRecorded);
-  EXPECT_EQ(counters.snapshot()[0].count, 2u);
-  EXPECT_EQ(_lines.count(4, "writeToLogFile: No room in " + path(name) + " until it expires; lines are lost"),
-            1);
-}
-
-TEST_F(MessageLogTest, KeepsTheNewestFileOnly) {
-  std::string newest = "veskreportingd_9_messageLog.diag";
-  _root.write("logs/" + newest, "");
-  for (const char* name : {"veskreportingd_5_messageLog.diag", "veskreportingd__messageLog.diag"}) {
-    newest = makeYounger(name, birth(_logs / newest));
-  }
-  _clock.time = birth(_logs / newest);
-  _log.write("message");
-  EXPECT_EQ(files(), std::set<std::string>{newest});
-  EXPECT_EQ(_lines.countContaining(6, "writeToLogFile: Deleted expired veskreportingd log file "), 2);
-}
-
-TEST_F(MessageLogTest, LeavesOtherFilesAlone) {
-  const std::set<std::string> others = {
-      "veskreportingd_messageLog.diag", "veskreportingd_1_2_messageLog.diag", "other_1_messageLog.diag",
-      "veskreportingd_1_messageLog.txt", "veskreportingd_1_messageLog.diag_"};
-  for (const auto& name : others) _root.write("logs/" + name, "theirs");
-  _log.write("message");
-  for (const auto& name : others) EXPECT_EQ(read(name), "theirs");
-  EXPECT_EQ(files().size(), others.size() + 1);
-}
-
-TEST_F(MessageLogTest, FollowsNoLinkOutOfItsDirectory) {
-  _root.write("victim", "untouched");
-  std::filesystem::create_directory(_logs);
-  const std::string link = "veskreportingd_1_messageLog.diag";
-  std::filesystem::create_symlink(_root / "victim", _logs / link);
-  _log.write("lost");
-  EXPECT_EQ(_root.read("victim"), "untouched");
-  EXPECT_EQ(files(), std::set<std::string>{});
+  EXPECT_EQ(read(kFirst).size(), 98u);
+  EXPECT_EQ(lost(), 2u);
   EXPECT_EQ(
-      _lines.countContaining(6, "writeToLogFile: Deleted expired veskreportingd log file " + path(link)), 1);
-  EXPECT_EQ(_lines.countContaining(6, "writeToLogFile: Saved"), 0);
-  _log.write("saved");
-  EXPECT_EQ(files().size(), 1u);
+      _lines.count(4, "writeToLogFile: No room in " + path(kFirst) + " until it expires; lines are lost"), 1);
+  EXPECT_EQ(_lines.countContaining(6, "Saved"), 2);
 }
 
 TEST_F(MessageLogTest, NeitherMixesNorLosesLinesOfSeveralThreads) {
-  constexpr int kThreads = 4;
-  constexpr int kLines = 50;
   std::vector<std::thread> threads;
-  for (int i = 0; i < kThreads; ++i) {
-    threads.emplace_back([&, i] {
+  for (char letter : {'a', 'b', 'c', 'd'}) {
+    threads.emplace_back([this, letter] {
       MessageLog log(_logs.string(), _clock);
-      for (int k = 0; k < kLines; ++k) log.write(std::string(2000, static_cast<char>('a' + i)));
+      for (int k = 0; k < 50; ++k) log.write(std::string(2000, letter));
     });
   }
   for (auto& thread : threads) thread.join();
   ASSERT_EQ(files().size(), 1u);
   std::istringstream text(read(*files().begin()));
-  std::string line;
   int count = 0;
-  for (; std::getline(text, line); ++count) {
-    ASSERT_EQ(line.size(), 2000 + std::string("(2026-11-24 20:31:29 +0000) ").size());
-    EXPECT_EQ(std::count(line.begin(), line.end(), line.back()), 2000);
+  for (std::string line; std::getline(text, line); ++count) {
+    ASSERT_EQ(line.substr(28), std::string(2000, line.back()));
   }
-  EXPECT_EQ(count, kThreads * kLines);
+  EXPECT_EQ(count, 200);
 }
 
 TEST(LogFormat, ShowsEveryValueByItsOwnType) {
-  const auto format = [](std::string_view text, std::vector<LogArgument> arguments = {}) {
-    return formatLogMessage(text, arguments);
+  struct Case {
+    const char* format;
+    std::vector<LogArgument> arguments;
+    std::string shown;
   };
-  const std::optional<std::string> none;
-  EXPECT_EQ(format("[%@ -> %@] %@", {"a", std::string_view("b"), none}), "[a -> b] (null)");
-  EXPECT_EQ(format("%@ %@ %@ %@", {1, UINT64_MAX, -2.5, true}), "1 18446744073709551615 -2.5 1");
-  EXPECT_EQ(format("%d %5d|%-5d|%05d", {-1, 2, 3, 4}), "-1     2|3    |00004");
-  EXPECT_EQ(format("%u %x %#X %llu %ld", {7u, 255, 255u, UINT64_MAX, -1L}),
-            "7 ff 0XFF 18446744073709551615 -1");
-  EXPECT_EQ(format("%.2f %g %f", {1.005, 0.5, 3}), "1.00 0.5 3.000000");
-  EXPECT_EQ(format("100%% %@%%", {"x"}), "100% x%");
-  // What does not fit still shows its value, and nothing reads what is not there.
-  EXPECT_EQ(format("%d %f %s", {"text", "text", 5}), "text text 5");
-  EXPECT_EQ(format("%d %u", {1.5, -1}), "1.5 -1");
-  EXPECT_EQ(format("%@ %@ %d", {"one"}), "one %@ %d");
-  EXPECT_EQ(format("%@", {"one", "two"}), "one");
-  EXPECT_EQ(format("%", {"x"}), "%");
-  EXPECT_EQ(format("%n %p %*d", {"x", "y", 1}), "%n %p %*d");
-  EXPECT_EQ(format("%999999999999d", {1}).size(), 256u);
-  EXPECT_EQ(format("%.99999f", {1e300}).substr(0, 3), "100");
-  EXPECT_EQ(format("%@", {"%@ %s %n"}), "%@ %s %n");
+  const std::string blanks(255, ' ');
+  const std::vector<LogArgument> x{"x"};
+  const Case cases[] = {
+      {"[%@ -> %@] %@", {"a", std::string_view("b"), std::optional<std::string>()}, "[a -> b] (null)"},
+      {"%@ %@ %@ %@", {1, UINT64_MAX, -2.5, true}, "1 18446744073709551615 -2.5 1"},
+      {"%s %@ %@ %@",
+       {5, INT64_MIN, 0.1, static_cast<const char*>(nullptr)},
+       "5 -9223372036854775808 0.1 (null)"},
+      {"%d %5d|%-5d|%05d|%+d|% d %i", {-1, 2, 3, 4, 5, 6, 7}, "-1     2|3    |00004|+5| 6 7"},
+      {"%u %x %#X %o %.3d", {7u, 255, 255u, 8, 7}, "7 ff 0XFF 10 007"},
+      {"%llu %ld %hhd %qd %jd %zd %td",
+       {UINT64_MAX, -1L, 300, 1, 2, 3, 4},
+       "18446744073709551615 -1 300 1 2 3 4"},
+      {"%.2f %g %f %F %e %E %G",
+       {1.005, 0.5, 3, 2u, 1.0, 2, 1e-9},
+       "1.00 0.5 3.000000 2.000000 1.000000e+00 2.000000E+00 1E-09"},
+      {"100%% %@%%", x, "100% x%"},
+      // What does not fit still shows its value, and nothing reads what is not there.
+      {"%d %f %x", {"text", "text", "text"}, "text text text"},
+      {"%d %u %x %d", {1.5, -1, -1, UINT64_MAX}, "1.5 -1 ffffffffffffffff 18446744073709551615"},
+      {"%@ %@ %5d|", {"one"}, "one %@ %5d|"},
+      {"%@", {"one", "two"}, "one"},
+      {"%@", {"%@ %s %n"}, "%@ %s %n"},
+      {"%999999999999d", {1}, blanks + "1"},
+      {"%------d|%300d", {1, 2}, "1|" + blanks + "2"},
+      {"%.99999f", {0.0}, "0." + std::string(256, '0')},
+  };
+  for (const auto& test : cases) EXPECT_EQ(formatLogMessage(test.format, test.arguments), test.shown);
+  for (const char* none : {"%", "%5", "%5.", "%-", "%l", "%n %p %*d"})
+    EXPECT_EQ(formatLogMessage(none, x), none);
+  EXPECT_EQ(formatLogMessage("%.256f", std::vector<LogArgument>{1e300}).size(), 558u);
+}
+
+TEST(WriteToLogFile, FormatsALineOfTheProcessSLog) {
+  writeToLogFile("[%@ -> flushMessages] %@ %d", "httpPost", std::string("posted"), 5);
+  writeToLogFile("100%%");
+  const std::string text = testRoot().readAll("var/mobile/Library/Logs/Dunmore/Retired");
+  const std::string start = ") [httpPost -> flushMessages] posted 5\n(";
+  EXPECT_EQ(text.find(start), text.find(')')) << text;
+  EXPECT_EQ(text.substr(text.rfind(')')), ") 100%\n");
 }
 
 }  // namespace

@@ -5,11 +5,11 @@
 #include <unistd.h>
 
 #include <charconv>
+#include <ctime>
 #include <filesystem>
 #include <system_error>
 #include <vector>
 
-#include "platform/files/FileDescriptor.h"
 #include "platform/files/RootPrefix.h"
 #include "platform/files/WriteAll.h"
 #include "platform/log/SystemLog.h"
@@ -24,10 +24,10 @@ constexpr std::string_view kNameStart = "veskreportingd";
 constexpr std::string_view kNameEnd = "messageLog.diag";
 constexpr std::chrono::seconds kExpiryAge{86400};
 
-struct LogFile {
-  std::string path;
-  std::optional<WallTime> created;
-};
+// Longer than any kernel's clock tick: two changes of a directory within one tick leave the same time in it.
+constexpr std::chrono::milliseconds kSettled{100};
+
+using LogFile = MessageLogFile;
 
 bool isLogFileName(std::string_view name) {
   const std::size_t first = name.find('_');
@@ -54,9 +54,12 @@ std::optional<WallTime> dateInName(std::string_view name) {
   return WallTime(std::chrono::seconds(static_cast<std::uint32_t>(seconds)));
 }
 
-std::optional<WallTime> creationDate(const std::string& path) {
+/// Of the file that is open as `descriptor`, or else stands at `path`.
+std::optional<WallTime> creationDate(const std::string& path, int descriptor = -1) {
   struct statx status {};
-  if (::statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BTIME | STATX_MTIME, &status) != 0) {
+  const bool isOpen = descriptor >= 0;
+  if (::statx(isOpen ? descriptor : AT_FDCWD, isOpen ? "" : path.c_str(),
+              isOpen ? AT_EMPTY_PATH : AT_SYMLINK_NOFOLLOW, STATX_BTIME | STATX_MTIME, &status) != 0) {
     return std::nullopt;
   }
   return logFileCreationDate(status, std::string_view(path).substr(path.rfind('/') + 1));
@@ -77,13 +80,21 @@ void createDirectoryWithParents(const std::string& directory) {
   }
 }
 
+/// Whether it is one of the log's files. A directory of such a name can't be: the log never makes one and
+/// could not delete it either.
+bool isLogFile(const std::filesystem::directory_entry& entry) {
+  std::error_code unknown;
+  return isLogFileName(entry.path().filename().native()) &&
+         (entry.is_symlink(unknown) || !entry.is_directory(unknown));
+}
+
 /// Paths of the log files in `directory`, which is created when it is missing.
 std::vector<std::string> listLogFiles(const std::string& directory) {
   std::vector<std::string> paths;
   std::error_code error;
   std::filesystem::directory_iterator entry(directory, error);
   for (; !error && entry != std::filesystem::directory_iterator(); entry.increment(error)) {
-    if (isLogFileName(entry->path().filename().native())) paths.push_back(entry->path().native());
+    if (isLogFile(*entry)) paths.push_back(entry->path().native());
   }
   if (!error) return paths;
   if (error == std::errc::no_such_file_or_directory) {
@@ -130,12 +141,28 @@ std::optional<LogFile> createLogFile(const std::string& directory, WallTime now)
 
 enum class Appended : unsigned char { Yes, No, Full };
 
-Appended append(const std::string& path, std::string_view line, std::int64_t maximumBytes) {
-  FileDescriptor file(::open(path.c_str(), O_WRONLY | O_APPEND | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+Appended append(int file, std::string_view line, std::int64_t maximumBytes) {
   struct stat status {};
-  if (!file || ::fstat(file.get(), &status) != 0) return Appended::No;
+  if (::fstat(file, &status) != 0 || !S_ISREG(status.st_mode)) return Appended::No;
   if (status.st_size + static_cast<std::int64_t>(line.size()) > maximumBytes) return Appended::Full;
-  return writeAll(file.get(), line) == 0 ? Appended::Yes : Appended::No;
+  return writeAll(file, line) == 0 ? Appended::Yes : Appended::No;
+}
+
+std::chrono::nanoseconds sinceEpoch(const timespec& time) {
+  return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
+}
+
+/// Whether any later change of the directory's entries will show in its time.
+bool isSettled(const struct stat& directory) {
+  timespec now{};
+  ::clock_gettime(CLOCK_REALTIME, &now);
+  return sinceEpoch(now) - sinceEpoch(directory.st_mtim) > kSettled;
+}
+
+bool isSameState(const struct stat& one, const struct stat& other) {
+  return one.st_dev == other.st_dev && one.st_ino == other.st_ino &&
+         sinceEpoch(one.st_mtim) == sinceEpoch(other.st_mtim) &&
+         sinceEpoch(one.st_ctim) == sinceEpoch(other.st_ctim);
 }
 
 }  // namespace
@@ -155,34 +182,67 @@ std::optional<WallTime> logFileCreationDate(const struct statx& status, std::str
 MessageLog::MessageLog(std::string directory, const WallClock& clock, const Options& options)
     : _directory(std::move(directory)), _clock(clock), _options(options) {}
 
+MessageLog::Current MessageLog::search(WallTime now) const {
+  Current current;
+  const bool isSettledNow =
+      ::stat(_directory.c_str(), &current.directory) == 0 && isSettled(current.directory);
+  const std::vector<std::string> paths = listLogFiles(_directory);
+  current.file = chooseCurrentFile(paths, now);
+  current.canStay = isSettledNow && current.file && paths.size() == 1;
+  if (!current.file) current.file = createLogFile(_directory, now);
+  if (current.file) {
+    current.descriptor = FileDescriptor(
+        ::open(current.file->path.c_str(), O_WRONLY | O_APPEND | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+  }
+  return current;
+}
+
+bool MessageLog::isStillChosen(const Current& current, WallTime now) const {
+  struct stat directory {};
+  if (!current.canStay || ::stat(_directory.c_str(), &directory) != 0) return false;
+  if (!isSameState(directory, current.directory)) return false;
+  const auto created = creationDate(current.file->path, current.descriptor.get());
+  return created && now - *created <= kExpiryAge;
+}
+
 void MessageLog::write(std::string_view message) try {
   // One lock for all logs: two of them may stand on one directory.
   static Mutex mutex;
   MutexLock lock(mutex);
   const WallTime now = _clock.now();
-  auto file = chooseCurrentFile(listLogFiles(_directory), now);
-  if (!file) file = createLogFile(_directory, now);
-  if (!file) return;
+  if (!isStillChosen(_current, now)) {
+    _current = {};
+    _current = search(now);
+  }
+  if (!_current.file) return countLost();
 
   std::string line = "(" + logDate(now) + ") ";
   line.append(message).append("\n");
-  switch (append(file->path, line, _options.maximumBytes)) {
+  const std::string& path = _current.file->path;
+  switch (append(_current.descriptor.get(), line, _options.maximumBytes)) {
     case Appended::Yes:
-      VESK_LOG_INFO("writeToLogFile: Saved log message to %s", file->path.c_str());
+      VESK_LOG_INFO("writeToLogFile: Saved log message to %s", path.c_str());
       break;
     case Appended::No:
-      deleteLogFile(*file);
+      countLost();
+      _current.canStay = false;
+      deleteLogFile(*_current.file);
       break;
     case Appended::Full:
-      _options.counters->count("message-log", DropReason::NotRecorded);
+      countLost();
       if (_full.begins()) {
-        VESK_LOG_WARNING("writeToLogFile: No room in %s until it expires; lines are lost",
-                         file->path.c_str());
+        VESK_LOG_WARNING("writeToLogFile: No room in %s until it expires; lines are lost", path.c_str());
       }
       break;
   }
+  if (!_current.canStay) _current = {};
 } catch (const std::exception& error) {
+  countLost();
   VESK_LOG_ERROR("writeToLogFile: %s", error.what());
+}
+
+void MessageLog::countLost() const noexcept {
+  _options.counters->count("message-log", DropReason::NotRecorded);
 }
 
 void writeToLogFile(std::string_view format, std::span<const LogArgument> arguments) {

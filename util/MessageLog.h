@@ -9,6 +9,7 @@
 #include <string>
 #include <string_view>
 
+#include "platform/files/FileDescriptor.h"
 #include "platform/ipc/WarningBurst.h"
 #include "platform/time/Clock.h"
 #include "util/Counters.h"
@@ -16,10 +17,21 @@
 
 namespace vesk {
 
-/// Appends lines to the one log file of a directory, starts a new file each day and deletes the old one. All
-/// state is in the directory. Failures cost a system-log line, never an exception. Thread-safe: a whole write
-/// happens under one lock of the process, a leaf under which only the system log is called, so two sessions'
-/// lines are never mixed or lost.
+/// A log file as its directory shows it.
+struct MessageLogFile {
+  std::string path;
+  std::optional<WallTime> created;
+};
+
+/// Appends lines to the one log file of a directory, starts a new file each day and deletes the old one.
+/// Failures cost a system-log line, never an exception; every line that is lost is counted. Thread-safe: a
+/// whole write happens under one lock of the process, a leaf under which only the system log is called, so
+/// two sessions' lines are never mixed or lost.
+///
+/// The directory decides, not memory: a file that was removed, replaced or joined by a second one is seen by
+/// the next write. The file only stays open from one write to the next while the directory, by its identity
+/// and times, is the one in which a search found no other log file. A directory that changed less than 100 ms
+/// before the search is searched again, because a second change could leave the same time in it.
 ///
 /// The directory's own parents may be links, as the administrator likes; a log file may not. Files are made
 /// with mode 0640 and directories with mode 0750.
@@ -39,10 +51,23 @@ class MessageLog {
   void write(std::string_view message);
 
  private:
+  struct Current {
+    std::optional<MessageLogFile> file;  ///< none: it could not be made
+    FileDescriptor descriptor;
+    struct stat directory {};  ///< from before it was searched
+    bool canStay = false;      ///< it is the directory's only log file, and a change of that will show
+  };
+
+  Current search(WallTime now) const;
+  bool isStillChosen(const Current& current, WallTime now) const;
+  void countLost() const noexcept;
+
   const std::string _directory;
   const WallClock& _clock;
   const Options _options;
-  WarningBurst _full;  // used under the lock
+  // Used under the lock.
+  Current _current;
+  WarningBurst _full;
 };
 
 /// When the log file of that name was made: its birth time where the file system records one, else the

@@ -42,10 +42,10 @@ std::string firstText(std::string_view bytes) {
 
 }  // namespace
 
-std::optional<std::string> firmwareFact(std::string_view key) {
+std::optional<std::string> firmwareFact(std::string_view key, const std::string& root) {
   for (const Source& source : kSources) {
     if (source.key != key) continue;
-    SmallFile file = readSmallFile(source.path, 4096);
+    SmallFile file = readSmallFile(root + source.path, 4096);
     if (!file.bytes) continue;
     std::string fact = firstText(*file.bytes);
     if (!fact.empty() && std::find(kFillers.begin(), kFillers.end(), fact) == kFillers.end()) return fact;

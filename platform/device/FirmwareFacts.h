@@ -8,7 +8,7 @@
 namespace vesk {
 
 /// The firmware's word for a fact of the device-information query, or nothing: "ProductType", "DeviceName",
-/// "HWModelStr", "SerialNumber". DMI gives serial numbers to root only.
-std::optional<std::string> firmwareFact(std::string_view key);
+/// "HWModelStr", "SerialNumber". DMI gives serial numbers to root only. `root`: where /sys and /proc are.
+std::optional<std::string> firmwareFact(std::string_view key, const std::string& root = {});
 
 }  // namespace vesk

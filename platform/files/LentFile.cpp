@@ -4,6 +4,8 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <filesystem>
+#include <system_error>
 
 namespace vesk {
 
@@ -17,10 +19,22 @@ LentFile::LentFile(FileDescriptor descriptor) noexcept : _descriptor(std::move(d
   if (_descriptor && ::fstat(_descriptor.get(), &_status) != 0) _status = {};
 }
 
-bool LentFile::isRegularAt(const std::string& path) const noexcept {
-  if (!S_ISREG(_status.st_mode) || path.empty()) return false;
+bool LentFile::isRegularAt(const std::string& path) const {
+  if (!S_ISREG(_status.st_mode) || _status.st_nlink == 0 || path.empty()) return false;
   struct stat named {};
-  return ::lstat(path.c_str(), &named) != 0 || S_ISREG(named.st_mode);
+  if (::lstat(path.c_str(), &named) == 0) return S_ISREG(named.st_mode);
+  if (errno != ENOENT) return true;
+  const std::string parent = path.substr(0, path.rfind('/') + 1);
+  // A directory in which it is missing may be another one than the client sees under that path, as with
+  // PrivateTmp=. The kernel knows by which path the client opened its file.
+  return ::stat(parent.c_str(), &named) != 0 || wasOpenedAt(path);
+}
+
+bool LentFile::wasOpenedAt(const std::string& path) const {
+  std::error_code unknown;
+  const auto opened =
+      std::filesystem::read_symlink("/proc/self/fd/" + std::to_string(_descriptor.get()), unknown);
+  return opened == std::filesystem::path(path).lexically_normal();
 }
 
 LentFile::Reading LentFile::read(std::string& bytes, const std::function<bool()>& goOn) const {

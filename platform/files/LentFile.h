@@ -19,9 +19,9 @@ class LentFile {
   /// Takes the descriptor, which may be none.
   explicit LentFile(FileDescriptor descriptor) noexcept;
 
-  /// Whether it is a regular file, and `path` does not name something of another kind. A path that is out of
-  /// this process's sight tells nothing.
-  bool isRegularAt(const std::string& path) const noexcept;
+  /// Whether it is a regular file, still has a name, and `path` names a regular file. A path that this
+  /// process can't see, because of rights or of mounts of its own, is believed.
+  bool isRegularAt(const std::string& path) const;
 
   /// Bytes.
   std::uint64_t size() const noexcept { return static_cast<std::uint64_t>(_status.st_size); }
@@ -43,6 +43,7 @@ class LentFile {
   bool removeFrom(const std::string& path, uid_t user) const;
 
  private:
+  bool wasOpenedAt(const std::string& path) const;
   bool isUnchanged(const struct stat& now) const noexcept;
 
   FileDescriptor _descriptor;
