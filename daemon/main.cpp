@@ -11,6 +11,7 @@
 #include "platform/log/SystemLog.h"
 #include "platform/sandbox/Sandbox.h"
 #include "platform/service/DescriptorLimit.h"
+#include "platform/service/Journal.h"
 #include "platform/service/ProcessMemory.h"
 #include "platform/service/SchedulingClass.h"
 
@@ -23,6 +24,7 @@ constexpr std::chrono::seconds kPatienceOfLog{1};
 
 int run(const vesk::DaemonOptions& options) {
   vesk::enterSchedulingClass(vesk::SchedulingClass::Utility, 0);
+  vesk::SystemLog::setJournal(vesk::writeToJournal);
   vesk::VeskReportingLogging::startLogging("veskreportingd", "Daemon");
   vesk::SystemLog::setPatience(kPatienceOfLog);
   if (options.sandbox) {

@@ -64,13 +64,7 @@ class AgentStorebags : public testing::Test {
 TEST_F(AgentStorebags, FetchesByAgeAndWaitsAfterFailures) {
   enum class Does { Fetch, FetchInVain, ServeCached, Wait };
   const Outcome failure;
-  const struct {
-    double at;
-    Outcome next;
-    Does does;
-    std::optional<Dictionary> served;
-    std::optional<std::string> version;
-  } steps[] = {
+  const std::tuple<double, Outcome, Does, std::optional<Dictionary>, std::optional<std::string>> steps[] = {
       {0, failure, Does::FetchInVain, {}, {}},
       {899.9, {kFirst, 600}, Does::Wait, {}, {}},
       {900, {kFirst, 600, "1"}, Does::Fetch, kFirst, "1"},
@@ -87,53 +81,49 @@ TEST_F(AgentStorebags, FetchesByAgeAndWaitsAfterFailures) {
       {2040.1, {kFirst, 3600}, Does::Wait, kSecond, "6"},
       {2040, {kFirst, 86400, "7"}, Does::Fetch, kFirst, "7"},
       {-84359.9, failure, Does::ServeCached, kFirst, "7"},
-      {-84360, {kSecond, 5, "8"}, Does::Fetch, kSecond, "8"},
-  };
+      {-84360, {kSecond, 5, "8"}, Does::Fetch, kSecond, "8"}};
   auto session = newSession();
   EXPECT_EQ(agent->storebagVersionForSession(*session), std::nullopt);
-  for (const auto& step : steps) {
-    SCOPED_TRACE(step.at);
-    harness.clock.set(1'700'000'000 + step.at);
-    next = step.next;
+  for (const auto& [at, outcome, does, served, version] : steps) {
+    SCOPED_TRACE(at);
+    harness.clock.set(1'700'000'000 + at);
+    next = outcome;
     fetched.clear();
     log.clear();
-    EXPECT_EQ(agent->storebagForSession(*session), step.served);
-    EXPECT_EQ(agent->storebagVersionForSession(*session), step.version);
+    EXPECT_EQ(agent->storebagForSession(*session), served);
+    EXPECT_EQ(agent->storebagVersionForSession(*session), version);
     Lines lines{{7, "storebagForSession: Retrieving storebag for session 77 with client type 7"}};
-    if (step.does == Does::ServeCached) {
+    if (does == Does::ServeCached) {
       lines.emplace_back(7, "storebagForSession: Cached storebag found for client type 7");
-    } else if (step.does == Does::Wait) {
+    } else if (does == Does::Wait) {
       lines.emplace_back(6,
                          "storebagForSession: Not fetching storebag for client type 7 - must wait 900 "
                          "seconds between attempts");
     } else {
       lines.emplace_back(7, "fetchAndCacheStorebag: Fetching storebag for client type 7");
       lines.emplace_back(
-          7, "fetchAndCacheStorebag: Storebag max age: " + std::to_string(step.next.maxAge) + " seconds");
-      if (step.does == Does::FetchInVain)
+          7, "fetchAndCacheStorebag: Storebag max age: " + std::to_string(outcome.maxAge) + " seconds");
+      if (does == Does::FetchInVain)
         lines.emplace_back(3, "fetchAndCacheStorebag: Unable to fetch storebag for client type 7");
     }
     EXPECT_EQ(log.lines(), lines);
-    EXPECT_EQ(fetched.size(), step.does == Does::Fetch || step.does == Does::FetchInVain ? 1u : 0u);
+    EXPECT_EQ(fetched.size(), does == Does::Fetch || does == Does::FetchInVain ? 1u : 0u);
   }
 }
 
 TEST_F(AgentStorebags, KeepsOneRecordAStorebag) {
   next = {kFirst, 60, "1"};
-  const struct {
-    Value clientType;
-    std::vector<std::int32_t> fetches;
-    bool isServed;
-  } cases[] = {{7, {7}, true}, {11, {}, true}, {5, {5}, true},  {"6", {}, false}, {6, {6}, true},
-               {4, {}, false}, {0, {}, false}, {12, {}, false}, {-1, {}, false},  {"?", {}, false}};
-  for (const auto& test : cases) {
-    SCOPED_TRACE(describe(test.clientType));
+  const std::tuple<Value, std::vector<std::int32_t>, bool> cases[] = {
+      {7, {7}, true}, {11, {}, true}, {5, {5}, true},  {"6", {}, false}, {6, {6}, true},
+      {4, {}, false}, {0, {}, false}, {12, {}, false}, {-1, {}, false},  {"?", {}, false}};
+  for (const auto& [clientType, fetches, isServed] : cases) {
+    SCOPED_TRACE(describe(clientType));
     fetched.clear();
-    auto session = newSession(test.clientType);
-    EXPECT_EQ(agent->storebagForSession(*session), test.isServed ? std::optional(kFirst) : std::nullopt);
+    auto session = newSession(clientType);
+    EXPECT_EQ(agent->storebagForSession(*session), isServed ? std::optional(kFirst) : std::nullopt);
     EXPECT_EQ(agent->storebagVersionForSession(*session),
-              test.isServed ? std::optional<std::string>("1") : std::nullopt);
-    EXPECT_EQ(fetched, test.fetches);
+              isServed ? std::optional<std::string>("1") : std::nullopt);
+    EXPECT_EQ(fetched, fetches);
   }
   auto unconfigured =
       std::make_shared<ReportingdSession>(agent, std::make_shared<RecordingConnection>(), sessionServices);
@@ -189,9 +179,8 @@ TEST_F(AgentStorebags, HoldsItsMonitorDuringAFetchAndNoLonger) {
 TEST_F(AgentStorebags, CountsItsConnectionsAndTheCallsThatTheyLose) {
   std::vector<std::shared_ptr<RecordingConnection>> connections;
   for (const char* counts : {"0(0)", "1(0)", "2(0)", "0(0)"}) {
-    if (connections.size() == 3) {
+    if (connections.size() == 3)
       for (auto& each : connections) each->invalidate();
-    }
     connections.push_back(std::make_shared<RecordingConnection>());
     log.clear();
     EXPECT_TRUE(agent->shouldAcceptNewConnection(connections.back()));

@@ -1,6 +1,3 @@
-#include <sys/resource.h>
-#include <unistd.h>
-
 #include <csignal>
 #include <future>
 
@@ -151,51 +148,6 @@ TEST_F(ClientSession, RefusesWhatCannotBeSentAndGoesOn) {
   EXPECT_EQ(session.drops().invalid, 5U);
   EXPECT_EQ(session.uploadFile(directory / "missing").status, ReportingStatus::FileUnavailable);
   EXPECT_EQ(session.uploadFile(directory.path()).detail, "Is a directory");
-}
-
-TEST_F(ClientSession, TellsOfTheLastDescriptorThatTheFileTook) {
-  auto file = directory.write("file", "contents");
-  VeskReporting session(options());
-  ASSERT_TRUE(session.connect());
-  rlimit before{};
-  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &before), 0);
-  const rlimit few{256, before.rlim_max};
-  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &few), 0);
-  std::vector<FileDescriptor> taken;
-  do taken.emplace_back(::dup(0));
-  while (taken.back());
-  for (int left : {0, 1}) {
-    if (left == 1) taken.erase(taken.end() - 2);
-    EXPECT_EQ(session.uploadFile(file).status, ReportingStatus::OutOfResources) << left;
-  }
-  taken.clear();
-  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &before), 0);
-  EXPECT_TRUE(session.uploadFile(file).answer);
-  EXPECT_EQ(session.drops().invalid, 0U);
-}
-
-TEST_F(ClientSession, ManyThreadsSendThroughOneSession) {
-  constexpr int kThreads = 8, kMessages = 200;
-  {
-    VeskReporting session(options());
-    std::vector<std::thread> threads;
-    for (int thread = 0; thread < kThreads; ++thread) {
-      threads.emplace_back([&session, thread] {
-        for (int i = 0; i < kMessages; ++i) {
-          EXPECT_EQ(session.sendMessage(static_cast<std::uint16_t>(thread), static_cast<std::uint16_t>(i)),
-                    ReportingStatus::Queued);
-        }
-      });
-    }
-    for (auto& thread : threads) thread.join();
-  }
-  std::vector<int> next(kThreads);
-  for (const std::string& line : record.lines()) {
-    int thread = 0, number = 0;
-    ASSERT_EQ(std::sscanf(line.c_str(), "message %d %d", &thread, &number), 2) << line;
-    EXPECT_EQ(number, next[static_cast<std::size_t>(thread)]++);
-  }
-  EXPECT_EQ(next, std::vector<int>(kThreads, kMessages));
 }
 
 TEST_F(ClientSession, TheEndOfASessionSendsWhatIsQueuedAndCollectsItsAnswers) {

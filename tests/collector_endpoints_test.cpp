@@ -1,18 +1,13 @@
 #include <gtest/gtest.h>
-#include <sys/resource.h>
 #include <utime.h>
-
-#include <csignal>
 
 #include "tests/support/TempDirectory.h"
 #include "tools/collector/ControlEndpoint.h"
 #include "tools/collector/EventsEndpoint.h"
-#include "tools/collector/HTTPDate.h"
 #include "tools/collector/StorebagEndpoint.h"
 #include "tools/collector/UploadsEndpoint.h"
 #include "tools/json/JSONReader.h"
 #include "tools/storebag/StorebagDocument.h"
-#include "tools/text/Printable.h"
 #include "util/Gzip.h"
 
 namespace vesk {
@@ -143,19 +138,6 @@ TEST_F(CollectorEndpoints, LeaveAPostUnansweredThatCanNotBeSaved) {
   }
   EXPECT_FALSE(_faults.add("post=none"));
   EXPECT_EQ(_stats.eventsNotSaved, 4U);
-
-  _events.answer(post());
-  rlimit before{};
-  ::getrlimit(RLIMIT_FSIZE, &before);
-  ::signal(SIGXFSZ, SIG_IGN);
-  rlimit full = before;
-  full.rlim_cur = _files.read("events.jsonl").size() + 10;
-  ::setrlimit(RLIMIT_FSIZE, &full);
-  EXPECT_EQ(_events.answer(post()).fault, HTTPAnswer::Fault::CloseWithoutAnswer);
-  ::setrlimit(RLIMIT_FSIZE, &before);
-  _events.answer(post());
-  EXPECT_EQ(savedLines().size(), 2U) << "and no torn line between them";
-  EXPECT_EQ(_stats.posts, 2U);
 }
 
 TEST_F(CollectorEndpoints, GiveFaultsInTheirOrderAndAsOftenAsAsked) {
@@ -235,16 +217,6 @@ TEST_F(StorebagServing, SignsOnTheFlyAndAnswersConditionally) {
   EXPECT_EQ(get("/bags/sorrel/zelko", "yesterday").status, 200U);
 }
 
-TEST_F(StorebagServing, NeverGivesTwoVersionsOneDate) {
-  writeVersion("1", 1'795'552'289);
-  get("/bags/zelko");
-  writeVersion("1.1", 1'795'552'289);
-  EXPECT_EQ(findHeader(get("/bags/zelko").headers, "Last-Modified"), httpDate(1'795'552'290));
-  writeVersion("1", 1'795'550'000);
-  EXPECT_EQ(get("/bags/zelko", httpDate(1'795'552'290)).status, 200U);
-  EXPECT_EQ(findHeader(get("/bags/zelko").headers, "Last-Modified"), httpDate(1'795'552'291));
-}
-
 TEST_F(StorebagServing, RefusesNamesItDoesNotHaveAndSourcesWithMistakes) {
   _files.write("../outside.toml", "version = '1'");
   _files.write("bad.json", R"({"version": 1})");
@@ -258,11 +230,6 @@ TEST_F(StorebagServing, RefusesNamesItDoesNotHaveAndSourcesWithMistakes) {
   EXPECT_NE(bad.body.find("bad.json: version: must be a text"), std::string::npos);
   EXPECT_EQ(verdictOn(get("/bags/good")), StorebagVerdict::Valid);
   EXPECT_EQ(_endpoint.answer(request("POST", "/bags/good")).status, 405U);
-}
-
-TEST(Console, ShowsNothingThatSteersATerminal) {
-  EXPECT_EQ(printable("a\x1b[2J\n\x7fgr\u00fc \u0090"), "a\\x1b[2J\\x0a\\x7fgr\u00fc \\xc2\\x90");
-  EXPECT_EQ(printable("\xff\xc3\xbc"), "\\xff\\xc3\\xbc");
 }
 
 TEST(HTTPReceived, UnpacksNoMoreThanItsLimit) {

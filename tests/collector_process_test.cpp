@@ -56,16 +56,6 @@ TEST_F(CollectorProcess, WritesOneJSONLineAnEventAndNothingElseOnItsOutput) {
   EXPECT_EQ(line.value->dictionary()->dictionary("headers")->text("X-Vesk-Sender"), "HD");
 }
 
-TEST_F(CollectorProcess, GoesOnWithoutAnOutput) {
-  auto command = options();
-  command.outputClosed = true;
-  ChildProcess collector(command);
-  waitUntilReady();
-  EXPECT_EQ(WebClient(fact("authorityFile")).post(fact("eventsURL"), kPost, kPostHeaders).status, 200);
-  collector.signal(SIGTERM);
-  EXPECT_EQ(collector.wait(), 0) << collector.errors();
-}
-
 TEST_F(CollectorProcess, TellsUsageFromFailure) {
   ChildProcess first(options());
   waitUntilReady();

@@ -54,30 +54,19 @@ TEST(UUID, IsRandomVersionFour) {
             "00010203-0405-0607-0809-0a0b0c0d0eff");
 }
 
-TEST(RSAPublicKey, VerifiesItsSignatureFromEitherForm) {
+TEST(RSAPublicKey, VerifiesItsOwnSignatureOnlyFromEitherForm) {
   TestSigningKey signer;
-  auto signature = signer.sign("payload");
+  const auto signature = signer.sign("payload");
+  auto broken = signature;
+  broken.back() = static_cast<char>(broken.back() ^ 1);
   for (const auto& der : {signer.publicKeyInfo(), signer.bareKey()}) {
     auto key = RSAPublicKey::fromDER(der);
     ASSERT_TRUE(key);
     EXPECT_TRUE(key->verifySHA1(sha1("payload"), signature));
-  }
-}
-
-TEST(RSAPublicKey, RefusesEverySignatureButItsOwn) {
-  TestSigningKey signer;
-  auto key = RSAPublicKey::fromDER(signer.publicKeyInfo());
-  ASSERT_TRUE(key);
-  auto signature = signer.sign("payload");
-  EXPECT_FALSE(key->verifySHA1(sha1("payloaD"), signature));
-  for (std::size_t at : {std::size_t{0}, signature.size() / 2, signature.size() - 1}) {
-    auto broken = signature;
-    broken[at] = static_cast<char>(broken[at] ^ 1);
-    EXPECT_FALSE(key->verifySHA1(sha1("payload"), broken));
-  }
-  for (const auto& other : {std::string(), signature.substr(1), signature + "x",
-                            signer.sign("payload", EVP_sha256()), TestSigningKey().sign("payload")}) {
-    EXPECT_FALSE(key->verifySHA1(sha1("payload"), other));
+    EXPECT_FALSE(key->verifySHA1(sha1("payloaD"), signature));
+    for (const auto& other : {std::string(), signature.substr(1), signature + "x", broken,
+                              signer.sign("payload", EVP_sha256()), TestSigningKey().sign("payload")})
+      EXPECT_FALSE(key->verifySHA1(sha1("payload"), other));
   }
 }
 

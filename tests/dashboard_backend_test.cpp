@@ -22,9 +22,6 @@ constexpr timeval kWhen{1'700'000'001, 999'999};
 
 class Dashboard : public testing::Test {
  protected:
-  BackendServices services() {
-    return {_harness.services.http, _harness.clock, _harness.counters, _queues, {}, {}, {}};
-  }
   Dictionary profile(Dictionary more = {}) const {
     MutableDictionary entries(
         Dictionary{{"ip", "127.0.0.1"}, {"port", static_cast<int>(_server.endpoint().port)}});
@@ -56,7 +53,7 @@ class Dashboard : public testing::Test {
   DashboardServer _server;
   BackendHarness _harness;
   SimulatedQueues _queues;
-  BackendServices _services = services();
+  BackendServices _services{_harness.services.http, _harness.clock, _harness.counters, _queues, {}, {}, {}};
   CapturedLog _log;
 };
 
@@ -114,29 +111,25 @@ TEST_F(Dashboard, NumbersItsMessagesAndNamesTheirSenders) {
 
 TEST_F(Dashboard, TellsDeliveryAndOriginInItsFlags) {
   const Dictionary reliable{{"reliable", 500}};
-  const struct {
-    std::optional<Dictionary> profile;
-    int bindError;
-    char flags;
-  } cases[] = {
+  const std::tuple<std::optional<Dictionary>, int, char> cases[] = {
       {profile(), 0, 0},    {profile(reliable), 0, 1},     {profile(reliable), EADDRINUSE, 0},
       {std::nullopt, 0, 3}, {std::nullopt, EADDRINUSE, 2},
   };
-  for (const auto& test : cases) {
-    SocketFaults::bindError = test.bindError;
-    auto backend = test.profile
-                       ? make(test.profile)
+  for (const auto& [profile, bindError, flags] : cases) {
+    SocketFaults::bindError = bindError;
+    auto backend = profile
+                       ? make(profile)
                        : stamped(DashboardBackend::create("dashboard", std::string("127.0.0.1"),
                                                           _server.endpoint().port, Text("Phone"), _services));
     SocketFaults::bindError = 0;
     ASSERT_TRUE(backend);
     _queues.queue->run();
-    EXPECT_EQ(datagramOf(*backend, std::nullopt).substr(62), (std::string{'\0', test.flags}));
+    EXPECT_EQ(datagramOf(*backend, std::nullopt).substr(62), (std::string{'\0', flags}));
     EXPECT_EQ(backend->displayURL(), std::nullopt);
     _queues.queue->advance(std::chrono::milliseconds(999));
     EXPECT_EQ(_server.take().size(), 0u);
     _queues.queue->advance(std::chrono::milliseconds(1));
-    EXPECT_EQ(_server.take().size(), test.flags % 2 == 1 ? 1u : 0u) << "sent again at the second tick";
+    EXPECT_EQ(_server.take().size(), flags % 2 == 1 ? 1u : 0u) << "sent again at the second tick";
     backend.reset();
     _queues.queue->advance(std::chrono::seconds(20));
     _server.take();
@@ -160,10 +153,7 @@ TEST_F(Dashboard, FindsItsServerByAnyNumber) {
 TEST_F(Dashboard, WritesPayloadsShortestValueFirst) {
   auto backend = make(profile());
   const std::string big(2000, 'x');
-  const struct {
-    std::optional<Dictionary> payload;
-    std::string text;
-  } cases[] = {
+  const std::pair<std::optional<Dictionary>, std::string> cases[] = {
       {std::nullopt, ""},
       {Dictionary{}, ""},
       {Dictionary{{"list", List{"a"}}, {"none", Value()}, {"date", Date{1}}, {"bytes", Bytes("b")}},
@@ -183,12 +173,11 @@ TEST_F(Dashboard, WritesPayloadsShortestValueFirst) {
       {Dictionary{{"big", big}, {"more", big}}, " big=" + big.substr(0, 1018)},
       {Dictionary{{"k", std::string(1018, 'x')}, {"next", big}}, " k=" + std::string(1018, 'x') + " n"},
       {Dictionary{{"k", std::string(1020, 'x')}, {"next", big}}, " k=" + std::string(1020, 'x')},
-      {Dictionary{{"k", std::string(1021, 'x')}}, " k=" + std::string(1020, 'x')},
-  };
-  for (const auto& test : cases) {
-    const auto datagram = datagramOf(*backend, test.payload);
-    EXPECT_EQ(datagram.substr(64), test.text);
-    EXPECT_EQ(decodeDashboardHeader(datagram)->length, 64 + test.text.size());
+      {Dictionary{{"k", std::string(1021, 'x')}}, " k=" + std::string(1020, 'x')}};
+  for (const auto& [payload, text] : cases) {
+    const auto datagram = datagramOf(*backend, payload);
+    EXPECT_EQ(datagram.substr(64), text);
+    EXPECT_EQ(decodeDashboardHeader(datagram)->length, 64 + text.size());
   }
   EXPECT_EQ(descriptionForObject(std::nullopt), "null");
 }
@@ -258,11 +247,7 @@ TEST_F(Dashboard, SaysWhatItDoesInTheSystemLog) {
     return Dictionary{{"ip", ip}, {"port", port}, {"reliable", reliable}};
   };
   const Dictionary reliable{{"reliable", 500}};
-  const struct {
-    const char* description;
-    std::function<void()> act;
-    Lines lines;
-  } cases[] = {
+  const std::tuple<const char*, std::function<void()>, Lines> cases[] = {
       {"no profile", refuses(std::nullopt), {{3, start + "initWitName with all null params."}}},
       {"nothing in it", refuses(Dictionary{}), {noIP}},
       {"no ip", refuses(Dictionary{{"port", 1}}), {noIP}},
@@ -299,7 +284,7 @@ TEST_F(Dashboard, SaysWhatItDoesInTheSystemLog) {
       {"no buffer",
        [&] {
          auto backend = make(profile());
-         ScarceMemory scarce(1);
+         ScarceMemory scarce;
          EXPECT_EQ(backend->sendMessage(std::nullopt, kWhen, 0, 0, 0), std::nullopt);
        },
        {{3, "DashboardBackend(sendMessage): can't malloc."}}},
@@ -323,11 +308,11 @@ TEST_F(Dashboard, SaysWhatItDoesInTheSystemLog) {
        [&] { EXPECT_FALSE(make(profile())->uploadLogData(List{1})); },
        {{3, upload + "Post URL for log data array is nil"}}},
   };
-  for (const auto& test : cases) {
-    SCOPED_TRACE(test.description);
+  for (const auto& [description, act, lines] : cases) {
+    SCOPED_TRACE(description);
     _log.clear();
-    test.act();
-    EXPECT_EQ(_log.lines(), test.lines);
+    act();
+    EXPECT_EQ(_log.lines(), lines);
   }
   _log.clear();
   EXPECT_FALSE(
@@ -336,23 +321,20 @@ TEST_F(Dashboard, SaysWhatItDoesInTheSystemLog) {
 }
 
 TEST_F(Dashboard, TakesTheTickFromItsProfile) {
-  const struct {
-    Value reliable;
-    int tick;
-    bool warns;
-  } cases[] = {{500, 500, false}, {"40", 40, false}, {true, 1, false},    {86'400'000, 86'400'000, false},
-               {0, 500, true},    {-3, 500, true},   {"soon", 500, true}, {UINT64_MAX, 500, true}};
-  for (const auto& test : cases) {
-    SCOPED_TRACE(describe(test.reliable));
+  const std::tuple<Value, int, bool> cases[] = {
+      {500, 500, false}, {"40", 40, false}, {true, 1, false},    {86'400'000, 86'400'000, false},
+      {0, 500, true},    {-3, 500, true},   {"soon", 500, true}, {UINT64_MAX, 500, true}};
+  for (const auto& [reliable, tick, warns] : cases) {
+    SCOPED_TRACE(describe(reliable));
     _log.clear();
-    auto backend = make(profile(Dictionary{{"reliable", test.reliable}}));
+    auto backend = make(profile(Dictionary{{"reliable", reliable}}));
     _queues.queue->run();
     EXPECT_EQ(datagramOf(*backend, std::nullopt).back(), 1);
-    _queues.queue->advance(std::chrono::milliseconds(2 * test.tick - 1));
+    _queues.queue->advance(std::chrono::milliseconds(2 * tick - 1));
     EXPECT_EQ(_server.take().size(), 0u);
     _queues.queue->advance(std::chrono::milliseconds(1));
     EXPECT_EQ(_server.take().size(), 1u);
-    EXPECT_EQ(_log.countContaining(4, ""), test.warns);
+    EXPECT_EQ(_log.countContaining(4, ""), warns);
     backend->cleanup();
     _queues.queue->advance(std::chrono::hours(48));
     _server.take();
@@ -363,37 +345,32 @@ TEST_F(Dashboard, UploadsLogDataAndAnnouncesWhereItWent) {
   const std::string upload = "DashboardBackend(uploadLogData): ";
   const std::string failed = upload + "Error uploading log data array (";
   const List logData{Dictionary{{"when", Date{12.5}}, {"text", "ä"}}, Bytes("\x01")};
-  const struct {
-    unsigned status;
-    std::string answer;
-    const char* text;  // of the announcement; null: none
-    std::string line;
-  } cases[] = {
+  // text: of the announcement; null: none
+  const std::tuple<unsigned, std::string, const char*, std::string> cases[] = {
       {200, "http://d/7?a=b", " LogDataUploadLocation=http://d/7?a\\=b",
        "Log data uploaded to http://d/7?a=b"},
       {404, "not here", " LogDataUploadLocation=not here", "Log data uploaded to not here"},
       {503, "ü", " LogDataUploadLocation=ü", "Log data uploaded to ü"},
       {200, "", nullptr, "Error uploading log data array ((null))"},
       {200, "\xFF", nullptr, "Error uploading log data array (the answer is not UTF-8)"},
-      {200, "a\0b"s, nullptr, "Error uploading log data array (the answer is not UTF-8)"},
-  };
+      {200, "a\0b"s, nullptr, "Error uploading log data array (the answer is not UTF-8)"}};
   RecordingServer server;
   auto backend = make(profile(Dictionary{{"post_url", server.url("/log?x")}}));
   _harness.clock.set(1'234.5);
-  for (std::uint16_t event = 0; const auto& test : cases) {
-    SCOPED_TRACE(test.line);
+  for (std::uint16_t event = 0; const auto& [status, body, text, line] : cases) {
+    SCOPED_TRACE(line);
     HTTPAnswer answer;
-    answer.status = test.status;
-    answer.body = test.answer;
+    answer.status = status;
+    answer.body = body;
     server.answerWith(answer);
     _log.clear();
-    EXPECT_EQ(backend->uploadLogData(logData), test.text != nullptr);
-    EXPECT_EQ(_log.lines(), std::vector{std::pair(test.text ? 7 : 3, upload + test.line)});
+    EXPECT_EQ(backend->uploadLogData(logData), text != nullptr);
+    EXPECT_EQ(_log.lines(), std::vector{std::pair(text ? 7 : 3, upload + line)});
     _queues.queue->run();
     const auto datagrams = _server.take();
-    ASSERT_EQ(datagrams.size(), test.text ? 1u : 0u);
-    if (test.text) {
-      EXPECT_EQ(datagrams[0].substr(64), test.text);
+    ASSERT_EQ(datagrams.size(), text ? 1u : 0u);
+    if (text) {
+      EXPECT_EQ(datagrams[0].substr(64), text);
       const auto header = decodeDashboardHeader(datagrams[0]);
       EXPECT_EQ(header->method, 0);
       EXPECT_EQ(header->respCode, 2);

@@ -25,7 +25,6 @@ class Delivery : public testing::Test {
   void start(bool reliable = true, milliseconds tick = milliseconds(500)) {
     UDPSocket socket;
     ASSERT_EQ(socket.open(), 0);
-    _descriptor = socket.descriptor();
     _delivery =
         std::make_shared<DashboardDelivery>(std::move(socket), _queue, _linger, _counters, "dashboard");
     if (reliable) _delivery->useReliableUDP();
@@ -68,19 +67,14 @@ class Delivery : public testing::Test {
   std::shared_ptr<SimulatedQueue> _queue = std::make_shared<SimulatedQueue>();
   std::shared_ptr<DashboardLinger> _linger = std::make_shared<DashboardLinger>(1);
   std::shared_ptr<DashboardDelivery> _delivery;
-  int _descriptor = -1;  // the delivery's
   CapturedLog _log;
 };
 
 TEST_F(Delivery, SendsUntilItArrivesOrIsGivenUp) {
   constexpr int kShort = SocketFaults::kShort, kNoRoute = ENETUNREACH;
-  const struct {
-    const char* description;
-    bool reliable;
-    std::deque<int> sends;  // what becomes of the first ones
-    std::vector<int> arrivals;
-    int lostAt;  // -1: never
-  } cases[] = {
+  // sends: what becomes of the first ones
+  // lostAt: -1: never
+  const std::tuple<const char*, bool, std::deque<int>, std::vector<int>, int> cases[] = {
       {"nothing fails", true, {}, {0, 1000, 2500, 5000, 9500}, 10'000},
       {"first send", true, {EPERM}, {500, 1500, 3000, 5500, 10'000}, 10'500},
       {"short first send", true, {kShort}, {500, 1500, 3000, 5500, 10'000}, 10'500},
@@ -96,13 +90,12 @@ TEST_F(Delivery, SendsUntilItArrivesOrIsGivenUp) {
       {"unreliable: no room", false, {EAGAIN}, {10}, -1},
       {"unreliable: no room later", false, {EPERM, EAGAIN}, {1000}, -1},
       {"unreliable: no way", false, {EADDRNOTAVAIL, EINVAL, kNoRoute, EDESTADDRREQ}, {1000}, -1},
-      {"unreliable: no other way", false, {kNoRoute, kNoRoute}, {500}, -1},
-  };
-  for (const auto& test : cases) {
-    SCOPED_TRACE(test.description);
-    start(test.reliable);
+      {"unreliable: no other way", false, {kNoRoute, kNoRoute}, {500}, -1}};
+  for (const auto& [description, reliable, sends, expectedArrivals, expectedLostAt] : cases) {
+    SCOPED_TRACE(description);
+    start(reliable);
     const auto lostBefore = lost(DropReason::Unacknowledged);
-    SocketFaults::sends = test.sends;
+    SocketFaults::sends = sends;
     send(7);
     std::vector<int> arrivals;
     int lostAt = -1;
@@ -111,8 +104,8 @@ TEST_F(Delivery, SendsUntilItArrivesOrIsGivenUp) {
       arrivals.insert(arrivals.end(), _server.take().size(), at);
       if (lostAt < 0 && lost(DropReason::Unacknowledged) > lostBefore) lostAt = at;
     }
-    EXPECT_EQ(arrivals, test.arrivals);
-    EXPECT_EQ(lostAt, test.lostAt);
+    EXPECT_EQ(arrivals, expectedArrivals);
+    EXPECT_EQ(lostAt, expectedLostAt);
     EXPECT_TRUE(SocketFaults::sends.empty());
     EXPECT_EQ(_queue->waiting(), 0u);
     EXPECT_EQ(lost(DropReason::OverBound), 0u);
@@ -145,11 +138,8 @@ TEST_F(Delivery, AnAcknowledgementTakesTheFirstDatagramWithItsEventID) {
     return bytes.substr(0, size);
   };
   const std::uint16_t ids[] = {5, 0x1234, 5, 0x127F, 0x1200};
-  const struct {
-    const char* description;
-    std::vector<std::string> answers;
-    std::vector<int> others;  // which are sent again
-  } cases[] = {
+  // others: which are sent again
+  const std::tuple<const char*, std::vector<std::string>, std::vector<int>> cases[] = {
       {"unknown", {carrying(9, 64)}, {0, 1, 2, 3, 4}},
       {"little-endian", {carrying(0x3412, 64)}, {0, 1, 2, 3, 4}},
       {"nothing in it", {"", "x"}, {0, 1, 2, 3, 4}},
@@ -161,10 +151,9 @@ TEST_F(Delivery, AnAcknowledgementTakesTheFirstDatagramWithItsEventID) {
       {"both", {carrying(5, 64), carrying(5, 64)}, {1, 3, 4}},
       {"all, in another order",
        {carrying(0x127F, 62), carrying(5, 62), carrying(0x1200, 62), carrying(0x1234, 62), carrying(5, 62)},
-       {}},
-  };
-  for (const auto& test : cases) {
-    SCOPED_TRACE(test.description);
+       {}}};
+  for (const auto& [description, answers, expectedOthers] : cases) {
+    SCOPED_TRACE(description);
     start();
     for (std::size_t i = 0; i < std::size(ids); ++i) {
       auto buffer = std::make_unique<DashboardDelivery::Buffer>();
@@ -173,18 +162,17 @@ TEST_F(Delivery, AnAcknowledgementTakesTheFirstDatagramWithItsEventID) {
     }
     _queue->run();
     EXPECT_EQ(_server.take().size(), std::size(ids));
-    for (const auto& answer : test.answers) _server.send(answer);
+    for (const auto& answer : answers) _server.send(answer);
     _queue->advance(milliseconds(1000));
     std::vector<int> others;
     for (const auto& datagram : _server.take()) others.push_back(datagram[0]);
-    EXPECT_EQ(others, test.others);
+    EXPECT_EQ(others, expectedOthers);
     _delivery->cleanup();
     _queue->advance(milliseconds(30'000));
     _server.take();
   }
-  for (std::size_t size : {0u, 1u, 60u, 61u}) {  // of more that can be read
+  for (std::size_t size : {0u, 1u, 60u, 61u})  // of more that can be read
     EXPECT_EQ(eventIDOfAcknowledgement(std::string_view(carrying(5, 64)).substr(0, size)), std::nullopt);
-  }
 }
 
 TEST_F(Delivery, TheOldestOfFiftyOneGoes) {
@@ -200,8 +188,7 @@ TEST_F(Delivery, TheOldestOfFiftyOneGoes) {
 
 TEST_F(Delivery, WhatComesFasterThanItGoesOutIsBounded) {
   start();
-  for (int i = 0; i < 1030; ++i)
-    _delivery->send(std::make_unique<DashboardDelivery::Buffer>(), kDashboardHeaderSize, 1);
+  for (int i = 0; i < 1030; ++i) handOver(1);
   EXPECT_EQ(lost(DropReason::OverBound), 6u);
   _queue->run();
   EXPECT_EQ(lost(DropReason::OverBound), 6u + 1024u - 50u);

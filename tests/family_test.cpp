@@ -1,6 +1,4 @@
 // Families of sessions: parents, combined IDs, reporting states, aggregation.
-#include <gtest/gtest.h>
-
 #include <atomic>
 #include <future>
 #include <latch>
@@ -21,57 +19,51 @@ std::string without(std::string places, const std::string& others) {
 }
 
 TEST_F(Family, EveryWalkTakesTheFirstOfEachLevel) {
-  struct Row {
-    const char* what;
-    std::string levels;       // in the order of joining; sessions are named by their place in it
-    std::string aggregating;  // which have aggregation on when all have joined
-    char asking;
-    std::string parent;
-    std::string chain;     // from the top
-    std::string ancestor;  // the one that aggregates
-    std::string left;      // which aggregate once `asking` has refreshed those below
-  };
-  const Row rows[] = {
-      {"the top", "0123", "0123", '0', "", "", "", "0"},
-      {"a top that does not aggregate", "012", "12", '0', "", "", "", "12"},
-      {"a child", "0123", "", '1', "0", "0", "", ""},
-      {"a child that aggregates", "012", "12", '1', "0", "0", "", "1"},
-      {"a child below one that aggregates", "012", "02", '1', "0", "0", "0", "0"},
-      {"three levels down", "0123", "023", '3', "2", "012", "0", "02"},
-      {"joined the other way round", "3210", "012", '0', "1", "321", "2", "12"},
-      {"the highest that aggregates", "0123", "12", '3', "2", "012", "1", "12"},
-      {"two at the top", "001", "01", '2', "0", "0", "0", "01"},
-      {"two at the top, of which the second aggregates", "001", "12", '2', "0", "0", "", "12"},
-      {"two in the middle", "0112", "12", '3', "1", "01", "1", "12"},
-      {"two in the middle, of which the second aggregates", "0112", "2", '3', "1", "01", "", "2"},
-      {"the first of two in the middle", "0112", "123", '1', "0", "0", "", "12"},
-      {"a gap right above", "02", "0", '1', "", "", "0", "0"},
-      {"a gap further up", "023", "1", '2', "1", "1", "1", "1"},
-      {"nothing at the top", "12", "", '1', "0", "0", "", ""},
-      {"alone", "2", "0", '0', "", "", "", "0"},
-  };
-  for (const Row& row : rows) {
+  // levels: in the order of joining; sessions are named by their place in it
+  // aggregating: which have aggregation on when all have joined
+  // identity: from the top
+  // ancestor: the one that aggregates
+  // remaining: which aggregate once `asker` has refreshed those below
+  const std::tuple<const char*, std::string, std::string, char, std::string, std::string, std::string,
+                   std::string>
+      rows[] = {{"the top", "0123", "0123", '0', "", "", "", "0"},
+                {"a top that does not aggregate", "012", "12", '0', "", "", "", "12"},
+                {"a child", "0123", "", '1', "0", "0", "", ""},
+                {"a child that aggregates", "012", "12", '1', "0", "0", "", "1"},
+                {"a child below one that aggregates", "012", "02", '1', "0", "0", "0", "0"},
+                {"three levels down", "0123", "023", '3', "2", "012", "0", "02"},
+                {"joined the other way round", "3210", "012", '0', "1", "321", "2", "12"},
+                {"the highest that aggregates", "0123", "12", '3', "2", "012", "1", "12"},
+                {"two at the top", "001", "01", '2', "0", "0", "0", "01"},
+                {"two at the top, of which the second aggregates", "001", "12", '2', "0", "0", "", "12"},
+                {"two in the middle", "0112", "12", '3', "1", "01", "1", "12"},
+                {"two in the middle, of which the second aggregates", "0112", "2", '3', "1", "01", "", "2"},
+                {"the first of two in the middle", "0112", "123", '1', "0", "0", "", "12"},
+                {"a gap right above", "02", "0", '1', "", "", "0", "0"},
+                {"a gap further up", "023", "1", '2', "1", "1", "1", "1"},
+                {"nothing at the top", "12", "", '1', "0", "0", "", ""},
+                {"alone", "2", "0", '0', "", "", "", "0"}};
+  for (const auto& [what, levels, aggregating, asker, parent, identity, ancestor, remaining] : rows) {
+    SCOPED_TRACE(what);
     std::map<char, DrivenSession> members;
     std::map<std::shared_ptr<ReportingdSession>, std::string> places{{nullptr, ""}};
-    for (char level : row.levels) {
+    for (char level : levels) {
       const char place = static_cast<char>('0' + members.size());
       auto member = members.emplace(place, join(level - '0')).first;
       places.emplace(member->second.session, std::string(1, place));
     }
     for (auto& [place, member] : members) {
-      if (row.aggregating.find(place) == std::string::npos) continue;
+      if (aggregating.find(place) == std::string::npos) continue;
       member->setSessionInfo(member->sessionInfo().value(), userInfo("MyApp"), {}, true);
     }
-    DrivenSession& asking = members.at(row.asking);
+    DrivenSession& asking = members.at(asker);
     std::string chain;
-    for (char place : row.chain) chain += (chain.empty() ? "" : ".") + members.at(place)->sessionIDString();
-    EXPECT_EQ(harness.agent->parentSessionIDStringForSession(*asking.session).value_or(""), chain)
-        << row.what;
+    for (char place : identity) chain += (chain.empty() ? "" : ".") + members.at(place)->sessionIDString();
+    EXPECT_EQ(harness.agent->parentSessionIDStringForSession(*asking.session).value_or(""), chain);
     {
       RecursiveMutexLock lock(harness.agent->monitor());
-      EXPECT_EQ(places.at(harness.agent->parentSessionForChild(*asking.session)), row.parent) << row.what;
-      EXPECT_EQ(places.at(harness.agent->getAncestorWithAggregatorForSession(*asking.session)), row.ancestor)
-          << row.what;
+      EXPECT_EQ(places.at(harness.agent->parentSessionForChild(*asking.session)), parent);
+      EXPECT_EQ(places.at(harness.agent->getAncestorWithAggregatorForSession(*asking.session)), ancestor);
     }
     // A message goes to the ancestor or to the sender's own client, never to both.
     std::string told, closed, left;
@@ -81,14 +73,14 @@ TEST_F(Family, EveryWalkTakesTheFirstOfEachLevel) {
         member.connection->onCall = [&, expected, place = place,
                                      connection = member.connection.get()](const auto&) {
           list += place;
-          EXPECT_EQ(connection->told().back(), expected) << row.what;
+          EXPECT_EQ(connection->told().back(), expected);
         };
       }
     };
     listen(told, std::to_string(asking->sessionID()) + R"(: 1700000000.000000 3/2 {"a": "text"})");
     asking.send(message());
-    const bool isOwn = row.aggregating.find(row.asking) != std::string::npos;
-    EXPECT_EQ(told, !row.ancestor.empty() ? row.ancestor : std::string(isOwn, row.asking)) << row.what;
+    const bool isOwn = aggregating.find(asker) != std::string::npos;
+    EXPECT_EQ(told, !ancestor.empty() ? ancestor : std::string(isOwn, asker));
 
     listen(closed, "closing: 0.000000 0/0");
     harness.agent->updateDownstreamSessions(*asking.session);
@@ -96,23 +88,21 @@ TEST_F(Family, EveryWalkTakesTheFirstOfEachLevel) {
       if (member->hasAggregator()) left += place;
       member.connection->onCall = nullptr;
     }
-    EXPECT_EQ(left, row.left) << row.what;
-    EXPECT_EQ(closed, without(row.aggregating, row.left)) << row.what;
+    EXPECT_EQ(left, remaining);
+    EXPECT_EQ(closed, without(aggregating, remaining));
   }
 }
 
 TEST_F(Family, ArrivalsRefreshThoseBelowInTheOrderOfJoining) {
-  struct Row {
-    std::vector<int> levels;
-    bool isEnabled;  // the session of level 2, in the end
-  };
   // A session is enabled by the state that its parent has at that moment.
-  for (const Row& row : {Row{{0, 1, 2}, true}, {{0, 2, 1}, true}, {{1, 2, 0}, true}, {{2, 1, 0}, false}}) {
+  const std::pair<std::vector<int>, bool> rows[] = {
+      {{0, 1, 2}, true}, {{0, 2, 1}, true}, {{1, 2, 0}, true}, {{2, 1, 0}, false}};
+  for (const auto& [levels, isEnabled] : rows) {
     std::map<int, DrivenSession> members;
-    for (int level : row.levels) members.emplace(level, join(level, false, level == 2 ? "MYAPP" : "MyApp"));
+    for (int level : levels) members.emplace(level, join(level, false, level == 2 ? "MYAPP" : "MyApp"));
     const auto& last = members.at(2);
-    EXPECT_EQ(last->fetchReportingStates(), row.isEnabled ? BackendNames{"httpPost"} : BackendNames{});
-    if (!row.isEnabled) continue;
+    EXPECT_EQ(last->fetchReportingStates(), isEnabled ? BackendNames{"httpPost"} : BackendNames{});
+    if (!isEnabled) continue;
     EXPECT_EQ(last->samplingThresholdWithBackendName("httpPost"), Value(1.0)) << "the parent's";
     harness.posts();
     members.at(2).send(message());
@@ -135,32 +125,26 @@ TEST_F(Family, AChildCopiesItsParentsStatesButAnOverride) {
     }
     return section.share();
   };
-  struct Row {
-    const char* parent;
-    const char* child;
-    BackendNames enabled;
-  };
-  const Row rows[] = {
+  const std::tuple<const char*, const char*, BackendNames> rows[] = {
       {"httpPost 1", "httpPost 0", {"httpPost"}},
       {"httpPost 1", "httpPost 0 dashboard -", {"httpPost"}},
       {"dashboard - httpPost2 1.5 httpPost 1",
        "httpPost 0 httpPost2 0 dashboard -",
        {"httpPost", "httpPost2", "dashboard"}},
       {"httpPost 0", "httpPost 1", {}},
-      {"httpPost 1", "httpPost override", {}},
-  };
-  for (const Row& row : rows) {
-    harness.storebags[5] = storebag(0, row.parent);
-    harness.storebags[6] = storebag(1, row.child);
+      {"httpPost 1", "httpPost override", {}}};
+  for (const auto& [ofParent, ofChild, enabled] : rows) {
+    harness.storebags[5] = storebag(0, ofParent);
+    harness.storebags[6] = storebag(1, ofChild);
     harness.clock.advance(std::chrono::hours(2));
     auto parent = join(0), child = join(1);
-    EXPECT_EQ(names, row.enabled) << row.child;
-    for (const std::string& name : row.enabled)
+    EXPECT_EQ(names, enabled) << ofChild;
+    for (const std::string& name : enabled)
       EXPECT_EQ(child->samplingThresholdWithBackendName(name),
                 parent->samplingThresholdWithBackendName(name));
     child.send(message(2));  // lifts an override
-    const bool isLifted = std::string_view(row.child).ends_with("override");
-    EXPECT_EQ(child->fetchReportingStates(), isLifted ? BackendNames{"httpPost"} : row.enabled);
+    const bool isLifted = std::string_view(ofChild).ends_with("override");
+    EXPECT_EQ(child->fetchReportingStates(), isLifted ? BackendNames{"httpPost"} : enabled);
   }
 }
 
@@ -342,9 +326,8 @@ TEST_F(Family, AClientThatTakesNoMessagesCostsOneLineAndNobodyElse) {
   for (int i = 0; i < 100; ++i) child.send(message(0));
   child->flushMessagesWithReply({});
   std::size_t posted = 0;
-  for (const auto& post : harness.posts()) {
+  for (const auto& post : harness.posts())
     for (const auto& event : post.events()) posted += event.at("_method") == 3;
-  }
   EXPECT_EQ(posted, 100u) << "the sender does not notice";
   EXPECT_EQ(harness.dropped(DropReason::NotAggregated), 100u);
   EXPECT_EQ(log.count(3, "sendMessageWithDictionary: Failed to get remote object proxy: gone"), 1);

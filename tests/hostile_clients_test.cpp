@@ -105,30 +105,28 @@ TEST(HostileClients, AFloodOfWarningsIsCutShortWithTheNumberLeftOut) {
   }
 }
 
-const std::vector<Value> kStrangeValues{
-    "text",
-    "",
-    "-9223372036854775809",
-    -1,
-    std::numeric_limits<std::int64_t>::min(),
-    std::uint64_t{1} << 63,
-    std::numeric_limits<std::uint64_t>::max(),
-    std::numeric_limits<double>::quiet_NaN(),
-    std::numeric_limits<double>::infinity(),
-    -std::numeric_limits<double>::infinity(),
-    1e300,
-    true,
-    Value(),
-    Bytes("bytes"),
-    Date{std::numeric_limits<double>::infinity()},
-    List{1, "two"},
-    Dictionary{{"a", 1}},
-    [] {
-      MutableDictionary wide;
-      for (int i = 0; i < 10'000; ++i) wide.set(std::to_string(i), i);
-      return wide.share();
-    }(),
-};
+const std::vector<Value> kStrangeValues{"text",
+                                        "",
+                                        "-9223372036854775809",
+                                        -1,
+                                        std::numeric_limits<std::int64_t>::min(),
+                                        std::uint64_t{1} << 63,
+                                        std::numeric_limits<std::uint64_t>::max(),
+                                        std::numeric_limits<double>::quiet_NaN(),
+                                        std::numeric_limits<double>::infinity(),
+                                        -std::numeric_limits<double>::infinity(),
+                                        1e300,
+                                        true,
+                                        Value(),
+                                        Bytes("bytes"),
+                                        Date{std::numeric_limits<double>::infinity()},
+                                        List{1, "two"},
+                                        Dictionary{{"a", 1}},
+                                        [] {
+                                          MutableDictionary wide;
+                                          for (int i = 0; i < 10'000; ++i) wide.set(std::to_string(i), i);
+                                          return wide.share();
+                                        }()};
 
 Dictionary with(const Dictionary& base, const char* key, const Value& value) {
   MutableDictionary changed(base);

@@ -131,18 +131,16 @@ TEST(HTTPClient, BadAnswersAreErrorsOfTheirKindAndOverWithTheNextRequest) {
   const struct {
     Fault fault;
     std::optional<Kind> kind;
-  } cases[] = {
-      {Fault::None, {}},
-      {Fault::Stall, Kind::Timeout},
-      {Fault::ResetBeforeAnswer, Kind::Interrupted},
-      {Fault::ResetMidAnswer, Kind::Interrupted},
-      {Fault::CloseWithoutAnswer, Kind::Interrupted},
-      {Fault::CloseMidAnswer, Kind::Interrupted},
-      {Fault::CloseAfterAnswer, {}},
-      {Fault::SlowBody, {}},
-      {Fault::Garbage, Kind::Other},
-      {Fault::HugeBody, Kind::TooLarge},
-  };
+  } cases[] = {{Fault::None, {}},
+               {Fault::Stall, Kind::Timeout},
+               {Fault::ResetBeforeAnswer, Kind::Interrupted},
+               {Fault::ResetMidAnswer, Kind::Interrupted},
+               {Fault::CloseWithoutAnswer, Kind::Interrupted},
+               {Fault::CloseMidAnswer, Kind::Interrupted},
+               {Fault::CloseAfterAnswer, {}},
+               {Fault::SlowBody, {}},
+               {Fault::Garbage, Kind::Other},
+               {Fault::HugeBody, Kind::TooLarge}};
   TempDirectory directory;
   const auto authority = CertificateAuthority::generate();
   ::setenv("SSL_CERT_FILE", directory.write("ca.pem", authority.certificate()).c_str(), 1);
@@ -230,7 +228,7 @@ TEST(HTTPClient, ItsEndFailsWhatIsOutstandingAtOnce) {
     note(result);
     again->start(fetchFrom(server.url()), note);
   });
-  waitFor([&] { return server.count() == 6; });
+  waitFor([&] { return server.count() == 8; });
   // Two that wait for another attempt: nothing listens on the port of a server that is gone.
   std::string gone = [] { return RecordingServer().url(); }();
   client->start(postTo(gone), note);

@@ -193,22 +193,6 @@ TEST_F(Schedule, OwnersTakeTurnsAndShareWhatMayWait) {
   EXPECT_EQ(givenUp(), "c") << "nobody comes to more than that one has";
 }
 
-TEST_F(Schedule, TheMemoryOfWaitingPostsIsBounded) {
-  options.maximumMemory = 12'000;
-  for (const char* name : {"1", "2", "3"}) {
-    auto next = post(name, 100);
-    next->request.headers = {{"X-Vesk-Client-Name", std::string(4000, 'x')}};
-    HTTPRequest request = std::move(next->request);
-    next->complete({HTTPResponse(), std::nullopt});
-    schedule().add(std::make_unique<HTTPExchange>(
-        std::move(request),
-        [this, name](const HTTPResult& result) { givenUpNames += result.error ? name : ""; }, now,
-        outstanding));
-  }
-  EXPECT_EQ(givenUp(), "3") << "headers count";
-  EXPECT_EQ(takeReady(), "12");
-}
-
 TEST_F(Schedule, AFetchThatFindsNoConnectionInTimeIsGivenUp) {
   for (const char* name : {"f", "g", "h", "i"}) schedule().add(fetch(name));
   EXPECT_EQ(takeReady(), "fgh");

@@ -10,44 +10,37 @@ constexpr const char* kSendMessage = "HTTPSPostBackend(sendMessage): ";
 using HTTPSBatch = HTTPSBackendTest;
 
 TEST_F(HTTPSBatch, FlagsStateAndBatchingChooseTheRoad) {
-  const struct {
-    std::int32_t state;
-    bool batch;
-    std::int32_t flag;
-    const char* postedTo;  // "" for held or dropped
-    std::int32_t stateAfter;
-    const char* line;  // "" for none
-    bool lacksUserInfo = false;
-  } cases[] = {
-      {2, false, 0, "/post", 2, "7 Sending 2, 0, 1"},
-      {2, true, 0, "", 2, "7 Batching 2, 1, 1"},
-      {2, true, 1, "/realtime", 2, "7 Sending 2, 1, 1"},
-      {2, false, 2, "/post", 2, "7 Sending 2, 0, 1"},
-      {0, false, 0, "", 0, "7 Batching 0, 0, 1"},
-      {0, false, 1, "/realtime", 0, "7 Sending 0, 0, 1"},
-      {0, false, 2, "", 0, "7 Batching 0, 0, 1"},
-      {0, false, 3, "/realtime", 0, "7 Sending 0, 0, 1"},
-      {3, false, 0, "", 3, "7 Batching 3, 0, 1"},
-      {3, false, 1, "/realtime", 3, "7 Sending 3, 0, 1"},
-      {3, false, 2, "/post", 2, "7 Sending 2, 0, 1"},
-      {3, true, 2, "", 2, "7 Batching 2, 1, 1"},
-      {3, true, 3, "/realtime", 2, "7 Sending 2, 1, 1"},
-      {3, false, 7, "", 3, "7 Batching 3, 0, 1"},
-      {1, false, 1, "", 1, ""},
-      {1, false, 2, "", 1, ""},
+  // postedTo: "" for held or dropped
+  // line: "" for none
+  const std::tuple<std::int32_t, bool, std::int32_t, const char*, std::int32_t, const char*, bool> cases[] = {
+      {2, false, 0, "/post", 2, "7 Sending 2, 0, 1", false},
+      {2, true, 0, "", 2, "7 Batching 2, 1, 1", false},
+      {2, true, 1, "/realtime", 2, "7 Sending 2, 1, 1", false},
+      {2, false, 2, "/post", 2, "7 Sending 2, 0, 1", false},
+      {0, false, 0, "", 0, "7 Batching 0, 0, 1", false},
+      {0, false, 1, "/realtime", 0, "7 Sending 0, 0, 1", false},
+      {0, false, 2, "", 0, "7 Batching 0, 0, 1", false},
+      {0, false, 3, "/realtime", 0, "7 Sending 0, 0, 1", false},
+      {3, false, 0, "", 3, "7 Batching 3, 0, 1", false},
+      {3, false, 1, "/realtime", 3, "7 Sending 3, 0, 1", false},
+      {3, false, 2, "/post", 2, "7 Sending 2, 0, 1", false},
+      {3, true, 2, "", 2, "7 Batching 2, 1, 1", false},
+      {3, true, 3, "/realtime", 2, "7 Sending 2, 1, 1", false},
+      {3, false, 7, "", 3, "7 Batching 3, 0, 1", false},
+      {1, false, 1, "", 1, "", false},
+      {1, false, 2, "", 1, "", false},
       {2, false, 0, "", 2, "7 Batching 2, 0, 1", true},
-      {2, false, 1, "/realtime", 2, "7 Sending 2, 0, 1", true},
-  };
-  for (const auto& test : cases) {
-    SCOPED_TRACE(testing::Message() << "state " << test.state << " flag " << test.flag);
-    auto backend = make(entry(), {.batchEvents = test.batch});
-    if (test.lacksUserInfo) backend->setUserInfoDict(std::nullopt);
-    backend->setState(test.state);
+      {2, false, 1, "/realtime", 2, "7 Sending 2, 0, 1", true}};
+  for (const auto& [state, batch, flag, postedTo, stateAfter, line, lacksUserInfo] : cases) {
+    SCOPED_TRACE(testing::Message() << "state " << state << " flag " << flag);
+    auto backend = make(entry(), {.batchEvents = batch});
+    if (lacksUserInfo) backend->setUserInfoDict(std::nullopt);
+    backend->setState(state);
     CapturedLog log;
-    send(*backend, Dictionary(), 3, test.flag);
-    EXPECT_EQ(linesOf(log, kSendMessage), *test.line ? Lines{test.line} : Lines{});
-    EXPECT_EQ(takeTargets(), *test.postedTo ? Lines{std::string(test.postedTo) + " 1"} : Lines{});
-    EXPECT_EQ(backend->state(), test.stateAfter);
+    send(*backend, Dictionary(), 3, flag);
+    EXPECT_EQ(linesOf(log, kSendMessage), *line ? Lines{line} : Lines{});
+    EXPECT_EQ(takeTargets(), *postedTo ? Lines{std::string(postedTo) + " 1"} : Lines{});
+    EXPECT_EQ(backend->state(), stateAfter);
   }
 }
 
@@ -55,22 +48,19 @@ TEST_F(HTTPSBatch, HeldEventsGoFirstOnceEnabled) {
   const std::string forced =
       "7 Backend has changed its state to 'Enabled', batching is not requested and some events have already "
       "been batched. Forcing Flush here to keep events in order.";
-  const struct {
-    std::int32_t state;
-    bool batch;
-    Lines lines;
-  } cases[] = {{2, false, {forced, "7 HTTPSPostBackend(flushMessages): called", "7 Sending 2, 0, 1"}},
-               {2, true, {"7 Sending 2, 1, 1"}},
-               {0, false, {"7 Sending 0, 0, 1"}}};
-  for (const auto& test : cases) {
+  const std::tuple<std::int32_t, bool, Lines> cases[] = {
+      {2, false, {forced, "7 HTTPSPostBackend(flushMessages): called", "7 Sending 2, 0, 1"}},
+      {2, true, {"7 Sending 2, 1, 1"}},
+      {0, false, {"7 Sending 0, 0, 1"}}};
+  for (const auto& [state, batch, lines] : cases) {
     auto backend = make(entry(), {.batchEvents = true});
     send(*backend);
-    backend->setState(test.state);
-    backend->setBatchEvents(test.batch);
+    backend->setState(state);
+    backend->setBatchEvents(batch);
     CapturedLog log;
     send(*backend, Dictionary(), 3, MessageFlagRealtime);
-    EXPECT_EQ(takeAll().size(), test.lines.size() > 1 ? 2u : 1u);
-    EXPECT_EQ(linesOf(log, kSendMessage), test.lines);
+    EXPECT_EQ(takeAll().size(), lines.size() > 1 ? 2u : 1u);
+    EXPECT_EQ(linesOf(log, kSendMessage), lines);
   }
 }
 
@@ -130,16 +120,17 @@ TEST_F(HTTPSBatch, LateUserInfoReachesTheEventsThatLackItFiltered) {
   send(*backend, Dictionary{{"extra", "event"}, {"clientName", "event"}});
   update(*backend, Dictionary{{"serviceName", "user"}, {"clientName", "user"}, {"extra", "user"}});
   send(*backend);
-  backend->flushMessages();
+  const auto printable = backend->flushMessages().value();
   const auto post = take();
-  const struct {
-    const char *clientName, *extra;
-    bool hasService;
-  } expected[] = {{"user", "user", true}, {"event", "event", false}, {"user", "user", false}};
-  for (std::size_t i = 0; i < 3; ++i) {
-    EXPECT_EQ(post.event(i).at("clientName"), expected[i].clientName);
-    EXPECT_EQ(post.event(i).at("extra"), expected[i].extra);
-    EXPECT_EQ(post.event(i).contains("serviceName"), expected[i].hasService);
+  EXPECT_TRUE(printable.starts_with("{\n    \"postTime\": 1700000000.0,\n")) << printable;
+  EXPECT_EQ(boost::json::parse(printable), boost::json::value(post.body));
+  const std::tuple<const char*, const char*, bool> expected[] = {
+      {"user", "user", true}, {"event", "event", false}, {"user", "user", false}};
+  for (std::size_t i = 0; const auto& [clientName, extra, hasService] : expected) {
+    const auto event = post.event(i++);
+    EXPECT_EQ(event.at("clientName"), clientName);
+    EXPECT_EQ(event.at("extra"), extra);
+    EXPECT_EQ(event.contains("serviceName"), hasService);
   }
   update(*backend, Dictionary{{"serviceName", "user"}});
   send(*backend);
@@ -164,19 +155,6 @@ TEST_F(HTTPSBatch, CorrelationReachesHeldAndLaterEvents) {
 // --- Bounds
 
 const std::string kMebibyte(std::size_t{1} << 20, 'x');
-
-TEST_F(HTTPSBatch, LargeUserInfoThatComesLateGoesWithTheNewestEvents) {
-  auto backend = make(entry({{"expedite", 0}}), {.userInfo = std::nullopt});
-  for (int i = 0; i < 100; ++i) send(*backend, Dictionary{{"n", i}}, i);
-  update(*backend, Dictionary{{"clientName", "Camera"}, {"bulk", kMebibyte}});
-  backend->flushMessages();
-  const auto post = take();
-  const std::size_t sent = post.events().size();
-  EXPECT_EQ(sent, 31u) << "twice what may be held";
-  EXPECT_EQ(sent + harness.dropped(DropReason::OverBound), 100u);
-  EXPECT_EQ(post.event(sent - 1).at("n"), 99);
-  EXPECT_EQ(post.event(sent - 1).at("clientName"), "Camera");
-}
 
 TEST_F(HTTPSBatch, HeldEventsAreBoundedByDroppingTheOldest) {
   CapturedLog log;

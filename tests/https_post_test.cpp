@@ -1,4 +1,5 @@
 // Posts on the wire, and what their answers do.
+#include "backends/RefusedPosts.h"
 #include "tests/support/HTTPSBackendTest.h"
 #include "tests/support/TestRoot.h"
 #include "util/Gzip.h"
@@ -6,6 +7,7 @@
 namespace vesk::test {
 namespace {
 
+using namespace std::chrono_literals;
 using HTTPSPost = HTTPSBackendTest;
 
 TEST_F(HTTPSPost, HeadersTellWhoSends) {
@@ -73,37 +75,26 @@ TEST_F(HTTPSPost, BodyIsCompressedOnlyWhereThatIsShorter) {
   for (int seen : sizes) EXPECT_GT(seen, 0) << "shorter, as long, longer";
 }
 
-TEST_F(HTTPSPost, PrintableTextIsThePostedBody) {
-  auto backend = make(entry(), {.batchEvents = true});
-  send(*backend, Dictionary{{"n", 1}});
-  const auto printable = backend->flushMessages().value();
-  EXPECT_TRUE(printable.starts_with("{\n    \"postTime\": 1700000000.0,\n")) << printable;
-  EXPECT_EQ(boost::json::parse(printable), boost::json::value(take().body));
-}
-
 TEST_F(HTTPSPost, AnswersDecideTheState) {
-  const struct {
-    std::vector<unsigned> statuses;
-    std::optional<DropReason> dropped;
-  } cases[] = {{{200, 299}, {}},
-               {{302, 404, 499, 600}, DropReason::ServerRefused},
-               {{500, 503, 599}, DropReason::ServerError5xx}};
+  const std::pair<std::vector<unsigned>, std::optional<DropReason>> cases[] = {
+      {{200, 299}, {}},
+      {{302, 404, 499, 600}, DropReason::ServerRefused},
+      {{500, 503, 599}, DropReason::ServerError5xx}};
   // The status decides, also when the rest of the answer does not arrive.
   for (auto fault : {HTTPAnswer::Fault::None, HTTPAnswer::Fault::CloseMidAnswer}) {
-    for (const auto& test : cases) {
-      for (const unsigned status : test.statuses) {
+    for (const auto& [statuses, reason] : cases) {
+      for (const unsigned status : statuses) {
         SCOPED_TRACE(status);
         CapturedLog log;
-        const auto dropped = [&] { return test.dropped ? harness.dropped(*test.dropped) : 0; };
-        const auto before = dropped();
+        const auto before = reason ? harness.dropped(*reason) : 0;
         harness.answerWith(status, fault);
         auto backend = make(entry(), {.batchEvents = true});
         for (int i = 0; i < 2; ++i) send(*backend);
         backend->flushMessages();
         take();
-        const long disables = test.dropped == DropReason::ServerError5xx ? 1 : 0;
+        const long disables = reason == DropReason::ServerError5xx ? 1 : 0;
         EXPECT_EQ(backend->state(), disables ? BackendStateDisabled : BackendStateEnabled);
-        EXPECT_EQ(dropped() - before, test.dropped ? 2u : 0u) << "each event of the batch";
+        EXPECT_EQ(reason ? harness.dropped(*reason) - before : 2, 2u) << "each event of the batch";
         EXPECT_EQ(log.count(6, "postJSONMessage: backend httpPost disabled by server " +
                                    std::to_string(status) + " return code"),
                   disables);
@@ -111,6 +102,37 @@ TEST_F(HTTPSPost, AnswersDecideTheState) {
       }
     }
   }
+}
+
+TEST(RefusedPosts, OneLineABurstCountsTheEvents) {
+  // line: null: none
+  const std::tuple<const char*, long, std::size_t, std::chrono::seconds, const char*> cases[] = {
+      {"httpPost", 404, 3, 0s, "backend httpPost: server answered 404, events lost: 3"},
+      {"httpPost", 404, 50, 1s, nullptr},
+      {"httpPost2", 302, 1, 1s, "backend httpPost2: server answered 302, events lost: 1"},
+      {"httpPost", 410, 7, 10s, nullptr},
+      {"httpPost", 302, 1, 20s, "backend httpPost: server answered 302, events lost: 58"},
+      {"httpPost", 404, 2, 60s, "backend httpPost: server answered 404, events lost: 2"}};
+  RefusedPosts refused;
+  for (const auto& [backend, status, events, at, line] : cases) {
+    CapturedLog log;
+    refused.note(backend, status, events, RefusedPosts::Instant(1h) + at);
+    std::vector<std::pair<int, std::string>> expected;
+    if (line) expected = {{4, std::string("HTTPSPostBackend(postJsonMessage): ") + line}};
+    EXPECT_EQ(log.lines(), expected) << at.count();
+  }
+}
+
+TEST_F(HTTPSPost, AnAnswerThatIsNeitherSuccessNorAnErrorIsNoted) {
+  CapturedLog log;
+  auto backend = make(entry());
+  for (unsigned status : {200u, 404u, 503u}) {
+    harness.answerWith(status);
+    send(*backend);
+    take();
+  }
+  EXPECT_EQ(log.countContaining(4, ""), 1);
+  EXPECT_EQ(log.countContaining(4, "backend httpPost: server answered 404, events lost: 1"), 1);
 }
 
 TEST_F(HTTPSPost, WhatHasNowhereToGoIsCounted) {

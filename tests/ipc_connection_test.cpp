@@ -1,9 +1,6 @@
 // The daemon's and the client's end of the IPC layer over real sockets: calls, answers, life cycle.
 #include <gtest/gtest.h>
 #include <sys/socket.h>
-#include <sys/wait.h>
-
-#include <csignal>
 
 #include <future>
 
@@ -12,7 +9,6 @@
 #include "platform/ipc/UnixSocket.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/IPCHarness.h"
-#include "tests/support/ProcessFacts.h"
 
 namespace vesk::test {
 namespace {
@@ -66,17 +62,6 @@ TEST(IPCConnection, AnswersWhatCannotBeServedWithAnError) {
   EXPECT_EQ(log.countContaining(3, "ipc: connection"), 1) << "the exception";
 }
 
-TEST(IPCConnection, DropsWrongOneWayCallsWithOneLineABurst) {
-  CapturedLog log;
-  TestService service;
-  TestClient client(service);
-  for (int i = 0; i < 10; ++i) client.post("sendMessageWithDictionary", {true});
-  client.post("noSuchMember");
-  EXPECT_EQ(client.call("flushMessagesWithReply"), "posted all");
-  EXPECT_EQ(log.countContaining(4, ""), 1);
-  EXPECT_EQ(service.journal.count("message"), 0u);
-}
-
 TEST(IPCConnection, TellsWhatThereIs) {
   TestService service;
   TestClient client(service);
@@ -120,27 +105,6 @@ TEST(IPCConnection, KeepsADescriptorUnderATokenThatIsGoodOnce) {
 
   service.listener().stop();
   EXPECT_FALSE(ExtensionTokens::shared().consume(second)) << "it went with the connection";
-}
-
-TEST(IPCConnection, EndsWithTheProcessThatMadeItAndNotWithOneForkedFromThat) {
-  TestService service;
-  std::optional<TestClient> client(std::in_place, service);
-  ASSERT_EQ(client->call("flushMessagesWithReply"), "posted all");
-  auto fork = [&](const std::function<void()>& body) {
-    pid_t child = ::fork();
-    if (child == 0) {
-      body();
-      ::_exit(0);
-    }
-    return child;
-  };
-  ASSERT_GT(::waitpid(fork([&] { client.reset(); }), nullptr, 0), 0);
-  EXPECT_EQ(client->call("flushMessagesWithReply"), "posted all");
-  pid_t holder = fork([] { ::pause(); });
-  client.reset();
-  EXPECT_TRUE(service.journal.waitFor("destroyed"));
-  ::kill(holder, SIGKILL);
-  EXPECT_EQ(::waitpid(holder, nullptr, 0), holder);
 }
 
 TEST(IPCConnection, ServesWhatAClientSentBeforeItLeftItsAnswersUnread) {
@@ -188,30 +152,6 @@ TEST(IPCConnection, GivesTheClientTheLastWordOfASessionThatIsSentAway) {
   stopping.join();
   EXPECT_EQ(client.received, (std::vector<std::string>{"sendMessageToClient none 0 0 0 none"}));
   EXPECT_EQ(service.journal.lines().back(), "destroyed");
-}
-
-TEST(IPCListener, LeavesNeitherThreadNorDescriptorBehind) {
-  { TestService first; }  // with it comes what stays: a sanitizer's own thread
-  const ProcessFacts facts(::getpid());
-  const std::size_t descriptors = facts.descriptors();
-  const std::size_t threads = facts.threads();
-  {
-    TestService service;
-    std::vector<std::unique_ptr<TestClient>> clients;
-    for (int i = 0; i < 20; ++i) {
-      clients.push_back(std::make_unique<TestClient>(service));
-      EXPECT_EQ(clients.back()->call("uploadFileAtPath", {std::string("u"), IPCDescriptor{0}}), "true");
-    }
-    clients.resize(10);
-    EXPECT_TRUE(service.journal.waitFor("destroyed", 10));
-    service.listener().stop();
-    EXPECT_EQ(service.journal.count("destroyed"), 20u);
-    service.listener().stop();
-    for (auto& client : clients) EXPECT_TRUE(client->runToEnd());
-  }
-  EXPECT_EQ(facts.descriptors(), descriptors);
-  // The kernel shows a thread for a moment after it was joined.
-  EXPECT_TRUE(eventually([&] { return facts.threads() <= threads; })) << facts.threads();
 }
 
 TEST(IPCListener, DoesNotWaitForEverForAHandlerThatHangs) {

@@ -1,4 +1,4 @@
-// What the daemon does when the machine under it fails: disks, descriptors, memory, and its own sudden end.
+// What the daemon does when the machine under it fails: disks, descriptors, and its own sudden end.
 #include <gtest/gtest.h>
 #include <sched.h>
 #include <sys/mount.h>
@@ -7,7 +7,6 @@
 #include <algorithm>
 #include <atomic>
 #include <csignal>
-#include <cstdlib>
 #include <random>
 #include <thread>
 
@@ -127,60 +126,6 @@ TEST(Machine, WithoutDescriptorsItGoesOnAndForgetsNothing) {
   EXPECT_EQ(harness.stopDaemon(), 0);
 }
 
-TEST(Machine, WithoutMemoryItRefusesAndRecovers) {
-  if (kIsSanitized) GTEST_SKIP() << "the sanitizer itself needs more memory";
-  DaemonHarness harness;
-  harness.startDaemon({"--log-level", "6"});
-  limit(harness.daemon(), RLIMIT_DATA, rlim_t{64} << 20);
-  RoadClient fresh(harness);
-  std::vector<std::unique_ptr<RoadClient>> clients;
-  for (int i = 0; i < 8; ++i) clients.push_back(std::make_unique<RoadClient>(harness));
-  harness.setFault("post=stall");
-  // 200 MB that nobody takes: more than may wait, and more than there is.
-  std::string text(500'000, ' ');
-  std::mt19937 random(1);
-  for (char& letter : text) letter = static_cast<char>('!' + random() % 90);  // so that it stays large
-  const Dictionary large{{"x", text}};
-  std::vector<std::thread> threads;
-  std::atomic<int> answered{0};
-  for (auto& client : clients) {
-    threads.emplace_back([&] {
-      for (int i = 0; i < 50; ++i) {
-        auto sent = client->reporting.sendMessageAndWait(message(4, large), ChildProcess::kPatience);
-        answered += sent.status != ReportingStatus::TimedOut ? 1 : 0;
-      }
-    });
-  }
-  for (auto& thread : threads) thread.join();
-  EXPECT_EQ(answered, 400) << "each call ends";
-  EXPECT_TRUE(harness.daemon().waitForText("bad_alloc")) << "or else this test tries nothing";
-  harness.stopCollector();
-  harness.startCollector();
-  // Until the daemon notices that its collector is back, more waits than may: new messages are dropped.
-  harness.waitForEvents([&](const auto& all) {
-    (void)fresh.reporting.sendMessageAndWait(message(5));
-    return std::any_of(all.begin(), all.end(),
-                       [](const auto& line) { return line.at("event").at("_method") == 5; });
-  });
-  EXPECT_EQ(harness.stopDaemon(), 0);
-}
-
-/// As many as fit in twenty seconds, or what VESK_TERMINATIONS says.
-class Rounds {
- public:
-  bool goOn() {
-    ++_done;
-    return _wanted > 0 ? _done <= _wanted : std::chrono::steady_clock::now() < _end;
-  }
-  int done() const { return _done; }
-
- private:
-  const char* const _setting = std::getenv("VESK_TERMINATIONS");
-  const int _wanted = _setting != nullptr ? std::atoi(_setting) : 0;
-  const std::chrono::steady_clock::time_point _end = std::chrono::steady_clock::now() + 20s;
-  int _done = 0;
-};
-
 // Before its signals are set up, a daemon ends as any program does; it has accepted nobody then.
 bool endedInOrder(int signal, int status, const std::string& log) {
   if (status == 128 + signal) return signal == SIGKILL || log.find("start loop.") == std::string::npos;
@@ -200,8 +145,8 @@ TEST(Machine, MayEndAtAnyMomentAndItsClientsReturnByThemselves) {
   const auto seed = std::random_device()();
   SCOPED_TRACE("seed " + std::to_string(seed));
   std::mt19937 random(seed);
-  Rounds rounds;
-  while (rounds.goOn() && !HasFailure()) {
+  const auto end = std::chrono::steady_clock::now() + 20s;
+  while (std::chrono::steady_clock::now() < end && !HasFailure()) {
     std::this_thread::sleep_for(std::chrono::milliseconds(random() % 100));  // the moment
     const int signal = random() % 4 == 0 ? SIGKILL : SIGTERM;
     harness.daemon().signal(signal);
@@ -216,7 +161,6 @@ TEST(Machine, MayEndAtAnyMomentAndItsClientsReturnByThemselves) {
   }
   stop = true;
   sender.join();
-  RecordProperty("rounds", rounds.done());
   auto sent = client.reporting.sendMessageAndWait(message(5), ChildProcess::kPatience);
   EXPECT_TRUE(sent) << sent.detail;
   harness.waitForEventsOfMethod(5, 1);

@@ -21,7 +21,6 @@ std::string document(const std::vector<std::string>& objects, std::size_t root =
          tail(static_cast<unsigned char>(table));
 }
 
-// What plistlib writes is read in plist_oracle_test.cpp.
 TEST(BinaryPropertyList, ReadsTheRarerForms) {
   const struct {
     std::string object;

@@ -21,7 +21,6 @@ std::string nestedArrays(std::size_t depth) {
   return document(repeated("<array>", depth) + repeated("</array>", depth));
 }
 
-// What plistlib writes is read in plist_oracle_test.cpp.
 TEST(XMLPropertyList, ReadsTheRarerForms) {
   const struct {
     const char* content;

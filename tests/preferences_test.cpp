@@ -30,38 +30,23 @@ class Preferences : public testing::Test {
 };
 
 TEST_F(Preferences, HaveEveryKindOfValue) {
-  testRoot().write(kSystemFile, R"(
-# Dots do not make a deep key where there is none. "..........
-text = "é .......... \" .........."
-lines = """.........." .......... """"
-literal = '..........'
-integer = -7
-real = 2.5
-boolean = true
-date = 2026-11-24
-"date with time" = 2026-11-24T20:31:29.5+01:00
-"local date" = 2026-11-24T20:31:29
-time = 07:32:00
-list = [1, "two"]
-[table]
-key = "value"
-)");
-  const struct {
-    const char* key;
-    Value value;
-  } cases[] = {{"text", "é .......... \" .........."},
-               {"lines", "..........\" .......... \""},
-               {"literal", ".........."},
-               {"integer", -7},
-               {"real", 2.5},
-               {"boolean", true},
-               {"date", Date{1795478400}},
-               {"date with time", Date{1795548689.5}},
-               {"local date", Date{1795552289}},
-               {"time", "07:32:00"},
-               {"list", List{1, "two"}},
-               {"table", Dictionary{{"key", "value"}}}};
-  for (const auto& c : cases) EXPECT_EQ(valueForKey(c.key), c.value) << c.key;
+  const std::tuple<const char*, const char*, Value> cases[] = {
+      {"text", R"("é .......... \" ..........")", "é .......... \" .........."},
+      {"lines", R"("""..........\" .......... """")", "..........\" .......... \""},
+      {"literal", "'..........'", ".........."},
+      {"integer", "-7", -7},
+      {"real", "2.5", 2.5},
+      {"boolean", "true", true},
+      {"date", "2026-11-24", Date{1795478400}},
+      {"date with time", "2026-11-24T20:31:29.5+01:00", Date{1795548689.5}},
+      {"local date", "2026-11-24T20:31:29", Date{1795552289}},
+      {"time", "07:32:00", "07:32:00"},
+      {"list", "[1, \"two\"]", List{1, "two"}},
+      {"table", "{key = \"value\"}", Dictionary{{"key", "value"}}}};
+  std::string file = "# Dots do not make a deep key where there is none. \"..........\n";
+  for (const auto& [key, text, value] : cases) file += '"' + std::string(key) + "\" = " + text + '\n';
+  testRoot().write(kSystemFile, file);
+  for (const auto& [key, text, value] : cases) EXPECT_EQ(valueForKey(key), value) << key;
   EXPECT_EQ(valueForKey("key"), std::nullopt);
 }
 

@@ -1,14 +1,11 @@
-// Serial queues, timers and read sources, on real threads.
+// Serial queues and timers, on real threads.
 #include <gtest/gtest.h>
-#include <sys/eventfd.h>
 
 #include <atomic>
 #include <future>
 #include <optional>
 #include <stdexcept>
-#include <system_error>
 
-#include "platform/files/FileDescriptor.h"
 #include "platform/queue/WorkQueue.h"
 #include "tests/support/CapturedLog.h"
 
@@ -31,7 +28,6 @@ class Queues : public testing::Test {
   std::promise<void> done;
 };
 using WorkTimerTest = Queues;
-using ReadSourceTest = Queues;
 
 TEST_F(Queues, RunsItsWorkOneAtATimeInOrder) {
   std::vector<int> order;  // guarded by the queue itself
@@ -46,15 +42,6 @@ TEST_F(Queues, RunsItsWorkOneAtATimeInOrder) {
   drain(queue);
   ASSERT_EQ(order.size(), 500u);
   EXPECT_TRUE(std::is_sorted(order.begin(), order.end()));
-}
-
-TEST_F(Queues, ABlockedQueueDoesNotHoldUpAnother) {
-  WorkQueue other(pool);
-  std::promise<void> gate;
-  queue.submit([future = gate.get_future().share()] { future.wait(); });
-  drain(other);
-  gate.set_value();
-  drain(queue);
 }
 
 TEST_F(Queues, GoOnAfterWorkThatThrows) {
@@ -92,37 +79,6 @@ TEST_F(WorkTimerTest, RepeatsUntilItCancelsItself) {
   queue.submitAfter(milliseconds(20), [&] { later.set_value(); });
   later.get_future().wait();
   EXPECT_EQ(fired, 3);
-}
-
-TEST_F(ReadSourceTest, IsCalledAgainWhileAnythingIsLeft) {
-  auto counter = std::make_shared<const FileDescriptor>(::eventfd(0, EFD_SEMAPHORE));
-  int calls = 0;
-  ReadSource source(queue, counter, [&] {
-    eventfd_t one = 0;
-    ASSERT_EQ(::eventfd_read(counter->get(), &one), 0);
-    if (++calls == 6) done.set_value();
-  });
-  for (int i = 0; i < 2; ++i) EXPECT_EQ(::eventfd_write(counter->get(), 3), 0);
-  done.get_future().wait();
-}
-
-TEST_F(ReadSourceTest, CancelsItselfAtTheEndOfItsStream) {
-  auto counter = std::make_shared<const FileDescriptor>(::eventfd(0, 0));
-  int calls = 0;
-  ReadSource source;
-  queue.submit([&] {
-    source = ReadSource(queue, counter, [&] {
-      ++calls;
-      source.cancel();
-      source.cancel();
-      done.set_value();
-    });
-    ::eventfd_write(counter->get(), 1);
-  });
-  done.get_future().wait();
-  drain(queue);
-  EXPECT_EQ(calls, 1);
-  EXPECT_THROW(ReadSource(queue, std::make_shared<const FileDescriptor>(), [] {}), std::system_error);
 }
 
 TEST(WorkQueuePool, StopDestroysWhatHasNotRun) {

@@ -4,19 +4,13 @@
 #include <sys/time.h>
 #include <unistd.h>
 
-#include <atomic>
 #include <cstdlib>
-#include <fstream>
 #include <future>
-#include <memory>
 #include <semaphore>
 #include <thread>
-#include <vector>
 
 #include "daemon/RunLoop.h"
 #include "platform/ipc/UnixSocket.h"
-#include "platform/service/ProcessMemory.h"
-#include "tests/support/ProcessFacts.h"
 #include "tests/support/TempDirectory.h"
 
 namespace vesk {
@@ -110,34 +104,8 @@ TEST_F(RunLoopTest, NotesAPauseAfterWorkOnce) {
   _busy.end();
   EXPECT_TRUE(paused.try_acquire_for(30s));
   EXPECT_FALSE(paused.try_acquire_for(50ms));
-  std::atomic<bool> works{true};
-  std::thread worker([&] {
-    while (works) _busy.touch();
-  });
-  EXPECT_TRUE(paused.try_acquire_for(30s)) << "it can't be put off for ever";
-  works = false;
-  worker.join();
   loop.stop();
   outcome.get();
-}
-
-// Blocks of a thread that has ended, every hundredth of them still in use.
-TEST(ProcessMemory, FreePagesGoBackFromBetweenUsedOnes) {
-  if (test::kIsSanitized) GTEST_SKIP() << "the sanitizer's allocator is another one";
-  const auto resident = [] {
-    std::size_t all = 0, pages = 0;
-    std::ifstream("/proc/self/statm") >> all >> pages;
-    return pages * static_cast<std::size_t>(::sysconf(_SC_PAGESIZE));
-  };
-  std::vector<std::unique_ptr<std::string>> blocks(40'000);
-  std::thread([&] {
-    for (auto& block : blocks) block = std::make_unique<std::string>(1000, 'x');
-  }).join();
-  for (std::size_t i = 0; i < blocks.size(); ++i)
-    if (i % 100 != 0) blocks[i].reset();
-  const std::size_t before = resident();
-  releaseFreePages();
-  EXPECT_LT(resident() + 30'000'000, before);
 }
 
 TEST_F(RunLoopTest, TellsTheManagerHowItGoes) {

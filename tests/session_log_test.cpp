@@ -1,6 +1,4 @@
 // What sessions and the agent write into the system log: every line, in order, whole and with its level.
-#include <gtest/gtest.h>
-
 #include <functional>
 
 #include "tests/support/CapturedLog.h"
@@ -38,14 +36,16 @@ TEST_F(SessionLog, OfASession) {
   const Dictionary parameters{{"category", 1}, {"type", 2}};
   DrivenSession session(harness);
   names.emplace_back("IDENTITY", session->sessionIDString());
-  session.send(parameters);  // before its start: nothing takes anything
+  EXPECT_TRUE(names.back().second.size() == 24 && names.back().second.ends_with("=="));
+  EXPECT_EQ(session.send(parameters), std::nullopt) << "before its start nothing takes anything";
+  EXPECT_EQ(harness.dropped(DropReason::NoBackend), 1u);
   session.flush();
   session->uploadFileAtPath("file:///no%20file", "", {});
   session->uploadLogData({1, "b"}, {});
   session->setSessionInfo(sessionInfo(0), userInfo("MyApp"), {}, true);
   session->setSessionInfo(info, userInfo("MyApp"), {}, false);  // which does not require its user info
   session->setSessionInfo(Dictionary(), {}, {}, false);
-  session.start();  // without a client type there is no storebag
+  EXPECT_EQ(session.start(), std::nullopt) << "without a client type there is no storebag";
   session->setSessionInfo(info, {}, {}, true);
   session.start();
   session->sendMessageWithCategory(1, 2, std::nullopt, {});
@@ -146,9 +146,8 @@ TEST_F(SessionLog, OfTheAgent) {
   auto child = join(1);
   note([&] { child.states(userInfo("MYAPP")); });
   auto top = join(0), grandchild = join(2);
-  names.emplace_back("CHILD", child->sessionIDString());
-  names.emplace_back("TOP", top->sessionIDString());
-  names.emplace_back("GRANDCHILD", grandchild->sessionIDString());
+  for (const auto& [name, session] : {std::pair("CHILD", &child), {"TOP", &top}, {"GRANDCHILD", &grandchild}})
+    names.emplace_back(name, (*session)->sessionIDString());
   top->setSessionInfo(sessionInfo(0), userInfo("MyApp"), {}, true);
   grandchild->setSessionInfo(sessionInfo(2), userInfo("MyApp"), {}, true);
   note([&] { update(child); });

@@ -1,4 +1,4 @@
-// Sessions driven by hand: configuration, dispatch, answers, and their end.
+// Sessions driven by hand: configuration, dispatch, answers, what they may hold back, and their end.
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <unistd.h>
@@ -93,25 +93,13 @@ std::string displayURL(DrivenSession& session) {
   return url;
 }
 
-TEST_F(Session, UnstartedAnswersNothing) {
-  auto session = configured(identified(4));
-  EXPECT_EQ(session->sessionIDString().size(), 24u);
-  EXPECT_TRUE(session->sessionIDString().ends_with("=="));
-  EXPECT_EQ(session.start(), std::nullopt) << "no storebag for this client type";
-  EXPECT_EQ(session.send(message(1, 2)), std::nullopt);
-  EXPECT_EQ(session.states(kCamera), std::nullopt);
-  EXPECT_EQ(displayURL(session), "URL not available");
-  EXPECT_EQ(harness.dropped(DropReason::NoBackend), 1u);
-}
-
 TEST_F(Session, WhatAClientCallsItsFileFillsNoLog) {
   CapturedLog log;
   auto session = configured(identified(4));
   const std::string written = logged([&] {
     for (const std::string& url : {std::string("file:///a%20b(\n(2026) [forged] \xc3\xa9"),
-                                   "file://host" + std::string(1 << 20, '\n'), std::string(1 << 20, 'x')}) {
+                                   "file://host" + std::string(1 << 20, '\n'), std::string(1 << 20, 'x')})
       session->uploadFileAtPath(url, "", {[](const bool& reply) { EXPECT_FALSE(reply); }, nullptr});
-    }
   });
   EXPECT_EQ(std::count(written.begin(), written.end(), '\n'), 3);
   EXPECT_LT(written.size(), 2000u);
@@ -153,11 +141,8 @@ TEST_F(Session, BackendsAreStampedWithTheDeviceAndTheClient) {
                                            .as_object();
     for (const auto& [key, value] : fields) EXPECT_EQ(event.at(key), value) << key;
     const auto* identity = event.if_contains("_sessionID");
-    if (single) {
-      EXPECT_FALSE(identity) << "a temporary backend has no session identity";
-    } else {
-      EXPECT_EQ(identity->as_string(), session->sessionIDString()) << "its own, before there is a family";
-    }
+    EXPECT_EQ(identity ? std::string(identity->as_string()) : "", single ? "" : session->sessionIDString())
+        << "its own, before there is a family; a temporary backend has none";
   }
 }
 
@@ -231,14 +216,10 @@ TEST_F(Session, ParametersAreCheckedAndCut) {
 }
 
 TEST_F(Session, TheAnswerIsTheHTTPPostBackendsOrTheDashboards) {
-  struct Row {
-    const char* backends;
-    std::string sent;          // whose answer: P of httpPost, D of the dashboard
-    std::string loggedBySend;  // from whom the message log has one; 2: httpPost2
-    std::string flushed;       // and the same of a flush
-    std::string loggedByFlush;
-  };
-  const Row rows[] = {
+  // sent: whose answer: P of httpPost, D of the dashboard
+  // loggedBySend: from whom the message log has one; 2: httpPost2
+  // flushed: and the same of a flush
+  const std::tuple<const char*, std::string, std::string, std::string, std::string> rows[] = {
       {"httpPost dashboard", "P", "PD", "", ""},
       {"dashboard httpPost", "P", "PD", "", ""},
       {"httpPost~ dashboard", "D", "D", "P", "P"},
@@ -247,28 +228,26 @@ TEST_F(Session, TheAnswerIsTheHTTPPostBackendsOrTheDashboards) {
       {"httpPost2 dashboard", "D", "2D", "", ""},
       {"dashboard httpPost2~", "D", "D", "", "2"},
       {"httpPost~ httpPost2", "", "2", "P", "P"},
-      {"", "", "", "", ""},
-  };
+      {"", "", "", "", ""}};
   auto whose = [](const std::optional<std::string>& answer) {
     return !answer ? "" : answer->starts_with("{") ? "P" : "D";
   };
-  for (const Row& row : rows) {
-    auto session = started(storebag(row.backends));
+  for (const auto& [backends, sent, loggedBySend, flushed, loggedByFlush] : rows) {
+    SCOPED_TRACE(backends);
+    auto session = started(storebag(backends));
     auto check = [&](const std::string& operation, const std::string& expected, const std::string& log,
                      auto act) {
       std::optional<std::string> answer;
       const std::string lines = logged([&] { answer = act(); });
-      EXPECT_EQ(whose(answer), expected) << row.backends << operation;
+      EXPECT_EQ(whose(answer), expected) << operation;
       std::string from;
-      for (const char* name : {"Post", "Post2", "dashboard"}) {
+      for (const char* name : {"Post", "Post2", "dashboard"})
         if (contains(lines, name + (" -> " + operation + "] ")))
           from += name == std::string("dashboard") ? 'D' : name == std::string("Post") ? 'P' : '2';
-      }
-      EXPECT_EQ(from, log) << row.backends << lines;
+      EXPECT_EQ(from, log) << lines;
     };
-    check("sendMessageWithDictionary", row.sent, row.loggedBySend,
-          [&] { return session.send(message(3, 2)); });
-    check("flushMessages", row.flushed, row.loggedByFlush, [&] { return session.flush(); });
+    check("sendMessageWithDictionary", sent, loggedBySend, [&] { return session.send(message(3, 2)); });
+    check("flushMessages", flushed, loggedByFlush, [&] { return session.flush(); });
   }
 }
 
@@ -280,7 +259,7 @@ TEST_F(Session, AnAnswerIsCutToWhatFitsIntoAMessage) {
     return session.flush().value();
   };
   const std::size_t rest = answerTo("").size();
-  EXPECT_EQ(answerTo(std::string(kMaxAnswerBytes - rest, 'x')).size(), kMaxAnswerBytes);
+  EXPECT_EQ(answerTo(std::string(kMaxAnswerBytes - rest, 'x')).size(), std::size_t{1} << 20);
   for (std::size_t shift = 0; shift < 4; ++shift) {
     std::string text(shift, 'x');
     while (text.size() <= kMaxAnswerBytes) text += "\xF0\x9F\x90\x8B";
@@ -304,7 +283,7 @@ TEST_F(Session, DisplayURLComesFromTheFirstBackendThatHasOne) {
       {"dashboard+ httpPost2+ httpPost", "http://httpPost2?sequences=77&override=yes"},
       {"httpPost httpPost2 dashboard+", "http://dashboard?sequences=77&override=yes"},
       {"dashboard", "URL not available"},
-  };
+      {"", "URL not available"}};
   for (const auto& [backends, expected] : cases) {
     auto session = started(storebag(backends));
     EXPECT_EQ(displayURL(session), expected) << backends;
@@ -377,20 +356,17 @@ TEST_F(Session, UserInfoDecidesPendingBackends) {
   const Dictionary otherClient = merged(kCamera, Dictionary{{kVeskReportingUserInfoClientName, "Other"}});
   const Dictionary nameless{{kVeskReportingUserInfoServiceName, "Clips"}};
   const Dictionary more = merged(kCamera, Dictionary{{"more", 1}});
-  struct Row {
-    std::optional<Dictionary> given;
-    bool isNews;
-  };
-  const Row rows[] = {{std::nullopt, false}, {kCamera, true},      {more, false},
-                      {otherService, true},  {otherClient, true},  {nameless, true},
-                      {nameless, true},      {std::nullopt, true}, {more, true}};
+  const std::pair<std::optional<Dictionary>, bool> rows[] = {
+      {std::nullopt, false}, {kCamera, true},      {more, false},
+      {otherService, true},  {otherClient, true},  {nameless, true},
+      {nameless, true},      {std::nullopt, true}, {more, true}};
   std::optional<Dictionary> kept;
-  for (const Row& row : rows) {
+  for (const auto& [given, isNews] : rows) {
     CapturedLog log;
-    const std::string what = row.given ? describe(*row.given) : "none";
-    if (row.isNews) kept = row.given;
-    EXPECT_EQ(session.states(row.given), kept ? BackendNames{"httpPost"} : BackendNames{}) << what;
-    EXPECT_EQ(log.count(7, "receivedUserInfo: Received new user info for session 77"), row.isNews) << what;
+    const std::string what = given ? describe(*given) : "none";
+    if (isNews) kept = given;
+    EXPECT_EQ(session.states(given), kept ? BackendNames{"httpPost"} : BackendNames{}) << what;
+    EXPECT_EQ(log.count(7, "receivedUserInfo: Received new user info for session 77"), isNews) << what;
     EXPECT_EQ(session->userInfo(), kept) << what;
     harness.posts();
     if (!session.send(message(3, 2))) continue;
@@ -453,6 +429,39 @@ TEST_F(Session, AggregationFollowsTheLastConfigurationAndTheEndComesInOrder) {
   EXPECT_EQ(posts, (std::vector<std::size_t>{0, 1}))
       << "the flush is between the last message and the closing one";
   session.connection->onCall = nullptr;
+}
+
+TEST(HeldBudget, ASessionPaysWithItsOwnEvents) {
+  testRoot().write("etc/veskreporting/device.toml", "DeviceName = \"Phone\"\n");
+  BackendHarness harness;
+  harness.services.heldBudget = std::make_shared<HeldBudget>(
+      HeldBudget::Limits{.ofSession = 1 << 20, .ofUser = 2 << 20, .ofAll = 3 << 20});
+  // Each event takes a tenth of a MiB and a little more.
+  const Dictionary payload{{"bulk", std::string(100 << 10, 'x')}};
+  const std::string of = "HTTPSPostBackend(batchEvent): ";
+  const std::string ofBackend = ": dropping the oldest events of backend httpPost";
+  const std::tuple<const char*, uid_t, int, std::uint64_t, std::string> cases[] = {
+      {"within its own limit", 1, 9, 0, ""},
+      {"above it", 1, 11, 3,
+       of + "backend httpPost holds more than 1048576 bytes: dropping its oldest events"},
+      {"its user's is used up", 1, 9, 8, of + "user 1 holds more than 2097152 bytes" + ofBackend},
+      {"another user's is not", 2, 9, 0, ""},
+      {"all is used up", 3, 9, 8, of + "the daemon holds more than 3145728 bytes" + ofBackend}};
+  std::vector<BackendSet> sessions;
+  for (const auto& [what, user, events, dropped, line] : cases) {
+    SCOPED_TRACE(what);
+    CapturedLog log;
+    const std::uint64_t before = harness.dropped(DropReason::OverBound);
+    sessions.push_back(createBackends(Dictionary{{"httpPost", Dictionary{{"clients", List{}}}}}, Dictionary(),
+                                      std::nullopt, "", "7.0", user, harness.services)
+                           .value());
+    for (int i = 0; i < events; ++i) sessions.back().at(0).second->sendMessage(payload, timeval{}, 3, 2, 0);
+    EXPECT_EQ(harness.dropped(DropReason::OverBound) - before, dropped);
+    EXPECT_EQ(log.countContaining(4, ""), line.empty() ? 0 : 1);
+    EXPECT_EQ(log.count(4, line), line.empty() ? 0 : 1);
+  }
+  sessions.clear();
+  EXPECT_EQ(harness.services.heldBudget->accountFor(1)->exceeded(1 << 20), nullptr) << "given back";
 }
 
 }  // namespace

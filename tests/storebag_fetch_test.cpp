@@ -154,11 +154,7 @@ TEST_F(StorebagFetch, EveryFailureSaysWhatItIs) {
   const std::pair<int, std::string> invalid{3, withName("Signature can not be verified, 0x")};
   const std::pair<int, std::string> unreadable{
       3, withName("propertyListWithData error " + parsePropertyList("junk").error)};
-  const struct {
-    const char* name;
-    std::string body;
-    Lines lines;
-  } cases[] = {
+  const std::tuple<const char*, std::string, Lines> cases[] = {
       {"no property list", "junk", {unreadable, unsigned_, unfetched}},
       {"no content",
        "",
@@ -177,16 +173,15 @@ TEST_F(StorebagFetch, EveryFailureSaysWhatItIs) {
       {"a payload that is no property list", serialized(document("junk", "junk")), {unfetched}},
       {"a payload that is a list",
        serialized(document(*writeXMLPropertyList(List{}), *writeXMLPropertyList(List{}))),
-       {unfetched}},
-  };
-  for (const auto& test : cases) {
-    SCOPED_TRACE(test.name);
-    serve(test.body, {{"Cache-Control", "max-age=77"}});
+       {unfetched}}};
+  for (const auto& [name, body, expectedLines] : cases) {
+    SCOPED_TRACE(name);
+    serve(body, {{"Cache-Control", "max-age=77"}});
     EXPECT_FALSE(fetch());
     EXPECT_FALSE(version);
     EXPECT_FALSE(notModified);
     EXPECT_EQ(maxAge, 77) << "written before anything fails";
-    EXPECT_EQ(lines(), test.lines);
+    EXPECT_EQ(lines(), expectedLines);
   }
 }
 
@@ -255,41 +250,41 @@ TEST_F(StorebagFetch, AsksOnlyForWhatIsNewer) {
   const std::string adding = withName("Adding 'Last-Modified: " + first + "' to the header");
   const std::string unchanged = withName("storebag content has not changed. using its cached version");
 
-  // The first answer has no content: its age counts all the same.
-  serve("", {{"Last-Modified", first}});
-  EXPECT_FALSE(fetch());
-  EXPECT_FALSE(notModified);
-  EXPECT_EQ(lastModified, first);
-  EXPECT_EQ(maxAge, 86400);
-  EXPECT_EQ(lines(), (Lines{{7, withName("New 'Last-Modified: " + first + "' received")},
-                            {3, withName("propertyListWithData error " + parsePropertyList("").error)},
-                            {3, withName("Signature is missing")},
-                            {3, forClientType("Could not fetch storebag for client type 5")}}));
-
-  serve("", {{"Last-Modified", second}, {"Cache-Control", "max-age=60"}}, 304);
-  EXPECT_FALSE(fetch());
-  EXPECT_TRUE(notModified);
-  EXPECT_EQ(lastModified, first);
-  EXPECT_EQ(maxAge, 60);
-  EXPECT_EQ(lines(), (Lines{{7, adding}, {7, unchanged}}));
-  EXPECT_EQ(server().requests().back().header("If-Modified-Since"), first);
-
-  // Without the header an empty answer is a failure.
-  serve("", {}, 304);
-  EXPECT_FALSE(fetch());
-  EXPECT_FALSE(notModified);
-  EXPECT_EQ(lastModified, first);
-
-  serve(signedStorebag(payload()), {{"last-modified", second}});
-  EXPECT_EQ(fetch(), kSeed);
-  EXPECT_EQ(lastModified, second);
-  EXPECT_EQ(lines(), (Lines{{7, adding}, {7, withName("New 'Last-Modified: " + second + "' received")}}));
-
-  // With content it is no answer of that kind, whatever it says of its age.
-  serve("junk", {{"Last-Modified", first}});
-  EXPECT_FALSE(fetch());
-  EXPECT_FALSE(notModified);
-  EXPECT_EQ(lastModified, first);
+  const std::string changed = withName("New 'Last-Modified: " + second + "' received");
+  const Lines junk{{7, withName("Adding 'Last-Modified: " + second + "' to the header")},
+                   {7, withName("New 'Last-Modified: " + first + "' received")},
+                   {3, withName("propertyListWithData error " + parsePropertyList("junk").error)},
+                   {3, withName("Signature is missing")},
+                   {3, forClientType("Could not fetch storebag for client type 5")}};
+  const std::pair<int, std::string> empty{
+      3, withName("propertyListWithData error " + parsePropertyList("").error)};
+  const auto good = signedStorebag(payload());
+  // wasNotModified, known, age: what the fetch tells of its answer; its age counts also without content.
+  const std::tuple<unsigned, std::string, HTTPHeaderList, bool, std::string, std::int32_t, Lines> cases[] = {
+      {200, "", {{"Last-Modified", first}}, false, first, 86400, {junk[1], empty, junk[3], junk[4]}},
+      {304,
+       "",
+       {{"Last-Modified", second}, {"Cache-Control", "max-age=60"}},
+       true,
+       first,
+       60,
+       {{7, adding}, {7, unchanged}}},
+      // Without the header an empty answer is a failure.
+      {304, "", {}, false, first, 86400, {{7, adding}, empty, junk[3], junk[4]}},
+      {200, good, {{"last-modified", second}}, false, second, 86400, {{7, adding}, {7, changed}}},
+      // With content it is no answer of that kind, whatever it says of its age.
+      {200, "junk", {{"Last-Modified", first}}, false, first, 86400, junk}};
+  for (const auto& [status, body, headers, wasNotModified, known, age, expectedLines] : cases) {
+    SCOPED_TRACE(known + body);
+    const auto before = lastModified;
+    serve(body, headers, status);
+    EXPECT_EQ(fetch(), body == good ? std::optional(kSeed) : std::nullopt);
+    EXPECT_EQ(server().requests().back().header("If-Modified-Since"), before);
+    EXPECT_EQ(notModified, wasNotModified);
+    EXPECT_EQ(lastModified, known);
+    EXPECT_EQ(maxAge, age);
+    EXPECT_EQ(lines(), expectedLines);
+  }
 
   // Without a slot nothing is conditional.
   serve(signedStorebag(payload()), {{"Last-Modified", first}});
@@ -298,13 +293,15 @@ TEST_F(StorebagFetch, AsksOnlyForWhatIsNewer) {
 }
 
 TEST_F(StorebagFetch, TheStorebagsOwnAgeGoesBeforeTheServers) {
-  struct Case {
-    Value cycle;
-    std::int32_t age;
-  };
-  for (const auto& [cycle, age] :
-       {Case{172800, 86400}, Case{86401, 86400}, Case{300, 300}, Case{0, 0}, Case{-5, -5}, Case{12.9, 12},
-        Case{std::int64_t{1} << 40, 86400}, Case{-(std::int64_t{1} << 40), -2147483647 - 1}}) {
+  const std::pair<Value, std::int32_t> cases[] = {{172800, 86400},
+                                                  {86401, 86400},
+                                                  {300, 300},
+                                                  {0, 0},
+                                                  {-5, -5},
+                                                  {12.9, 12},
+                                                  {std::int64_t{1} << 40, 86400},
+                                                  {-(std::int64_t{1} << 40), INT32_MIN}};
+  for (const auto& [cycle, age] : cases) {
     serve(signedStorebag(payload({{"refresh_cycle", cycle}})), {{"Cache-Control", "max-age=600"}});
     EXPECT_TRUE(fetch());
     EXPECT_EQ(maxAge, age);
@@ -323,15 +320,13 @@ TEST_F(StorebagFetch, TheStorebagsOwnAgeGoesBeforeTheServers) {
 
 TEST_F(StorebagFetch, ASeedDeviceTakesTheReleaseSectionWhenThereIsNoOther) {
   const std::pair<int, std::string> missing{4, forClientType("Seed section is missing in the storebag.")};
+  const auto none = forClientType("Could not find storebag for client type 5 with release environment");
   serve(signedStorebag(payload({}, "seed")));
   EXPECT_EQ(fetch(), kRelease);
   EXPECT_EQ(lines(), Lines{missing});
   serve(signedStorebag({{"version", "1"}, {"refresh_cycle", 5}}), {{"Cache-Control", "max-age=600"}});
   EXPECT_FALSE(fetch());
-  EXPECT_EQ(
-      lines(),
-      (Lines{missing,
-             {3, forClientType("Could not find storebag for client type 5 with release environment")}}));
+  EXPECT_EQ(lines(), (Lines{missing, {3, none}}));
   EXPECT_FALSE(version);
   EXPECT_EQ(maxAge, 600);
 }
@@ -373,10 +368,7 @@ TEST(StorebagRequest, IsGivenUpAfterFifteenSeconds) {
 }
 
 TEST(StorebagAge, IsWhatCacheControlGrants) {
-  const struct {
-    std::optional<std::string_view> header;
-    std::int32_t age;
-  } cases[] = {
+  const std::pair<std::optional<std::string_view>, std::int32_t> cases[] = {
       {std::nullopt, 86400},
       {"", 86400},
       {"no-cache", 86400},
@@ -391,11 +383,9 @@ TEST(StorebagAge, IsWhatCacheControlGrants) {
       {"public,max-age=600", 86400},
       {"max-age 30", 30},
       {"max-age=99999999999", 2147483647},
-      {"max-age=-99999999999", -2147483647 - 1},
-  };
-  for (const auto& test : cases) {
-    EXPECT_EQ(maxAgeFromCacheControl(test.header), test.age) << test.header.value_or("(none)");
-  }
+      {"max-age=-99999999999", -2147483647 - 1}};
+  for (const auto& [header, age] : cases)
+    EXPECT_EQ(maxAgeFromCacheControl(header), age) << header.value_or("(none)");
 }
 
 }  // namespace

@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 #include <sched.h>
 #include <sys/mount.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 
 #include <filesystem>
@@ -16,7 +15,6 @@
 #include "platform/ipc/ExtensionTokens.h"
 #include "platform/queue/TimedQueuePool.h"
 #include "tests/support/CapturedLog.h"
-#include "tests/support/ProcessFacts.h"
 #include "tests/support/RecordingServer.h"
 #include "tests/support/TempDirectory.h"
 
@@ -310,21 +308,6 @@ TEST_F(UploadTest, TakesItsUsersShareForTheFileAndItsCompressedForm) {
   }
   EXPECT_TRUE(hasRoomMeanwhile);
   EXPECT_TRUE(services.uploads->enter(user, 200'000)) << "all of it is free again";
-}
-
-TEST_F(UploadTest, AFileThatFindsNoMemoryIsRefused) {
-  if (kIsSanitized) GTEST_SKIP() << "the sanitizer takes all addresses";
-  const std::string path = file();
-  fs::resize_file(path, UploadBackend::kMaximumFile);
-  rlimit before{};
-  ::getrlimit(RLIMIT_AS, &before);
-  const rlimit scarce{std::uint64_t{128} << 20, before.rlim_max};
-  const std::string lent = token(opened(path));
-  ::setrlimit(RLIMIT_AS, &scarce);
-  EXPECT_FALSE(backend->uploadFileAtPath(path, lent));
-  ::setrlimit(RLIMIT_AS, &before);
-  EXPECT_EQ(log.lines().back(), Line(3, kUnit + "Not enough memory for the input file"));
-  EXPECT_TRUE(fs::exists(path));
 }
 
 TEST(UploadGateTest, LetsInWhatThereIsRoomForAndLeavesSomeToOthers) {

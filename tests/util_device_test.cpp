@@ -91,24 +91,6 @@ TEST_F(Device, ReadsOSReleaseAsAShellWould) {
   EXPECT_EQ(QNCopyAnswer("ProductVersion"), std::nullopt) << "the first of both files counts";
 }
 
-TEST_F(Device, IgnoresFactsThatAreNone) {
-  testRoot().write("etc/os-release", "VERSION_ID=12\n");
-  for (const auto& [fact, answer] :
-       std::map<std::string, std::string>{{"\"\"", "12"},
-                                          {'"' + std::string(129, 'x') + '"', "12"},
-                                          {'"' + std::string(128, 'x') + '"', std::string(128, 'x')},
-                                          {"\"a\\nb\"", "12"},
-                                          {"\"a\\u0000\"", "12"},
-                                          {"\"\\u001f\"", "12"},
-                                          {"\"\\u007f\"", "12"},
-                                          {"\" \"", " "},
-                                          {"2210", "2210"},
-                                          {"[1]", "12"}}) {
-    testRoot().write(kFacts, "ProductVersion = " + fact + "\n");
-    EXPECT_EQ(QNCopyAnswer("ProductVersion"), answer) << fact;
-  }
-}
-
 TEST_F(Device, HasAnIdentifierThatIsDerivedFromItsMachineID) {
   // The first 20 bytes of SHA-256 over the label "com.corvane.veskreportingd device identifier 1\n" and the
   // ID.
@@ -235,15 +217,6 @@ TEST(ReportingdUtil, EncodesWhatAQueryMayNotHold) {
   EXPECT_EQ(encodedForURLQuery(" #%[]\"\\\n<>^`{|}\x7f\xc3\xa9"),
             "%20%23%25%5B%5D%22%5C%0A%3C%3E%5E%60%7B%7C%7D%7F%C3%A9");
   EXPECT_EQ(encodedForURL(unreserved + "#[]%20 \"\xc3\xa9"), unreserved + "#[]%20%20%22%C3%A9");
-}
-
-TEST(ReportingdUtil, KnowsWebURLs) {
-  for (const char* url : {"http://h", "HTTPS://[::1]:8443/a?b=c#d", "https://user@h/%20(-._~!$&'*+,;=)"})
-    EXPECT_TRUE(isWebURL(url)) << url;
-  for (const char* url :
-       {"", "http://", "https://", "http:///x", "http://?x", "http://#", "http://:80/", "ftp://h", "//h",
-        "https//h", "http://h/a b", "http://h/\"", "http://h/\xc3\xa9", "xhttp://h"})
-    EXPECT_FALSE(isWebURL(url)) << url;
 }
 
 }  // namespace

@@ -162,17 +162,6 @@ TEST_F(VeskreportCommand, SendsEachLineOfStandardInput) {
       1U);
 }
 
-TEST_F(VeskreportCommand, SendsManyLinesInOrder) {
-  constexpr int kLines = 3000;
-  std::string input;
-  for (int i = 0; i < kLines; ++i) input += "{\"n\":" + std::to_string(i) + "}\n";
-  auto outcome = runClient({"send", "--stdin", "-c", "1", "-t", "2"}, input);
-  EXPECT_EQ(outcome.output, "3000 messages sent\n");
-  auto lines = record.lines();
-  ASSERT_EQ(lines.size(), 2U + kLines);
-  EXPECT_NE(lines.back().find("\"n\": 2999}"), std::string::npos);
-}
-
 TEST_F(VeskreportCommand, SaysWhatFailed) {
   record.setBackends(std::nullopt);
   auto outcome = runClient({"send", "-c", "1", "-t", "2", "--json"});

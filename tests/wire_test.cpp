@@ -1,12 +1,8 @@
 // D-Bus messages: what arrives, what is refused, and whether other implementations agree.
 #include <gtest/gtest.h>
-#include <malloc.h>
-#include <poll.h>
 
-#include <future>
 #include <limits>
 
-#include "platform/ipc/BusClient.h"
 #include "platform/ipc/IPCIncomingCall.h"
 #include "platform/ipc/IPCListener.h"
 #include "platform/ipc/MessageWriter.h"
@@ -88,7 +84,7 @@ std::string message(const OutgoingHeader& header, const std::vector<IPCArgument>
   return bytes;
 }
 
-/// Serves "take" (every type of argument) and "echo" (any value), and ends a wait with "done".
+/// Answers a call with its value.
 class Echo final : public IPCExportedObject, public IPCListenerDelegate {
  public:
   Echo() {
@@ -103,26 +99,8 @@ class Echo final : public IPCExportedObject, public IPCListenerDelegate {
   const char* interfaceName() const override { return kInterface; }
   const char* introspection() const override { return "<interface name=\"test.Interface\"/>\n"; }
   void handle(IPCIncomingCall& call) override {
-    if (call.member() == "echo") {
-      Value value;
-      if (call.read("v", value)) call.answer({List{value}});
-      return;
-    }
-    bool flag = false;
-    std::uint16_t number = 0;
-    double real = 0;
-    std::string text;
-    Dictionary dictionary;
-    List list;
-    std::optional<Dictionary> maybeDictionary;
-    std::optional<std::string> maybeText;
-    std::vector<std::string> texts;
-    std::optional<std::vector<std::string>> maybeTexts;
-    EXPECT_TRUE(call.read("bqdsa{sv}avaa{sv}asasaas", flag, number, real, text, dictionary, list,
-                          maybeDictionary, maybeText, texts, maybeTexts));
-    taken.set_value(
-        {flag, number, real, text, dictionary, list, maybeDictionary, maybeText, texts, maybeTexts});
-    call.answer();
+    Value value;
+    if (call.read("v", value)) call.answer({List{value}});
   }
   bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) override {
     connection->setExportedObject(std::shared_ptr<IPCExportedObject>(this, [](auto*) {}));
@@ -130,37 +108,10 @@ class Echo final : public IPCExportedObject, public IPCListenerDelegate {
     return true;
   }
 
-  std::promise<std::vector<IPCArgument>> taken;
-
  private:
   TempDirectory _directory;
   std::unique_ptr<IPCListener> _listener;
 };
-
-TEST(Wire, CarriesEveryArgument) {
-  for (bool full : {false, true}) {
-    for (bool expectsReply : {false, true}) {
-      Echo echo;
-      BusClient::Options options;
-      options.socketPath = echo.socket();
-      options.objectPath = kObjectPath;
-      BusClient client(std::move(options));
-      const IPCOutgoingCall call{kInterface, "take", arguments(full)};
-      bool isAnswered = !expectsReply;
-      auto answered = [&](BusAnswer& answer) { isAnswered = !answer.isError(); };
-      auto result = expectsReply ? client.send(call, answered, std::chrono::seconds(60)) : client.send(call);
-      ASSERT_EQ(result, BusClient::SendResult::Sent) << "it waits until the client has been let in";
-      auto taken = echo.taken.get_future();
-      while (!isAnswered || taken.wait_for(std::chrono::seconds(0)) != std::future_status::ready) {
-        pollfd poll{client.fd(), client.events(), 0};
-        ::poll(&poll, 1, isAnswered ? 10 : client.timeout());
-        ASSERT_EQ(client.process(), BusClient::Progress::Connected);
-      }
-      EXPECT_EQ(client.queuedMessages(), 0U);
-      EXPECT_EQ(message(kHeader, taken.get()), message(kHeader, arguments(full)));
-    }
-  }
-}
 
 // GIO and libdbus send each type in both byte orders, and compare what comes back.
 TEST(Wire, UnderstandsOtherImplementations) {
@@ -173,9 +124,8 @@ TEST(Wire, UnderstandsOtherImplementations) {
 
 std::string described(std::vector<Value> values) { return describe(List(std::move(values)), kShown); }
 
-/// All arguments of the message that `bytes` are; "refused" when they are none, or when bytes are left behind
-/// the arguments and `toTheEnd`.
-std::string readHere(const std::string& bytes, bool toTheEnd = true) {
+/// All arguments of the message in `bytes`, or "refused".
+std::string readHere(const std::string& bytes) {
   HeaderParser parser;
   const auto* header = parser.parse(bytes);
   if (!header || header->descriptors > 0) return "refused";
@@ -185,7 +135,7 @@ std::string readHere(const std::string& bytes, bool toTheEnd = true) {
        types.remove_prefix(completeTypeLength(types))) {
     if (!reader.read(values.emplace_back())) return "refused";
   }
-  return !toTheEnd || reader.finish() ? described(std::move(values)) : "refused";
+  return reader.finish() ? described(std::move(values)) : "refused";
 }
 
 std::string readBySdBus(BusServer& server, const std::string& bytes) {
@@ -242,22 +192,6 @@ TEST(Wire, IsReadBySdBusAsItWasWritten) {
   }
 }
 
-// sd-bus takes four kinds of message that break the format's rules.
-enum class SdBusIsLax { No, BodyWithoutSignature, BytesBehindTheArguments, BooleanBeyondOne, Padding };
-
-/// Why sd-bus reads `bytes`, of which the byte `at` was changed, when we don't.
-SdBusIsLax whySdBusReads(const std::string& bytes, std::size_t at, const std::string& there) {
-  if (there == "[]") return SdBusIsLax::BodyWithoutSignature;
-  if (readHere(bytes, false) == there) return SdBusIsLax::BytesBehindTheArguments;
-  std::string padding = bytes;
-  padding[at] = '\0';
-  if (readHere(padding) == there) return SdBusIsLax::Padding;
-  std::string boolean = bytes;
-  const char one[] = {bytes[0] == 'l', 0, 0, bytes[0] == 'B'};
-  boolean.replace(at / 4 * 4, 4, one, 4);
-  return readHere(boolean) == there ? SdBusIsLax::BooleanBeyondOne : SdBusIsLax::No;
-}
-
 // Whatever bit of a message is wrong, both readers refuse it, or read the same.
 TEST(Wire, AgreesWithSdBusOnBrokenMessages) {
   BusServer server;
@@ -272,10 +206,8 @@ TEST(Wire, AgreesWithSdBusOnBrokenMessages) {
     ++(here == "refused" ? refused : read);
     if (here == there) return;
     ++lax;
-    EXPECT_TRUE(here == "refused" && whySdBusReads(bytes, at, there) != SdBusIsLax::No)
-        << "byte " << at << "\n"
-        << here << "\n"
-        << there;
+    // sd-bus takes bodies without a signature, excess bytes, booleans beyond one, and bytes in the padding.
+    EXPECT_EQ(here, "refused") << "byte " << at << ": " << there;
   };
   const std::string ordinary =
       message(kHeader, {mixed(), std::optional<Dictionary>(Dictionary{{"k", "v"}}), List{"a", 2U}, true,
@@ -307,47 +239,27 @@ std::string single(const char* type, const std::string& text) {
 }
 
 TEST(Wire, AgreesWithSdBusOnNamesAndTypes) {
+  auto depth = [](int count, char open) { return std::string(static_cast<std::size_t>(count), open); };
   struct Case {
     const char* type;
-    std::string text;
     bool isValid;
+    std::vector<std::string> texts;
     bool sdBusIsLax = false;
   };
   BusServer server;
-  for (const Case& c : {
-           Case{"o", "/", true},
-           Case{"o", "/a_1/B", true},
-           Case{"o", "", false},
-           Case{"o", "a", false},
-           Case{"o", "/a/", false},
-           Case{"o", "/a//b", false},
-           Case{"o", "/a-b", false},
-           Case{"g", "", true},
-           Case{"g", "ybnqiuxtdsogv", true},
-           Case{"g", "a{sa(iv)}(s(b)ay)", true},
-           Case{"g", std::string(32, 'a') + "y", true},
-           Case{"g", std::string(33, 'a') + "y", false},
-           Case{"g", std::string(32, '(') + "y" + std::string(32, ')'), true},
-           Case{"g", std::string(33, '(') + "y" + std::string(33, ')'), false},
-           Case{"g", "a", false},
-           Case{"g", "()", false},
-           Case{"g", "(i", false},
-           Case{"g", "i)", false},
-           Case{"g", "{sv}", false, true},
-           Case{"g", "a{vs}", false},
-           Case{"g", "a{s}", false},
-           Case{"g", "a{sss}", false},
-           Case{"g", "a{sv", false},
-           Case{"g", "z", false},
-           Case{"s", "a\xc2\xa0z", true},
-           Case{"s", "a\0b"s, false},
-           Case{"s", "\xed\xa0\x80", false},
-           Case{"s", "\xc0\x80", false},
-       }) {
-    SCOPED_TRACE(std::string(c.type) + " " + ::testing::PrintToString(c.text));
-    const std::string bytes = single(c.type, c.text);
-    EXPECT_EQ(readHere(bytes) != "refused", c.isValid);
-    EXPECT_EQ(readBySdBus(server, bytes) != "refused", c.isValid || c.sdBusIsLax);
+  for (const Case& c :
+       {Case{"o", true, {"/", "/a_1/B"}}, Case{"o", false, {"", "a", "/a/", "/a//b", "/a-b"}},
+        Case{"g", true, {"", "ybnqiuxtdsogv", "a{sa(iv)}(s(b)ay)", depth(32, 'a') + "y"}},
+        Case{"g", true, {depth(32, '(') + "y" + depth(32, ')')}},
+        Case{"g", false, {depth(33, 'a') + "y", depth(33, '(') + "y" + depth(33, ')'), "a", "()", "(i"}},
+        Case{"g", false, {"i)", "a{vs}", "a{s}", "a{sss}", "a{sv", "z"}}, Case{"g", false, {"{sv}"}, true},
+        Case{"s", true, {"a\xc2\xa0z"}}, Case{"s", false, {"a\0b"s, "\xed\xa0\x80", "\xc0\x80"}}}) {
+    for (const std::string& text : c.texts) {
+      SCOPED_TRACE(std::string(c.type) + " " + ::testing::PrintToString(text));
+      const std::string bytes = single(c.type, text);
+      EXPECT_EQ(readHere(bytes) != "refused", c.isValid);
+      EXPECT_EQ(readBySdBus(server, bytes) != "refused", c.isValid || c.sdBusIsLax);
+    }
   }
 }
 
@@ -363,15 +275,7 @@ std::string headerOnly(char type, const std::vector<std::tuple<char, const char*
       fields.field(code, signature, value);
     }
   }
-  const std::string bytes = fields.take();
-  Marshalled whole(false);
-  whole.raw(std::string("l") + type + "\1\1");
-  whole.number(0);
-  whole.number(1);
-  whole.number(static_cast<std::uint32_t>(bytes.size()));
-  whole.raw(bytes);
-  whole.align(8);
-  return whole.take();
+  return wholeMessage(std::string("l") + type + "\1\1", fields.take(), "");
 }
 
 TEST(Wire, AgreesWithSdBusOnHeaders) {
@@ -453,26 +357,6 @@ TEST(Wire, WritesNothingThatNoReceiverTakes) {
   }
 }
 
-#if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
-TEST(Wire, AnEventKeepsLittleMoreThanWhatIsCounted) {
-  const Dictionary payload{{"a", "b"}, {"l", List{Dictionary{{"c", 1}}}}};
-  const std::string bytes =
-      message(kHeader, {Dictionary{{"payload", payload}, {"stray", std::string(7'900, 'x')}}});
-  HeaderParser parser;
-  std::vector<Dictionary> kept;
-  const std::size_t before = ::mallinfo2().uordblks;
-  for (int i = 0; i < 1000; ++i) {
-    const auto* header = parser.parse(bytes);
-    MessageReader reader({header, 1, std::string_view(bytes).substr(parser.headerSize()), {}});
-    Dictionary whole;
-    ASSERT_TRUE(reader.read(whole));
-    kept.push_back(*whole.dictionary("payload"));
-  }
-  EXPECT_EQ(kept.back(), payload);
-  EXPECT_LT(::mallinfo2().uordblks - before, 1000 * (approximateMemory(kept[0]) + 1024) * 11 / 10);
-}
-#endif
-
 // --- Authentication
 
 TEST(Sasl, ServesLines) {
@@ -520,30 +404,6 @@ TEST(Sasl, ServesLines) {
       }
     }
   }
-  EXPECT_EQ(SaslServer(1000).step("AUTH").verdict, V::Refused) << "without the first NUL";
-  EXPECT_EQ(SaslServer(1000).step("\0"s + std::string(1025, 'x')).verdict, V::Refused);
-  std::string many(1, '\0');
-  for (int i = 0; i < 33; ++i) many += "AUTH\r\n";
-  EXPECT_EQ(SaslServer(1000).step(many).verdict, V::Refused);
-}
-
-TEST(Sasl, ClientReadsAnswers) {
-  using V = SaslClient::Verdict;
-  struct Case {
-    const char* heard;
-    V verdict;
-    const char* refusal;
-  };
-  for (const Case& c :
-       {Case{"DATA\r\nOK 12\r\nAGREE_UNIX_FD\r\n", V::Accepted, ""},
-        Case{"DATA\r\nOK 12\r\n", V::Continue, ""},
-        Case{"REJECTED EXTERNAL\r\n", V::Refused, "REJECTED EXTERNAL"},
-        Case{"DATA\r\nOKAY\r\n", V::Refused, "OKAY"}, Case{"DATA\r\nOK\r\nERROR\r\n", V::Refused, "ERROR"}}) {
-    SaslClient client;
-    EXPECT_EQ(client.step(c.heard).verdict, c.verdict) << c.heard;
-    EXPECT_EQ(client.refusal(), c.refusal);
-  }
-  EXPECT_EQ(SaslClient().step(std::string(1025, 'x')).verdict, V::Refused);
 }
 
 }  // namespace

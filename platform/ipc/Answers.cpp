@@ -17,6 +17,7 @@ void Answers::send(std::uint32_t call, const std::vector<IPCArgument>& arguments
   sendError(call, kErrorFailed, "The answer can't be sent");
 } catch (const std::exception& error) {
   VESK_LOG_ERROR("ipc: An answer is lost: %s", error.what());
+  _isBroken = true;
 }
 
 void Answers::sendError(std::uint32_t call, const char* errorName, const char* text) noexcept try {
@@ -26,6 +27,7 @@ void Answers::sendError(std::uint32_t call, const char* errorName, const char* t
   if (result == CodecResult::Ok) add(std::move(message));
 } catch (const std::exception& error) {
   VESK_LOG_ERROR("ipc: An answer is lost: %s", error.what());
+  _isBroken = true;
 }
 
 bool Answers::owe() {

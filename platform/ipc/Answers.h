@@ -40,6 +40,9 @@ class Answers {
 
   /// On the connection's thread: puts what waits into the channel's output.
   void moveTo(Channel& channel);
+  /// Whether an answer could not even be written as an error. Its caller would wait for ever, so the
+  /// connection has to end.
+  bool isBroken() const noexcept { return _isBroken.load(); }
   /// Drops what waits and what will come.
   void close() noexcept;
 
@@ -49,6 +52,7 @@ class Answers {
 
   const std::function<void()> _wake;
   std::atomic<std::uint32_t> _lastSerial{0};
+  std::atomic<bool> _isBroken{false};
   std::atomic<std::thread::id> _thread{};
 
   Mutex _mutex;

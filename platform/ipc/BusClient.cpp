@@ -18,9 +18,6 @@ namespace {
 // Messages served in one `process`, so that a daemon that sends without end leaves the owner's loop its turn.
 constexpr int kMaximumSteps = 64;
 
-// The daemon's messages are bounded likewise.
-constexpr std::size_t kMaximumIncoming = kMaximumMessageSize + 64 * 1024;
-
 // Bytes, as far as the system allows: small messages take several times their size in the kernel.
 constexpr int kSendBuffer = 1 << 20;
 
@@ -48,7 +45,7 @@ BusClient::BusClient(Options options)
                                                   : connectUnixSocket(options.socketPath))),
       _router(options.objectPath, "client", _answers, {}),
       _writer(options.objectPath),
-      _channel(_socket.get(), kMaximumIncoming) {
+      _channel(_socket.get(), kMaximumMessageSize) {
   ::fcntl(_socket.get(), F_SETFL, ::fcntl(_socket.get(), F_GETFL) | O_NONBLOCK);
   ::setsockopt(_socket.get(), SOL_SOCKET, SO_SNDBUF, &kSendBuffer, sizeof kSendBuffer);
   _channel.output() += SaslClient::greeting();

@@ -43,6 +43,7 @@ ConnectionLoop::End ConnectionLoop::serve(const std::atomic<bool>& invalidated) 
   for (;;) {
     sendOutgoing();
     if (invalidated.load()) return drain();
+    if (_answers.isBroken()) return closeFor("an answer is lost");
     if (!_isReady && std::chrono::steady_clock::now() >= deadline) {
       VESK_LOG_WARNING("ipc: %s: Closed: not authenticated in time", _name.c_str());
       return End::NotAuthenticated;

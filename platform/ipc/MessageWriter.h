@@ -24,8 +24,9 @@ struct OutgoingHeader {
   std::uint32_t replySerial = 0;
 };
 
-/// Longer messages are refused, as they are by the receiver.
-inline constexpr std::size_t kMaximumMessageSize = std::size_t{1} << 20;
+/// Bytes of a message that either end takes: the content is limited to 1 MiB, with an error that says so, and
+/// what is around it to 64 KiB.
+inline constexpr std::size_t kMaximumMessageSize = (std::size_t{1} << 20) + 64 * 1024;
 
 /// Appends a message to `out`, in little-endian order. Unless it returns Ok, `out` is as before, also when it
 /// throws. `serial` is not 0. Descriptors among the arguments are counted; the caller sends them along.

@@ -3,9 +3,6 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#define SD_JOURNAL_SUPPRESS_LOCATION
-#include <systemd/sd-journal.h>
-
 #include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
@@ -94,10 +91,10 @@ void emit(LogLevel level, std::string_view text, std::chrono::milliseconds patie
   const LogState* log = state().load();
   if (log->sink) {
     log->sink(level, line);
+  } else if (auto journal = SystemLog::journal(); log->toJournal && journal) {
+    journal(level, line, log->processName, log->facility);
   } else if (log->toJournal) {
-    sd_journal_send("MESSAGE=%s", line.c_str(), "PRIORITY=%i", static_cast<int>(level),
-                    "SYSLOG_IDENTIFIER=%s", log->processName.c_str(), "VESK_FACILITY=%s",
-                    log->facility.c_str(), nullptr);
+    writeToStandardError("<" + std::to_string(static_cast<int>(level)) + ">" + line, patience);
   } else {
     writeToStandardError(withHead(*log, level, line), patience);
   }

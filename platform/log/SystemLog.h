@@ -5,16 +5,18 @@
 #include <chrono>
 #include <cstdint>
 #include <functional>
+#include <string>
 #include <string_view>
 
 #include "platform/log/LogLevel.h"
 
 namespace vesk {
 
-/// Writes the process's log lines. Lines go to the journal when stderr is connected to it, else to stderr as
-/// "2026-11-24 20:31:29.123 name[pid] <level> text", in UTC. Safe from any thread, also
-/// under other locks (it takes none but the rate limit's, for a look-up); never throws, raises no SIGPIPE.
-/// Control characters in a line are shown as \xNN, so that text from outside can't forge a line.
+/// Writes the process's log lines, to stderr as "2026-11-24 20:31:29.123 name[pid] <level> text", in UTC.
+/// Where stderr is connected to the journal they go there instead: through `setJournal`, or as "<level>text",
+/// which the journal understands. Safe from any thread, also under other locks (it takes none but the rate
+/// limit's, for a look-up); never throws, raises no SIGPIPE. Control characters in a line are shown as \xNN,
+/// so that text from outside can't forge a line.
 class SystemLog {
  public:
   using Sink = std::function<void(LogLevel, std::string_view line)>;
@@ -40,6 +42,13 @@ class SystemLog {
   /// their own. The sink is called on the logging thread and must not log.
   static void setSink(Sink sink);
 
+  /// How to reach the journal with all that is known of a line; a function that may be called from any
+  /// thread.
+  using Journal = void (*)(LogLevel level, const std::string& line, const std::string& processName,
+                           const std::string& facility);
+  static void setJournal(Journal journal) noexcept { _journal.store(journal); }
+  static Journal journal() noexcept { return _journal.load(); }
+
   /// From now on, of the lines of one VESK_LOG for one user (LogUser) only the first `lines` in ten seconds
   /// are written, and then one that gives the number of those left out. Level 3 is never limited. 0: no
   /// limit, which is the default.
@@ -52,6 +61,7 @@ class SystemLog {
  private:
   static std::atomic<int> _level;
   static std::atomic<int> _patience;  ///< milliseconds
+  static inline std::atomic<Journal> _journal{nullptr};
   static std::chrono::milliseconds patience() noexcept {
     return std::chrono::milliseconds(_patience.load(std::memory_order_relaxed));
   }

@@ -73,28 +73,24 @@ struct DrivenSession {
   ReportingdSession* operator->() const { return session.get(); }
 
   std::optional<BackendNames> start() {
-    std::optional<BackendNames> names;
-    session->startConfigWithCompletionHandler(
-        {[&](const std::optional<BackendNames>& reply) { names = reply; }, nullptr});
-    return names;
+    return answer<BackendNames>([&](auto to) { session->startConfigWithCompletionHandler({to, {}}); });
   }
   std::optional<BackendNames> states(const std::optional<Dictionary>& userInfo) {
-    std::optional<BackendNames> names;
-    session->fetchStatesWithUserInfo(
-        userInfo, {[&](const std::optional<BackendNames>& reply) { names = reply; }, nullptr});
-    return names;
+    return answer<BackendNames>([&](auto to) { session->fetchStatesWithUserInfo(userInfo, {to, {}}); });
   }
   std::optional<std::string> flush() {
-    std::optional<std::string> answer;
-    session->flushMessagesWithReply(
-        {[&](const std::optional<std::string>& reply) { answer = reply; }, nullptr});
-    return answer;
+    return answer<std::string>([&](auto to) { session->flushMessagesWithReply({to, {}}); });
   }
-  std::optional<std::string> send(Dictionary parameters) {
-    std::optional<std::string> answer;
-    session->sendMessageWithDictionary(
-        parameters, {[&](const std::optional<std::string>& reply) { answer = reply; }, nullptr});
-    return answer;
+  std::optional<std::string> send(const Dictionary& parameters) {
+    return answer<std::string>([&](auto to) { session->sendMessageWithDictionary(parameters, {to, {}}); });
+  }
+
+ private:
+  template <class Answer, class Operation>
+  static std::optional<Answer> answer(Operation operation) {
+    std::optional<Answer> given;
+    operation([&](const std::optional<Answer>& reply) { given = reply; });
+    return given;
   }
 };
 

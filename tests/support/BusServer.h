@@ -109,37 +109,17 @@ inline bool readBySdBus(sd_bus_message* message, std::vector<Value>& out) {
       const char* s;
     } raw{};
     if (sd_bus_message_read_basic(message, type, &raw) <= 0) return false;
-    switch (type) {
-      case 'b':
-        out.emplace_back(raw.i != 0);
-        break;
-      case 'y':
-        out.emplace_back(std::uint64_t{raw.y});
-        break;
-      case 'n':
-        out.emplace_back(std::int64_t{raw.n});
-        break;
-      case 'q':
-        out.emplace_back(std::uint64_t{raw.q});
-        break;
-      case 'i':
-        out.emplace_back(std::int64_t{raw.i});
-        break;
-      case 'u':
-        out.emplace_back(std::uint64_t{raw.u});
-        break;
-      case 'x':
-        out.emplace_back(raw.x);
-        break;
-      case 't':
-        out.emplace_back(raw.t);
-        break;
-      case 'd':
-        out.emplace_back(raw.d);
-        break;
-      default:
-        out.push_back(type == 'g' && *raw.s == '\0' ? Value() : Value(std::string(raw.s)));
-    }
+    out.push_back(type == 'b'                     ? Value(raw.i != 0)
+                  : type == 'y'                   ? Value(std::uint64_t{raw.y})
+                  : type == 'n'                   ? Value(std::int64_t{raw.n})
+                  : type == 'q'                   ? Value(std::uint64_t{raw.q})
+                  : type == 'i'                   ? Value(std::int64_t{raw.i})
+                  : type == 'u'                   ? Value(std::uint64_t{raw.u})
+                  : type == 'x'                   ? Value(raw.x)
+                  : type == 't'                   ? Value(raw.t)
+                  : type == 'd'                   ? Value(raw.d)
+                  : type == 'g' && *raw.s == '\0' ? Value()
+                                                  : Value(std::string(raw.s)));
   }
 }
 

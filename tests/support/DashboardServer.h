@@ -22,8 +22,6 @@ class DashboardServer {
   }
 
   IPv4Endpoint endpoint() const { return _endpoint; }
-  /// From now on its port refuses datagrams.
-  void stop() { _socket.close(); }
 
   /// What has arrived since the last call; loopback delivers before `send` returns.
   std::vector<std::string> take() {

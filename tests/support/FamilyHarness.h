@@ -13,9 +13,8 @@ class FamilyHarness : public ::testing::Test {
  protected:
   FamilyHarness() {
     testRoot().write("etc/veskreporting/device.toml", "DeviceName = \"Phone\"\n");
-    for (int level = 0; level < 4; ++level) {
+    for (int level = 0; level < 4; ++level)
       harness.storebags[5 + level] = Dictionary{{"httpPost", profile(level, level == 0 ? 1.0 : 0.0)}};
-    }
   }
   Dictionary profile(int level, double threshold) {
     return Dictionary{{"clients", List{Dictionary{{"post_url", harness.url()},

@@ -67,7 +67,6 @@ bool TestService::shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>
   {
     std::lock_guard lock(_mutex);
     _connections.push_back(connection);
-    _sessions.push_back(session);
   }
   journal.add("accepted");
   connection->resume();
@@ -78,12 +77,6 @@ std::shared_ptr<IPCConnection> TestService::connection(std::size_t index) {
   EXPECT_TRUE(journal.waitFor("accepted", index + 1));
   std::lock_guard lock(_mutex);
   return _connections.at(index).lock();
-}
-
-std::shared_ptr<ActingSession> TestService::session(std::size_t index) {
-  EXPECT_TRUE(journal.waitFor("accepted", index + 1));
-  std::lock_guard lock(_mutex);
-  return _sessions.at(index).lock();
 }
 
 // --- TestClient

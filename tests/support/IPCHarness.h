@@ -39,7 +39,6 @@ class TestService : public IPCListenerDelegate {
   IPCListener& listener() { return *_listener; }
   /// The connection accepted as the `index`th, while somebody holds it.
   std::shared_ptr<IPCConnection> connection(std::size_t index = 0);
-  std::shared_ptr<ActingSession> session(std::size_t index = 0);
 
   std::function<void()> onInvalidation;
   Record journal;
@@ -49,7 +48,6 @@ class TestService : public IPCListenerDelegate {
   std::string _path;
   std::mutex _mutex;
   std::vector<std::weak_ptr<IPCConnection>> _connections;
-  std::vector<std::weak_ptr<ActingSession>> _sessions;
   std::unique_ptr<IPCListener> _listener;
 };
 

@@ -44,6 +44,19 @@ struct WireHeader {
   std::uint32_t descriptors = 0;
 };
 
+/// A message that begins with the four bytes of `start`.
+inline std::string wholeMessage(std::string_view start, const std::string& fields, const std::string& body) {
+  Marshalled whole(start[0] == 'B');
+  whole.raw(start);
+  whole.number(static_cast<std::uint32_t>(body.size()));
+  whole.number(1);
+  whole.number(static_cast<std::uint32_t>(fields.size()));
+  whole.raw(fields);
+  whole.align(8);
+  whole.raw(body);
+  return whole.take();
+}
+
 /// A one-way call as it goes over the wire.
 inline std::string wireMessage(const char* member, const std::string& signature, const std::string& body,
                                WireHeader header = {}) {
@@ -58,18 +71,8 @@ inline std::string wireMessage(const char* member, const std::string& signature,
     fields.raw("\x09\1u\0"sv);
     fields.number(header.descriptors);
   }
-  const std::string fieldBytes = fields.take();
-
-  Marshalled whole(header.bigEndian);
   // One-way; version 1.
-  whole.raw(header.bigEndian ? "B\1\1\1"sv : "l\1\1\1"sv);
-  whole.number(static_cast<std::uint32_t>(body.size()));
-  whole.number(1);
-  whole.number(static_cast<std::uint32_t>(fieldBytes.size()));
-  whole.raw(fieldBytes);
-  whole.align(8);
-  whole.raw(body);
-  return whole.take();
+  return wholeMessage(header.bigEndian ? "B\1\1\1"sv : "l\1\1\1"sv, fields.take(), body);
 }
 
 }  // namespace vesk::test

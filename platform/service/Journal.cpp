@@ -1,0 +1,15 @@
+#include "platform/service/Journal.h"
+
+// Every line would come from the same place of the code.
+#define SD_JOURNAL_SUPPRESS_LOCATION
+#include <systemd/sd-journal.h>
+
+namespace vesk {
+
+void writeToJournal(LogLevel level, const std::string& line, const std::string& processName,
+                    const std::string& facility) {
+  sd_journal_send("MESSAGE=%s", line.c_str(), "PRIORITY=%i", static_cast<int>(level), "SYSLOG_IDENTIFIER=%s",
+                  processName.c_str(), "VESK_FACILITY=%s", facility.c_str(), nullptr);
+}
+
+}  // namespace vesk
