@@ -281,6 +281,7 @@ TEST_F(Dashboard, SaysWhatItDoesInTheSystemLog) {
       {"no timer",
        with(_queues.queue->refusesWork, true, [&] { EXPECT_FALSE(make(profile(reliable))); }),
        {noTimer}},
+#if !defined(__SANITIZE_THREAD__) && !defined(__SANITIZE_ADDRESS__)  // these builds allocate before it
       {"no buffer",
        [&] {
          auto backend = make(profile());
@@ -288,6 +289,7 @@ TEST_F(Dashboard, SaysWhatItDoesInTheSystemLog) {
          EXPECT_EQ(backend->sendMessage(std::nullopt, kWhen, 0, 0, 0), std::nullopt);
        },
        {{3, "DashboardBackend(sendMessage): can't malloc."}}},
+#endif
       {"cleanup, answered late, twice",
        [&] {
          auto backend = make(profile(reliable));
