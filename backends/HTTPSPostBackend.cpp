@@ -171,7 +171,7 @@ HTTPSPostBackend::PostToBuild HTTPSPostBackend::batchEvent(MutableDictionary eve
 
 bool HTTPSPostBackend::holdsEvents() const { return _batchedEvents && _batchedEvents->size() > 0; }
 
-// Enabled, a full batch is simply sent. Otherwise nobody may be told yet, and the oldest events have to go.
+// Enabled, a full batch is simply sent. Otherwise nothing may be sent yet, and the oldest events have to go.
 void HTTPSPostBackend::boundHeldEvents() {
   if (!_heldBytes->exceeded()) return;
   PostToBuild full;

@@ -23,7 +23,7 @@ class CallQueue {
 
   /// False when no descriptor was left to make the queue with.
   bool isUsable() const noexcept { return _readEnd && _writeEnd; }
-  /// False once the host has closed the queue's descriptors: it wakes nobody any more.
+  /// False once the host has closed the queue's descriptors: it can't wake its thread any more.
   bool ownsItsDescriptors() const noexcept { return _readEnd.isOurs() && _writeEnd.isOurs(); }
 
   /// Queued, QueueFull or Closed. Throws std::bad_alloc, and then nothing was queued.

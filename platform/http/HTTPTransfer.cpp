@@ -70,7 +70,7 @@ bool passes(CURLcode code, CURL* easy) {
       return true;
     case Kind::TLS:
       // A server that goes down in the middle of the handshake, or a certificate that can't be verified: a
-      // captive portal shows its own until somebody has logged in.
+      // captive portal shows its own until the user has logged in.
       return code == CURLE_SSL_CONNECT_ERROR || code == CURLE_PEER_FAILED_VERIFICATION ||
              code == CURLE_SSL_ISSUER_ERROR || code == CURLE_SSL_INVALIDCERTSTATUS;
     case Kind::Timeout: {
