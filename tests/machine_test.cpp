@@ -156,7 +156,7 @@ TEST(Machine, MayEndAtAnyMomentAndItsClientsReturnByThemselves) {
                                                    << log;
     harness.launchDaemon();
     if (random() % 2 == 0) {
-      EXPECT_TRUE(harness.daemon().waitForText("start loop."));
+      EXPECT_TRUE(harness.daemon().waitForText("start loop.")) << harness.daemon().errors();
     }
   }
   stop = true;
