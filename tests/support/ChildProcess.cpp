@@ -1,5 +1,6 @@
 #include "tests/support/ChildProcess.h"
 
+#include <fcntl.h>
 #include <poll.h>
 #include <signal.h>
 #include <spawn.h>
@@ -18,11 +19,13 @@ namespace vesk::test {
 
 namespace {
 
+/// Opened for appending: the position of a file in memory is not locked between threads that write.
 FileDescriptor fileHolding(const std::string& text = {}) {
   FileDescriptor file(::memfd_create("child", MFD_CLOEXEC));
   if (!file || ::write(file.get(), text.data(), text.size()) != static_cast<ssize_t>(text.size()))
     throw std::runtime_error("no file for a child process");
   ::lseek(file.get(), 0, SEEK_SET);
+  ::fcntl(file.get(), F_SETFL, O_APPEND);
   return file;
 }
 
