@@ -2,6 +2,7 @@
 #include <VeskReporting/VeskReportingKeys.h>
 
 #include <algorithm>
+#include <boost/algorithm/string/join.hpp>
 #include <limits>
 #include <utility>
 
@@ -33,10 +34,7 @@ std::int32_t clamped(std::int64_t number) {
 }
 
 std::string printed(const NameList& list) {
-  std::string out = "(";
-  for (const auto& item : list.value_or(std::vector<std::string>()))
-    out += (out.size() > 1 ? ", " : "") + item;
-  return out + ")";
+  return "(" + boost::algorithm::join(list.value_or(std::vector<std::string>()), ", ") + ")";
 }
 
 }  // namespace

@@ -112,7 +112,6 @@ std::optional<std::string> HTTPSPostBackend::createMessageForPostAndLogging(
 HTTPSPostBackend::Headers HTTPSPostBackend::postHeaders(std::optional<std::uint16_t> method,
                                                         std::optional<std::uint16_t> responseCode) const {
   Headers headers;
-  headers.reserve(10);
   if (_userInfoDict) {
     if (auto name = _userInfoDict->text(kVeskReportingUserInfoClientName)) {
       headers.emplace_back("X-Vesk-Client-Name", headerValue(*name));

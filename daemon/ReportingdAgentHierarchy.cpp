@@ -108,10 +108,9 @@ std::optional<std::string> ReportingdAgent::parentSessionIDStringForSession(Repo
                    session.sessionID(), shown(key).c_str());
     return std::nullopt;
   }
-  if (level < 0) return std::nullopt;
   std::optional<std::string> chain;
-  for (std::int32_t above = level - 1; above >= 0; --above) {
-    auto ancestor = getFirstSessionWithHierarchy(above, *list);
+  for (std::int32_t above = level; above > 0;) {
+    auto ancestor = getFirstSessionWithHierarchy(--above, *list);
     if (!ancestor) {
       VESK_LOG_INFO(
           "parentSessionIDStringForSession: Found a gap in hierarchy (one of parents missing): incomplete "

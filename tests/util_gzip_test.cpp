@@ -1,8 +1,31 @@
+#include <dlfcn.h>
 #include <gtest/gtest.h>
 #include <zlib.h>
 
+#include <optional>
+
 #include "tests/support/CapturedLog.h"
 #include "util/Gzip.h"
+
+namespace {
+
+std::optional<int> beginsWith;  // what zlib answers in place of doing anything
+std::optional<int> deflatesWith;
+
+}  // namespace
+
+int deflateInit2_(z_streamp stream, int level, int method, int windowBits, int memory, int strategy,
+                  const char* version, int size) {
+  if (beginsWith) return *beginsWith;
+  static const auto begin = reinterpret_cast<decltype(&deflateInit2_)>(::dlsym(RTLD_NEXT, "deflateInit2_"));
+  return begin(stream, level, method, windowBits, memory, strategy, version, size);
+}
+
+int deflate(z_streamp stream, int flush) {
+  if (deflatesWith) return *deflatesWith;
+  static const auto next = reinterpret_cast<decltype(&deflate)>(::dlsym(RTLD_NEXT, "deflate"));
+  return next(stream, flush);
+}
 
 namespace vesk::test {
 namespace {
@@ -17,6 +40,33 @@ TEST(Gzip, RefusesWhatZlibCannotTake) {
   const std::string full = "\"Ran out of output buffer for writing compressed bytes.\" Message: \"(null)\"";
   EXPECT_EQ(log.lines(), (Lines{{3, begin + "Cannot compress empty ByteBlob"},
                                 {3, begin + "zlib error while attempting compression: " + full}}));
+}
+
+TEST(Gzip, SaysHowZlibFailed) {
+  const std::string versions = "The version of zlib.h and the version of the library linked do not match.";
+  const std::map<int, std::string> beginnings{{Z_STREAM_ERROR, "Invalid parameter passed in to function."},
+                                              {Z_MEM_ERROR, "Insufficient memory."},
+                                              {Z_VERSION_ERROR, versions},
+                                              {Z_ERRNO, "Unknown error code."}};
+  const std::map<int, std::string> failures{
+      {Z_ERRNO, "Error occured while reading file."},
+      {Z_STREAM_ERROR, "The stream state was inconsistent (e.g., next_in or next_out was NULL)."},
+      {Z_DATA_ERROR, "The deflate data was invalid or incomplete."},
+      {Z_MEM_ERROR, "Memory could not be allocated for processing."},
+      {Z_BUF_ERROR, "Ran out of output buffer for writing compressed bytes."},
+      {Z_VERSION_ERROR, versions},
+      {Z_NEED_DICT, "Unknown error code."}};
+  const auto expectFailure = [](std::optional<int>& answer, int with, const std::string& line) {
+    CapturedLog log;
+    answer = with;
+    EXPECT_FALSE(gzipDeflate("x"));
+    answer.reset();
+    EXPECT_EQ(log.lines(), (Lines{{3, "compressDataWithZlibOrGzip: " + line + "\" Message: \"(null)\""}}));
+  };
+  for (const auto& [answer, text] : beginnings)
+    expectFailure(beginsWith, answer, "deflateInit2() Error: \"" + text);
+  for (const auto& [answer, text] : failures)
+    expectFailure(deflatesWith, answer, "zlib error while attempting compression: \"" + text);
 }
 
 TEST(Gzip, MakesTheStreamsThatZlibMakes) {
