@@ -69,10 +69,9 @@ void UploadBackend::setUploadURL(const std::optional<std::string>& url) {
 
 bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string& extensionToken) {
   VESK_LOG_DEBUG("UploadBackend(uploadFileAtPath): Uploading file %s", path.c_str());
-  auto url = uploadURL();
-  if (!url) return false;
   try {
-    return upload(withoutTrailingSlashes(path), extensionToken, *url);
+    auto url = uploadURL();
+    return url && upload(withoutTrailingSlashes(path), extensionToken, *url);
   } catch (const std::bad_alloc&) {
     VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Not enough memory for the input file");
     return false;
