@@ -54,6 +54,19 @@ IPCListener::Options listenerOptions(ServiceManager& serviceManager) {
   return options;
 }
 
+std::size_t bytesOfMiB(const char* preference, std::size_t byDefault) {
+  constexpr std::uint64_t kMost = 1 << 30;
+  auto wanted = preferenceNumberForKey(preference, 1);
+  return wanted ? std::min(*wanted, kMost) << 20 : byDefault;
+}
+
+HeldBudget::Limits heldLimits() {
+  HeldBudget::Limits limits;
+  limits.ofUser = bytesOfMiB("maxHeldMiBPerUser", limits.ofUser);
+  limits.ofAll = bytesOfMiB("maxHeldMiB", limits.ofAll);
+  return limits;
+}
+
 HTTPClient::Options httpOptions(BusyMarker& busyMarker) {
   HTTPClient::Options options;
   options.userAgent = "veskreportingd/" VESK_VERSION;
@@ -104,6 +117,7 @@ struct Daemon::Parts {
         http(httpOptions(busyMarker)),
         agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetcher(), busyMarker)),
         listener(listenerOptions(serviceManager)) {
+    backendServices.heldBudget = std::make_shared<HeldBudget>(heldLimits());
     listener.setDelegate(agent.get());
   }
 

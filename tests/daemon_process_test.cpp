@@ -179,6 +179,10 @@ TEST_F(DaemonProcess, TellsItsManagerHowItGoesAndWhatWasLost) {
     const ssize_t size = ::recv(manager.get(), text, sizeof text, 0);
     return std::string(text, static_cast<std::size_t>(std::max<ssize_t>(size, 0)));
   };
+  harness.setPreference("maxHeldMiBPerUser", "1");
+  HTTPAnswer storebag;
+  storebag.body = signedStorebag(key, Dictionary{{"release", section("/post")}});
+  serve(storebag);
   ::setenv("NOTIFY_SOCKET", (harness.root / "notify").c_str(), 1);
   harness.startDaemon();
   ::unsetenv("NOTIFY_SOCKET");
@@ -186,10 +190,15 @@ TEST_F(DaemonProcess, TellsItsManagerHowItGoesAndWhatWasLost) {
   // A client type without a storebag has no backend.
   RoadClient client(harness, {{kVeskReportingSessionInfoClientType, 4}});
   EXPECT_TRUE(client.reporting.sendMessageAndWait(message(3)));
+  // Without its user info a session holds what it sends.
+  RoadClient holding(harness, {{kVeskReportingSessionInfoRequireUserInfo, true}});
+  const auto bulk = message(3, {{"bulk", std::string(200 << 10, 'x')}});
+  for (int i = 0; i < 6; ++i) EXPECT_TRUE(holding.reporting.sendMessageAndWait(bulk));
   EXPECT_EQ(harness.stopDaemon(), 0);
   EXPECT_EQ(notification(), "STOPPING=1");
   const std::string log = withoutTime(harness.daemon().errors());
-  EXPECT_TRUE(log.ends_with("\n<6> main: Lost since the start: session no-backend 1\n")) << log;
+  EXPECT_NE(log.find("<6> main: Lost since the start: httpPost over-bound "), log.npos) << log;
+  EXPECT_NE(log.find("\n<6> main: Lost since the start: session no-backend 1\n"), log.npos) << log;
 }
 
 }  // namespace
