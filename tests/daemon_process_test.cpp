@@ -170,7 +170,7 @@ TEST_F(DaemonProcess, WithoutItsSandboxSaysSoAndEndsWhenIdle) {
             "<6> main: Listener resumes without sandbox, start loop.\n");
 }
 
-TEST_F(DaemonProcess, TellsItsManagerHowItGoesAndWhatWasLost) {
+TEST_F(DaemonProcess, TellsItsManagerHowItGoesAndKeepsToItsLimits) {
   FileDescriptor manager(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
   UnixSocketAddress address(harness.root / "notify");
   ASSERT_EQ(::bind(manager.get(), address.get(), address.size()), 0);
@@ -179,6 +179,8 @@ TEST_F(DaemonProcess, TellsItsManagerHowItGoesAndWhatWasLost) {
     const ssize_t size = ::recv(manager.get(), text, sizeof text, 0);
     return std::string(text, static_cast<std::size_t>(std::max<ssize_t>(size, 0)));
   };
+  harness.setPreference("logRateLimit", "3");
+  harness.setPreference("maxConnectionsPerUser", "2");
   harness.setPreference("maxHeldMiBPerUser", "1");
   HTTPAnswer storebag;
   storebag.body = signedStorebag(key, Dictionary{{"release", section("/post")}});
@@ -194,11 +196,14 @@ TEST_F(DaemonProcess, TellsItsManagerHowItGoesAndWhatWasLost) {
   RoadClient holding(harness, {{kVeskReportingSessionInfoRequireUserInfo, true}});
   const auto bulk = message(3, {{"bulk", std::string(200 << 10, 'x')}});
   for (int i = 0; i < 6; ++i) EXPECT_TRUE(holding.reporting.sendMessageAndWait(bulk));
+  VeskReporting third(harness.clientOptions());
+  EXPECT_EQ(third.connect().status, ReportingStatus::TooManyConnections);
   EXPECT_EQ(harness.stopDaemon(), 0);
   EXPECT_EQ(notification(), "STOPPING=1");
   const std::string log = withoutTime(harness.daemon().errors());
   EXPECT_NE(log.find("<6> main: Lost since the start: httpPost over-bound "), log.npos) << log;
   EXPECT_NE(log.find("\n<6> main: Lost since the start: session no-backend 1\n"), log.npos) << log;
+  EXPECT_NE(log.find("\n<7> log: Left out 4 lines of user "), log.npos) << log;
 }
 
 }  // namespace
