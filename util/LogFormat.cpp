@@ -1,6 +1,7 @@
 #include "util/LogFormat.h"
 
 #include <algorithm>
+#include <charconv>
 #include <cstdio>
 
 namespace vesk {
@@ -9,40 +10,47 @@ namespace {
 
 constexpr std::string_view kFlags = "-+ #0";
 constexpr std::string_view kLengthModifiers = "hlqjzt";
+constexpr std::string_view kConversions = "@sdiuxXofFeEgG";
 constexpr int kWidest = 256;
 
 struct Placeholder {
   std::string flags;       // with width and precision: what printf gets between "%" and the conversion
-  char conversion = 0;     // 0: this is no placeholder
+  char conversion = 0;     // 0: not a placeholder
   std::size_t length = 0;  // of the whole placeholder in the format
 };
 
-// A width or a precision; what would fill the log with blanks is cut.
-std::string takeNumber(std::string_view format, std::size_t& at) {
-  int number = -1;
-  for (; at < format.size() && format[at] >= '0' && format[at] <= '9'; ++at) {
-    number = std::min(kWidest, std::max(number, 0) * 10 + (format[at] - '0'));
-  }
-  return number < 0 ? std::string() : std::to_string(number);
+/// Takes the characters at the beginning of `rest` that are among `set`.
+std::string_view takeAll(std::string_view set, std::string_view& rest) {
+  const std::string_view taken = rest.substr(0, rest.find_first_not_of(set));
+  rest.remove_prefix(taken.size());
+  return taken;
+}
+
+// A width or a precision, limited so that it can't fill the log with blanks.
+std::string takeNumber(std::string_view& rest) {
+  const std::string_view digits = takeAll("0123456789", rest);
+  if (digits.empty()) return {};
+  int number = kWidest;
+  std::from_chars(digits.data(), digits.data() + digits.size(), number);  // unchanged beyond its range
+  return std::to_string(std::min(number, kWidest));
 }
 
 /// `format` starts with "%".
 Placeholder parsePlaceholder(std::string_view format) {
   Placeholder placeholder;
-  std::size_t at = 1;
-  while (at < format.size() && kFlags.find(format[at]) != std::string_view::npos) {
-    if (placeholder.flags.find(format[at]) == std::string::npos) placeholder.flags += format[at];
-    ++at;
+  std::string_view rest = format.substr(1);
+  for (char flag : takeAll(kFlags, rest)) {
+    if (placeholder.flags.find(flag) == std::string::npos) placeholder.flags += flag;
   }
-  placeholder.flags += takeNumber(format, at);
-  if (at < format.size() && format[at] == '.') {
-    ++at;
-    placeholder.flags += "." + takeNumber(format, at);
+  placeholder.flags += takeNumber(rest);
+  if (rest.starts_with('.')) {
+    rest.remove_prefix(1);
+    placeholder.flags += "." + takeNumber(rest);
   }
-  while (at < format.size() && kLengthModifiers.find(format[at]) != std::string_view::npos) ++at;
-  if (at < format.size() && std::string_view("@sdiuxXofFeEgG").find(format[at]) != std::string_view::npos) {
-    placeholder.conversion = format[at];
-    placeholder.length = at + 1;
+  takeAll(kLengthModifiers, rest);
+  if (!rest.empty() && kConversions.find(rest.front()) != std::string_view::npos) {
+    placeholder.conversion = rest.front();
+    placeholder.length = format.size() - rest.size() + 1;
   }
   return placeholder;
 }
@@ -50,14 +58,12 @@ Placeholder parsePlaceholder(std::string_view format) {
 // The format is built here, from checked parts and for the very type of `value`.
 template <class T>
 std::string printed(const std::string& format, T value) {
-  char buffer[1024];
+  char buffer[1024] = "";  // the largest double with 256 decimals takes 566
 #pragma GCC diagnostic push
 #pragma GCC diagnostic ignored "-Wformat-nonliteral"
-  int size = std::snprintf(buffer, sizeof buffer, format.c_str(), value);
+  std::snprintf(buffer, sizeof buffer, format.c_str(), value);
 #pragma GCC diagnostic pop
-  return size < 0
-             ? std::string()
-             : std::string(buffer, std::min<std::size_t>(static_cast<std::size_t>(size), sizeof buffer - 1));
+  return buffer;
 }
 
 struct PlainForm {
