@@ -2,6 +2,7 @@
 
 #include "client/protocol/WireNames.h"
 #include "platform/ipc/IPCIncomingCall.h"
+#include "platform/log/SystemLog.h"
 
 namespace vesk {
 
@@ -11,14 +12,16 @@ void AggregationReceiver::handle(IPCIncomingCall& call) {
   if (call.member() != wire::kSendMessageToClient.name) {
     return call.refuse("org.freedesktop.DBus.Error.UnknownMethod", "the client has no such member");
   }
-  std::optional<Dictionary> sessionInfo;
-  double timestamp = 0;
-  std::uint16_t category = 0;
-  std::uint16_t type = 0;
-  std::optional<Dictionary> payload;
-  if (!call.read(wire::kSendMessageToClient.arguments, sessionInfo, timestamp, category, type, payload))
+  AggregatedMessage message;
+  if (!call.read(wire::kSendMessageToClient.arguments, message.sessionInfo, message.timestamp,
+                 message.category, message.type, message.payload)) {
     return;
-  _client.sendMessageToClient(sessionInfo, timestamp, category, type, payload);
+  }
+  try {
+    if (_handler) (*_handler)(message);
+  } catch (...) {
+    VESK_LOG_ERROR("VeskReporting: an aggregation handler threw an exception");
+  }
   call.answer();
 }
 

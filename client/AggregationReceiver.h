@@ -1,22 +1,27 @@
 // The client's own object on the wire.
 #pragma once
 
-#include "client/protocol/ClientSessionInterface.h"
+#include <VeskReporting/VeskReportingTypes.h>
+
+#include <memory>
+#include <utility>
+
 #include "platform/ipc/IPCConnection.h"
 
 namespace vesk {
 
-/// Decodes the daemon's calls for the client's side of the protocol.
+/// Hands the messages that the daemon calls it with to the client's handler, if it has one. For one thread.
 class AggregationReceiver final : public IPCExportedObject {
  public:
-  /// `client` outlives this object and must not throw.
-  explicit AggregationReceiver(ClientSessionReplyInterface& client) noexcept : _client(client) {}
+  void setHandler(std::shared_ptr<const AggregationHandler> handler) noexcept {
+    _handler = std::move(handler);
+  }
 
   const char* interfaceName() const override;
   void handle(IPCIncomingCall& call) override;
 
  private:
-  ClientSessionReplyInterface& _client;
+  std::shared_ptr<const AggregationHandler> _handler;
 };
 
 }  // namespace vesk

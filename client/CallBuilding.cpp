@@ -5,24 +5,11 @@
 
 #include <cerrno>
 #include <filesystem>
-#include <string_view>
 #include <system_error>
 
-#include "platform/ipc/MessageWriter.h"
 #include "platform/text/PercentCode.h"
 
 namespace vesk {
-
-namespace {
-
-std::string urlOf(const std::string& path) { return "file://" + percentEncoded(path, "/"); }
-
-}  // namespace
-
-bool isEncodable(const ClientCall& call) {
-  std::string message;
-  return CallWriter(wire::kObjectPath).append(call.call, 1, false, message) == CodecResult::Ok;
-}
 
 FileToUpload openToUpload(const std::string& path) {
   FileToUpload file;
@@ -40,7 +27,7 @@ FileToUpload openToUpload(const std::string& path) {
     file.descriptor.reset();
     return file;
   }
-  file.url = urlOf(absolute.lexically_normal().string());
+  file.url = "file://" + percentEncoded(absolute.lexically_normal().string(), "/");
   return file;
 }
 

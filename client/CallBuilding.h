@@ -10,10 +10,6 @@
 
 namespace vesk {
 
-/// Whether the daemon can be sent `call`, which has no descriptor: neither too large nor nested too deeply,
-/// and valid text. Costs as much as sending it. Throws std::bad_alloc.
-bool isEncodable(const ClientCall& call);
-
 /// A one-way call of the daemon's object. Throws std::bad_alloc.
 template <class... Arguments>
 ClientCall makeCall(const wire::Member& member, Arguments&&... arguments) {

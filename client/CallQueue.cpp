@@ -2,37 +2,52 @@
 
 #include <sys/socket.h>
 
+#include <algorithm>
+#include <cerrno>
+#include <system_error>
 #include <utility>
 
 namespace vesk {
 
-CallQueue::CallQueue(std::size_t maximumCalls, std::size_t maximumMemory) noexcept
-    : _maximumCalls(maximumCalls), _maximumMemory(maximumMemory) {
+CallQueue::CallQueue(const ReportingOptions& options)
+    : _maximumCalls(options.maximumQueuedMessages), _maximumMemory(options.maximumQueuedBytes) {
   int ends[2];
-  if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends) != 0) return;
+  if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends) != 0) {
+    throw std::system_error(errno, std::generic_category(), "socketpair");
+  }
   _readEnd = GuardedDescriptor(FileDescriptor(ends[0]));
   _writeEnd = GuardedDescriptor(FileDescriptor(ends[1]));
 }
 
-ReportingStatus CallQueue::push(ClientCall&& call) {
+ReportingStatus CallQueue::push(ClientCall&& pushed) {
+  ClientCalls one;  // made and, when it is refused, destroyed outside the lock
+  one.push_back(std::move(pushed));
+  const ClientCall& call = one.front();
+  auto status = ReportingStatus::Queued;
   bool mustWake = false;
   {
     MutexLock lock(_mutex);
-    if (_isClosed) return ReportingStatus::Closed;
+    if (_drainDeadline) return ReportingStatus::Closed;
+    const bool isRequest = call.isConnectionRequest();
     // One call of any size gets into an empty queue; the wire's own limit decides about it.
-    bool isFull = _calls >= _maximumCalls || (_calls > 0 && _memory + call.memory > _maximumMemory);
-    if (isFull) return ReportingStatus::QueueFull;
-    bool isAnswered = call.wantsAnswer();
-    std::size_t memory = call.memory;
-    _queued.push_back(std::move(call));
-    ++_calls;
-    _memory += memory;
-    _hasAnsweredCall |= isAnswered;
-    mustWake = _wakeFor == WakeFor::EveryCall || (isAnswered && _wakeFor == WakeFor::AnsweredCalls);
+    const bool isFull = _calls >= _maximumCalls || (_calls > 0 && _memory + call.memory > _maximumMemory);
+    if (isFull && !isRequest) {
+      countDrop(Drop::QueueFull);
+      status = ReportingStatus::QueueFull;
+      mustWake = !_isBurst.exchange(true);
+      _mustTellOfBurst |= mustWake;
+    } else {
+      _calls += isRequest ? 0 : 1;
+      _memory += call.memory;
+      if (call.end) _firstDeadline = std::min(_firstDeadline, call.deadline);
+      mustWake = _wakeFor == WakeFor::EveryCall || (call.end && _wakeFor == WakeFor::AnsweredCalls);
+      ClientCalls& line = isRequest ? _requests : _queued;
+      line.splice(line.end(), one);
+    }
     if (mustWake) _wakeFor = WakeFor::NothingQueued;
   }
   if (mustWake) wake();
-  return ReportingStatus::Queued;
+  return status;
 }
 
 void CallQueue::wake() noexcept {
@@ -40,43 +55,57 @@ void CallQueue::wake() noexcept {
   if (_writeEnd.isOurs()) ::send(_writeEnd.get(), "", 1, MSG_DONTWAIT | MSG_NOSIGNAL);
 }
 
-void CallQueue::close() noexcept {
+void CallQueue::close(Time drainDeadline) noexcept {
   {
     MutexLock lock(_mutex);
-    _isClosed = true;
+    _drainDeadline = drainDeadline;
   }
   wake();
 }
 
-void CallQueue::takeAll(std::vector<ClientCall>& calls) noexcept {
+bool CallQueue::take(ClientCalls& calls, ClientCalls& requests, Time& firstDeadline) noexcept {
   MutexLock lock(_mutex);
-  _queued.swap(calls);
-  _hasAnsweredCall = false;
+  calls.splice(calls.end(), _queued);
+  requests.splice(requests.end(), _requests);
+  firstDeadline = std::min(firstDeadline, std::exchange(_firstDeadline, Time::max()));
+  return std::exchange(_mustTellOfBurst, false);
 }
 
-void CallQueue::leave(std::size_t calls, std::size_t memory) noexcept {
-  MutexLock lock(_mutex);
-  _calls -= calls;
+void CallQueue::leave(std::size_t memory, bool wasLast) noexcept {
   _memory -= memory;
+  --_calls;
+  if (wasLast) _isBurst = false;
 }
 
-bool CallQueue::prepareToSleep(WakeFor what) noexcept {
+std::optional<CallQueue::Time> CallQueue::drainDeadline() const noexcept {
   MutexLock lock(_mutex);
-  if (what == WakeFor::EveryCall && !_queued.empty()) return false;
-  if (what == WakeFor::AnsweredCalls && _hasAnsweredCall) return false;
-  _wakeFor = what;
-  return true;
+  return _drainDeadline;
 }
 
-void CallQueue::awake(bool descriptorIsReadable) noexcept {
+bool CallQueue::sleep(WakeFor what, Time::duration wait, pollfd other) noexcept {
+  using std::chrono::milliseconds;
+  pollfd descriptors[] = {{_readEnd.get(), POLLIN, 0}, other};
+  {
+    MutexLock lock(_mutex);
+    const bool isAnsweredQueued = _firstDeadline != Time::max();
+    if (isAnsweredQueued || (what == WakeFor::EveryCall && !_queued.empty())) {
+      wait = wait.zero();
+    } else {
+      _wakeFor = what;
+    }
+  }
+  const auto left =
+      std::clamp(std::chrono::ceil<milliseconds>(wait), milliseconds(0), milliseconds(3'600'000));
+  const bool isReady = ::poll(descriptors, 2, static_cast<int>(left.count())) > 0;
   {
     MutexLock lock(_mutex);
     _wakeFor = WakeFor::NothingQueued;
   }
   char ignored[64];
-  while (descriptorIsReadable && _readEnd.isOurs() &&
+  while (isReady && descriptors[0].revents != 0 && _readEnd.isOurs() &&
          ::recv(_readEnd.get(), ignored, sizeof ignored, MSG_DONTWAIT) == sizeof ignored) {
   }
+  return isReady && descriptors[1].revents != 0;
 }
 
 }  // namespace vesk

@@ -2,9 +2,12 @@
 #pragma once
 
 #include <VeskReporting/VeskReportingTypes.h>
+#include <poll.h>
 
+#include <atomic>
+#include <chrono>
 #include <cstddef>
-#include <vector>
+#include <optional>
 
 #include "client/ClientCall.h"
 #include "platform/files/GuardedDescriptor.h"
@@ -12,55 +15,68 @@
 
 namespace vesk {
 
-/// Bounded queue from any thread to one. Putting a call in takes a short lock, and costs a system call only
-/// when the receiving thread sleeps and asked to be woken for it.
+/// Why a call was not sent: as in ReportingDrops.
+enum class Drop { QueueFull, Invalid, Unsent };
+
+/// Bounded queue from any thread to one, with the count of what was dropped. Putting a call in takes a short
+/// lock, and costs a system call only when the receiving thread sleeps and asked to be woken for it.
 class CallQueue {
  public:
+  using Time = ClientCall::Time;
   /// What the receiving thread asks to be woken for.
   enum class WakeFor { NothingQueued, AnsweredCalls, EveryCall };
 
-  CallQueue(std::size_t maximumCalls, std::size_t maximumMemory) noexcept;
+  /// Throws std::system_error when no descriptor is left.
+  explicit CallQueue(const ReportingOptions& options);
 
-  /// False when no descriptor was left to make the queue with.
-  bool isUsable() const noexcept { return _readEnd && _writeEnd; }
-  /// False once the host has closed the queue's descriptors: it can't wake its thread any more.
-  bool ownsItsDescriptors() const noexcept { return _readEnd.isOurs() && _writeEnd.isOurs(); }
+  // For any thread.
 
-  /// Queued, QueueFull or Closed. Throws std::bad_alloc, and then nothing was queued.
+  /// Queued, QueueFull or Closed. Connection requests need no room. Throws std::bad_alloc, and then nothing
+  /// was queued.
   ReportingStatus push(ClientCall&& call);
-
-  /// Wakes the receiving thread, whatever it asked for.
-  void wake() noexcept;
-  /// No call gets in any more; wakes the receiving thread.
-  void close() noexcept;
+  /// No call gets in any more; the receiving thread is to end by `drainDeadline`.
+  void close(Time drainDeadline) noexcept;
+  void countDrop(Drop reason) noexcept { ++_drops[static_cast<std::size_t>(reason)]; }
+  /// Takes no lock, so that a process forked from this one may ask.
+  ReportingDrops drops() const noexcept { return {_drops[0], _drops[1], _drops[2]}; }
 
   // The receiving thread's side.
 
-  /// Moves everything queued to `calls`, which must be empty. It goes on to count against the bounds.
-  void takeAll(std::vector<ClientCall>& calls) noexcept;
-  /// Calls taken earlier have left: their room is free again.
-  void leave(std::size_t calls, std::size_t memory) noexcept;
-  /// Says what a push from now on has to wake for. False when such a call is queued already: don't sleep.
-  bool prepareToSleep(WakeFor what) noexcept;
-  /// Readable once something has woken the thread, or the host has closed the other end.
-  int descriptor() const noexcept { return _readEnd.get(); }
-  /// After waking: pushes need not wake any more, and the descriptor is quiet again.
-  void awake(bool descriptorIsReadable) noexcept;
+  /// False once the host has closed the queue's descriptors: it can't wake its thread any more.
+  bool ownsItsDescriptors() const noexcept { return _readEnd.isOurs() && _writeEnd.isOurs(); }
+  /// Appends everything queued to `calls`, where it goes on to count against the bounds, and what asks for
+  /// the connection to `requests`; lowers `firstDeadline` to theirs. True when a burst of drops has begun,
+  /// which deserves a log line.
+  bool take(ClientCalls& calls, ClientCalls& requests, Time& firstDeadline) noexcept;
+  /// A call taken earlier has left, as the last one or not: its room is free again.
+  void leave(std::size_t memory, bool wasLast) noexcept;
+  /// Set once the queue is closed.
+  std::optional<Time> drainDeadline() const noexcept;
+  /// Waits for `other`, for a push of `what`, or until `wait` is over. Whether `other` is ready.
+  bool sleep(WakeFor what, ClientCall::Time::duration wait, pollfd other) noexcept;
 
  private:
+  void wake() noexcept;
+
   const std::size_t _maximumCalls;
   const std::size_t _maximumMemory;
   // Sockets, which unlike an eventfd have an identity.
   GuardedDescriptor _readEnd;
   GuardedDescriptor _writeEnd;
 
-  Mutex _mutex;
-  std::vector<ClientCall> _queued VESK_GUARDED_BY(_mutex);
-  std::size_t _calls VESK_GUARDED_BY(_mutex) = 0;   ///< queued, or taken and not left yet
-  std::size_t _memory VESK_GUARDED_BY(_mutex) = 0;  ///< theirs
-  bool _hasAnsweredCall VESK_GUARDED_BY(_mutex) = false;
+  // Raised under the lock only.
+  std::atomic<std::size_t> _calls{0};   ///< queued, or taken and not left yet
+  std::atomic<std::size_t> _memory{0};  ///< theirs
+  std::atomic<bool> _isBurst{false};    ///< of drops
+  std::atomic<std::uint64_t> _drops[3] = {};
+
+  mutable Mutex _mutex;
+  ClientCalls _queued VESK_GUARDED_BY(_mutex);
+  ClientCalls _requests VESK_GUARDED_BY(_mutex);
+  Time _firstDeadline VESK_GUARDED_BY(_mutex) = Time::max();  ///< of the answers that those want
   WakeFor _wakeFor VESK_GUARDED_BY(_mutex) = WakeFor::NothingQueued;
-  bool _isClosed VESK_GUARDED_BY(_mutex) = false;
+  bool _mustTellOfBurst VESK_GUARDED_BY(_mutex) = false;
+  std::optional<Time> _drainDeadline VESK_GUARDED_BY(_mutex);
 };
 
 }  // namespace vesk

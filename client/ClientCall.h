@@ -6,6 +6,7 @@
 #include <chrono>
 #include <cstdint>
 #include <functional>
+#include <list>
 #include <memory>
 #include <string_view>
 
@@ -28,15 +29,17 @@ struct ClientCall {
 
   IPCOutgoingCall call{nullptr, nullptr, {}};
   GuardedDescriptor descriptor;                           ///< the one that the arguments borrow
-  std::shared_ptr<CallEnd> end;                           ///< null: the call is one way
+  CallEnd end;                                            ///< empty: the call is one way
   Time deadline{};                                        ///< of the answer
   std::size_t memory = 0;                                 ///< bytes that it counts in the queue
   std::shared_ptr<const AggregationHandler> aggregation;  ///< in force once this call was sent
   CallEffect effect = CallEffect::None;
 
-  bool wantsAnswer() const noexcept { return end != nullptr; }
-  /// Nothing but arguments, and nobody waits for an answer.
-  bool isPlain() const noexcept { return !end && !descriptor; }
+  /// Calls nothing: its end is told when the daemon is reached.
+  bool isConnectionRequest() const noexcept { return call.member == nullptr; }
 };
+
+/// A call keeps its place in memory while it moves from list to list.
+using ClientCalls = std::list<ClientCall>;
 
 }  // namespace vesk

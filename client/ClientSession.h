@@ -1,18 +1,21 @@
-// How the operations of a session reach its thread.
+// How the operations of a session reach its thread, and what owns that.
 #pragma once
 
 #include <VeskReporting/VeskReportingTypes.h>
 
 #include <chrono>
+#include <exception>
+#include <future>
 #include <memory>
+#include <thread>
+#include <type_traits>
 #include <utility>
 #include <variant>
 
-#include "client/Answers.h"
 #include "client/BoundedWait.h"
-#include "client/CallBuilding.h"
 #include "client/ClientCall.h"
-#include "client/SessionThread.h"
+#include "client/ForkGuard.h"
+#include "client/SessionWorker.h"
 
 namespace vesk {
 
@@ -23,11 +26,17 @@ class ClientSession {
  public:
   using Timeout = std::chrono::milliseconds;
 
-  /// Throws when there is no memory, no descriptor or no thread for it.
-  explicit ClientSession(const ReportingOptions& options) : _thread(options) {}
+  /// Throws std::system_error or std::bad_alloc when there is no memory, no descriptor or no thread for it.
+  explicit ClientSession(const ReportingOptions& options);
+  /// Waits for the thread's end; on that thread itself, only tells it to end.
+  ~ClientSession();
+  ClientSession(const ClientSession&) = delete;
+  ClientSession& operator=(const ClientSession&) = delete;
 
-  bool isOurs() const noexcept { return _thread.isOurs(); }
-  SessionWorker& worker() noexcept { return _thread.worker(); }
+  /// False in a process forked from the one that made this: only `drops` may be asked there.
+  bool isOurs() const noexcept { return _process.isOurs(); }
+  bool isConnected() const noexcept { return isOurs() && _worker->isConnected(); }
+  ReportingDrops drops() const noexcept { return _worker->queue().drops(); }
 
   /// One way.
   template <class Make>
@@ -51,20 +60,29 @@ class ClientSession {
     });
   }
 
-  /// Waits for the answer.
+  /// Waits for the answer; a tenth of a second longer when a callback holds the session's thread.
   template <class Answer, class Make>
   ReportingResult<Answer> wait(const Make& make, Timeout timeout) noexcept {
-    return waitFor<Answer>(timeout, [&](ReportingCallback<Answer> callback) {
-      return ask<Answer>(make, std::move(callback), timeout);
-    });
-  }
-
-  ReportingResult<std::monostate> connect(Timeout timeout) noexcept {
-    return waitFor<std::monostate>(timeout, [&](ReportingCallback<std::monostate> callback) {
-      auto end = endFor<std::monostate>(std::move(callback));
-      bool isAsked = worker().requestConnection(std::move(end), deadlineAfter(timeout));
-      return isAsked ? ReportingStatus::Queued : ReportingStatus::Closed;
-    });
+    // The session's thread knows better why there is no answer in time; it is given a moment to say so.
+    constexpr std::chrono::milliseconds kGrace{100};
+    const auto outcome = [](ReportingStatus status) { return ReportingResult<Answer>{status, {}, {}}; };
+    if (!isOurs()) return outcome(ReportingStatus::ForkedProcess);
+    if (isSessionThread()) return outcome(ReportingStatus::OnSessionThread);
+    try {
+      const auto deadline = deadlineAfter(timeout) + kGrace;
+      // Shared by both: the caller may have gone when the answer comes.
+      auto promise = std::make_shared<std::promise<ReportingResult<Answer>>>();
+      auto answer = promise->get_future();
+      const auto status = ask<Answer>(
+          make, [promise](ReportingResult<Answer> result) { promise->set_value(std::move(result)); },
+          timeout);
+      if (status != ReportingStatus::Queued) return outcome(status);
+      if (answer.wait_until(deadline) == std::future_status::timeout)
+        return outcome(ReportingStatus::TimedOut);
+      return answer.get();
+    } catch (...) {
+      return outcome(ReportingStatus::OutOfResources);
+    }
   }
 
  private:
@@ -72,33 +90,35 @@ class ClientSession {
     return std::chrono::steady_clock::now() + boundedWait(timeout);
   }
 
-  ReportingStatus push(ClientCall&& call) {
-    // Told here and now: dropped on its way, it would leave the session what it was before, and nobody knew.
-    if (call.effect != CallEffect::None && !isEncodable(call)) {
-      worker().drops().invalid();
-      return ReportingStatus::InvalidArgument;
-    }
-    ReportingStatus status = worker().queue().push(std::move(call));
-    if (status == ReportingStatus::QueueFull && worker().drops().queueFull()) worker().queue().wake();
-    return status;
+  /// From the bus's answer to the result that `callback` gets.
+  template <class Answer>
+  static CallEnd endFor(ReportingCallback<Answer> callback) {
+    return
+        [callback = std::move(callback)](ReportingStatus status, BusAnswer* answer, std::string_view detail) {
+          ReportingResult<Answer> result{status, {}, {}};
+          try {
+            result.detail = detail;
+            if constexpr (!std::is_same_v<Answer, std::monostate>) {
+              if (answer && !answer->read(result.answer)) {
+                result.status = ReportingStatus::Refused;
+                result.detail = "the daemon's answer is of another type";
+              }
+            }
+          } catch (const std::exception&) {
+            // The callback is called all the same: without the words, or without the answer.
+            result = {answer ? ReportingStatus::OutOfResources : status, {}, {}};
+          }
+          callback(std::move(result));
+        };
   }
 
-  template <class Answer, class Ask>
-  ReportingResult<Answer> waitFor(Timeout timeout, const Ask& ask) noexcept {
-    auto outcome = [](ReportingStatus status) { return ReportingResult<Answer>{status, {}, {}}; };
-    if (!isOurs()) return outcome(ReportingStatus::ForkedProcess);
-    if (_thread.isCurrent()) return outcome(ReportingStatus::OnSessionThread);
-    try {
-      auto deadline = deadlineAfter(timeout);
-      auto pending = std::make_shared<PendingAnswer<Answer>>();
-      auto status = ask([pending](ReportingResult<Answer> result) { pending->set(std::move(result)); });
-      return status == ReportingStatus::Queued ? pending->wait(deadline) : outcome(status);
-    } catch (...) {
-      return outcome(ReportingStatus::OutOfResources);
-    }
-  }
+  bool isSessionThread() const noexcept { return std::this_thread::get_id() == _thread.get_id(); }
+  ReportingStatus push(ClientCall&& call);
 
-  SessionThread _thread;
+  const ForkGuard _process;
+  const std::chrono::milliseconds _drainTime;
+  const std::shared_ptr<SessionWorker> _worker;
+  std::thread _thread;
 };
 
 }  // namespace vesk

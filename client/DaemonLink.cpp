@@ -1,11 +1,13 @@
 #include "client/DaemonLink.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <system_error>
 #include <utility>
 
 #include "client/protocol/WireNames.h"
+#include "platform/files/RootPrefix.h"
 
 namespace vesk {
 
@@ -19,11 +21,10 @@ constexpr std::chrono::seconds kShortestVisit{1};
 
 }  // namespace
 
-DaemonLink::DaemonLink(std::string socketPath, ReconnectPolicy policy,
-                       std::shared_ptr<IPCExportedObject> receiver)
-    : _socketPath(std::move(socketPath)),
+DaemonLink::DaemonLink(const ReportingOptions& options, std::shared_ptr<IPCExportedObject> receiver)
+    : _socketPath(options.socketPath.empty() ? pathUnderRoot(wire::kSocketPath) : options.socketPath),
       _receiver(std::move(receiver)),
-      _policy(policy),
+      _policy(options.firstReconnectWait, options.lastReconnectWait),
       _problem(_socketPath + ": not connected") {}
 
 DaemonLink::Change DaemonLink::reach(Time now, Urgency urgency) {
@@ -43,8 +44,7 @@ DaemonLink::Change DaemonLink::reach(Time now, Urgency urgency) {
     return Change::None;
   } catch (const std::system_error& error) {
     if (error.code().value() == EUSERS) return turnedAway(now);
-    lose(now, std::strerror(error.code().value()));
-    return Change::Lost;
+    return lose(now, std::strerror(error.code().value()));
   }
 }
 
@@ -52,8 +52,7 @@ DaemonLink::Change DaemonLink::process(Time now) {
   if (!_bus) return Change::None;
   if (_bus->process() == BusClient::Progress::Disconnected) {
     if (_bus->wasTurnedAway()) return turnedAway(now);
-    lose(now, _isReady ? "the daemon has closed the connection" : "the daemon does not let us in");
-    return Change::Lost;
+    return lose(now, _isReady ? "the daemon has closed the connection" : "the daemon does not let us in");
   }
   if (_isReady) return Change::None;
   if (_bus->isReady()) {
@@ -62,16 +61,14 @@ DaemonLink::Change DaemonLink::process(Time now) {
     return Change::Ready;
   }
   if (now - _since < kLongestKnock) return Change::None;
-  lose(now, "the daemon does not answer");
-  return Change::Lost;
+  return lose(now, "the daemon does not answer");
 }
 
 DaemonLink::Change DaemonLink::turnedAway(Time now) noexcept {
-  lose(now, "the daemon takes no more", ReportingStatus::TooManyConnections);
-  return Change::Lost;
+  return lose(now, "the daemon takes no more", ReportingStatus::TooManyConnections);
 }
 
-void DaemonLink::lose(Time now, const char* cause, ReportingStatus status) noexcept {
+DaemonLink::Change DaemonLink::lose(Time now, const char* cause, ReportingStatus status) noexcept {
   _problemStatus = status;
   if (_isReady && now - _since >= kShortestVisit) {
     _policy.succeeded();
@@ -86,15 +83,14 @@ void DaemonLink::lose(Time now, const char* cause, ReportingStatus status) noexc
   }
   // Out of the way first: the handlers that its end calls may ask about this link.
   auto bus = std::move(_bus);
+  return Change::Lost;
 }
 
-std::optional<DaemonLink::Time> DaemonLink::nextDue(Time now) const {
+DaemonLink::Time DaemonLink::nextDue(Time now) const {
   if (!_bus) return _policy.due();
-  int milliseconds = _bus->timeout();
-  auto knock = _isReady ? std::nullopt : std::optional<Time>(_since + kLongestKnock);
-  if (milliseconds < 0) return knock;
-  Time bus = now + std::chrono::milliseconds(milliseconds);
-  return knock && *knock < bus ? knock : bus;
+  const int milliseconds = _bus->timeout();
+  const Time bus = milliseconds < 0 ? Time::max() : now + std::chrono::milliseconds(milliseconds);
+  return _isReady ? bus : std::min(bus, _since + kLongestKnock);
 }
 
 }  // namespace vesk

@@ -2,10 +2,10 @@
 #pragma once
 
 #include <VeskReporting/VeskReportingTypes.h>
+#include <poll.h>
 
 #include <chrono>
 #include <memory>
-#include <optional>
 #include <string>
 
 #include "client/ReconnectPolicy.h"
@@ -30,8 +30,9 @@ class DaemonLink {
   };
 
   /// `receiver` gets the daemon's calls.
-  DaemonLink(std::string socketPath, ReconnectPolicy policy, std::shared_ptr<IPCExportedObject> receiver);
+  DaemonLink(const ReportingOptions& options, std::shared_ptr<IPCExportedObject> receiver);
 
+  bool isAway() const noexcept { return !_bus; }
   bool isReady() const noexcept { return _isReady; }
   bool wasEverReady() const noexcept { return _wasEverReady; }
   /// For a person: the socket's path and what is wrong with it; empty when there was no memory for it.
@@ -46,14 +47,13 @@ class DaemonLink {
   [[nodiscard]] Change reach(Time now, Urgency urgency);
   /// Does what the socket is ready for.
   [[nodiscard]] Change process(Time now);
-  /// Gives the connection up. Handlers of answers still owed run before this returns.
-  void lose(Time now, const char* cause, ReportingStatus status = ReportingStatus::NotConnected) noexcept;
+  /// Gives the connection up. Handlers of answers still owed run before this returns Lost.
+  Change lose(Time now, const char* cause, ReportingStatus status = ReportingStatus::NotConnected) noexcept;
 
-  /// For poll(); -1 when away.
-  int descriptor() const { return _bus ? _bus->fd() : -1; }
-  short events() const { return _bus ? _bus->events() : short{0}; }
-  /// When `reach` or `process` has to be called without the socket being ready; nothing for "need not".
-  std::optional<Time> nextDue(Time now) const;
+  /// For poll(); no descriptor when away.
+  pollfd polled() const { return _bus ? pollfd{_bus->fd(), _bus->events(), 0} : pollfd{-1, 0, 0}; }
+  /// When `reach` or `process` has to be called without the socket being ready.
+  Time nextDue(Time now) const;
   /// Whether `Urgency::Early` would make a difference.
   bool mayReachEarly() const noexcept { return !_bus && _policy.mayTryEarly(); }
 

@@ -4,12 +4,9 @@
 
 #include <algorithm>
 #include <exception>
-#include <new>
+#include <iterator>
 #include <utility>
 
-#include "client/AggregationReceiver.h"
-#include "client/protocol/WireNames.h"
-#include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
@@ -31,36 +28,9 @@ constexpr std::size_t kMaximumAnswersOwed = 512;
 // messages then costs its senders no system call.
 constexpr std::chrono::milliseconds kNap{1};
 
-std::string socketOf(const ReportingOptions& options) {
-  return options.socketPath.empty() ? pathUnderRoot(wire::kSocketPath) : options.socketPath;
-}
+constexpr char kLost[] = "the daemon has closed the connection";
 
 }  // namespace
-
-SessionWorker::SessionWorker(const ReportingOptions& options)
-    : _queue(options.maximumQueuedMessages, options.maximumQueuedBytes),
-      _link(socketOf(options), ReconnectPolicy(options.firstReconnectWait, options.lastReconnectWait),
-            std::make_shared<AggregationReceiver>(static_cast<ClientSessionReplyInterface&>(*this))) {}
-
-bool SessionWorker::requestConnection(std::shared_ptr<CallEnd> end, ClientCall::Time deadline) {
-  {
-    MutexLock lock(_mutex);
-    if (_hasEnded) return false;
-    _newRequests.push_back({std::move(end), deadline});
-  }
-  _queue.wake();
-  return true;
-}
-
-void SessionWorker::stop(ClientCall::Time deadline) noexcept {
-  // Closed first: once the thread knows that it has to end, nothing can get in behind its last look.
-  _queue.close();
-  {
-    MutexLock lock(_mutex);
-    _newDrainDeadline = deadline;
-  }
-  _queue.wake();
-}
 
 void SessionWorker::run() noexcept {
   while (!isFinished(Clock::now()) && _queue.ownsItsDescriptors()) {
@@ -76,21 +46,18 @@ void SessionWorker::run() noexcept {
   }
   if (!_queue.ownsItsDescriptors()) {
     VESK_LOG_ERROR("VeskReporting: the session has ended: its process has closed its descriptors");
-    _queue.close();
+    _queue.close(Clock::now());
   }
   endEverything();
 }
 
 void SessionWorker::step() {
-  Time now = Clock::now();
-  takeRequests();
-  takeCalls();
-  tellOfDrops();
+  const Time now = Clock::now();
+  const auto urgency = takeCalls();
   endOverdue(now);
-  reachDaemon(now);
+  reachDaemon(now, urgency);
   sendWaiting(now);
   sayFarewell(now);
-  giveRoomBack();
   if (!isFinished(now)) sleep(now);
 }
 
@@ -101,102 +68,101 @@ bool SessionWorker::isFinished(Time now) const noexcept {
 }
 
 void SessionWorker::endEverything() noexcept {
-  _isClosed = true;
-  tellOfDrops();
+  takeCalls();
   _isConnected.store(false, std::memory_order_relaxed);
+  // Before the link's end tells them that they have lost their connection.
+  for (ClientCall& call : _owed) finish(call, ReportingStatus::Closed);
   _link.lose(Clock::now(), "the session was closed");
-  if (_callsInBus > 0 && _waiting.front().wantsAnswer()) frontHasLeft();
-  auto close = [this](const ClientCall& call) {
-    _drops.unsent();
-    finish(call.end, ReportingStatus::Closed, nullptr, "");
-  };
-  for (; !_waiting.empty(); frontHasLeft()) close(_waiting.front());
-  for (const ClientCall& call : _taken) close(call);
-  std::vector<ClientCall> last;
-  _queue.takeAll(last);
-  for (const ClientCall& call : last) close(call);
-  endRequests(ReportingStatus::Closed, "");
-  std::vector<ConnectionRequest> late;
-  {
-    MutexLock lock(_mutex);
-    _hasEnded = true;
-    late.swap(_newRequests);
+  while (!_waiting.empty()) {
+    finish(_waiting.front(), ReportingStatus::Closed);
+    drop(_waiting.begin(), Drop::Unsent);
   }
-  for (const ConnectionRequest& request : late) finish(request.end, ReportingStatus::Closed, nullptr, "");
+  endRequests(ReportingStatus::Closed, "");
 }
 
-// --- What comes in
+// --- What comes in, and what ends without an answer
 
-void SessionWorker::takeCalls() {
-  // What could not be moved on for want of memory comes before what was queued since.
-  if (_taken.empty()) _queue.takeAll(_taken);
-  _isNapping = !_taken.empty();
-  if (!_taken.empty() && _urgency == DaemonLink::Urgency::WhenDue) _urgency = DaemonLink::Urgency::Early;
-  _waiting.append(_taken);
-}
-
-void SessionWorker::takeRequests() {
-  MutexLock lock(_mutex);
-  if (!_newRequests.empty() || _newDrainDeadline) _urgency = DaemonLink::Urgency::AtOnce;
-  if (_newDrainDeadline) _drainDeadline = std::exchange(_newDrainDeadline, std::nullopt);
-  _requests.reserve(_requests.size() + _newRequests.size());
-  for (auto& request : std::exchange(_newRequests, {})) _requests.push_back(std::move(request));
-}
-
-// Here and not where the call was refused: a log may have a host's sink behind it, which takes its time.
-void SessionWorker::tellOfDrops() noexcept {
-  if (_drops.takeBurst()) {
+DaemonLink::Urgency SessionWorker::takeCalls() noexcept {
+  const std::size_t calls = _waiting.size();
+  const std::size_t requests = _requests.size();
+  // Asked first: once it is set, nothing gets in behind what is taken now.
+  const bool wasClosing = _drainDeadline.has_value();
+  _drainDeadline = _queue.drainDeadline();
+  // Told here and not where the call was refused: a log may have a host's sink behind it, which takes time.
+  if (_queue.take(_waiting, _requests, _firstDeadline)) {
     VESK_LOG_WARNING("VeskReporting: too much waits for the daemon, messages are dropped");
   }
+  _isNapping = _waiting.size() > calls;
+  const bool isUrgent = _requests.size() > requests || _drainDeadline.has_value() != wasClosing;
+  if (isUrgent) return DaemonLink::Urgency::AtOnce;
+  return _isNapping ? DaemonLink::Urgency::Early : DaemonLink::Urgency::WhenDue;
 }
 
-void SessionWorker::endOverdue(Time now) {
-  std::erase_if(_requests, [&](const ConnectionRequest& request) {
-    if (request.deadline > now) return false;
-    finish(request.end, _link.problemStatus(), nullptr, _link.problem());
-    return true;
-  });
-
-  auto first = _waiting.firstDeadline();
-  if (!first || *first > now) return;
-  std::vector<ClientCall> overdue;
-  _waiting.moveOverdue(overdue, now, _callsInBus == 0);
-  auto status = _link.isReady() ? ReportingStatus::TimedOut : _link.problemStatus();
-  for (const ClientCall& call : overdue) {
-    if (call.call.member) {
-      ++_callsGone;
-      _memoryGone += call.memory;
-      if (call.end) _drops.unsent();
+// What an overdue call leaves behind in the daemon is wanted all the same: it stays, one way, and takes the
+// place of one just before it that does the same.
+void SessionWorker::endOverdue(Time now) noexcept {
+  if (now < _firstDeadline) return;
+  _firstDeadline = Time::max();
+  const auto isOverdue = [&](const ClientCall& call) {
+    if (!call.end || call.deadline <= now) return static_cast<bool>(call.end);
+    _firstDeadline = std::min(_firstDeadline, call.deadline);
+    return false;
+  };
+  for (auto next = _requests.begin(); next != _requests.end();) {
+    const auto request = next++;
+    if (!isOverdue(*request)) continue;
+    finish(*request, _link.problemStatus(), nullptr, _link.problem());
+    _requests.erase(request);
+  }
+  const auto status = _link.isReady() ? ReportingStatus::TimedOut : _link.problemStatus();
+  const std::string_view detail = _link.isReady() ? std::string_view() : _link.problem();
+  const auto first = std::next(_waiting.begin(), static_cast<std::ptrdiff_t>(_callsInBus));
+  for (auto next = first; next != _waiting.end();) {
+    const auto call = next++;
+    if (!isOverdue(*call)) continue;
+    finish(*call, status, nullptr, detail);
+    if (call->effect == CallEffect::None) {
+      drop(call, Drop::Unsent);
+    } else if (call != first && !std::prev(call)->end && std::prev(call)->effect == call->effect) {
+      leave(std::prev(call));
     }
-    finish(call.end, status, nullptr, _link.isReady() ? "" : _link.problem());
   }
 }
 
-void SessionWorker::endRequests(ReportingStatus status, std::string_view detail) {
-  for (const auto& request : std::exchange(_requests, {})) finish(request.end, status, nullptr, detail);
+void SessionWorker::endRequests(ReportingStatus status, std::string_view detail) noexcept {
+  for (ClientCall& request : _requests) finish(request, status, nullptr, detail);
+  _requests.clear();
 }
 
-void SessionWorker::sendMessageToClient(const std::optional<Dictionary>& sessionInfo, double timestamp,
-                                        std::uint16_t category, std::uint16_t type,
-                                        const std::optional<Dictionary>& payload) {
-  auto handler = _memory.aggregation();
-  if (!handler) return;
+void SessionWorker::finish(ClientCall& call, ReportingStatus status, BusAnswer* answer,
+                           std::string_view detail) noexcept {
+  if (!call.end) return;
   try {
-    (*handler)(AggregatedMessage{sessionInfo, timestamp, category, type, payload});
+    std::exchange(call.end, nullptr)(status, answer, detail);
   } catch (...) {
-    VESK_LOG_ERROR("VeskReporting: an aggregation handler threw an exception");
+    VESK_LOG_ERROR("VeskReporting: a callback threw an exception");
   }
+}
+
+void SessionWorker::drop(Call call, Drop reason) noexcept {
+  _queue.countDrop(reason);
+  leave(call);
+}
+
+void SessionWorker::leave(Call call) noexcept {
+  const std::size_t memory = call->memory;
+  _waiting.erase(call);
+  _queue.leave(memory, _waiting.empty());
 }
 
 // --- The link
 
 bool SessionWorker::wantsDaemon() const noexcept {
   if (!_waiting.empty() || !_requests.empty()) return true;
-  return !_drainDeadline && !_memory.isEmpty();
+  return !_drainDeadline && (_configuration || _start);
 }
 
-void SessionWorker::reachDaemon(Time now) {
-  auto urgency = std::exchange(_urgency, DaemonLink::Urgency::WhenDue);
+void SessionWorker::reachDaemon(Time now, DaemonLink::Urgency urgency) {
   if (_link.isReady()) return endRequests(ReportingStatus::Done, "");
   if (wantsDaemon()) linkHasChanged(_link.reach(now, urgency));
 }
@@ -210,21 +176,20 @@ void SessionWorker::linkHasChanged(DaemonLink::Change change) {
     return introduceAgain();
   }
   VESK_LOG_DEBUG("VeskReporting: %s", _link.problem().c_str());
-  // What the socket had not taken whole, the daemon has not seen: a one-way call is sent again. A call that
-  // wants an answer has learnt of the loss already.
-  if (_callsInBus > 0 && _waiting.front().wantsAnswer()) frontWasSent();
   _callsInBus = 0;
   _isHopeless = _drainDeadline && !_link.wasEverReady();
   endRequests(_link.problemStatus(), _link.problem());
 }
 
+void SessionWorker::connectionBroke(Time now) { linkHasChanged(_link.lose(now, kLost)); }
+
 // A daemon that does not know who we are must not get a message: without memory to tell it, try again later.
 void SessionWorker::introduceAgain() {
   bool isTold = true;
   try {
-    for (const IPCOutgoingCall* call : _memory.replay()) {
-      if (!isTold || !call) continue;
-      auto result = _link.bus().send(*call);
+    for (const auto* call : {&_configuration, &_start}) {
+      if (!isTold || !*call) continue;
+      const auto result = _link.bus().send(**call);
       isTold = result == BusClient::SendResult::Sent || result == BusClient::SendResult::Refused;
     }
   } catch (const std::exception&) {
@@ -233,192 +198,137 @@ void SessionWorker::introduceAgain() {
   if (!isTold) connectionBroke(Clock::now());
 }
 
+// Needs no memory: a call that was sent can't be taken back.
+void SessionWorker::remember(ClientCall& call) noexcept {
+  constexpr std::size_t kUserInfoOfConfiguration = 1, kUserInfoOfStates = 0;
+  if (call.effect == CallEffect::Configures) _configuration = std::move(call.call);
+  if (call.effect == CallEffect::Starts) _start = std::move(call.call);
+  if (call.effect == CallEffect::ChangesUserInfo && _configuration) {
+    _configuration->arguments[kUserInfoOfConfiguration] = std::move(call.call.arguments[kUserInfoOfStates]);
+  }
+}
+
 // --- Sending
 
 bool SessionWorker::canSend() {
   if (!_link.isReady() || _waiting.empty() || _link.bus().queuedMessages() > 0) return false;
-  return !_waiting.front().wantsAnswer() || _answersOwed < kMaximumAnswersOwed;
+  return !_waiting.front().end || _owed.size() < kMaximumAnswersOwed;
 }
 
-// Calls stay here until the socket has taken them: what only the bus held would be lost with the connection.
+// One-way calls stay here until the socket has taken them: what only the bus held would be lost with the
+// connection. A call that wants an answer learns of that loss from the bus.
 void SessionWorker::sendWaiting(Time now) {
-  for (int i = 0; i < kWritesPerStep; ++i) {
-    callsHaveLeft();
-    if (!canSend()) return;
-    if (_waiting.front().isPlain()) {
-      sendTogether(now);
-    } else {
-      sendFront(now);
-    }
-  }
-}
-
-void SessionWorker::sendTogether(Time now) {
-  BusClient& bus = _link.bus();
-  const std::size_t most = std::min(_waiting.size(), kCallsPerWrite);
-  while (_callsInBus < most && bus.addedBytes() < kBytesPerWrite) {
-    ClientCall& call = _waiting.at(_callsInBus);
-    if (!call.isPlain()) break;
-    auto result = bus.add(call.call);
-    if (result == BusClient::SendResult::Disconnected) return connectionBroke(now);
-    if (result == BusClient::SendResult::OutOfResources) throw std::bad_alloc();  // later, then
-    if (result == BusClient::SendResult::Sent) {
-      handedOver(call);
-    } else if (_callsInBus > 0) {
-      break;  // once it is the front
-    } else {
-      _drops.invalid();
-      return frontHasLeft();
-    }
-  }
-  if (bus.write() == BusClient::Progress::Disconnected) return connectionBroke(now);
   callsHaveLeft();
+  for (int writes = 0; writes < kWritesPerStep && canSend(); ++writes) {
+    if (!sendTogether(now)) return connectionBroke(now);
+    callsHaveLeft();
+  }
 }
 
-void SessionWorker::sendFront(Time now) {
-  ClientCall& front = _waiting.front();
-  BusClient::SendResult result;
-  if (front.descriptor && !front.descriptor.isOurs()) {
-    _drops.unsent();
-    finish(front.end, ReportingStatus::FileUnavailable, nullptr, "");
-    return frontHasLeft();
+/// One call that wants an answer, or the one-way calls before the next of those. False when the connection
+/// has ended.
+bool SessionWorker::sendTogether(Time now) {
+  BusClient& bus = _link.bus();
+  for (auto next = _waiting.begin(); next != _waiting.end();) {
+    const auto call = next++;
+    const bool isAnswered = static_cast<bool>(call->end);
+    if (isAnswered && _callsInBus > 0) break;
+    const auto status = handOver(call, now);
+    if (status == ReportingStatus::NotConnected) return false;
+    if (status != ReportingStatus::Queued) {
+      finish(*call, status);
+      drop(call, status == ReportingStatus::InvalidArgument ? Drop::Invalid : Drop::Unsent);
+    }
+    if (isAnswered || _callsInBus == kCallsPerWrite || bus.addedBytes() >= kBytesPerWrite) break;
   }
-  if (front.wantsAnswer()) {
-    auto left = std::chrono::ceil<std::chrono::milliseconds>(front.deadline - now);
-    auto handler = [this, end = front.end, deadline = front.deadline](BusAnswer& answer) {
-      --_answersOwed;
-      finishWithAnswer(end, deadline, answer);
-    };
-    result = _link.bus().send(front.call, std::move(handler), left);
-    if (result == BusClient::SendResult::Sent) ++_answersOwed;
-  } else {
-    result = _link.bus().send(front.call);
-  }
+  return bus.write() == BusClient::Progress::Connected;
+}
 
-  switch (result) {
+/// Queued when the bus has taken the call, otherwise why not.
+ReportingStatus SessionWorker::handOver(Call call, Time now) {
+  if (call->descriptor && !call->descriptor.isOurs()) return ReportingStatus::FileUnavailable;
+  BusClient& bus = _link.bus();
+  const auto left = std::chrono::ceil<std::chrono::milliseconds>(call->deadline - now);
+  const auto onAnswer = [this, call](BusAnswer& answer) { answered(call, answer); };
+  switch (call->end ? bus.send(call->call, onAnswer, left) : bus.add(call->call)) {
     case BusClient::SendResult::Sent:
-      front.deadline = Time::max();  // the bus minds it
-      handedOver(front);
-      return callsHaveLeft();
+      break;
     case BusClient::SendResult::Refused:
-      _drops.invalid();
-      finish(front.end, ReportingStatus::InvalidArgument, nullptr, "");
-      return frontHasLeft();
+      return ReportingStatus::InvalidArgument;
     case BusClient::SendResult::OutOfResources:
-      _drops.unsent();
-      finish(front.end, ReportingStatus::OutOfResources, nullptr, "");
-      return frontHasLeft();
+      return ReportingStatus::OutOfResources;
     case BusClient::SendResult::Disconnected:
-      return connectionBroke(now);
+      return ReportingStatus::NotConnected;
   }
-}
-
-void SessionWorker::handedOver(const ClientCall& call) noexcept {
-  _memory.sending(call);
-  ++_callsInBus;
-}
-
-void SessionWorker::connectionBroke(Time now) {
-  _link.lose(now, "the daemon has closed the connection");
-  linkHasChanged(DaemonLink::Change::Lost);
+  if (call->effect == CallEffect::Configures) _receiver->setHandler(call->aggregation);
+  if (call->end) {
+    remember(*call);
+    _owed.splice(_owed.end(), _waiting, call);
+    _queue.leave(call->memory, _waiting.empty());
+  } else {
+    ++_callsInBus;
+  }
+  return ReportingStatus::Queued;
 }
 
 void SessionWorker::callsHaveLeft() {
   if (_callsInBus == 0) return;
-  std::size_t held = std::min(_callsInBus, _link.bus().queuedMessages());
-  for (std::size_t left = std::exchange(_callsInBus, held) - held; left > 0; --left) frontWasSent();
-  if (_callsGone >= kCallsPerWrite) giveRoomBack();
+  const std::size_t held = std::min(_callsInBus, _link.bus().queuedMessages());
+  for (; _callsInBus > held; --_callsInBus) {
+    remember(_waiting.front());
+    leave(_waiting.begin());
+  }
 }
 
-void SessionWorker::frontWasSent() noexcept {
-  _memory.sent(std::move(_waiting.front().call), _waiting.front().effect);
-  frontHasLeft();
-}
-
-void SessionWorker::frontHasLeft() noexcept {
-  ++_callsGone;
-  _memoryGone += _waiting.front().memory;
-  _waiting.popFront();
-}
-
-void SessionWorker::giveRoomBack() noexcept {
-  if (_callsGone == 0) return;
-  _queue.leave(std::exchange(_callsGone, 0), std::exchange(_memoryGone, 0));
-  if (_waiting.empty()) _drops.burstIsOver();
+void SessionWorker::answered(Call call, BusAnswer& answer) noexcept {
+  ClientCalls one;
+  one.splice(one.begin(), _owed, call);
+  if (!answer.isError()) return finish(*call, ReportingStatus::Done, &answer);
+  if (answer.errorName() == "org.freedesktop.DBus.Error.Disconnected") {
+    // A host that closes descriptors ends the session, whichever of them it is noticed by.
+    if (!_queue.ownsItsDescriptors()) return finish(*call, ReportingStatus::Closed);
+    return finish(*call, ReportingStatus::NotConnected, nullptr, kLost);
+  }
+  // The same name stands for a time that ran out and for a daemon that gave no answer.
+  const bool isOverdue =
+      answer.errorName() == "org.freedesktop.DBus.Error.NoReply" && Clock::now() >= call->deadline;
+  finish(*call, isOverdue ? ReportingStatus::TimedOut : ReportingStatus::Refused, nullptr,
+         answer.errorText());
 }
 
 // The daemon serves calls in order: its answer to this one shows that it has taken all before. A connection
 // closed sooner could fail under a daemon that still answers, and what it had not read yet would be lost.
 void SessionWorker::sayFarewell(Time now) {
-  bool isTime = _drainDeadline && _farewell == Farewell::NotYet && _link.isReady() && _waiting.empty() &&
-                _answersOwed == 0;
+  const bool isTime =
+      _drainDeadline && _farewell == Farewell::NotYet && _link.isReady() && _waiting.empty() && _owed.empty();
   if (!isTime) return;
-  auto result = _link.bus().send(
+  const auto result = _link.bus().send(
       {"org.freedesktop.DBus.Peer", "Ping", {}}, [this](BusAnswer&) { _farewell = Farewell::Answered; },
       std::chrono::ceil<std::chrono::milliseconds>(*_drainDeadline - now));
   _farewell = result == BusClient::SendResult::Sent ? Farewell::Asked : Farewell::Answered;
 }
 
-void SessionWorker::finish(const std::shared_ptr<CallEnd>& end, ReportingStatus status, BusAnswer* answer,
-                           std::string_view detail) noexcept {
-  if (!end) return;
-  try {
-    (*end)(status, answer, detail);
-  } catch (...) {
-    VESK_LOG_ERROR("VeskReporting: a callback threw an exception");
-  }
-}
-
-void SessionWorker::finishWithAnswer(const std::shared_ptr<CallEnd>& end, Time deadline,
-                                     BusAnswer& answer) noexcept {
-  if (!answer.isError()) return finish(end, ReportingStatus::Done, &answer, "");
-  if (answer.errorName() == "org.freedesktop.DBus.Error.Disconnected") {
-    auto status = _isClosed ? ReportingStatus::Closed : ReportingStatus::NotConnected;
-    return finish(end, status, nullptr, _isClosed ? "" : "the daemon has closed the connection");
-  }
-  // The same name stands for a time that ran out and for a daemon that gave no answer.
-  bool isOverdue = answer.errorName() == "org.freedesktop.DBus.Error.NoReply" && Clock::now() >= deadline;
-  finish(end, isOverdue ? ReportingStatus::TimedOut : ReportingStatus::Refused, nullptr, answer.errorText());
-}
-
 // --- Sleeping
 
 void SessionWorker::sleep(Time now) {
-  pollfd descriptors[] = {{_queue.descriptor(), POLLIN, 0}, {_link.descriptor(), _link.events(), 0}};
-  Time due = nextDue(now);
-  if (!_queue.prepareToSleep(wakeFor())) due = now;
-  auto wait = std::chrono::ceil<std::chrono::milliseconds>(due - now).count();
-  int ready = ::poll(descriptors, 2, static_cast<int>(std::clamp<long>(wait, 0, 3'600'000)));
-  _queue.awake(ready > 0 && descriptors[0].revents != 0);
-
+  const bool isReady = _queue.sleep(wakeFor(), nextDue(now) - now, _link.polled());
   now = Clock::now();
-  auto linkDue = _link.nextDue(now);
-  if ((ready > 0 && descriptors[1].revents != 0) || (linkDue && *linkDue <= now)) {
-    linkHasChanged(_link.process(now));
-  }
+  if (isReady || _link.nextDue(now) <= now) linkHasChanged(_link.process(now));
 }
 
 SessionWorker::Time SessionWorker::nextDue(Time now) {
   if (canSend()) return now;
-  Time due = now + std::chrono::hours(1);
-  auto consider = [&](std::optional<Time> time) {
-    if (time && *time < due) due = *time;
-  };
-  if (_link.descriptor() >= 0 || wantsDaemon()) consider(_link.nextDue(now));
-  for (const auto& request : _requests) consider(request.deadline);
-  consider(_waiting.firstDeadline());
-  consider(_drainDeadline);
-  if (_isNapping && _waiting.empty()) consider(now + kNap);
+  Time due = std::min(now + std::chrono::hours(1), _firstDeadline);
+  if (!_link.isAway() || wantsDaemon()) due = std::min(due, _link.nextDue(now));
+  if (_drainDeadline) due = std::min(due, *_drainDeadline);
+  if (_isNapping && _waiting.empty()) due = std::min(due, now + kNap);
   return due;
 }
 
 CallQueue::WakeFor SessionWorker::wakeFor() const noexcept {
-  if (_link.isReady()) {
-    return _waiting.empty() && !_isNapping ? CallQueue::WakeFor::EveryCall
-                                           : CallQueue::WakeFor::AnsweredCalls;
-  }
-  bool isIdle = !wantsDaemon();
-  return isIdle || _link.mayReachEarly() ? CallQueue::WakeFor::EveryCall : CallQueue::WakeFor::AnsweredCalls;
+  const bool isBusy =
+      _link.isReady() ? !_waiting.empty() || _isNapping : wantsDaemon() && !_link.mayReachEarly();
+  return isBusy ? CallQueue::WakeFor::AnsweredCalls : CallQueue::WakeFor::EveryCall;
 }
 
 }  // namespace vesk

@@ -23,24 +23,26 @@ using Timeout = std::chrono::milliseconds;
 // Descriptors are dearer than memory: with the default bound, 16 may wait.
 constexpr std::size_t kMemoryOfDescriptor = std::size_t{512} << 10;
 
-// A session that could not be made refuses everything.
-template <class Session, class Make>
-ReportingStatus post(const std::unique_ptr<Session>& session, const Make& make) noexcept {
-  return session ? session->post(make) : ReportingStatus::OutOfResources;
+// The three forms of a call, which `make` makes of `arguments`. A session that could not be made refuses it.
+
+template <class Session, class Make, class... Arguments>
+ReportingStatus post(const std::unique_ptr<Session>& session, const Make& make,
+                     Arguments&... arguments) noexcept {
+  return session ? session->post([&] { return make(arguments...); }) : ReportingStatus::OutOfResources;
 }
 
-template <class Answer, class Session, class Make>
+template <class Answer, class Session, class Make, class... Arguments>
 ReportingStatus ask(const std::unique_ptr<Session>& session, ReportingCallback<Answer>& callback,
-                    Timeout timeout, const Make& make) noexcept {
-  return session ? session->template ask<Answer>(make, std::move(callback), timeout)
-                 : ReportingStatus::OutOfResources;
+                    Timeout timeout, const Make& make, Arguments&... arguments) noexcept {
+  if (!session) return ReportingStatus::OutOfResources;
+  return session->template ask<Answer>([&] { return make(arguments...); }, std::move(callback), timeout);
 }
 
-template <class Answer, class Session, class Make>
-ReportingResult<Answer> wait(const std::unique_ptr<Session>& session, Timeout timeout,
-                             const Make& make) noexcept {
+template <class Answer, class Session, class Make, class... Arguments>
+ReportingResult<Answer> wait(const std::unique_ptr<Session>& session, Timeout timeout, const Make& make,
+                             Arguments&... arguments) noexcept {
   if (!session) return {ReportingStatus::OutOfResources, {}, {}};
-  return session->template wait<Answer>(make, timeout);
+  return session->template wait<Answer>([&] { return make(arguments...); }, timeout);
 }
 
 ClientCall withEffect(ClientCall call, CallEffect effect) {
@@ -48,40 +50,50 @@ ClientCall withEffect(ClientCall call, CallEffect effect) {
   return call;
 }
 
-ClientCall makeSetSessionInfo(Dictionary& sessionInfo, std::optional<Dictionary>& userInfo,
-                              std::vector<std::string>& frameworks, AggregationHandler& handler) {
+ClientCall setInfo(Dictionary& sessionInfo, std::optional<Dictionary>& userInfo,
+                   std::vector<std::string>& frameworks, AggregationHandler& handler) {
   ClientCall call = makeCall(wire::kSetSessionInfo, std::move(sessionInfo), std::move(userInfo),
                              std::move(frameworks), static_cast<bool>(handler));
   if (handler) call.aggregation = std::make_shared<const AggregationHandler>(std::move(handler));
   return withEffect(std::move(call), CallEffect::Configures);
 }
 
-ClientCall makeStartConfig() { return withEffect(makeCall(wire::kStartConfig), CallEffect::Starts); }
+ClientCall start() { return withEffect(makeCall(wire::kStartConfig), CallEffect::Starts); }
 
-ClientCall makeFetchStates(std::optional<Dictionary>& userInfo) {
+ClientCall states(std::optional<Dictionary>& userInfo) {
   return withEffect(makeCall(wire::kFetchStates, std::move(userInfo)), CallEffect::ChangesUserInfo);
 }
 
-ClientCall makeMessage(std::uint16_t category, std::uint16_t type, std::optional<Dictionary>& payload) {
+ClientCall displayURL() { return makeCall(wire::kFetchDisplayURL); }
+
+ClientCall message(std::uint16_t category, std::uint16_t type, std::optional<Dictionary>& payload) {
   return makeCall(wire::kSendMessageWithCategory, category, type, std::move(payload));
 }
 
-ClientCall makeMessageOnce(Dictionary& sessionInfo, std::optional<Dictionary>& userInfo,
-                           std::uint16_t category, std::uint16_t type, std::optional<Dictionary>& payload) {
+ClientCall messageOf(Dictionary& parameters) {
+  return makeCall(wire::kSendMessageWithDictionary, std::move(parameters));
+}
+
+ClientCall messageOnce(Dictionary& sessionInfo, std::optional<Dictionary>& userInfo, std::uint16_t category,
+                       std::uint16_t type, std::optional<Dictionary>& payload) {
   return makeCall(wire::kSendMessageWithSessionInfo, std::move(sessionInfo), std::move(userInfo), category,
                   type, std::move(payload));
+}
+
+ClientCall flush() { return makeCall(wire::kFlushMessages); }
+
+ClientCall logDataUpload(List& logData) { return makeCall(wire::kUploadLogData, std::move(logData)); }
+
+ClientCall fileUpload(FileToUpload& file) {
+  ClientCall call = makeCall(wire::kUploadFile, std::move(file.url), IPCDescriptor{file.descriptor.get()});
+  call.descriptor = GuardedDescriptor(std::move(file.descriptor));
+  call.memory = std::max(call.memory, kMemoryOfDescriptor);
+  return call;
 }
 
 ReportingStatus statusOf(const FileToUpload& file) noexcept {
   bool isScarce = file.error == EMFILE || file.error == ENFILE || file.error == ENOMEM;
   return isScarce ? ReportingStatus::OutOfResources : ReportingStatus::FileUnavailable;
-}
-
-ClientCall makeUpload(FileToUpload& file) {
-  ClientCall call = makeCall(wire::kUploadFile, std::move(file.url), IPCDescriptor{file.descriptor.get()});
-  call.descriptor = GuardedDescriptor(std::move(file.descriptor));
-  call.memory = std::max(call.memory, kMemoryOfDescriptor);
-  return call;
 }
 
 }  // namespace
@@ -100,114 +112,98 @@ VeskReporting::~VeskReporting() {
 }
 
 ReportingResult<std::monostate> VeskReporting::connect(Timeout timeout) noexcept {
-  if (!_implementation) return {ReportingStatus::OutOfResources, {}, {}};
-  return _implementation->connect(timeout);
+  return wait<std::monostate>(_implementation, timeout, [] { return ClientCall{}; });
 }
 
-bool VeskReporting::isConnected() const noexcept {
-  return _implementation && _implementation->isOurs() && _implementation->worker().isConnected();
-}
+bool VeskReporting::isConnected() const noexcept { return _implementation && _implementation->isConnected(); }
 
 ReportingDrops VeskReporting::drops() const noexcept {
-  return _implementation ? _implementation->worker().drops().read() : ReportingDrops{};
+  return _implementation ? _implementation->drops() : ReportingDrops{};
 }
 
 ReportingStatus VeskReporting::setSessionInfo(Dictionary sessionInfo, std::optional<Dictionary> userInfo,
                                               std::vector<std::string> frameworksToCheck,
                                               AggregationHandler aggregationHandler) noexcept {
-  return post(_implementation, [&] {
-    return makeSetSessionInfo(sessionInfo, userInfo, frameworksToCheck, aggregationHandler);
-  });
+  return post(_implementation, setInfo, sessionInfo, userInfo, frameworksToCheck, aggregationHandler);
 }
 
 ReportingResult<BackendNamesAnswer> VeskReporting::startConfig(Timeout timeout) noexcept {
-  return wait<BackendNamesAnswer>(_implementation, timeout, makeStartConfig);
+  return wait<BackendNamesAnswer>(_implementation, timeout, start);
 }
 
 ReportingStatus VeskReporting::startConfig(ReportingCallback<BackendNamesAnswer> callback,
                                            Timeout timeout) noexcept {
-  return ask<BackendNamesAnswer>(_implementation, callback, timeout, makeStartConfig);
+  return ask(_implementation, callback, timeout, start);
 }
 
 ReportingResult<BackendNamesAnswer> VeskReporting::fetchStates(std::optional<Dictionary> userInfo,
                                                                Timeout timeout) noexcept {
-  return wait<BackendNamesAnswer>(_implementation, timeout, [&] { return makeFetchStates(userInfo); });
+  return wait<BackendNamesAnswer>(_implementation, timeout, states, userInfo);
 }
 
 ReportingStatus VeskReporting::fetchStates(std::optional<Dictionary> userInfo,
                                            ReportingCallback<BackendNamesAnswer> callback,
                                            Timeout timeout) noexcept {
-  return ask<BackendNamesAnswer>(_implementation, callback, timeout,
-                                 [&] { return makeFetchStates(userInfo); });
+  return ask(_implementation, callback, timeout, states, userInfo);
 }
 
 ReportingResult<std::string> VeskReporting::fetchDisplayURL(Timeout timeout) noexcept {
-  return wait<std::string>(_implementation, timeout, [] { return makeCall(wire::kFetchDisplayURL); });
+  return wait<std::string>(_implementation, timeout, displayURL);
 }
 
 ReportingStatus VeskReporting::fetchDisplayURL(ReportingCallback<std::string> callback,
                                                Timeout timeout) noexcept {
-  return ask<std::string>(_implementation, callback, timeout,
-                          [] { return makeCall(wire::kFetchDisplayURL); });
+  return ask(_implementation, callback, timeout, displayURL);
 }
 
 ReportingStatus VeskReporting::sendMessage(std::uint16_t category, std::uint16_t type,
                                            std::optional<Dictionary> payload) noexcept {
-  return post(_implementation, [&] { return makeMessage(category, type, payload); });
+  return post(_implementation, message, category, type, payload);
 }
 
 ReportingStatus VeskReporting::sendMessage(std::uint16_t category, std::uint16_t type,
                                            std::optional<Dictionary> payload,
                                            ReportingCallback<MessageAnswer> callback,
                                            Timeout timeout) noexcept {
-  return ask<MessageAnswer>(_implementation, callback, timeout,
-                            [&] { return makeMessage(category, type, payload); });
+  return ask(_implementation, callback, timeout, message, category, type, payload);
 }
 
 ReportingResult<MessageAnswer> VeskReporting::sendMessageAndWait(std::uint16_t category, std::uint16_t type,
                                                                  std::optional<Dictionary> payload,
                                                                  Timeout timeout) noexcept {
-  return wait<MessageAnswer>(_implementation, timeout, [&] { return makeMessage(category, type, payload); });
+  return wait<MessageAnswer>(_implementation, timeout, message, category, type, payload);
 }
 
 ReportingStatus VeskReporting::sendMessage(Dictionary parameters) noexcept {
-  return post(_implementation,
-              [&] { return makeCall(wire::kSendMessageWithDictionary, std::move(parameters)); });
+  return post(_implementation, messageOf, parameters);
 }
 
 ReportingStatus VeskReporting::sendMessage(Dictionary parameters, ReportingCallback<MessageAnswer> callback,
                                            Timeout timeout) noexcept {
-  return ask<MessageAnswer>(_implementation, callback, timeout, [&] {
-    return makeCall(wire::kSendMessageWithDictionary, std::move(parameters));
-  });
+  return ask(_implementation, callback, timeout, messageOf, parameters);
 }
 
 ReportingResult<MessageAnswer> VeskReporting::sendMessageAndWait(Dictionary parameters,
                                                                  Timeout timeout) noexcept {
-  return wait<MessageAnswer>(_implementation, timeout, [&] {
-    return makeCall(wire::kSendMessageWithDictionary, std::move(parameters));
-  });
+  return wait<MessageAnswer>(_implementation, timeout, messageOf, parameters);
 }
 
-ReportingStatus VeskReporting::flushMessages() noexcept {
-  return post(_implementation, [] { return makeCall(wire::kFlushMessages); });
-}
+ReportingStatus VeskReporting::flushMessages() noexcept { return post(_implementation, flush); }
 
 ReportingStatus VeskReporting::flushMessages(ReportingCallback<MessageAnswer> callback,
                                              Timeout timeout) noexcept {
-  return ask<MessageAnswer>(_implementation, callback, timeout,
-                            [] { return makeCall(wire::kFlushMessages); });
+  return ask(_implementation, callback, timeout, flush);
 }
 
 ReportingResult<MessageAnswer> VeskReporting::flushMessagesAndWait(Timeout timeout) noexcept {
-  return wait<MessageAnswer>(_implementation, timeout, [] { return makeCall(wire::kFlushMessages); });
+  return wait<MessageAnswer>(_implementation, timeout, flush);
 }
 
 ReportingResult<bool> VeskReporting::uploadFile(const std::string& path, Timeout timeout) noexcept {
   try {
     FileToUpload file = openToUpload(path);
     if (!file.descriptor) return {statusOf(file), false, std::strerror(file.error)};
-    return wait<bool>(_implementation, timeout, [&] { return makeUpload(file); });
+    return wait<bool>(_implementation, timeout, fileUpload, file);
   } catch (const std::exception&) {
     return {ReportingStatus::OutOfResources, false, {}};
   }
@@ -217,29 +213,25 @@ ReportingStatus VeskReporting::uploadFile(const std::string& path, ReportingCall
                                           Timeout timeout) noexcept {
   try {
     FileToUpload file = openToUpload(path);
-    if (!file.descriptor) return statusOf(file);
-    return ask<bool>(_implementation, callback, timeout, [&] { return makeUpload(file); });
+    return file.descriptor ? ask(_implementation, callback, timeout, fileUpload, file) : statusOf(file);
   } catch (const std::exception&) {
     return ReportingStatus::OutOfResources;
   }
 }
 
 ReportingResult<bool> VeskReporting::uploadLogData(List logData, Timeout timeout) noexcept {
-  return wait<bool>(_implementation, timeout,
-                    [&] { return makeCall(wire::kUploadLogData, std::move(logData)); });
+  return wait<bool>(_implementation, timeout, logDataUpload, logData);
 }
 
 ReportingStatus VeskReporting::uploadLogData(List logData, ReportingCallback<bool> callback,
                                              Timeout timeout) noexcept {
-  return ask<bool>(_implementation, callback, timeout,
-                   [&] { return makeCall(wire::kUploadLogData, std::move(logData)); });
+  return ask(_implementation, callback, timeout, logDataUpload, logData);
 }
 
 ReportingStatus VeskReporting::sendMessageOnce(Dictionary sessionInfo, std::optional<Dictionary> userInfo,
                                                std::uint16_t category, std::uint16_t type,
                                                std::optional<Dictionary> payload) noexcept {
-  return post(_implementation,
-              [&] { return makeMessageOnce(sessionInfo, userInfo, category, type, payload); });
+  return post(_implementation, messageOnce, sessionInfo, userInfo, category, type, payload);
 }
 
 ReportingStatus VeskReporting::sendMessageOnce(Dictionary sessionInfo, std::optional<Dictionary> userInfo,
@@ -247,8 +239,7 @@ ReportingStatus VeskReporting::sendMessageOnce(Dictionary sessionInfo, std::opti
                                                std::optional<Dictionary> payload,
                                                ReportingCallback<std::string> callback,
                                                Timeout timeout) noexcept {
-  return ask<std::string>(_implementation, callback, timeout,
-                          [&] { return makeMessageOnce(sessionInfo, userInfo, category, type, payload); });
+  return ask(_implementation, callback, timeout, messageOnce, sessionInfo, userInfo, category, type, payload);
 }
 
 ReportingResult<std::string> VeskReporting::sendMessageOnceAndWait(Dictionary sessionInfo,
@@ -256,8 +247,8 @@ ReportingResult<std::string> VeskReporting::sendMessageOnceAndWait(Dictionary se
                                                                    std::uint16_t category, std::uint16_t type,
                                                                    std::optional<Dictionary> payload,
                                                                    Timeout timeout) noexcept {
-  return wait<std::string>(_implementation, timeout,
-                           [&] { return makeMessageOnce(sessionInfo, userInfo, category, type, payload); });
+  return wait<std::string>(_implementation, timeout, messageOnce, sessionInfo, userInfo, category, type,
+                           payload);
 }
 
 }  // namespace vesk

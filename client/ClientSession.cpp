@@ -1,15 +1,14 @@
-#include "client/SessionThread.h"
+#include "client/ClientSession.h"
 
 #include <pthread.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <csignal>
-#include <system_error>
+#include <string>
 
-#include "client/BoundedWait.h"
 #include "client/DrainBudget.h"
-#include "client/ProcessMark.h"
+#include "client/protocol/WireNames.h"
+#include "platform/ipc/MessageWriter.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
@@ -41,34 +40,40 @@ std::thread startThread(const std::shared_ptr<SessionWorker>& worker) {
   return thread;
 }
 
-std::shared_ptr<SessionWorker> makeWorker(const ReportingOptions& options) {
-  auto worker = std::make_shared<SessionWorker>(options);
-  if (!worker->queue().isUsable()) throw std::system_error(errno, std::generic_category(), "socketpair");
-  return worker;
+/// Neither too large nor nested too deeply, and valid text. Costs as much as sending it.
+bool isEncodable(const ClientCall& call) {
+  std::string message;
+  return CallWriter(wire::kObjectPath).append(call.call, 1, false, message) == CodecResult::Ok;
 }
 
 }  // namespace
 
-SessionThread::SessionThread(const ReportingOptions& options)
-    : _mark(processMark()),
-      _drainTime(boundedWait(options.drainTime)),
-      _worker(makeWorker(options)),
+ClientSession::ClientSession(const ReportingOptions& options)
+    : _drainTime(boundedWait(options.drainTime)),
+      _worker(std::make_shared<SessionWorker>(options)),
       _thread(startThread(_worker)) {}
 
-SessionThread::~SessionThread() {
+ClientSession::~ClientSession() {
   const auto begun = std::chrono::steady_clock::now();
   const auto granted = DrainBudget::shared().grant(_drainTime, begun);
-  _worker->stop(begun + granted);
-  if (isCurrent()) {
+  _worker->queue().close(begun + granted);
+  if (isSessionThread()) {
     VESK_LOG_ERROR("VeskReporting: a session was destroyed by one of its callbacks");
     _thread.detach();
-  } else {
-    _thread.join();
-    const auto now = std::chrono::steady_clock::now();
-    DrainBudget::shared().spend(std::min<std::chrono::steady_clock::duration>(now - begun, granted), now);
+    return;
   }
+  _thread.join();
+  const auto now = std::chrono::steady_clock::now();
+  DrainBudget::shared().spend(std::min<std::chrono::steady_clock::duration>(now - begun, granted), now);
 }
 
-bool SessionThread::isOurs() const noexcept { return _mark == processMark(); }
+ReportingStatus ClientSession::push(ClientCall&& call) {
+  // Told here and now: dropped on its way, it would leave the session what it was before, and nobody knew.
+  if (call.effect != CallEffect::None && !isEncodable(call)) {
+    _worker->queue().countDrop(Drop::Invalid);
+    return ReportingStatus::InvalidArgument;
+  }
+  return _worker->queue().push(std::move(call));
+}
 
 }  // namespace vesk
