@@ -19,6 +19,8 @@ constexpr std::chrono::seconds kLongestKnock{10};
 // A connection that ends sooner is a failed attempt: a daemon that turns us away must not be asked in a loop.
 constexpr std::chrono::seconds kShortestVisit{1};
 
+constexpr char kTurnedAway[] = "the daemon takes no more";
+
 }  // namespace
 
 DaemonLink::DaemonLink(const ReportingOptions& options, std::shared_ptr<IPCExportedObject> receiver)
@@ -43,7 +45,7 @@ DaemonLink::Change DaemonLink::reach(Time now, Urgency urgency) {
     _since = now;
     return Change::None;
   } catch (const std::system_error& error) {
-    if (error.code().value() == EUSERS) return turnedAway(now);
+    if (error.code().value() == EUSERS) return lose(now, kTurnedAway, ReportingStatus::TooManyConnections);
     return lose(now, std::strerror(error.code().value()));
   }
 }
@@ -51,7 +53,7 @@ DaemonLink::Change DaemonLink::reach(Time now, Urgency urgency) {
 DaemonLink::Change DaemonLink::process(Time now) {
   if (!_bus) return Change::None;
   if (_bus->process() == BusClient::Progress::Disconnected) {
-    if (_bus->wasTurnedAway()) return turnedAway(now);
+    if (_bus->wasTurnedAway()) return lose(now, kTurnedAway, ReportingStatus::TooManyConnections);
     return lose(now, _isReady ? "the daemon has closed the connection" : "the daemon does not let us in");
   }
   if (_isReady) return Change::None;
@@ -62,10 +64,6 @@ DaemonLink::Change DaemonLink::process(Time now) {
   }
   if (now - _since < kLongestKnock) return Change::None;
   return lose(now, "the daemon does not answer");
-}
-
-DaemonLink::Change DaemonLink::turnedAway(Time now) noexcept {
-  return lose(now, "the daemon takes no more", ReportingStatus::TooManyConnections);
 }
 
 DaemonLink::Change DaemonLink::lose(Time now, const char* cause, ReportingStatus status) noexcept {

@@ -58,8 +58,6 @@ class DaemonLink {
   bool mayReachEarly() const noexcept { return !_bus && _policy.mayTryEarly(); }
 
  private:
-  Change turnedAway(Time now) noexcept;
-
   const std::string _socketPath;
   const std::shared_ptr<IPCExportedObject> _receiver;
   ReconnectPolicy _policy;

@@ -7,7 +7,6 @@
 #include <chrono>
 #include <utility>
 
-#include "client/common/Resources.h"
 #include "client/protocol/WireNames.h"
 #include "daemon/ReportingdAgent.h"
 #include "platform/device/DeviceInformation.h"
@@ -113,7 +112,7 @@ struct Daemon::Parts {
                         std::make_shared<UploadGate>(),
                         std::make_shared<PowerLog>(powerLogOptions()),
                         dashboardLinger()},
-        sessionServices{backendServices, clientLibraryVersion()},
+        sessionServices{backendServices, VeskReporting::version()},
         http(httpOptions(busyMarker)),
         agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetcher(), busyMarker)),
         listener(listenerOptions(serviceManager)) {
@@ -122,7 +121,7 @@ struct Daemon::Parts {
   }
 
   StorebagFetcher storebagFetcher() {
-    return [this, library = LibraryFacts{sessionServices.libraryVersion, publicKeyDER}](
+    return [this, library = LibraryFacts{sessionServices.libraryVersion, VeskReporting::publicKey}](
                std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version,
                bool& notModified, std::optional<std::string>& lastModified) {
       return fetchStorebagForEnvironmentAndClientType(http, library, clientType, maxAge, version, notModified,

@@ -1,9 +1,10 @@
 // veskreportingd: accepts reporting messages from local clients and delivers them.
+#include <VeskReporting/VeskReportingLogging.h>
+
 #include <cstdio>
 #include <cstdlib>
 #include <exception>
 
-#include "client/common/Logging.h"
 #include "daemon/Daemon.h"
 #include "daemon/DaemonOptions.h"
 #include "daemon/RunLoop.h"

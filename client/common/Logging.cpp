@@ -1,4 +1,4 @@
-#include "client/common/Logging.h"
+#include <VeskReporting/VeskReportingLogging.h>
 
 #include <utility>
 

@@ -61,7 +61,7 @@ PersistentIdentifiers::Pair PersistentIdentifiers::load() const {
   if (lock) {
     if (auto known = readFile()) return *known;
   }
-  Pair pair = fresh();
+  Pair pair{uuidText(makeUUID()), uuidText(makeUUID())};
   if (lock) cause = store(pair);
   if (cause != 0) {
     VESK_LOG_WARNING("VeskReporting: cannot keep identifiers in %s: %s; they last as long as this process",
@@ -82,14 +82,10 @@ std::optional<PersistentIdentifiers::Pair> PersistentIdentifiers::readFile() con
     VESK_LOG_WARNING("VeskReporting: cannot read %s: %s; kept as %s.bad, new identifiers are made",
                      _path.c_str(), file.error.c_str(), _path.c_str());
   }
-  keepAside();
-  return std::nullopt;
-}
-
-void PersistentIdentifiers::keepAside() const {
   if (std::rename(_path.c_str(), (_path + ".bad").c_str()) != 0) {
     VESK_LOG_WARNING("VeskReporting: cannot rename %s: %s", _path.c_str(), std::strerror(errno));
   }
+  return std::nullopt;
 }
 
 int PersistentIdentifiers::store(const Pair& pair) const {
@@ -127,10 +123,6 @@ std::optional<PersistentIdentifiers::Pair> PersistentIdentifiers::parse(const st
   }
   if (pair.respecting.empty() || pair.overriding.empty()) return std::nullopt;
   return pair;
-}
-
-PersistentIdentifiers::Pair PersistentIdentifiers::fresh() {
-  return {uuidText(makeUUID()), uuidText(makeUUID())};
 }
 
 std::string VeskReporting::getPersistentIdentifierForDNU(bool respectsConsent) noexcept {

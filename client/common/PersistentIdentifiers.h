@@ -33,11 +33,9 @@ class PersistentIdentifiers {
 
   Pair load() const;
   std::optional<Pair> readFile() const;
-  void keepAside() const;
   /// 0, or the errno of what failed.
   int store(const Pair& pair) const;
   static std::optional<Pair> parse(const std::string& text);
-  static Pair fresh();
 
   const std::string _path;
   Mutex _mutex;

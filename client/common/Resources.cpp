@@ -1,5 +1,3 @@
-#include "client/common/Resources.h"
-
 #include <VeskReporting/VeskReporting.h>
 
 #include <algorithm>
@@ -17,8 +15,8 @@ namespace {
 constexpr std::size_t kMaximumVersionFile = 4096;
 constexpr std::size_t kMaximumVersion = 64;
 constexpr std::size_t kMaximumPublicKey = std::size_t{64} << 10;
-constexpr char kDefaultVersion[] = "7.0";
 
+/// A file that the installed library carries besides code.
 std::optional<std::string> readResource(const char* name, std::size_t limit) {
   std::string path = pathUnderRoot("/usr/share/veskreporting/") + name;
   SmallFile file = readTrustedFile(path, limit);
@@ -34,39 +32,34 @@ bool isUsableVersion(std::string_view version) {
          std::all_of(version.begin(), version.end(), [](char c) { return c > ' ' && c < 0x7f; });
 }
 
-}  // namespace
-
-std::optional<std::string> bundleVersion() {
+/// The first line of the file "version", trimmed; nothing when there is no such file or it holds nothing
+/// usable.
+std::optional<std::string> declaredVersion() {
   auto file = readResource("version", kMaximumVersionFile);
   if (!file) return std::nullopt;
   std::string_view text = trimmed(*file);
   std::string_view version = trimmed(text.substr(0, text.find('\n')));
-  if (!isUsableVersion(version)) {
-    VESK_LOG_WARNING("VeskReporting: the file \"version\" holds no version");
-    return std::nullopt;
-  }
-  return std::string(version);
+  if (isUsableVersion(version)) return std::string(version);
+  VESK_LOG_WARNING("VeskReporting: the file \"version\" holds no version");
+  return std::nullopt;
 }
 
-std::string clientLibraryVersion() { return bundleVersion().value_or(kDefaultVersion); }
-
-std::optional<std::string> publicKeyDER() {
-  auto key = readResource("publicKey.der", kMaximumPublicKey);
-  if (key && key->empty()) return std::nullopt;
-  return key;
-}
+}  // namespace
 
 std::string VeskReporting::version() noexcept {
+  constexpr char kDefaultVersion[] = "7.0";  // short enough to need no memory
   try {
-    return clientLibraryVersion();
+    return declaredVersion().value_or(kDefaultVersion);
   } catch (...) {
-    return kDefaultVersion;  // short enough to need no memory
+    return kDefaultVersion;
   }
 }
 
 std::optional<std::string> VeskReporting::publicKey() noexcept {
   try {
-    return publicKeyDER();
+    auto key = readResource("publicKey.der", kMaximumPublicKey);
+    if (key && key->empty()) return std::nullopt;
+    return key;
   } catch (...) {
     return std::nullopt;
   }

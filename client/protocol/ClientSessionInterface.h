@@ -48,16 +48,4 @@ class ClientSessionInterface {
                                           Reply<std::string> reply) = 0;
 };
 
-/// Implemented by the client; the daemon calls it, one way, with the messages that the client aggregates.
-class ClientSessionReplyInterface {
- public:
-  virtual ~ClientSessionReplyInterface() = default;
-
-  /// `timestamp`: seconds since 1970. The closing message of an aggregation has no session info, time 0,
-  /// category 0, type 0 and no payload.
-  virtual void sendMessageToClient(const std::optional<Dictionary>& sessionInfo, double timestamp,
-                                   std::uint16_t category, std::uint16_t type,
-                                   const std::optional<Dictionary>& payload) = 0;
-};
-
 }  // namespace vesk

@@ -20,20 +20,6 @@ class ClientSessionStub final : public IPCExportedObject {
   void handle(IPCIncomingCall& call) override;
 
  private:
-  void setSessionInfo(IPCIncomingCall& call);
-  void startConfigWithCompletionHandler(IPCIncomingCall& call);
-  void fetchStatesWithUserInfo(IPCIncomingCall& call);
-  void fetchDisplayURL(IPCIncomingCall& call);
-  void sendMessageWithCategory(IPCIncomingCall& call);
-  void sendMessageWithDictionary(IPCIncomingCall& call);
-  void flushMessagesWithReply(IPCIncomingCall& call);
-  void uploadFileAtPath(IPCIncomingCall& call);
-  void uploadLogData(IPCIncomingCall& call);
-  void sendMessageWithSessionInfo(IPCIncomingCall& call);
-
-  struct Handler;
-  static const Handler kHandlers[];
-
   const std::shared_ptr<ClientSessionInterface> _session;
 };
 

@@ -1,10 +1,11 @@
 #include "tools/veskreport/StorebagCommands.h"
 
+#include <VeskReporting/VeskReporting.h>
+
 #include <exception>
 #include <stdexcept>
 #include <string>
 
-#include "client/common/Resources.h"
 #include "tools/files/WholeFile.h"
 #include "tools/storebag/SigningKey.h"
 #include "tools/storebag/StorebagDocument.h"
@@ -31,7 +32,7 @@ int reporting(const Output& output, const Work& work) {
 
 std::string publicKeyOf(const StorebagArguments& arguments) {
   if (!arguments.publicKey.empty()) return readWholeFile(arguments.publicKey, kMaximumKey);
-  auto installed = publicKeyDER();
+  auto installed = VeskReporting::publicKey();
   if (!installed) throw std::runtime_error("no public key is installed: name one with --key");
   return *installed;
 }
