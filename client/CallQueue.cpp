@@ -19,10 +19,7 @@ CallQueue::CallQueue(const ReportingOptions& options)
   _writeEnd = GuardedDescriptor(FileDescriptor(ends[1]));
 }
 
-ReportingStatus CallQueue::push(ClientCall&& pushed) {
-  ClientCalls one;  // made and, when it is refused, destroyed outside the lock
-  one.push_back(std::move(pushed));
-  const ClientCall& call = one.front();
+ReportingStatus CallQueue::push(ClientCall&& call) {
   auto status = ReportingStatus::Queued;
   bool mustWake = false;
   {
@@ -34,15 +31,17 @@ ReportingStatus CallQueue::push(ClientCall&& pushed) {
     if (isFull && !isRequest) {
       countDrop(Drop::QueueFull);
       status = ReportingStatus::QueueFull;
-      mustWake = !_isBurst.exchange(true);
+      mustWake = !std::exchange(_isBurst, true);
       _mustTellOfBurst |= mustWake;
     } else {
+      if (_spare.empty()) _spare.emplace_back();
       _calls += isRequest ? 0 : 1;
       _memory += call.memory;
       if (call.end) _firstDeadline = std::min(_firstDeadline, call.deadline);
       mustWake = _wakeFor == WakeFor::EveryCall || (call.end && _wakeFor == WakeFor::AnsweredCalls);
+      _spare.front() = std::move(call);
       ClientCalls& line = isRequest ? _requests : _queued;
-      line.splice(line.end(), one);
+      line.splice(line.end(), _spare, _spare.begin());
     }
     if (mustWake) _wakeFor = WakeFor::NothingQueued;
   }
@@ -71,10 +70,12 @@ bool CallQueue::take(ClientCalls& calls, ClientCalls& requests, Time& firstDeadl
   return std::exchange(_mustTellOfBurst, false);
 }
 
-void CallQueue::leave(std::size_t memory, bool wasLast) noexcept {
+void CallQueue::leave(std::size_t calls, std::size_t memory, bool wereLast, ClientCalls&& emptied) noexcept {
+  MutexLock lock(_mutex);
+  _calls -= calls;
   _memory -= memory;
-  --_calls;
-  if (wasLast) _isBurst = false;
+  if (wereLast) _isBurst = false;
+  _spare.splice(_spare.end(), emptied);
 }
 
 std::optional<CallQueue::Time> CallQueue::drainDeadline() const noexcept {

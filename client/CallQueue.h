@@ -48,8 +48,9 @@ class CallQueue {
   /// the connection to `requests`; lowers `firstDeadline` to theirs. True when a burst of drops has begun,
   /// which deserves a log line.
   bool take(ClientCalls& calls, ClientCalls& requests, Time& firstDeadline) noexcept;
-  /// A call taken earlier has left, as the last one or not: its room is free again.
-  void leave(std::size_t memory, bool wasLast) noexcept;
+  /// Calls taken earlier have left, as the last ones or not: their room is free again, and the nodes of
+  /// those that are `emptied` are used again.
+  void leave(std::size_t calls, std::size_t memory, bool wereLast, ClientCalls&& emptied = {}) noexcept;
   /// Set once the queue is closed.
   std::optional<Time> drainDeadline() const noexcept;
   /// Waits for `other`, for a push of `what`, or until `wait` is over. Whether `other` is ready.
@@ -64,15 +65,15 @@ class CallQueue {
   GuardedDescriptor _readEnd;
   GuardedDescriptor _writeEnd;
 
-  // Raised under the lock only.
-  std::atomic<std::size_t> _calls{0};   ///< queued, or taken and not left yet
-  std::atomic<std::size_t> _memory{0};  ///< theirs
-  std::atomic<bool> _isBurst{false};    ///< of drops
   std::atomic<std::uint64_t> _drops[3] = {};
 
   mutable Mutex _mutex;
+  std::size_t _calls VESK_GUARDED_BY(_mutex) = 0;   ///< queued, or taken and not left yet
+  std::size_t _memory VESK_GUARDED_BY(_mutex) = 0;  ///< theirs
+  bool _isBurst VESK_GUARDED_BY(_mutex) = false;    ///< of drops
   ClientCalls _queued VESK_GUARDED_BY(_mutex);
   ClientCalls _requests VESK_GUARDED_BY(_mutex);
+  ClientCalls _spare VESK_GUARDED_BY(_mutex);                 ///< empty
   Time _firstDeadline VESK_GUARDED_BY(_mutex) = Time::max();  ///< of the answers that those want
   WakeFor _wakeFor VESK_GUARDED_BY(_mutex) = WakeFor::NothingQueued;
   bool _mustTellOfBurst VESK_GUARDED_BY(_mutex) = false;

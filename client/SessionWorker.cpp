@@ -152,7 +152,7 @@ void SessionWorker::drop(Call call, Drop reason) noexcept {
 void SessionWorker::leave(Call call) noexcept {
   const std::size_t memory = call->memory;
   _waiting.erase(call);
-  _queue.leave(memory, _waiting.empty());
+  _queue.leave(1, memory, _waiting.empty());
 }
 
 // --- The link
@@ -264,7 +264,7 @@ ReportingStatus SessionWorker::handOver(Call call, Time now) {
   if (call->end) {
     remember(*call);
     _owed.splice(_owed.end(), _waiting, call);
-    _queue.leave(call->memory, _waiting.empty());
+    _queue.leave(1, call->memory, _waiting.empty());
   } else {
     ++_callsInBus;
   }
@@ -274,10 +274,15 @@ ReportingStatus SessionWorker::handOver(Call call, Time now) {
 void SessionWorker::callsHaveLeft() {
   if (_callsInBus == 0) return;
   const std::size_t held = std::min(_callsInBus, _link.bus().queuedMessages());
+  ClientCalls left;
+  std::size_t memory = 0;
   for (; _callsInBus > held; --_callsInBus) {
     remember(_waiting.front());
-    leave(_waiting.begin());
+    memory += _waiting.front().memory;
+    _waiting.front() = ClientCall{};
+    left.splice(left.end(), _waiting, _waiting.begin());
   }
+  if (!left.empty()) _queue.leave(left.size(), memory, _waiting.empty(), std::move(left));
 }
 
 void SessionWorker::answered(Call call, BusAnswer& answer) noexcept {
