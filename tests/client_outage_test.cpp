@@ -252,10 +252,11 @@ TEST_F(ClientOutage, AHostThatClosesAllDescriptorsNeitherHangsNorGetsAnythingInI
     std::ignore = idle.sendMessage(1, 1);
     std::ignore = session->sendMessage(1, 1);
     // Whether the thread misses its connection or what wakes it first is chance.
-    const auto status = answer.get().status;
-    bool areRefused = (status == ReportingStatus::Closed || status == ReportingStatus::NotConnected) &&
-                      session->fetchDisplayURL(1h).status == ReportingStatus::Closed &&
-                      session->connect(1h).status == ReportingStatus::Closed;
+    const auto interrupted = answer.get().status;
+    bool areRefused =
+        (interrupted == ReportingStatus::Closed || interrupted == ReportingStatus::NotConnected) &&
+        session->fetchDisplayURL(1h).status == ReportingStatus::Closed &&
+        session->connect(1h).status == ReportingStatus::Closed;
     session.reset();
     bool areUntouched = std::all_of(own.begin(), own.end(), [](const FileDescriptor& descriptor) {
       struct stat status {};
