@@ -1,5 +1,11 @@
 #include "platform/ipc/BusConnection.h"
 
+#include <poll.h>
+#include <sys/ioctl.h>
+
+#include <algorithm>
+#include <thread>
+
 #include "platform/ipc/ExtensionTokens.h"
 #include "platform/log/LogUser.h"
 #include "platform/log/SystemLog.h"
@@ -8,60 +14,42 @@ namespace vesk {
 
 namespace {
 
-std::uint64_t nextSerial() {
-  static std::atomic<std::uint64_t> last{0};
-  return ++last;
-}
-
 std::string nameFor(std::uint64_t serial, const IPCPeer& peer) {
   return "connection " + std::to_string(serial) + " (user " + std::to_string(peer.user) + ", process " +
          std::to_string(peer.process) + ")";
 }
 
+/// Milliseconds for poll() until `deadline`, rounded up so that it has passed when poll() returns.
+int untilDeadline(std::chrono::steady_clock::time_point deadline) {
+  auto left =
+      std::chrono::ceil<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now()).count();
+  return static_cast<int>(std::clamp<long long>(left, 0, 1'000'000));
+}
+
 }  // namespace
 
-BusConnection::BusConnection(FileDescriptor socket, const IPCPeer& peer, const ConnectionSettings& settings,
+BusConnection::BusConnection(FileDescriptor socket, std::uint64_t serial, const IPCPeer& peer,
                              std::shared_ptr<ConnectionRegistry> registry)
-    : _serial(nextSerial()),
+    : _serial(serial),
       _peer(peer),
-      _settings(settings),
-      _name(nameFor(_serial, peer)),
+      _name(nameFor(serial, peer)),
       _registry(std::move(registry)),
-      _wakeup(std::make_shared<Wakeup>()),
       _answers(std::make_shared<Answers>([wakeup = _wakeup] { wakeup->signal(); })),
-      _outbox(settings.maximumOutbox),
+      _outbox(_registry->options.maximumOutbox),
       _socket(std::move(socket)),
-      _router(settings.objectPath, _name, _answers, {_serial, _peer.user},
-              {.content = settings.maximumMessage}) {}
-
-BusConnection::~BusConnection() { close(); }
-
-void BusConnection::setExportedObject(std::shared_ptr<IPCExportedObject> object) {
-  _router.setExportedObject(std::move(object));
-}
-
-void BusConnection::setInterruptionHandler(std::function<void()> handler) {
-  _interruptionHandler = std::move(handler);
-}
-
-void BusConnection::setInvalidationHandler(std::function<void()> handler) {
-  _invalidationHandler = std::move(handler);
-}
-
-void BusConnection::setLossHandler(std::function<void(std::size_t calls)> handler) {
-  _lossHandler = std::move(handler);
-}
+      _router(_registry->options.objectPath, _name, _answers, {serial, peer.user},
+              {.content = _registry->options.maximumMessage}),
+      _writer(_registry->options.objectPath),
+      _sasl(peer.user),
+      _channel(_socket.get(), _registry->options.maximumMessage + kMessageOverhead) {}
 
 void BusConnection::resume() {
-  {
-    MutexLock lock(_mutex);
-    if (std::exchange(_started, true)) return;
-  }
+  if (_started.exchange(true)) return;
   try {
     _registry->launch([self = shared_from_this()] { self->run(); });
   } catch (const std::exception& error) {
     VESK_LOG_ERROR("ipc: %s: Closed: %s", _name.c_str(), error.what());
-    finish(ConnectionLoop::End::NotAuthenticated, nullptr);
+    finish(End::NotAuthenticated);
     close();
   }
 }
@@ -73,10 +61,7 @@ void BusConnection::invalidate() {
 
 void BusConnection::end() {
   invalidate();
-  {
-    MutexLock lock(_mutex);
-    if (std::exchange(_started, true)) return;
-  }
+  if (_started.exchange(true)) return;
   _outbox.close();
   LogUser onBehalfOf(_peer.user);
   dropHandlers();
@@ -92,26 +77,172 @@ void BusConnection::callRemoteObject(IPCOutgoingCall call,
   _wakeup->signal();
 }
 
+// --- On the connection's thread
+
 void BusConnection::run() noexcept {
   LogUser onBehalfOf(_peer.user);
+  auto how = End::BrokenOff;
   try {
-    ConnectionLoop loop(_socket.get(), _peer, _name, _settings, _outbox, *_wakeup, *_answers, _router);
-    finish(loop.serve(_invalidated), &loop);
+    how = serve();
   } catch (const std::exception& error) {
     VESK_LOG_ERROR("ipc: %s: Closed: %s", _name.c_str(), error.what());
-    finish(ConnectionLoop::End::BrokenOff, nullptr);
   }
+  finish(how);
   // After the bus; whoever still holds this connection does not hold its socket open.
   close();
 }
 
-void BusConnection::finish(ConnectionLoop::End how, ConnectionLoop* loop) noexcept {
+BusConnection::End BusConnection::serve() {
+  const Time deadline = std::chrono::steady_clock::now() + _registry->options.authenticationTimeout;
+  _answers->setThread(std::this_thread::get_id());
+  for (;;) {
+    sendOutgoing();
+    if (_invalidated.load()) return drain();
+    if (_answers->isBroken()) return closeFor("an answer is lost");
+    if (!_isReady && std::chrono::steady_clock::now() >= deadline) {
+      VESK_LOG_WARNING("ipc: %s: Closed: not authenticated in time", _name.c_str());
+      return End::NotAuthenticated;
+    }
+    wait(deadline);
+    if (auto end = advance()) return *end;
+  }
+}
+
+/// What this thread and others have answered and called, with one system call.
+void BusConnection::sendOutgoing() {
+  _answers->moveTo(_channel);
+  while (_isReady && !_peerGone && _channel.unsentBytes() < kMaximumUnsent) {
+    auto call = _outbox.take();
+    if (!call) break;
+    if (!appendCall(*call)) _outbox.lose();
+  }
+  // What the client had sent before it went is served all the same, so its going is no end here.
+  if (!_channel.flush()) _peerGone = true;
+  if (_peerGone) _channel.dropOutput();
+}
+
+bool BusConnection::appendCall(const IPCOutgoingCall& call) {
+  const auto result = _writer.append(call, ++_lastSerial, false, _channel.output());
+  if (result == CodecResult::Ok) {
+    _channel.queued();
+    return true;
+  }
+  VESK_LOG_WARNING("ipc: %s: The call %s can't be sent: %s", _name.c_str(), call.member, describe(result));
+  return false;
+}
+
+void BusConnection::wait(Time deadline) {
+  if (_hasMore && !isBackedUp()) return;
+  pollfd polls[] = {{_socket.get(), static_cast<short>(!isBackedUp() ? POLLIN : POLLOUT), 0},
+                    {_wakeup->fd(), POLLIN, 0}};
+  if (::poll(polls, 2, _isReady ? -1 : untilDeadline(deadline)) <= 0) return;
+  if (polls[0].revents & (POLLHUP | POLLERR)) {
+    _peerGone = true;
+    _channel.dropOutput();
+  }
+  if (polls[1].revents) _wakeup->clear();
+}
+
+BusConnection::End BusConnection::closeFor(const char* complaint) {
+  if (complaint) VESK_LOG_WARNING("ipc: %s: Closed: %s", _name.c_str(), complaint);
+  return _isReady ? End::BrokenOff : End::NotAuthenticated;
+}
+
+/// One step: reads what has come, and serves it.
+std::optional<BusConnection::End> BusConnection::advance() {
+  if (isBackedUp()) return std::nullopt;
+  if (!_hasMore) {
+    switch (_channel.receive()) {
+      case Channel::Input::Nothing:
+        return std::nullopt;
+      case Channel::Input::HungUp:
+        return _isReady ? End::HungUp : End::NotAuthenticated;
+      case Channel::Input::BrokenOff:
+        return closeFor(_channel.complaint());
+      case Channel::Input::Some:
+        break;
+    }
+  }
+  if (!_isReady) {
+    if (auto end = authenticate()) return end;
+    if (!_isReady) return std::nullopt;
+  }
+  return serveMessages();
+}
+
+std::optional<BusConnection::End> BusConnection::authenticate() {
+  auto step = _sasl.step(_channel.bytes());
+  if (step.verdict == SaslServer::Verdict::Refused) return closeFor("no D-Bus authentication");
+  _channel.skip(step.taken);
+  if (!step.answer.empty()) {
+    _channel.output() += step.answer;
+    _channel.queued();
+  }
+  _isReady = step.verdict == SaslServer::Verdict::Begun;
+  if (!_isReady && _channel.hasDescriptors()) return closeFor("a descriptor before authentication");
+  return std::nullopt;
+}
+
+std::optional<BusConnection::End> BusConnection::serveMessages() {
+  for (;;) {
+    Message message;
+    _hasMore = false;
+    switch (_channel.next(message)) {
+      case Channel::Next::Incomplete:
+        return std::nullopt;
+      case Channel::Next::Refused:
+        return closeFor(_channel.complaint());
+      case Channel::Next::Dropped:
+        if (_brokenMessages.begins()) VESK_LOG_WARNING("ipc: %s: Dropped a broken message", _name.c_str());
+        break;
+      case Channel::Next::Whole:
+        _router.route(message);
+        _answers->moveTo(_channel);
+        if (message.hasDescriptors()) return closeFor("descriptors that no call takes");
+        break;
+    }
+    if (_channel.unsentBytes() > kMaximumUnsent) {
+      sendOutgoing();
+      // What is left is served once the client has read: until then nothing more is read from it either.
+      _hasMore = true;
+      if (isBackedUp()) return std::nullopt;
+    }
+  }
+}
+
+BusConnection::End BusConnection::drain() {
+  int waiting = 0;
+  if (!_isReady || ::ioctl(_socket.get(), FIONREAD, &waiting) != 0) return End::Invalidated;
+  const std::size_t target = _channel.received() + static_cast<std::size_t>(waiting);
+  const Time deadline = std::chrono::steady_clock::now() + kDrainTime;
+  while ((_hasMore || _channel.received() < target) && !isBackedUp() &&
+         std::chrono::steady_clock::now() < deadline) {
+    if (advance()) break;
+    sendOutgoing();
+  }
+  return End::Invalidated;
+}
+
+void BusConnection::flush() {
+  const Time deadline = std::chrono::steady_clock::now() + kFlushTime;
+  while (_isReady && !_peerGone && std::chrono::steady_clock::now() < deadline) {
+    sendOutgoing();
+    if (!isBackedUp()) {
+      if (_outbox.empty()) return;
+      continue;
+    }
+    pollfd poll{_socket.get(), POLLOUT, 0};
+    if (::poll(&poll, 1, untilDeadline(deadline)) <= 0 || (poll.revents & (POLLHUP | POLLERR))) return;
+  }
+}
+
+void BusConnection::finish(End how) noexcept {
   // A client that has gone takes no call; one that is sent away still gets what its session says in the end.
-  std::size_t lost = how == ConnectionLoop::End::Invalidated ? 0 : _outbox.close();
-  if (how == ConnectionLoop::End::BrokenOff) callHandler(_interruptionHandler);
+  std::size_t lost = how == End::Invalidated ? 0 : _outbox.close();
+  if (how == End::BrokenOff) callHandler(_interruptionHandler);
   callHandler(_invalidationHandler);
   dropHandlers();
-  if (loop && how == ConnectionLoop::End::Invalidated) loop->flush(kFlushTime);
+  if (how == End::Invalidated) flush();
   if (std::size_t unsent = _outbox.close()) {
     VESK_LOG_WARNING("ipc: %s: Ended before %zu calls to the client were sent", _name.c_str(), unsent);
     lost += unsent;
@@ -137,10 +268,10 @@ void BusConnection::dropHandlers() noexcept {
 
 void BusConnection::close() noexcept {
   if (!_counted.exchange(false)) return;
+  _answers->close();
   _socket.reset();
   ExtensionTokens::shared().drop(_serial);
-  _registry->remove(_serial);
-  _registry->release(_peer.user);
+  _registry->release(_serial);
 }
 
 }  // namespace vesk

@@ -2,20 +2,25 @@
 #pragma once
 
 #include <atomic>
+#include <chrono>
+#include <cstddef>
 #include <cstdint>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <string>
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/ipc/Answers.h"
 #include "platform/ipc/CallRouter.h"
-#include "platform/ipc/ConnectionLoop.h"
+#include "platform/ipc/Channel.h"
 #include "platform/ipc/ConnectionRegistry.h"
 #include "platform/ipc/IPCConnection.h"
+#include "platform/ipc/MessageWriter.h"
 #include "platform/ipc/Outbox.h"
+#include "platform/ipc/Sasl.h"
 #include "platform/ipc/Wakeup.h"
-#include "platform/sync/Mutex.h"
+#include "platform/ipc/WarningBurst.h"
 
 namespace vesk {
 
@@ -26,32 +31,68 @@ namespace vesk {
 /// no handler.
 class BusConnection final : public IPCConnection, public std::enable_shared_from_this<BusConnection> {
  public:
+  /// The content of a message is limited to `maximumMessage`, with an error that names the limit; the bytes
+  /// around it, by closing the connection, to this much more.
+  static constexpr std::size_t kMessageOverhead = 64 * 1024;
+  /// Answers and calls that wait for the client to read beyond what its socket holds. Beyond that nothing
+  /// more is served, so a client that calls without reading its answers waits itself.
+  static constexpr std::size_t kMaximumUnsent = 224 * 1024;
+  /// What a client had sent when its connection was invalidated is still served, for this long.
+  static constexpr std::chrono::milliseconds kDrainTime{1'000};
   /// Bytes for the client that wait when the connection ends from this side are written for so long.
   static constexpr std::chrono::milliseconds kFlushTime{1'000};
 
-  /// `peer` has been admitted by `registry`, which is told when this ends.
-  BusConnection(FileDescriptor socket, const IPCPeer& peer, const ConnectionSettings& settings,
+  /// `registry` has admitted it under that number, and is told when this ends.
+  BusConnection(FileDescriptor socket, std::uint64_t serial, const IPCPeer& peer,
                 std::shared_ptr<ConnectionRegistry> registry);
-  ~BusConnection() override;
+  ~BusConnection() override { close(); }
 
-  std::uint64_t serial() const noexcept { return _serial; }
   /// For the listener: as `invalidate`, and when there is no thread lets go of handlers and exported object.
   void end();
 
   std::string description() const override { return _name; }
   IPCPeer peer() const override { return _peer; }
-  void setExportedObject(std::shared_ptr<IPCExportedObject> object) override;
-  void setInterruptionHandler(std::function<void()> handler) override;
-  void setInvalidationHandler(std::function<void()> handler) override;
-  void setLossHandler(std::function<void(std::size_t calls)> handler) override;
+  void setExportedObject(std::shared_ptr<IPCExportedObject> object) override {
+    _router.setExportedObject(std::move(object));
+  }
+  void setInterruptionHandler(std::function<void()> handler) override {
+    _interruptionHandler = std::move(handler);
+  }
+  void setInvalidationHandler(std::function<void()> handler) override {
+    _invalidationHandler = std::move(handler);
+  }
+  void setLossHandler(std::function<void(std::size_t calls)> handler) override {
+    _lossHandler = std::move(handler);
+  }
   void resume() override;
   void invalidate() override;
   void callRemoteObject(IPCOutgoingCall call,
                         const std::function<void(const std::string& error)>& errorHandler) override;
 
  private:
+  using Time = std::chrono::steady_clock::time_point;
+
+  enum class End {
+    HungUp,            ///< the client closed the connection
+    BrokenOff,         ///< in mid-message, by an error, or because the client broke the rules
+    Invalidated,       ///< from this end
+    NotAuthenticated,  ///< before a call could be received
+  };
+
   void run() noexcept;
-  void finish(ConnectionLoop::End how, ConnectionLoop* loop) noexcept;
+  End serve();
+  void sendOutgoing();
+  bool appendCall(const IPCOutgoingCall& call);
+  void wait(Time deadline);
+  std::optional<End> advance();
+  std::optional<End> authenticate();
+  std::optional<End> serveMessages();
+  End closeFor(const char* complaint);
+  End drain();
+  void flush();
+  bool isBackedUp() const noexcept { return _channel.unsentBytes() > 0; }
+
+  void finish(End how) noexcept;
   void callHandler(const std::function<void()>& handler) noexcept;
   void dropHandlers() noexcept;
   void close() noexcept;
@@ -59,14 +100,14 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   // Constant after construction.
   const std::uint64_t _serial;
   const IPCPeer _peer;
-  const ConnectionSettings _settings;
   const std::string _name;
   const std::shared_ptr<ConnectionRegistry> _registry;
-  const std::shared_ptr<Wakeup> _wakeup;
+  const std::shared_ptr<Wakeup> _wakeup = std::make_shared<Wakeup>();
   const std::shared_ptr<Answers> _answers;
 
   // Synchronised by themselves.
   Outbox _outbox;
+  std::atomic<bool> _started{false};
   std::atomic<bool> _invalidated{false};
   std::atomic<bool> _counted{true};
 
@@ -77,8 +118,15 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   std::function<void()> _invalidationHandler;
   std::function<void(std::size_t)> _lossHandler;
 
-  Mutex _mutex;
-  bool _started VESK_GUARDED_BY(_mutex) = false;
+  // The thread's.
+  CallWriter _writer;
+  SaslServer _sasl;
+  Channel _channel;
+  std::uint32_t _lastSerial = 0;
+  bool _isReady = false;   // the client has authenticated itself and begun
+  bool _hasMore = false;   // messages have come that are not served yet
+  bool _peerGone = false;  // nothing can be sent any more
+  WarningBurst _brokenMessages;
 };
 
 }  // namespace vesk

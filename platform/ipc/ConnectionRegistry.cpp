@@ -1,94 +1,119 @@
 #include "platform/ipc/ConnectionRegistry.h"
 
+#include <pthread.h>
+
+#include <algorithm>
+#include <system_error>
+
 namespace vesk {
 
-ConnectionRegistry::Admission ConnectionRegistry::admit(uid_t user) {
+namespace {
+
+constexpr std::size_t kKeptForRoot = 16;
+
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+#define VESK_LARGE_FRAMES 1
+#elif defined(__has_feature)
+#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer)
+#define VESK_LARGE_FRAMES 1
+#endif
+#endif
+
+// A value nested to the limit, decoded and written as JSON, takes about 100 KiB. std::thread gives no say in
+// the size, and a thousand idle connections should not reserve eight gigabytes.
+#ifdef VESK_LARGE_FRAMES
+constexpr std::size_t kStackSize = std::size_t{4} << 20;
+#else
+constexpr std::size_t kStackSize = std::size_t{512} << 10;
+#endif
+
+void* run(void* argument) {
+  std::unique_ptr<std::function<void()>> body(static_cast<std::function<void()>*>(argument));
+  pthread_setname_np(pthread_self(), "vesk-connection");
+  (*body)();
+  return nullptr;
+}
+
+void startDetached(std::function<void()> body) {
+  auto argument = std::make_unique<std::function<void()>>(std::move(body));
+  pthread_attr_t attributes;
+  pthread_t thread;
+  int error = pthread_attr_init(&attributes);
+  if (error == 0) {
+    pthread_attr_setstacksize(&attributes, kStackSize);
+    pthread_attr_setdetachstate(&attributes, PTHREAD_CREATE_DETACHED);
+    error = pthread_create(&thread, &attributes, run, argument.get());
+    pthread_attr_destroy(&attributes);
+  }
+  if (error != 0) throw std::system_error(error, std::generic_category(), "A thread can't be started");
+  static_cast<void>(argument.release());
+}
+
+}  // namespace
+
+ConnectionRegistry::Admission ConnectionRegistry::admit(std::uint64_t serial, uid_t user) {
+  const std::size_t kept = user == 0 ? 0 : std::min(kKeptForRoot, options.maximumConnections / 8);
   MutexLock lock(_mutex);
-  if (_count >= (user == 0 ? _maximum : _maximumOfOthers)) return Admission::TooMany;
-  auto& ofUser = _countOfUser[user];
-  if (ofUser >= _maximumPerUser) return Admission::TooManyOfUser;
-  ++ofUser;
-  ++_count;
+  if (_entries.size() >= options.maximumConnections - kept) return Admission::TooMany;
+  auto isUsers = [user](const auto& entry) { return entry.second.user == user; };
+  const auto ofUser = std::count_if(_entries.begin(), _entries.end(), isUsers);
+  if (static_cast<std::size_t>(ofUser) >= options.maximumConnectionsPerUser) return Admission::TooManyOfUser;
+  _entries.emplace(serial, Entry{user, {}});
   return Admission::Admitted;
 }
 
-void ConnectionRegistry::release(uid_t user) noexcept {
+void ConnectionRegistry::release(std::uint64_t serial) noexcept {
   MutexLock lock(_mutex);
-  auto ofUser = _countOfUser.find(user);
-  if (ofUser == _countOfUser.end()) return;
-  if (--ofUser->second == 0) _countOfUser.erase(ofUser);
-  --_count;
+  _entries.erase(serial);
 }
 
 std::size_t ConnectionRegistry::count() const {
   MutexLock lock(_mutex);
-  return _count;
+  return _entries.size();
 }
 
 void ConnectionRegistry::add(std::uint64_t serial, std::weak_ptr<BusConnection> connection) {
   MutexLock lock(_mutex);
-  _connections.emplace(serial, std::move(connection));
-}
-
-void ConnectionRegistry::remove(std::uint64_t serial) noexcept {
-  MutexLock lock(_mutex);
-  _connections.erase(serial);
+  _entries.at(serial).connection = std::move(connection);
 }
 
 std::vector<std::shared_ptr<BusConnection>> ConnectionRegistry::connections() const {
   std::vector<std::shared_ptr<BusConnection>> alive;
   MutexLock lock(_mutex);
-  for (const auto& [serial, connection] : _connections) {
-    if (auto held = connection.lock()) alive.push_back(std::move(held));
+  for (const auto& [serial, entry] : _entries) {
+    if (auto held = entry.connection.lock()) alive.push_back(std::move(held));
   }
   return alive;
 }
 
 void ConnectionRegistry::launch(std::function<void()> body) {
-  MutexLock lock(_mutex);
-  std::uint64_t number = ++_lastThread;
-  // Holding the lock keeps the new thread from ending before it is listed.
-  auto& place = _running[number];
+  {
+    MutexLock lock(_mutex);
+    ++_running;
+  }
   try {
-    place = SmallThread("vesk-connection", [this, number, body = std::move(body)]() mutable {
+    startDetached([self = shared_from_this(), body = std::move(body)]() mutable {
       body();
       body = nullptr;  // what it holds goes before the thread counts as ended
-      finish(number);
+      self->finish();
     });
   } catch (...) {
-    _running.erase(number);
+    finish();
     throw;
   }
 }
 
-void ConnectionRegistry::finish(std::uint64_t thread) noexcept {
+void ConnectionRegistry::finish() noexcept {
   MutexLock lock(_mutex);
-  // Moving the node allocates nothing.
-  _ended.insert(_running.extract(thread));
-  if (_running.empty()) _noneRuns.notify_all();
-  _threadEnded.signal();
-}
-
-void ConnectionRegistry::reap() {
-  _threadEnded.clear();
-  std::map<std::uint64_t, SmallThread> ended;
-  {
-    MutexLock lock(_mutex);
-    ended.swap(_ended);
-  }
+  if (--_running == 0) _noneRuns.notify_all();
 }
 
 bool ConnectionRegistry::waitForThreads(std::chrono::steady_clock::time_point deadline) {
-  bool haveEnded = true;
-  {
-    MutexLock lock(_mutex);
-    while (!_running.empty() && haveEnded) {
-      haveEnded = _noneRuns.wait_until(_mutex, deadline) == std::cv_status::no_timeout;
-    }
-    haveEnded = _running.empty();
+  MutexLock lock(_mutex);
+  while (_running > 0) {
+    if (_noneRuns.wait_until(_mutex, deadline) == std::cv_status::timeout) return _running == 0;
   }
-  reap();
-  return haveEnded;
+  return true;
 }
 
 }  // namespace vesk

@@ -4,18 +4,13 @@
 #include <poll.h>
 #include <sys/eventfd.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
 
-#include <atomic>
 #include <cerrno>
 #include <system_error>
 
 #include "platform/ipc/BusConnection.h"
 #include "platform/ipc/ConnectionRegistry.h"
-#include "platform/ipc/SmallThread.h"
 #include "platform/ipc/UnixSocket.h"
-#include "platform/ipc/Wakeup.h"
-#include "platform/ipc/WarningBurst.h"
 #include "platform/ipc/WireFormat.h"
 #include "platform/log/SystemLog.h"
 
@@ -46,60 +41,25 @@ FileDescriptor checkedInherited(FileDescriptor socket) {
 
 }  // namespace
 
-class IPCListener::Implementation {
- public:
-  explicit Implementation(Options options);
-  ~Implementation() { stop(std::chrono::steady_clock::time_point::max()); }
-
-  void setDelegate(IPCListenerDelegate* delegate) { _delegate = delegate; }
-  void resume();
-  bool stop(std::chrono::steady_clock::time_point deadline);
-  std::size_t connectionCount() const { return _registry->count(); }
-
- private:
-  enum class Accepted { Yes, NoneWaiting, NoRoom };
-
-  void run();
-  Accepted acceptOne();
-  Accepted refuseForWantOfDescriptors();
-  void admit(FileDescriptor socket);
-  void introduce(FileDescriptor socket, const IPCPeer& peer);
-  void removeSocket();
-
-  const ConnectionSettings _settings;
-  const std::string _madePath;  // empty for an inherited socket
-  const std::shared_ptr<ConnectionRegistry> _registry;
-  FileDescriptor _listening;
-  FileDescriptor _reserve =
-      anyDescriptor();  // given up to accept, and close, a connection without any to spare
-  struct stat _madeSocket {};
-  Wakeup _wakeup;
-  std::atomic<bool> _stopping{false};
-  IPCListenerDelegate* _delegate = nullptr;
-  WarningBurst _refusals;
-  SmallThread _thread;
-};
-
-IPCListener::Implementation::Implementation(Options options)
-    : _settings{options.objectPath, options.maximumMessage, options.maximumOutbox,
-                options.authenticationTimeout},
-      _madePath(options.inherited ? std::string() : options.socketPath),
-      _registry(std::make_shared<ConnectionRegistry>(options.maximumConnections,
-                                                     options.maximumConnectionsPerUser)),
+IPCListener::IPCListener(Options options)
+    : _madePath(options.inherited ? std::string() : options.socketPath),
       _listening(options.inherited ? checkedInherited(std::move(options.inherited))
-                                   : listenOnUnixSocket(options.socketPath)) {
+                                   : listenOnUnixSocket(options.socketPath)),
+      _registry(std::make_shared<ConnectionRegistry>(std::move(options))),
+      _reserve(anyDescriptor()) {
   if (!_madePath.empty()) ::stat(_madePath.c_str(), &_madeSocket);
 }
 
-void IPCListener::Implementation::resume() {
-  if (_stopping || _thread.isJoinable()) return;
-  _thread = SmallThread("vesk-listener", [this] { run(); });
+void IPCListener::resume() {
+  if (_stopping || _thread.joinable()) return;
+  _thread = std::thread([this] { run(); });
+  pthread_setname_np(_thread.native_handle(), "vesk-listener");
 }
 
-bool IPCListener::Implementation::stop(std::chrono::steady_clock::time_point deadline) {
+bool IPCListener::stop(std::chrono::steady_clock::time_point deadline) {
   _stopping = true;
   _wakeup.signal();
-  _thread.join();
+  if (_thread.joinable()) _thread.join();
   removeSocket();
   _listening.reset();
   for (const auto& connection : _registry->connections()) connection->end();
@@ -107,29 +67,27 @@ bool IPCListener::Implementation::stop(std::chrono::steady_clock::time_point dea
 }
 
 /// Only the socket that this listener has made: another daemon may have taken the path over.
-void IPCListener::Implementation::removeSocket() {
+void IPCListener::removeSocket() {
   struct stat now {};
   if (!_listening || _madePath.empty() || ::lstat(_madePath.c_str(), &now) != 0) return;
   if (now.st_dev == _madeSocket.st_dev && now.st_ino == _madeSocket.st_ino) ::unlink(_madePath.c_str());
 }
 
-void IPCListener::Implementation::run() {
+void IPCListener::run() {
   bool pause = false;
   while (!_stopping) {
     pollfd polls[] = {
         {_listening.get(), static_cast<short>(pause ? 0 : POLLIN), 0},
         {_wakeup.fd(), POLLIN, 0},
-        {_registry->threadEnded().fd(), POLLIN, 0},
     };
-    ::poll(polls, 3, pause ? kPauseMilliseconds : -1);
-    if (polls[2].revents) _registry->reap();
+    ::poll(polls, 2, pause ? kPauseMilliseconds : -1);
     auto accepted = Accepted::Yes;
     while (!_stopping && accepted == Accepted::Yes) accepted = acceptOne();
     pause = accepted == Accepted::NoRoom;
   }
 }
 
-IPCListener::Implementation::Accepted IPCListener::Implementation::acceptOne() {
+IPCListener::Accepted IPCListener::acceptOne() {
   FileDescriptor socket(::accept4(_listening.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
   if (socket) {
     admit(std::move(socket));
@@ -149,7 +107,7 @@ IPCListener::Implementation::Accepted IPCListener::Implementation::acceptOne() {
   }
 }
 
-IPCListener::Implementation::Accepted IPCListener::Implementation::refuseForWantOfDescriptors() {
+IPCListener::Accepted IPCListener::refuseForWantOfDescriptors() {
   _reserve.reset();
   FileDescriptor socket(::accept4(_listening.get(), nullptr, nullptr, SOCK_CLOEXEC));
   bool refused = static_cast<bool>(socket);
@@ -159,7 +117,7 @@ IPCListener::Implementation::Accepted IPCListener::Implementation::refuseForWant
   return refused ? Accepted::Yes : Accepted::NoRoom;
 }
 
-void IPCListener::Implementation::admit(FileDescriptor socket) {
+void IPCListener::admit(FileDescriptor socket) {
   IPCPeer peer;
   try {
     peer = peerOfSocket(socket.get());
@@ -167,8 +125,10 @@ void IPCListener::Implementation::admit(FileDescriptor socket) {
     VESK_LOG_WARNING("ipc: Refused a connection: %s", error.what());
     return;
   }
-  auto admission = _registry->admit(peer.user);
-  if (admission == ConnectionRegistry::Admission::Admitted) return introduce(std::move(socket), peer);
+  static std::atomic<std::uint64_t> lastSerial{0};
+  const std::uint64_t serial = ++lastSerial;
+  const auto admission = _registry->admit(serial, peer.user);
+  if (admission == ConnectionRegistry::Admission::Admitted) return introduce(std::move(socket), serial, peer);
   // It never blocks: the socket is new, and a line fits.
   const std::string line = std::string(kTooManyConnections) + "\r\n";
   ::send(socket.get(), line.data(), line.size(), MSG_NOSIGNAL | MSG_DONTWAIT);
@@ -178,37 +138,18 @@ void IPCListener::Implementation::admit(FileDescriptor socket) {
   }
 }
 
-void IPCListener::Implementation::introduce(FileDescriptor socket, const IPCPeer& peer) {
+void IPCListener::introduce(FileDescriptor socket, std::uint64_t serial, const IPCPeer& peer) {
   std::shared_ptr<BusConnection> connection;
   try {
-    connection = std::make_shared<BusConnection>(std::move(socket), peer, _settings, _registry);
-    _registry->add(connection->serial(), connection);
+    connection = std::make_shared<BusConnection>(std::move(socket), serial, peer, _registry);
+    _registry->add(serial, connection);
     if (!_delegate || !_delegate->shouldAcceptNewConnection(connection)) connection->end();
   } catch (const std::exception& error) {
     VESK_LOG_ERROR("ipc: Refused a connection: %s", error.what());
-    if (connection) {
-      connection->end();
-    } else {
-      _registry->release(peer.user);
-    }
+    connection ? connection->end() : _registry->release(serial);
   }
 }
 
-IPCListener::IPCListener(Options options)
-    : _implementation(std::make_unique<Implementation>(std::move(options))) {}
-
-IPCListener::~IPCListener() = default;
-
-void IPCListener::setDelegate(IPCListenerDelegate* delegate) { _implementation->setDelegate(delegate); }
-
-void IPCListener::resume() { _implementation->resume(); }
-
-void IPCListener::stop() { _implementation->stop(std::chrono::steady_clock::time_point::max()); }
-
-bool IPCListener::stopWithin(std::chrono::milliseconds patience) {
-  return _implementation->stop(std::chrono::steady_clock::now() + patience);
-}
-
-std::size_t IPCListener::connectionCount() const { return _implementation->connectionCount(); }
+std::size_t IPCListener::connectionCount() const { return _registry->count(); }
 
 }  // namespace vesk

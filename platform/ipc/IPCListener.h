@@ -1,15 +1,23 @@
 // Accepts clients on the daemon's Unix socket.
 #pragma once
 
+#include <sys/stat.h>
+
+#include <atomic>
 #include <chrono>
 #include <cstddef>
 #include <memory>
 #include <string>
+#include <thread>
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/ipc/IPCConnection.h"
+#include "platform/ipc/Wakeup.h"
+#include "platform/ipc/WarningBurst.h"
 
 namespace vesk {
+
+class ConnectionRegistry;
 
 class IPCListenerDelegate {
  public:
@@ -35,25 +43,45 @@ class IPCListener {
   /// Binds the socket. Throws std::system_error when it can't.
   explicit IPCListener(Options options);
   /// As `stop`.
-  ~IPCListener();
+  ~IPCListener() { stop(); }
 
   /// Not owned; outlives the listener. Set before `resume`.
-  void setDelegate(IPCListenerDelegate* delegate);
+  void setDelegate(IPCListenerDelegate* delegate) { _delegate = delegate; }
   /// Begins to accept, on the listener's own thread.
   void resume();
   /// No further connection is accepted; those that are open get invalidated, and this waits until every
   /// connection's thread has ended (invalidation handlers included). Safe before `resume` and twice; not from
   /// a connection's thread.
-  void stop();
+  void stop() { stop(std::chrono::steady_clock::time_point::max()); }
   /// The same, but waits no longer than that. False when a thread still runs: then neither this nor what its
   /// handlers use may be destroyed.
-  [[nodiscard]] bool stopWithin(std::chrono::milliseconds patience);
+  [[nodiscard]] bool stopWithin(std::chrono::milliseconds patience) {
+    return stop(std::chrono::steady_clock::now() + patience);
+  }
 
   std::size_t connectionCount() const;
 
  private:
-  class Implementation;
-  std::unique_ptr<Implementation> _implementation;
+  enum class Accepted { Yes, NoneWaiting, NoRoom };
+
+  bool stop(std::chrono::steady_clock::time_point deadline);
+  void run();
+  Accepted acceptOne();
+  Accepted refuseForWantOfDescriptors();
+  void admit(FileDescriptor socket);
+  void introduce(FileDescriptor socket, std::uint64_t serial, const IPCPeer& peer);
+  void removeSocket();
+
+  const std::string _madePath;  // empty for an inherited socket
+  struct stat _madeSocket {};
+  FileDescriptor _listening;
+  const std::shared_ptr<ConnectionRegistry> _registry;
+  FileDescriptor _reserve;  // given up to accept, and close, a connection without any to spare
+  Wakeup _wakeup;
+  std::atomic<bool> _stopping{false};
+  IPCListenerDelegate* _delegate = nullptr;
+  WarningBurst _refusals;
+  std::thread _thread;
 };
 
 }  // namespace vesk
