@@ -6,98 +6,76 @@ namespace vesk {
 
 namespace {
 
-struct Memory {
-  static constexpr std::size_t kCall = sizeof(IPCOutgoingCall);
-  static constexpr std::size_t kArgument = sizeof(IPCArgument);
-  static constexpr std::size_t kText = sizeof(std::string);
+/// What a call's arguments come to: as they are held, and as the writer counts them.
+struct Size {
+  std::size_t memory = 0;
+  std::size_t content = 0;
+  std::size_t nodes = 0;
+  bool isMemoryOnly = false;
 
-  static std::size_t ofText(const std::string& text) noexcept { return text.size(); }
-  static std::size_t of(const Value& value) noexcept { return approximateMemory(value); }
-  static std::size_t of(const Dictionary& dictionary) noexcept { return approximateMemory(dictionary); }
-};
-
-struct Content {
-  static constexpr std::size_t kCall = sizeof(IPCOutgoingCall);
-  static constexpr std::size_t kArgument = kNodeContent;
-  static constexpr std::size_t kText = kNodeContent;
-
-  static std::size_t ofText(const std::string& text) noexcept { return text.size(); }
-  static std::size_t of(const Value& value) noexcept {
-    std::size_t size = kNodeContent;
-    if (const Text* text = value.text()) size += text->size();
-    if (const Bytes* bytes = value.bytes()) size += bytes->size();
-    if (const Dictionary* dictionary = value.dictionary()) size += of(*dictionary);
+  void count(std::size_t size) {
+    ++nodes;
+    content += size;
+  }
+  void contents(const Value& value) {
+    count(kNodeContent);
+    if (const Text* text = value.text()) count(text->size());
+    if (const Bytes* bytes = value.bytes()) count(bytes->size());
+    if (const Dictionary* dictionary = value.dictionary()) contents(*dictionary);
     if (const List* list = value.list()) {
-      size += kNodeContent;
-      for (const Value& item : *list) size += of(item);
+      count(kNodeContent);
+      for (const Value& item : *list) contents(item);
     }
-    return size;
   }
-  static std::size_t of(const Dictionary& dictionary) noexcept {
-    std::size_t size = kNodeContent;
-    for (const auto& entry : dictionary) size += entry.key.size() + of(entry.value);
-    return size;
-  }
-};
-
-struct Nodes {
-  static constexpr std::size_t kCall = 0;
-  static constexpr std::size_t kArgument = 0;
-  static constexpr std::size_t kText = 0;
-
-  static std::size_t ofText(const std::string&) noexcept { return 1; }
-  static std::size_t of(const Value& value) noexcept {
-    if (const Dictionary* dictionary = value.dictionary()) return 1 + of(*dictionary);
-    std::size_t count = value.text() || value.bytes() ? 2 : 1;
-    if (const List* list = value.list()) {
-      ++count;
-      for (const Value& item : *list) count += of(item);
+  void contents(const Dictionary& dictionary) {
+    count(kNodeContent);
+    for (const auto& entry : dictionary) {
+      count(entry.key.size());
+      contents(entry.value);
     }
-    return count;
   }
-  static std::size_t of(const Dictionary& dictionary) noexcept {
-    std::size_t count = 1;
-    for (const auto& entry : dictionary) count += 1 + of(entry.value);
-    return count;
-  }
-};
 
-/// What an argument comes to besides `Measure::kArgument`.
-template <class Measure>
-struct ArgumentSize {
-  std::size_t operator()(const std::string& text) const noexcept { return Measure::ofText(text); }
-  std::size_t operator()(const Dictionary& dictionary) const noexcept { return Measure::of(dictionary); }
-  std::size_t operator()(const List& list) const noexcept { return Measure::of(Value(list)); }
-  std::size_t operator()(const std::vector<std::string>& texts) const noexcept {
-    std::size_t size = 0;
-    for (const auto& text : texts) size += Measure::kText + Measure::ofText(text);
-    return size;
+  void add(const std::string& text) {
+    memory += text.size();
+    count(text.size());
+  }
+  void add(const Dictionary& dictionary) {
+    memory += approximateMemory(dictionary);
+    if (!isMemoryOnly) contents(dictionary);
+  }
+  void add(const List& list) {
+    memory += approximateMemory(Value(list));
+    if (!isMemoryOnly) contents(Value(list));
+  }
+  void add(const std::vector<std::string>& texts) {
+    memory += texts.size() * sizeof(std::string);
+    content += texts.size() * kNodeContent;
+    for (const auto& text : texts) add(text);
   }
   template <class T>
-  std::size_t operator()(const std::optional<T>& argument) const noexcept {
-    return argument ? (*this)(*argument) : 0;
+  void add(const std::optional<T>& argument) {
+    if (argument) add(*argument);
   }
-  std::size_t operator()(bool) const noexcept { return 0; }
-  std::size_t operator()(std::uint16_t) const noexcept { return 0; }
-  std::size_t operator()(double) const noexcept { return 0; }
-  std::size_t operator()(IPCDescriptor) const noexcept { return 0; }
+  template <class Fixed>
+  void add(const Fixed&) {}  // a number or a descriptor
 };
 
-template <class Measure>
-std::size_t sizeOf(const IPCOutgoingCall& call) noexcept {
-  std::size_t size = Measure::kCall;
-  for (const auto& argument : call.arguments) {
-    size += Measure::kArgument + std::visit(ArgumentSize<Measure>{}, argument);
-  }
+Size sizeOf(const IPCOutgoingCall& call, bool isMemoryOnly) {
+  const std::size_t arguments = call.arguments.size();
+  Size size{.memory = sizeof call + arguments * sizeof(IPCArgument),
+            .content = sizeof call + arguments * kNodeContent,
+            .isMemoryOnly = isMemoryOnly};
+  for (const auto& argument : call.arguments) std::visit([&](const auto& held) { size.add(held); }, argument);
   return size;
 }
 
 }  // namespace
 
-std::size_t approximateMemory(const IPCOutgoingCall& call) noexcept { return sizeOf<Memory>(call); }
+std::size_t approximateMemory(const IPCOutgoingCall& call) noexcept { return sizeOf(call, true).memory; }
 
 bool isTooLarge(const IPCOutgoingCall& call, const CodecLimits& limits) noexcept {
-  return sizeOf<Content>(call) > limits.content || sizeOf<Nodes>(call) > limits.nodes;
+  const Size size = sizeOf(call, false);
+  return size.content > limits.content || size.nodes > limits.nodes;
 }
 
 }  // namespace vesk

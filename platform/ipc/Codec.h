@@ -24,8 +24,7 @@ enum class CodecResult {
   Ok,
   WrongType,      ///< the arguments are not of the types asked for, or hold a type that no value has
   LimitExceeded,  ///< too deep, too many values or too large
-  Malformed,      ///< bytes that break the format, or text that is not UTF-8 or holds a NUL
-  OutOfResources  ///< no descriptor was left to send them with
+  Malformed       ///< bytes that break the format, or text that is not UTF-8 or holds a NUL
 };
 
 /// For a person; a constant.

@@ -3,6 +3,7 @@
 #include <cstring>
 #include <iterator>
 #include <optional>
+#include <type_traits>
 
 #include "platform/unicode/UTF8.h"
 
@@ -13,6 +14,9 @@ namespace {
 // In the order of IPCArgument's alternatives.
 constexpr const char* kSignatures[] = {"b", "q", "d", "s", "a{sv}", "av", "aa{sv}", "as", "as", "aas", "ah"};
 static_assert(std::size(kSignatures) == std::variant_size_v<IPCArgument>);
+
+// Of a value's variant, in the order of Value::Kind. The empty signature is the null marker.
+constexpr const char* kValueSignatures[] = {"g", "b", "x", "t", "d", "s", "ay", "(d)", "av", "a{sv}"};
 
 /// Appends values under D-Bus's alignment, which counts from where it begins.
 class Writer {
@@ -40,24 +44,43 @@ class Writer {
     _out.append(text).push_back('\0');
   }
 
-  // Arguments, each as its type says.
+  // Each as its type says.
+  template <class Number>
+  requires std::is_arithmetic_v<Number>
+  void add(Number value) { number(value); }
   void add(bool value) { number(std::uint32_t{value}); }
-  void add(std::uint16_t value) { number(value); }
-  void add(double value) { number(value); }
-  void add(std::string_view text) {
-    if (!count(text.size())) return;
-    if (!isValidUTF8(text, false)) return fail(CodecResult::Malformed);
-    rawText(text);
+  void add(std::monostate) { signature(""); }
+  void add(const Text& text) { addText(text.view()); }
+  void add(const std::string& text) { addText(text); }
+  void add(const Bytes& bytes) {
+    if (!count(bytes.size())) return;
+    number(static_cast<std::uint32_t>(bytes.size()));
+    _out.append(bytes.view());
   }
-  void add(const std::string& text) { add(std::string_view(text)); }
-  void add(const std::vector<std::string>& texts) {
-    array(4, [&] {
-      for (const auto& text : texts) add(std::string_view(text));
+  void add(Date date) {
+    align(8);
+    number(date.secondsSince1970);
+  }
+  void add(const Value& value) {  // as a variant
+    if (!count(kNodeContent)) return;
+    signature(kValueSignatures[static_cast<std::size_t>(value.kind())]);
+    value.visit([this](const auto& held) { add(held); });
+  }
+  void add(const Dictionary& dictionary) {
+    nested(8, 2, dictionary, [this](const DictionaryEntry& entry) {  // entry and variant
+      align(8);
+      add(entry.key);
+      add(entry.value);
     });
   }
-  void add(const Dictionary& dictionary);
-  void add(const List& list);
-  void add(const Value& value);
+  void add(const List& list) {
+    nested(1, 1, list, [this](const Value& item) { add(item); });  // variant
+  }
+  void add(const std::vector<std::string>& texts) {
+    array(4, [&] {
+      for (const auto& text : texts) addText(text);
+    });
+  }
   template <class T>
   void add(const std::optional<T>& value) {
     array(4, [&] {
@@ -84,19 +107,27 @@ class Writer {
     --_containers;
   }
 
-  /// An array whose elements open `containers` each, besides those that they open themselves.
-  template <class Contents>
-  void nested(std::size_t alignment, std::size_t containers, const Contents& contents) {
+  /// An array of values whose elements open `containers` each, besides those that they open themselves.
+  template <class Elements, class AddOne>
+  void nested(std::size_t alignment, std::size_t containers, const Elements& elements, const AddOne& addOne) {
     if (!count(kNodeContent)) return;
     array(alignment, [&] {
       _containers += containers;
       if (++_depth > _limits.depth || _containers > kMaximumContainers) fail(CodecResult::LimitExceeded);
-      if (_result == CodecResult::Ok) contents();
+      for (const auto& element : elements) {
+        if (_result != CodecResult::Ok) break;
+        addOne(element);
+      }
       --_depth;
       _containers -= containers;
     });
   }
 
+  void addText(std::string_view text) {
+    if (!count(text.size())) return;
+    if (!isValidUTF8(text, false)) return fail(CodecResult::Malformed);
+    rawText(text);
+  }
   bool count(std::size_t content) {
     if (_result != CodecResult::Ok) return false;
     _content += content;
@@ -119,87 +150,17 @@ class Writer {
   CodecResult _result = CodecResult::Ok;
 };
 
-void Writer::add(const Dictionary& dictionary) {
-  nested(8, 2, [&] {  // entry and variant
-    for (const auto& entry : dictionary) {
-      align(8);
-      add(entry.key.view());
-      add(entry.value);
-      if (_result != CodecResult::Ok) return;
-    }
-  });
-}
-
-void Writer::add(const List& list) {
-  nested(1, 1, [&] {  // variant
-    for (const auto& item : list) {
-      add(item);
-      if (_result != CodecResult::Ok) return;
-    }
-  });
-}
-
-/// As a variant.
-void Writer::add(const Value& value) {
-  if (!count(kNodeContent)) return;
-  switch (value.kind()) {
-    case Value::Kind::None:
-      signature("g");
-      return signature("");
-    case Value::Kind::Boolean:
-      signature("b");
-      return add(*value.boolean());
-    case Value::Kind::Signed:
-      signature("x");
-      return number(*value.signedInteger());
-    case Value::Kind::Unsigned:
-      signature("t");
-      return number(*value.unsignedInteger());
-    case Value::Kind::Double:
-      signature("d");
-      return number(*value.real());
-    case Value::Kind::Text:
-      signature("s");
-      return add(value.text()->view());
-    case Value::Kind::Bytes: {
-      const auto bytes = value.bytes()->view();
-      if (!count(bytes.size())) return;
-      signature("ay");
-      number(static_cast<std::uint32_t>(bytes.size()));
-      _out.append(bytes);
-      return;
-    }
-    case Value::Kind::Date:
-      signature("(d)");
-      align(8);
-      return number(value.date()->secondsSince1970);
-    case Value::Kind::List:
-      signature("av");
-      return add(*value.list());
-    case Value::Kind::Dictionary:
-      signature("a{sv}");
-      return add(*value.dictionary());
-  }
-}
-
-void addField(Writer& writer, HeaderField field, const char* type, std::string_view value) {
-  if (value.empty()) return;
+template <class T>
+void addField(Writer& writer, HeaderField field, const char* type, T value) {
+  if (value == T{}) return;
   writer.align(8);
   writer.byte(static_cast<char>(field));
   writer.signature(type);
-  if (field == kSignature) {
-    writer.signature(value);
+  if constexpr (std::is_integral_v<T>) {
+    writer.number(value);
   } else {
-    writer.rawText(value);
+    *type == 'g' ? writer.signature(value) : writer.rawText(value);
   }
-}
-
-void addField(Writer& writer, HeaderField field, std::uint32_t value) {
-  if (value == 0) return;
-  writer.align(8);
-  writer.byte(static_cast<char>(field));
-  writer.signature("u");
-  writer.number(value);
 }
 
 std::uint32_t descriptorsAmong(const std::vector<IPCArgument>& arguments) {
@@ -225,9 +186,9 @@ void appendHeader(const OutgoingHeader& header, std::string_view signature, std:
   addField(writer, kInterface, "s", header.interfaceName);
   addField(writer, kMember, "s", header.member);
   addField(writer, kErrorName, "s", header.errorName);
-  addField(writer, kReplySerial, header.replySerial);
+  addField(writer, kReplySerial, "u", header.replySerial);
   addField(writer, kSignature, "g", signature);
-  addField(writer, kUnixDescriptors, descriptors);
+  addField(writer, kUnixDescriptors, "u", descriptors);
   const auto size = static_cast<std::uint32_t>(out.size() - begin);
   std::memcpy(out.data() + begin - sizeof size, &size, sizeof size);
   writer.align(8);
@@ -270,19 +231,11 @@ CodecResult wholeOrNothing(std::string& out, const Append& append) {
 }  // namespace
 
 const char* describe(CodecResult result) noexcept {
-  switch (result) {
-    case CodecResult::Ok:
-      return "no error";
-    case CodecResult::WrongType:
-      return "an argument is of the wrong type";
-    case CodecResult::LimitExceeded:
-      return "the arguments are too deep, too many or too large";
-    case CodecResult::Malformed:
-      return "the arguments are malformed";
-    case CodecResult::OutOfResources:
-      return "no descriptor is left for the arguments";
-  }
-  return "unknown error";
+  // In the order of CodecResult.
+  constexpr const char* kTexts[] = {"no error", "an argument is of the wrong type",
+                                    "the arguments are too deep, too many or too large",
+                                    "the arguments are malformed"};
+  return kTexts[static_cast<std::size_t>(result)];
 }
 
 CodecResult appendMessage(const OutgoingHeader& header, std::uint32_t serial,
@@ -295,32 +248,26 @@ CodecResult appendMessage(const OutgoingHeader& header, std::uint32_t serial,
   });
 }
 
-const std::string& CallWriter::headerFor(const IPCOutgoingCall& call, const std::string& signature) {
+const std::string& CallWriter::headerFor(const IPCOutgoingCall& call) {
+  _signature.clear();
+  appendSignature(call.arguments, _signature);
+  const std::uint32_t descriptors = descriptorsAmong(call.arguments);
   for (const Kept& kept : _kept) {
     if (kept.member == call.member && kept.interfaceName == call.interfaceName &&
-        kept.signature == signature) {
+        kept.descriptors == descriptors && kept.signature == _signature) {
       return kept.bytes;
     }
   }
-  Kept kept{call.interfaceName, call.member, signature, {}};
-  appendHeader({.path = _objectPath, .interfaceName = call.interfaceName, .member = call.member}, signature,
-               0, kept.bytes);
+  Kept kept{call.interfaceName, call.member, descriptors, _signature, {}};
+  appendHeader({.path = _objectPath, .interfaceName = call.interfaceName, .member = call.member}, _signature,
+               descriptors, kept.bytes);
   return _kept.emplace_back(std::move(kept)).bytes;
 }
 
 CodecResult CallWriter::append(const IPCOutgoingCall& call, std::uint32_t serial, bool expectsReply,
                                std::string& out) {
-  if (descriptorsAmong(call.arguments) > 0) {
-    return appendMessage({.expectsReply = expectsReply,
-                          .path = _objectPath,
-                          .interfaceName = call.interfaceName,
-                          .member = call.member},
-                         serial, call.arguments, out);
-  }
   return wholeOrNothing(out, [&](std::size_t start) {
-    _signature.clear();
-    appendSignature(call.arguments, _signature);
-    out += headerFor(call, _signature);
+    out += headerFor(call);
     if (expectsReply) out[start + kFlagsAt] = '\0';
     return appendBody(start, serial, call.arguments, out, {});
   });

@@ -46,11 +46,12 @@ class CallWriter {
   struct Kept {
     const char* interfaceName;
     const char* member;
+    std::uint32_t descriptors;
     std::string signature;
     std::string bytes;  ///< of a one-way call, without body size and serial
   };
 
-  const std::string& headerFor(const IPCOutgoingCall& call, const std::string& signature);
+  const std::string& headerFor(const IPCOutgoingCall& call);
 
   const std::string _objectPath;
   std::vector<Kept> _kept;

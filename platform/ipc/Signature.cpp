@@ -50,27 +50,15 @@ bool isValidSignature(std::string_view signature) noexcept {
 }
 
 std::size_t alignmentOf(char type) noexcept {
-  switch (type) {
-    case 'n':
-    case 'q':
-      return 2;
-    case 'b':
-    case 'i':
-    case 'u':
-    case 's':
-    case 'o':
-    case 'a':
-    case 'h':
-      return 4;
-    case 'x':
-    case 't':
-    case 'd':
-    case '(':
-    case '{':
-      return 8;
-    default:
-      return 1;
+  struct Alignment {
+    std::string_view types;
+    std::size_t bytes;
+  };
+  constexpr Alignment kAlignments[] = {{"nq", 2}, {"biusoah", 4}, {"xtd({", 8}};
+  for (const auto& alignment : kAlignments) {
+    if (alignment.types.find(type) != std::string_view::npos) return alignment.bytes;
   }
+  return 1;
 }
 
 }  // namespace vesk
