@@ -1,6 +1,5 @@
 #include "platform/ipc/Message.h"
 
-#include <algorithm>
 #include <cstring>
 
 #include "platform/ipc/MessageReader.h"
@@ -13,40 +12,36 @@ namespace {
 
 constexpr std::size_t kMaximumName = 255;
 
-bool isNameCharacter(char c, bool isFirst) {
-  return c == '_' || (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z') || (!isFirst && c >= '0' && c <= '9');
-}
-
-/// Characters of a member, or of one element of a longer name.
-bool isElement(std::string_view element, bool mayStartWithDigit = false) {
-  if (element.empty()) return false;
-  for (std::size_t i = 0; i < element.size(); ++i) {
-    if (!isNameCharacter(element[i], i == 0 && !mayStartWithDigit)) return false;
+/// Elements of letters, digits, underscores and `others`; none is empty, and only where `mayStartWithDigit`
+/// does one start with a digit.
+bool areElements(std::string_view name, char separator, bool mayStartWithDigit,
+                 std::string_view others = "") {
+  char before = separator;
+  for (const char c : name) {
+    const bool isFirst = before == separator;
+    const bool isDigit = c >= '0' && c <= '9';
+    const bool isLetter = c == '_' || (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z');
+    const bool isAllowed = isLetter || (isDigit && (mayStartWithDigit || !isFirst)) ||
+                           others.find(c) != others.npos || (c == separator && !isFirst);
+    if (!isAllowed) return false;
+    before = c;
   }
-  return true;
+  return before != separator;
 }
 
-bool isMember(std::string_view name) { return name.size() <= kMaximumName && isElement(name); }
+bool isMember(std::string_view name) {
+  return name.size() <= kMaximumName && name.find('.') == name.npos && areElements(name, '.', false);
+}
 
 /// Of an interface or an error: two elements at least.
 bool isInterface(std::string_view name) {
-  if (name.size() > kMaximumName || name.find('.') == name.npos) return false;
-  for (;;) {
-    const auto dot = name.find('.');
-    if (!isElement(name.substr(0, dot))) return false;
-    if (dot == name.npos) return true;
-    name.remove_prefix(dot + 1);
-  }
+  return name.size() <= kMaximumName && name.find('.') != name.npos && areElements(name, '.', false);
 }
 
 /// As other peers name themselves; messages here need none.
 bool isBusName(std::string_view name) {
-  const bool isUnique = name.starts_with(':');
-  if (isUnique) name.remove_prefix(1);
-  return !name.empty() && name.size() <= kMaximumName && name.find('.') != name.npos &&
-         std::all_of(name.begin(), name.end(),
-                     [](char c) { return c == '.' || c == '-' || isNameCharacter(c, false); }) &&
-         !name.starts_with('.') && !name.ends_with('.') && name.find("..") == name.npos;
+  if (name.starts_with(':')) name.remove_prefix(1);
+  return name.size() <= kMaximumName && name.find('.') != name.npos && areElements(name, '.', true, "-");
 }
 
 /// What a call, an answer, an error or a signal can't do without.
@@ -144,6 +139,10 @@ std::uint32_t numberAt(std::string_view bytes, std::size_t at) noexcept {
 }
 
 }  // namespace
+
+bool isObjectPath(std::string_view path) noexcept {
+  return path == "/" || (path.starts_with('/') && areElements(path.substr(1), '/', true));
+}
 
 std::optional<std::uint64_t> messageSize(std::string_view bytes) noexcept {
   if (bytes[0] != kLittleEndian && bytes[0] != kBigEndian) return std::nullopt;

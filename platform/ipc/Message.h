@@ -44,6 +44,9 @@ struct Message {
   }
 };
 
+/// Whether `path` is a D-Bus object path.
+bool isObjectPath(std::string_view path) noexcept;
+
 /// Size of the message that begins with these bytes (kFixedHeader at least); nothing when they begin none.
 std::optional<std::uint64_t> messageSize(std::string_view bytes) noexcept;
 

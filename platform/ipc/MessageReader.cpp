@@ -22,25 +22,10 @@ std::shared_ptr<const char> sharedCopy(std::string_view body) {
 
 }  // namespace
 
-bool isObjectPath(std::string_view path) noexcept {
-  if (path == "/") return true;
-  if (!path.starts_with('/') || path.ends_with('/')) return false;
-  for (std::size_t i = 1; i < path.size(); ++i) {
-    const char c = path[i];
-    const bool isWord =
-        c == '_' || (c >= '0' && c <= '9') || (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z');
-    if (!isWord && (c != '/' || path[i - 1] == '/')) return false;
-  }
-  return true;
-}
-
 MessageReader::MessageReader(const Message& message, CodecLimits limits)
-    : MessageReader(message.body, sharedCopy(message.body), message, limits) {}
-
-MessageReader::MessageReader(std::string_view body, std::shared_ptr<const char> owner, const Message& message,
-                             CodecLimits limits) noexcept
-    : _owner(std::move(owner)),
-      _cursor(_owner ? std::string_view(_owner.get(), body.size()) : body, message.header->isBigEndian),
+    : _owner(sharedCopy(message.body)),
+      _cursor(_owner ? std::string_view(_owner.get(), message.body.size()) : message.body,
+              message.header->isBigEndian),
       _types(message.header->signature),
       _limits(limits) {}
 
@@ -71,35 +56,6 @@ bool MessageReader::enter() noexcept {
   return ++_containers <= kMaximumContainers || fail(CodecResult::LimitExceeded);
 }
 
-/// `elements` reads up to the end that it is given.
-template <class Elements>
-bool MessageReader::array(std::size_t alignment, const Elements& elements) {
-  std::uint32_t size = 0;
-  if (!enter() || !found(_cursor.number(size) && _cursor.align(alignment) && size <= _cursor.left())) {
-    return false;
-  }
-  const std::size_t end = _cursor.position() + size;
-  if (!elements(end) || !found(_cursor.position() == end)) return false;
-  --_containers;
-  return true;
-}
-
-template <class T, class One>
-bool MessageReader::atMostOne(std::size_t alignment, std::optional<T>& out, const One& readOne) {
-  out.reset();
-  return array(alignment, [&](std::size_t end) {
-    if (_cursor.position() < end && !readOne(out.emplace())) return false;
-    return _cursor.position() >= end || fail(CodecResult::WrongType);
-  });
-}
-
-bool MessageReader::boolean(bool& out) {
-  std::uint32_t value = 0;
-  if (!found(_cursor.number(value) && value <= 1)) return false;
-  out = value == 1;
-  return true;
-}
-
 /// Valid UTF-8 without NUL; counted, but not as a node.
 bool MessageReader::text(std::string_view& out) {
   return found(_cursor.text(out) && isValidUTF8(out, false)) && count(out.size());
@@ -112,41 +68,16 @@ Text MessageReader::kept(std::string_view text) {
 
 // --- Arguments
 
-bool MessageReader::read(bool& out) { return take("b") && boolean(out); }
-bool MessageReader::read(std::uint16_t& out) { return take("q") && found(_cursor.number(out)); }
-bool MessageReader::read(double& out) { return take("d") && found(_cursor.number(out)); }
-bool MessageReader::read(std::string& out) { return take("s") && stringArgument(out); }
-bool MessageReader::read(Dictionary& out) { return take("a{sv}") && dictionary("v", out); }
-
 bool MessageReader::read(List& out) {
-  const auto type = _types.substr(0, completeTypeLength(_types));
+  const auto type = nextType();
   if (!type.starts_with('a')) return fail(CodecResult::WrongType);
   return take(type) && list(type.substr(1), out);
 }
 
 bool MessageReader::read(Value& out) {
-  const auto type = _types.substr(0, completeTypeLength(_types));
+  const auto type = nextType();
   if (type.empty()) return fail(CodecResult::WrongType);
   return take(type) && value(type, out);
-}
-
-bool MessageReader::read(std::optional<Dictionary>& out) {
-  return take("aa{sv}") && atMostOne(4, out, [this](Dictionary& one) { return dictionary("v", one); });
-}
-
-bool MessageReader::read(std::optional<std::string>& out) {
-  return take("as") && atMostOne(4, out, [this](std::string& one) { return stringArgument(one); });
-}
-
-bool MessageReader::read(std::vector<std::string>& out) { return take("as") && strings(out); }
-
-bool MessageReader::read(std::optional<std::vector<std::string>>& out) {
-  return take("aas") && atMostOne(4, out, [this](std::vector<std::string>& one) { return strings(one); });
-}
-
-bool MessageReader::readDescriptor(std::optional<std::uint32_t>& out) {
-  return take("ah") &&
-         atMostOne(4, out, [this](std::uint32_t& index) { return found(_cursor.number(index)); });
 }
 
 bool MessageReader::finish() {
@@ -154,18 +85,25 @@ bool MessageReader::finish() {
   return found(_cursor.atEnd());
 }
 
-bool MessageReader::stringArgument(std::string& out) {
+bool MessageReader::get(bool& out) {
+  std::uint32_t value = 0;
+  if (!get(value) || !found(value <= 1)) return false;
+  out = value == 1;
+  return true;
+}
+
+bool MessageReader::get(std::string& out) {
   std::string_view view;
   if (!text(view)) return false;
   out = view;
   return true;
 }
 
-bool MessageReader::strings(std::vector<std::string>& out) {
+bool MessageReader::get(std::vector<std::string>& out) {
   out.clear();
   return array(4, [&](std::size_t end) {
     while (_cursor.position() < end) {
-      if (!countNode() || !stringArgument(out.emplace_back())) return false;
+      if (!countNode() || !get(out.emplace_back())) return false;
     }
     return true;
   });
@@ -201,7 +139,7 @@ bool MessageReader::value(std::string_view type, Value& out) {
 template <class Number, class As>
 bool MessageReader::number(Value& out) {
   Number raw{};
-  if (!found(_cursor.number(raw))) return false;
+  if (!get(raw)) return false;
   out = static_cast<As>(raw);
   return true;
 }
@@ -210,33 +148,12 @@ bool MessageReader::basic(char type, Value& out) {
   if (type == 'h') return fail(CodecResult::WrongType);
   if (!countNode()) return false;
   switch (type) {
-    case 's': {
-      std::string_view view;
-      if (!text(view)) return false;
-      out = kept(view);
-      return true;
-    }
-    case 'o': {
-      std::string_view path;
-      if (!found(_cursor.text(path) && isObjectPath(path)) || !count(path.size())) return false;
-      out = kept(path);
-      return true;
-    }
-    case 'g': {
-      std::string_view signature;
-      if (!found(_cursor.signature(signature) && isValidSignature(signature)) || !count(signature.size())) {
-        return false;
-      }
-      // The empty signature, which means nothing anywhere else, is the null marker.
-      out = signature.empty() ? Value() : Value(kept(signature));
-      return true;
-    }
-    case 'b': {
-      bool flag = false;
-      if (!boolean(flag)) return false;
-      out = flag;
-      return true;
-    }
+    case 's':
+    case 'o':
+    case 'g':
+      return textual(type, out);
+    case 'b':
+      return number<bool, bool>(out);
     case 'y':
       return number<std::uint8_t, std::uint64_t>(out);
     case 'n':
@@ -254,6 +171,18 @@ bool MessageReader::basic(char type, Value& out) {
     default:
       return number<double, double>(out);
   }
+}
+
+/// A text, an object path or a signature.
+bool MessageReader::textual(char type, Value& out) {
+  std::string_view view;
+  const bool isWellFormed = type == 'g'   ? _cursor.signature(view) && isValidSignature(view)
+                            : type == 'o' ? _cursor.text(view) && isObjectPath(view)
+                                          : _cursor.text(view) && isValidUTF8(view, false);
+  if (!found(isWellFormed) || !count(view.size())) return false;
+  // The empty signature, which means nothing anywhere else, is the null marker.
+  out = type == 'g' && view.empty() ? Value() : Value(kept(view));
+  return true;
 }
 
 bool MessageReader::variant(Value& out) {

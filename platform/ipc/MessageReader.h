@@ -11,13 +11,11 @@
 
 #include "platform/ipc/Codec.h"
 #include "platform/ipc/Message.h"
+#include "platform/ipc/Signature.h"
 #include "platform/ipc/WireCursor.h"
 #include "platform/values/Value.h"
 
 namespace vesk {
-
-/// Whether `path` is a D-Bus object path.
-bool isObjectPath(std::string_view path) noexcept;
 
 /// Reads the arguments from first to last. After the first failure every further read fails the same way.
 /// For one thread.
@@ -28,20 +26,18 @@ class MessageReader {
   /// Reads values of `types` from `cursor` on.
   MessageReader(const WireCursor& cursor, std::string_view types) noexcept : _cursor(cursor), _types(types) {}
 
-  /// Each reads the next argument into `out` and returns whether everything was well so far.
-  bool read(bool& out);
-  bool read(std::uint16_t& out);
-  bool read(double& out);
-  bool read(std::string& out);
-  bool read(Dictionary& out);                               ///< a{sv}
-  bool read(List& out);                                     ///< an array of anything
-  bool read(Value& out);                                    ///< anything
-  bool read(std::optional<Dictionary>& out);                ///< aa{sv}, at most one
-  bool read(std::optional<std::string>& out);               ///< as, at most one
-  bool read(std::vector<std::string>& out);                 ///< as
-  bool read(std::optional<std::vector<std::string>>& out);  ///< aas, at most one
+  /// Each reads the next argument into `out` and returns whether everything was well so far. T: an
+  /// alternative of IPCArgument, read from its type there.
+  template <class T>
+  bool read(T& out) {
+    return take(argumentType<T>()) && get(out);
+  }
+  bool read(List& out);   ///< an array of anything
+  bool read(Value& out);  ///< anything
   /// ah, at most one: an index into the message's descriptors.
-  bool readDescriptor(std::optional<std::uint32_t>& out);
+  bool readDescriptor(std::optional<std::uint32_t>& out) {
+    return take(argumentType<IPCDescriptor>()) && get(out);
+  }
 
   /// Whether all arguments have been read and no byte is left.
   bool finish();
@@ -50,9 +46,6 @@ class MessageReader {
   const WireCursor& cursor() const noexcept { return _cursor; }
 
  private:
-  MessageReader(std::string_view body, std::shared_ptr<const char> owner, const Message& message,
-                CodecLimits limits) noexcept;
-
   bool fail(CodecResult result) noexcept;
   bool found(bool isWellFormed) noexcept { return isWellFormed || fail(CodecResult::Malformed); }
   bool take(std::string_view type) noexcept;
@@ -60,20 +53,46 @@ class MessageReader {
   bool countNode(std::size_t content = 0) noexcept;
   bool enter() noexcept;
 
+  /// `elements` reads up to the end that it is given.
   template <class Elements>
-  bool array(std::size_t alignment, const Elements& elements);
-  template <class T, class One>
-  bool atMostOne(std::size_t alignment, std::optional<T>& out, const One& readOne);
-  template <class Number, class As>
-  bool number(Value& out);
-  bool boolean(bool& out);
-  bool stringArgument(std::string& out);
-  bool strings(std::vector<std::string>& out);
+  bool array(std::size_t alignment, const Elements& elements) {
+    std::uint32_t size = 0;
+    if (!enter() || !found(_cursor.number(size) && _cursor.align(alignment) && size <= _cursor.left())) {
+      return false;
+    }
+    const std::size_t end = _cursor.position() + size;
+    if (!elements(end) || !found(_cursor.position() == end)) return false;
+    --_containers;
+    return true;
+  }
+
+  template <class Number>
+  bool get(Number& out) {
+    return found(_cursor.number(out));
+  }
+  bool get(bool& out);
+  bool get(std::string& out);
+  bool get(std::vector<std::string>& out);
+  bool get(Dictionary& out) { return dictionary("v", out); }
+  /// At most one: a number of 32 bits, a text or an array.
+  template <class T>
+  bool get(std::optional<T>& out) {
+    out.reset();
+    return array(4, [&](std::size_t end) {
+      if (_cursor.position() < end && !get(out.emplace())) return false;
+      return _cursor.position() >= end || fail(CodecResult::WrongType);
+    });
+  }
+
+  std::string_view nextType() const noexcept { return _types.substr(0, completeTypeLength(_types)); }
   bool text(std::string_view& out);
   Text kept(std::string_view text);
 
   bool value(std::string_view type, Value& out);
   bool basic(char type, Value& out);
+  template <class Number, class As>
+  bool number(Value& out);
+  bool textual(char type, Value& out);
   bool variant(Value& out);
   bool structure(std::string_view members, Value& out);
   bool bytes(Value& out);

@@ -1,19 +1,15 @@
 #include "platform/ipc/MessageWriter.h"
 
 #include <cstring>
-#include <iterator>
 #include <optional>
 #include <type_traits>
 
+#include "platform/ipc/Signature.h"
 #include "platform/unicode/UTF8.h"
 
 namespace vesk {
 
 namespace {
-
-// In the order of IPCArgument's alternatives.
-constexpr const char* kSignatures[] = {"b", "q", "d", "s", "a{sv}", "av", "aa{sv}", "as", "as", "aas", "ah"};
-static_assert(std::size(kSignatures) == std::variant_size_v<IPCArgument>);
 
 // Of a value's variant, in the order of Value::Kind. The empty signature is the null marker.
 constexpr const char* kValueSignatures[] = {"g", "b", "x", "t", "d", "s", "ay", "(d)", "av", "a{sv}"};
@@ -195,7 +191,7 @@ void appendHeader(const OutgoingHeader& header, std::string_view signature, std:
 }
 
 void appendSignature(const std::vector<IPCArgument>& arguments, std::string& out) {
-  for (const auto& argument : arguments) out += kSignatures[argument.index()];
+  for (const auto& argument : arguments) out += kArgumentTypes[argument.index()];
 }
 
 /// Adds the body to the message whose header begins at `start`, and completes that.

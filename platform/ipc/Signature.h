@@ -2,9 +2,28 @@
 #pragma once
 
 #include <cstddef>
+#include <iterator>
 #include <string_view>
+#include <type_traits>
+#include <variant>
+
+#include "platform/ipc/IPCConnection.h"
 
 namespace vesk {
+
+/// Of arguments, in the order of IPCArgument's alternatives.
+inline constexpr std::string_view kArgumentTypes[] = {"b",      "q",  "d",  "s",   "a{sv}", "av",
+                                                      "aa{sv}", "as", "as", "aas", "ah"};
+static_assert(std::size(kArgumentTypes) == std::variant_size_v<IPCArgument>);
+
+template <class T, std::size_t At = 0>
+constexpr std::string_view argumentType() noexcept {
+  if constexpr (std::is_same_v<T, std::variant_alternative_t<At, IPCArgument>>) {
+    return kArgumentTypes[At];
+  } else {
+    return argumentType<T, At + 1>();
+  }
+}
 
 /// Length of the complete type that `signature` begins with; 0 when it begins with none, or with one that is
 /// nested deeper than D-Bus allows (32 arrays, 32 structures).
