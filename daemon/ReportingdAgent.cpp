@@ -39,15 +39,15 @@ bool ReportingdAgent::shouldAcceptNewConnection(const std::shared_ptr<IPCConnect
   VESK_LOG_DEBUG("listener: Accepting new Orvo connection %s, %d(%d) connections.",
                  connection->description().c_str(), _sessionCount.load(), _familyCount.load());
   auto session = std::make_shared<ReportingdSession>(shared_from_this(), connection, _services);
-  connection->setExportedObject(std::make_shared<ClientSessionStub>(session));
-  connection->setInterruptionHandler([session] {
-    VESK_LOG_DEBUG("listener: Orvo connection to %s was interrupted", session->description().c_str());
-  });
-  connection->setInvalidationHandler(
-      [session, agent = shared_from_this()] { agent->sessionInvalidated(session); });
-  connection->setLossHandler([&counters = _services.backends.counters](std::size_t calls) {
-    counters.count("session", DropReason::NotAggregated, calls);
-  });
+  IPCHandlers handlers{
+      .object = std::make_shared<ClientSessionStub>(session),
+      .interruption =
+          [session] {
+            VESK_LOG_DEBUG("listener: Orvo connection to %s was interrupted", session->description().c_str());
+          },
+      .invalidation = [session, agent = shared_from_this()] { agent->sessionInvalidated(session); },
+      .loss = [&counters = _services.backends.counters](
+                  std::size_t calls) { counters.count("session", DropReason::NotAggregated, calls); }};
   // Last, so that nothing that fails leaves a session behind that no connection ends.
   {
     MutexLock lock(_sessionListMutex);
@@ -55,7 +55,7 @@ bool ReportingdAgent::shouldAcceptNewConnection(const std::shared_ptr<IPCConnect
     ++_sessionCount;
     if (_sessionList.size() == 1) _busyMarker.begin();
   }
-  connection->resume();
+  connection->resume(std::move(handlers));
   return true;
 }
 

@@ -103,8 +103,7 @@ class Echo final : public IPCExportedObject, public IPCListenerDelegate {
     if (call.read("v", value)) call.answer({List{value}});
   }
   bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) override {
-    connection->setExportedObject(std::shared_ptr<IPCExportedObject>(this, [](auto*) {}));
-    connection->resume();
+    connection->resume({std::shared_ptr<IPCExportedObject>(this, [](auto*) {})});
     return true;
   }
 

@@ -43,8 +43,10 @@ BusConnection::BusConnection(FileDescriptor socket, std::uint64_t serial, const 
       _sasl(peer.user),
       _channel(_socket.get(), _registry->options.maximumMessage + kMessageOverhead) {}
 
-void BusConnection::resume() {
+void BusConnection::resume(IPCHandlers handlers) {
   if (_started.exchange(true)) return;
+  _router.setExportedObject(std::move(handlers.object));
+  _handlers = std::move(handlers);
   try {
     _registry->launch([self = shared_from_this()] { self->run(); });
   } catch (const std::exception& error) {
@@ -63,8 +65,6 @@ void BusConnection::end() {
   invalidate();
   if (_started.exchange(true)) return;
   _outbox.close();
-  LogUser onBehalfOf(_peer.user);
-  dropHandlers();
   close();
 }
 
@@ -239,15 +239,15 @@ void BusConnection::flush() {
 void BusConnection::finish(End how) noexcept {
   // A client that has gone takes no call; one that is sent away still gets what its session says in the end.
   std::size_t lost = how == End::Invalidated ? 0 : _outbox.close();
-  if (how == End::BrokenOff) callHandler(_interruptionHandler);
-  callHandler(_invalidationHandler);
+  if (how == End::BrokenOff) callHandler(_handlers.interruption);
+  callHandler(_handlers.invalidation);
   dropHandlers();
   if (how == End::Invalidated) flush();
   if (std::size_t unsent = _outbox.close()) {
     VESK_LOG_WARNING("ipc: %s: Ended before %zu calls to the client were sent", _name.c_str(), unsent);
     lost += unsent;
   }
-  if (lost > 0 && _lossHandler) callHandler([&] { _lossHandler(lost); });
+  if (lost > 0 && _handlers.loss) callHandler([&] { _handlers.loss(lost); });
 }
 
 void BusConnection::callHandler(const std::function<void()>& handler) noexcept {
@@ -261,8 +261,8 @@ void BusConnection::callHandler(const std::function<void()>& handler) noexcept {
 
 void BusConnection::dropHandlers() noexcept {
   // Moved out first: what goes with them may call this connection.
-  auto interruption = std::exchange(_interruptionHandler, nullptr);
-  auto invalidation = std::exchange(_invalidationHandler, nullptr);
+  auto interruption = std::exchange(_handlers.interruption, nullptr);
+  auto invalidation = std::exchange(_handlers.invalidation, nullptr);
   auto object = _router.takeExportedObject();
 }
 

@@ -47,24 +47,12 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
                 std::shared_ptr<ConnectionRegistry> registry);
   ~BusConnection() override { close(); }
 
-  /// For the listener: as `invalidate`, and when there is no thread lets go of handlers and exported object.
+  /// For the listener: as `invalidate`, and when there is no thread closes the socket.
   void end();
 
   std::string description() const override { return _name; }
   IPCPeer peer() const override { return _peer; }
-  void setExportedObject(std::shared_ptr<IPCExportedObject> object) override {
-    _router.setExportedObject(std::move(object));
-  }
-  void setInterruptionHandler(std::function<void()> handler) override {
-    _interruptionHandler = std::move(handler);
-  }
-  void setInvalidationHandler(std::function<void()> handler) override {
-    _invalidationHandler = std::move(handler);
-  }
-  void setLossHandler(std::function<void(std::size_t calls)> handler) override {
-    _lossHandler = std::move(handler);
-  }
-  void resume() override;
+  void resume(IPCHandlers handlers) override;
   void invalidate() override;
   void callRemoteObject(IPCOutgoingCall call,
                         const std::function<void(const std::string& error)>& errorHandler) override;
@@ -114,9 +102,7 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   // Set before `resume`, then the thread's.
   FileDescriptor _socket;
   CallRouter _router;
-  std::function<void()> _interruptionHandler;
-  std::function<void()> _invalidationHandler;
-  std::function<void(std::size_t)> _lossHandler;
+  IPCHandlers _handlers;  // but for the object, which the router has
 
   // The thread's.
   CallWriter _writer;

@@ -55,8 +55,19 @@ struct IPCOutgoingCall {
   std::vector<IPCArgument> arguments;
 };
 
-/// Shared by its owner (a session), its handlers and its own thread. The handlers and the exported object are
-/// dropped after the invalidation handler has run, which breaks the rings that they form with the connection.
+/// What a connection is given to do. Everything runs on the connection's thread, the handlers at most once,
+/// and is dropped after the invalidation handler has run, which breaks the rings that it forms with the
+/// connection. Each may be empty.
+struct IPCHandlers {
+  std::shared_ptr<IPCExportedObject> object{};
+  std::function<void()> interruption{};
+  std::function<void()> invalidation{};
+  /// Told how many calls that `callRemoteObject` took were never sent, if any; runs after the others have
+  /// been dropped.
+  std::function<void(std::size_t calls)> loss{};
+};
+
+/// Shared by its owner (a session), its handlers and its own thread.
 class IPCConnection {
  public:
   virtual ~IPCConnection() = default;
@@ -65,17 +76,8 @@ class IPCConnection {
   /// As the kernel told when it connected.
   virtual IPCPeer peer() const = 0;
 
-  /// Set before `resume`; run on the connection's thread, each at most once.
-  virtual void setExportedObject(std::shared_ptr<IPCExportedObject> object) = 0;
-  virtual void setInterruptionHandler(std::function<void()> handler) = 0;
-  virtual void setInvalidationHandler(std::function<void()> handler) = 0;
-
-  /// Told, on the connection's thread, how many calls that `callRemoteObject` took were never sent, if any;
-  /// runs after the other handlers have been dropped. Set before `resume`.
-  virtual void setLossHandler(std::function<void(std::size_t calls)> handler) = 0;
-
   /// Begins to serve calls, on the connection's own thread.
-  virtual void resume() = 0;
+  virtual void resume(IPCHandlers handlers) = 0;
 
   /// Asks the connection to end; safe from any thread and more than once. The invalidation handler runs on
   /// the connection's thread soon after.

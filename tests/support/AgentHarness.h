@@ -13,17 +13,15 @@ class RecordingConnection final : public IPCConnection {
  public:
   std::string description() const override { return "recording connection"; }
   IPCPeer peer() const override { return {}; }
-  void setExportedObject(std::shared_ptr<IPCExportedObject> object) override { _object = std::move(object); }
-  void setInterruptionHandler(std::function<void()> handler) override { _interrupted = std::move(handler); }
-  void setInvalidationHandler(std::function<void()> handler) override { _invalidated = std::move(handler); }
-  void setLossHandler(std::function<void(std::size_t)> handler) override { lose = std::move(handler); }
-  void resume() override {}
-  void invalidate() override {
-    if (auto handler = std::exchange(_invalidated, nullptr)) handler();
-    _interrupted = nullptr;
-    _object.reset();
+  void resume(IPCHandlers handlers) override {
+    lose = std::exchange(handlers.loss, nullptr);
+    _handlers = std::move(handlers);
   }
-  void interrupt() { _interrupted(); }
+  void invalidate() override {
+    if (auto handler = std::exchange(_handlers.invalidation, nullptr)) handler();
+    _handlers = {};
+  }
+  void interrupt() { _handlers.interruption(); }
   /// The messages that its client was handed, each as "102: 1700000000.000000 3/2 {a: text}" (who sent it,
   /// when, what), or "closing: 0.000000 0/0".
   std::vector<std::string> told() const {
@@ -51,9 +49,7 @@ class RecordingConnection final : public IPCConnection {
   std::function<void(const IPCOutgoingCall&)> onCall;  ///< by the sender, who may hold the agent's monitor
 
  private:
-  std::shared_ptr<IPCExportedObject> _object;
-  std::function<void()> _interrupted;
-  std::function<void()> _invalidated;
+  IPCHandlers _handlers;
 };
 
 class AgentHarness;

@@ -57,19 +57,20 @@ TestService::TestService(const std::function<void(IPCListener::Options&)>& adjus
 
 bool TestService::shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) {
   auto session = std::make_shared<ActingSession>(journal, connection);
-  connection->setExportedObject(std::make_shared<ClientSessionStub>(session));
-  connection->setInterruptionHandler([this, session] { journal.add("interrupted"); });
-  connection->setInvalidationHandler([this, session] {
-    journal.add("invalidated");
-    if (onInvalidation) onInvalidation();
-  });
-  connection->setLossHandler([this](std::size_t calls) { journal.add("lost " + std::to_string(calls)); });
+  IPCHandlers handlers{.object = std::make_shared<ClientSessionStub>(session),
+                       .interruption = [this, session] { journal.add("interrupted"); },
+                       .invalidation =
+                           [this, session] {
+                             journal.add("invalidated");
+                             if (onInvalidation) onInvalidation();
+                           },
+                       .loss = [this](std::size_t calls) { journal.add("lost " + std::to_string(calls)); }};
   {
     std::lock_guard lock(_mutex);
     _connections.push_back(connection);
   }
   journal.add("accepted");
-  connection->resume();
+  connection->resume(std::move(handlers));
   return true;
 }
 

@@ -28,13 +28,11 @@ RecordingDaemon::~RecordingDaemon() {
 }
 
 bool RecordingDaemon::shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) {
-  connection->setExportedObject(
-      std::make_shared<ClientSessionStub>(std::make_shared<RecordingSession>(_record)));
   {
     std::lock_guard lock(_mutex);
     _last = connection;
   }
-  connection->resume();
+  connection->resume({std::make_shared<ClientSessionStub>(std::make_shared<RecordingSession>(_record))});
   return true;
 }
 
