@@ -1,33 +1,38 @@
 #include "platform/ipc/Answers.h"
 
-#include <exception>
 #include <utility>
 
-#include "platform/ipc/MessageWriter.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
 
-void Answers::send(std::uint32_t call, const std::vector<IPCArgument>& arguments) noexcept try {
+CodecResult Answers::write(const OutgoingHeader& header, const std::vector<IPCArgument>& arguments) {
   std::string message;
-  const auto result =
-      appendMessage({.type = MessageType::Answer, .replySerial = call}, ++_lastSerial, arguments, message);
-  if (result == CodecResult::Ok) return add(std::move(message));
-  VESK_LOG_ERROR("ipc: An answer can't be sent: %s", describe(result));
-  sendError(call, kErrorFailed, "The answer can't be sent");
-} catch (const std::exception& error) {
+  const auto result = appendMessage(header, ++_lastSerial, arguments, message);
+  MutexLock lock(_mutex);
+  if (result == CodecResult::Ok && !_closed) _waiting.push_back(std::move(message));
+  return result;
+}
+
+void Answers::lose(const std::exception& error) noexcept {
   VESK_LOG_ERROR("ipc: An answer is lost: %s", error.what());
   _isBroken = true;
 }
 
-void Answers::sendError(std::uint32_t call, const char* errorName, const char* text) noexcept try {
-  std::string message;
-  const auto result = appendMessage({.type = MessageType::Error, .errorName = errorName, .replySerial = call},
-                                    ++_lastSerial, {IPCArgument(std::string(text))}, message);
-  if (result == CodecResult::Ok) add(std::move(message));
+void Answers::send(std::uint32_t call, const std::vector<IPCArgument>& arguments) noexcept try {
+  const auto result = write({.type = MessageType::Answer, .replySerial = call}, arguments);
+  if (result == CodecResult::Ok) return;
+  VESK_LOG_ERROR("ipc: An answer can't be sent: %s", describe(result));
+  sendError(call, kErrorFailed, "The answer can't be sent");
 } catch (const std::exception& error) {
-  VESK_LOG_ERROR("ipc: An answer is lost: %s", error.what());
-  _isBroken = true;
+  lose(error);
+}
+
+void Answers::sendError(std::uint32_t call, const char* errorName, const char* text) noexcept try {
+  write({.type = MessageType::Error, .errorName = errorName, .replySerial = call},
+        {IPCArgument(std::string(text))});
+} catch (const std::exception& error) {
+  lose(error);
 }
 
 bool Answers::owe() {
@@ -54,11 +59,6 @@ void Answers::paid() noexcept {
     if (_closed) return;
   }
   if (_wake && _thread.load() != std::this_thread::get_id()) _wake();
-}
-
-void Answers::add(std::string message) {
-  MutexLock lock(_mutex);
-  if (!_closed) _waiting.push_back(std::move(message));
 }
 
 void Answers::moveTo(Channel& channel) {

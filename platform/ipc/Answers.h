@@ -4,6 +4,7 @@
 #include <atomic>
 #include <cstddef>
 #include <cstdint>
+#include <exception>
 #include <functional>
 #include <string>
 #include <thread>
@@ -11,6 +12,7 @@
 
 #include "platform/ipc/Channel.h"
 #include "platform/ipc/IPCConnection.h"
+#include "platform/ipc/MessageWriter.h"
 #include "platform/sync/Mutex.h"
 
 namespace vesk {
@@ -47,7 +49,8 @@ class Answers {
   void close() noexcept;
 
  private:
-  void add(std::string message);
+  CodecResult write(const OutgoingHeader& header, const std::vector<IPCArgument>& arguments);
+  void lose(const std::exception& error) noexcept;
   void paid() noexcept;
 
   const std::function<void()> _wake;

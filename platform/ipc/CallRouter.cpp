@@ -140,12 +140,6 @@ void CallRouter::serveIntrospectable(IPCIncomingCall& call, std::string_view pat
   call.answer({IPCArgument(std::move(xml))});
 }
 
-bool CallRouter::knowsInterface(std::string_view name) const {
-  constexpr std::string_view kStandard[] = {kPeer, kIntrospectable, kProperties};
-  return name.empty() || name == _object->interfaceName() ||
-         std::find(std::begin(kStandard), std::end(kStandard), name) != std::end(kStandard);
-}
-
 /// No interface here has a property.
 void CallRouter::serveProperties(IPCIncomingCall& call) {
   std::string interfaceName;
@@ -160,7 +154,10 @@ void CallRouter::serveProperties(IPCIncomingCall& call) {
   } else {
     return call.refuse(kErrorUnknownMethod, kNoSuchMethod);
   }
-  if (!knowsInterface(interfaceName)) return call.refuse(kErrorUnknownInterface, kNoSuchInterface);
+  const std::string_view known[] = {"", _object->interfaceName(), kPeer, kIntrospectable, kProperties};
+  if (std::find(std::begin(known), std::end(known), interfaceName) == std::end(known)) {
+    return call.refuse(kErrorUnknownInterface, kNoSuchInterface);
+  }
   if (call.member() == "GetAll") return call.answer({IPCArgument(Dictionary())});
   call.refuse(kErrorUnknownProperty, "The interface has no such property");
 }

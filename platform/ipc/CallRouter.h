@@ -35,7 +35,6 @@ class CallRouter {
   void servePeer(IPCIncomingCall& call);
   void serveIntrospectable(IPCIncomingCall& call, std::string_view path);
   void serveProperties(IPCIncomingCall& call);
-  bool knowsInterface(std::string_view name) const;
   void warn(std::string_view member, const char* what);
 
   const std::string _objectPath;

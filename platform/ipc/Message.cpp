@@ -1,6 +1,7 @@
 #include "platform/ipc/Message.h"
 
 #include <cstring>
+#include <iterator>
 
 #include "platform/ipc/MessageReader.h"
 #include "platform/ipc/Signature.h"
@@ -29,17 +30,17 @@ bool areElements(std::string_view name, char separator, bool mayStartWithDigit,
   return before != separator;
 }
 
-bool isMember(std::string_view name) {
+bool isMember(std::string_view name) noexcept {
   return name.size() <= kMaximumName && name.find('.') == name.npos && areElements(name, '.', false);
 }
 
 /// Of an interface or an error: two elements at least.
-bool isInterface(std::string_view name) {
+bool isInterface(std::string_view name) noexcept {
   return name.size() <= kMaximumName && name.find('.') != name.npos && areElements(name, '.', false);
 }
 
 /// As other peers name themselves; messages here need none.
-bool isBusName(std::string_view name) {
+bool isBusName(std::string_view name) noexcept {
   if (name.starts_with(':')) name.remove_prefix(1);
   return name.size() <= kMaximumName && name.find('.') != name.npos && areElements(name, '.', true, "-");
 }
@@ -58,6 +59,24 @@ bool isComplete(const MessageHeader& header) {
   }
   return true;
 }
+
+struct KnownField {
+  std::string_view type;
+  bool (*isValid)(std::string_view) noexcept = nullptr;  // of a text
+  std::string MessageHeader::*text = nullptr;            // where it is kept
+};
+
+// In the order of HeaderField.
+constexpr KnownField kKnownFields[] = {{"o", isObjectPath, &MessageHeader::path},
+                                       {"s", isInterface, &MessageHeader::interfaceName},
+                                       {"s", isMember, &MessageHeader::member},
+                                       {"s", isInterface, &MessageHeader::errorName},
+                                       {"u"},
+                                       {"s", isBusName},
+                                       {"s", isBusName},
+                                       {"g", isValidSignature, &MessageHeader::signature},
+                                       {"u"}};
+static_assert(std::size(kKnownFields) == kUnixDescriptors);
 
 class FieldReader {
  public:
@@ -84,36 +103,14 @@ class FieldReader {
 
  private:
   bool readKnown(std::uint8_t field, std::string_view type) {
-    std::string other;
-    switch (field) {
-      case kPath:
-        return type == "o" && text(_header.path, isObjectPath);
-      case kInterface:
-        return type == "s" && text(_header.interfaceName, isInterface);
-      case kMember:
-        return type == "s" && text(_header.member, isMember);
-      case kErrorName:
-        return type == "s" && text(_header.errorName, isInterface);
-      case kDestination:
-      case kSender:
-        return type == "s" && text(other, isBusName);
-      case kReplySerial:
-        return type == "u" && _cursor.number(_header.replySerial) && _header.replySerial != 0;
-      case kUnixDescriptors:
-        return type == "u" && _cursor.number(_header.descriptors);
-      default: {
-        std::string_view signature;
-        if (type != "g" || !_cursor.signature(signature) || !isValidSignature(signature)) return false;
-        _header.signature = signature;
-        return true;
-      }
-    }
-  }
-
-  bool text(std::string& out, bool (*isValid)(std::string_view)) {
-    std::string_view bytes;
-    if (!_cursor.text(bytes) || !isValid(bytes)) return false;
-    out = bytes;
+    const KnownField& known = kKnownFields[field - 1];
+    if (type != known.type) return false;
+    if (field == kReplySerial) return _cursor.number(_header.replySerial) && _header.replySerial != 0;
+    if (field == kUnixDescriptors) return _cursor.number(_header.descriptors);
+    std::string_view text;
+    const bool isWhole = field == kSignature ? _cursor.signature(text) : _cursor.text(text);
+    if (!isWhole || !known.isValid(text)) return false;
+    if (known.text) _header.*known.text = text;
     return true;
   }
 

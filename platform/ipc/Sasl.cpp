@@ -57,8 +57,8 @@ SaslServer::Step SaslServer::step(std::string_view data) {
     if (++_lines > kMaximumLines) return {Verdict::Refused};
     step.taken += end + kLineEnd.size();
     step.answer += answerTo(rest.substr(0, end));
-    if (_isRefused) return {Verdict::Refused};
-    if (_hasBegun) {
+    if (_state == State::Refused) return {Verdict::Refused};
+    if (_state == State::Begun) {
       step.verdict = Verdict::Begun;
       return step;
     }
@@ -85,13 +85,10 @@ std::string SaslServer::answerTo(std::string_view line) {
   }
   if (_state == State::WantsData && takeWord(line, "DATA")) return check(line);
   if (takeWord(line, "CANCEL") || takeWord(line, "ERROR")) return reject();
-  if (_state == State::WantsBegin) {
-    if (line == "NEGOTIATE_UNIX_FD") return "AGREE_UNIX_FD\r\n";
-    _hasBegun = line == "BEGIN";
-  } else {
-    _isRefused = line == "BEGIN";
-  }
-  return _hasBegun || _isRefused ? std::string() : "ERROR\r\n";
+  if (_state == State::WantsBegin && line == "NEGOTIATE_UNIX_FD") return "AGREE_UNIX_FD\r\n";
+  if (line != "BEGIN") return "ERROR\r\n";
+  _state = _state == State::WantsBegin ? State::Begun : State::Refused;
+  return {};
 }
 
 std::string_view SaslClient::greeting() noexcept {

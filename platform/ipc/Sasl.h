@@ -32,7 +32,7 @@ class SaslServer {
   Step step(std::string_view data);
 
  private:
-  enum class State { WantsAuth, WantsData, WantsBegin };
+  enum class State { WantsAuth, WantsData, WantsBegin, Begun, Refused };
 
   std::string answerTo(std::string_view line);
   std::string check(std::string_view claim);
@@ -40,8 +40,6 @@ class SaslServer {
 
   const uid_t _peer;
   State _state = State::WantsAuth;
-  bool _hasBegun = false;
-  bool _isRefused = false;
   bool _seenFirstByte = false;
   std::size_t _lines = 0;
 };
