@@ -43,7 +43,7 @@ BusClient::BusClient(Options options)
     : _process(::getpid()),
       _socket(GuardedDescriptor(options.connected ? std::move(options.connected)
                                                   : connectUnixSocket(options.socketPath))),
-      _router(options.objectPath, "client", _answers, {}),
+      _router(options.objectPath, "client", _outbox, {}),
       _writer(options.objectPath),
       _channel(_socket.get(), kMaximumMessageSize) {
   ::fcntl(_socket.get(), F_SETFL, ::fcntl(_socket.get(), F_GETFL) | O_NONBLOCK);
@@ -86,7 +86,7 @@ BusClient::SendResult BusClient::send(const IPCOutgoingCall& call, AnswerHandler
 /// Until the daemon has let us in, calls wait behind the greeting.
 BusClient::Progress BusClient::write() {
   if (hasEnded()) return disconnected();
-  _answers->moveTo(_channel);
+  _outbox->moveAnswersTo(_channel);
   return !_isReady || _channel.flush() ? Progress::Connected : disconnected();
 }
 
@@ -174,7 +174,7 @@ BusClient::Progress BusClient::disconnected() {
 }
 
 void BusClient::end() noexcept {
-  _answers->close();
+  _outbox->close();
   // A process forked from this one may hold the socket too, and would keep the session alive in the daemon;
   // in that process itself the connection is not ours to end.
   if (!hasEnded() && isOurs()) ::shutdown(_socket.get(), SHUT_RDWR);

@@ -11,12 +11,12 @@
 #include <string_view>
 
 #include "platform/files/GuardedDescriptor.h"
-#include "platform/ipc/Answers.h"
 #include "platform/ipc/CallRouter.h"
 #include "platform/ipc/Channel.h"
 #include "platform/ipc/IPCConnection.h"
 #include "platform/ipc/MessageReader.h"
 #include "platform/ipc/MessageWriter.h"
+#include "platform/ipc/Outbox.h"
 #include "platform/ipc/Sasl.h"
 
 namespace vesk {
@@ -132,7 +132,7 @@ class BusClient {
 
   const pid_t _process;
   GuardedDescriptor _socket;  // none once the connection has ended
-  const std::shared_ptr<Answers> _answers = std::make_shared<Answers>(nullptr);
+  const std::shared_ptr<Outbox> _outbox = std::make_shared<Outbox>();
   CallRouter _router;
   CallWriter _writer;
   SaslClient _sasl;

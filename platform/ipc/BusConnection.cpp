@@ -34,10 +34,10 @@ BusConnection::BusConnection(FileDescriptor socket, std::uint64_t serial, const 
       _peer(peer),
       _name(nameFor(serial, peer)),
       _registry(std::move(registry)),
-      _answers(std::make_shared<Answers>([wakeup = _wakeup] { wakeup->signal(); })),
-      _outbox(_registry->options.maximumOutbox),
+      _outbox(std::make_shared<Outbox>(_registry->options.maximumOutbox,
+                                       [wakeup = _wakeup] { wakeup->signal(); })),
       _socket(std::move(socket)),
-      _router(_registry->options.objectPath, _name, _answers, {serial, peer.user},
+      _router(_registry->options.objectPath, _name, _outbox, {serial, peer.user},
               {.content = _registry->options.maximumMessage}),
       _writer(_registry->options.objectPath),
       _sasl(peer.user),
@@ -64,17 +64,15 @@ void BusConnection::invalidate() {
 void BusConnection::end() {
   invalidate();
   if (_started.exchange(true)) return;
-  _outbox.close();
+  _outbox->close();
   close();
 }
 
 void BusConnection::callRemoteObject(IPCOutgoingCall call,
                                      const std::function<void(const std::string& error)>& errorHandler) {
-  if (const char* error = _outbox.put(std::move(call))) {
+  if (const char* error = _outbox->put(std::move(call))) {
     if (errorHandler) errorHandler(error);
-    return;
   }
-  _wakeup->signal();
 }
 
 // --- On the connection's thread
@@ -94,11 +92,11 @@ void BusConnection::run() noexcept {
 
 BusConnection::End BusConnection::serve() {
   const Time deadline = std::chrono::steady_clock::now() + _registry->options.authenticationTimeout;
-  _answers->setThread(std::this_thread::get_id());
+  _outbox->setThread(std::this_thread::get_id());
   for (;;) {
     sendOutgoing();
     if (_invalidated.load()) return drain();
-    if (_answers->isBroken()) return closeFor("an answer is lost");
+    if (_outbox->isBroken()) return closeFor("an answer is lost");
     if (!_isReady && std::chrono::steady_clock::now() >= deadline) {
       VESK_LOG_WARNING("ipc: %s: Closed: not authenticated in time", _name.c_str());
       return End::NotAuthenticated;
@@ -110,11 +108,11 @@ BusConnection::End BusConnection::serve() {
 
 /// What this thread and others have answered and called, with one system call.
 void BusConnection::sendOutgoing() {
-  _answers->moveTo(_channel);
+  _outbox->moveAnswersTo(_channel);
   while (_isReady && !_peerGone && _channel.unsentBytes() < kMaximumUnsent) {
-    auto call = _outbox.take();
+    auto call = _outbox->takeCall();
     if (!call) break;
-    if (!appendCall(*call)) _outbox.lose();
+    if (!appendCall(*call)) _outbox->loseCall();
   }
   // What the client had sent before it went is served all the same, so its going is no end here.
   if (!_channel.flush()) _peerGone = true;
@@ -197,7 +195,7 @@ std::optional<BusConnection::End> BusConnection::serveMessages() {
         break;
       case Channel::Next::Whole:
         _router.route(message);
-        _answers->moveTo(_channel);
+        _outbox->moveAnswersTo(_channel);
         if (message.hasDescriptors()) return closeFor("descriptors that no call takes");
         break;
     }
@@ -228,7 +226,7 @@ void BusConnection::flush() {
   while (_isReady && !_peerGone && std::chrono::steady_clock::now() < deadline) {
     sendOutgoing();
     if (!isBackedUp()) {
-      if (_outbox.empty()) return;
+      if (!_outbox->hasCalls()) return;
       continue;
     }
     pollfd poll{_socket.get(), POLLOUT, 0};
@@ -238,12 +236,12 @@ void BusConnection::flush() {
 
 void BusConnection::finish(End how) noexcept {
   // A client that has gone takes no call; one that is sent away still gets what its session says in the end.
-  std::size_t lost = how == End::Invalidated ? 0 : _outbox.close();
+  std::size_t lost = how == End::Invalidated ? 0 : _outbox->close();
   if (how == End::BrokenOff) callHandler(_handlers.interruption);
   callHandler(_handlers.invalidation);
   dropHandlers();
   if (how == End::Invalidated) flush();
-  if (std::size_t unsent = _outbox.close()) {
+  if (std::size_t unsent = _outbox->close()) {
     VESK_LOG_WARNING("ipc: %s: Ended before %zu calls to the client were sent", _name.c_str(), unsent);
     lost += unsent;
   }
@@ -268,7 +266,7 @@ void BusConnection::dropHandlers() noexcept {
 
 void BusConnection::close() noexcept {
   if (!_counted.exchange(false)) return;
-  _answers->close();
+  _outbox->close();
   _socket.reset();
   ExtensionTokens::shared().drop(_serial);
   _registry->release(_serial);

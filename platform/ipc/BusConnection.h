@@ -11,7 +11,6 @@
 #include <string>
 
 #include "platform/files/FileDescriptor.h"
-#include "platform/ipc/Answers.h"
 #include "platform/ipc/CallRouter.h"
 #include "platform/ipc/Channel.h"
 #include "platform/ipc/ConnectionRegistry.h"
@@ -91,10 +90,9 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   const std::string _name;
   const std::shared_ptr<ConnectionRegistry> _registry;
   const std::shared_ptr<Wakeup> _wakeup = std::make_shared<Wakeup>();
-  const std::shared_ptr<Answers> _answers;
+  const std::shared_ptr<Outbox> _outbox;
 
   // Synchronised by themselves.
-  Outbox _outbox;
   std::atomic<bool> _started{false};
   std::atomic<bool> _invalidated{false};
   std::atomic<bool> _counted{true};

@@ -58,11 +58,11 @@ std::string machineID() {
 
 }  // namespace
 
-CallRouter::CallRouter(std::string objectPath, std::string connectionName, std::shared_ptr<Answers> answers,
+CallRouter::CallRouter(std::string objectPath, std::string connectionName, std::shared_ptr<Outbox> outbox,
                        const ExtensionOwner& owner, CodecLimits limits)
     : _objectPath(std::move(objectPath)),
       _connectionName(std::move(connectionName)),
-      _answers(std::move(answers)),
+      _outbox(std::move(outbox)),
       _owner(owner),
       _limits(limits) {}
 
@@ -76,7 +76,7 @@ void CallRouter::warn(std::string_view member, const char* what) {
 void CallRouter::route(Message& message) {
   const MessageHeader& header = *message.header;
   if (header.type != MessageType::Call) return;
-  IPCIncomingCall call(message, _answers, _owner, _limits);
+  IPCIncomingCall call(message, _outbox, _owner, _limits);
   if (header.interfaceName == kPeer) {
     servePeer(call);
   } else if (header.interfaceName == kIntrospectable) {

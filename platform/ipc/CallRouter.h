@@ -5,10 +5,10 @@
 #include <string>
 #include <string_view>
 
-#include "platform/ipc/Answers.h"
 #include "platform/ipc/Codec.h"
 #include "platform/ipc/ExtensionTokens.h"
 #include "platform/ipc/IPCConnection.h"
+#include "platform/ipc/Outbox.h"
 #include "platform/ipc/WarningBurst.h"
 
 namespace vesk {
@@ -21,7 +21,7 @@ class IPCIncomingCall;
 class CallRouter {
  public:
   /// `owner`: as IPCIncomingCall's. `limits`: of the arguments of one call.
-  CallRouter(std::string objectPath, std::string connectionName, std::shared_ptr<Answers> answers,
+  CallRouter(std::string objectPath, std::string connectionName, std::shared_ptr<Outbox> outbox,
              const ExtensionOwner& owner, CodecLimits limits = {});
 
   void setExportedObject(std::shared_ptr<IPCExportedObject> object) { _object = std::move(object); }
@@ -39,7 +39,7 @@ class CallRouter {
 
   const std::string _objectPath;
   const std::string _connectionName;
-  const std::shared_ptr<Answers> _answers;
+  const std::shared_ptr<Outbox> _outbox;
   const ExtensionOwner _owner;
   const CodecLimits _limits;
   std::shared_ptr<IPCExportedObject> _object;

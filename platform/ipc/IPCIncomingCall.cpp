@@ -24,13 +24,13 @@ std::string IPCIncomingCall::grant(FileDescriptor descriptor) {
 
 void IPCIncomingCall::answer(const std::vector<IPCArgument>& arguments) {
   if (std::exchange(_settled, true)) return;
-  if (expectsReply()) _answers->send(_message.serial, arguments);
+  if (expectsReply()) _outbox->send(_message.serial, arguments);
 }
 
 void IPCIncomingCall::refuse(const char* errorName, const char* text) {
   if (std::exchange(_settled, true)) return;
   if (expectsReply()) {
-    _answers->sendError(_message.serial, errorName, text);
+    _outbox->sendError(_message.serial, errorName, text);
   } else {
     _complaint = text;
   }
@@ -38,13 +38,13 @@ void IPCIncomingCall::refuse(const char* errorName, const char* text) {
 
 bool IPCIncomingCall::owe() {
   if (std::exchange(_settled, true) || !expectsReply()) return false;
-  if (_answers->owe()) return true;
-  _answers->sendError(_message.serial, kErrorLimitsExceeded, "Too many calls wait for their answers");
+  if (_outbox->owe()) return true;
+  _outbox->sendError(_message.serial, kErrorLimitsExceeded, "Too many calls wait for their answers");
   return false;
 }
 
-void IPCIncomingCall::abandon(Answers& answers, std::uint32_t call) noexcept {
-  answers.settleWithError(call, kErrorNoReply, "The call was given up without an answer");
+void IPCIncomingCall::abandon(Outbox& outbox, std::uint32_t call) noexcept {
+  outbox.settleWithError(call, kErrorNoReply, "The call was given up without an answer");
 }
 
 }  // namespace vesk

@@ -9,10 +9,10 @@
 #include <vector>
 
 #include "platform/files/FileDescriptor.h"
-#include "platform/ipc/Answers.h"
 #include "platform/ipc/ExtensionTokens.h"
 #include "platform/ipc/IPCConnection.h"
 #include "platform/ipc/MessageReader.h"
+#include "platform/ipc/Outbox.h"
 #include "platform/ipc/Reply.h"
 
 namespace vesk {
@@ -23,9 +23,9 @@ namespace vesk {
 class IPCIncomingCall {
  public:
   /// `owner`: whose the descriptors are that `grant` keeps. All outlive the call.
-  IPCIncomingCall(Message& message, const std::shared_ptr<Answers>& answers, const ExtensionOwner& owner,
+  IPCIncomingCall(Message& message, const std::shared_ptr<Outbox>& outbox, const ExtensionOwner& owner,
                   const CodecLimits& limits) noexcept
-      : _message(message), _answers(answers), _owner(owner), _limits(limits) {}
+      : _message(message), _outbox(outbox), _owner(owner), _limits(limits) {}
 
   std::string_view member() const noexcept { return _message.header->member; }
   /// False for a one-way call: nothing that is answered goes anywhere.
@@ -53,14 +53,14 @@ class IPCIncomingCall {
   template <class... Arguments>
   [[nodiscard]] Reply<Arguments...> takeReply() {
     if (!owe()) return {};
-    auto send = [answers = _answers, call = _message.serial](const Arguments&... values) {
+    auto send = [outbox = _outbox, call = _message.serial](const Arguments&... values) {
       std::vector<IPCArgument> arguments;
       arguments.reserve(sizeof...(values));
       (arguments.emplace_back(std::in_place_type<Arguments>, values), ...);
-      answers->settle(call, arguments);
+      outbox->settle(call, arguments);
     };
     return Reply<Arguments...>(std::move(send),
-                               [answers = _answers, call = _message.serial] { abandon(*answers, call); });
+                               [outbox = _outbox, call = _message.serial] { abandon(*outbox, call); });
   }
 
   /// Whether it has ended in one of the four ways.
@@ -77,10 +77,10 @@ class IPCIncomingCall {
 
   bool refuseArguments(CodecResult result);
   bool owe();
-  static void abandon(Answers& answers, std::uint32_t call) noexcept;
+  static void abandon(Outbox& outbox, std::uint32_t call) noexcept;
 
   Message& _message;
-  const std::shared_ptr<Answers>& _answers;
+  const std::shared_ptr<Outbox>& _outbox;
   const ExtensionOwner& _owner;
   const CodecLimits& _limits;
   bool _settled = false;

@@ -3,49 +3,126 @@
 #include <utility>
 
 #include "platform/ipc/CallSize.h"
-#include "platform/ipc/Codec.h"
+#include "platform/log/SystemLog.h"
 
 namespace vesk {
+
+CodecResult Outbox::write(const OutgoingHeader& header, const std::vector<IPCArgument>& arguments) {
+  std::string message;
+  const auto result = appendMessage(header, ++_lastSerial, arguments, message);
+  MutexLock lock(_mutex);
+  if (result == CodecResult::Ok && !_closed) _answers.push_back(std::move(message));
+  return result;
+}
+
+void Outbox::lose(const std::exception& error) noexcept {
+  VESK_LOG_ERROR("ipc: An answer is lost: %s", error.what());
+  _isBroken = true;
+}
+
+void Outbox::send(std::uint32_t call, const std::vector<IPCArgument>& arguments) noexcept try {
+  const auto result = write({.type = MessageType::Answer, .replySerial = call}, arguments);
+  if (result == CodecResult::Ok) return;
+  VESK_LOG_ERROR("ipc: An answer can't be sent: %s", describe(result));
+  sendError(call, kErrorFailed, "The answer can't be sent");
+} catch (const std::exception& error) {
+  lose(error);
+}
+
+void Outbox::sendError(std::uint32_t call, const char* errorName, const char* text) noexcept try {
+  write({.type = MessageType::Error, .errorName = errorName, .replySerial = call},
+        {IPCArgument(std::string(text))});
+} catch (const std::exception& error) {
+  lose(error);
+}
+
+bool Outbox::owe() {
+  MutexLock lock(_mutex);
+  if (_owed >= kMaximumOwed) return false;
+  ++_owed;
+  return true;
+}
+
+void Outbox::settle(std::uint32_t call, const std::vector<IPCArgument>& arguments) noexcept {
+  send(call, arguments);
+  paid();
+}
+
+void Outbox::settleWithError(std::uint32_t call, const char* errorName, const char* text) noexcept {
+  sendError(call, errorName, text);
+  paid();
+}
+
+void Outbox::paid() noexcept {
+  {
+    MutexLock lock(_mutex);
+    --_owed;
+    if (_closed) return;
+  }
+  wake();
+}
+
+void Outbox::wake() const noexcept {
+  if (_wake && _thread.load() != std::this_thread::get_id()) _wake();
+}
 
 const char* Outbox::put(IPCOutgoingCall call) {
   if (isTooLarge(call, CodecLimits{})) return "the call is too large";
   const std::size_t memory = approximateMemory(call);
-  MutexLock lock(_mutex);
-  if (_closed) return "the connection has ended";
-  if (_entries.size() >= _maximumCalls || (!_entries.empty() && _memory + memory > kMaximumMemory)) {
-    return "too many calls wait for the client";
+  {
+    MutexLock lock(_mutex);
+    if (_closed) return "the connection has ended";
+    if (_calls.size() >= _maximumCalls || (!_calls.empty() && _memory + memory > kMaximumMemory)) {
+      return "too many calls wait for the client";
+    }
+    _calls.push_back({std::move(call), memory});
+    _memory += memory;
   }
-  _entries.push_back({std::move(call), memory});
-  _memory += memory;
+  wake();
   return nullptr;
 }
 
-std::optional<IPCOutgoingCall> Outbox::take() {
-  MutexLock lock(_mutex);
-  if (_entries.empty()) return std::nullopt;
-  Entry entry = std::move(_entries.front());
-  _entries.pop_front();
-  _memory -= entry.memory;
-  return std::move(entry.call);
+void Outbox::moveAnswersTo(Channel& channel) {
+  std::vector<std::string> answers;
+  {
+    MutexLock lock(_mutex);
+    if (_answers.empty()) return;
+    answers.swap(_answers);
+  }
+  for (const std::string& message : answers) {
+    channel.output() += message;
+    channel.queued();
+  }
 }
 
-void Outbox::lose() {
+std::optional<IPCOutgoingCall> Outbox::takeCall() {
+  MutexLock lock(_mutex);
+  if (_calls.empty()) return std::nullopt;
+  Call next = std::move(_calls.front());
+  _calls.pop_front();
+  _memory -= next.memory;
+  return std::move(next.call);
+}
+
+bool Outbox::hasCalls() const {
+  MutexLock lock(_mutex);
+  return !_calls.empty();
+}
+
+void Outbox::loseCall() {
   MutexLock lock(_mutex);
   ++_lost;
 }
 
-bool Outbox::empty() const {
-  MutexLock lock(_mutex);
-  return _entries.empty();
-}
-
 std::size_t Outbox::close() {
-  std::deque<Entry> forgotten;  // released after the lock
+  std::deque<Call> calls;  // released after the lock
+  std::vector<std::string> answers;
   MutexLock lock(_mutex);
   _closed = true;
   _memory = 0;
-  forgotten.swap(_entries);
-  return forgotten.size() + std::exchange(_lost, 0);
+  answers.swap(_answers);
+  calls.swap(_calls);
+  return calls.size() + std::exchange(_lost, 0);
 }
 
 }  // namespace vesk

@@ -1,46 +1,93 @@
-// Calls to one client that wait for its connection's thread. Private to platform/ipc.
+// What one connection is to send. Private to platform/ipc.
 #pragma once
 
+#include <atomic>
 #include <cstddef>
+#include <cstdint>
 #include <deque>
+#include <exception>
+#include <functional>
 #include <optional>
+#include <string>
+#include <thread>
+#include <vector>
 
+#include "platform/ipc/Channel.h"
 #include "platform/ipc/IPCConnection.h"
+#include "platform/ipc/MessageWriter.h"
 #include "platform/sync/Mutex.h"
 
 namespace vesk {
 
-/// Bounded by number and by memory, because a client that does not read must cost its session only so much.
-/// Thread-safe; its lock is a leaf.
+/// Answers to the peer's calls, written by whoever gives them, and calls to the peer wait here until the
+/// connection's thread takes them. Shared by the connection and every reply closure, which may outlive it:
+/// then an answer goes nowhere. Bounded, because a peer that does not read must cost its session only so
+/// much. Thread-safe; its lock is a leaf.
 class Outbox {
  public:
+  /// Calls of one peer that may be owed an answer. Calls are served one after another, so only a handler that
+  /// puts its answers off comes near this.
+  static constexpr std::size_t kMaximumOwed = 256;
   /// Bytes that all waiting calls hold together, unless there is only one, which may have
   /// `CodecLimits::content`.
   static constexpr std::size_t kMaximumMemory = std::size_t{4} << 20;
 
-  explicit Outbox(std::size_t maximumCalls) : _maximumCalls(maximumCalls) {}
+  /// `wake` makes the connection's thread take what waits; any other thread calls it.
+  explicit Outbox(std::size_t maximumCalls = 0, std::function<void()> wake = nullptr)
+      : _maximumCalls(maximumCalls), _wake(std::move(wake)) {}
+  /// Told by the connection's thread which it is: for its own answers it need not be woken.
+  void setThread(std::thread::id thread) noexcept { _thread.store(thread); }
+
+  /// Answers the call with that number, while it is served. An answer that can't be written becomes an error.
+  void send(std::uint32_t call, const std::vector<IPCArgument>& arguments) noexcept;
+  void sendError(std::uint32_t call, const char* errorName, const char* text) noexcept;
+
+  /// Notes that a call is answered later, by one of the next two. False when too many are.
+  [[nodiscard]] bool owe();
+  void settle(std::uint32_t call, const std::vector<IPCArgument>& arguments) noexcept;
+  void settleWithError(std::uint32_t call, const char* errorName, const char* text) noexcept;
 
   /// Null when the call was taken, else why it was not.
   const char* put(IPCOutgoingCall call);
-  std::optional<IPCOutgoingCall> take();
-  bool empty() const;
+
+  // On the connection's thread.
+
+  /// Puts the answers that wait into the channel's output.
+  void moveAnswersTo(Channel& channel);
+  std::optional<IPCOutgoingCall> takeCall();
+  bool hasCalls() const;
   /// Notes that a call which had been taken could not be sent.
-  void lose();
-  /// Refuses calls from now on and forgets those that wait; returns how many are lost, in all.
+  void loseCall();
+  /// Whether an answer could not even be written as an error. Its caller would wait for ever, so the
+  /// connection has to end.
+  bool isBroken() const noexcept { return _isBroken.load(); }
+  /// Forgets what waits and what will come; returns how many calls are lost, in all.
   std::size_t close();
 
  private:
-  struct Entry {
+  struct Call {
     IPCOutgoingCall call;
     std::size_t memory;
   };
 
+  CodecResult write(const OutgoingHeader& header, const std::vector<IPCArgument>& arguments);
+  void lose(const std::exception& error) noexcept;
+  void paid() noexcept;
+  void wake() const noexcept;
+
   const std::size_t _maximumCalls;
+  const std::function<void()> _wake;
+  std::atomic<std::uint32_t> _lastSerial{0};
+  std::atomic<bool> _isBroken{false};
+  std::atomic<std::thread::id> _thread{};
+
   mutable Mutex _mutex;
   bool _closed VESK_GUARDED_BY(_mutex) = false;
-  std::size_t _memory VESK_GUARDED_BY(_mutex) = 0;
+  std::size_t _owed VESK_GUARDED_BY(_mutex) = 0;
+  std::vector<std::string> _answers VESK_GUARDED_BY(_mutex);
+  std::deque<Call> _calls VESK_GUARDED_BY(_mutex);
+  std::size_t _memory VESK_GUARDED_BY(_mutex) = 0;  // of the calls
   std::size_t _lost VESK_GUARDED_BY(_mutex) = 0;
-  std::deque<Entry> _entries VESK_GUARDED_BY(_mutex);
 };
 
 }  // namespace vesk
