@@ -8,10 +8,10 @@
 #include <optional>
 #include <string>
 
-#include "backends/DashboardLinger.h"
 #include "backends/HeldBytes.h"
-#include "backends/RefusedPosts.h"
-#include "backends/UploadGate.h"
+#include "backends/dashboard/DashboardLinger.h"
+#include "backends/https/RefusedPosts.h"
+#include "backends/upload/UploadGate.h"
 #include "platform/http/HTTPClient.h"
 #include "platform/queue/TimedQueue.h"
 #include "platform/time/Clock.h"

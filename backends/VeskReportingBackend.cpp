@@ -2,17 +2,17 @@
 
 #include <VeskReporting/VeskReportingKeys.h>
 
-#include "backends/DashboardBackend.h"
-#include "backends/HTTPSPostBackend.h"
-#include "backends/KilnarBackend.h"
-#include "backends/UploadBackend.h"
-#include "backends/WrenBackend.h"
+#include "backends/dashboard/DashboardBackend.h"
+#include "backends/https/HTTPSPostBackend.h"
+#include "backends/kilnar/KilnarBackend.h"
+#include "backends/upload/UploadBackend.h"
+#include "backends/wren/WrenBackend.h"
 #include "platform/crypto/Digest.h"
 #include "platform/log/SystemLog.h"
 #include "platform/text/ASCII.h"
-#include "platform/values/Conversions.h"
 #include "util/ReportingdUtil.h"
 #include "util/SamplingDraw.h"
+#include "values/Conversions.h"
 
 namespace vesk {
 

@@ -10,11 +10,11 @@
 #include <string>
 #include <string_view>
 
+#include <VeskReporting/values/Value.h>
 #include "backends/BackendServices.h"
-#include "backends/EventBatch.h"
+#include "backends/https/EventBatch.h"
 #include "platform/sync/Mutex.h"
 #include "platform/sync/Snapshot.h"
-#include "platform/values/Value.h"
 
 namespace vesk {
 

@@ -5,8 +5,8 @@
 #include <cstdlib>
 #include <filesystem>
 
-#include "backends/DashboardBackend.h"
-#include "backends/DashboardText.h"
+#include "backends/dashboard/DashboardBackend.h"
+#include "backends/dashboard/DashboardText.h"
 #include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
 #include "platform/queue/TimedQueuePool.h"

@@ -9,7 +9,7 @@
 #include <fstream>
 #include <string>
 
-#include "backends/DashboardDatagram.h"
+#include "backends/dashboard/DashboardDatagram.h"
 #include "platform/net/UDPSocket.h"
 
 int main(int argc, char** argv) {

@@ -1,8 +1,8 @@
 #include "client/AggregationReceiver.h"
 
-#include "client/protocol/WireNames.h"
 #include "platform/ipc/IPCIncomingCall.h"
 #include "platform/log/SystemLog.h"
+#include "protocol/WireNames.h"
 
 namespace vesk {
 

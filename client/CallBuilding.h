@@ -5,8 +5,8 @@
 #include <utility>
 
 #include "client/ClientCall.h"
-#include "client/protocol/WireNames.h"
 #include "platform/ipc/CallSize.h"
+#include "protocol/WireNames.h"
 
 namespace vesk {
 

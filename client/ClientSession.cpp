@@ -7,9 +7,9 @@
 #include <string>
 
 #include "client/DrainBudget.h"
-#include "client/protocol/WireNames.h"
 #include "platform/ipc/MessageWriter.h"
 #include "platform/log/SystemLog.h"
+#include "protocol/WireNames.h"
 
 namespace vesk {
 

@@ -6,8 +6,8 @@
 #include <system_error>
 #include <utility>
 
-#include "client/protocol/WireNames.h"
 #include "platform/files/RootPrefix.h"
+#include "protocol/WireNames.h"
 
 namespace vesk {
 

@@ -45,7 +45,7 @@ else()
   add_link_options(-Wl,-z,relro,-z,now)
 endif()
 
-include_directories(${PROJECT_SOURCE_DIR} ${PROJECT_SOURCE_DIR}/client/include ${PROJECT_BINARY_DIR}/include)
+include_directories(${PROJECT_SOURCE_DIR})
 
 # vesk_library(NAME SOURCES… [LINK …]): a static library of one directory's units.
 function(vesk_library name)

@@ -1,13 +1,13 @@
 #include "daemon/Daemon.h"
 
-#include <VeskReporting/VeskReporting.h>
 #include <VeskReporting/VeskReportingKeys.h>
 
 #include <algorithm>
 #include <chrono>
 #include <utility>
 
-#include "client/protocol/WireNames.h"
+#include "common/PersistentIdentifiers.h"
+#include "common/Resources.h"
 #include "daemon/ReportingdAgent.h"
 #include "platform/device/DeviceInformation.h"
 #include "platform/files/RootPrefix.h"
@@ -17,6 +17,7 @@
 #include "platform/powerlog/PowerLog.h"
 #include "platform/queue/TimedQueuePool.h"
 #include "platform/service/DescriptorLimit.h"
+#include "protocol/WireNames.h"
 #include "storebag/StorebagNaming.h"
 #include "util/Counters.h"
 
@@ -104,15 +105,13 @@ struct Daemon::Parts {
                         WallClock::system(),
                         Counters::shared(),
                         networkQueues,
-                        [](bool respectsConsent) {
-                          return VeskReporting::getPersistentIdentifierForDNU(respectsConsent);
-                        },
+                        [](bool respectsConsent) { return persistentIdentifierForDNU(respectsConsent); },
                         diagnosticsSubmissionConsent,
                         regionCode,
                         std::make_shared<UploadGate>(),
                         std::make_shared<PowerLog>(powerLogOptions()),
                         dashboardLinger()},
-        sessionServices{backendServices, VeskReporting::version()},
+        sessionServices{backendServices, clientLibraryVersion()},
         http(httpOptions(busyMarker)),
         agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetcher(), busyMarker)),
         listener(listenerOptions(serviceManager)) {
@@ -121,7 +120,7 @@ struct Daemon::Parts {
   }
 
   StorebagFetcher storebagFetcher() {
-    return [this, library = LibraryFacts{sessionServices.libraryVersion, VeskReporting::publicKey}](
+    return [this, library = LibraryFacts{sessionServices.libraryVersion, publicKeyDER}](
                std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version,
                bool& notModified, std::optional<std::string>& lastModified) {
       return fetchStorebagForEnvironmentAndClientType(http, library, clientType, maxAge, version, notModified,

@@ -5,8 +5,8 @@
 #include <algorithm>
 #include <cstdio>
 
-#include "client/protocol/ClientSessionStub.h"
 #include "platform/log/SystemLog.h"
+#include "protocol/ClientSessionStub.h"
 #include "util/ReportingdUtil.h"
 
 namespace vesk {

@@ -8,8 +8,8 @@
 #include <optional>
 #include <string>
 
+#include <VeskReporting/values/Value.h>
 #include "platform/time/Clock.h"
-#include "platform/values/Value.h"
 #include "storebag/StorebagFetch.h"
 
 namespace vesk {

@@ -3,8 +3,8 @@
 #include <cstdint>
 #include <cstdlib>
 
-#include "backends/DashboardDelivery.h"
-#include "backends/DashboardText.h"
+#include "backends/dashboard/DashboardDelivery.h"
+#include "backends/dashboard/DashboardText.h"
 #include "platform/unicode/UTF8.h"
 #include "tests/support/SimulatedQueues.h"
 #include "tools/collector/ReceivedDatagram.h"

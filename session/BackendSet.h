@@ -9,8 +9,8 @@
 #include <utility>
 #include <vector>
 
+#include <VeskReporting/values/Value.h>
 #include "backends/VeskReportingBackend.h"
-#include "platform/values/Value.h"
 
 namespace vesk {
 

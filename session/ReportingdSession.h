@@ -12,10 +12,10 @@
 #include <string>
 
 #include "backends/BackendServices.h"
-#include "client/protocol/ClientSessionInterface.h"
 #include "platform/ipc/IPCConnection.h"
 #include "platform/ipc/WarningBurst.h"
 #include "platform/sync/Mutex.h"
+#include "protocol/ClientSessionInterface.h"
 #include "session/BackendSet.h"
 #include "session/ReportingdSessionDelegate.h"
 

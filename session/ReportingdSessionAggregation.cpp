@@ -1,8 +1,8 @@
 // A session and its relatives: user info, aggregation, combined session IDs.
 #include <VeskReporting/VeskReportingKeys.h>
 
-#include "client/protocol/ClientSessionReplyProxy.h"
 #include "platform/log/SystemLog.h"
+#include "protocol/ClientSessionReplyProxy.h"
 #include "session/ReportingdSession.h"
 #include "util/ReportingdUtil.h"
 

@@ -5,8 +5,8 @@
 #include <optional>
 #include <string>
 
+#include <VeskReporting/values/Value.h>
 #include "platform/sync/Mutex.h"
-#include "platform/values/Value.h"
 
 namespace vesk {
 

@@ -1,7 +1,7 @@
 // The storebag that stands in for one that can't be reached.
 #pragma once
 
-#include "platform/values/Value.h"
+#include <VeskReporting/values/Value.h>
 
 namespace vesk {
 

@@ -9,11 +9,11 @@
 #include "platform/log/SystemLog.h"
 #include "platform/plist/PropertyList.h"
 #include "platform/text/ASCII.h"
-#include "platform/values/Conversions.h"
 #include "storebag/StorebagFallback.h"
 #include "storebag/StorebagNaming.h"
 #include "storebag/StorebagProfile.h"
 #include "storebag/StorebagSignature.h"
+#include "values/Conversions.h"
 
 namespace vesk {
 

@@ -7,8 +7,8 @@
 #include <string>
 #include <string_view>
 
+#include <VeskReporting/values/Value.h>
 #include "platform/http/HTTPClient.h"
-#include "platform/values/Value.h"
 
 namespace vesk {
 

@@ -6,8 +6,8 @@
 
 #include "platform/log/SystemLog.h"
 #include "platform/preferences/PreferencesSuite.h"
-#include "platform/values/Conversions.h"
 #include "util/ReportingdUtil.h"
+#include "values/Conversions.h"
 
 namespace vesk {
 

@@ -1,7 +1,7 @@
 #include "storebag/StorebagProfile.h"
 
 #include "platform/log/SystemLog.h"
-#include "platform/values/Conversions.h"
+#include "values/Conversions.h"
 
 namespace vesk {
 

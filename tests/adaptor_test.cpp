@@ -8,7 +8,7 @@
 #include <filesystem>
 #include <future>
 
-#include "backends/WrenBackend.h"
+#include "backends/wren/WrenBackend.h"
 #include "platform/files/RootPrefix.h"
 #include "tests/support/BackendHarness.h"
 #include "tests/support/CapturedLog.h"

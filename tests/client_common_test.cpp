@@ -9,7 +9,7 @@
 #include <set>
 #include <thread>
 
-#include "client/common/PersistentIdentifiers.h"
+#include "common/PersistentIdentifiers.h"
 #include "platform/files/FileDescriptor.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/TestRoot.h"

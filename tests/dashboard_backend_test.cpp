@@ -1,8 +1,8 @@
 // The dashboard backend: its profile, datagrams to the byte, log lines, log data.
 #include <gtest/gtest.h>
 
-#include "backends/DashboardBackend.h"
-#include "backends/DashboardText.h"
+#include "backends/dashboard/DashboardBackend.h"
+#include "backends/dashboard/DashboardText.h"
 #include "platform/plist/KeyedArchive.h"
 #include "tests/support/BackendHarness.h"
 #include "tests/support/CapturedLog.h"

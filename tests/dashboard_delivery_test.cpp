@@ -3,7 +3,7 @@
 
 #include <numeric>
 
-#include "backends/DashboardDelivery.h"
+#include "backends/dashboard/DashboardDelivery.h"
 #include "platform/queue/TimedQueuePool.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/DashboardServer.h"

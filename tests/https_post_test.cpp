@@ -1,5 +1,5 @@
 // Posts on the wire, and what their answers do.
-#include "backends/RefusedPosts.h"
+#include "backends/https/RefusedPosts.h"
 #include "tests/support/HTTPSBackendTest.h"
 #include "tests/support/TestRoot.h"
 #include "util/Gzip.h"

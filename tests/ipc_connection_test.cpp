@@ -4,9 +4,9 @@
 
 #include <future>
 
-#include "client/protocol/ClientSessionReplyProxy.h"
 #include "platform/ipc/ExtensionTokens.h"
 #include "platform/ipc/UnixSocket.h"
+#include "protocol/ClientSessionReplyProxy.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/IPCHarness.h"
 

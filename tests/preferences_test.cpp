@@ -7,9 +7,9 @@
 #include <cstdlib>
 
 #include "platform/preferences/TomlFile.h"
-#include "platform/values/Conversions.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/TestRoot.h"
+#include "values/Conversions.h"
 
 namespace vesk::test {
 namespace {

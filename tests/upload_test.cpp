@@ -11,7 +11,7 @@
 #include <future>
 #include <thread>
 
-#include "backends/UploadBackend.h"
+#include "backends/upload/UploadBackend.h"
 #include "platform/ipc/ExtensionTokens.h"
 #include "platform/queue/TimedQueuePool.h"
 #include "tests/support/CapturedLog.h"

@@ -7,10 +7,10 @@
 
 #include "platform/device/DeviceInformation.h"
 #include "platform/device/FirmwareFacts.h"
-#include "platform/values/Conversions.h"
 #include "tests/support/TestRoot.h"
 #include "util/ReportingdUtil.h"
 #include "util/URLQuery.h"
+#include "values/Conversions.h"
 
 namespace vesk::test {
 namespace {

@@ -9,7 +9,7 @@
 #include <type_traits>
 #include <variant>
 
-#include "platform/values/Text.h"
+#include <VeskReporting/values/Text.h>
 
 namespace vesk {
 

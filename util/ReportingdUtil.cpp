@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <cstring>
 
-#include "client/include/VeskReporting/VeskReportingKeys.h"
+#include <VeskReporting/VeskReportingKeys.h>
 #include "platform/device/DeviceInformation.h"
 #include "platform/unicode/Unicode.h"
 

@@ -7,7 +7,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/values/Value.h"
+#include <VeskReporting/values/Value.h>
 
 namespace vesk {
 

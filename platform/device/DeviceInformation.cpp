@@ -18,7 +18,7 @@
 #include "platform/text/ASCII.h"
 #include "platform/unicode/UTF8.h"
 #include "platform/unicode/Unicode.h"
-#include "platform/values/Conversions.h"
+#include "values/Conversions.h"
 
 namespace vesk {
 

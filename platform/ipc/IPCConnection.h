@@ -12,7 +12,7 @@
 #include <variant>
 #include <vector>
 
-#include "platform/values/Value.h"
+#include <VeskReporting/values/Value.h>
 
 namespace vesk {
 

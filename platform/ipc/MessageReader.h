@@ -9,11 +9,11 @@
 #include <string_view>
 #include <vector>
 
+#include <VeskReporting/values/Value.h>
 #include "platform/ipc/Codec.h"
 #include "platform/ipc/Message.h"
 #include "platform/ipc/Signature.h"
 #include "platform/ipc/WireCursor.h"
-#include "platform/values/Value.h"
 
 namespace vesk {
 

@@ -8,7 +8,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/values/Value.h"
+#include <VeskReporting/values/Value.h>
 
 namespace vesk {
 

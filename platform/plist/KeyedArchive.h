@@ -5,8 +5,8 @@
 #include <string>
 #include <string_view>
 
+#include <VeskReporting/values/Value.h>
 #include "platform/plist/PropertyList.h"
-#include "platform/values/Value.h"
 
 namespace vesk {
 

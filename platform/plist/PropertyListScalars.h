@@ -5,7 +5,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/values/Value.h"
+#include <VeskReporting/values/Value.h>
 
 namespace vesk {
 

@@ -7,7 +7,7 @@
 #include "platform/json/JSONWriter.h"
 #include "platform/log/SystemLog.h"
 #include "platform/powerlog/PowerLogStore.h"
-#include "platform/values/Conversions.h"
+#include "values/Conversions.h"
 
 namespace vesk {
 

@@ -12,10 +12,10 @@
 #include <thread>
 #include <vector>
 
+#include <VeskReporting/values/Value.h>
 #include "platform/powerlog/PowerLogEvent.h"
 #include "platform/sync/Mutex.h"
 #include "platform/time/Clock.h"
-#include "platform/values/Value.h"
 
 namespace vesk {
 

@@ -10,8 +10,8 @@
 #include <string>
 #include <vector>
 
+#include <VeskReporting/values/Value.h>
 #include "platform/files/FileDescriptor.h"
-#include "platform/values/Value.h"
 
 namespace vesk::test {
 

@@ -6,7 +6,7 @@
 
 #include <filesystem>
 
-#include "backends/DashboardDatagram.h"
+#include "backends/dashboard/DashboardDatagram.h"
 #include "platform/net/UDPSocket.h"
 
 namespace vesk::test {

@@ -3,7 +3,7 @@
 
 #include <gtest/gtest.h>
 
-#include "backends/HTTPSPostBackend.h"
+#include "backends/https/HTTPSPostBackend.h"
 #include "tests/support/BackendHarness.h"
 #include "tests/support/CapturedLog.h"
 

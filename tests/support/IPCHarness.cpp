@@ -4,10 +4,10 @@
 #include <poll.h>
 #include <sys/socket.h>
 
-#include "client/protocol/ClientSessionReplyProxy.h"
-#include "client/protocol/ClientSessionStub.h"
 #include "platform/ipc/IPCIncomingCall.h"
 #include "platform/ipc/UnixSocket.h"
+#include "protocol/ClientSessionReplyProxy.h"
+#include "protocol/ClientSessionStub.h"
 
 namespace vesk::test {
 

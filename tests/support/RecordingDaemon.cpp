@@ -1,8 +1,8 @@
 #include "tests/support/RecordingDaemon.h"
 
-#include "client/protocol/ClientSessionReplyProxy.h"
-#include "client/protocol/ClientSessionStub.h"
-#include "client/protocol/WireNames.h"
+#include "protocol/ClientSessionReplyProxy.h"
+#include "protocol/ClientSessionStub.h"
+#include "protocol/WireNames.h"
 
 namespace vesk::test {
 

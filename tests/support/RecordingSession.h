@@ -10,8 +10,8 @@
 #include <functional>
 #include <mutex>
 
-#include "client/protocol/ClientSessionInterface.h"
 #include "platform/ipc/ExtensionTokens.h"
+#include "protocol/ClientSessionInterface.h"
 
 namespace vesk::test {
 

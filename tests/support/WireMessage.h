@@ -4,7 +4,7 @@
 #include <string>
 #include <string_view>
 
-#include "client/protocol/WireNames.h"
+#include "protocol/WireNames.h"
 
 namespace vesk::test {
 

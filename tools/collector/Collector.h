@@ -9,7 +9,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/values/Value.h"
+#include <VeskReporting/values/Value.h>
 #include "tools/collector/Console.h"
 #include "tools/collector/DashboardReceiver.h"
 #include "tools/storebag/StorebagSource.h"

@@ -4,7 +4,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/values/Value.h"
+#include <VeskReporting/values/Value.h>
 #include "tools/collector/HTTPMessage.h"
 
 namespace vesk {

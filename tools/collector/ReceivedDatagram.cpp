@@ -1,6 +1,6 @@
 #include "tools/collector/ReceivedDatagram.h"
 
-#include "backends/SenderCodes.h"
+#include "backends/https/SenderCodes.h"
 #include "platform/json/JSONWriter.h"
 #include "tools/collector/EventText.h"
 #include "tools/text/Printable.h"

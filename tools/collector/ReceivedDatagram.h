@@ -5,9 +5,9 @@
 #include <string>
 #include <string_view>
 
-#include "backends/DashboardDatagram.h"
+#include <VeskReporting/values/Value.h>
+#include "backends/dashboard/DashboardDatagram.h"
 #include "platform/time/Clock.h"
-#include "platform/values/Value.h"
 
 namespace vesk {
 

@@ -5,9 +5,9 @@
 #include <span>
 #include <string_view>
 
-#include "client/include/VeskReporting/VeskReportingKeys.h"
+#include <VeskReporting/VeskReportingKeys.h>
 #include "platform/net/UDPSocket.h"
-#include "platform/values/Conversions.h"
+#include "values/Conversions.h"
 
 namespace vesk {
 

@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/values/Value.h"
+#include <VeskReporting/values/Value.h>
 
 namespace vesk {
 

@@ -3,7 +3,7 @@
 
 #include <string>
 
-#include "platform/values/Value.h"
+#include <VeskReporting/values/Value.h>
 
 namespace vesk {
 

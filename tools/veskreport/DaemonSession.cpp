@@ -2,8 +2,8 @@
 
 #include <random>
 
-#include "client/protocol/WireNames.h"
 #include "platform/files/RootPrefix.h"
+#include "protocol/WireNames.h"
 #include "tools/veskreport/PayloadParser.h"
 
 namespace vesk {

@@ -5,7 +5,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/values/Value.h"
+#include <VeskReporting/values/Value.h>
 
 namespace vesk {
 

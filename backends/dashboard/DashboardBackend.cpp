@@ -1,0 +1,183 @@
+#include "backends/dashboard/DashboardBackend.h"
+
+#include <algorithm>
+#include <exception>
+#include <new>
+#include <utility>
+
+#include "backends/dashboard/DashboardText.h"
+#include "platform/log/SystemLog.h"
+#include "storebag/StorebagProfile.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr char kQueueLabel[] = "com.corvane.VeskReporting.networkProc";
+/// Longer than anything lives; the clock still holds a time that far away.
+constexpr auto kLongestTick =
+    std::chrono::duration_cast<std::chrono::milliseconds>(TimedQueue::Clock::duration::max()) / 4;
+constexpr std::int64_t kMicrosecondsPerStep = 4000;
+
+/// What a profile says of the server and the delivery.
+struct Settings {
+  IPv4Endpoint server;
+  bool isReliable = true;
+  std::chrono::milliseconds tick = DashboardDelivery::kDefaultTick;
+};
+
+/// What is no address stands for all ones, to which nothing can be connected.
+IPv4Endpoint serverAt(std::string_view ip, std::uint16_t port) {
+  return IPv4Endpoint::parse(ip, port).value_or(IPv4Endpoint{0xFFFF'FFFF, port});
+}
+
+std::chrono::milliseconds tickFrom(std::int64_t reliable) {
+  if (reliable > 0) return std::min(std::chrono::milliseconds(reliable), kLongestTick);
+  VESK_LOG_WARNING("DashboardBackend(initWithName): 'reliable' can't be %lld ms, using %d ms",
+                   static_cast<long long>(reliable),
+                   static_cast<int>(DashboardDelivery::kDefaultTick.count()));
+  return DashboardDelivery::kDefaultTick;
+}
+
+/// Nothing, and a line, when the server can't be told.
+std::optional<Settings> settingsFrom(const std::string& name, const Dictionary& profile) {
+  auto ip = profileText(name, profile, "ip");
+  if (!ip) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): can't resolve server IP");
+    return std::nullopt;
+  }
+  auto port = profileIntegerOrNumericText(name, profile, "port");
+  if (!port) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): can't resolve server port");
+    return std::nullopt;
+  }
+  auto reliable = profileIntegerOrNumericText(name, profile, "reliable");
+  return Settings{serverAt(*ip, static_cast<std::uint16_t>(*port)), reliable.has_value(),
+                  reliable ? tickFrom(*reliable) : DashboardDelivery::kDefaultTick};
+}
+
+std::optional<Settings> settingsFrom(const std::optional<std::string>& serverIP, std::uint16_t serverPort) {
+  if (!serverIP) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): initWitName with all null params.");
+    return std::nullopt;
+  }
+  return Settings{serverAt(*serverIP, serverPort)};
+}
+
+std::shared_ptr<TimedQueue> networkQueue(const BackendServices& services) {
+  try {
+    return services.networkQueues.makeQueue(kQueueLabel);
+  } catch (const std::exception&) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): can't create timer source.");
+    return nullptr;
+  }
+}
+
+}  // namespace
+
+std::shared_ptr<DashboardBackend> DashboardBackend::create(const std::string& name,
+                                                           const std::optional<Dictionary>& profile,
+                                                           const std::optional<Text>& productFamily,
+                                                           const BackendServices& services) {
+  return createConnected(name, profile, std::nullopt, 0, productFamily, services);
+}
+
+std::shared_ptr<DashboardBackend> DashboardBackend::create(const std::string& name,
+                                                           const std::optional<std::string>& serverIP,
+                                                           std::uint16_t serverPort,
+                                                           const std::optional<Text>& productFamily,
+                                                           const BackendServices& services) {
+  if (!serverIP) return nullptr;
+  return createConnected(name, std::nullopt, serverIP, serverPort, productFamily, services);
+}
+
+std::shared_ptr<DashboardBackend> DashboardBackend::createConnected(
+    const std::string& name, const std::optional<Dictionary>& profile,
+    const std::optional<std::string>& serverIP, std::uint16_t serverPort,
+    const std::optional<Text>& productFamily, const BackendServices& services) {
+  auto settings = profile ? settingsFrom(name, *profile) : std::nullopt;
+  if (profile && !settings) return nullptr;
+  UDPSocket socket;
+  if (int error = socket.open()) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): socket() failed (%d)", error);
+    return nullptr;
+  }
+  auto queue = networkQueue(services);
+  if (!queue) return nullptr;
+  auto delivery = std::make_shared<DashboardDelivery>(std::move(socket), std::move(queue),
+                                                      services.dashboardLinger, services.counters, name);
+  std::shared_ptr<DashboardBackend> backend(
+      new DashboardBackend(name, profile, productFamily.value_or(Text()), delivery, services));
+  if (!profile) settings = settingsFrom(serverIP, serverPort);
+  if (!settings) return nullptr;  // the backend's end gives everything back, here and below
+  if (settings->isReliable) delivery->useReliableUDP();
+  if (!delivery->connect(settings->server)) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): socket connect() failed.");
+    return nullptr;
+  }
+  if (!delivery->start(settings->tick)) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): can't create timer source.");
+    return nullptr;
+  }
+  return backend;
+}
+
+DashboardBackend::DashboardBackend(const std::string& name, const std::optional<Dictionary>& profile,
+                                   const Text& productFamily, std::shared_ptr<DashboardDelivery> delivery,
+                                   const BackendServices& services)
+    : VeskReportingBackend(name, profile.value_or(Dictionary()), productFamily, services),
+      _usingProfile(profile.has_value()),
+      _postURL(profileText(name, _profile, "post_url")),
+      _delivery(std::move(delivery)) {
+  MutexLock lock(_mutex);
+  _displayURL = profileText(name, _profile, "display_url");
+}
+
+// For a backend that its session never came to clean up. Without memory the delivery isn't told, and lets go
+// of everything once nothing is pending any more.
+DashboardBackend::~DashboardBackend() {
+  try {
+    _delivery->cleanup();
+  } catch (const std::exception&) {
+  }
+}
+
+DashboardHeader DashboardBackend::headerFor(const timeval& timestamp, std::uint16_t method,
+                                            std::uint16_t respCode, std::uint16_t eventID) const {
+  DashboardHeader header;
+  header.subsecond = static_cast<std::uint8_t>(timestamp.tv_usec / kMicrosecondsPerStep);
+  header.seconds = static_cast<std::uint32_t>(timestamp.tv_sec);
+  header.method = method;
+  header.respCode = respCode;
+  header.eventID = eventID;
+  header.isReliable = _delivery->isReliable();
+  header.isWithoutProfile = !_usingProfile;
+  MutexLock lock(_mutex);
+  header.libraryVersionMajor = _selfVersionMajor;
+  header.clientType = static_cast<std::uint8_t>(_compType);
+  header.sessionID = _sessionID;
+  header.clientVersion = _clientVersion;
+  std::copy_n(_udid.begin(), std::min(_udid.size(), header.deviceID.size()), header.deviceID.begin());
+  return header;
+}
+
+std::optional<std::string> DashboardBackend::sendMessageInTurn(const std::optional<Dictionary>& payload,
+                                                               const timeval& timestamp, std::uint16_t method,
+                                                               std::uint16_t respCode, std::uint16_t eventID,
+                                                               std::int32_t) {
+  std::unique_ptr<DashboardDelivery::Buffer> buffer(new (std::nothrow) DashboardDelivery::Buffer);
+  if (!buffer) {
+    VESK_LOG_ERROR("DashboardBackend(sendMessage): can't malloc.");
+    return std::nullopt;
+  }
+  DashboardHeader header = headerFor(timestamp, method, respCode, eventID);
+  const std::size_t textLength =
+      payload ? writePayloadText(*payload, buffer->data() + kDashboardHeaderSize, kDashboardTextArea) : 0;
+  header.length = static_cast<std::uint16_t>(kDashboardHeaderSize + textLength);
+  encodeDashboardHeader(header, buffer->data());
+  auto line = writeLocalLog({buffer->data(), header.length});
+  _delivery->send(std::move(buffer), header.length, eventID);
+  return line;
+}
+
+}  // namespace vesk

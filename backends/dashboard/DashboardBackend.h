@@ -1,0 +1,66 @@
+// The backend that reports each message as one UDP datagram to a dashboard.
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "backends/VeskReportingBackend.h"
+#include "backends/dashboard/DashboardDelivery.h"
+
+namespace vesk {
+
+/// Encodes messages on the session's thread and hands the datagrams to its delivery, which does the rest on
+/// its own queue and may outlive the backend (DashboardDelivery.h). The text of a datagram is the answer.
+class DashboardBackend final : public VeskReportingBackend {
+ public:
+  /// From a storebag's profile. Null, and a level-3 line, when the profile or the system doesn't allow it.
+  static std::shared_ptr<DashboardBackend> create(const std::string& name,
+                                                  const std::optional<Dictionary>& profile,
+                                                  const std::optional<Text>& productFamily,
+                                                  const BackendServices& services);
+  /// Without a profile; delivery is reliable. Null, without a line, when there is no address.
+  static std::shared_ptr<DashboardBackend> create(const std::string& name,
+                                                  const std::optional<std::string>& serverIP,
+                                                  std::uint16_t serverPort,
+                                                  const std::optional<Text>& productFamily,
+                                                  const BackendServices& services);
+  ~DashboardBackend() override;
+
+  /// Uploads `logData` as keyed archive and announces where the server put it; waits for its turn among the
+  /// uploads of its size (UploadGate.h) and then for the server, 120 s at most, without any lock.
+  bool uploadLogData(const List& logData) override;
+
+  bool isReliable() const noexcept { return _delivery->isReliable(); }
+
+ protected:
+  std::optional<std::string> sendMessageInTurn(const std::optional<Dictionary>& payload,
+                                               const timeval& timestamp, std::uint16_t method,
+                                               std::uint16_t respCode, std::uint16_t eventID,
+                                               std::int32_t flag) override VESK_REQUIRES(_sendMutex)
+      VESK_EXCLUDES(_mutex);
+  void cleanupInTurn() override VESK_REQUIRES(_sendMutex) { _delivery->cleanup(); }
+
+ private:
+  DashboardBackend(const std::string& name, const std::optional<Dictionary>& profile,
+                   const Text& productFamily, std::shared_ptr<DashboardDelivery> delivery,
+                   const BackendServices& services);
+
+  static std::shared_ptr<DashboardBackend> createConnected(const std::string& name,
+                                                           const std::optional<Dictionary>& profile,
+                                                           const std::optional<std::string>& serverIP,
+                                                           std::uint16_t serverPort,
+                                                           const std::optional<Text>& productFamily,
+                                                           const BackendServices& services);
+
+  /// All but the length.
+  DashboardHeader headerFor(const timeval& timestamp, std::uint16_t method, std::uint16_t respCode,
+                            std::uint16_t eventID) const VESK_EXCLUDES(_mutex);
+
+  // Constant after construction.
+  const bool _usingProfile;
+  const std::optional<std::string> _postURL;
+  const std::shared_ptr<DashboardDelivery> _delivery;
+};
+
+}  // namespace vesk

@@ -1,0 +1,264 @@
+#include "backends/https/HTTPSPostBackend.h"
+
+#include "platform/log/SystemLog.h"
+#include "storebag/StorebagNaming.h"
+#include "storebag/StorebagProfile.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::uint16_t kSessionTypeStop = 1;
+constexpr std::size_t kMostMethods = 65'536;
+
+// The device's facts hold for all sessions alike, so one line a process is enough.
+void noteMissingFamily(const std::string& name) {
+  static std::atomic<bool> noted{false};
+  if (noted.exchange(true)) return;
+  VESK_LOG_WARNING(
+      "HTTPSPostBackend(initWithName): the device has no product family (DeviceName), so there is no backend "
+      "%s",
+      name.c_str());
+}
+
+}  // namespace
+
+std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::create(const std::string& name,
+                                                           const std::optional<Dictionary>& profile,
+                                                           const std::optional<Text>& productFamily,
+                                                           const BackendServices& services) {
+  if (!productFamily) noteMissingFamily(name);
+  if (!profile || !productFamily) return nullptr;
+  if (!profileList(name, *profile, "clients")) {
+    VESK_LOG_ERROR("HTTPSPostBackend(initWithName): can't find the client list.");
+    return nullptr;
+  }
+  return std::shared_ptr<HTTPSPostBackend>(new HTTPSPostBackend(name, *profile, *productFamily, services));
+}
+
+HTTPSPostBackend::HTTPSPostBackend(const std::string& name, const Dictionary& profile,
+                                   const Text& productFamily, const BackendServices& services)
+    : VeskReportingBackend(name, profile, productFamily, services),
+      _dnuEnabled(services.diagnosticsSubmissionConsent()),
+      _uuidRespectDnu(services.persistentIdentifierForDNU(true)),
+      _uuidOverrideDnu(services.persistentIdentifierForDNU(false)),
+      _eventThreshold(kDefaultEventThreshold) {
+  MutexLock lock(_mutex);
+  _postURL = preferenceStringForKey("httpsPostURL");
+  if (_postURL) {
+    VESK_LOG_DEBUG("HTTPSPostBackend(initWithName): Using user default '%s' for postURL", _postURL->c_str());
+  }
+  _useDefaultPostURL = _postURL.has_value();
+  _realtimePostURL = preferenceStringForKey("httpsRealtimePostURL");
+  if (_realtimePostURL) {
+    VESK_LOG_DEBUG("HTTPSPostBackend(initWithName): Using user default '%s' for realtimePostURL",
+                   _realtimePostURL->c_str());
+  }
+  _useDefaultRealtimePostURL = _realtimePostURL.has_value();
+  _displayURL = profileText(name, profile, "display_url");
+}
+
+HTTPSPostBackend::~HTTPSPostBackend() {
+  MutexLock lock(_mutex);
+  // Events that never found the backend enabled leave no other trace.
+  if (holdsEvents()) _services.counters.count(_name, DropReason::NeverEnabled, _batchedEvents->size());
+}
+
+std::optional<std::string> HTTPSPostBackend::postURL() const {
+  MutexLock lock(_mutex);
+  return _postURL;
+}
+
+void HTTPSPostBackend::setPostURL(const std::optional<std::string>& url) {
+  MutexLock lock(_mutex);
+  _postURL = url;
+}
+
+// --- One message
+
+std::optional<std::string> HTTPSPostBackend::sendMessageInTurn(const std::optional<Dictionary>& payload,
+                                                               const timeval& timestamp, std::uint16_t method,
+                                                               std::uint16_t respCode, std::uint16_t eventID,
+                                                               std::int32_t flag) {
+  if (state() == BackendStateDisabled) {
+    _services.counters.count(_name, DropReason::StateDisabled);
+    return std::nullopt;
+  }
+  // The event gets its place before the lock is released: what relatives change while a body is built then
+  // reaches it among the held events.
+  PostToBuild earlier;
+  PostToBuild own;
+  bool batchEvents = false;
+  bool requireUserInfo = false;
+  {
+    MutexLock lock(_mutex);
+    MutableDictionary event = respCode == kSessionTypeStop
+                                  ? createEventDictfromPayload(payloadWithStopEntries(payload), timestamp,
+                                                               method, respCode, eventID)
+                                  : createEventDictfromPayload(payload, timestamp, method, respCode, eventID);
+    prepareEventForMessage(event);
+    if (isOverridingSampling(flag)) {
+      std::int32_t expected = BackendStateOverride;  // a completion may just switch the backend off
+      _state.compare_exchange_strong(expected, BackendStateEnabled);
+    }
+    batchEvents = _batchEvents;
+    requireUserInfo = _requireUserInfo;
+    if (mustHold(flag)) {
+      earlier = batchEvent(std::move(event));
+    } else {
+      earlier = takeBatchBeforeSingleEvent();
+      own = takeSingleEvent(std::move(event), method, respCode, flag);
+    }
+  }
+  if (earlier) buildAndPost(std::move(earlier));
+  if (!own) {
+    boundHeldEvents();
+    return std::nullopt;
+  }
+  VESK_LOG_DEBUG("HTTPSPostBackend(sendMessage): Sending %d, %d, %d", state(), batchEvents, requireUserInfo);
+  return buildAndPost(std::move(own));
+}
+
+bool HTTPSPostBackend::mustHold(std::int32_t flag) const {
+  const std::int32_t currentState = state();
+  const bool hold =
+      !isRealtime(flag) && (currentState == BackendStatePending || currentState == BackendStateOverride ||
+                            _batchEvents || (_requireUserInfo && !_userInfoDict));
+  if (hold) {
+    VESK_LOG_DEBUG("HTTPSPostBackend(sendMessage): Batching %d, %d, %d", currentState, _batchEvents,
+                   _requireUserInfo);
+  }
+  return hold;
+}
+
+std::optional<Dictionary> HTTPSPostBackend::payloadWithStopEntries(
+    const std::optional<Dictionary>& payload) const {
+  VESK_LOG_DEBUG(
+      "HTTPSPostBackend(sendMessage): Adding dnu type and sampling threshold to SESSION_TYPE_STOP message "
+      "dictionary");
+  if (!payload) {
+    VESK_LOG_ERROR("HTTPSPostBackend(sendMessage): SESSION_TYPE_STOP message dictionary is nil");
+    return std::nullopt;
+  }
+  MutableDictionary extended(*payload, 4);
+  extended.set(Text::literal("Opt"), _dnuType);
+  extended.set(Text::literal("SamplingThreshold"), samplingThreshold().value_or(Value(-1)));
+  extended.set(Text::literal("OverrideSampling"), _overrideSampling.value_or(Value(-1)));
+  extended.set(Text::literal("Batch"), _batchEvents ? 1 : 0);
+  return extended.share();
+}
+
+// --- Batches
+
+HTTPSPostBackend::PostToBuild HTTPSPostBackend::batchEvent(MutableDictionary event) {
+  const Value* methodValue = event.find("_method");
+  std::int64_t method = methodValue ? methodValue->asInteger().value_or(0) : 0;
+  std::int32_t count = _eventMethodCounts[method];
+  PostToBuild full;
+  if (count > _eventThreshold) {
+    VESK_LOG_DEBUG(
+        "HTTPSPostBackend(batchEvent): Flushing all batched events as we reached event threshold for method "
+        "%d",
+        static_cast<int>(method));
+    full = takeBatch();
+    count = 0;
+  }
+  if (!_batchedEvents) _batchedEvents = std::make_unique<EventBatch>(_heldBytes);
+  _batchedEvents->add(std::move(event));
+  _eventMethodCounts[method] = count + 1;
+  return full;
+}
+
+bool HTTPSPostBackend::holdsEvents() const { return _batchedEvents && _batchedEvents->size() > 0; }
+
+// Enabled, a full batch is simply sent. Otherwise nothing may be sent yet, and the oldest events have to go.
+void HTTPSPostBackend::boundHeldEvents() {
+  if (!_heldBytes->exceeded()) return;
+  PostToBuild full;
+  {
+    MutexLock lock(_mutex);
+    if (state() == BackendStateEnabled) full = takeBatch();
+    if (_batchedEvents) noteDropped(*_batchedEvents, _batchedEvents->dropOldest());
+    if (_eventMethodCounts.size() > kMostMethods)
+      _eventMethodCounts.clear();  // user info may name any number
+  }
+  if (full) buildAndPost(std::move(full));
+}
+
+void HTTPSPostBackend::noteDropped(EventBatch& batch, const EventBatch::Dropped& dropped) const {
+  if (dropped.count == 0) return;
+  _services.counters.count(_name, DropReason::OverBound, dropped.count);
+  if (!batch.beginsToDrop()) return;
+  if (dropped.account->isOfSession()) {
+    VESK_LOG_WARNING(
+        "HTTPSPostBackend(batchEvent): backend %s holds more than %zu bytes: dropping its oldest events",
+        _name.c_str(), dropped.bound);
+  } else {
+    VESK_LOG_WARNING(
+        "HTTPSPostBackend(batchEvent): %s holds more than %zu bytes: dropping the oldest events of backend "
+        "%s",
+        dropped.account->holder().c_str(), dropped.bound, _name.c_str());
+  }
+}
+
+std::optional<std::string> HTTPSPostBackend::flushMessagesInTurn() {
+  PostToBuild held;
+  {
+    MutexLock lock(_mutex);
+    held = takeBatch();
+  }
+  if (!held) return std::nullopt;
+  return buildAndPost(std::move(held));
+}
+
+// --- Taking events out to be posted
+
+HTTPSPostBackend::PostToBuild HTTPSPostBackend::takeBatch() {
+  if (!holdsEvents() || state() != BackendStateEnabled || (_requireUserInfo && !_userInfoDict)) {
+    return nullptr;
+  }
+  VESK_LOG_DEBUG("HTTPSPostBackend(flushMessages): called");
+  PostToBuild post = makePost(std::move(_batchedEvents), 0, std::nullopt, std::nullopt);
+  _eventMethodCounts.clear();
+  if (_userInfoDict) {
+    MutableDictionary filtered(*_userInfoDict);
+    _filters.filterEvent(filtered);
+    if (!filtered.empty()) post->lateUserInfo = filtered.share();
+  }
+  return post;
+}
+
+HTTPSPostBackend::PostToBuild HTTPSPostBackend::takeBatchBeforeSingleEvent() {
+  if (state() != BackendStateEnabled || _batchEvents || !holdsEvents()) return nullptr;
+  VESK_LOG_DEBUG(
+      "HTTPSPostBackend(sendMessage): Backend has changed its state to 'Enabled', batching is not "
+      "requested and some events have already been batched. Forcing Flush here to keep events in order.");
+  return takeBatch();
+}
+
+HTTPSPostBackend::PostToBuild HTTPSPostBackend::takeSingleEvent(MutableDictionary event, std::uint16_t method,
+                                                                std::uint16_t respCode, std::int32_t flag) {
+  auto single = std::make_unique<EventBatch>(_heldBytes);
+  single->add(std::move(event));
+  return makePost(std::move(single), flag, method, respCode);
+}
+
+HTTPSPostBackend::PostToBuild HTTPSPostBackend::makePost(std::unique_ptr<EventBatch> events,
+                                                         std::int32_t flag,
+                                                         std::optional<std::uint16_t> method,
+                                                         std::optional<std::uint16_t> responseCode) const {
+  auto post = std::make_unique<Post>();
+  post->events = std::move(events);
+  post->url = isRealtime(flag) ? _realtimePostURL : _postURL;
+  post->clientID = clientIdentifier();
+  post->headers = postHeaders(method, responseCode);
+  post->isPrintable = _dnuType == 0 && _dnuEnabled;
+  return post;
+}
+
+void HTTPSPostBackend::setCorrelatedSessionIDLocked(const std::optional<Text>& sessionID) {
+  VeskReportingBackend::setCorrelatedSessionIDLocked(sessionID);
+  if (_batchedEvents) _batchedEvents->setSessionID(sessionID);
+}
+
+}  // namespace vesk

@@ -1,0 +1,139 @@
+// The main backend: events as JSON, posted singly or in batches over HTTPS.
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <unordered_map>
+#include <vector>
+
+#include "backends/VeskReportingBackend.h"
+#include "backends/https/EventBatch.h"
+#include "backends/https/EventFilters.h"
+
+namespace vesk {
+
+/// Turns each message into an event record, filters it, and posts it at once or holds it for a batch, as the
+/// client entry of its profile says. Sources: HTTPSPostBackend.cpp (messages, batches),
+/// HTTPSPostConfiguration.cpp (state and policy from the storebag), HTTPSPostEvent.cpp (event records),
+/// HTTPSPostRequest.cpp (JSON body and post).
+class HTTPSPostBackend final : public VeskReportingBackend {
+ public:
+  /// Nothing when profile or product family are missing, or when the profile has no `clients`.
+  static std::shared_ptr<HTTPSPostBackend> create(const std::string& name,
+                                                  const std::optional<Dictionary>& profile,
+                                                  const std::optional<Text>& productFamily,
+                                                  const BackendServices& services);
+  ~HTTPSPostBackend() override;
+
+  std::optional<std::string> postURL() const;
+  void setPostURL(const std::optional<std::string>& url);
+
+  /// Decides the state from the profile and the user info, and with it URLs, filters, sampling and
+  /// thresholds.
+  std::int32_t updateBackendState();
+
+ protected:
+  std::optional<std::string> sendMessageInTurn(const std::optional<Dictionary>& payload,
+                                               const timeval& timestamp, std::uint16_t method,
+                                               std::uint16_t respCode, std::uint16_t eventID,
+                                               std::int32_t flag) override VESK_REQUIRES(_sendMutex)
+      VESK_EXCLUDES(_mutex);
+  std::optional<std::string> flushMessagesInTurn() override VESK_REQUIRES(_sendMutex) VESK_EXCLUDES(_mutex);
+  void updateStateLocked() override VESK_REQUIRES(_mutex);
+  void setCorrelatedSessionIDLocked(const std::optional<Text>& sessionID) override VESK_REQUIRES(_mutex);
+
+ private:
+  /// Messages of one method that a batch takes beyond the first.
+  static constexpr std::int32_t kDefaultEventThreshold = 49;
+
+  using Headers = std::vector<std::pair<std::string, std::string>>;
+
+  /// Events that were taken to be posted, and all that their post is made of: later changes of the backend
+  /// don't concern them.
+  struct Post {
+    std::unique_ptr<EventBatch> events;
+    std::optional<Dictionary> lateUserInfo;  ///< filtered, not empty; for events from before it was known
+    std::optional<std::string> url;
+    std::string clientID;
+    Headers headers;
+    bool isPrintable = false;  ///< the local message log may get its text
+  };
+  using PostToBuild = std::unique_ptr<Post>;
+
+  HTTPSPostBackend(const std::string& name, const Dictionary& profile, const Text& productFamily,
+                   const BackendServices& services);
+
+  // Configuration.
+  std::int32_t updateBackendStateLocked() VESK_REQUIRES(_mutex);
+  std::int32_t stateForEntry(const Dictionary& entry, const std::optional<Text>& clientName)
+      VESK_REQUIRES(_mutex);
+  std::int32_t stateWithoutUserInfo(const std::vector<Dictionary>& clients) VESK_REQUIRES(_mutex);
+  std::int32_t stateForSampling(const Dictionary& entry) VESK_REQUIRES(_mutex);
+  bool consentAllows(const Dictionary& entry) VESK_REQUIRES(_mutex);
+  bool placeAndDeviceAllow(const Dictionary& entry) VESK_REQUIRES(_mutex);
+  void updateEventThreshold(const Dictionary& entry) VESK_REQUIRES(_mutex);
+  void updateExtrasOnInternal(const Dictionary& entry) VESK_REQUIRES(_mutex);
+  void updateExpedite(const Dictionary& entry) VESK_REQUIRES(_mutex);
+  bool updatePostLink(const Dictionary& entry) VESK_REQUIRES(_mutex);
+  bool matchClientNameAndServiceID(const Dictionary& entry, const std::optional<Text>& clientName,
+                                   const std::optional<Text>& serviceName) const;
+  std::optional<std::vector<Dictionary>> clientEntries() const;
+
+  // Events.
+  MutableDictionary createEventDictfromPayload(const std::optional<Dictionary>& payload,
+                                               const timeval& timestamp, std::uint16_t method,
+                                               std::uint16_t respCode, std::uint16_t eventID) const
+      VESK_REQUIRES(_mutex);
+  std::optional<Dictionary> payloadWithStopEntries(const std::optional<Dictionary>& payload) const
+      VESK_REQUIRES(_mutex);
+  void prepareEventForMessage(MutableDictionary& event) const VESK_REQUIRES(_mutex);
+  bool mustHold(std::int32_t flag) const VESK_REQUIRES(_mutex);
+  bool holdsEvents() const VESK_REQUIRES(_mutex);
+  PostToBuild batchEvent(MutableDictionary event) VESK_REQUIRES(_sendMutex, _mutex);
+  void boundHeldEvents() VESK_REQUIRES(_sendMutex) VESK_EXCLUDES(_mutex);
+  void noteDropped(EventBatch& batch, const EventBatch::Dropped& dropped) const;
+
+  // Taking events out to be posted; null: there are none, or they may not go yet.
+  PostToBuild takeBatch() VESK_REQUIRES(_mutex);
+  PostToBuild takeBatchBeforeSingleEvent() VESK_REQUIRES(_mutex);
+  PostToBuild takeSingleEvent(MutableDictionary event, std::uint16_t method, std::uint16_t respCode,
+                              std::int32_t flag) VESK_REQUIRES(_sendMutex, _mutex);
+  PostToBuild makePost(std::unique_ptr<EventBatch> events, std::int32_t flag,
+                       std::optional<std::uint16_t> method, std::optional<std::uint16_t> responseCode) const
+      VESK_REQUIRES(_mutex);
+
+  // Body and post: without _mutex, since a body may be large.
+  std::optional<std::string> buildAndPost(PostToBuild post) VESK_REQUIRES(_sendMutex) VESK_EXCLUDES(_mutex);
+  std::optional<std::string> createMessageForPostAndLogging(
+      Post& post, std::optional<std::string>* prettyJsonString) const;
+  void postJSONMessage(Post post, std::string json, std::size_t eventCount);
+  std::string clientIdentifier() const VESK_REQUIRES(_mutex);
+  Headers postHeaders(std::optional<std::uint16_t> method, std::optional<std::uint16_t> responseCode) const
+      VESK_REQUIRES(_mutex);
+  void postCompleted(const HTTPResult& result, std::size_t eventCount);
+
+  // Constant after construction.
+  const bool _dnuEnabled;  // the user's consent
+  // The client's identifier: where the consent is respected, and where the storebag overrides it.
+  const std::string _uuidRespectDnu;
+  const std::string _uuidOverrideDnu;
+
+  // Guarded by _mutex.
+  std::optional<std::string> _postURL VESK_GUARDED_BY(_mutex);
+  std::optional<std::string> _realtimePostURL VESK_GUARDED_BY(_mutex);
+  // Whether they come from the preferences.
+  bool _useDefaultPostURL VESK_GUARDED_BY(_mutex) = false;
+  bool _useDefaultRealtimePostURL VESK_GUARDED_BY(_mutex) = false;
+  std::unique_ptr<EventBatch> _batchedEvents VESK_GUARDED_BY(_mutex);
+  EventFilters _filters VESK_GUARDED_BY(_mutex);
+  // 0 consent respected; overridden: 1 without it, 2 with it.
+  std::int32_t _dnuType VESK_GUARDED_BY(_mutex) = 0;
+  std::int32_t _eventThreshold VESK_GUARDED_BY(_mutex);
+  std::int32_t _extrasOnInternal VESK_GUARDED_BY(_mutex) = 0;
+  std::optional<Value> _overrideSampling VESK_GUARDED_BY(_mutex);  // a number
+  std::unordered_map<std::int64_t, std::int32_t> _eventMethodCounts VESK_GUARDED_BY(_mutex);
+};
+
+}  // namespace vesk

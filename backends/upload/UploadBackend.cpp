@@ -1,0 +1,182 @@
+#include "backends/upload/UploadBackend.h"
+
+#include <cinttypes>
+#include <new>
+
+#include "backends/upload/UploadGate.h"
+#include "platform/ipc/ExtensionTokens.h"
+#include "platform/log/SystemLog.h"
+#include "platform/unicode/UTF8.h"
+#include "storebag/StorebagProfile.h"
+#include "util/Gzip.h"
+#include "util/URLQuery.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr char kDescription[] = "Tellvue MQRC log";
+
+constexpr std::chrono::seconds kLeastTimeout{60};
+// Others wait for the room that a file takes while it is read.
+constexpr std::size_t kLeastRead = std::size_t{32} << 10;  // bytes a second
+// A large file may take a day on a thin line, but a server that takes next to nothing hangs.
+constexpr std::size_t kLeastSent = std::size_t{1} << 10;
+
+std::chrono::seconds timeoutFor(std::size_t bytes, std::size_t bytesPerSecond) {
+  return kLeastTimeout + std::chrono::seconds(bytes / bytesPerSecond);
+}
+
+/// Slashes behind a path belong to no component of it.
+std::string withoutTrailingSlashes(const std::string& path) {
+  return path.substr(0, path.find_last_not_of('/') + 1);
+}
+
+std::string lastComponentOf(const std::string& path) { return path.substr(path.rfind('/') + 1); }
+
+}  // namespace
+
+std::shared_ptr<UploadBackend> UploadBackend::create(const std::string& name,
+                                                     const std::optional<Dictionary>& profile,
+                                                     const std::optional<Text>& productFamily,
+                                                     const BackendServices& services) {
+  auto postURL = profile ? profileText(name, *profile, "post_url") : std::nullopt;
+  if (!postURL) {
+    VESK_LOG_ERROR("UploadBackend(initWithName): can't resolve upload post URL.");
+    return nullptr;
+  }
+  std::shared_ptr<UploadBackend> backend(
+      new UploadBackend(name, *profile, productFamily.value_or(Text()), services));
+  MutexLock lock(backend->_mutex);
+  backend->_uploadURL = postURL;
+  backend->_displayURL = profileText(name, *profile, "display_url");
+  return backend;
+}
+
+UploadBackend::UploadBackend(const std::string& name, const Dictionary& profile, const Text& productFamily,
+                             const BackendServices& services)
+    : VeskReportingBackend(name, profile, productFamily, services) {}
+
+std::optional<std::string> UploadBackend::uploadURL() const {
+  MutexLock lock(_mutex);
+  return _uploadURL;
+}
+
+void UploadBackend::setUploadURL(const std::optional<std::string>& url) {
+  MutexLock lock(_mutex);
+  _uploadURL = url;
+}
+
+bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string& extensionToken) {
+  VESK_LOG_DEBUG("UploadBackend(uploadFileAtPath): Uploading file %s", path.c_str());
+  try {
+    auto url = uploadURL();
+    return url && upload(withoutTrailingSlashes(path), extensionToken, *url);
+  } catch (const std::bad_alloc&) {
+    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Not enough memory for the input file");
+    return false;
+  }
+}
+
+bool UploadBackend::upload(const std::string& path, const std::string& extensionToken,
+                           const std::string& uploadURL) {
+  ExtensionHandle handle = ExtensionTokens::shared().consume(extensionToken);
+  const LentFile file(std::move(handle.descriptor));
+  if (!file.isRegularAt(path)) {
+    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Only upload a regular file.");
+    return false;
+  }
+  if (file.size() > kMaximumFile) {
+    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Input file has %" PRIu64 " bytes, more than the %" PRIu64
+                   " that can be uploaded",
+                   file.size(), kMaximumFile);
+    return false;
+  }
+  if (file.size() == 0) {
+    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Input file is empty");
+    return false;
+  }
+  auto pass = _services.uploads->enter(handle.user, 2 * static_cast<std::size_t>(file.size()));
+  if (!pass) {
+    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Too many uploads are under way");
+    return false;
+  }
+  auto contents = contentsOf(file);
+  if (!contents) return false;
+  auto compressed = compressToBuffer(true, *contents);
+  contents.reset();
+  if (!compressed) return false;
+
+  auto request = requestFor(path, uploadURL);
+  if (!request) {
+    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Unable to create URL request");
+    return false;
+  }
+  request->timeout = timeoutFor(compressed->size, kLeastSent);
+  request->leastBytesPerSecond = kLeastSent;
+  request->body.assign(compressed->bytes.get(), compressed->size);
+  compressed.reset();
+  pass->shrinkTo(request->body.size());
+  HTTPResult result = _services.uploads->perform(_services.http, std::move(*request));
+  if (accepted(result, uploadURL) && !file.removeFrom(path, handle.user)) {
+    VESK_LOG_DEBUG("UploadBackend(uploadFileAtPath): Left in its place: %s", path.c_str());
+  }
+  return true;
+}
+
+std::optional<std::string> UploadBackend::contentsOf(const LentFile& file) const {
+  std::string contents;
+  // A file system may be slow on purpose, and others wait for the room that its file takes.
+  const auto deadline = std::chrono::steady_clock::now() + timeoutFor(file.size(), kLeastRead);
+  LentFile::Reading reading = file.read(
+      contents, [&] { return _services.uploads->isOpen() && std::chrono::steady_clock::now() < deadline; });
+  if (reading == LentFile::Reading::GivenUp) {
+    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Input file was not read in time");
+    return std::nullopt;
+  }
+  if (reading == LentFile::Reading::Shrank) {
+    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Input file has shrunk while it was uploaded");
+    return std::nullopt;
+  }
+  if (reading == LentFile::Reading::Unreadable) {
+    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Input file is empty");
+    return std::nullopt;
+  }
+  return contents;
+}
+
+std::optional<HTTPRequest> UploadBackend::requestFor(const std::string& path,
+                                                     const std::string& uploadURL) const {
+  std::string udid;
+  std::uint32_t sessionID = 0;
+  {
+    MutexLock lock(_mutex);
+    udid = _udid;
+    sessionID = _sessionID;
+  }
+  HTTPRequest request;
+  request.method = "POST";
+  request.url = uploadURL + "?uuid=" + udid + "&sequence=" + std::to_string(sessionID) +
+                "&description=" + encodedForURLQuery(kDescription) +
+                "%20(Uploaded%20by%20ZKS)&filename=" + encodedForURLQuery(lastComponentOf(path) + ".gz") +
+                "&raw=true";
+  if (!isWebURL(request.url)) return std::nullopt;
+  request.headers = {{"Content-Type", "application/octet-stream"}, {"Content-Encoding", "gzip"}};
+  return request;
+}
+
+bool UploadBackend::accepted(const HTTPResult& result, const std::string& uploadURL) const {
+  if (result.error || !result.response) {
+    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): post %s",
+                   result.error ? result.error->description.c_str() : "(null)");
+    _services.counters.count(_name, DropReason::TransportError);
+    return false;
+  }
+  const std::string& answer = result.response->body;
+  const bool isText = isValidUTF8(answer);
+  VESK_LOG_DEBUG("UploadBackend(uploadFileAtPath): sending to |%s|, Json output: %s", uploadURL.c_str(),
+                 isText ? answer.c_str() : "(null)");
+  return isText && answer.find("success") != std::string::npos;
+}
+
+}  // namespace vesk

@@ -1,0 +1,164 @@
+#include "backends/wren/WrenBackend.h"
+
+#include <cstring>
+#include <exception>
+#include <utility>
+
+#include "backends/wren/WrenPayload.h"
+#include "platform/files/RootPrefix.h"
+#include "platform/log/SystemLog.h"
+#include "util/SamplingDraw.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr char kAdaptorBundle[] =
+    "/System/Library/PrivateFrameworks/ZelkoServices.framework/Frameworks/ZKSPerformance.framework";
+constexpr char kLibraryInBundle[] = "/ZKSPerformance.so";
+constexpr char kStateDirectory[] = "/var/lib/veskreportingd";
+
+/// The bundle that has the adaptor for a client type.
+std::optional<std::string> bundleForClientType(std::int32_t clientType) {
+  if (clientType == 7 || clientType == 11) return pathUnderRoot(kAdaptorBundle) + kLibraryInBundle;
+  return std::nullopt;
+}
+
+void writeLine(int level, const char* line) {
+  if (level != 3 && level != 4 && level != 6) level = 7;
+  VESK_LOG(static_cast<LogLevel>(level), "WrenAdaptor: %s", line ? line : "");
+}
+
+/// Short, where there is no memory for more.
+std::string textOf(const char* problem) noexcept {
+  try {
+    return problem;
+  } catch (const std::bad_alloc&) {
+    return "out of memory";  // which fits into any string
+  }
+}
+
+/// Runs what an adaptor does. Whatever it throws ends here; the text of it comes back, or null when all went
+/// well.
+template <class Call>
+std::optional<std::string> guarded(const Call& call) noexcept {
+  try {
+    call();
+    return std::nullopt;
+  } catch (const std::exception& error) {
+    return textOf(error.what());
+  } catch (...) {
+    return textOf("an exception of its own");
+  }
+}
+
+}  // namespace
+
+std::shared_ptr<WrenBackend> WrenBackend::create(const std::string& name,
+                                                 const std::optional<Dictionary>& profile,
+                                                 const std::optional<Text>& productFamily,
+                                                 std::int32_t clientType, const BackendServices& services) {
+  VESK_LOG_INFO("WrenBackend(initWithName): Loading Wren adaptor class for client type %d", clientType);
+  auto bundle = bundleForClientType(clientType);
+  if (!bundle) {
+    VESK_LOG_ERROR("WrenBackend(initWithName): No matching bundle found for client type %d", clientType);
+    nextSamplingDraw();  // one that is refused takes its place in the sequence all the same
+    return nullptr;
+  }
+  return std::shared_ptr<WrenBackend>(new WrenBackend(
+      name, profile.value_or(Dictionary()), productFamily.value_or(Text()), services, std::move(*bundle)));
+}
+
+std::shared_ptr<WrenBackend> WrenBackend::create(const std::string& name,
+                                                 const std::optional<Dictionary>& profile,
+                                                 const std::optional<Text>& productFamily,
+                                                 const BackendServices& services) {
+  return create(name, profile, productFamily, 0, services);
+}
+
+WrenBackend::WrenBackend(const std::string& name, const Dictionary& profile, const Text& productFamily,
+                         const BackendServices& services, std::string bundlePath)
+    : VeskReportingBackend(name, profile, productFamily, services),
+      _clientBundle(std::move(bundlePath)),
+      _stateDirectory(pathUnderRoot(kStateDirectory)),
+      _host{VESK_WREN_ADAPTOR_VERSION, _stateDirectory.c_str(), &writeLine} {
+  makeAdaptor();
+}
+
+void WrenBackend::makeAdaptor() noexcept {
+  auto problem = guarded([this] {
+    if (!_clientBundle.isLoaded() && !_clientBundle.load()) {
+      VESK_LOG_DEBUG("WrenBackend(initWithName): %s", _clientBundle.error().c_str());
+      return;
+    }
+    _wrenAdaptorClass =
+        reinterpret_cast<VeskWrenAdaptorFactory>(_clientBundle.symbolNamed(VESK_WREN_ADAPTOR_FACTORY));
+    if (!_wrenAdaptorClass) {
+      VESK_LOG_DEBUG("WrenBackend(initWithName): %s exports no %s", _clientBundle.path().c_str(),
+                     VESK_WREN_ADAPTOR_FACTORY);
+      return;
+    }
+    VeskWrenAdaptor* made = _wrenAdaptorClass(&_host);
+    if (made && made->version != VESK_WREN_ADAPTOR_VERSION) {
+      VESK_LOG_DEBUG("WrenBackend(initWithName): %s is made for version %u", _clientBundle.path().c_str(),
+                     made->version);
+      return;  // how it would be released is not known either
+    }
+    _wrenAdaptor.reset(made);
+  });
+  if (problem) {
+    VESK_LOG_ERROR("WrenBackend(initWithName): Wren adaptor could not be made: %s", problem->c_str());
+  }
+}
+
+std::optional<std::string> WrenBackend::sendMessageInTurn(const std::optional<Dictionary>& payload,
+                                                          const timeval&, std::uint16_t method,
+                                                          std::uint16_t respCode, std::uint16_t,
+                                                          std::int32_t) {
+  VeskWrenSendMessage forward = forwardingOperation();
+  if (!forward) {
+    VESK_LOG_ERROR("WrenBackend(sendMessage): Wren adaptor %s does not respond to forwarding selector %s",
+                   adaptorDescription(), VESK_WREN_SEND_MESSAGE);
+    _services.counters.count(_name, DropReason::AdaptorFailed);
+    return std::nullopt;
+  }
+  if (auto problem = forwardTo(forward, method, respCode, payload)) {
+    VESK_LOG_ERROR("WrenBackend(sendMessage): Wren adaptor %s failed: %s", adaptorDescription(),
+                   problem->c_str());
+    _services.counters.count(_name, DropReason::AdaptorFailed);
+  }
+  return std::nullopt;
+}
+
+std::optional<std::string> WrenBackend::forwardTo(VeskWrenSendMessage forward, std::uint16_t method,
+                                                  std::uint16_t respCode,
+                                                  const std::optional<Dictionary>& payload) noexcept {
+  return guarded([&] {
+    const Dictionary dictionary = payload.value_or(Dictionary());
+    WrenPayload view(dictionary);
+    forward(_wrenAdaptor.get(), method, respCode, &view.view());
+  });
+}
+
+VeskWrenSendMessage WrenBackend::forwardingOperation() const noexcept {
+  const VeskWrenOperation* operation = _wrenAdaptor ? _wrenAdaptor->operations : nullptr;
+  for (; operation && operation->name; ++operation) {
+    if (std::strcmp(operation->name, VESK_WREN_SEND_MESSAGE) == 0) {
+      return reinterpret_cast<VeskWrenSendMessage>(operation->function);
+    }
+  }
+  return nullptr;
+}
+
+const char* WrenBackend::adaptorDescription() const noexcept {
+  return _wrenAdaptor && _wrenAdaptor->description ? _wrenAdaptor->description : "(null)";
+}
+
+void WrenBackend::ReleaseAdaptor::operator()(VeskWrenAdaptor* adaptor) const noexcept {
+  if (!adaptor->release) return;
+  if (auto problem = guarded([adaptor] { adaptor->release(adaptor); })) {
+    VESK_LOG_ERROR("WrenBackend(dealloc): Wren adaptor failed: %s", problem->c_str());
+  }
+}
+
+}  // namespace vesk

@@ -1,0 +1,68 @@
+#include "common/Resources.h"
+
+#include <algorithm>
+#include <string_view>
+
+#include "platform/files/RootPrefix.h"
+#include "platform/files/TrustedFile.h"
+#include "platform/log/SystemLog.h"
+#include "platform/text/ASCII.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::size_t kMaximumVersionFile = 4096;
+constexpr std::size_t kMaximumVersion = 64;
+constexpr std::size_t kMaximumPublicKey = std::size_t{64} << 10;
+
+/// A file that the installed library carries besides code.
+std::optional<std::string> readResource(const char* name, std::size_t limit) {
+  std::string path = pathUnderRoot("/usr/share/veskreporting/") + name;
+  SmallFile file = readTrustedFile(path, limit);
+  if (!file.bytes && !file.missing && !file.reported) {
+    VESK_LOG_WARNING("VeskReporting: cannot read %s: %s", path.c_str(), file.error.c_str());
+  }
+  return std::move(file.bytes);
+}
+
+// The version goes into a URL as it stands, so it has to be one printable word.
+bool isUsableVersion(std::string_view version) {
+  return !version.empty() && version.size() <= kMaximumVersion &&
+         std::all_of(version.begin(), version.end(), [](char c) { return c > ' ' && c < 0x7f; });
+}
+
+/// The first line of the file "version", trimmed; nothing when there is no such file or it holds nothing
+/// usable.
+std::optional<std::string> declaredVersion() {
+  auto file = readResource("version", kMaximumVersionFile);
+  if (!file) return std::nullopt;
+  std::string_view text = trimmed(*file);
+  std::string_view version = trimmed(text.substr(0, text.find('\n')));
+  if (isUsableVersion(version)) return std::string(version);
+  VESK_LOG_WARNING("VeskReporting: the file \"version\" holds no version");
+  return std::nullopt;
+}
+
+}  // namespace
+
+std::string clientLibraryVersion() noexcept {
+  constexpr char kDefaultVersion[] = "7.0";  // short enough to need no memory
+  try {
+    return declaredVersion().value_or(kDefaultVersion);
+  } catch (...) {
+    return kDefaultVersion;
+  }
+}
+
+std::optional<std::string> publicKeyDER() noexcept {
+  try {
+    auto key = readResource("publicKey.der", kMaximumPublicKey);
+    if (key && key->empty()) return std::nullopt;
+    return key;
+  } catch (...) {
+    return std::nullopt;
+  }
+}
+
+}  // namespace vesk

@@ -1,0 +1,26 @@
+// The daemon's end of the protocol: calls as they come over the wire become calls of a session.
+#pragma once
+
+#include <memory>
+
+#include "platform/ipc/IPCConnection.h"
+#include "platform/ipc/IPCIncomingCall.h"
+#include "protocol/ClientSessionInterface.h"
+
+namespace vesk {
+
+/// Exported under wire::kObjectPath; holds its session, so the connection that exports it does.
+class ClientSessionStub final : public IPCExportedObject {
+ public:
+  explicit ClientSessionStub(std::shared_ptr<ClientSessionInterface> session)
+      : _session(std::move(session)) {}
+
+  const char* interfaceName() const override;
+  const char* introspection() const override;
+  void handle(IPCIncomingCall& call) override;
+
+ private:
+  const std::shared_ptr<ClientSessionInterface> _session;
+};
+
+}  // namespace vesk

@@ -1,0 +1,67 @@
+#include "values/Conversions.h"
+
+#include <charconv>
+#include <cmath>
+
+namespace vesk {
+
+namespace {
+
+std::string_view withoutLeadingSpace(std::string_view text) noexcept {
+  std::size_t start = text.find_first_not_of(" \t\n\v\f\r");
+  return start == std::string_view::npos ? std::string_view() : text.substr(start);
+}
+
+template <class Number>
+std::string decimal(Number number) {
+  char digits[64];
+  auto [end, error] = std::to_chars(digits, digits + sizeof digits, number);
+  return error == std::errc{} ? std::string(digits, end) : std::string();
+}
+
+// With an exponent only where people would write one: who reads a value as an integer gets 100000, not 1.
+std::string decimal(double number) {
+  const double size = std::abs(number);
+  const bool isPlain = size == 0 || (size >= 1e-4 && size < 1e16);
+  char digits[64];
+  auto [end, error] = std::to_chars(digits, digits + sizeof digits, number,
+                                    isPlain ? std::chars_format::fixed : std::chars_format::scientific);
+  return error == std::errc{} ? std::string(digits, end) : std::string();
+}
+
+}  // namespace
+
+std::int64_t leadingInteger(std::string_view text) noexcept {
+  text = withoutLeadingSpace(text);
+  if (text.size() > 1 && text[0] == '+' && text[1] != '-') text.remove_prefix(1);
+  std::int64_t number = 0;
+  auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
+  if (error == std::errc::result_out_of_range) return text[0] == '-' ? INT64_MIN : INT64_MAX;
+  return number;
+}
+
+std::optional<std::string> stringForm(const Value& value) {
+  switch (value.kind()) {
+    case Value::Kind::Text:
+      return value.text()->string();
+    case Value::Kind::Boolean:
+      return *value.boolean() ? "1" : "0";
+    case Value::Kind::Signed:
+      return decimal(*value.signedInteger());
+    case Value::Kind::Unsigned:
+      return decimal(*value.unsignedInteger());
+    case Value::Kind::Double:
+      return decimal(*value.real());
+    default:
+      return std::nullopt;
+  }
+}
+
+std::int64_t integerForm(const Value& value) {
+  if (const Text* text = value.text()) return leadingInteger(text->view());
+  return value.asInteger().value_or(0);
+}
+
+double finiteOrMinusOne(double value) noexcept { return std::isfinite(value) ? value : -1.0; }
+
+}  // namespace vesk

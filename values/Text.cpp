@@ -1,0 +1,33 @@
+#include <VeskReporting/values/Text.h>
+
+#include <cstring>
+
+namespace vesk {
+
+namespace {
+
+std::shared_ptr<char[]> allocate(std::size_t size) { return std::make_shared_for_overwrite<char[]>(size); }
+
+}  // namespace
+
+Text::Text(std::string_view text) : _size(text.size()) {
+  if (text.empty()) return;
+  auto storage = allocate(text.size());
+  std::memcpy(storage.get(), text.data(), text.size());
+  _data = std::shared_ptr<const char>(storage, storage.get());
+}
+
+Text TextArena::add(std::string_view text) {
+  if (text.empty()) return {};
+  if (text.size() > _chunkSize / 4) return Text(text);
+  if (!_chunk || _used + text.size() > _chunkSize) {
+    _chunk = allocate(_chunkSize);
+    _used = 0;
+  }
+  char* at = _chunk.get() + _used;
+  std::memcpy(at, text.data(), text.size());
+  _used += text.size();
+  return Text(std::shared_ptr<const char>(_chunk, at), text.size());
+}
+
+}  // namespace vesk

@@ -1,0 +1,284 @@
+#include <VeskReporting/values/Value.h>
+
+#include <algorithm>
+#include <cmath>
+#include <limits>
+#include <unordered_map>
+#include <unordered_set>
+
+namespace vesk {
+
+namespace {
+
+constexpr std::size_t kLinearScanLimit = 32;
+
+const Value* findIn(const std::vector<DictionaryEntry>& entries, std::string_view key) noexcept {
+  for (const auto& entry : entries) {
+    if (entry.key == key) return &entry.value;
+  }
+  return nullptr;
+}
+
+bool areUnique(const std::vector<DictionaryEntry>& entries) noexcept {
+  for (auto entry = entries.begin(); entry != entries.end(); ++entry) {
+    for (auto earlier = entries.begin(); earlier != entry; ++earlier) {
+      if (earlier->key == entry->key) return false;
+    }
+  }
+  return true;
+}
+
+}  // namespace
+
+// --- List
+
+List::List(std::vector<Value> values) {
+  values.shrink_to_fit();  // few are made, and those that wait add up
+  if (!values.empty()) _values = std::make_shared<const std::vector<Value>>(std::move(values));
+}
+
+List::List(std::initializer_list<Value> values) : List(std::vector<Value>(values)) {}
+
+std::size_t List::size() const noexcept { return _values ? _values->size() : 0; }
+const Value& List::operator[](std::size_t index) const noexcept { return (*_values)[index]; }
+const Value* List::begin() const noexcept { return _values ? _values->data() : nullptr; }
+const Value* List::end() const noexcept { return _values ? _values->data() + _values->size() : nullptr; }
+
+bool operator==(const List& a, const List& b) noexcept {
+  return std::equal(a.begin(), a.end(), b.begin(), b.end());
+}
+
+// --- Dictionary
+
+struct Dictionary::Storage {
+  explicit Storage(std::vector<DictionaryEntry> list) : entries(std::move(list)) {
+    if (entries.size() <= kLinearScanLimit) return;
+    index.reserve(entries.size());
+    for (std::size_t i = 0; i < entries.size(); ++i) index.emplace(entries[i].key.view(), i);
+  }
+  std::vector<DictionaryEntry> entries;
+  std::unordered_map<std::string_view, std::size_t> index;  // empty for small dictionaries
+};
+
+Dictionary::Dictionary(std::initializer_list<DictionaryEntry> entries) {
+  MutableDictionary building;
+  building.reserve(entries.size());
+  for (const auto& entry : entries) building.append(entry.key, entry.value);
+  *this = building.shareUnique();
+}
+
+std::size_t Dictionary::size() const noexcept { return _storage ? _storage->entries.size() : 0; }
+const DictionaryEntry* Dictionary::begin() const noexcept {
+  return _storage ? _storage->entries.data() : nullptr;
+}
+const DictionaryEntry* Dictionary::end() const noexcept { return begin() + size(); }
+
+const Value* Dictionary::find(std::string_view key) const noexcept {
+  if (!_storage) return nullptr;
+  if (_storage->index.empty()) return findIn(_storage->entries, key);
+  auto at = _storage->index.find(key);
+  return at == _storage->index.end() ? nullptr : &_storage->entries[at->second].value;
+}
+
+std::optional<Text> Dictionary::text(std::string_view key) const {
+  const Value* value = find(key);
+  if (!value || !value->text()) return std::nullopt;
+  return *value->text();
+}
+
+std::optional<Dictionary> Dictionary::dictionary(std::string_view key) const {
+  const Value* value = find(key);
+  if (!value || !value->dictionary()) return std::nullopt;
+  return *value->dictionary();
+}
+
+std::optional<List> Dictionary::list(std::string_view key) const {
+  const Value* value = find(key);
+  if (!value || !value->list()) return std::nullopt;
+  return *value->list();
+}
+
+bool operator==(const Dictionary& a, const Dictionary& b) noexcept {
+  if (a._storage == b._storage) return true;
+  return std::equal(a.begin(), a.end(), b.begin(), b.end());
+}
+
+// --- MutableDictionary
+
+MutableDictionary::MutableDictionary(const Dictionary& source, std::size_t extra) {
+  _entries.reserve(source.size() + extra);
+  _entries.assign(source.begin(), source.end());
+}
+
+void MutableDictionary::set(Text key, Value value) {
+  for (auto& entry : _entries) {
+    if (entry.key == key) {
+      entry.value = std::move(value);
+      return;
+    }
+  }
+  append(std::move(key), std::move(value));
+}
+
+void MutableDictionary::setAll(const Dictionary& source) {
+  if (source.size() <= kLinearScanLimit) {
+    for (const auto& entry : source) set(entry.key, entry.value);
+    return;
+  }
+  // The source is indexed, this one is not.
+  std::unordered_set<const Value*> taken;
+  for (auto& entry : _entries) {
+    const Value* value = source.find(entry.key.view());
+    if (value && taken.insert(value).second) entry.value = *value;
+  }
+  for (const auto& entry : source) {
+    if (!taken.contains(&entry.value)) append(entry.key, entry.value);
+  }
+}
+
+void MutableDictionary::remove(std::string_view key) {
+  std::erase_if(_entries, [&](const DictionaryEntry& entry) { return entry.key == key; });
+}
+
+const Value* MutableDictionary::find(std::string_view key) const noexcept { return findIn(_entries, key); }
+
+Dictionary MutableDictionary::share() {
+  if (_entries.empty()) return {};
+  return Dictionary(std::make_shared<const Dictionary::Storage>(std::exchange(_entries, {})));
+}
+
+Dictionary MutableDictionary::shareUnique() {
+  if (_entries.size() <= kLinearScanLimit && areUnique(_entries)) return share();
+  std::vector<DictionaryEntry> unique;
+  unique.reserve(_entries.size());
+  if (_entries.size() <= kLinearScanLimit) {
+    for (auto& entry : _entries) {
+      auto same =
+          std::find_if(unique.begin(), unique.end(), [&](const auto& e) { return e.key == entry.key; });
+      if (same == unique.end()) {
+        unique.push_back(std::move(entry));
+      } else {
+        same->value = std::move(entry.value);
+      }
+    }
+  } else {
+    std::unordered_map<Text, std::size_t> seen;
+    seen.reserve(_entries.size());
+    for (auto& entry : _entries) {
+      auto [at, isNew] = seen.emplace(entry.key, unique.size());
+      if (isNew) {
+        unique.push_back(std::move(entry));
+      } else {
+        unique[at->second].value = std::move(entry.value);
+      }
+    }
+  }
+  _entries = std::move(unique);
+  return share();
+}
+
+// --- Numbers
+
+std::optional<std::int64_t> Value::asInteger() const noexcept {
+  switch (kind()) {
+    case Kind::Boolean:
+      return *boolean() ? 1 : 0;
+    case Kind::Signed:
+      return *signedInteger();
+    case Kind::Unsigned:
+      return static_cast<std::int64_t>(*unsignedInteger());
+    case Kind::Double: {
+      double value = *real();
+      if (std::isnan(value)) return 0;
+      if (value >= 0x1p63) return std::numeric_limits<std::int64_t>::max();
+      if (value < -0x1p63) return std::numeric_limits<std::int64_t>::min();
+      return static_cast<std::int64_t>(value);
+    }
+    default:
+      return std::nullopt;
+  }
+}
+
+std::optional<double> Value::asDouble() const noexcept {
+  switch (kind()) {
+    case Kind::Boolean:
+      return *boolean() ? 1.0 : 0.0;
+    case Kind::Signed:
+      return static_cast<double>(*signedInteger());
+    case Kind::Unsigned:
+      return static_cast<double>(*unsignedInteger());
+    case Kind::Double:
+      return *real();
+    default:
+      return std::nullopt;
+  }
+}
+
+std::optional<bool> Value::asBoolean() const noexcept {
+  switch (kind()) {
+    case Kind::Boolean:
+      return *boolean();
+    case Kind::Signed:
+      return *signedInteger() != 0;
+    case Kind::Unsigned:
+      return *unsignedInteger() != 0;
+    case Kind::Double:
+      return *real() != 0;
+    default:
+      return std::nullopt;
+  }
+}
+
+std::optional<std::int64_t> integerForKey(const Dictionary& dictionary, std::string_view key) noexcept {
+  const Value* value = dictionary.find(key);
+  return value ? value->asInteger() : std::nullopt;
+}
+
+std::optional<double> doubleForKey(const Dictionary& dictionary, std::string_view key) noexcept {
+  const Value* value = dictionary.find(key);
+  return value ? value->asDouble() : std::nullopt;
+}
+
+std::optional<bool> booleanForKey(const Dictionary& dictionary, std::string_view key) noexcept {
+  const Value* value = dictionary.find(key);
+  return value ? value->asBoolean() : std::nullopt;
+}
+
+namespace {
+
+// What the allocator and the reference count cost, and a node of an index.
+constexpr std::size_t kBlockMemory = 32;
+constexpr std::size_t kIndexNodeMemory = 48;
+
+std::size_t memoryOf(const std::vector<DictionaryEntry>& entries) noexcept {
+  std::size_t size = entries.capacity() * sizeof(DictionaryEntry);
+  for (const auto& entry : entries) size += entry.key.size() + approximateMemory(entry.value);
+  return size;
+}
+
+}  // namespace
+
+std::size_t approximateMemory(const Value& value) noexcept {
+  if (const Text* text = value.text()) return text->size();
+  if (const Bytes* bytes = value.bytes()) return bytes->size();
+  if (const Dictionary* dictionary = value.dictionary()) return approximateMemory(*dictionary);
+  std::size_t size = 0;
+  if (const List* list = value.list(); list && !list->empty()) {
+    size = sizeof(std::vector<Value>) + 2 * kBlockMemory;
+    for (const Value& item : *list) size += sizeof(Value) + approximateMemory(item);
+  }
+  return size;
+}
+
+std::size_t approximateMemory(const Dictionary& dictionary) noexcept {
+  if (!dictionary._storage) return 0;
+  const auto& storage = *dictionary._storage;
+  return sizeof storage + 2 * kBlockMemory + memoryOf(storage.entries) +
+         storage.index.size() * (sizeof(*storage.index.begin()) + kIndexNodeMemory);
+}
+
+std::size_t approximateMemory(const MutableDictionary& dictionary) noexcept {
+  return memoryOf(dictionary.entries());
+}
+
+}  // namespace vesk
