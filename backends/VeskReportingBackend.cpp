@@ -1,12 +1,5 @@
 #include "backends/VeskReportingBackend.h"
 
-#include <VeskReporting/VeskReportingKeys.h>
-
-#include "backends/dashboard/DashboardBackend.h"
-#include "backends/https/HTTPSPostBackend.h"
-#include "backends/kilnar/KilnarBackend.h"
-#include "backends/upload/UploadBackend.h"
-#include "backends/wren/WrenBackend.h"
 #include "platform/crypto/Digest.h"
 #include "platform/log/SystemLog.h"
 #include "platform/text/ASCII.h"
@@ -26,28 +19,6 @@ std::optional<Text> textFrom(const std::optional<std::string>& text) {
 std::uint8_t versionPiece(std::string_view piece) { return static_cast<std::uint8_t>(leadingInteger(piece)); }
 
 }  // namespace
-
-std::shared_ptr<VeskReportingBackend> VeskReportingBackend::newBackendWithName(
-    const std::string& name, const std::optional<Dictionary>& profile,
-    const std::optional<Text>& productFamily, std::int32_t clientType, const BackendServices& services) {
-  if (name == kVeskReportingBackendDashboard) {
-    return DashboardBackend::create(name, profile, productFamily, services);
-  }
-  if (name == kVeskReportingBackendUploadServer) {
-    return UploadBackend::create(name, profile, productFamily, services);
-  }
-  if (name == kVeskReportingBackendHTTPPost || name == kVeskReportingBackendHTTPPost2) {
-    return HTTPSPostBackend::create(name, profile, productFamily, services);
-  }
-  if (name == kVeskReportingBackendKilnar) {
-    return KilnarBackend::create(name, profile, productFamily, services);
-  }
-  if (name == kVeskReportingBackendWren && deviceProductType() != Text::literal("Bramble")) {
-    return WrenBackend::create(name, profile, productFamily, clientType, services);
-  }
-  VESK_LOG_ERROR("VeskReportingBackend(newBackendWithName): %s", name.c_str());
-  return nullptr;
-}
 
 VeskReportingBackend::VeskReportingBackend(const std::string& name, const Dictionary& profile,
                                            const Text& productFamily, const BackendServices& services)

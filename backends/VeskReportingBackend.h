@@ -53,14 +53,6 @@ constexpr bool isOverridingSampling(std::int32_t flag) {
 /// Kept alive by its session and by posts that are under way.
 class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBackend> {
  public:
-  /// The backend that a storebag lists under `name`; nothing for a name that is not known, for a Wren backend
-  /// on a "Bramble" device, and when the backend finds `profile` unusable.
-  static std::shared_ptr<VeskReportingBackend> newBackendWithName(const std::string& name,
-                                                                  const std::optional<Dictionary>& profile,
-                                                                  const std::optional<Text>& productFamily,
-                                                                  std::int32_t clientType,
-                                                                  const BackendServices& services);
-
   virtual ~VeskReportingBackend() = default;
   VeskReportingBackend(const VeskReportingBackend&) = delete;
   VeskReportingBackend& operator=(const VeskReportingBackend&) = delete;

@@ -5,6 +5,7 @@
 #include <cstdlib>
 #include <filesystem>
 
+#include "backends/BackendFactory.h"
 #include "backends/dashboard/DashboardBackend.h"
 #include "backends/dashboard/DashboardText.h"
 #include "platform/files/RootPrefix.h"
@@ -37,7 +38,7 @@ struct Sink {
 struct Sender {
   Sender() {
     Dictionary profile{{"ip", "127.0.0.1"}, {"port", static_cast<int>(sink.socket.localEndpoint()->port)}};
-    backend = VeskReportingBackend::newBackendWithName("dashboard", profile, Text("Phone"), 5, services);
+    backend = newBackendWithName("dashboard", profile, Text("Phone"), 5, services);
     if (!backend) std::abort();
     backend->setSelfVersion("7.0");
     backend->setCompType(5);

@@ -6,7 +6,7 @@
 #include <cstdlib>
 #include <filesystem>
 
-#include "backends/VeskReportingBackend.h"
+#include "backends/BackendFactory.h"
 #include "platform/files/FileDescriptor.h"
 #include "platform/files/RootPrefix.h"
 #include "platform/ipc/MessageReader.h"
@@ -40,8 +40,8 @@ std::shared_ptr<VeskReportingBackend> makeBackend(BackendServices& services) {
                    {"expedite", 0},
                    {"filters", List{Dictionary{{"key", "username"}, {"action", "sha256"}},
                                     Dictionary{{"key", "secret"}, {"action", "remove"}}}}};
-  auto backend = VeskReportingBackend::newBackendWithName(
-      kVeskReportingBackendHTTPPost, Dictionary{{"clients", List{entry}}}, Text("Phone"), 5, services);
+  auto backend = newBackendWithName(kVeskReportingBackendHTTPPost, Dictionary{{"clients", List{entry}}},
+                                    Text("Phone"), 5, services);
   backend->setRequireUserInfo(true);
   backend->setUserInfoDict(kUserInfo);
   backend->setCompType(5);

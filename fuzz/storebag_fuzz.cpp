@@ -2,7 +2,7 @@
 // messages.
 #include <cstdint>
 
-#include "backends/VeskReportingBackend.h"
+#include "backends/BackendFactory.h"
 #include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
 #include "platform/plist/PropertyList.h"
@@ -56,8 +56,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   const Value profile = withoutAddresses(*outcome.value);
   if (!profile.dictionary()) return 0;
   for (bool knowsUser : {false, true}) {
-    auto backend = VeskReportingBackend::newBackendWithName("httpPost", *profile.dictionary(), Text("Phone"),
-                                                            5, shared.services);
+    auto backend = newBackendWithName("httpPost", *profile.dictionary(), Text("Phone"), 5, shared.services);
     if (!backend) continue;
     backend->setCompType(5);
     if (knowsUser) {

@@ -1,4 +1,5 @@
 #include "session/BackendSet.h"
+#include "backends/BackendFactory.h"
 
 #include <VeskReporting/VeskReportingKeys.h>
 
@@ -92,8 +93,8 @@ std::optional<BackendSet> createBackends(const std::optional<Dictionary>& storeb
   BackendSet backends;
   for (const DictionaryEntry& entry : *storebag) {
     std::string name = entry.key.string();
-    auto backend = VeskReportingBackend::newBackendWithName(name, profileFrom(entry), identity.productFamily,
-                                                            identity.clientType, services);
+    auto backend =
+        newBackendWithName(name, profileFrom(entry), identity.productFamily, identity.clientType, services);
     if (!backend) continue;
     stamp(*backend, identity, userInfo, deviceID, libraryVersion);
     backend->setHeldBytes(heldBytes);

@@ -8,6 +8,7 @@
 #include <filesystem>
 #include <future>
 
+#include "backends/BackendFactory.h"
 #include "backends/wren/WrenBackend.h"
 #include "platform/files/RootPrefix.h"
 #include "tests/support/BackendHarness.h"
@@ -46,8 +47,7 @@ class AdaptorTest : public testing::Test {
   ~AdaptorTest() override { setRootPrefix(""); }
 
   std::shared_ptr<VeskReportingBackend> make(std::int32_t clientType = 7) {
-    return VeskReportingBackend::newBackendWithName("wren", std::nullopt, std::nullopt, clientType,
-                                                    harness.services);
+    return newBackendWithName("wren", std::nullopt, std::nullopt, clientType, harness.services);
   }
   void send(VeskReportingBackend& backend, const std::optional<Dictionary>& payload,
             std::uint16_t method = 3) {

@@ -5,6 +5,7 @@
 #include <semaphore>
 #include <thread>
 
+#include "backends/BackendFactory.h"
 #include "tests/support/BackendHarness.h"
 
 namespace vesk::test {
@@ -33,14 +34,13 @@ class BackendConcurrency : public ::testing::Test {
  protected:
   /// One that batches; `flag` 1 posts a message at once.
   BackendConcurrency() {
-    backend = VeskReportingBackend::newBackendWithName(
-        kVeskReportingBackendHTTPPost,
-        Dictionary{{"clients", List{Dictionary{{"post_url", harness.url()},
-                                               {"locale_whitelist", List{"US"}},
-                                               {"filters", List{}},
-                                               {"sampling_threshold", 1},
-                                               {"expedite", 0}}}}},
-        Text("Phone"), 5, services);
+    backend = newBackendWithName(kVeskReportingBackendHTTPPost,
+                                 Dictionary{{"clients", List{Dictionary{{"post_url", harness.url()},
+                                                                        {"locale_whitelist", List{"US"}},
+                                                                        {"filters", List{}},
+                                                                        {"sampling_threshold", 1},
+                                                                        {"expedite", 0}}}}},
+                                 Text("Phone"), 5, services);
     backend->setRequireUserInfo(true);
     backend->setUserInfoDict(Dictionary{{kVeskReportingUserInfoClientName, "Camera"}});
     backend->setCombinedSessionIDString("own");

@@ -1,6 +1,7 @@
 // The dashboard backend: its profile, datagrams to the byte, log lines, log data.
 #include <gtest/gtest.h>
 
+#include "backends/BackendFactory.h"
 #include "backends/dashboard/DashboardBackend.h"
 #include "backends/dashboard/DashboardText.h"
 #include "platform/plist/KeyedArchive.h"
@@ -29,8 +30,7 @@ class Dashboard : public testing::Test {
     return entries.share();
   }
   std::shared_ptr<VeskReportingBackend> make(const std::optional<Dictionary>& profile) {
-    return stamped(
-        VeskReportingBackend::newBackendWithName("dashboard", profile, Text("Phone"), 5, _services));
+    return stamped(newBackendWithName("dashboard", profile, Text("Phone"), 5, _services));
   }
   std::shared_ptr<VeskReportingBackend> stamped(std::shared_ptr<VeskReportingBackend> backend) {
     if (!backend) return nullptr;

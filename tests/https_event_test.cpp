@@ -1,6 +1,7 @@
 // What becomes of one message: the event record, its filters, and what JSON carries of it.
 #include <cstdio>
 
+#include "backends/BackendFactory.h"
 #include "tests/support/HTTPSBackendTest.h"
 #include "tests/support/TestRoot.h"
 
@@ -78,8 +79,7 @@ void tellEnvironment(const char* preferences, const char* facts, const char* zon
   ::setenv("TZ", zone, 1);
   BackendHarness harness;
   const Dictionary profile{{"clients", List{Dictionary{{"post_url", harness.url()}}}}};
-  auto backend =
-      VeskReportingBackend::newBackendWithName("httpPost", profile, Text("Phone"), 5, harness.services);
+  auto backend = newBackendWithName("httpPost", profile, Text("Phone"), 5, harness.services);
   backend->updateState();
   backend->sendMessage(Dictionary(), at(0), 3, 2, 0);
   const auto event = harness.posts().at(0).event();

@@ -1,4 +1,5 @@
 // What an HTTPS backend makes of its profile: whether it reports, for which client, where to and how.
+#include "backends/BackendFactory.h"
 #include "tests/support/HTTPSBackendTest.h"
 #include "tests/support/TestRoot.h"
 
@@ -264,7 +265,7 @@ TEST_F(HTTPSPolicy, FactoryKnowsSixNames) {
                            {"display_url", "http://display/"}};
   const auto built = [&](const char* name, const std::optional<Dictionary>& with,
                          const std::optional<Text>& family = Text("Phone")) {
-    return VeskReportingBackend::newBackendWithName(name, with, family, 7, harness.services);
+    return newBackendWithName(name, with, family, 7, harness.services);
   };
   for (const char* name : {"httpPost", "httpPost2", "dashboard", "uploadServer", "kilnar", "wren"}) {
     const auto backend = built(name, profile);

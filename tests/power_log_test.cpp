@@ -1,6 +1,7 @@
 // The power log: what the backend records, what the file keeps, and how it fares on the real daemon.
 #include <gtest/gtest.h>
 
+#include "backends/BackendFactory.h"
 #include "platform/powerlog/PowerLog.h"
 #include "platform/powerlog/PowerLogReader.h"
 #include "tests/support/BackendHarness.h"
@@ -52,8 +53,7 @@ TEST_F(PowerLogTest, TheBackendRecordsMessagesThatHaveMethodAndPayload) {
   BackendHarness harness;
   CapturedLog log;
   harness.services.powerLog = std::make_shared<PowerLog>(options());
-  auto backend =
-      VeskReportingBackend::newBackendWithName("kilnar", std::nullopt, std::nullopt, 5, harness.services);
+  auto backend = newBackendWithName("kilnar", std::nullopt, std::nullopt, 5, harness.services);
   ASSERT_TRUE(backend);
   const std::tuple<std::uint16_t, std::optional<Dictionary>, const char*> cases[] = {
       {5, Dictionary{{"k", "v"}}, R"({"k":"v","method":5,"respCode":200,"event":1})"},
@@ -80,8 +80,7 @@ TEST_F(PowerLogTest, TheBackendRecordsMessagesThatHaveMethodAndPayload) {
   }
   EXPECT_EQ(log.lines().size(), 0u);
   harness.services.powerLog = nullptr;
-  auto without =
-      VeskReportingBackend::newBackendWithName("kilnar", Dictionary(), Text("Phone"), 5, harness.services);
+  auto without = newBackendWithName("kilnar", Dictionary(), Text("Phone"), 5, harness.services);
   EXPECT_EQ(without->sendMessage(Dictionary{{"k", 1}}, timeval{}, 5, 200, 0), std::nullopt);
 }
 

@@ -11,6 +11,7 @@
 #include <future>
 #include <thread>
 
+#include "backends/BackendFactory.h"
 #include "backends/upload/UploadBackend.h"
 #include "platform/ipc/ExtensionTokens.h"
 #include "platform/queue/TimedQueuePool.h"
@@ -54,9 +55,9 @@ int openCount(const struct stat& file) {
 class UploadTest : public testing::Test {
  protected:
   std::shared_ptr<UploadBackend> make(const std::string& url) {
-    auto made = std::dynamic_pointer_cast<UploadBackend>(VeskReportingBackend::newBackendWithName(
-        "uploadServer", Dictionary{{"post_url", url}, {"display_url", "https://show"}}, std::nullopt, 5,
-        services));
+    auto made = std::dynamic_pointer_cast<UploadBackend>(
+        newBackendWithName("uploadServer", Dictionary{{"post_url", url}, {"display_url", "https://show"}},
+                           std::nullopt, 5, services));
     made->setUdid("udid");
     made->setSessionID(4'000'000'000);
     return made;
@@ -262,8 +263,7 @@ TEST_F(UploadTest, AServerThatCanNotBeReachedCostsNothing) {
   const std::optional<Dictionary> profiles[] = {std::nullopt, Dictionary{{"display_url", "https://show"}}};
   for (const auto& profile : profiles) {
     log.clear();
-    EXPECT_FALSE(
-        VeskReportingBackend::newBackendWithName("uploadServer", profile, Text("Phone"), 5, services));
+    EXPECT_FALSE(newBackendWithName("uploadServer", profile, Text("Phone"), 5, services));
     EXPECT_EQ(log.lines(),
               (std::vector<Line>{{3, "UploadBackend(initWithName): can't resolve upload post URL."}}));
   }

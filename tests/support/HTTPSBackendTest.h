@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include "backends/BackendFactory.h"
 #include "backends/https/HTTPSPostBackend.h"
 #include "tests/support/BackendHarness.h"
 #include "tests/support/CapturedLog.h"
@@ -44,9 +45,9 @@ class HTTPSBackendTest : public ::testing::Test {
     return whole.share();
   }
   std::shared_ptr<HTTPSPostBackend> make(List clients, const Stamp& stamp = {}) {
-    auto backend = std::static_pointer_cast<HTTPSPostBackend>(VeskReportingBackend::newBackendWithName(
-        kVeskReportingBackendHTTPPost, Dictionary{{"clients", std::move(clients)}}, Text("Phone"), 5,
-        harness.services));
+    auto backend = std::static_pointer_cast<HTTPSPostBackend>(
+        newBackendWithName(kVeskReportingBackendHTTPPost, Dictionary{{"clients", std::move(clients)}},
+                           Text("Phone"), 5, harness.services));
     backend->setSessionID(4'000'000'000);
     backend->setCompType(stamp.clientType);
     backend->setClientVersion(3);

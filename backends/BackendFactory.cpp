@@ -1,0 +1,62 @@
+#include "backends/BackendFactory.h"
+
+#include <VeskReporting/VeskReportingKeys.h>
+
+#include <algorithm>
+#include <iterator>
+
+#include "backends/dashboard/DashboardBackend.h"
+#include "backends/https/HTTPSPostBackend.h"
+#include "backends/kilnar/KilnarBackend.h"
+#include "backends/upload/UploadBackend.h"
+#include "backends/wren/WrenBackend.h"
+#include "platform/log/SystemLog.h"
+#include "util/ReportingdUtil.h"
+
+namespace vesk {
+
+namespace {
+
+using Profile = std::optional<Dictionary>;
+using Family = std::optional<Text>;
+using Maker = std::shared_ptr<VeskReportingBackend> (*)(const std::string& name, const Profile& profile,
+                                                        const Family& productFamily, std::int32_t clientType,
+                                                        const BackendServices& services);
+
+template <class Backend>
+std::shared_ptr<VeskReportingBackend> make(const std::string& name, const Profile& profile,
+                                           const Family& productFamily, std::int32_t clientType,
+                                           const BackendServices& services) {
+  if constexpr (requires { Backend::create(name, profile, productFamily, clientType, services); }) {
+    return Backend::create(name, profile, productFamily, clientType, services);
+  } else {
+    return Backend::create(name, profile, productFamily, services);
+  }
+}
+
+constexpr struct {
+  std::string_view name;
+  Maker make;
+} kBackends[] = {{kVeskReportingBackendDashboard, make<DashboardBackend>},
+                 {kVeskReportingBackendUploadServer, make<UploadBackend>},
+                 {kVeskReportingBackendHTTPPost, make<HTTPSPostBackend>},
+                 {kVeskReportingBackendHTTPPost2, make<HTTPSPostBackend>},
+                 {kVeskReportingBackendKilnar, make<KilnarBackend>},
+                 {kVeskReportingBackendWren, make<WrenBackend>}};
+
+}  // namespace
+
+std::shared_ptr<VeskReportingBackend> newBackendWithName(const std::string& name, const Profile& profile,
+                                                         const Family& productFamily, std::int32_t clientType,
+                                                         const BackendServices& services) {
+  const auto known = std::find_if(std::begin(kBackends), std::end(kBackends),
+                                  [&](const auto& backend) { return backend.name == name; });
+  const bool hasNone = name == kVeskReportingBackendWren && deviceProductType() == Text::literal("Bramble");
+  if (known != std::end(kBackends) && !hasNone) {
+    return known->make(name, profile, productFamily, clientType, services);
+  }
+  VESK_LOG_ERROR("VeskReportingBackend(newBackendWithName): %s", name.c_str());
+  return nullptr;
+}
+
+}  // namespace vesk

@@ -1,0 +1,21 @@
+// Makes backends by their names in the storebag.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "backends/VeskReportingBackend.h"
+
+namespace vesk {
+
+/// Makes the backend that a storebag lists under `name`. Returns null for an unknown name, for a Wren backend
+/// on a "Bramble" device (both with a line of level 3), and when the backend can't use `profile`.
+std::shared_ptr<VeskReportingBackend> newBackendWithName(const std::string& name,
+                                                         const std::optional<Dictionary>& profile,
+                                                         const std::optional<Text>& productFamily,
+                                                         std::int32_t clientType,
+                                                         const BackendServices& services);
+
+}  // namespace vesk
