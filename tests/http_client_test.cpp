@@ -38,23 +38,17 @@ TEST(HTTPClient, SendsWhatItIsGivenAndLittleElse) {
   auto result = client.perform(request);
 
   ASSERT_TRUE(result.response);
-  EXPECT_FALSE(result.error);
   EXPECT_EQ(result.response->status, 201);
   EXPECT_EQ(result.response->header("cache-CONTROL"), "max-age=600");
-  EXPECT_FALSE(result.response->header("cache"));
   EXPECT_NE(result.response->body.find("made"), std::string::npos);
   ASSERT_EQ(server.count(), 1u);
   auto received = server.requests().front();
   EXPECT_EQ(received.method, "POST");
   EXPECT_EQ(received.target, "/a?b=c");
   EXPECT_TRUE(received.body == request.body);
-  HTTPHeaderList own;
-  for (const auto& header : received.headers) {
-    if (header.first != "Host") own.push_back(header);
-  }
-  HTTPHeaderList expected = request.headers;
-  expected.insert(expected.begin(), {"User-Agent", "veskreportingd"});
-  EXPECT_EQ(own, expected);
+  std::erase_if(received.headers, [](const auto& header) { return header.first == "Host"; });
+  request.headers.insert(request.headers.begin(), {"User-Agent", "veskreportingd"});
+  EXPECT_EQ(received.headers, request.headers);
 }
 
 TEST(HTTPClient, LeavesOutHeadersThatWouldBreakTheRequestApart) {
@@ -130,52 +124,35 @@ TEST(HTTPClient, FollowsOnlyHTTPAndNoRedirect) {
 TEST(HTTPClient, BadAnswersAreErrorsOfTheirKindAndOverWithTheNextRequest) {
   const struct {
     Fault fault;
-    std::optional<Kind> kind;
-  } cases[] = {{Fault::None, {}},
-               {Fault::Stall, Kind::Timeout},
-               {Fault::ResetBeforeAnswer, Kind::Interrupted},
-               {Fault::ResetMidAnswer, Kind::Interrupted},
-               {Fault::CloseWithoutAnswer, Kind::Interrupted},
-               {Fault::CloseMidAnswer, Kind::Interrupted},
-               {Fault::CloseAfterAnswer, {}},
-               {Fault::SlowBody, {}},
-               {Fault::Garbage, Kind::Other},
-               {Fault::HugeBody, Kind::TooLarge}};
+    Kind kind;
+    HTTPRequest::Retry retry;  // what the server has whole is never sent again
+  } cases[] = {{Fault::ResetBeforeAnswer, Kind::Interrupted, HTTPRequest::Retry::Never},
+               {Fault::CloseWithoutAnswer, Kind::Interrupted, HTTPRequest::Retry::Never},
+               {Fault::ResetMidAnswer, Kind::Interrupted, HTTPRequest::Retry::UntilSent},
+               {Fault::CloseMidAnswer, Kind::Interrupted, HTTPRequest::Retry::UntilSent},
+               {Fault::Stall, Kind::Timeout, HTTPRequest::Retry::UntilSent},
+               {Fault::Garbage, Kind::Other, HTTPRequest::Retry::UntilSent}};
   TempDirectory directory;
   const auto authority = CertificateAuthority::generate();
   ::setenv("SSL_CERT_FILE", directory.write("ca.pem", authority.certificate()).c_str(), 1);
-  for (bool tls : {false, true}) {
-    for (const auto& test : cases) {
-      SCOPED_TRACE(std::to_string(static_cast<int>(test.fault)) + (tls ? " over TLS" : ""));
-      HTTPServer::Options options;
-      if (tls) options.tls = authority.issueServerIdentity();
-      RecordingServer server(
-          [fault = test.fault](const HTTPReceived&, std::size_t count) {
-            auto answer = faulty(count == 0 ? fault : Fault::None, "0123456789");
-            answer.pause = 1ms;
-            return answer;
-          },
-          options);
-      HTTPClient client(HTTPClient::Options{.maximumBody = 1000});
-      auto request = fetchFrom(server.url());
-      if (test.fault == Fault::Stall) request.timeout = 2s;
-      auto result = client.perform(request);
-      EXPECT_EQ(server.count(), 1u);
-      EXPECT_EQ(result.error.has_value(), test.kind.has_value());
-      const bool hasStatus =
-          test.fault == Fault::CloseMidAnswer || test.fault == Fault::HugeBody || !test.kind;
-      if (test.fault != Fault::ResetMidAnswer) {
-        EXPECT_EQ(result.response.has_value(), hasStatus);
-      }
-      if (test.kind && result.error) {
-        EXPECT_EQ(result.error->kind, *test.kind) << result.error->description;
-        EXPECT_FALSE(result.error->description.empty());
-      } else if (result.response) {
-        EXPECT_EQ(result.response->body, "0123456789");
-      }
-      result = client.perform(fetchFrom(server.url()));
-      EXPECT_TRUE(result.response && result.response->body == "0123456789");
+  for (const auto& [fault, kind, retry] : cases) {
+    SCOPED_TRACE(static_cast<int>(fault));
+    RecordingServer server(
+        [fault = fault](const HTTPReceived&, std::size_t count) {
+          return faulty(count == 0 ? fault : Fault::None, "0123456789");
+        },
+        {.tls = authority.issueServerIdentity()});
+    HTTPClient client;
+    auto request = postTo(server.url(), "event", retry);
+    if (fault == Fault::Stall) request.timeout = 2s;
+    const auto result = client.perform(request);
+    EXPECT_EQ(server.count(), 1u);
+    ASSERT_TRUE(result.error);
+    EXPECT_EQ(result.error->kind, kind) << result.error->description;
+    if (fault != Fault::ResetMidAnswer) {
+      EXPECT_EQ(result.response.has_value(), fault == Fault::CloseMidAnswer);
     }
+    EXPECT_EQ(client.perform(fetchFrom(server.url())).response->body, "0123456789");
   }
   ::unsetenv("SSL_CERT_FILE");
 }

@@ -33,40 +33,27 @@ TEST(RetryPolicy, WaitsGrowAreSpreadAndEnd) {
 
 class Schedule : public testing::Test {
  protected:
-  Schedule() {
-    options.maximumWaiting = 100;
-    options.maximumConnectionsPerHost = 3;
-  }
-
-  HTTPSchedule::Exchange exchange(const std::string& name, HTTPRequest::Retry retry, std::size_t size = 10,
-                                  const std::string& host = "https://a") {
+  /// A post, or a fetch when it is never sent again.
+  void add(const std::string& name, std::size_t size = 10, std::uint32_t owner = 0,
+           HTTPRequest::Retry retry = HTTPRequest::Retry::UntilSent, const std::string& host = "https://a") {
     HTTPRequest request;
     request.url = host + "/" + name;
     request.body = std::string(size, 'x');
     request.retry = retry;
-    return std::make_unique<HTTPExchange>(
-        std::move(request),
-        [this, name](const HTTPResult& result) {
-          if (result.error) givenUpNames += name;
-        },
-        now, outstanding);
+    request.owner = owner;
+    const auto noteFailure = [this, name](const HTTPResult& result) {
+      if (result.error) givenUpNames += name;
+    };
+    schedule.add(std::make_unique<HTTPExchange>(std::move(request), noteFailure, now, outstanding));
   }
-  HTTPSchedule::Exchange post(const std::string& name, std::size_t size = 10,
-                              const std::string& host = "https://a") {
-    return exchange(name, HTTPRequest::Retry::UntilSent, size, host);
-  }
-  HTTPSchedule::Exchange postOf(std::uint32_t owner, const std::string& name, std::size_t size = 10) {
-    auto its = post(name, size);
-    its->request.owner = owner;
-    return its;
-  }
-  HTTPSchedule::Exchange fetch(const std::string& name) {
-    return exchange(name, HTTPRequest::Retry::Never, 0);
+  void addFetch(const std::string& name) { add(name, 0, 0, HTTPRequest::Retry::Never); }
+  void addToOtherHost(const std::string& name) {
+    add(name, 1, 0, HTTPRequest::Retry::UntilSent, "https://b");
   }
   /// Takes all that may go out now; the names in order.
   std::string takeReady() {
     std::string names;
-    while (auto next = schedule().next(now)) {
+    while (auto next = schedule.next(now)) {
       names += next->request.url.substr(next->request.url.rfind('/') + 1);
       active.push_back(std::move(next));
     }
@@ -74,35 +61,28 @@ class Schedule : public testing::Test {
   }
   std::string givenUp() { return std::exchange(givenUpNames, ""); }
   void failFirst() {
-    schedule().failed(std::move(active.front()), {HTTPError::Kind::Connect, "down"}, true, now);
+    schedule.failed(std::move(active.front()), {HTTPError::Kind::Connect, "down"}, true, now);
     active.erase(active.begin());
   }
   void answerFirst() {
-    schedule().answered(*active.front());
+    schedule.answered(*active.front());
     active.front()->complete({HTTPResponse(), std::nullopt});
     active.erase(active.begin());
-  }
-  HTTPSchedule& schedule() {
-    if (!_schedule) _schedule.emplace(options);
-    return *_schedule;
   }
 
   std::string givenUpNames;
   HTTPOutstanding outstanding;
-  HTTPClient::Options options;
+  HTTPSchedule schedule{{.maximumWaiting = 100, .maximumConnectionsPerHost = 3}};
   Instant now{Instant{} + 1h};
   std::vector<HTTPSchedule::Exchange> active;
-
- private:
-  std::optional<HTTPSchedule> _schedule;
 };
 
 TEST_F(Schedule, KeepsTheOrderOfAHostAndOneConnectionForFetches) {
-  for (const char* name : {"1", "2", "3", "4"}) schedule().add(post(name));
-  schedule().add(post("b", 10, "https://b"));
+  for (const char* name : {"1", "2", "3", "4"}) add(name);
+  addToOtherHost("b");
   EXPECT_EQ(takeReady(), "12b");
-  schedule().add(fetch("f"));
-  schedule().add(fetch("g"));
+  addFetch("f");
+  addFetch("g");
   EXPECT_EQ(takeReady(), "f");
   answerFirst();
   EXPECT_EQ(takeReady(), "g") << "a fetch goes before posts";
@@ -111,16 +91,16 @@ TEST_F(Schedule, KeepsTheOrderOfAHostAndOneConnectionForFetches) {
 }
 
 TEST_F(Schedule, AFailedPostComesBackBeforeThoseBehindIt) {
-  for (const char* name : {"1", "2", "3", "4"}) schedule().add(post(name));
+  for (const char* name : {"1", "2", "3", "4"}) add(name);
   EXPECT_EQ(takeReady(), "12");
   failFirst();
   EXPECT_EQ(takeReady(), "3") << "others do not wait for it";
-  auto due = schedule().nextAdvance();
+  auto due = schedule.nextAdvance();
   ASSERT_TRUE(due);
   EXPECT_GE(*due - now, 100ms);
   EXPECT_LE(*due - now, 300ms);
   now = *due;
-  schedule().advance(now);
+  schedule.advance(now);
   answerFirst();
   EXPECT_EQ(takeReady(), "1");
   EXPECT_EQ(givenUp(), "");
@@ -128,22 +108,22 @@ TEST_F(Schedule, AFailedPostComesBackBeforeThoseBehindIt) {
 
 TEST_F(Schedule, InAnOutageAtMostSoManyBytesWait) {
   EXPECT_EQ(HTTPClient::Options().maximumWaiting, std::size_t{8} << 20);
-  schedule().add(post("1", 60));
-  schedule().add(post("2", 60));
+  add("1", 60);
+  add("2", 60);
   EXPECT_EQ(takeReady(), "12");
   failFirst();
   failFirst();
   EXPECT_EQ(givenUp(), "2");
-  schedule().add(post("3", 40));
-  schedule().add(post("4", 1));
+  add("3", 40);
+  add("4", 1);
   EXPECT_EQ(givenUp(), "4") << "what the queue holds counts too";
-  schedule().add(post("5", 1, "https://b"));
+  addToOtherHost("5");
   EXPECT_EQ(givenUp(), "") << "another host is not down";
 }
 
 TEST_F(Schedule, AnAnswerEndsTheWaitOfAllAndTheOldestGoFirst) {
   for (const char* name : {"1", "2", "3"}) {
-    schedule().add(post(name, 25));
+    add(name, 25);
     now += 1ms;
   }
   EXPECT_EQ(takeReady(), "12");
@@ -151,28 +131,28 @@ TEST_F(Schedule, AnAnswerEndsTheWaitOfAllAndTheOldestGoFirst) {
   failFirst();
   EXPECT_EQ(takeReady(), "3");
   failFirst();
-  schedule().add(post("4", 100));
-  schedule().add(post("5", 10));
+  add("4", 100);
+  add("5", 10);
   EXPECT_EQ(givenUp(), "5") << "4 is about to find out whether the host is back";
   EXPECT_EQ(takeReady(), "4");
   answerFirst();
   EXPECT_EQ(takeReady(), "12") << "at once";
   failFirst();
-  schedule().retryNow();
+  schedule.retryNow();
   answerFirst();
   EXPECT_EQ(takeReady(), "13") << "it waits for nothing when the daemon stops";
   EXPECT_EQ(givenUp(), "");
 }
 
 TEST_F(Schedule, PostsQueuedBehindAnOutageShareItsEnd) {
-  for (const char* name : {"1", "2", "3"}) schedule().add(post(name));
+  for (const char* name : {"1", "2", "3"}) add(name);
   EXPECT_EQ(takeReady(), "12");
   now += 61s;
-  schedule().add(post("4"));
+  add("4");
   failFirst();
   EXPECT_EQ(givenUp(), "31");
 
-  for (const char* name : {"5", "6"}) schedule().add(post(name));
+  for (const char* name : {"5", "6"}) add(name);
   now += 61s;
   answerFirst();
   EXPECT_EQ(takeReady(), "45");
@@ -181,25 +161,25 @@ TEST_F(Schedule, PostsQueuedBehindAnOutageShareItsEnd) {
 }
 
 TEST_F(Schedule, OwnersTakeTurnsAndShareWhatMayWait) {
-  for (const char* name : {"1", "2", "3", "4", "5"}) schedule().add(postOf(7, name));
-  schedule().add(postOf(8, "a"));
+  for (const char* name : {"1", "2", "3", "4", "5"}) add(name, 10, 7);
+  add("a", 10, 8);
   EXPECT_EQ(takeReady(), "1a");
   failFirst();
   failFirst();
-  schedule().add(postOf(7, "6", 40));
-  schedule().add(postOf(8, "b", 30));
+  add("6", 40, 7);
+  add("b", 30, 8);
   EXPECT_EQ(givenUp(), "234") << "who has most waiting gives way";
-  schedule().add(postOf(8, "c", 70));
+  add("c", 70, 8);
   EXPECT_EQ(givenUp(), "c") << "nobody comes to more than that one has";
 }
 
 TEST_F(Schedule, AFetchThatFindsNoConnectionInTimeIsGivenUp) {
-  for (const char* name : {"f", "g", "h", "i"}) schedule().add(fetch(name));
+  for (const char* name : {"f", "g", "h", "i"}) addFetch(name);
   EXPECT_EQ(takeReady(), "fgh");
-  EXPECT_EQ(schedule().nextAdvance(), now + 60s);
-  schedule().advance(now + 59s);
+  EXPECT_EQ(schedule.nextAdvance(), now + 60s);
+  schedule.advance(now + 59s);
   EXPECT_EQ(givenUp(), "");
-  schedule().advance(now + 60s);
+  schedule.advance(now + 60s);
   EXPECT_EQ(givenUp(), "i");
 }
 
