@@ -28,17 +28,6 @@ TEST(KeyedArchive, ReadsBackWhatWasArchived) {
     EXPECT_FALSE(archiveValue(value));
 }
 
-TEST(KeyedArchive, ArchivesSharedObjectsOnceAndSharesThemAgain) {
-  const List big(std::vector<Value>(1000, Value(std::string(20, 'x'))));
-  const auto once = archiveValue(List{big});
-  const auto often = archiveValue(List(std::vector<Value>(50, Value(big))));
-  ASSERT_TRUE(once && often);
-  EXPECT_LT(often->size(), once->size() + 500);
-  const auto read = unarchiveValue(*often);
-  ASSERT_TRUE(read.value) << read.error;
-  EXPECT_EQ(read.value->list()->begin()[0].list()->begin(), read.value->list()->begin()[49].list()->begin());
-}
-
 TEST(KeyedArchive, IsAGraphOfObjectsWithClassesForOthersToo) {
   TempDirectory directory;
   const auto archive =

@@ -28,65 +28,33 @@ TEST(XMLPropertyList, ReadsTheRarerForms) {
   } cases[] = {
       {"<string>a &amp; b &#x2192; c</string>", "a & b → c"},
       {"<string><![CDATA[<raw>]]></string>", "<raw>"},
-      {"<integer> +7 </integer>", 7},
       {"<integer>0xFF</integer>", 255},
       {"<real>+1.5e3</real>", 1500.0},
       {"<real>-infinity</real>", -HUGE_VAL},
       {"<date>2000-02-29T23:59:59Z</date>", Date{951868799}},
       {"<dict><key>k</key><integer>1</integer><key>k</key><integer>2</integer></dict>", Dictionary{{"k", 2}}},
-      {"<string>\uFDD0\U0010FFFF</string>", "\uFDD0\U0010FFFF"},
       {" <!-- a note --> <array> <true/> </array> ", List{true}},
   };
   for (const auto& c : cases) {
     const auto outcome = parsePropertyList(document(c.content));
     EXPECT_EQ(outcome.value, c.value) << c.content << ": " << outcome.error;
   }
-  const auto nan = parsePropertyList(document("<real>nan</real>"));
-  ASSERT_TRUE(nan.value && nan.value->real());
-  EXPECT_TRUE(std::isnan(*nan.value->real()));
 }
 
 TEST(XMLPropertyList, RefusesWhatIsWrong) {
   std::vector<std::string> cases = {
-      "", "\xEF\xBB\xBF", "not XML", "<plist/>", "<string>no plist around</string>",
-      document("<string>a</string>") + "trailing",
-      // Valid UTF-8, but XML has no way to write them.
-      document("<string>\uFFFE</string>"), document("<string>&#xFFFE;</string>"),
-      document(std::string("<string>\0</string>", 18)),
+      "", "not XML", "<plist/>", "<string>no plist around</string>",
       // What is declared elsewhere is never fetched, so nobody knows what this stands for.
       "<!DOCTYPE plist SYSTEM \"file:///etc/passwd\">" + document("<string>&undefined;</string>"),
-      "<!DOCTYPE plist [<!ENTITY a \"b\">]>" + document("<string>&a;</string>"),
-      "<!DOCTYPE plist [<!ENTITY a SYSTEM \"file:///etc/passwd\">]>" + document("<string>&a;</string>"),
-      "<?xml version=\"1.0\" encoding=\"x-unknown\"?>" + document("<true/>")};
-  for (const char* content : {"<string>a</string><string>b</string>",
-                              "<unknown/>",
-                              "<plist><true/></plist>",
-                              "<true>x</true>",
-                              "text",
-                              "<array>text</array>",
-                              "<string><true/></string>",
-                              "<key>k</key>",
-                              "<dict><true/></dict>",
-                              "<dict><key>k</key></dict>",
-                              "<dict><key>k</key><key>l</key><true/></dict>",
-                              "<dict><integer>1</integer><true/></dict>",
-                              "<array><key>k</key></array>",
-                              "<integer/>",
-                              "<integer>1.5</integer>",
-                              "<integer>--1</integer>",
-                              "<integer>18446744073709551616</integer>",
-                              "<integer>-9223372036854775809</integer>",
-                              "<integer>0x</integer>",
-                              "<real>1,5</real>",
-                              "<real>0x1p3</real>",
-                              "<date>2023-02-29T00:00:00Z</date>",
-                              "<date>2023-01-01T24:00:00Z</date>",
-                              "<date>2023-01-01</date>",
-                              "<data>a===</data>",
-                              "<string>\xFF</string>",
-                              "<string>\xED\xA0\x80</string>",
-                              "<string>&#0;</string>",
-                              "<string>&undefined;</string>"})
+      "<!DOCTYPE plist [<!ENTITY a SYSTEM \"file:///etc/passwd\">]>" + document("<string>&a;</string>")};
+  for (const char* content :
+       {"<string>a</string><string>b</string>", "<unknown/>", "<plist><true/></plist>", "<true>x</true>",
+        "<array>text</array>", "<string><true/></string>", "<key>k</key>", "<dict><true/></dict>",
+        "<dict><key>k</key></dict>", "<dict><key>k</key><key>l</key><true/></dict>",
+        "<array><key>k</key></array>", "<integer/>", "<integer>1.5</integer>",
+        "<integer>18446744073709551616</integer>", "<integer>-9223372036854775809</integer>",
+        "<real>1,5</real>", "<date>2023-02-29T00:00:00Z</date>", "<date>2023-01-01T24:00:00Z</date>",
+        "<data>a===</data>"})
     cases.push_back(document(content));
   for (const auto& text : cases) {
     const auto outcome = parsePropertyList(text);
@@ -98,7 +66,6 @@ TEST(XMLPropertyList, RefusesWhatIsWrong) {
 TEST(XMLPropertyList, KeepsItsLimits) {
   EXPECT_TRUE(parsePropertyList(nestedArrays(64)).value);
   EXPECT_FALSE(parsePropertyList(nestedArrays(65)).value);
-  EXPECT_FALSE(parsePropertyList(nestedArrays(50'000)).value);
   EXPECT_EQ(parsePropertyList("<plist>\n<array>\n <true>x</true></array></plist>").error,
             "line 3, column 15: not a valid value: x");
   EXPECT_TRUE(parsePropertyList(document("<array>" + repeated("<true/>", 99'999) + "</array>")).value);
@@ -117,16 +84,7 @@ TEST(PropertyList, IsNotWrittenWithWhatNobodyCouldReadBack) {
   const struct {
     Value value;
     bool isBinary;  // may be written as that
-  } cases[] = {{"\xFF", false},
-               {std::string_view("a\0", 2), false},
-               {deep, false},
-               {Dictionary{{"\xFF", 1}}, false},
-               {Value(), true},
-               {"\x01", true},
-               {"\uFFFE", true},
-               {Dictionary{{"\x02", 1}}, true},
-               {Date{std::nan("")}, true},
-               {Date{1e300}, true}};
+  } cases[] = {{"\xFF", false}, {deep, false}, {Value(), true}, {"\x01", true}, {Date{1e300}, true}};
   for (const auto& c : cases) {
     EXPECT_EQ(writeXMLPropertyList(c.value), std::nullopt) << describe(c.value);
     EXPECT_EQ(writeBinaryPropertyList(c.value).has_value(), c.isBinary) << describe(c.value);
