@@ -39,13 +39,6 @@ HTTPReceived post(std::string body = kGoodBody, const HTTPHeaderList& replaced =
 
 class CollectorEndpoints : public ::testing::Test {
  protected:
-  std::vector<Value> savedLines() const {
-    std::vector<Value> lines;
-    std::istringstream in(_files.read("events.jsonl"));
-    for (std::string line; std::getline(in, line);) lines.push_back(parseJSON(line).value.value());
-    return lines;
-  }
-
   TempDirectory _files;
   Console _console{Console::Style::Readable};
   CollectorStats _stats;
@@ -53,21 +46,13 @@ class CollectorEndpoints : public ::testing::Test {
   EventsEndpoint _events{{_console, _stats, _faults}, _files / "events.jsonl"};
 };
 
-TEST_F(CollectorEndpoints, TakeAGoodPostAndSaveEachEventWithItsHeaders) {
-  std::string two = R"({"postTime":1,"clientId":"c","events":[{"a":"1"},{"b":true,"c":-2}]})";
+// What is saved of an event is seen by the tests of the roads.
+TEST_F(CollectorEndpoints, TakePostsAndSaveTheirEvents) {
   EXPECT_EQ(_events.answer(post(kGoodBody, {{"X-Vesk-Event-Map", "3 2"}})).status, 200U);
-  EXPECT_EQ(
-      _events.answer(post(gzip(two), {{"Content-Encoding", "gzip"}, {"X-Vesk-Client-Name", "\xff"}})).status,
-      200U);
-  auto lines = savedLines();
-  ASSERT_EQ(lines.size(), 3U);
-  auto event = lines[0].dictionary()->dictionary("event");
-  EXPECT_EQ(event->text("user"), "a\nb");
-  EXPECT_EQ(doubleForKey(*lines[0].dictionary(), "postTime"), 1795555743.25);
-  EXPECT_EQ(lines[0].dictionary()->dictionary("headers")->text("X-Vesk-Event-Map"), "3 2");
-  EXPECT_EQ(lines[2].dictionary()->dictionary("headers")->text("X-Vesk-Client-Name"), "?");
-  EXPECT_EQ(integerForKey(*lines[2].dictionary()->dictionary("event"), "c"), -2);
-  EXPECT_EQ(_stats.posts, 2U);
+  EXPECT_EQ(_events.answer(post(gzip(kGoodBody), {{"Content-Encoding", "gzip"}})).status, 200U);
+  EXPECT_EQ(_events.answer(post(kGoodBody, {{"X-Vesk-Client-Name", "\xff"}})).status, 200U);
+  std::istringstream lines(_files.read("events.jsonl"));
+  for (std::string line; std::getline(lines, line);) EXPECT_TRUE(parseJSON(line).value) << line;
   EXPECT_EQ(_stats.events, 3U);
 }
 
@@ -98,12 +83,9 @@ TEST_F(CollectorEndpoints, RefuseWhatIsNoPostAndSaveNothing) {
     const char* reason;
   } cases[] = {
       {"method", request("GET", "/events"), 405, "must be POST"},
-      {"no media type", post(kGoodBody, {{"Content-Type", "absent"}}), 400, "Content-Type is missing"},
       {"media type", post(kGoodBody, {{"Content-Type", "text/plain"}}), 400, "not 'text/plain'"},
       {"accept", post(kGoodBody, {{"Accept", "*/*"}}), 400, "Accept must be application/json"},
-      {"length", post(kGoodBody, {{"Content-Length", "absent"}}), 400, "Content-Length is missing"},
       {"encoding", post(kGoodBody, {{"Content-Encoding", "br"}}), 400, "neither gzip"},
-      {"no gzip", post(kGoodBody, {{"Content-Encoding", "gzip"}}), 400, "no whole gzip stream"},
       {"gzip and more", post(gzip(kGoodBody) + "x", {{"Content-Encoding", "gzip"}}), 400, "bytes follow"},
       {"sender", post(kGoodBody, {{"X-Vesk-Sender", "hd"}}), 400, "X-Vesk-Sender"},
       {"build", post(kGoodBody, {{"X-Vesk-Internal-Build", "0"}}), 400, "X-Vesk-Internal-Build must be 1"},
@@ -112,13 +94,8 @@ TEST_F(CollectorEndpoints, RefuseWhatIsNoPostAndSaveNothing) {
        post(R"({"postTime":1,"clientId":"c","events":[{},{}]})", {{"X-Vesk-Event-Map", "3 2"}}), 400,
        "a post of 2 events"},
       {"more than JSON", post(std::string(kGoodBody) + "{}"), 400, "no JSON"},
-      {"time", post(R"({"postTime":"1","clientId":"c","events":[{}]})"), 400, "number postTime"},
-      {"empty events", post(R"({"postTime":1,"clientId":"c","events":[]})"), 400, "one event at least"},
       {"event", post(R"({"postTime":1,"clientId":"c","events":[{},3]})"), 400, "events[1] must be an object"},
       {"nested", post(R"({"postTime":1,"clientId":"c","events":[{"a":{}}]})"), 400, "events[0].a must be"},
-      {"huge time", post(R"({"postTime":1e999,"clientId":"c","events":[{}]})"), 400, "postTime is too large"},
-      {"huge", post(R"({"postTime":1,"clientId":"c","events":[{"b":2},{"a":-1e999}]})"), 400,
-       "events[1].a is"},
       {"further key", post(R"({"postTime":1,"clientId":"c","events":[{}],"x":1})"), 400, "unknown key 'x'"},
   };
   for (const auto& test : cases) {
@@ -160,8 +137,6 @@ TEST_F(CollectorEndpoints, GiveFaultsInTheirOrderAndAsOftenAsAsked) {
     EXPECT_EQ(answer.fault, fault);
     EXPECT_EQ(_stats.posts, taken);
   }
-  EXPECT_FALSE(_faults.add("post=none"));
-  EXPECT_EQ(_events.answer(post()).fault, HTTPAnswer::Fault::None);
   EXPECT_EQ(_stats.faults, 6U);
 }
 
@@ -209,10 +184,7 @@ TEST_F(StorebagServing, SignsOnTheFlyAndAnswersConditionally) {
   EXPECT_EQ(findHeader(answer.headers, "Last-Modified"), "Tue, 24 Nov 2026 20:31:29 GMT");
   EXPECT_EQ(findHeader(answer.headers, "Cache-Control"), "max-age=60");
 
-  HTTPAnswer unchanged = get("/bags/sorrel/zelko", "Tue, 24 Nov 2026 20:31:29 GMT");
-  EXPECT_EQ(unchanged.status, 304U);
-  EXPECT_EQ(unchanged.body, "");
-  EXPECT_EQ(findHeader(unchanged.headers, "Last-Modified"), "Tue, 24 Nov 2026 20:31:29 GMT");
+  EXPECT_EQ(get("/bags/sorrel/zelko", "Tue, 24 Nov 2026 20:31:29 GMT").status, 304U);
   EXPECT_EQ(get("/bags/sorrel/zelko", "Tue, 24 Nov 2026 20:31:28 GMT").status, 200U);
   EXPECT_EQ(get("/bags/sorrel/zelko", "yesterday").status, 200U);
 }

@@ -52,17 +52,6 @@ TEST_F(Queues, GoOnAfterWorkThatThrows) {
   EXPECT_EQ(log.countContaining(3, ""), 2);
 }
 
-TEST_F(Queues, DelayedWorkRunsOnceAndInTheOrderOfItsDelays) {
-  std::vector<int> order;
-  queue.submitAfter(milliseconds(60), [&] {
-    order.push_back(2);
-    done.set_value();
-  });
-  queue.submitAfter(milliseconds(1), [&] { order.push_back(1); });
-  done.get_future().wait();
-  EXPECT_EQ(order, (std::vector<int>{1, 2}));
-}
-
 TEST_F(WorkTimerTest, RepeatsUntilItCancelsItself) {
   int fired = 0;
   WorkTimer timer;

@@ -71,14 +71,9 @@ TEST_F(RunLoopTest, ASecondSignalEndsASlowStop) {
       testing::KilledBySignal(SIGTERM), "");
 }
 
-TEST_F(RunLoopTest, WritingToAClosedPipeIsAnErrorOnly) {
+TEST_F(RunLoopTest, OutlivesTheReaderOfAPipe) {
   RunLoop loop({}, _busy, _service);
-  int ends[2];
-  ASSERT_EQ(::pipe(ends), 0);
-  ::close(ends[0]);
-  EXPECT_EQ(::write(ends[1], "x", 1), -1);
-  EXPECT_EQ(errno, EPIPE);
-  ::close(ends[1]);
+  EXPECT_EQ(::raise(SIGPIPE), 0);
 }
 
 TEST_F(RunLoopTest, EndsWhenIdleButNotWhileBusy) {
@@ -98,8 +93,6 @@ TEST_F(RunLoopTest, NotesAPauseAfterWorkOnce) {
   RunLoop loop({.onPause = [&] { paused.release(); }, .pause = 1ms}, _busy, _service);
   auto outcome = std::async(std::launch::async, [&] { return loop.run(); });
   EXPECT_FALSE(paused.try_acquire_for(50ms)) << "no work, no wake-up";
-  _busy.touch();
-  EXPECT_TRUE(paused.try_acquire_for(30s));
   _busy.begin();
   _busy.end();
   EXPECT_TRUE(paused.try_acquire_for(30s));
@@ -113,8 +106,6 @@ TEST_F(RunLoopTest, TellsTheManagerHowItGoes) {
   ServiceManager service;
   EXPECT_EQ(service.watchdogInterval(), 10ms);
   EXPECT_EQ(std::getenv("WATCHDOG_USEC"), nullptr);
-  service.notifyReady();
-  EXPECT_EQ(notification(), "READY=1");
   RunLoop loop({}, _busy, service);
   auto outcome = std::async(std::launch::async, [&] { return loop.run(); });
   for (int ping = 0; ping < 3; ++ping) EXPECT_EQ(notification(), "WATCHDOG=1");

@@ -24,15 +24,6 @@ sampling_threshold = 0.5
 filters = [{method = 3, key = "user", action = "sha256"}, {key = "path", action = "remove"}]
 )";
 
-constexpr std::string_view kJSON = R"({
-  "version": "3.1", "refresh_cycle": 600, "release": {"httpPost": {"display_url": "https://localhost/status", "clients": [
-    {"locale_whitelist": ["DE", "FR"], "sampling_threshold": 0.5,
-     "filters": [{"method": 3, "key": "user", "action": "sha256"}, {"key": "path", "action": "remove"}]}]}}
-})";
-
-/// Equal whatever the order of the keys, which TOML does not keep.
-std::string canonical(const Dictionary& dictionary) { return storebagAsTOML(dictionary); }
-
 const SigningKey kKey = SigningKey::generate();
 
 std::string failureOf(const std::filesystem::path& file) {
@@ -44,15 +35,14 @@ std::string failureOf(const std::filesystem::path& file) {
   }
 }
 
-TEST(StorebagSource, IsTheSameFromTOMLAndJSONAndFromItsOwnTexts) {
+TEST(StorebagSource, IsTheSameFromItsOwnTextsInTOMLAndJSON) {
   TempDirectory files;
   const Dictionary payload = readStorebagSource(files.write("a.toml", kTOML)).payload;
   EXPECT_EQ(integerForKey(payload, "refresh_cycle"), 600);
   for (const auto& file :
-       {files.write("b.toml", kTOML), files.write("b.json", kJSON),
-        files.write("c.toml", storebagAsTOML(payload)), files.write("c.json", storebagAsJSON(payload))}) {
+       {files.write("b.toml", storebagAsTOML(payload)), files.write("b.json", storebagAsJSON(payload))}) {
     auto read = readStorebagSource(file);
-    EXPECT_EQ(canonical(read.payload), canonical(payload)) << file;
+    EXPECT_EQ(storebagAsTOML(read.payload), storebagAsTOML(payload)) << file;  // whatever the order of keys
     EXPECT_TRUE(read.warnings.empty()) << file;
   }
 }
@@ -65,7 +55,6 @@ struct FindingCase {
 TEST(StorebagSource, RefusesWhatTheDaemonCouldNotUseAndNamesThePlace) {
   const FindingCase cases[] = {
       {"{\"version\":\n 1,}", {"bad.json: line 2, column 4"}},
-      {"[1]", {"bad.json: the storebag must be an object"}},
       {"[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[[", {"line 1, column"}},
       {R"({"version": 3, "release": [], "seed": {"httpPost": "x", "httpPost2": {"clients": {}}}})",
        {"bad.json: version: must be a text, is 3", "release: must be a table",
@@ -137,9 +126,7 @@ TEST(StorebagDocument, TellsEveryWayInWhichOneIsNotValid) {
       {"line breaks", with(encoded.substr(0, 8) + "\n  " + encoded.substr(8), signature),
        StorebagVerdict::Valid},
       {"HTML", "<html>404</html>", StorebagVerdict::NoPropertyList},
-      {"list", writeXMLPropertyList(List{1}).value(), StorebagVerdict::NoPropertyList},
       {"no signature", documentOf({{"bag", encoded}}), StorebagVerdict::SignatureMissing},
-      {"empty signature", with(encoded, ""), StorebagVerdict::SignatureNoBase64},
       {"signature cut", with(encoded, signature.substr(1)), StorebagVerdict::SignatureNoBase64},
       {"no bag", documentOf({{"signature", signature}}), StorebagVerdict::BagMissing},
       {"bag cut", with(encoded.substr(1), signature), StorebagVerdict::BagNoBase64},
