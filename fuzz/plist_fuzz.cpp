@@ -1,8 +1,10 @@
-// Property lists of both encodings: whatever is read can be written and reads back the same.
+// Property lists of both encodings and keyed archives: whatever is read can be written and reads back the
+// same.
 #include <cstdint>
 #include <cstdlib>
 
 #include "platform/plist/PropertyList.h"
+#include "tools/collector/ArchiveText.h"
 
 namespace {
 
@@ -22,6 +24,14 @@ void roundTrip(const Value& value, const std::optional<std::string>& written, Pr
   require(describe(*again.value, shown).substr(0, shown) == describe(value, shown).substr(0, shown));
 }
 
+void readArchive(std::string_view bytes) {
+  const auto outcome = unarchiveValue(bytes);
+  require(outcome.value.has_value() == outcome.error.empty());
+  if (!outcome.value) return;
+  const auto archive = archiveValue(*outcome.value);
+  require(archive && archiveText(*archive) == archiveText(bytes));
+}
+
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
@@ -35,5 +45,6 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     roundTrip(*outcome.value, binary, flavor, std::size_t{1} << 20);
     roundTrip(*outcome.value, writeXMLPropertyList(*outcome.value), PropertyListFlavor::Plain, 1);
   }
+  readArchive(bytes);
   return 0;
 }

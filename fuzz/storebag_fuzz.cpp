@@ -6,28 +6,17 @@
 #include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
 #include "platform/plist/PropertyList.h"
-#include "platform/queue/TimedQueuePool.h"
+#include "tests/support/BackendHarness.h"
 
 namespace {
 
 using namespace vesk;
 
-struct Shared {
-  Shared() {
+struct Harness : test::BackendHarness {
+  Harness() {
     SystemLog::setLevel(static_cast<int>(LogLevel::Error));
     setRootPrefix("/nonexistent");  // the machine's own preferences may name a server
   }
-
-  HTTPClient http;
-  Counters counters;
-  TimedQueuePool networkQueues{1};
-  BackendServices services{http,
-                           WallClock::system(),
-                           counters,
-                           networkQueues,
-                           [](bool) { return std::string("id"); },
-                           [] { return true; },
-                           [] { return std::optional<std::string>("US"); }};
 };
 
 /// The profile without addresses: the bytes choose what is sent, not whom it reaches.
@@ -50,13 +39,13 @@ Value withoutAddresses(const Value& value) {
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-  static Shared shared;
+  static Harness harness;
   const auto outcome = parsePropertyList({reinterpret_cast<const char*>(data), size});
   if (!outcome.value) return 0;
   const Value profile = withoutAddresses(*outcome.value);
   if (!profile.dictionary()) return 0;
   for (bool knowsUser : {false, true}) {
-    auto backend = newBackendWithName("httpPost", *profile.dictionary(), Text("Phone"), 5, shared.services);
+    auto backend = newBackendWithName("httpPost", *profile.dictionary(), Text("Phone"), 5, harness.services);
     if (!backend) continue;
     backend->setCompType(5);
     if (knowsUser) {
