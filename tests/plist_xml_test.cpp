@@ -78,18 +78,5 @@ TEST(XMLPropertyList, KeepsLineEndsAsTheyAre) {
   EXPECT_EQ(parsePropertyList(*writeXMLPropertyList(text)).value, text);
 }
 
-TEST(PropertyList, IsNotWrittenWithWhatNobodyCouldReadBack) {
-  Value deep = List{};
-  for (int i = 1; i < 65; ++i) deep = List{deep};
-  const struct {
-    Value value;
-    bool isBinary;  // may be written as that
-  } cases[] = {{"\xFF", false}, {deep, false}, {Value(), true}, {"\x01", true}, {Date{1e300}, true}};
-  for (const auto& c : cases) {
-    EXPECT_EQ(writeXMLPropertyList(c.value), std::nullopt) << describe(c.value);
-    EXPECT_EQ(writeBinaryPropertyList(c.value).has_value(), c.isBinary) << describe(c.value);
-  }
-}
-
 }  // namespace
 }  // namespace vesk
