@@ -166,29 +166,6 @@ TEST(IPCListener, DoesNotWaitForEverForAHandlerThatHangs) {
   EXPECT_EQ(service.listener().connectionCount(), 0u);
 }
 
-TEST(IPCListener, TakesOverAStaleSocketButNoLiveOne) {
-  TestService first;
-  auto samePath = [&](IPCListener::Options& options) { options.socketPath = first.path(); };
-  EXPECT_THROW(TestService second(samePath), std::system_error);
-  TestClient client(first);
-  EXPECT_EQ(client.call("flushMessagesWithReply"), "posted all");
-
-  // What a daemon that was killed leaves behind: a socket that nobody listens on.
-  const std::string stale = first.path() + ".stale";
-  {
-    UnixSocketAddress address(stale);
-    FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    ASSERT_EQ(::bind(socket.get(), address.get(), address.size()), 0);
-  }
-  {
-    TestService third([&](IPCListener::Options& options) { options.socketPath = stale; });
-    TestClient other(third);
-    EXPECT_EQ(other.call("flushMessagesWithReply"), "posted all");
-    EXPECT_EQ(std::filesystem::status(stale).permissions(), static_cast<std::filesystem::perms>(0666));
-  }
-  EXPECT_FALSE(std::filesystem::exists(stale));
-}
-
 TEST(IPCListener, ServesAnInheritedSocketAndAPathLongerThanAnAddress) {
   TempDirectory directory;
   const std::string path = directory / std::string(120, 'd') / "socket";

@@ -175,41 +175,6 @@ TEST_F(SandboxTest, DeniesWhatIsNotGranted) {
   ::munmap(page, 4096);
 }
 
-// Sockets, logs, uploads and adaptors are tried by the tests on the real daemon.
-TEST_F(SandboxTest, AllowsWhatTheDaemonDoes) {
-  const fs::path certificates = directory.write("ca/certificates.pem", "authority");
-  const fs::path replacement = directory.write("ca/replacement.pem", "authority");
-  const fs::path settings = directory.write("etc/veskreporting/device.toml", "");
-  const fs::path state = root / "var/lib/veskreportingd";
-  const std::vector<Probe> probes = {
-      {"read the profile", [&] { return opens(profilePath(), O_RDONLY); }},
-      {"read settings", [&] { return opens(settings, O_RDONLY); }},
-      {"read certificates", [] { return opens("/etc/ssl/certs", O_RDONLY); }},
-      {"read other certificates", [&] { return opens(certificates, O_RDONLY); }},
-      {"read what replaces them", [&] { return opens(replacement, O_RDONLY); }},
-      {"read about itself", [] { return opens("/proc/self/maps", O_RDONLY); }},
-      {"make a file", [&] { return opens(state / "new", O_WRONLY | O_CREAT | O_EXCL); }},
-      {"rename a file", [&] { return ::rename((state / "new").c_str(), (state / "old").c_str()); }},
-      {"truncate a file", [&] { return opens(state / "old", O_WRONLY | O_TRUNC); }},
-      {"remove a file", [&] { return ::unlink((state / "old").c_str()); }},
-      {"look a name up",
-       [] {
-         addrinfo* found = nullptr;
-         int result = ::getaddrinfo("localhost", "80", nullptr, &found);
-         if (found) ::freeaddrinfo(found);
-         return result == 0 ? 0L : -1L;
-       }},
-      {"signal itself", [] { return ::raise(SIGWINCH); }},
-  };
-  ::setenv("SSL_CERT_FILE", certificates.c_str(), 1);
-  ::setenv("XDG_CONFIG_HOME", "relative", 1);  // is left out
-  EXPECT_EQ(inside([&] { return faults(probes, [](int error) { return error != 0; }); }), "");
-  ::unsetenv("SSL_CERT_FILE");
-  ::unsetenv("XDG_CONFIG_HOME");
-  EXPECT_EQ(fs::status(root / "run/veskreportingd").permissions(), fs::perms{0755});
-  EXPECT_EQ(fs::status(state).permissions(), fs::perms{0750});
-}
-
 TEST_F(SandboxTest, DeniesPortsAndSocketsOfOthersWhereTheKernelKnowsHow) {
   if (::syscall(SYS_landlock_create_ruleset, nullptr, 0, LANDLOCK_CREATE_RULESET_VERSION) < 6)
     GTEST_SKIP() << "this kernel does not";
