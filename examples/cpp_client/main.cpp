@@ -15,7 +15,9 @@ int main(int argc, char** argv) {
     return 1;
   }
   ReportingStatus configured = reporting.setSessionInfo(
-      {{kVeskReportingSessionInfoSessionID, 1}, {kVeskReportingSessionInfoClientType, 5}},
+      {{kVeskReportingSessionInfoSessionID, 1},
+       {kVeskReportingSessionInfoClientType, 5},
+       {kVeskReportingSessionInfoRequireUserInfo, true}},  // so that consent, sampling and filters apply
       Dictionary{{kVeskReportingUserInfoClientName, "Camera"}});
   if (configured != ReportingStatus::Queued) return 1;
 
