@@ -67,7 +67,9 @@ def main():
         session = Session(options.socket)
         session.configure({"sessionID": GLib.Variant("u", os.getpid()),
                            "clientType": GLib.Variant("i", options.client_type),
-                           "clientVersion": GLib.Variant("u", 1)},
+                           "clientVersion": GLib.Variant("u", 1),
+                           # so that consent, sampling and filters apply
+                           "requireUserInfo": GLib.Variant("b", True)},
                           {"clientName": GLib.Variant("s", options.client_name)})
         backends = session.start()
         if backends is None:
