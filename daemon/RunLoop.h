@@ -26,8 +26,8 @@ class RunLoop {
   struct Options {
     /// How long the process may be idle; nothing: for ever.
     std::optional<std::chrono::milliseconds> idleExit{};
-    /// Called on this thread once work has paused for that long, or has gone on for ten times as long: then
-    /// nobody is disturbed, or it can't be put off any more.
+    /// Called on this thread once work has paused for `pause`, so that it delays no client, or after ten
+    /// times as long without a pause.
     std::function<void()> onPause = nullptr;
     std::chrono::milliseconds pause{3000};
   };
