@@ -73,8 +73,7 @@ class Services {
 /// A whole message as a client sends it.
 std::string call() {
   std::string message;
-  CallWriter writer("/o");
-  if (writer.append({"i.f", "m", {payload()}}, 1, false, message) != CodecResult::Ok) std::abort();
+  if (appendCall("/o", {"i.f", "m", {payload()}}, message) != CodecResult::Ok) std::abort();
   return message;
 }
 
@@ -92,12 +91,11 @@ void readCall(benchmark::State& state) {
 BENCHMARK(readCall);
 
 void writeCall(benchmark::State& state) {
-  CallWriter writer("/o");
   const Dictionary message = payload();
   std::string out;
   for (auto _ : state) {
     out.clear();
-    benchmark::DoNotOptimize(writer.append({"i.f", "m", {message}}, 1, false, out));
+    benchmark::DoNotOptimize(appendCall("/o", {"i.f", "m", {message}}, out));
   }
 }
 BENCHMARK(writeCall);

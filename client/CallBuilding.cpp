@@ -7,9 +7,23 @@
 #include <filesystem>
 #include <system_error>
 
+#include "platform/ipc/MessageWriter.h"
 #include "platform/text/PercentCode.h"
 
 namespace vesk {
+
+ClientCall encoded(IPCOutgoingCall call, CallEffect effect) {
+  // Most calls fit, and grow no buffer step by step.
+  constexpr std::size_t kUsualSize = 512;
+  ClientCall result;
+  std::string& message = result.call.message;
+  message.reserve(kUsualSize);
+  if (appendCall(wire::kObjectPath, call, message) != CodecResult::Ok) throw InvalidCall();
+  result.memory = sizeof result + message.capacity();
+  result.effect = effect;
+  if (effect != CallEffect::None) result.arguments = std::move(call.arguments);
+  return result;
+}
 
 FileToUpload openToUpload(const std::string& path) {
   FileToUpload file;

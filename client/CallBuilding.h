@@ -1,25 +1,33 @@
 // Makes calls out of what callers give.
 #pragma once
 
+#include <exception>
 #include <string>
 #include <utility>
 
 #include "client/ClientCall.h"
-#include "platform/ipc/CallSize.h"
 #include "protocol/WireNames.h"
 
 namespace vesk {
 
-/// A one-way call of the daemon's object. Throws std::bad_alloc.
+/// A call that no receiver would take: too large, nested too deeply, or with text that is not UTF-8.
+class InvalidCall : public std::exception {};
+
+/// Throws InvalidCall or std::bad_alloc.
+ClientCall encoded(IPCOutgoingCall call, CallEffect effect);
+
+/// A one-way call of the daemon's object. Throws as `encoded`.
+template <class... Arguments>
+ClientCall makeCall(CallEffect effect, const wire::Member& member, Arguments&&... arguments) {
+  IPCOutgoingCall call{wire::kSessionInterface, member.name, {}};
+  call.arguments.reserve(sizeof...(arguments));
+  (call.arguments.emplace_back(std::forward<Arguments>(arguments)), ...);
+  return encoded(std::move(call), effect);
+}
+
 template <class... Arguments>
 ClientCall makeCall(const wire::Member& member, Arguments&&... arguments) {
-  ClientCall call;
-  call.call.interfaceName = wire::kSessionInterface;
-  call.call.member = member.name;
-  call.call.arguments.reserve(sizeof...(arguments));
-  (call.call.arguments.emplace_back(std::forward<Arguments>(arguments)), ...);
-  call.memory = sizeof call - sizeof call.call + approximateMemory(call.call);
-  return call;
+  return makeCall(CallEffect::None, member, std::forward<Arguments>(arguments)...);
 }
 
 /// A file opened for the daemon.

@@ -9,6 +9,7 @@
 #include <list>
 #include <memory>
 #include <string_view>
+#include <vector>
 
 #include "platform/files/GuardedDescriptor.h"
 #include "platform/ipc/IPCConnection.h"
@@ -27,16 +28,17 @@ using CallEnd = std::function<void(ReportingStatus status, BusAnswer* answer, st
 struct ClientCall {
   using Time = std::chrono::steady_clock::time_point;
 
-  IPCOutgoingCall call{nullptr, nullptr, {}};
+  IPCEncodedCall call;
   GuardedDescriptor descriptor;                           ///< the one that the arguments borrow
   CallEnd end;                                            ///< empty: the call is one way
   Time deadline{};                                        ///< of the answer
   std::size_t memory = 0;                                 ///< bytes that it counts in the queue
   std::shared_ptr<const AggregationHandler> aggregation;  ///< in force once this call was sent
   CallEffect effect = CallEffect::None;
+  std::vector<IPCArgument> arguments;  ///< of a call with an effect
 
   /// Calls nothing: its end is told when the daemon is reached.
-  bool isConnectionRequest() const noexcept { return call.member == nullptr; }
+  bool isConnectionRequest() const noexcept { return call.message.empty(); }
 };
 
 /// A call keeps its place in memory while it moves from list to list.

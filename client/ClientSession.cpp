@@ -4,12 +4,9 @@
 
 #include <algorithm>
 #include <csignal>
-#include <string>
 
 #include "client/DrainBudget.h"
-#include "platform/ipc/MessageWriter.h"
 #include "platform/log/SystemLog.h"
-#include "protocol/WireNames.h"
 
 namespace vesk {
 
@@ -40,12 +37,6 @@ std::thread startThread(const std::shared_ptr<SessionWorker>& worker) {
   return thread;
 }
 
-/// Neither too large nor nested too deeply, and valid text. Costs as much as sending it.
-bool isEncodable(const ClientCall& call) {
-  std::string message;
-  return CallWriter(wire::kObjectPath).append(call.call, 1, false, message) == CodecResult::Ok;
-}
-
 }  // namespace
 
 ClientSession::ClientSession(const ReportingOptions& options)
@@ -65,15 +56,6 @@ ClientSession::~ClientSession() {
   _thread.join();
   const auto now = std::chrono::steady_clock::now();
   DrainBudget::shared().spend(std::min<std::chrono::steady_clock::duration>(now - begun, granted), now);
-}
-
-ReportingStatus ClientSession::push(ClientCall&& call) {
-  // Told here and now: dropped on its way, it would leave the session what it was before, and nobody knew.
-  if (call.effect != CallEffect::None && !isEncodable(call)) {
-    _worker->queue().countDrop(Drop::Invalid);
-    return ReportingStatus::InvalidArgument;
-  }
-  return _worker->queue().push(std::move(call));
 }
 
 }  // namespace vesk

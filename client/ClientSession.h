@@ -13,6 +13,7 @@
 #include <variant>
 
 #include "client/BoundedWait.h"
+#include "client/CallBuilding.h"
 #include "client/ClientCall.h"
 #include "client/ForkGuard.h"
 #include "client/SessionWorker.h"
@@ -43,7 +44,10 @@ class ClientSession {
   ReportingStatus post(const Make& make) noexcept {
     if (!isOurs()) return ReportingStatus::ForkedProcess;
     try {
-      return push(make());
+      return _worker->queue().push(make());
+    } catch (const InvalidCall&) {
+      _worker->queue().countDrop(Drop::Invalid);
+      return ReportingStatus::InvalidArgument;
     } catch (...) {
       return ReportingStatus::OutOfResources;
     }
@@ -113,7 +117,6 @@ class ClientSession {
   }
 
   bool isSessionThread() const noexcept { return std::this_thread::get_id() == _thread.get_id(); }
-  ReportingStatus push(ClientCall&& call);
 
   const ForkGuard _process;
   const std::chrono::milliseconds _drainTime;

@@ -159,7 +159,7 @@ void SessionWorker::leave(Call call) noexcept {
 
 bool SessionWorker::wantsDaemon() const noexcept {
   if (!_waiting.empty() || !_requests.empty()) return true;
-  return !_drainDeadline && (_configuration || _start);
+  return !_drainDeadline && (_configuration || _isStarted);
 }
 
 void SessionWorker::reachDaemon(Time now, DaemonLink::Urgency urgency) {
@@ -185,26 +185,28 @@ void SessionWorker::connectionBroke(Time now) { linkHasChanged(_link.lose(now, k
 
 // A daemon that does not know who we are must not get a message: without memory to tell it, try again later.
 void SessionWorker::introduceAgain() {
-  bool isTold = true;
+  bool isTold = false;
   try {
-    for (const auto* call : {&_configuration, &_start}) {
-      if (!isTold || !*call) continue;
-      const auto result = _link.bus().send(**call);
-      isTold = result == BusClient::SendResult::Sent || result == BusClient::SendResult::Refused;
-    }
+    isTold = (!_configuration || tell(wire::kSetSessionInfo, *_configuration)) &&
+             (!_isStarted || tell(wire::kStartConfig, {}));
   } catch (const std::exception&) {
-    isTold = false;
+    // Not told.
   }
   if (!isTold) connectionBroke(Clock::now());
+}
+
+bool SessionWorker::tell(const wire::Member& member, const std::vector<IPCArgument>& arguments) {
+  return _link.bus().send(IPCOutgoingCall{wire::kSessionInterface, member.name, arguments}) ==
+         BusClient::SendResult::Sent;
 }
 
 // Needs no memory: a call that was sent can't be taken back.
 void SessionWorker::remember(ClientCall& call) noexcept {
   constexpr std::size_t kUserInfoOfConfiguration = 1, kUserInfoOfStates = 0;
-  if (call.effect == CallEffect::Configures) _configuration = std::move(call.call);
-  if (call.effect == CallEffect::Starts) _start = std::move(call.call);
+  if (call.effect == CallEffect::Configures) _configuration = std::move(call.arguments);
+  if (call.effect == CallEffect::Starts) _isStarted = true;
   if (call.effect == CallEffect::ChangesUserInfo && _configuration) {
-    _configuration->arguments[kUserInfoOfConfiguration] = std::move(call.call.arguments[kUserInfoOfStates]);
+    (*_configuration)[kUserInfoOfConfiguration] = std::move(call.arguments[kUserInfoOfStates]);
   }
 }
 
@@ -237,7 +239,7 @@ bool SessionWorker::sendTogether(Time now) {
     if (status == ReportingStatus::NotConnected) return false;
     if (status != ReportingStatus::Queued) {
       finish(*call, status);
-      drop(call, status == ReportingStatus::InvalidArgument ? Drop::Invalid : Drop::Unsent);
+      drop(call, Drop::Unsent);
     }
     if (isAnswered || _callsInBus == kCallsPerWrite || bus.addedBytes() >= kBytesPerWrite) break;
   }
@@ -250,16 +252,9 @@ ReportingStatus SessionWorker::handOver(Call call, Time now) {
   BusClient& bus = _link.bus();
   const auto left = std::chrono::ceil<std::chrono::milliseconds>(call->deadline - now);
   const auto onAnswer = [this, call](BusAnswer& answer) { answered(call, answer); };
-  switch (call->end ? bus.send(call->call, onAnswer, left) : bus.add(call->call)) {
-    case BusClient::SendResult::Sent:
-      break;
-    case BusClient::SendResult::Refused:
-      return ReportingStatus::InvalidArgument;
-    case BusClient::SendResult::OutOfResources:
-      return ReportingStatus::OutOfResources;
-    case BusClient::SendResult::Disconnected:
-      return ReportingStatus::NotConnected;
-  }
+  const auto result = call->end ? bus.send(call->call, onAnswer, left) : bus.add(call->call);
+  if (result == BusClient::SendResult::OutOfResources) return ReportingStatus::OutOfResources;
+  if (result != BusClient::SendResult::Sent) return ReportingStatus::NotConnected;
   if (call->effect == CallEffect::Configures) _receiver->setHandler(call->aggregation);
   if (call->end) {
     remember(*call);
@@ -308,7 +303,8 @@ void SessionWorker::sayFarewell(Time now) {
       _drainDeadline && _farewell == Farewell::NotYet && _link.isReady() && _waiting.empty() && _owed.empty();
   if (!isTime) return;
   const auto result = _link.bus().send(
-      {"org.freedesktop.DBus.Peer", "Ping", {}}, [this](BusAnswer&) { _farewell = Farewell::Answered; },
+      IPCOutgoingCall{"org.freedesktop.DBus.Peer", "Ping", {}},
+      [this](BusAnswer&) { _farewell = Farewell::Answered; },
       std::chrono::ceil<std::chrono::milliseconds>(*_drainDeadline - now));
   _farewell = result == BusClient::SendResult::Sent ? Farewell::Asked : Farewell::Answered;
 }

@@ -8,11 +8,13 @@
 #include <memory>
 #include <optional>
 #include <string_view>
+#include <vector>
 
 #include "client/AggregationReceiver.h"
 #include "client/CallQueue.h"
 #include "client/ClientCall.h"
 #include "client/DaemonLink.h"
+#include "protocol/WireNames.h"
 
 namespace vesk {
 
@@ -55,6 +57,7 @@ class SessionWorker {
   void reachDaemon(Time now, DaemonLink::Urgency urgency);
   void linkHasChanged(DaemonLink::Change change);
   void introduceAgain();
+  bool tell(const wire::Member& member, const std::vector<IPCArgument>& arguments);
   void remember(ClientCall& call) noexcept;
 
   bool canSend();
@@ -86,8 +89,8 @@ class SessionWorker {
   const std::shared_ptr<AggregationReceiver> _receiver = std::make_shared<AggregationReceiver>();
   DaemonLink _link;
   // As last sent: what the daemon has to be told after a reconnection.
-  std::optional<IPCOutgoingCall> _configuration;
-  std::optional<IPCOutgoingCall> _start;
+  std::optional<std::vector<IPCArgument>> _configuration;
+  bool _isStarted = false;
 
   std::optional<Time> _drainDeadline;  ///< set once the session is being closed
   Farewell _farewell = Farewell::NotYet;

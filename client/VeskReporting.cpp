@@ -45,23 +45,18 @@ ReportingResult<Answer> wait(const std::unique_ptr<Session>& session, Timeout ti
   return session->template wait<Answer>([&] { return make(arguments...); }, timeout);
 }
 
-ClientCall withEffect(ClientCall call, CallEffect effect) {
-  call.effect = effect;
+ClientCall setInfo(Dictionary& sessionInfo, std::optional<Dictionary>& userInfo,
+                   std::vector<std::string>& frameworks, AggregationHandler& handler) {
+  ClientCall call = makeCall(CallEffect::Configures, wire::kSetSessionInfo, std::move(sessionInfo),
+                             std::move(userInfo), std::move(frameworks), static_cast<bool>(handler));
+  if (handler) call.aggregation = std::make_shared<const AggregationHandler>(std::move(handler));
   return call;
 }
 
-ClientCall setInfo(Dictionary& sessionInfo, std::optional<Dictionary>& userInfo,
-                   std::vector<std::string>& frameworks, AggregationHandler& handler) {
-  ClientCall call = makeCall(wire::kSetSessionInfo, std::move(sessionInfo), std::move(userInfo),
-                             std::move(frameworks), static_cast<bool>(handler));
-  if (handler) call.aggregation = std::make_shared<const AggregationHandler>(std::move(handler));
-  return withEffect(std::move(call), CallEffect::Configures);
-}
-
-ClientCall start() { return withEffect(makeCall(wire::kStartConfig), CallEffect::Starts); }
+ClientCall start() { return makeCall(CallEffect::Starts, wire::kStartConfig); }
 
 ClientCall states(std::optional<Dictionary>& userInfo) {
-  return withEffect(makeCall(wire::kFetchStates, std::move(userInfo)), CallEffect::ChangesUserInfo);
+  return makeCall(CallEffect::ChangesUserInfo, wire::kFetchStates, std::move(userInfo));
 }
 
 ClientCall displayURL() { return makeCall(wire::kFetchDisplayURL); }
@@ -85,7 +80,9 @@ ClientCall flush() { return makeCall(wire::kFlushMessages); }
 ClientCall logDataUpload(List& logData) { return makeCall(wire::kUploadLogData, std::move(logData)); }
 
 ClientCall fileUpload(FileToUpload& file) {
-  ClientCall call = makeCall(wire::kUploadFile, std::move(file.url), IPCDescriptor{file.descriptor.get()});
+  const IPCDescriptor descriptor{file.descriptor.get()};
+  ClientCall call = makeCall(wire::kUploadFile, std::move(file.url), descriptor);
+  call.call.descriptor = descriptor;
   call.descriptor = GuardedDescriptor(std::move(file.descriptor));
   call.memory = std::max(call.memory, kMemoryOfDescriptor);
   return call;

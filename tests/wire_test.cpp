@@ -349,9 +349,8 @@ TEST(Wire, WritesNothingThatNoReceiverTakes) {
            Case{"text", "\x01 \u00e9", CodecResult::Ok},
        }) {
     SCOPED_TRACE(c.what);
-    CallWriter writer(kObjectPath);
     std::string out = "before";
-    EXPECT_EQ(writer.append({kInterface, "m", {Dictionary{{"k", c.value}}}}, 1, false, out), c.result);
+    EXPECT_EQ(appendCall(kObjectPath, {kInterface, "m", {Dictionary{{"k", c.value}}}}, out), c.result);
     EXPECT_EQ(out == "before", c.result != CodecResult::Ok);
   }
 }

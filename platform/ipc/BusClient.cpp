@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <climits>
 
+#include "platform/ipc/MessageWriter.h"
 #include "platform/ipc/UnixSocket.h"
 #include "platform/log/SystemLog.h"
 
@@ -20,14 +21,6 @@ constexpr int kMaximumSteps = 64;
 
 // Bytes, as far as the system allows: small messages take several times their size in the kernel.
 constexpr int kSendBuffer = 1 << 20;
-
-/// The descriptor among the arguments, or -1.
-int borrowedDescriptor(const IPCOutgoingCall& call) {
-  for (const auto& argument : call.arguments) {
-    if (const auto* descriptor = std::get_if<IPCDescriptor>(&argument)) return descriptor->borrowed;
-  }
-  return -1;
-}
 
 void tell(BusClient::AnswerHandler& handler, BusAnswer answer) noexcept {
   try {
@@ -44,7 +37,7 @@ BusClient::BusClient(Options options)
       _socket(GuardedDescriptor(options.connected ? std::move(options.connected)
                                                   : connectUnixSocket(options.socketPath))),
       _router(options.objectPath, "client", _outbox, {}),
-      _writer(options.objectPath),
+      _objectPath(std::move(options.objectPath)),
       _channel(_socket.get(), kMaximumMessageSize) {
   ::fcntl(_socket.get(), F_SETFL, ::fcntl(_socket.get(), F_GETFL) | O_NONBLOCK);
   ::setsockopt(_socket.get(), SOL_SOCKET, SO_SNDBUF, &kSendBuffer, sizeof kSendBuffer);
@@ -54,16 +47,17 @@ BusClient::BusClient(Options options)
   [[maybe_unused]] const bool isThere = _channel.flush();
 }
 
-BusClient::SendResult BusClient::append(const IPCOutgoingCall& call, bool expectsReply) {
+BusClient::SendResult BusClient::append(const IPCEncodedCall& call, bool expectsReply) {
   if (hasEnded()) return SendResult::Disconnected;
   FileDescriptor descriptor;
-  if (const int borrowed = borrowedDescriptor(call); borrowed >= 0) {
-    descriptor = FileDescriptor(::fcntl(borrowed, F_DUPFD_CLOEXEC, 3));
+  if (call.descriptor.borrowed >= 0) {
+    descriptor = FileDescriptor(::fcntl(call.descriptor.borrowed, F_DUPFD_CLOEXEC, 3));
     if (!descriptor) return SendResult::OutOfResources;
   }
-  if (_writer.append(call, ++_lastSerial, expectsReply, _channel.output()) != CodecResult::Ok) {
-    return SendResult::Refused;
-  }
+  std::string& output = _channel.output();
+  const std::size_t start = output.size();
+  output += call.message;
+  stamp(output.data() + start, ++_lastSerial, expectsReply);
   _channel.queued(std::move(descriptor));
   return SendResult::Sent;
 }
@@ -71,6 +65,16 @@ BusClient::SendResult BusClient::append(const IPCOutgoingCall& call, bool expect
 bool BusClient::isOurs() const { return ::getpid() == _process; }
 
 BusClient::SendResult BusClient::send(const IPCOutgoingCall& call, AnswerHandler handler,
+                                      std::chrono::milliseconds timeout) {
+  IPCEncodedCall encoded;
+  if (appendCall(_objectPath, call, encoded.message) != CodecResult::Ok) return SendResult::Refused;
+  for (const auto& argument : call.arguments) {
+    if (const auto* descriptor = std::get_if<IPCDescriptor>(&argument)) encoded.descriptor = *descriptor;
+  }
+  return send(encoded, std::move(handler), timeout);
+}
+
+BusClient::SendResult BusClient::send(const IPCEncodedCall& call, AnswerHandler handler,
                                       std::chrono::milliseconds timeout) {
   const auto result = append(call, static_cast<bool>(handler));
   if (result != SendResult::Sent) return result;

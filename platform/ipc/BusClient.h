@@ -15,7 +15,6 @@
 #include "platform/ipc/Channel.h"
 #include "platform/ipc/IPCConnection.h"
 #include "platform/ipc/MessageReader.h"
-#include "platform/ipc/MessageWriter.h"
 #include "platform/ipc/Outbox.h"
 #include "platform/ipc/Sasl.h"
 
@@ -85,12 +84,14 @@ class BusClient {
 
   /// Sends at once what the socket takes. A `handler` gets the answer, or an error after `timeout`; without
   /// one the call is one-way. The handler is dropped unless the call was sent.
+  [[nodiscard]] SendResult send(const IPCEncodedCall& call, AnswerHandler handler = nullptr,
+                                std::chrono::milliseconds timeout = {});
   [[nodiscard]] SendResult send(const IPCOutgoingCall& call, AnswerHandler handler = nullptr,
                                 std::chrono::milliseconds timeout = {});
   /// A one-way call, put with those that `write` writes together: the cheap way to send many. Once the socket
   /// is full they wait here; a sender that must not lose them with the connection keeps its own until
   /// `queuedMessages` says that they have left.
-  [[nodiscard]] SendResult add(const IPCOutgoingCall& call) { return append(call, false); }
+  [[nodiscard]] SendResult add(const IPCEncodedCall& call) { return append(call, false); }
   [[nodiscard]] Progress write();
   /// Bytes and messages that the socket has not taken. Nothing bounds them here: a sender holds back when
   /// there are many.
@@ -118,7 +119,7 @@ class BusClient {
   };
   using OwedAnswers = std::map<std::uint32_t, Owed>;  // by the number of the call
 
-  SendResult append(const IPCOutgoingCall& call, bool expectsReply);
+  SendResult append(const IPCEncodedCall& call, bool expectsReply);
   /// A process forked from this one has the socket too, but the connection is not its own.
   bool isOurs() const;
   bool hasEnded() const { return !_socket || !_socket.isOurs(); }
@@ -134,7 +135,7 @@ class BusClient {
   GuardedDescriptor _socket;  // none once the connection has ended
   const std::shared_ptr<Outbox> _outbox = std::make_shared<Outbox>();
   CallRouter _router;
-  CallWriter _writer;
+  const std::string _objectPath;
   SaslClient _sasl;
   Channel _channel;
   OwedAnswers _owed;

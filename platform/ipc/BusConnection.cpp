@@ -7,6 +7,7 @@
 #include <thread>
 
 #include "platform/ipc/ExtensionTokens.h"
+#include "platform/ipc/MessageWriter.h"
 #include "platform/log/LogUser.h"
 #include "platform/log/SystemLog.h"
 
@@ -39,7 +40,6 @@ BusConnection::BusConnection(FileDescriptor socket, std::uint64_t serial, const 
       _socket(std::move(socket)),
       _router(_registry->options.objectPath, _name, _outbox, {serial, peer.user},
               {.content = _registry->options.maximumMessage}),
-      _writer(_registry->options.objectPath),
       _sasl(peer.user),
       _channel(_socket.get(), _registry->options.maximumMessage + kMessageOverhead) {}
 
@@ -70,9 +70,12 @@ void BusConnection::end() {
 
 void BusConnection::callRemoteObject(IPCOutgoingCall call,
                                      const std::function<void(const std::string& error)>& errorHandler) {
-  if (const char* error = _outbox->put(std::move(call))) {
-    if (errorHandler) errorHandler(error);
-  }
+  std::string message;
+  const auto result = appendCall(_registry->options.objectPath, call, message);
+  const char* error = result == CodecResult::Ok              ? _outbox->put(std::move(message))
+                      : result == CodecResult::LimitExceeded ? "the call is too large"
+                                                             : describe(result);
+  if (error && errorHandler) errorHandler(error);
 }
 
 // --- On the connection's thread
@@ -110,23 +113,14 @@ BusConnection::End BusConnection::serve() {
 void BusConnection::sendOutgoing() {
   _outbox->moveAnswersTo(_channel);
   while (_isReady && !_peerGone && _channel.unsentBytes() < kMaximumUnsent) {
-    auto call = _outbox->takeCall();
-    if (!call) break;
-    if (!appendCall(*call)) _outbox->loseCall();
+    const std::string call = _outbox->takeCall();
+    if (call.empty()) break;
+    _channel.output() += call;
+    _channel.queued();
   }
   // What the client had sent before it went is served all the same, so its going is no end here.
   if (!_channel.flush()) _peerGone = true;
   if (_peerGone) _channel.dropOutput();
-}
-
-bool BusConnection::appendCall(const IPCOutgoingCall& call) {
-  const auto result = _writer.append(call, ++_lastSerial, false, _channel.output());
-  if (result == CodecResult::Ok) {
-    _channel.queued();
-    return true;
-  }
-  VESK_LOG_WARNING("ipc: %s: The call %s can't be sent: %s", _name.c_str(), call.member, describe(result));
-  return false;
 }
 
 void BusConnection::wait(Time deadline) {

@@ -15,7 +15,6 @@
 #include "platform/ipc/Channel.h"
 #include "platform/ipc/ConnectionRegistry.h"
 #include "platform/ipc/IPCConnection.h"
-#include "platform/ipc/MessageWriter.h"
 #include "platform/ipc/Outbox.h"
 #include "platform/ipc/Sasl.h"
 #include "platform/ipc/Wakeup.h"
@@ -69,7 +68,6 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   void run() noexcept;
   End serve();
   void sendOutgoing();
-  bool appendCall(const IPCOutgoingCall& call);
   void wait(Time deadline);
   std::optional<End> advance();
   std::optional<End> authenticate();
@@ -103,10 +101,8 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   IPCHandlers _handlers;  // but for the object, which the router has
 
   // The thread's.
-  CallWriter _writer;
   SaslServer _sasl;
   Channel _channel;
-  std::uint32_t _lastSerial = 0;
   bool _isReady = false;   // the client has authenticated itself and begun
   bool _hasMore = false;   // messages have come that are not served yet
   bool _peerGone = false;  // nothing can be sent any more

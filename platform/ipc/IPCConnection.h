@@ -55,6 +55,12 @@ struct IPCOutgoingCall {
   std::vector<IPCArgument> arguments;
 };
 
+/// A call to the remote object, as `appendCall` writes it.
+struct IPCEncodedCall {
+  std::string message;
+  IPCDescriptor descriptor{};  ///< goes along
+};
+
 /// What a connection is given to do. Everything runs on the connection's thread, the handlers at most once,
 /// and is dropped after the invalidation handler has run, which breaks the rings that it forms with the
 /// connection. Each may be empty.

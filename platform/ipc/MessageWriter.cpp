@@ -244,29 +244,14 @@ CodecResult appendMessage(const OutgoingHeader& header, std::uint32_t serial,
   });
 }
 
-const std::string& CallWriter::headerFor(const IPCOutgoingCall& call) {
-  _signature.clear();
-  appendSignature(call.arguments, _signature);
-  const std::uint32_t descriptors = descriptorsAmong(call.arguments);
-  for (const Kept& kept : _kept) {
-    if (kept.member == call.member && kept.interfaceName == call.interfaceName &&
-        kept.descriptors == descriptors && kept.signature == _signature) {
-      return kept.bytes;
-    }
-  }
-  Kept kept{call.interfaceName, call.member, descriptors, _signature, {}};
-  appendHeader({.path = _objectPath, .interfaceName = call.interfaceName, .member = call.member}, _signature,
-               descriptors, kept.bytes);
-  return _kept.emplace_back(std::move(kept)).bytes;
+CodecResult appendCall(std::string_view objectPath, const IPCOutgoingCall& call, std::string& out) {
+  return appendMessage({.path = objectPath, .interfaceName = call.interfaceName, .member = call.member}, 1,
+                       call.arguments, out);
 }
 
-CodecResult CallWriter::append(const IPCOutgoingCall& call, std::uint32_t serial, bool expectsReply,
-                               std::string& out) {
-  return wholeOrNothing(out, [&](std::size_t start) {
-    out += headerFor(call);
-    if (expectsReply) out[start + kFlagsAt] = '\0';
-    return appendBody(start, serial, call.arguments, out, {});
-  });
+void stamp(char* message, std::uint32_t serial, bool expectsReply) noexcept {
+  message[kFlagsAt] = expectsReply ? '\0' : kNoReplyExpected;
+  std::memcpy(message + kSerialAt, &serial, sizeof serial);
 }
 
 }  // namespace vesk

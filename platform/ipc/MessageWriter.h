@@ -34,28 +34,10 @@ CodecResult appendMessage(const OutgoingHeader& header, std::uint32_t serial,
                           const std::vector<IPCArgument>& arguments, std::string& out,
                           CodecLimits limits = {});
 
-/// Writes calls of one object, and keeps the header of each member that it has called. For one thread.
-class CallWriter {
- public:
-  explicit CallWriter(std::string objectPath) : _objectPath(std::move(objectPath)) {}
+/// Appends a call of an object, as `appendMessage`. Its sender sets its number.
+CodecResult appendCall(std::string_view objectPath, const IPCOutgoingCall& call, std::string& out);
 
-  /// As `appendMessage`. The call's names are constants.
-  CodecResult append(const IPCOutgoingCall& call, std::uint32_t serial, bool expectsReply, std::string& out);
-
- private:
-  struct Kept {
-    const char* interfaceName;
-    const char* member;
-    std::uint32_t descriptors;
-    std::string signature;
-    std::string bytes;  ///< of a one-way call, without body size and serial
-  };
-
-  const std::string& headerFor(const IPCOutgoingCall& call);
-
-  const std::string _objectPath;
-  std::vector<Kept> _kept;
-  std::string _signature;
-};
+/// Numbers a whole message, and says whether it wants an answer.
+void stamp(char* message, std::uint32_t serial, bool expectsReply) noexcept;
 
 }  // namespace vesk

@@ -2,7 +2,6 @@
 
 #include <utility>
 
-#include "platform/ipc/CallSize.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
@@ -66,17 +65,16 @@ void Outbox::wake() const noexcept {
   if (_wake && _thread.load() != std::this_thread::get_id()) _wake();
 }
 
-const char* Outbox::put(IPCOutgoingCall call) {
-  if (isTooLarge(call, CodecLimits{})) return "the call is too large";
-  const std::size_t memory = approximateMemory(call);
+const char* Outbox::put(std::string call) {
+  stamp(call.data(), ++_lastSerial, false);
   {
     MutexLock lock(_mutex);
     if (_closed) return "the connection has ended";
-    if (_calls.size() >= _maximumCalls || (!_calls.empty() && _memory + memory > kMaximumMemory)) {
+    if (_calls.size() >= _maximumCalls || (!_calls.empty() && _memory + call.size() > kMaximumMemory)) {
       return "too many calls wait for the client";
     }
-    _calls.push_back({std::move(call), memory});
-    _memory += memory;
+    _memory += call.size();
+    _calls.push_back(std::move(call));
   }
   wake();
   return nullptr;
@@ -95,13 +93,13 @@ void Outbox::moveAnswersTo(Channel& channel) {
   }
 }
 
-std::optional<IPCOutgoingCall> Outbox::takeCall() {
+std::string Outbox::takeCall() {
   MutexLock lock(_mutex);
-  if (_calls.empty()) return std::nullopt;
-  Call next = std::move(_calls.front());
+  if (_calls.empty()) return {};
+  std::string next = std::move(_calls.front());
   _calls.pop_front();
-  _memory -= next.memory;
-  return std::move(next.call);
+  _memory -= next.size();
+  return next;
 }
 
 bool Outbox::hasCalls() const {
@@ -109,20 +107,15 @@ bool Outbox::hasCalls() const {
   return !_calls.empty();
 }
 
-void Outbox::loseCall() {
-  MutexLock lock(_mutex);
-  ++_lost;
-}
-
 std::size_t Outbox::close() {
-  std::deque<Call> calls;  // released after the lock
+  std::deque<std::string> calls;  // released after the lock
   std::vector<std::string> answers;
   MutexLock lock(_mutex);
   _closed = true;
   _memory = 0;
   answers.swap(_answers);
   calls.swap(_calls);
-  return calls.size() + std::exchange(_lost, 0);
+  return calls.size();
 }
 
 }  // namespace vesk

@@ -7,7 +7,6 @@
 #include <deque>
 #include <exception>
 #include <functional>
-#include <optional>
 #include <string>
 #include <thread>
 #include <vector>
@@ -28,8 +27,7 @@ class Outbox {
   /// Calls of one peer that may be owed an answer. Calls are served one after another, so only a handler that
   /// puts its answers off comes near this.
   static constexpr std::size_t kMaximumOwed = 256;
-  /// Bytes that all waiting calls hold together, unless there is only one, which may have
-  /// `CodecLimits::content`.
+  /// Bytes that all waiting calls hold together, unless there is only one.
   static constexpr std::size_t kMaximumMemory = std::size_t{4} << 20;
 
   /// `wake` makes the connection's thread take what waits; any other thread calls it.
@@ -47,17 +45,16 @@ class Outbox {
   void settle(std::uint32_t call, const std::vector<IPCArgument>& arguments) noexcept;
   void settleWithError(std::uint32_t call, const char* errorName, const char* text) noexcept;
 
-  /// Null when the call was taken, else why it was not.
-  const char* put(IPCOutgoingCall call);
+  /// Null when the call, a whole message, was taken, else why it was not.
+  const char* put(std::string call);
 
   // On the connection's thread.
 
   /// Puts the answers that wait into the channel's output.
   void moveAnswersTo(Channel& channel);
-  std::optional<IPCOutgoingCall> takeCall();
+  /// The next call; empty when there is none.
+  std::string takeCall();
   bool hasCalls() const;
-  /// Notes that a call which had been taken could not be sent.
-  void loseCall();
   /// Whether an answer could not even be written as an error. Its caller would wait for ever, so the
   /// connection has to end.
   bool isBroken() const noexcept { return _isBroken.load(); }
@@ -65,11 +62,6 @@ class Outbox {
   std::size_t close();
 
  private:
-  struct Call {
-    IPCOutgoingCall call;
-    std::size_t memory;
-  };
-
   CodecResult write(const OutgoingHeader& header, const std::vector<IPCArgument>& arguments);
   void lose(const std::exception& error) noexcept;
   void paid() noexcept;
@@ -85,9 +77,8 @@ class Outbox {
   bool _closed VESK_GUARDED_BY(_mutex) = false;
   std::size_t _owed VESK_GUARDED_BY(_mutex) = 0;
   std::vector<std::string> _answers VESK_GUARDED_BY(_mutex);
-  std::deque<Call> _calls VESK_GUARDED_BY(_mutex);
+  std::deque<std::string> _calls VESK_GUARDED_BY(_mutex);
   std::size_t _memory VESK_GUARDED_BY(_mutex) = 0;  // of the calls
-  std::size_t _lost VESK_GUARDED_BY(_mutex) = 0;
 };
 
 }  // namespace vesk
