@@ -19,6 +19,7 @@ ClientCall encoded(IPCOutgoingCall call, CallEffect effect) {
   std::string& message = result.call.message;
   message.reserve(kUsualSize);
   if (appendCall(wire::kObjectPath, call, message) != CodecResult::Ok) throw InvalidCall();
+  if (message.size() > kUsualSize) message.shrink_to_fit();
   result.memory = sizeof result + message.capacity();
   result.effect = effect;
   if (effect != CallEffect::None) result.arguments = std::move(call.arguments);

@@ -140,7 +140,7 @@ TEST_F(ClientSession, RefusesWhatCannotBeSentAndGoesOn) {
   EXPECT_EQ(session.uploadLogData(List(std::vector<Value>(90'000, Date{}))).status,
             ReportingStatus::InvalidArgument)
       << "too long on the wire only";
-  EXPECT_EQ(session.sendMessage(1, 1, Dictionary{{"k", "\xff"}}), ReportingStatus::Queued);
+  EXPECT_EQ(session.sendMessage(1, 1, Dictionary{{"k", "\xff"}}), ReportingStatus::InvalidArgument);
   EXPECT_EQ(session.setSessionInfo(sessionInfo, Dictionary{{"k", "\xff"}}), ReportingStatus::InvalidArgument)
       << "or the session would go on as what it was";
   EXPECT_EQ(session.fetchStates(Dictionary{{"k", "\xff"}}, nullptr), ReportingStatus::InvalidArgument);

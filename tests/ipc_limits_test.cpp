@@ -249,7 +249,7 @@ TEST(IPCLimits, TellsTheCallerWhenAClientsOutboxIsFull) {
     }
     EXPECT_EQ(error, "too many calls wait for the client");
     EXPECT_LE(taken, test.most);
-    connection->callRemoteObject({wire::kReplyInterface, "m", {std::string(kMessage, 'x')}},
+    connection->callRemoteObject({wire::kReplyInterface, "m", {std::string(kMessage + 1, 'x')}},
                                  [&](const std::string& text) { error = text; });
     EXPECT_EQ(error, "the call is too large");
     connection->callRemoteObject({wire::kReplyInterface, "m", {std::string("\xff")}},
