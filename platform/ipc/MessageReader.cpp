@@ -148,10 +148,15 @@ bool MessageReader::basic(char type, Value& out) {
   if (type == 'h') return fail(CodecResult::WrongType);
   if (!countNode()) return false;
   switch (type) {
-    case 's':
+    case 's': {
+      std::string_view view;
+      if (!text(view)) return false;
+      out = kept(view);
+      return true;
+    }
     case 'o':
     case 'g':
-      return textual(type, out);
+      return name(type, out);
     case 'b':
       return number<bool, bool>(out);
     case 'y':
@@ -173,12 +178,11 @@ bool MessageReader::basic(char type, Value& out) {
   }
 }
 
-/// A text, an object path or a signature.
-bool MessageReader::textual(char type, Value& out) {
+/// An object path or a signature.
+bool MessageReader::name(char type, Value& out) {
   std::string_view view;
-  const bool isWellFormed = type == 'g'   ? _cursor.signature(view) && isValidSignature(view)
-                            : type == 'o' ? _cursor.text(view) && isObjectPath(view)
-                                          : _cursor.text(view) && isValidUTF8(view, false);
+  const bool isWellFormed = type == 'g' ? _cursor.signature(view) && isValidSignature(view)
+                                        : _cursor.text(view) && isObjectPath(view);
   if (!found(isWellFormed) || !count(view.size())) return false;
   // The empty signature, which means nothing anywhere else, is the null marker.
   out = type == 'g' && view.empty() ? Value() : Value(kept(view));
@@ -188,7 +192,10 @@ bool MessageReader::textual(char type, Value& out) {
 bool MessageReader::variant(Value& out) {
   std::string_view type;
   if (!enter() || !found(_cursor.signature(type))) return false;
-  if (!found(!type.empty() && completeTypeLength(type) == type.size()) || !value(type, out)) return false;
+  // Most values are basic ones, and need no look at the rest of the grammar.
+  const bool isBasic = type.size() == 1 && isBasicType(type[0]);
+  if (!isBasic && !found(!type.empty() && completeTypeLength(type) == type.size())) return false;
+  if (!(isBasic ? basic(type[0], out) : value(type, out))) return false;
   --_containers;
   return true;
 }
@@ -238,11 +245,11 @@ bool MessageReader::dictionary(std::string_view valueType, Dictionary& out) {
     if (_cursor.position() < end) building.reserve(8);
     while (_cursor.position() < end) {
       std::string_view key;
-      Value value;
       if (!enter() || !found(_cursor.align(8)) || !text(key)) return false;
-      if (!this->value(valueType, value)) return false;
+      DictionaryEntry& entry = building.entries().emplace_back();
+      entry.key = kept(key);
+      if (!value(valueType, entry.value)) return false;
       --_containers;
-      building.append(kept(key), std::move(value));
     }
     return true;
   });

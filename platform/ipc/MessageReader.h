@@ -92,7 +92,7 @@ class MessageReader {
   bool basic(char type, Value& out);
   template <class Number, class As>
   bool number(Value& out);
-  bool textual(char type, Value& out);
+  bool name(char type, Value& out);
   bool variant(Value& out);
   bool structure(std::string_view members, Value& out);
   bool bytes(Value& out);

@@ -4,13 +4,12 @@ namespace vesk {
 
 namespace {
 
-constexpr std::string_view kBasicTypes = "ybnqiuxtdsogh";
 constexpr int kMaximumNesting = 32;
 
 std::size_t typeLength(std::string_view signature, int arrays, int structures) noexcept {
   if (signature.empty()) return 0;
   const char type = signature[0];
-  if (type == 'v' || kBasicTypes.find(type) != std::string_view::npos) return 1;
+  if (type == 'v' || isBasicType(type)) return 1;
   if (type == 'a') {
     if (arrays == kMaximumNesting) return 0;
     auto element = signature.substr(1);
@@ -20,7 +19,7 @@ std::size_t typeLength(std::string_view signature, int arrays, int structures) n
     }
     // A dictionary: a basic key and one value.
     if (structures == kMaximumNesting || element.size() < 2) return 0;
-    if (kBasicTypes.find(element[1]) == std::string_view::npos) return 0;
+    if (!isBasicType(element[1])) return 0;
     const std::size_t value = typeLength(element.substr(2), arrays + 1, structures + 1);
     if (value == 0 || 2 + value >= element.size() || element[2 + value] != '}') return 0;
     return 1 + 2 + value + 1;

@@ -25,6 +25,15 @@ constexpr std::string_view argumentType() noexcept {
   }
 }
 
+/// Of a value without others inside.
+constexpr bool isBasicType(char type) noexcept {
+  constexpr std::string_view kBasicTypes = "ybnqiuxtdsogh";
+  for (const char basic : kBasicTypes) {
+    if (type == basic) return true;
+  }
+  return false;
+}
+
 /// Length of the complete type that `signature` begins with; 0 when it begins with none, or with one that is
 /// nested deeper than D-Bus allows (32 arrays, 32 structures).
 std::size_t completeTypeLength(std::string_view signature) noexcept;

@@ -23,19 +23,18 @@ class WireCursor {
 
   /// `to`: a power of 2. The padding must be zero.
   bool align(std::size_t to) noexcept {
-    for (const std::size_t end = (_at + to - 1) & ~(to - 1); _at < end; ++_at) {
-      if (_at >= _bytes.size() || _bytes[_at] != '\0') return false;
-    }
-    return true;
+    const std::size_t end = (_at + to - 1) & ~(to - 1);
+    if (end > _bytes.size()) return false;
+    char padding = '\0';
+    for (; _at < end; ++_at) padding |= _bytes[_at];
+    return padding == '\0';
   }
 
   template <class Number>
   bool number(Number& out) noexcept {
     if (!align(sizeof out) || left() < sizeof out) return false;
-    std::array<char, sizeof out> raw;
-    std::memcpy(raw.data(), _bytes.data() + _at, sizeof out);
-    if (_swaps) std::reverse(raw.begin(), raw.end());
-    out = std::bit_cast<Number>(raw);
+    std::memcpy(&out, _bytes.data() + _at, sizeof out);
+    if (_swaps) out = swapped(out);
     _at += sizeof out;
     return true;
   }
@@ -58,6 +57,12 @@ class WireCursor {
   }
 
  private:
+  template <class Number>
+  static Number swapped(Number number) noexcept {
+    auto raw = std::bit_cast<std::array<char, sizeof number>>(number);
+    std::reverse(raw.begin(), raw.end());
+    return std::bit_cast<Number>(raw);
+  }
   bool terminated(std::size_t size, std::string_view& out) noexcept {
     if (left() <= size || _bytes[_at + size] != '\0') return false;
     out = _bytes.substr(_at, size);
