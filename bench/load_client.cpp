@@ -1,7 +1,8 @@
 // One client of the end-to-end bench: sends numbered messages as fast as the daemon takes them.
 //
-// Usage: load_client SOCKET CLIENT COUNT [FLAG [SESSIONS]]
-// Message ids are CLIENT * 10,000,000 and up. With many sessions each gets a batch of 50 in its turn. Prints
+// Usage: load_client SOCKET CLIENT COUNT [FLAG [SESSIONS [ANSWERED]]]
+// Message ids are CLIENT * 10,000,000 and up. With many sessions each gets a batch of 50 in its turn;
+// with ANSWERED 1 each message waits for its answer. Prints
 // "ready", waits for a line, sends, prints its own CPU time per message in microseconds, and ends with its
 // standard input.
 #include <VeskReporting/VeskReporting.h>
@@ -60,9 +61,10 @@ std::unique_ptr<vesk::VeskReporting> startSession(const char* socket, long clien
 }
 
 /// False, having said why, when the message can't be sent at all.
-bool send(vesk::VeskReporting& reporting, const vesk::Dictionary& message) {
+bool send(vesk::VeskReporting& reporting, const vesk::Dictionary& message, bool isAnswered) {
   for (;;) {
-    auto status = reporting.sendMessage(message);
+    auto status = isAnswered ? reporting.sendMessageAndWait(message).status : reporting.sendMessage(message);
+    if (isAnswered && status == vesk::ReportingStatus::Done) return true;
     if (status == vesk::ReportingStatus::Queued) return true;
     if (status != vesk::ReportingStatus::QueueFull) {
       std::fprintf(stderr, "load_client: %s\n", vesk::describe(status));
@@ -82,6 +84,7 @@ int main(int argc, char** argv) {
   const long count = std::strtol(argv[3], nullptr, 10);
   const int flag = argc > 4 ? std::atoi(argv[4]) : 0;
   const long sessionCount = argc > 5 ? std::strtol(argv[5], nullptr, 10) : 1;
+  const bool isAnswered = argc > 6 && std::atoi(argv[6]) == 1;
   std::vector<std::unique_ptr<vesk::VeskReporting>> sessions;
   for (long i = 0; i < sessionCount; ++i) {
     sessions.push_back(startSession(argv[1], client * 1000 + i));
@@ -93,7 +96,7 @@ int main(int argc, char** argv) {
   double before = cpuMicroseconds();
   for (long i = 0; i < count; ++i) {
     auto& session = *sessions[static_cast<std::size_t>(i / kBatch % sessionCount)];
-    if (!send(session, message(client * kIdsPerClient + i, flag))) return 1;
+    if (!send(session, message(client * kIdsPerClient + i, flag), isAnswered)) return 1;
   }
   for (auto& session : sessions) {
     auto flushed = session->flushMessagesAndWait(std::chrono::seconds(120));

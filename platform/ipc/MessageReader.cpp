@@ -125,22 +125,16 @@ bool MessageReader::value(std::string_view type, Value& out) {
   }
   if (type[1] == 'y') return bytes(out);
   if (type[1] == '{' && type[2] == 's') {
-    Dictionary entries;
-    if (!dictionary(type.substr(3, type.size() - 4), entries)) return false;
-    out = std::move(entries);
-    return true;
+    return dictionary(type.substr(3, type.size() - 4), out.emplace<Dictionary>());
   }
-  List items;
-  if (!list(type.substr(1), items)) return false;
-  out = std::move(items);
-  return true;
+  return list(type.substr(1), out.emplace<List>());
 }
 
 template <class Number, class As>
 bool MessageReader::number(Value& out) {
   Number raw{};
   if (!get(raw)) return false;
-  out = static_cast<As>(raw);
+  out.emplace<As>(raw);
   return true;
 }
 
@@ -151,7 +145,7 @@ bool MessageReader::basic(char type, Value& out) {
     case 's': {
       std::string_view view;
       if (!text(view)) return false;
-      out = kept(view);
+      out.emplace<Text>(kept(view));
       return true;
     }
     case 'o':
@@ -232,7 +226,7 @@ bool MessageReader::bytes(Value& out) {
     std::string_view data;
     if (!countNode(end - _cursor.position())) return false;
     _cursor.bytes(end - _cursor.position(), data);
-    out = Bytes(std::string(data));
+    out.emplace<Bytes>(std::string(data));
     return true;
   });
 }

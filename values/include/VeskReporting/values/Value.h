@@ -153,6 +153,12 @@ class VESK_API Value {
 
   friend bool operator==(const Value& a, const Value& b) noexcept { return a._value == b._value; }
 
+  /// Makes this a `T`, one of the alternatives, in place.
+  template <class T, class... Arguments>
+  T& emplace(Arguments&&... arguments) {
+    return _value.template emplace<T>(std::forward<Arguments>(arguments)...);
+  }
+
   template <class Visitor>
   decltype(auto) visit(Visitor&& visitor) const {
     return std::visit(std::forward<Visitor>(visitor), _value);
