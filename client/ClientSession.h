@@ -5,8 +5,8 @@
 
 #include <chrono>
 #include <exception>
-#include <future>
 #include <memory>
+#include <semaphore>
 #include <thread>
 #include <type_traits>
 #include <utility>
@@ -75,15 +75,19 @@ class ClientSession {
     try {
       const auto deadline = deadlineAfter(timeout) + kGrace;
       // Shared by both: the caller may have gone when the answer comes.
-      auto promise = std::make_shared<std::promise<ReportingResult<Answer>>>();
-      auto answer = promise->get_future();
-      const auto status = ask<Answer>(
-          make, [promise](ReportingResult<Answer> result) { promise->set_value(std::move(result)); },
-          timeout);
+      struct Waited {
+        ReportingResult<Answer> result;
+        std::binary_semaphore isThere{0};
+      };
+      auto waited = std::make_shared<Waited>();
+      const auto keep = [waited](ReportingResult<Answer> result) {
+        waited->result = std::move(result);
+        waited->isThere.release();
+      };
+      const auto status = ask<Answer>(make, keep, timeout);
       if (status != ReportingStatus::Queued) return outcome(status);
-      if (answer.wait_until(deadline) == std::future_status::timeout)
-        return outcome(ReportingStatus::TimedOut);
-      return answer.get();
+      if (!waited->isThere.try_acquire_until(deadline)) return outcome(ReportingStatus::TimedOut);
+      return std::move(waited->result);
     } catch (...) {
       return outcome(ReportingStatus::OutOfResources);
     }

@@ -48,7 +48,7 @@ BusClient::BusClient(Options options)
 }
 
 BusClient::SendResult BusClient::append(const IPCEncodedCall& call, bool expectsReply) {
-  if (hasEnded()) return SendResult::Disconnected;
+  if (!_socket) return SendResult::Disconnected;
   FileDescriptor descriptor;
   if (call.descriptor.borrowed >= 0) {
     descriptor = FileDescriptor(::fcntl(call.descriptor.borrowed, F_DUPFD_CLOEXEC, 3));
@@ -89,8 +89,10 @@ BusClient::SendResult BusClient::send(const IPCEncodedCall& call, AnswerHandler 
 
 /// Until the daemon has let us in, calls wait behind the greeting.
 BusClient::Progress BusClient::write() {
-  if (hasEnded()) return disconnected();
+  if (!_socket) return disconnected();
   _outbox->moveAnswersTo(_channel);
+  if (_channel.unsentBytes() == 0) return Progress::Connected;
+  if (hasEnded()) return disconnected();
   return !_isReady || _channel.flush() ? Progress::Connected : disconnected();
 }
 
@@ -113,6 +115,7 @@ int BusClient::timeout() const {
 BusClient::Progress BusClient::process() {
   if (write() == Progress::Disconnected) return Progress::Disconnected;
   if (!_hasMore) {
+    if (hasEnded()) return disconnected();
     const auto input = _channel.receive();
     if (input == Channel::Input::HungUp || input == Channel::Input::BrokenOff) return disconnected();
   }
