@@ -1,4 +1,4 @@
-// The operations that the daemon exports to each client. The bytes on the wire: docs/wire.md.
+// The operations that the daemon exports to each client. docs/wire.md describes their encoding.
 #pragma once
 
 #include <VeskReporting/VeskReportingTypes.h>
@@ -14,12 +14,12 @@
 
 namespace vesk {
 
-/// A longer text would not fit into a D-Bus message: what answers a message or a flush is cut to this, at a
-/// whole character, and says so in its last line.
+/// The limit, in bytes, of the text that answers a message or a flush, so that it fits into one D-Bus
+/// message. Longer text is cut after a whole character, and its last line says so.
 inline constexpr std::size_t kMaxAnswerBytes = std::size_t{1} << 20;
 
 /// Implemented by the daemon's session. All calls of one connection arrive in order on that connection's
-/// thread. Whatever a caller may leave out is optional. Implementations must not throw.
+/// thread. Arguments that a caller may omit are optional. Implementations must not throw.
 class ClientSessionInterface {
  public:
   virtual ~ClientSessionInterface() = default;
@@ -36,10 +36,10 @@ class ClientSessionInterface {
   virtual void sendMessageWithDictionary(const Dictionary& parameters,
                                          Reply<std::optional<std::string>> reply) = 0;
   virtual void flushMessagesWithReply(Reply<std::optional<std::string>> reply) = 0;
-  /// `extensionToken` names the descriptor that came with the call; empty when none came.
+  /// `extensionToken` names the descriptor that came with the call; it is empty if none came.
   virtual void uploadFileAtPath(const std::string& fileURL, const std::string& extensionToken,
                                 Reply<bool> completionHandler) = 0;
-  /// The reply's text describes an error; it is always absent.
+  /// The reply's text is meant for an error description; it is always absent.
   virtual void uploadLogData(const List& logData,
                              Reply<bool, std::optional<std::string>> completionHandler) = 0;
   virtual void sendMessageWithSessionInfo(const Dictionary& sessionInfo,

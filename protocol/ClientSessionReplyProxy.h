@@ -1,4 +1,4 @@
-// The daemon's view of the client's object.
+// The daemon's proxy for the object that the client exports.
 #pragma once
 
 #include <cstdint>
@@ -11,16 +11,16 @@
 
 namespace vesk {
 
-/// Sends each call through the connection's outbox. Never blocks; for any thread.
+/// Queues calls to the client on its connection. Never blocks. Thread-safe.
 class ClientSessionReplyProxy {
  public:
-  /// `errorHandler` is called, on the calling thread, when a call can't be sent.
+  /// `errorHandler` runs on the calling thread if a call can't be sent.
   ClientSessionReplyProxy(std::shared_ptr<IPCConnection> connection,
                           std::function<void(const std::string& error)> errorHandler)
       : _connection(std::move(connection)), _errorHandler(std::move(errorHandler)) {}
 
-  /// A message that the client aggregates. `timestamp`: seconds since 1970. The closing message of an
-  /// aggregation has no session info, time 0, category 0, type 0 and no payload.
+  /// Sends a message for the client to aggregate. `timestamp` is in seconds since 1970. The message that
+  /// closes an aggregation has no session info, time 0, category 0, type 0 and no payload.
   void sendMessageToClient(const std::optional<Dictionary>& sessionInfo, double timestamp,
                            std::uint16_t category, std::uint16_t type,
                            const std::optional<Dictionary>& payload);

@@ -36,7 +36,7 @@ void serveWith(void (Session::*method)(Parameters...), Session& session, const c
   std::apply([&](auto&... value) { (session.*method)(std::forward<Parameters>(value)...); }, values);
 }
 
-/// Reads what `method` takes, up to its reply, which comes last, and calls it.
+/// Reads the arguments of `method` and calls it. Its last parameter is the reply.
 template <auto method>
 void serve(Session& session, const char* signature, IPCIncomingCall& call) {
   serveWith(method, session, signature, call);
@@ -65,7 +65,7 @@ struct Handler {
   void (*handle)(Session& session, const char* signature, IPCIncomingCall& call);
 };
 
-// The most frequent first.
+// Ordered by frequency.
 constexpr Handler kHandlers[] = {
     {wire::kSendMessageWithDictionary, serve<&Session::sendMessageWithDictionary>},
     {wire::kSendMessageWithCategory, serve<&Session::sendMessageWithCategory>},

@@ -1,4 +1,4 @@
-// The daemon's end of the protocol: calls as they come over the wire become calls of a session.
+// The daemon's end of the protocol: turns incoming calls into calls of a session.
 #pragma once
 
 #include <memory>
@@ -9,7 +9,8 @@
 
 namespace vesk {
 
-/// Exported under wire::kObjectPath; holds its session, so the connection that exports it does.
+/// Exported under wire::kObjectPath. Owns its session, so the connection that exports it keeps the session
+/// alive.
 class ClientSessionStub final : public IPCExportedObject {
  public:
   explicit ClientSessionStub(std::shared_ptr<ClientSessionInterface> session)

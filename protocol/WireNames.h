@@ -1,21 +1,21 @@
-// The D-Bus names and signatures of the protocol, for both ends. What they mean: docs/wire.md.
+// The D-Bus names and signatures of the protocol, shared by both ends. docs/wire.md explains them.
 #pragma once
 
 namespace vesk::wire {
 
-/// The socket, as on a device.
+/// Default path of the daemon's socket.
 inline constexpr const char* kSocketPath = "/run/veskreportingd/com.corvane.veskreportingd";
-/// Of the daemon's object and of the client's.
+/// Path of the daemon's object and of the client's.
 inline constexpr const char* kObjectPath = "/com/corvane/veskreportingd/session";
 
-/// A member with the signatures of its arguments and of its answer.
+/// A method with the signatures of its arguments and of its answer.
 struct Member {
   const char* name;
   const char* arguments;
   const char* answer;
 };
 
-/// The daemon's object.
+// The daemon's object.
 inline constexpr const char* kSessionInterface = "com.corvane.veskreportingd.ClientSessionInterface";
 inline constexpr Member kSetSessionInfo{"setSessionInfo", "a{sv}aa{sv}asb", ""};
 inline constexpr Member kStartConfig{"startConfigWithCompletionHandler", "", "aas"};
@@ -28,7 +28,7 @@ inline constexpr Member kUploadFile{"uploadFileAtPath", "sah", "b"};
 inline constexpr Member kUploadLogData{"uploadLogData", "av", "bas"};
 inline constexpr Member kSendMessageWithSessionInfo{"sendMessageWithSessionInfo", "a{sv}aa{sv}qqaa{sv}", "s"};
 
-/// The client's object; one-way.
+// The client's object. Its method has no answer.
 inline constexpr const char* kReplyInterface = "com.corvane.veskreportingd.ClientSessionReplyInterface";
 inline constexpr Member kSendMessageToClient{"sendMessageToClient", "aa{sv}dqqaa{sv}", ""};
 
