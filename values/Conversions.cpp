@@ -19,7 +19,7 @@ std::string decimal(Number number) {
   return error == std::errc{} ? std::string(digits, end) : std::string();
 }
 
-// With an exponent only where people would write one: who reads a value as an integer gets 100000, not 1.
+// Uses an exponent only for very large or small numbers, so that reading 100000 as an integer doesn't give 1.
 std::string decimal(double number) {
   const double size = std::abs(number);
   const bool isPlain = size == 0 || (size >= 1e-4 && size < 1e16);

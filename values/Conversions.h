@@ -1,4 +1,4 @@
-// Values read as values of another kind.
+// Conversions between kinds of values.
 #pragma once
 
 #include <cstdint>
@@ -10,18 +10,17 @@
 
 namespace vesk {
 
-/// As text: a text unchanged, a number as decimal text (booleans are 1 and 0), nothing for any other kind.
+/// Text unchanged, numbers as decimal text (booleans as 1 and 0); nullopt for any other kind.
 std::optional<std::string> stringForm(const Value& value);
 
-/// As integer: a number as such, a text by its leading integer, 0 for any other kind. The result holds to the
-/// range of 64 bits.
+/// Numbers as integers, text by its leading integer, 0 for any other kind. Saturates at the range of 64 bits.
 std::int64_t integerForm(const Value& value);
 
-/// The decimal integer at the start of `text`, behind white space and a sign; 0 when there is none. Held
-/// inside the range of 64 bits.
+/// The decimal integer at the start of `text`, after optional white space and sign; 0 if there is none.
+/// Saturates at the range of 64 bits.
 std::int64_t leadingInteger(std::string_view text) noexcept;
 
-/// -1 for what is NaN or infinite, else `value`: JSON has no other numbers.
+/// Replaces NaN and infinity by -1, since JSON can't represent them.
 double finiteOrMinusOne(double value) noexcept;
 
 }  // namespace vesk

@@ -70,7 +70,7 @@ class Describer {
     _out += '"';
     for (char c : text) {
       if (full()) return;
-      // Control characters must not break a log line into two.
+      // Control characters must not split a log line.
       if (static_cast<unsigned char>(c) < 0x20 || c == 0x7f) {
         char buffer[8];
         std::snprintf(buffer, sizeof buffer, "\\x%02x", static_cast<unsigned char>(c));

@@ -33,7 +33,7 @@ bool areUnique(const std::vector<DictionaryEntry>& entries) noexcept {
 // --- List
 
 List::List(std::vector<Value> values) {
-  values.shrink_to_fit();  // few are made, and those that wait add up
+  values.shrink_to_fit();  // lists are rarely built, and unused capacity adds up in queues
   if (!values.empty()) _values = std::make_shared<const std::vector<Value>>(std::move(values));
 }
 
@@ -125,7 +125,7 @@ void MutableDictionary::setAll(const Dictionary& source) {
     for (const auto& entry : source) set(entry.key, entry.value);
     return;
   }
-  // The source is indexed, this one is not.
+  // The source has an index; this dictionary has none.
   std::unordered_set<const Value*> taken;
   for (auto& entry : _entries) {
     const Value* value = source.find(entry.key.view());
@@ -246,7 +246,7 @@ std::optional<bool> booleanForKey(const Dictionary& dictionary, std::string_view
 
 namespace {
 
-// What the allocator and the reference count cost, and a node of an index.
+// Approximate cost of an allocation with its reference count, and of an index node.
 constexpr std::size_t kBlockMemory = 32;
 constexpr std::size_t kIndexNodeMemory = 48;
 

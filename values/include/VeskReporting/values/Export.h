@@ -1,4 +1,4 @@
-// What the client library's shared object exports; everything else in it is hidden.
+// Marks what the client library's shared object exports. All other symbols are hidden.
 #pragma once
 
 #define VESK_API __attribute__((visibility("default")))

@@ -11,9 +11,9 @@
 
 namespace vesk {
 
-/// A piece of text that shares its bytes with its copies. Copying costs a reference count, or nothing at all
-/// for a literal. The bytes never change, so any thread may read any copy. They are valid UTF-8 wherever the
-/// text came through one of the decoders (wire, property list, TOML); the class itself does not check.
+/// Text that shares its bytes with its copies. Copying costs a reference count, or nothing for a literal. The
+/// bytes never change, so any thread may read any copy. Text from a decoder (wire, property list, TOML) is
+/// valid UTF-8; the class itself does not check.
 class VESK_API Text {
  public:
   Text() noexcept = default;
@@ -22,16 +22,16 @@ class VESK_API Text {
   // NOLINTNEXTLINE(google-explicit-constructor): texts are written as literals everywhere
   Text(std::string_view text);
   Text(const std::string& text) : Text(std::string_view(text)) {}
-  /// Null is an empty text.
+  /// A null pointer gives an empty text.
   Text(const char* text) : Text(std::string_view(text ? text : "")) {}
 
-  /// Refers to characters of static storage duration; nothing is copied and no reference is counted.
+  /// Refers to characters of static storage duration, without a copy or a reference count.
   template <std::size_t N>
   static Text literal(const char (&text)[N]) noexcept {
     return Text(std::shared_ptr<const char>(std::shared_ptr<const char>(), text), N - 1);
   }
 
-  /// Refers to `size` bytes at `data`, whose life `data` shares.
+  /// Refers to `size` bytes at `data` and shares ownership of them.
   Text(std::shared_ptr<const char> data, std::size_t size) noexcept : _data(std::move(data)), _size(size) {}
 
   std::string_view view() const noexcept { return {_data ? _data.get() : "", _size}; }
@@ -50,11 +50,11 @@ class VESK_API Text {
   std::size_t _size = 0;
 };
 
-/// Makes many texts out of few allocations: a decoder adds the texts of one message to one arena. A chunk
-/// lives as long as any text in it. Not thread-safe; the texts are.
+/// Creates many texts with few allocations. A decoder uses one arena per message. A chunk lives as long as
+/// any text in it. The arena is not thread-safe; its texts are.
 class VESK_API TextArena {
  public:
-  /// `chunkSize`: bytes per allocation; a text longer than a quarter of it gets an allocation of its own.
+  /// `chunkSize`: bytes per allocation. Text longer than a quarter of it gets its own allocation.
   explicit TextArena(std::size_t chunkSize = 1024) noexcept : _chunkSize(chunkSize) {}
   Text add(std::string_view text);
 

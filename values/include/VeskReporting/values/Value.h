@@ -1,4 +1,4 @@
-// The dynamic values that messages, session infos, preferences and configurations are made of.
+// The dynamic values in messages, session infos, preferences and configurations.
 #pragma once
 
 #include <cstddef>
@@ -20,13 +20,13 @@ class Value;
 struct DictionaryEntry;
 class MutableDictionary;
 
-/// A point in time: seconds since 1970 (may be fractional, negative or not finite: it came from outside).
+/// A point in time in seconds since 1970. Input from outside may make it fractional, negative or not finite.
 struct Date {
   double secondsSince1970 = 0;
   friend bool operator==(const Date&, const Date&) = default;
 };
 
-/// Immutable byte string; copies share it.
+/// Immutable bytes, shared between copies.
 class Bytes {
  public:
   Bytes() noexcept = default;
@@ -39,7 +39,7 @@ class Bytes {
   std::shared_ptr<const std::string> _data;
 };
 
-/// Immutable sequence of values; copies share it.
+/// Immutable sequence of values, shared between copies.
 class VESK_API List {
  public:
   List() noexcept = default;
@@ -57,10 +57,9 @@ class VESK_API List {
   std::shared_ptr<const std::vector<Value>> _values;
 };
 
-/// Immutable map from text to value that keeps the order of insertion; keys are unique. A copy is a reference
-/// count, so this is what "a copy of the dictionary" means throughout the project. Looking a key up is a
-/// linear scan up to 32 entries, which is faster than hashing for the sizes that messages have, and indexed
-/// above.
+/// Immutable map from text to value that keeps the order of insertion. Keys are unique. Copies share their
+/// entries. Lookup scans up to 32 entries, which is faster than hashing at the size of a message, and uses an
+/// index above that.
 class VESK_API Dictionary {
  public:
   Dictionary() noexcept = default;
@@ -75,7 +74,7 @@ class VESK_API Dictionary {
   const Value* find(std::string_view key) const noexcept;
   bool contains(std::string_view key) const noexcept { return find(key) != nullptr; }
 
-  /// The entry under `key` when it is of that kind, else nothing.
+  /// The value under `key` if it has that kind, otherwise nullopt.
   std::optional<Text> text(std::string_view key) const;
   std::optional<Dictionary> dictionary(std::string_view key) const;
   std::optional<List> list(std::string_view key) const;
@@ -93,7 +92,7 @@ class VESK_API Dictionary {
 /// One value of any kind. A default-constructed value is the null marker.
 class VESK_API Value {
  public:
-  /// In the order of the alternatives below.
+  /// In the order of the variant's alternatives.
   enum class Kind : std::uint8_t {
     None,
     Boolean,
@@ -123,17 +122,17 @@ class VESK_API Value {
   Value(vesk::Date value) noexcept : _value(value) {}                                      // NOLINT
   Value(vesk::List value) noexcept : _value(std::move(value)) {}                           // NOLINT
   Value(vesk::Dictionary value) noexcept : _value(std::move(value)) {}                     // NOLINT
-  /// A null `value`, as `std::getenv` may give it, is the null marker.
+  /// A null pointer, which `std::getenv` may return, gives the null marker.
   Value(const char* value) : Value(value ? Value(vesk::Text(value)) : Value()) {}  // NOLINT
   Value(std::nullptr_t) noexcept {}                                                // NOLINT
-  Value(const void* pointer) = delete;  // or any pointer would be a boolean
+  Value(const void* pointer) = delete;  // otherwise any pointer would convert to a boolean
 
   Kind kind() const noexcept { return static_cast<Kind>(_value.index()); }
   bool isNone() const noexcept { return kind() == Kind::None; }
   /// Boolean, integer or double.
   bool isNumber() const noexcept { return kind() >= Kind::Boolean && kind() <= Kind::Double; }
 
-  /// The alternative of that kind, or null.
+  /// The value if it has that kind, otherwise null.
   const bool* boolean() const noexcept { return std::get_if<bool>(&_value); }
   const std::int64_t* signedInteger() const noexcept { return std::get_if<std::int64_t>(&_value); }
   const std::uint64_t* unsignedInteger() const noexcept { return std::get_if<std::uint64_t>(&_value); }
@@ -144,9 +143,9 @@ class VESK_API Value {
   const vesk::List* list() const noexcept { return std::get_if<vesk::List>(&_value); }
   const vesk::Dictionary* dictionary() const noexcept { return std::get_if<vesk::Dictionary>(&_value); }
 
-  /// Numbers as other number types; nothing for what is no number. Integers are cut to the low bits as an
-  /// integer conversion does; doubles are cut towards zero and held inside the range of 64 bits first, so
-  /// that no number from outside has an undefined result (NaN gives 0).
+  /// Converts between number types; nullopt if the value is not a number. Integers wrap like an integer
+  /// conversion. Doubles are truncated and first clamped to the 64-bit range, so that no input gives an
+  /// undefined result (NaN gives 0).
   std::optional<std::int64_t> asInteger() const noexcept;
   std::optional<double> asDouble() const noexcept;
   std::optional<bool> asBoolean() const noexcept;
@@ -176,7 +175,7 @@ struct DictionaryEntry {
   friend bool operator==(const DictionaryEntry&, const DictionaryEntry&) = default;
 };
 
-/// A dictionary under construction, owned by one thread.
+/// A dictionary under construction. Not thread-safe.
 class VESK_API MutableDictionary {
  public:
   MutableDictionary() noexcept = default;
@@ -187,11 +186,11 @@ class VESK_API MutableDictionary {
   std::size_t size() const noexcept { return _entries.size(); }
   bool empty() const noexcept { return _entries.empty(); }
 
-  /// Replaces the value under `key` where it stands, or appends.
+  /// Replaces the value under `key` in place, or appends an entry.
   void set(Text key, Value value);
   /// Sets every entry of `source`.
   void setAll(const Dictionary& source);
-  /// Appends without looking for `key`: the caller knows that it is not there yet.
+  /// Appends an entry. `key` must not be present yet; this is not checked.
   void append(Text key, Value value) { _entries.push_back({std::move(key), std::move(value)}); }
   void remove(std::string_view key);
 
@@ -201,27 +200,26 @@ class VESK_API MutableDictionary {
   std::vector<DictionaryEntry>& entries() noexcept { return _entries; }
   const std::vector<DictionaryEntry>& entries() const noexcept { return _entries; }
 
-  /// Hands the entries to an immutable dictionary; this one is empty afterwards.
+  /// Moves the entries into an immutable dictionary and leaves this one empty.
   Dictionary share();
-  /// The same for entries appended from outside, which may repeat a key: the last value of a key wins and
-  /// stands where the key stood first.
+  /// Like `share`, for entries that may repeat a key: the last value wins, at the position of the first.
   Dictionary shareUnique();
 
  private:
   std::vector<DictionaryEntry> _entries;
 };
 
-/// What a dictionary holds under a key, read as a number; what is absent or no number gives nothing.
+/// The value under `key`, converted to a number; nullopt if it is absent or not a number.
 VESK_API std::optional<std::int64_t> integerForKey(const Dictionary& dictionary,
                                                    std::string_view key) noexcept;
 VESK_API std::optional<double> doubleForKey(const Dictionary& dictionary, std::string_view key) noexcept;
 VESK_API std::optional<bool> booleanForKey(const Dictionary& dictionary, std::string_view key) noexcept;
 
-/// One line that shows a value to a person, cut at about `limit` bytes (log lines, tools).
+/// One line that shows a value in logs and tools, cut at about `limit` bytes.
 VESK_API std::string describe(const Value& value, std::size_t limit = 1024);
 
-/// Memory that a value or dictionary holds beyond its own size, roughly, in bytes: its entries and texts.
-/// Texts shared with other dictionaries count in full.
+/// Approximate memory in bytes that a value's or dictionary's contents use beyond its own size. Text shared
+/// with other dictionaries counts in full.
 VESK_API std::size_t approximateMemory(const Value& value) noexcept;
 VESK_API std::size_t approximateMemory(const Dictionary& dictionary) noexcept;
 VESK_API std::size_t approximateMemory(const MutableDictionary& dictionary) noexcept;
