@@ -10,7 +10,7 @@ void VeskReportingLogging::startLogging(const char* processName, const char* fac
   try {
     SystemLog::open(processName ? processName : "", facility ? facility : "");
   } catch (...) {
-    // Without memory for the names, lines go out without them.
+    // Out of memory: lines are logged without the names.
   }
 }
 
@@ -25,7 +25,7 @@ void VeskReportingLogging::setSink(std::function<void(int level, std::string_vie
       sink(static_cast<int>(level), line);
     });
   } catch (...) {
-    // Without memory for another sink, lines keep going where they went.
+    // Out of memory: the previous sink stays.
   }
 }
 

@@ -38,7 +38,7 @@ bool isIdentifier(std::string_view text) {
   return true;
 }
 
-// Who holds the lock needs it for as long as a small file takes to be written.
+// The lock is only held while a small file is written.
 constexpr std::chrono::milliseconds kPatience{500};
 
 }  // namespace
@@ -50,7 +50,7 @@ std::string PersistentIdentifiers::identifier(bool respectsConsent) {
 }
 
 PersistentIdentifiers::Pair PersistentIdentifiers::load() const {
-  // The usual case takes no lock: the file is complete or not there.
+  // Usually the file is complete or absent, and reading it needs no lock.
   if (SmallFile file = readSmallFile(_path, kMaximumFile); file.bytes) {
     if (auto known = parse(*file.bytes)) return *known;
   }
@@ -70,7 +70,7 @@ PersistentIdentifiers::Pair PersistentIdentifiers::load() const {
   return pair;
 }
 
-// The file's identifiers; a file without them is moved out of the way.
+// Reads the identifiers, and moves a file without usable ones out of the way.
 std::optional<PersistentIdentifiers::Pair> PersistentIdentifiers::readFile() const {
   SmallFile file = readSmallFile(_path, kMaximumFile);
   if (file.missing) return std::nullopt;
@@ -93,7 +93,7 @@ int PersistentIdentifiers::store(const Pair& pair) const {
   text += std::string(kRespecting) + " = \"" + pair.respecting + "\"\n";
   text += std::string(kOverriding) + " = \"" + pair.overriding + "\"\n";
 
-  // The lock's holder is alone with this name; what a crashed one left is overwritten.
+  // Only the lock's holder uses this name. A leftover of a crashed process is overwritten.
   std::string temporary = _path + ".new";
   ::unlink(temporary.c_str());
   FileDescriptor file = makePrivateFile(temporary);
@@ -105,7 +105,7 @@ int PersistentIdentifiers::store(const Pair& pair) const {
   return cause;
 }
 
-// Reads what `store` writes: comments, blank lines and `key = "identifier"`.
+// Parses what `store` writes: comments, blank lines and `key = "identifier"`.
 std::optional<PersistentIdentifiers::Pair> PersistentIdentifiers::parse(const std::string& text) {
   Pair pair;
   for (std::size_t at = 0; at < text.size();) {

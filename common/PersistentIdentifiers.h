@@ -1,4 +1,4 @@
-// The device's stable identifiers, one per consent mode.
+// The device's persistent identifiers, one for each consent mode.
 #pragma once
 
 #include <optional>
@@ -8,18 +8,18 @@
 
 namespace vesk {
 
-/// The identifiers kept in one file.
+/// The identifiers stored in one file. Thread-safe.
 ///
-/// The file is made on first use: complete or not at all (rename), mode 0600, and by one process when several
-/// race (lock file beside it, which is waited for half a second at most). What root makes belongs to the
-/// directory's owner, the daemon's user. One that can't be read or understood is kept aside as "<path>.bad"
-/// and new identifiers are made, with a level-4 line. Identifiers that can't be stored live as long as this
-/// object. Thread-safe.
+/// The file is created on first use, atomically by rename, with mode 0600. A lock file beside it, awaited for
+/// at most half a second, ensures that only one of several processes creates it. If root creates the file,
+/// the directory's owner (the daemon's user) gets it. An unreadable or malformed file is renamed to
+/// "<path>.bad" and replaced by new identifiers, with a line of level 4. Identifiers that can't be stored
+/// live as long as this object.
 class PersistentIdentifiers {
  public:
   explicit PersistentIdentifiers(std::string path) : _path(std::move(path)) {}
 
-  /// UUID text.
+  /// Returns a UUID as text.
   std::string identifier(bool respectsConsent);
 
  private:
@@ -30,7 +30,7 @@ class PersistentIdentifiers {
 
   Pair load() const;
   std::optional<Pair> readFile() const;
-  /// 0, or the errno of what failed.
+  /// Returns 0, or the errno of the failed step.
   int store(const Pair& pair) const;
   static std::optional<Pair> parse(const std::string& text);
 
@@ -39,7 +39,8 @@ class PersistentIdentifiers {
   std::optional<Pair> _pair VESK_GUARDED_BY(_mutex);
 };
 
-/// From the process's one instance for /var/lib/veskreportingd/identifiers.toml; empty when memory runs out.
+/// Uses the process's one instance, for /var/lib/veskreportingd/identifiers.toml. Returns an empty string if
+/// out of memory.
 std::string persistentIdentifierForDNU(bool respectsConsent) noexcept;
 
 }  // namespace vesk

@@ -16,7 +16,7 @@ constexpr std::size_t kMaximumVersionFile = 4096;
 constexpr std::size_t kMaximumVersion = 64;
 constexpr std::size_t kMaximumPublicKey = std::size_t{64} << 10;
 
-/// A file that the installed library carries besides code.
+/// Reads one of the library's installed files.
 std::optional<std::string> readResource(const char* name, std::size_t limit) {
   std::string path = pathUnderRoot("/usr/share/veskreporting/") + name;
   SmallFile file = readTrustedFile(path, limit);
@@ -26,14 +26,13 @@ std::optional<std::string> readResource(const char* name, std::size_t limit) {
   return std::move(file.bytes);
 }
 
-// The version goes into a URL as it stands, so it has to be one printable word.
+// The version is put into a URL unescaped, so it must be a single printable word.
 bool isUsableVersion(std::string_view version) {
   return !version.empty() && version.size() <= kMaximumVersion &&
          std::all_of(version.begin(), version.end(), [](char c) { return c > ' ' && c < 0x7f; });
 }
 
-/// The first line of the file "version", trimmed; nothing when there is no such file or it holds nothing
-/// usable.
+/// The first line of the file "version", trimmed; nullopt if the file is missing or its version is unusable.
 std::optional<std::string> declaredVersion() {
   auto file = readResource("version", kMaximumVersionFile);
   if (!file) return std::nullopt;
@@ -47,7 +46,7 @@ std::optional<std::string> declaredVersion() {
 }  // namespace
 
 std::string clientLibraryVersion() noexcept {
-  constexpr char kDefaultVersion[] = "7.0";  // short enough to need no memory
+  constexpr char kDefaultVersion[] = "7.0";  // short enough to need no allocation
   try {
     return declaredVersion().value_or(kDefaultVersion);
   } catch (...) {

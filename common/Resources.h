@@ -1,4 +1,4 @@
-// Files that the installed client library carries besides code, in /usr/share/veskreporting.
+// Resource files of the installed client library, in /usr/share/veskreporting.
 #pragma once
 
 #include <optional>
@@ -6,11 +6,11 @@
 
 namespace vesk {
 
-/// The first line of the file "version", or "7.0" without a usable one.
+/// The first line of the file "version", or "7.0" if there is no usable one.
 std::string clientLibraryVersion() noexcept;
 
-/// The RSA public key that storebags are verified with: the file "publicKey.der"; nullopt when it is missing,
-/// empty, unreadable or not trusted.
+/// The RSA public key that storebags are verified with, from the file "publicKey.der"; nullopt if the file is
+/// missing, empty, unreadable or not trusted.
 std::optional<std::string> publicKeyDER() noexcept;
 
 }  // namespace vesk
