@@ -12,7 +12,7 @@ namespace vesk {
 
 namespace {
 
-/// What every backend of a set is told alike.
+/// The identity that all backends of a set share.
 struct SetIdentity {
   SetIdentity(const Dictionary& sessionInfo, const BackendServices& services)
       : startTimestamp(timevalFrom(services.clock.now())),
@@ -66,7 +66,7 @@ void stamp(VeskReportingBackend& backend, const SetIdentity& identity,
   backend.setStartTimestamp(identity.startTimestamp);
 }
 
-// A profile that is no dictionary counts as absent, as any value of a wrong type does.
+// Like any value of the wrong type, a profile that is not a dictionary counts as absent.
 std::optional<Dictionary> profileFrom(const DictionaryEntry& entry) {
   if (const Dictionary* profile = entry.value.dictionary()) return *profile;
   reportWrongType(entry.key.view(), "profile", entry.value);
@@ -113,7 +113,7 @@ std::shared_ptr<VeskReportingBackend> findBackend(const BackendSet& backends, st
 
 namespace {
 
-// The time service's own setting; a device that never changed it sets its zone by itself.
+// From the time service's settings. The default, if unset, is automatic.
 bool automaticTimeZoneEnabled() {
   auto value = PreferencesSuite("com.corvane.timed").valueForKey("TMAutomaticTimeZoneEnabled");
   return value ? value->asBoolean().value_or(true) : true;
@@ -135,7 +135,7 @@ Dictionary deviceDictionary(const std::string& libraryVersion,
     device.set("Hardware", orUnknown(deviceHardwareModel()));
     device.set("Product", orUnknown(deviceName()));
     device.set("ReportVers", libraryVersion);
-    // A locale without a country, such as C, leaves the entry out.
+    // A locale without a country, such as C, has no entry.
     if (countryCode) device.set("Locale", *countryCode);
   }
   device.set("AutomaticTimeSet", automaticTimeZoneEnabled());

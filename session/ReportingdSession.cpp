@@ -23,7 +23,7 @@ std::uint32_t sessionIDIn(const Dictionary& sessionInfo) {
       integerForKey(sessionInfo, kVeskReportingSessionInfoSessionID).value_or(0));
 }
 
-// The messages of the batch are posted by now: an answer that can't be sent would make the client send them
+// The batch has been posted already. If its answer were too large to send, the client would send the messages
 // again.
 std::optional<std::string> fittingAnswer(std::optional<std::string> answer) {
   if (!answer || answer->size() <= kMaxAnswerBytes) return answer;
@@ -58,7 +58,7 @@ ReportingdSession::ReportingdSession(std::shared_ptr<ReportingdSessionDelegate> 
 ReportingdSession::~ReportingdSession() {
   VESK_LOG_DEBUG("dealloc: ReportingdSession dealloc: %u", sessionID());
   _isEnding = true;
-  // Without memory, one step's failure must neither end the process nor keep the others from being tried.
+  // If one step runs out of memory, the process goes on and the other steps are still tried.
   auto attempt = [](auto step) {
     try {
       step();
@@ -216,7 +216,7 @@ void ReportingdSession::sendMessageWithSessionInfo(const Dictionary& sessionInfo
       !integerForKey(sessionInfo, kVeskReportingSessionInfoSessionID)) {
     VESK_LOG_ERROR("sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo");
     _services.backends.counters.count("session", DropReason::InvalidMessage);
-    return;  // the reply, destroyed uncalled, tells the caller
+    return;  // destroying the reply uncalled sends an error
   }
   {
     MutexLock lock(_mutex);

@@ -1,4 +1,4 @@
-// One client connection, seen from the daemon.
+// The daemon's side of one client connection.
 #pragma once
 
 #include <sys/time.h>
@@ -21,21 +21,21 @@
 
 namespace vesk {
 
-/// What all sessions of the process share; outlives them.
+/// Shared by all sessions of the process; outlives them.
 struct SessionServices {
   BackendServices& backends;
-  std::string libraryVersion;  ///< of the client library, "7.0" when it declares none
+  std::string libraryVersion;  ///< of the client library, "7.0" if it declares none
 };
 
-/// Configures the client's backends, hands each message to all of them, and picks the answer.
+/// Configures the client's backends, passes each message to all of them, and picks the answer.
 ///
 /// The operations of ClientSessionInterface run on the connection's thread. The agent calls the members
-/// marked "relatives" from other connections' threads, most of them with its monitor held; so every field
-/// that both touch is guarded by the session's own mutex, which is never held while the agent or a backend is
-/// called.
+/// marked "Family" from other connections' threads, usually while holding its monitor. All fields used by
+/// both are guarded by the session's mutex, which is never held during a call of the agent or a backend.
 ///
-/// Shared by the agent's lists, the connection (as exported object) and its handlers; the last of them to let
-/// go destroys it on its thread: it then sends the closing message, flushes and cleans up its backends.
+/// Shared by the agent's lists, the connection (as exported object) and its handlers. The last owner destroys
+/// the session on its own thread; the destructor sends the closing message and flushes and cleans up the
+/// backends.
 class ReportingdSession final : public ClientSessionInterface,
                                 public std::enable_shared_from_this<ReportingdSession> {
  public:
@@ -66,7 +66,8 @@ class ReportingdSession final : public ClientSessionInterface,
                                   const std::optional<Dictionary>& payload,
                                   Reply<std::string> reply) override;
 
-  /// What `sendMessageWithSessionInfo` does with its storebag: sends one message through backends of its own.
+  /// Sends one message through newly created backends, as `sendMessageWithSessionInfo` does with its
+  /// storebag.
   static void sendSingleMessage(const SessionServices& services, uid_t user,
                                 const std::optional<Dictionary>& sessionInfo,
                                 const std::optional<Dictionary>& userInfo,
@@ -74,29 +75,30 @@ class ReportingdSession final : public ClientSessionInterface,
                                 std::uint16_t type, const std::optional<Dictionary>& payload);
 
   // --- Identity
-  /// The client's number for the session; 0 until configured.
+  /// The session's number, chosen by the client; 0 until configured.
   std::uint32_t sessionID() const;
-  /// The session's own identity: 24 characters, made at creation.
+  /// The daemon's identifier of the session: 24 characters, created with it.
   std::string sessionIDString() const;
   std::optional<std::string> storebagVersion() const;
   std::optional<Dictionary> sessionInfo() const;
   std::optional<Dictionary> userInfo() const;
-  /// `correlationKeyForUserInfo` of the present user info; made when that is set, since messages ask for it.
+  /// `correlationKeyForUserInfo` of the current user info, cached because every message needs it.
   std::shared_ptr<const std::string> correlationKey() const;
   std::string description() const;
 
-  // --- Relatives
-  /// The level in the family: 0 at the top.
+  // --- Family
+  /// The level in the family; 0 is the top.
   std::int32_t getSessionHierarchy() const;
   bool hasAggregator() const noexcept { return _hasAggregator.load(); }
   void updateCombinedSessionID() VESK_EXCLUDES(_mutex);
   void syncReportingStates() VESK_EXCLUDES(_mutex);
   void shutdownSessionAggregation() VESK_EXCLUDES(_mutex);
-  /// The names of the enabled backends; nothing before the first start.
+  /// The names of the enabled backends; nullopt before the first start.
   std::optional<BackendNames> fetchReportingStates() const;
   std::optional<Value> samplingThresholdWithBackendName(const std::string& name) const;
-  /// Hands one message to this session's own client; never waits. One that the client does not take is lost
-  /// and counted, and told once a burst: whoever sends it must not pay for a client that does not read.
+  /// Sends one message to this session's own client without blocking. A message that the client does not take
+  /// is dropped, counted, and logged once per burst, so that a client that does not read never delays the
+  /// sender.
   void sendToAggregator(const std::optional<Dictionary>& sessionInfo, double timestamp,
                         std::uint16_t category, std::uint16_t type, const std::optional<Dictionary>& payload);
 
@@ -125,7 +127,7 @@ class ReportingdSession final : public ClientSessionInterface,
   void uploadFileWithURL(const std::string& fileURL, const std::string& extensionToken,
                          Reply<bool> completionHandler);
 
-  // Relatives.
+  // Family.
   static std::shared_ptr<const std::string> keyFor(const std::optional<Dictionary>& userInfo);
   bool undeliveredBurstBegins();
   void aggregateMessage(const std::optional<Dictionary>& sessionInfo, double timestamp,
@@ -137,11 +139,11 @@ class ReportingdSession final : public ClientSessionInterface,
   const std::shared_ptr<IPCConnection> _connection;
   const SessionServices& _services;
   const std::string _sessionIDString;
-  std::array<char, 41> _deviceid{};  // NUL-terminated; empty when the device gives no answer
+  std::array<char, 41> _deviceid{};  // NUL-terminated; empty if the device has no ID
 
-  bool _isEnding = false;  // by its destructor's thread alone
+  bool _isEnding = false;  // set by the destructor; used only on its thread
 
-  // Read for every message of the session, and changed by the session's relatives.
+  // Read for every message of the session; written from other sessions of the family.
   std::atomic<bool> _hasAggregator{false};
 
   // Guarded by _mutex.
@@ -150,7 +152,7 @@ class ReportingdSession final : public ClientSessionInterface,
   std::optional<Dictionary> _sessionInfo VESK_GUARDED_BY(_mutex);
   std::optional<Dictionary> _userInfo VESK_GUARDED_BY(_mutex);
   std::shared_ptr<const std::string> _correlationKey VESK_GUARDED_BY(_mutex);  // set along with _userInfo
-  List _frameworks VESK_GUARDED_BY(_mutex);  // kept for the session's life and not consulted
+  List _frameworks VESK_GUARDED_BY(_mutex);  // kept for the session's lifetime; not used
   SharedBackends _backends VESK_GUARDED_BY(_mutex);
   std::optional<std::string> _storebagVersion VESK_GUARDED_BY(_mutex);
   WarningBurst _undelivered VESK_GUARDED_BY(_mutex);  // of messages to this session's client

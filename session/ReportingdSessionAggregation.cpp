@@ -1,4 +1,4 @@
-// A session and its relatives: user info, aggregation, combined session IDs.
+// A session within its family: user info, aggregation, combined session IDs.
 #include <VeskReporting/VeskReportingKeys.h>
 
 #include "platform/log/SystemLog.h"
@@ -10,7 +10,7 @@ namespace vesk {
 
 namespace {
 
-// Both present as texts and the same.
+// Whether both have the same text under `key`.
 bool sameText(const std::optional<Dictionary>& a, const std::optional<Dictionary>& b, const char* key) {
   auto first = a ? a->text(key) : std::nullopt;
   auto second = b ? b->text(key) : std::nullopt;
@@ -52,11 +52,11 @@ std::int32_t ReportingdSession::getSessionHierarchy() const {
 void ReportingdSession::aggregateMessage(const std::optional<Dictionary>& sessionInfo, double timestamp,
                                          std::uint16_t category, std::uint16_t type,
                                          const std::optional<Dictionary>& payload) {
-  // A message at the top of its family does not wait for the monitor, which is held across a storebag's
-  // fetch.
+  // A message at the top of its family must not wait for the monitor, which is held while a storebag is
+  // fetched.
   if (_sessionDelegate->mayHaveAncestor(*this)) {
-    // Declared outside the lock's scope: the last holder of a session destroys it, and must not do so under
-    // the lock.
+    // Declared outside the lock's scope, so that the lock is released first if this is the session's last
+    // reference.
     std::shared_ptr<ReportingdSession> ancestor;
     RecursiveMutexLock monitor(_sessionDelegate->monitor());
     ancestor = _sessionDelegate->getAncestorWithAggregatorForSession(*this);
@@ -72,8 +72,7 @@ void ReportingdSession::sendToAggregator(const std::optional<Dictionary>& sessio
                                          std::uint16_t category, std::uint16_t type,
                                          const std::optional<Dictionary>& payload) {
   ClientSessionReplyProxy proxy(_connection, [&](const std::string& error) {
-    // To its own client that has gone, a session's last messages say nothing that the connection's end does
-    // not.
+    // While this session ends, its client is usually gone. Its last messages are not counted as lost.
     if (!_isEnding) _services.backends.counters.count("session", DropReason::NotAggregated);
     if (!undeliveredBurstBegins()) return;
     VESK_LOG_ERROR("sendMessageWithDictionary: Failed to get remote object proxy: %s", error.c_str());

@@ -1,4 +1,4 @@
-// The road of a message from its session to every backend.
+// Dispatches a session's messages to its backends.
 #include <VeskReporting/VeskReportingKeys.h>
 
 #include <climits>
@@ -15,11 +15,11 @@ namespace vesk {
 
 namespace {
 
-// Of a file's URL: no file has a longer one, each byte of its path encoded.
+// In a file's URL each byte of the path may be percent-encoded.
 constexpr std::size_t kLongestURL = 3 * PATH_MAX + sizeof "file://localhost";
 constexpr std::size_t kShownOfTooLong = 256;
 
-/// The one answer that goes back to the client: the HTTP-post backend's, else the dashboard's, else none.
+/// Picks the answer for the client: that of the HTTP-post backend, otherwise the dashboard's, otherwise none.
 class AnswerChoice {
  public:
   void offer(const std::string& backendName, const std::optional<std::string>& answer) {
@@ -56,7 +56,7 @@ std::optional<std::string> ReportingdSession::sendMessageWithDictionary(const Di
   auto set = backends();
   if (!set) {
     VESK_LOG_DEBUG("sendMessageWithDictionary: No backends available to send message");
-    // The session's own last message has no news for a session that never had a backend.
+    // The session's own closing message is not counted if it never had a backend.
     if (!_isEnding) _services.backends.counters.count("session", DropReason::NoBackend);
     return std::nullopt;
   }
@@ -123,7 +123,7 @@ void ReportingdSession::uploadFileWithURL(const std::string& fileURL, const std:
   std::string url = fileURL;
   bool succeeded = false;
   if (path.size() >= PATH_MAX || url.size() > kLongestURL) {
-    // A client must not fill the logs with what it calls its file.
+    // A client must not fill the log with a file name.
     path = cutToWholeCharacters(path, kShownOfTooLong);
     url = cutToWholeCharacters(url, kShownOfTooLong);
   } else if (auto set = backends()) {
@@ -191,7 +191,7 @@ void ReportingdSession::sendSingleMessage(const SessionServices& services, uid_t
     auto answer = backend->sendMessage(payload, now, category, type, 0);
     if (answer) writeToLogFile("[%@ -> sendMessageWithSessionInfo] %@", name, *answer);
   }
-  // A storebag may have the backend hold the message for a batch, which ends here.
+  // A storebag may enable batching; the batch ends here.
   flushBackends(*backends);
   cleanupBackends(*backends);
 }

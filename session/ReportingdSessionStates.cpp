@@ -22,7 +22,7 @@ void ReportingdSession::createBackendsWithStorebag(const std::optional<Dictionar
     MutexLock lock(_mutex);
     previous = std::exchange(_backends, std::move(next));
   }
-  // A second start: what the first one's backends hold is sent where it may be, then they end.
+  // Started a second time: the previous backends send what they hold if allowed, then end.
   if (previous) {
     flushBackends(*previous);
     cleanupBackends(*previous);
@@ -35,7 +35,8 @@ void ReportingdSession::cleanupBackends(const BackendSet& backends) {
 }
 
 void ReportingdSession::updateSessionWithDefaultSessionInfo() {
-  // Until the states are decided its level is not: no relative may find it in its family before that.
+  // The level is only final once the states are decided. No other session may find this one in its family
+  // before that.
   RecursiveMutexLock monitor(_sessionDelegate->monitor());
   _sessionDelegate->userInfoUpdatedForSession(*this);
   updateReportingStates();
