@@ -25,14 +25,14 @@ namespace vesk {
 
 namespace {
 
-// A connection takes four descriptors, its dashboard one more; these are for posts, files and the rest.
+// Each connection takes four descriptors and its dashboard one more. The rest are for posts, files and so on.
 constexpr std::size_t kDescriptorsOfConnection = 4;
 constexpr std::size_t kOtherDescriptors = 256;
 
-// Lines of one place for one user in ten seconds.
+// The number of lines that one call site may log for one user in ten seconds.
 constexpr std::uint64_t kLogRateLimit = 200;
 
-/// As many connections as are wanted, or as the process's descriptors allow.
+/// The wanted number of connections, or fewer if the process's descriptors don't suffice.
 std::size_t maximumConnections(std::size_t wanted) {
   const std::size_t limit = descriptorLimit();
   const std::size_t fitting = std::max<std::size_t>(
@@ -83,7 +83,8 @@ PowerLog::Options powerLogOptions() {
   return options;
 }
 
-/// Connections with a dashboard each take five of eight descriptors, two more are for what they make anew.
+/// A connection with a dashboard takes five of eight descriptors; two more are for the dashboards that it
+/// replaces.
 std::shared_ptr<DashboardLinger> dashboardLinger() {
   return std::make_shared<DashboardLinger>(
       static_cast<std::ptrdiff_t>(std::min(kMaximumLingering, descriptorLimit() / 8)));
@@ -128,9 +129,9 @@ struct Daemon::Parts {
     };
   }
 
-  // Datagrams take no time to send: one thread does it for all backends.
+  // Sending a datagram doesn't block, so one thread serves all backends.
   TimedQueuePool networkQueues{1};
-  // Before the client: what is still being posted when the client ends completes with the services' help.
+  // Declared before the client: posts that complete while the client ends still use the services.
   BackendServices backendServices;
   SessionServices sessionServices;
   HTTPClient http;
@@ -151,7 +152,7 @@ void Daemon::resume() { _parts->listener.resume(); }
 
 bool Daemon::stop() {
   if (std::exchange(_stopped, true)) return !_parts;
-  // A server that does not answer must not hold up the threads of connections that wait for it.
+  // Connection threads may be waiting for a server that does not answer.
   _parts->http.stopAllButPosts();
   _parts->backendServices.uploads->close();
   const bool haveEnded = _parts->listener.stopWithin(kSessionWait);
@@ -170,7 +171,7 @@ bool Daemon::stop() {
     VESK_LOG_WARNING("main: Stopping although datagrams are still unacknowledged after %d ms.",
                      static_cast<int>(kDatagramWait.count()));
   }
-  if (haveEnded) _parts.reset();  // gives up what is left, and counts it
+  if (haveEnded) _parts.reset();  // abandons and counts what is left
   logLosses();
   return haveEnded;
 }

@@ -10,30 +10,29 @@
 
 namespace vesk {
 
-/// Everything that serves clients: HTTP client, agent, listener. Members are destroyed from the clients
-/// inwards.
+/// Everything that serves clients: HTTP client, agent, listener. Destroyed in order from the clients inwards.
 class Daemon {
  public:
-  /// Publishes nothing yet. Throws std::system_error when the socket can't be made.
+  /// Does not accept clients yet. Throws std::system_error if the socket can't be created.
   Daemon(ServiceManager& serviceManager, BusyMarker& busyMarker);
-  /// As `stop`, but for sessions that do not end: those are waited for.
+  /// Like `stop`, but waits for all sessions without a limit.
   ~Daemon();
 
-  /// Begins to accept clients.
+  /// Starts accepting clients.
   void resume();
 
-  /// Ends in order: no new connections, the sessions destroyed (they send their closing messages and flush),
-  /// then what is being posted waited for, at most `kPostWait`, and datagrams, at most `kDatagramWait`; what
-  /// is left is given up. Last, one line for each reason and backend says what was lost since the start. Safe
+  /// Stops in order: closes the listener, destroys the sessions (they send their closing messages and flush),
+  /// then waits for posts in progress, at most `kPostWait`, and for datagrams, at most `kDatagramWait`.
+  /// Abandons what is left, then logs the losses since the start, one line for each reason and backend. Safe
   /// to call twice.
   ///
-  /// False when a session did not end within `kSessionWait`, as happens when the disk under it hangs: then
-  /// nothing was destroyed, and the process has to be left by std::_Exit.
+  /// Returns false if a session did not end within `kSessionWait`, for example because its disk hangs.
+  /// Nothing has been destroyed then, and the process must exit with std::_Exit.
   [[nodiscard]] bool stop();
 
   static constexpr std::chrono::seconds kSessionWait{15};
   static constexpr std::chrono::seconds kPostWait{10};
-  /// From the same moment: a dashboard that is not answered gives up 9.5 s after its next tick.
+  /// Counted from the same moment as `kPostWait`. An unanswered dashboard fails 9.5 s after its next tick.
   static constexpr std::chrono::milliseconds kDatagramWait{10'500};
 
  private:

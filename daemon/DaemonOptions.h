@@ -9,14 +9,14 @@
 namespace vesk {
 
 struct DaemonOptions {
-  std::optional<std::string> root;               ///< stands for "/" in every path of the daemon
+  std::optional<std::string> root;               ///< replaces "/" in every path of the daemon
   int logLevel = 6;                              ///< 3, 4, 6 or 7
-  std::optional<std::chrono::seconds> idleExit;  ///< how long to stay without a client; nothing: for ever
+  std::optional<std::chrono::seconds> idleExit;  ///< how long to run without a client; nullopt: for ever
   bool sandbox = true;
 };
 
-/// The options, or the exit status when the command line asked for help or could not be understood (said on
-/// the terminal).
+/// Returns the options, or the exit status if the command line asks for help or is invalid; the text has been
+/// printed to the terminal.
 std::variant<DaemonOptions, int> parseDaemonOptions(int argc, char** argv);
 
 }  // namespace vesk

@@ -48,7 +48,7 @@ bool ReportingdAgent::shouldAcceptNewConnection(const std::shared_ptr<IPCConnect
       .invalidation = [session, agent = shared_from_this()] { agent->sessionInvalidated(session); },
       .loss = [&counters = _services.backends.counters](
                   std::size_t calls) { counters.count("session", DropReason::NotAggregated, calls); }};
-  // Last, so that nothing that fails leaves a session behind that no connection ends.
+  // Last, so that no failure leaves behind a session without a connection to end it.
   {
     MutexLock lock(_sessionListMutex);
     _sessionList.push_back(session);
@@ -65,7 +65,7 @@ void ReportingdAgent::sessionInvalidated(const std::shared_ptr<ReportingdSession
   removeFromCorrelation(session);
 }
 
-// The caller holds a reference of its own, so neither erasure can be the session's end under a lock.
+// The caller holds a reference, so neither erasure destroys the session under a lock.
 void ReportingdAgent::removeFromSessionList(const std::shared_ptr<ReportingdSession>& session) {
   MutexLock lock(_sessionListMutex);
   if (std::erase(_sessionList, session) == 0) return;
@@ -73,8 +73,8 @@ void ReportingdAgent::removeFromSessionList(const std::shared_ptr<ReportingdSess
   if (_sessionList.empty()) _busyMarker.end();
 }
 
-// Its family is looked for in every list: the key of its present user info may not be the one that it joined
-// under, since a client may configure its session anew.
+// Searches every list. A client may configure its session again, so the current user info need not match the
+// family that the session joined.
 void ReportingdAgent::removeFromCorrelation(const std::shared_ptr<ReportingdSession>& session) {
   RecursiveMutexLock lock(_monitor);
   for (auto& [key, list] : _correlatedSessions) std::erase(list, session);

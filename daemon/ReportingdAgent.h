@@ -1,4 +1,4 @@
-// Accepts clients, keeps their sessions, and serves these as their delegate.
+// Accepts clients, keeps their sessions, and serves as the sessions' delegate.
 #pragma once
 
 #include <atomic>
@@ -18,23 +18,23 @@
 
 namespace vesk {
 
-/// Keeps the list of live sessions, and the storebag cache and the families of sessions under one recursive
-/// lock, its monitor. The list has a lock of its own; the two are never held one inside the other. A
-/// session's last reference is never given up under either.
+/// Keeps the list of live sessions under a lock of its own, and the storebag cache and the families of
+/// sessions under a recursive lock, the monitor. The two locks are never nested. A session's last reference
+/// is never dropped under either of them.
 ///
-/// Held by its sessions, so it outlives them. Sources: ReportingdAgent.cpp (connections, storebags),
+/// Its sessions share ownership, so it outlives them. Sources: ReportingdAgent.cpp (connections, storebags),
 /// ReportingdAgentHierarchy.cpp (families).
 class ReportingdAgent final : public ReportingdSessionDelegate,
                               public IPCListenerDelegate,
                               public std::enable_shared_from_this<ReportingdAgent> {
  public:
-  /// `services` and `busyMarker` outlive the agent.
+  /// `services` and `busyMarker` must outlive the agent.
   ReportingdAgent(const SessionServices& services, StorebagFetcher fetchStorebag, BusyMarker& busyMarker);
 
   // --- IPCListenerDelegate
   bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) override;
-  /// What the end of a session's connection does: the session leaves the list and every family. The caller
-  /// holds a reference, so that the session is not destroyed under a lock.
+  /// Called when a session's connection has ended. Removes the session from the list and from every family.
+  /// The caller must hold a reference, so that the session is not destroyed under a lock.
   void sessionInvalidated(const std::shared_ptr<ReportingdSession>& session);
 
   // --- ReportingdSessionDelegate
@@ -54,24 +54,24 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
  private:
   using SessionList = std::vector<std::shared_ptr<ReportingdSession>>;
 
-  /// An emptied list stays, in case its family comes back. A client that keeps inventing names must not fill
-  /// the memory: once there are this many lists, the empty ones go before another is made.
+  /// Empty lists are kept in case their family returns. At this many lists, the empty ones are removed before
+  /// another is added, so that clients can't fill the memory with invented names.
   static constexpr std::size_t kMostKeptLists = 256;
-  /// Nor must the names themselves: an empty list with a longer key, in bytes, goes with the next new one.
+  /// An empty list whose key exceeds this size in bytes is removed when the next list is added.
   static constexpr std::size_t kLongestKeptKey = 1024;
 
   void removeFromSessionList(const std::shared_ptr<ReportingdSession>& session) VESK_EXCLUDES(_monitor);
   void removeFromCorrelation(const std::shared_ptr<ReportingdSession>& session)
       VESK_EXCLUDES(_sessionListMutex);
 
-  /// The first session of exactly that level, in the order in which they joined.
+  /// The first session with exactly that level, in the order of joining.
   static std::shared_ptr<ReportingdSession> getFirstSessionWithHierarchy(std::int64_t level,
                                                                          const SessionList& list);
   const SessionList* correlatedSessions(const std::string& key) const VESK_REQUIRES(_monitor);
   SessionList& listForKey(const std::string& key) VESK_REQUIRES(_monitor);
 
-  // Written under the lock of what they count, and read without it: a listener's log line must not wait for a
-  // storebag.
+  // Written under the lock of what they count, and read without it, because a listener's log line must not
+  // wait for a storebag.
   std::atomic<int> _sessionCount{0};
   std::atomic<int> _familyCount{0};
 
@@ -79,7 +79,7 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
   const SessionServices& _services;
   BusyMarker& _busyMarker;
 
-  // Guarded by _sessionListMutex: every accepted session that is not yet invalidated, in order of acceptance.
+  // Guarded by _sessionListMutex: accepted sessions that are not invalidated yet, in order of acceptance.
   Mutex _sessionListMutex;
   SessionList _sessionList VESK_GUARDED_BY(_sessionListMutex);
 

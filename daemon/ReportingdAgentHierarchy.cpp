@@ -1,4 +1,4 @@
-// Families of sessions: those of the same client and service, by level.
+// Families: sessions of the same client and service, ordered by level.
 #include <algorithm>
 #include <cinttypes>
 
@@ -10,7 +10,7 @@ namespace vesk {
 
 namespace {
 
-/// A key comes from a client, which must not fill the log with it.
+/// Shortens a key for the log, since a client chooses it.
 std::string shown(const std::string& key) { return cutToWholeCharacters(key, 256); }
 
 template <class List>
@@ -48,7 +48,7 @@ void ReportingdAgent::userInfoUpdatedForSession(ReportingdSession& session) {
   auto userInfo = session.userInfo();
   if (!userInfo) {
     VESK_LOG_INFO("userInfoUpdatedForSession: No user info found for session %u", session.sessionID());
-    removeFromCorrelation(session.shared_from_this());  // a client may take back what it had said
+    removeFromCorrelation(session.shared_from_this());  // a client may withdraw its user info
     return;
   }
   auto self = session.shared_from_this();
@@ -138,7 +138,7 @@ std::shared_ptr<ReportingdSession> ReportingdAgent::getAncestorWithAggregatorFor
   const std::int32_t level = session.getSessionHierarchy();
   const SessionList* list = correlatedSessions(*session.correlationKey());
   if (!list) return nullptr;
-  // The list is walked, not the levels: those come from outside, and may be any number.
+  // Iterates over the list and not the levels, since a client may choose any number as its level.
   std::shared_ptr<ReportingdSession> ancestor;
   std::int32_t highest = level;
   for (auto candidate = list->begin(); candidate != list->end() && highest > 0; ++candidate) {

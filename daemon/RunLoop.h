@@ -1,4 +1,4 @@
-// The daemon's main run loop: waits for a reason to stop.
+// The daemon's main run loop, which waits for a reason to stop.
 #pragma once
 
 #include <chrono>
@@ -13,39 +13,39 @@
 
 namespace vesk {
 
-/// Runs on the main thread for the life of the process; the work is done by other threads. It sleeps until
-/// something happens: no wake-ups but the watchdog's, and after work those that look for a pause.
+/// Runs on the main thread for the life of the process, while other threads do the work. Wakes up only for
+/// events, for the watchdog's pings, and after work to look for a pause.
 class RunLoop {
  public:
   enum class Outcome {
     Stopped,    ///< by `stop`
     Signalled,  ///< by SIGTERM or SIGINT
-    Idle,       ///< the busy marker was down for the idle time
+    Idle,       ///< no work for the idle time
   };
 
   struct Options {
-    /// How long the process may be idle; nothing: for ever.
+    /// How long the process may be idle; nullopt: for ever.
     std::optional<std::chrono::milliseconds> idleExit{};
-    /// Called on this thread once work has paused for `pause`, so that it delays no client, or after ten
+    /// Called on this thread once work has paused for `pause`, so that no client is delayed, or after ten
     /// times as long without a pause.
     std::function<void()> onPause = nullptr;
     std::chrono::milliseconds pause{3000};
   };
 
-  /// Both outlive the loop. From here on SIGTERM and SIGINT wait for `run`, in this thread and in every
-  /// thread made later, and SIGPIPE is ignored: construct it before the process has other threads. Throws
-  /// std::system_error when there is no descriptor left.
+  /// The marker and the service manager must outlive the loop. Blocks SIGTERM and SIGINT for this thread and
+  /// all threads created later, so that `run` receives them, and ignores SIGPIPE. Construct it before the
+  /// process has other threads. Throws std::system_error if no descriptor is left.
   RunLoop(Options options, BusyMarker& busyMarker, ServiceManager& serviceManager);
-  /// Gives the signals back to the calling thread.
+  /// Restores the calling thread's signal mask.
   ~RunLoop();
   RunLoop(const RunLoop&) = delete;
   RunLoop& operator=(const RunLoop&) = delete;
 
-  /// Returns when there is a reason to stop. After a signal, SIGTERM and SIGINT have their usual effect
-  /// again: a second one ends a process that takes too long to stop.
+  /// Returns when there is a reason to stop. After a signal, SIGTERM and SIGINT have their default effect
+  /// again, so that a second one ends a process that is slow to stop.
   Outcome run();
 
-  /// Makes `run` return, also when called before it. Any thread; more than once.
+  /// Makes `run` return, even if called before it. Thread-safe; may be called repeatedly.
   void stop() noexcept;
 
  private:
@@ -64,10 +64,10 @@ class RunLoop {
   FileDescriptor _stopRequest;
   sigset_t _previousMask{};
 
-  // Used by `run` alone.
+  // Only used by `run`.
   std::optional<Clock::time_point> _idleDeadline;
   std::optional<Clock::time_point> _nextPing;
-  std::optional<Clock::time_point> _nextLook;  // whether work has paused
+  std::optional<Clock::time_point> _nextLook;  // next check for a pause in the work
   int _looks = 0;
 };
 

@@ -16,8 +16,8 @@ std::optional<Dictionary> StorebagCache::storebagForClientType(std::int32_t clie
   return record->second.storebagData;
 }
 
-// The age is taken without a sign: a clock that was set back shortens or lengthens the wait, but never blocks
-// fetching for ever.
+// Uses the absolute age: if the clock was set back, the wait gets longer or shorter, but fetching is never
+// blocked for ever.
 bool StorebagCache::isFresh(const Record& record, std::int32_t clientType) const {
   if (!record.storebagFetchTime) return false;
   auto age = std::chrono::abs(_clock.now() - *record.storebagFetchTime);
@@ -39,7 +39,7 @@ bool StorebagCache::isFresh(const Record& record, std::int32_t clientType) const
 void StorebagCache::fetchAndCacheStorebag(std::int32_t clientType) {
   VESK_LOG_DEBUG("fetchAndCacheStorebag: Fetching storebag for client type %d", clientType);
   Record& record = _records[std::string(*storebagNameForClientType(clientType))];
-  std::int32_t maxAge = 0;  // what a fetch without any answer reports
+  std::int32_t maxAge = 0;  // the value if a fetch gets no answer
   std::optional<std::string> version;
   bool notModified = false;
   std::optional<std::string> lastModified = record.storebagLastModified;

@@ -1,4 +1,4 @@
-// The storebags that the daemon has fetched, and when it may fetch again.
+// Caches the fetched storebags and decides when to fetch again.
 #pragma once
 
 #include <chrono>
@@ -14,22 +14,23 @@
 
 namespace vesk {
 
-/// Fetches the section of a client type's storebag that applies to this device. Blocks for the request.
+/// Fetches the section of a client type's storebag that applies to this device. Blocks during the request.
 using StorebagFetcher = std::function<std::optional<Dictionary>(
     std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
     std::optional<std::string>& lastModified)>;
 
-/// One record a storebag name, in memory only, for the life of the daemon. Not synchronised: the agent calls
-/// it with its monitor held, also across a fetch, so that two sessions never fetch the same storebag at once.
+/// Keeps one record per storebag name, in memory, for the life of the daemon. Not thread-safe: the agent
+/// calls it with its monitor held, also during a fetch, so that two sessions never fetch the same storebag at
+/// once.
 class StorebagCache {
  public:
-  /// After a failed attempt the server is left alone for this long.
+  /// The wait after a failed attempt.
   static constexpr std::chrono::seconds kMinimumWaitAfterFailure{900};
 
   StorebagCache(StorebagFetcher fetch, const WallClock& clock) : _fetch(std::move(fetch)), _clock(clock) {}
 
-  /// The cached section where it is fresh enough or may not be fetched yet, else what a fetch brings (or,
-  /// when that fails, the last good section). Nothing for a client type without a storebag.
+  /// Returns the cached section if it is fresh or must not be fetched yet; otherwise fetches it, and returns
+  /// the last good section if that fails. Returns nullopt for a client type without a storebag.
   std::optional<Dictionary> storebagForClientType(std::int32_t clientType);
 
   /// The version of the last good section; never fetches.
@@ -43,11 +44,11 @@ class StorebagCache {
     std::optional<std::string> storebagVersion;
     std::optional<WallTime> storebagFetchTime;  // end of the last attempt
     FetchState storebagFetchState = FetchState::Failure;
-    std::int32_t storebagMaxAge = 0;  // seconds, as the last attempt reported it
+    std::int32_t storebagMaxAge = 0;  // seconds, as reported by the last attempt
     std::optional<std::string> storebagLastModified;
   };
 
-  /// Whether the record may be served without a fetch; logs why.
+  /// Whether the record may be served without a fetch. Logs the reason.
   bool isFresh(const Record& record, std::int32_t clientType) const;
   void fetchAndCacheStorebag(std::int32_t clientType);
 

@@ -51,7 +51,7 @@ int run(const vesk::DaemonOptions& options) {
   serviceManager.notifyStopping();
   const bool haveEnded = daemon.stop();
   vesk::VeskReportingLogging::close();
-  if (!haveEnded) std::_Exit(1);  // what its sessions' threads still use can't be destroyed
+  if (!haveEnded) std::_Exit(1);  // its sessions' threads still use what would be destroyed
   return 0;
 }
 
