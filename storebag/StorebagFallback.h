@@ -1,12 +1,11 @@
-// The storebag that stands in for one that can't be reached.
+// The built-in storebag.
 #pragma once
 
 #include <VeskReporting/values/Value.h>
 
 namespace vesk {
 
-/// The payload that is used for the storebag "palvo" when its server can't be reached. Unsigned; without a
-/// section "seed".
+/// The payload used for the storebag "palvo" if its server can't be reached. Unsigned; has no section "seed".
 Dictionary fallbackStorebag();
 
 }  // namespace vesk

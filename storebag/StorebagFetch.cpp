@@ -22,9 +22,10 @@ namespace {
 constexpr std::chrono::seconds kTimeout{15};
 constexpr std::int32_t kLongestAge = 86400;  // seconds
 constexpr std::string_view kFallbackName = "palvo";
-constexpr std::string_view kStorebag = "storebag";  // stands for the backend in lines about its own entries
+constexpr std::string_view kStorebag =
+    "storebag";  // replaces the backend's name in lines about the storebag's own entries
 
-/// What the answer says in that header, on however many lines; none without it.
+/// The values of that header, joined if it has several lines; nullopt without the header.
 std::optional<std::string> listInHeader(const HTTPResponse& response, std::string_view name) {
   std::optional<std::string> list;
   for (const auto& [each, value] : response.headers) {
@@ -34,8 +35,8 @@ std::optional<std::string> listInHeader(const HTTPResponse& response, std::strin
   return list;
 }
 
-/// Whether the answer says that the caller's storebag is still the current one; else notes what it says about
-/// its own age.
+/// Whether the answer says that the caller's storebag is still current. Otherwise stores the answer's date in
+/// `lastModified`.
 bool hasNotChanged(const HTTPResponse& response, std::optional<std::string>* lastModified) {
   auto received = response.header("Last-Modified");
   if (!lastModified || !received) return false;
@@ -48,7 +49,7 @@ bool hasNotChanged(const HTTPResponse& response, std::optional<std::string>* las
   return false;
 }
 
-/// The signed document around a storebag; empty when `body` is none.
+/// The signed document around a storebag; empty if `body` is not such a document.
 Dictionary documentIn(const std::string& body) {
   auto outcome = parsePropertyList(body);
   if (!outcome.value) {
@@ -123,7 +124,7 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryF
 
   HTTPResult result = http.perform(storebagRequest(url, lastModified ? *lastModified : std::nullopt));
   if (result.error && result.error->kind == HTTPError::Kind::TooLarge) {
-    // There is an answer, and it is no storebag.
+    // The server answered, but not with a storebag.
     VESK_LOG_ERROR("fetchStorebagWithName: propertyListWithData error %s", result.error->description.c_str());
     return verifiedPayload({}, library);
   }
@@ -131,7 +132,7 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryF
     VESK_LOG_INFO(
         "fetchStorebagWithName: Error resolving with lookup server %s, sendSynchronousRequest error %s",
         url.c_str(), result.error->description.c_str());
-    // No client of a daemon that ends should start with less than the server would give it.
+    // While the daemon ends, no client should start with less than the server would give it.
     if (name != kFallbackName || result.error->kind == HTTPError::Kind::Stopped) return std::nullopt;
     VESK_LOG_INFO("fetchStorebagWithName: Loading default storebag '%s'", std::string(name).c_str());
     return fallbackStorebag();

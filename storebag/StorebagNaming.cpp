@@ -15,7 +15,7 @@ namespace {
 
 constexpr std::string_view kSuite = "com.corvane.veskreporting";
 constexpr std::int32_t kDefaultEnvironment = kSeedEnvironment;
-constexpr std::int64_t kEnvironmentTypes = 5;  // 0, which names no section, included
+constexpr std::int64_t kEnvironmentTypes = 5;  // including 0, which has no section
 
 std::atomic<std::int32_t> processEnvironmentType{0};
 
@@ -101,7 +101,7 @@ std::string storebagServerBaseURLFor(const std::optional<std::string>& override,
 
 std::string storebagServerBaseURL() {
   static const std::optional<std::string> override = preferenceStringForKey("veskreporting_storebag_url");
-  // The kind of build is only asked for where it decides.
+  // The kind of build is only determined if it decides.
   return storebagServerBaseURLFor(override, !override && isInternalBuild());
 }
 

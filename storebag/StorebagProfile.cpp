@@ -7,9 +7,9 @@ namespace vesk {
 
 namespace {
 
-constexpr std::size_t kShown = 64;  // bytes of a value in a log line
+constexpr std::size_t kShown = 64;  // bytes of a value shown in a log line
 
-/// The value under `key` when `accepts` it.
+/// The value under `key` if `accepts` returns true for it.
 template <class Accepts>
 const Value* find(std::string_view backendName, const Dictionary& profile, std::string_view key,
                   Accepts accepts) {

@@ -1,4 +1,4 @@
-// Typed reading of what a storebag says: a backend's profile, and the storebag's own entries.
+// Typed access to a storebag: to a backend's profile and to the storebag's own entries.
 #pragma once
 
 #include <cstdint>
@@ -11,25 +11,25 @@
 
 namespace vesk {
 
-/// Says, in one line of level 4, that `value` under `key` is not of the type that it must have.
+/// Logs one line of level 4: `value` under `key` does not have the required type.
 void reportWrongType(std::string_view backendName, std::string_view key, const Value& value);
 
-/// What `profile` holds under `key`. A storebag is signed, but its authors err: a value of the wrong type
-/// counts as absent and costs one line, which names the backend and the key.
+/// The value of `profile` under `key`. Storebags are signed but may contain mistakes: a value of the wrong
+/// type counts as absent, with one line that names the backend and the key.
 std::optional<std::string> profileText(std::string_view backendName, const Dictionary& profile,
                                        std::string_view key);
-/// Boolean, integer or double, as it stands.
+/// Boolean, integer or double, unconverted.
 std::optional<Value> profileNumber(std::string_view backendName, const Dictionary& profile,
                                    std::string_view key);
-/// A number, cut to an integer as `Value::asInteger` does.
+/// A number, converted to an integer by `Value::asInteger`.
 std::optional<std::int64_t> profileInteger(std::string_view backendName, const Dictionary& profile,
                                            std::string_view key);
-/// A number as above, or a text by its leading integer (0 when there is none).
+/// A number as above, or text by its leading integer (0 if there is none).
 std::optional<std::int64_t> profileIntegerOrNumericText(std::string_view backendName,
                                                         const Dictionary& profile, std::string_view key);
 std::optional<List> profileList(std::string_view backendName, const Dictionary& profile,
                                 std::string_view key);
-/// An element that is no text is left out, with one line for the list.
+/// Elements that are not text are left out, with one line for the list.
 std::optional<std::vector<std::string>> profileTextList(std::string_view backendName,
                                                         const Dictionary& profile, std::string_view key);
 std::optional<Dictionary> profileDictionary(std::string_view backendName, const Dictionary& profile,

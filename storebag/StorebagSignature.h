@@ -1,4 +1,4 @@
-// What makes a storebag trustworthy.
+// Verification of storebags.
 #pragma once
 
 #include <string_view>
