@@ -36,7 +36,7 @@ std::string dataText(std::string_view bytes) {
 
 class Printer {
  public:
-  /// `value` after whatever stands on its line already.
+  /// Appends `value` to the current line.
   void add(const Value& value, std::size_t indent) {
     if (const List* list = value.list()) {
       line("list of " + std::to_string(list->size()));

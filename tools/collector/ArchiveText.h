@@ -1,4 +1,4 @@
-// Keyed archives for a person to read.
+// Readable text for keyed archives.
 #pragma once
 
 #include <string>
@@ -8,11 +8,11 @@
 
 namespace vesk {
 
-/// What the tools read at most.
+/// Limits on the archives that the tools read.
 PropertyListLimits archiveLimits();
 
-/// The archived value, one line an item or entry, those of a container indented below it; ends with a line
-/// feed. Throws std::runtime_error that says what is wrong with the archive.
+/// The archived value with one line for each item or entry and the contents of containers indented. Ends with
+/// a line feed. Throws std::runtime_error with a description of the archive's fault.
 std::string archiveText(std::string_view archive);
 
 }  // namespace vesk

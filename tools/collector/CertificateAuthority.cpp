@@ -28,8 +28,8 @@ void setSerial(X509* certificate) {
           "set a serial number");
 }
 
-/// A certificate for `key` with everything but issuer, extensions and signature. It starts an hour ago, for
-/// clients whose clock is a little behind.
+/// Creates a certificate for `key` without issuer, extensions and signature. It is valid from an hour ago, so
+/// that clients with a slow clock accept it.
 Certificate startCertificate(EVP_PKEY* key, const char* commonName, long days) {
   Certificate certificate = checked(Certificate(X509_new()), "allocate a certificate");
   X509_set_version(certificate.get(), X509_VERSION_3);

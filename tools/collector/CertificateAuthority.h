@@ -1,4 +1,4 @@
-// A certificate authority of the collector's own, so that clients on this machine can verify it.
+// The collector's own certificate authority, so that clients on this machine can verify its certificates.
 #pragma once
 
 #include <filesystem>
@@ -9,14 +9,15 @@
 
 namespace vesk {
 
-/// Holds an EC P-256 authority key and issues server certificates. Immutable; thread-safe. Whatever fails
-/// throws std::runtime_error with a message that names the file or the step.
+/// Holds an EC P-256 authority key and issues server certificates. Immutable; thread-safe. Failures throw
+/// std::runtime_error with a message that names the file or the step.
 class CertificateAuthority {
  public:
-  /// A new authority that lives in memory only, valid for ten years.
+  /// Creates an authority in memory, valid for ten years.
   static CertificateAuthority generate();
-  /// The authority kept in `directory` as "ca.pem" and "ca.key" (mode 0600); made there when neither exists.
-  /// An expired one, or one file without the other, is refused rather than replaced: clients may trust it.
+  /// Opens the authority stored in `directory` as "ca.pem" and "ca.key" (mode 0600), or creates it if neither
+  /// file exists. Refuses an expired authority, or one file without the other, and does not replace it, since
+  /// clients may trust it.
   static CertificateAuthority openOrCreate(const std::filesystem::path& directory);
 
   static std::filesystem::path certificateFile(const std::filesystem::path& directory) {
@@ -26,11 +27,11 @@ class CertificateAuthority {
     return directory / "ca.key";
   }
 
-  /// What clients are to trust (SSL_CERT_FILE).
+  /// The certificate that clients should trust (SSL_CERT_FILE).
   const std::string& certificate() const { return _certificate; }
 
-  /// A fresh certificate, valid for so many days, for "localhost", 127.0.0.1, ::1 and the given further names
-  /// or numeric addresses.
+  /// Issues a new certificate, valid for `days` days, for "localhost", 127.0.0.1, ::1 and `furtherNames`,
+  /// which may be names or numeric addresses.
   TLSIdentity issueServerIdentity(const std::vector<std::string>& furtherNames = {}, long days = 365) const;
 
  private:

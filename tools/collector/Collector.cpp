@@ -54,7 +54,7 @@ struct Collector::Parts {
         plainPaths(Refusals(console, stats)) {
     for (const auto& fault : options.faults)
       if (auto problem = faults.add(fault)) throw std::runtime_error(*problem);
-    // What else is to be taken over HTTP gets its endpoint above and its path here.
+    // Further HTTP endpoints are created above and get their paths here.
     for (EndpointTable* paths : {&securePaths, &plainPaths}) {
       paths->add(kEventsPath, events);
       paths->add(kLogDataPath, logData);
@@ -65,7 +65,7 @@ struct Collector::Parts {
     plainPaths.add(kControlPath, control);
     secure = serve(securePaths, options.httpsPort, authority.issueServerIdentity(options.names));
     plain = serve(plainPaths, options.httpPort, std::nullopt);
-    // Dashboards know IPv4 only.
+    // Dashboards only support IPv4.
     if (IPv4Endpoint::parse(options.address, 0)) {
       datagrams = std::make_unique<DashboardReceiver>(DashboardReceiver::Parts{console, stats},
                                                       options.address, options.udpPort, options.datagramLoss,

@@ -1,4 +1,4 @@
-// The development collector: its keys, its endpoints and the two servers in front of them.
+// The development collector: its keys, its endpoints and its two HTTP servers.
 #pragma once
 
 #include <chrono>
@@ -19,34 +19,34 @@ namespace vesk {
 struct CollectorOptions {
   std::filesystem::path directory;  ///< the collector's own files
   std::string address = "127.0.0.1";
-  std::uint16_t httpsPort = 8443;  ///< 0: any free one
-  std::uint16_t httpPort = 8080;   ///< 0: any free one
-  std::uint16_t udpPort = 9053;    ///< 0: any free one
+  std::uint16_t httpsPort = 8443;  ///< 0: any free port
+  std::uint16_t httpPort = 8080;   ///< 0: any free port
+  std::uint16_t udpPort = 9053;    ///< 0: any free port
   DatagramLoss datagramLoss{};
   std::filesystem::path storebags;                       ///< empty: "storebags" in `directory`
   std::filesystem::path events;                          ///< empty: "events.jsonl" in `directory`
   std::filesystem::path uploads{};                       ///< empty: "uploads" in `directory`
-  std::string uploadAnswer = R"({"result":"success"})";  ///< to every file that is taken
+  std::string uploadAnswer = R"({"result":"success"})";  ///< to every accepted file
   std::optional<std::chrono::seconds> maximumAge{};
   std::vector<std::string> names{};   ///< further names and addresses for the certificate
   std::vector<std::string> faults{};  ///< as for FaultPlan::add
   StorebagChecks checks = StorebagChecks::Strict;
 };
 
-/// Runs from construction to destruction. Everything is offered over HTTPS and over HTTP; the control path
-/// over HTTP only. Datagrams are taken on a port of their own.
+/// Runs from construction to destruction. Serves all paths over HTTPS and HTTP, except the control path,
+/// which is served over HTTP only. Receives datagrams on a UDP port.
 class Collector {
  public:
-  /// Makes directories, the certificate authority and the signing key where they are missing. Throws
-  /// std::runtime_error with a message for a person.
+  /// Creates missing directories, the certificate authority and the signing key. Throws std::runtime_error
+  /// with a readable message.
   Collector(CollectorOptions options, Console& console);
   ~Collector();
   Collector(const Collector&) = delete;
   Collector& operator=(const Collector&) = delete;
 
-  /// What it listens on and where its files are: the ready file's entries.
+  /// The addresses it listens on and the paths of its files: the entries of the ready file.
   Dictionary facts() const;
-  /// The same for a person, with what to put where; lines.
+  /// The same as readable lines, with instructions for setting up the daemon.
   std::string introduction() const;
 
  private:

@@ -7,31 +7,33 @@
 
 namespace vesk {
 
-/// Each counter is synchronised by itself.
+/// Each counter is atomic.
 struct CollectorStats {
   struct Counter : std::atomic<std::uint64_t> {
     Counter(CollectorStats& stats, const char* counterName) : name(counterName) { stats.all.push_back(this); }
     const char* const name;
   };
 
-  std::vector<const Counter*> all;  ///< in the order of their declaration; constant after construction
+  std::vector<const Counter*> all;  ///< in order of declaration; constant after construction
 
-  Counter posts{*this, "posts"};                    ///< taken
-  Counter events{*this, "events"};                  ///< in the posts taken
-  Counter eventsNotSaved{*this, "eventsNotSaved"};  ///< in posts left unanswered since the file failed
-  Counter storebagsSent{*this, "storebagsSent"};    ///< whole, also those with a bad signature on demand
+  Counter posts{*this, "posts"};    ///< accepted
+  Counter events{*this, "events"};  ///< in accepted posts
+  Counter eventsNotSaved{*this,
+                         "eventsNotSaved"};  ///< in posts left unanswered because writing the file failed
+  Counter storebagsSent{*this,
+                        "storebagsSent"};  ///< complete, including those with a requested bad signature
   Counter storebagsUnchanged{*this, "storebagsUnchanged"};      ///< answered with 304
-  Counter datagrams{*this, "datagrams"};                        ///< of dashboards, taken
-  Counter datagramsAgain{*this, "datagramsAgain"};              ///< of these, that had been there before
-  Counter datagramsMalformed{*this, "datagramsMalformed"};      ///< that were none
-  Counter datagramsLost{*this, "datagramsLost"};                ///< on demand
+  Counter datagrams{*this, "datagrams"};                        ///< accepted from dashboards
+  Counter datagramsAgain{*this, "datagramsAgain"};              ///< of these, repeated ones
+  Counter datagramsMalformed{*this, "datagramsMalformed"};      ///< rejected as malformed
+  Counter datagramsLost{*this, "datagramsLost"};                ///< dropped on request
   Counter acknowledgements{*this, "acknowledgements"};          ///< sent
-  Counter acknowledgementsLost{*this, "acknowledgementsLost"};  ///< on demand
+  Counter acknowledgementsLost{*this, "acknowledgementsLost"};  ///< dropped on request
   Counter logData{*this, "logData"};                            ///< uploads of log data
-  Counter uploads{*this, "uploads"};                            ///< files taken
-  Counter refused{*this, "refused"};                            ///< requests that were not the protocol
-  Counter notHTTP{*this, "notHTTP"};  ///< connections that did not get as far as a request
-  Counter faults{*this, "faults"};    ///< faults on demand
+  Counter uploads{*this, "uploads"};                            ///< accepted files
+  Counter refused{*this, "refused"};                            ///< requests that violate the protocol
+  Counter notHTTP{*this, "notHTTP"};  ///< connections that ended before a complete request
+  Counter faults{*this, "faults"};    ///< injected faults
 };
 
 }  // namespace vesk

@@ -12,7 +12,7 @@ namespace vesk {
 
 namespace {
 
-/// 0, or the error number.
+/// Returns 0 or the error number.
 int writeLine(int descriptor, std::string_view line) {
   return writeAll(descriptor, std::string(line) + "\n");
 }

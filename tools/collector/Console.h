@@ -1,4 +1,4 @@
-// What the collector says to the person who runs it.
+// The collector's output for the person who runs it.
 #pragma once
 
 #include <string_view>
@@ -7,23 +7,23 @@
 
 namespace vesk {
 
-/// Whole lines to standard output and standard error, from any thread. A standard output that was closed
-/// costs one line on standard error, and the collector goes on without.
+/// Writes whole lines to standard output and standard error. Thread-safe. If standard output is closed, logs
+/// one line to standard error and continues without it.
 class Console {
  public:
   enum class Style : unsigned char {
-    Readable,  ///< everything for a person
-    JSON       ///< standard output holds the events only, one JSON line each; notes go to standard error
+    Readable,  ///< everything as readable text
+    JSON       ///< events as JSON lines on standard output; notes on standard error
   };
   explicit Console(Style style) : _style(style) {}
 
   Style style() const { return _style; }
 
-  /// What arrived; `lines` are separated by line feeds and hold no other control characters.
+  /// Shows received data. `lines` are separated by line feeds and contain no other control characters.
   void event(std::string_view lines);
-  /// What else happened. Control characters are shown as \xNN.
+  /// Shows any other occurrence. Control characters appear as \xNN.
   void note(std::string_view line);
-  /// What was refused or failed, on standard error.
+  /// Shows a refusal or failure, on standard error.
   void problem(std::string_view line);
 
  private:

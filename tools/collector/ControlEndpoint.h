@@ -1,4 +1,4 @@
-// Lets a test or a demonstration steer the running collector.
+// Lets a test or demonstration control the running collector.
 #pragma once
 
 #include "tools/collector/Endpoint.h"
@@ -6,8 +6,8 @@
 
 namespace vesk {
 
-/// Below its path: "fault" (POST: one fault a line, as FaultPlan::add takes them; GET: those still to come;
-/// DELETE: forgets them) and "stats" (GET: the counters as JSON).
+/// Serves two paths below its own. "fault": POST adds faults, one per line, in the form that FaultPlan::add
+/// accepts; GET lists the pending ones; DELETE removes them. "stats": GET returns the counters as JSON.
 class ControlEndpoint : public Endpoint {
  public:
   ControlEndpoint(Console& console, CollectorStats& stats, FaultPlan& faults)

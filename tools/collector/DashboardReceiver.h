@@ -1,4 +1,4 @@
-// Takes the datagrams of dashboards and acknowledges them.
+// Receives and acknowledges the datagrams of dashboards.
 #pragma once
 
 #include <cstdint>
@@ -18,9 +18,9 @@
 
 namespace vesk {
 
-/// Listens from construction to destruction, on a thread of its own. Shows each datagram on the console,
-/// appends it to a file of JSON lines, and sends the header of one that asks for it back. What is no datagram
-/// is counted and shown, and not answered.
+/// Listens from construction to destruction, on its own thread. Shows each datagram on the console, appends
+/// it to a file of JSON lines, and acknowledges it with its header if requested. Malformed datagrams are
+/// counted and shown, but not answered.
 class DashboardReceiver {
  public:
   struct Parts {
@@ -28,7 +28,7 @@ class DashboardReceiver {
     CollectorStats& stats;
     const WallClock& clock = WallClock::system();
   };
-  /// Port 0 takes any free one. Throws std::runtime_error with a message for a person.
+  /// Port 0 selects any free port. Throws std::runtime_error with a readable message.
   DashboardReceiver(Parts parts, const std::string& address, std::uint16_t port, DatagramLoss loss,
                     std::filesystem::path file);
   ~DashboardReceiver();
@@ -43,10 +43,10 @@ class DashboardReceiver {
   void record(const ReceivedDatagram& datagram);
   void acknowledge(std::string_view bytes, std::uint16_t eventID, std::uint32_t attempt,
                    const IPv4Endpoint& peer);
-  /// What is known of a datagram, made when it comes for the first time.
+  /// The history of one datagram, created when it first arrives.
   struct Known {
-    std::uint32_t sent = 0;   // so often, lost ones included
-    std::uint32_t taken = 0;  // of these
+    std::uint32_t sent = 0;   // how often it was sent, including lost ones
+    std::uint32_t taken = 0;  // how often it was accepted
   };
   Known& known(std::string_view bytes);
 
@@ -56,9 +56,9 @@ class DashboardReceiver {
   const std::filesystem::path _file;
   std::uint16_t _port = 0;
 
-  // Of the thread only, once it runs.
+  // Only used by the thread once it runs.
   UDPSocket _socket;
-  std::deque<std::size_t> _recent;  // digests of datagrams, oldest first
+  std::deque<std::size_t> _recent;  // digests of recent datagrams, oldest first
   std::unordered_map<std::size_t, Known> _known;
 
   FileDescriptor _stop;

@@ -1,12 +1,12 @@
-// Which datagrams and acknowledgements are lost on demand.
+// Decides which datagrams and acknowledgements are dropped on request.
 #pragma once
 
 #include <cstdint>
 
 namespace vesk {
 
-/// Loses with a probability, and the same ones in every run: what is lost depends on the seed, on the event
-/// ID and on how often its datagram has been sent, not on when it arrives.
+/// Drops datagrams with a given probability but reproducibly: the decision depends only on the seed, the
+/// event ID and how often the datagram was sent.
 class DatagramLoss {
  public:
   enum class What : unsigned char { Datagram, Acknowledgement };
@@ -15,7 +15,7 @@ class DatagramLoss {
   explicit DatagramLoss(double probability = 0, std::uint32_t seed = 1)
       : _probability(probability), _seed(seed) {}
 
-  /// `attempt`: how often this datagram was sent before.
+  /// Returns true if the datagram is dropped. `attempt`: how often it was sent before.
   bool takes(What what, std::uint16_t eventID, std::uint32_t attempt) const noexcept;
 
  private:

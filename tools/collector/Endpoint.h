@@ -12,22 +12,21 @@
 
 namespace vesk {
 
-/// Answers the requests for one path and those below it. Called from several servers' threads at once; must
-/// not block on the network.
+/// Answers the requests for one path and the paths below it. Called concurrently on several servers' threads.
+/// Must not block on the network.
 class Endpoint {
  public:
   virtual ~Endpoint() = default;
   virtual HTTPAnswer answer(const HTTPReceived& received) = 0;
 };
 
-/// Says on the console why a request is refused, counts it, and makes the answer that tells the peer the
-/// same.
+/// Refuses requests: shows the reason on the console, counts it, and builds an answer with the same reason.
 class Refusals {
  public:
   Refusals(Console& console, CollectorStats& stats) : _console(console), _stats(stats) {}
 
   HTTPAnswer operator()(const HTTPReceived& received, unsigned status, std::string_view reason) const;
-  /// 405 with the methods that the path knows.
+  /// Answers 405 with the methods that the path supports.
   HTTPAnswer wrongMethod(const HTTPReceived& received, std::string_view allowed) const;
 
  private:
@@ -35,12 +34,13 @@ class Refusals {
   CollectorStats& _stats;
 };
 
-/// Which endpoint answers which path: filled before the server starts, constant afterwards.
+/// Maps paths to endpoints. Filled before the server starts, constant afterwards.
 class EndpointTable {
  public:
   explicit EndpointTable(Refusals refusals) : _refusals(refusals) {}
 
-  /// `path` ("/events") and everything below it; the longest path wins. The endpoint must outlive the table.
+  /// Adds `path` ("/events") and everything below it. The longest matching path wins. The endpoint must
+  /// outlive the table.
   void add(std::string path, Endpoint& endpoint) { _endpoints.emplace_back(std::move(path), &endpoint); }
 
   HTTPAnswer answer(const HTTPReceived& received) const;

@@ -10,7 +10,7 @@ namespace vesk {
 
 namespace {
 
-/// The reason for refusing a request; does not leave this file.
+/// The reason for refusing a request. Used only in this file.
 struct Refusal : std::runtime_error {
   using std::runtime_error::runtime_error;
 };
@@ -52,7 +52,7 @@ void checkEventMap(const HTTPReceived& received, std::size_t events) {
     throw Refusal("X-Vesk-Event-Map stands on a post of " + std::to_string(events) + " events");
 }
 
-/// No JSON can carry what is too large for a double, so it could be neither saved nor shown.
+/// JSON can't represent a number beyond the range of a double, so it could be neither saved nor shown.
 bool isTooLarge(const Value& value) {
   const double* number = value.real();
   return number != nullptr && !std::isfinite(*number);

@@ -12,17 +12,17 @@ namespace vesk {
 struct EventPost {
   double postTime = 0;  ///< seconds since 1970
   std::string clientId;
-  List events;               ///< at least one; each a flat dictionary of texts, numbers and booleans
-  std::size_t jsonSize = 0;  ///< bytes of the body once unpacked
+  List events;               ///< at least one; each a flat dictionary of text, numbers and booleans
+  std::size_t jsonSize = 0;  ///< bytes of the decompressed body
 };
 
-/// The post, or why the request is none.
+/// The post, or what is wrong with the request.
 struct EventPostOutcome {
   std::optional<EventPost> post;
   std::string problem;
 };
 
-/// Checks everything that the protocol says of a post: headers, encoding and the shape of the JSON body.
+/// Checks all of the protocol's requirements: headers, encoding and the shape of the JSON body.
 EventPostOutcome readEventPost(const HTTPReceived& received);
 
 }  // namespace vesk

@@ -1,4 +1,4 @@
-// Events as text: for a person, and as JSON lines.
+// Formats events as readable text and as JSON lines.
 #pragma once
 
 #include <string>
@@ -9,11 +9,11 @@
 
 namespace vesk {
 
-/// The post on one line, its X-Vesk headers, then each event with its entries; without the last line feed and
-/// with no control character but line feeds.
+/// One line for the post, then its X-Vesk headers, then each event with its entries. No final line feed, and
+/// no other control characters than line feeds.
 std::string readableText(const EventPost& post, const HTTPReceived& received, WallTime now);
 
-/// One line an event, each with its line feed: a JSON object of "received" (seconds since 1970), "peer",
+/// One line per event, with its line feed: a JSON object with "received" (seconds since 1970), "peer",
 /// "path", "headers", "postTime", "clientId" and "event".
 std::string jsonLines(const EventPost& post, const HTTPReceived& received, WallTime now);
 

@@ -17,8 +17,8 @@ HTTPAnswer EventsEndpoint::serve(const HTTPReceived& received, const CollectorFa
   if (!outcome.post) return _refuse(received, 400, outcome.problem);
   HTTPAnswer answer;
   if (!record(*outcome.post, received)) {
-    // The sender keeps what was not answered and sends it again; after a 4xx it would drop it, and after a
-    // 5xx stop.
+    // The sender keeps an unanswered post and sends it again. After a 4xx it would drop the post, and after a
+    // 5xx it would stop posting.
     answer.fault = HTTPAnswer::Fault::CloseWithoutAnswer;
     return answer;
   }

@@ -1,4 +1,4 @@
-// Takes posts of events.
+// Receives posts of events.
 #pragma once
 
 #include <filesystem>
@@ -9,10 +9,10 @@
 
 namespace vesk {
 
-/// Appends every event of a good post to a file of JSON lines (opened for every post, so that it may be moved
-/// away), shows it on the console and answers 200. Where the file can't be written, the connection is closed
-/// without an answer and the post has not been taken. What is no post is refused with 400 or 405. A post that
-/// meets a fault which comes instead of the answer is neither shown nor saved.
+/// Appends every event of a valid post to a file of JSON lines, shows it on the console and answers 200.
+/// Opens the file for each post, so that it may be moved away. If the file can't be written, closes the
+/// connection without an answer and does not accept the post. Refuses invalid posts with 400 or 405. A post
+/// hit by a fault that replaces the answer is neither shown nor saved.
 class EventsEndpoint : public FaultyEndpoint {
  public:
   EventsEndpoint(const CollectorServices& services, std::filesystem::path file,
@@ -20,7 +20,7 @@ class EventsEndpoint : public FaultyEndpoint {
 
  private:
   HTTPAnswer serve(const HTTPReceived& received, const CollectorFault* fault) override;
-  /// False when the events could not be saved.
+  /// Returns false if the events could not be saved.
   bool record(const EventPost& post, const HTTPReceived& received);
 
   const std::filesystem::path _file;

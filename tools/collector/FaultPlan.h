@@ -1,4 +1,4 @@
-// Faults on demand: which request is to be answered how badly.
+// Injected faults: which requests get which bad answer.
 #pragma once
 
 #include <array>
@@ -14,52 +14,52 @@
 namespace vesk {
 
 enum class FaultTarget : unsigned char { Post, Storebag, Upload, LogData };
-/// In the order of the targets.
+/// In the order of FaultTarget.
 inline constexpr std::array<std::string_view, 4> kFaultTargetNames{"post", "storebag", "upload", "logdata"};
 
 struct CollectorFault {
   enum class Kind : unsigned char {
-    Answer,        ///< `status` and a line of text
-    EmptyBody,     ///< as without the fault, but nothing in the body
-    BadSignature,  ///< storebags only: signed over other bytes
-    Transport,     ///< as `transport` says
+    Answer,        ///< `status` with a line of text
+    EmptyBody,     ///< the normal answer with an empty body
+    BadSignature,  ///< storebags only: a signature over other bytes
+    Transport,     ///< a fault of the connection, given by `transport`
   };
   Kind kind = Kind::Answer;
   unsigned status = 0;
   HTTPAnswer::Fault transport = HTTPAnswer::Fault::None;
 
-  /// The server did its work and only the answer suffers: events of such a post have been taken.
+  /// True if only the answer is affected: the events of such a post are accepted.
   bool isOnlyInTheAnswer() const;
-  /// Turns the good answer into the bad one (BadSignature: leaves it, the storebag was signed badly already).
+  /// Turns the good answer into the bad one. Does nothing for BadSignature, which was applied while signing.
   void applyTo(HTTPAnswer& answer) const;
 };
 
-/// The faults still to come, per target in the order in which they were added. Thread-safe.
+/// The pending faults of each target, in the order in which they were added. Thread-safe.
 class FaultPlan {
  public:
-  /// Adds one fault written as "target=fault" or "target=fault*times", where target is one of
-  /// `kFaultTargetNames` and fault a status ("503", "answer=503") or one of the names that `faultNames`
-  /// lists. Without "*times" it stays until another is added; "target=none" forgets that target's. What is
-  /// wrong with the text comes back.
+  /// Adds a fault written as "target=fault" or "target=fault*times". The target is one of
+  /// `kFaultTargetNames`; the fault is a status ("503", "answer=503") or a name listed by `faultNames`.
+  /// Without "*times" the fault stays until another is added. "target=none" removes the target's faults.
+  /// Returns an error message if the text is invalid.
   [[nodiscard]] std::optional<std::string> add(std::string_view text);
   void clear();
 
-  /// The fault for the next request, which counts as used.
+  /// Removes and returns the fault for the next request.
   std::optional<CollectorFault> take(FaultTarget target);
 
-  /// One text a fault still to come, as for `add`.
+  /// The pending faults, each in the form that `add` accepts.
   std::vector<std::string> describe() const;
 
-  /// "post=FAULT, storebag=FAULT, … or …", for help and messages.
+  /// "post=FAULT, storebag=FAULT, … or …", for help and error messages.
   static std::string forms();
-  /// "500, stall, reset, …", likewise.
+  /// "500, stall, reset, …", for help and error messages.
   static std::string faultNames();
 
  private:
   struct Planned {
     CollectorFault fault;
     std::string name;
-    std::optional<unsigned> times;  // none: until another is added
+    std::optional<unsigned> times;  // nullopt: until another is added
   };
 
   mutable Mutex _mutex;

@@ -8,7 +8,7 @@ HTTPAnswer FaultyEndpoint::answer(const HTTPReceived& received) {
   HTTPAnswer answer;
   if (fault->isOnlyInTheAnswer()) {
     answer = serve(received, &*fault);
-    // Nothing has been taken, so no fault may turn this into a good answer.
+    // The request was not accepted, so no fault may turn this into a good answer.
     if (answer.fault != HTTPAnswer::Fault::None) return answer;
   }
   ++_stats.faults;

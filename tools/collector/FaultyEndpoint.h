@@ -1,4 +1,4 @@
-// What the endpoints that answer badly on demand have in common.
+// The base of endpoints that give bad answers on request.
 #pragma once
 
 #include "tools/collector/Endpoint.h"
@@ -6,18 +6,18 @@
 
 namespace vesk {
 
-/// What the endpoints share; it outlives them.
+/// What the endpoints share. Outlives them.
 struct CollectorServices {
   Console& console;
   CollectorStats& stats;
   FaultPlan& faults;
 };
 
-/// Makes answers bad where a fault on demand says so, and tells it on the console.
+/// Applies the planned faults to the answers and reports them on the console.
 class FaultyEndpoint : public Endpoint {
  public:
-  /// What `serve` gives, with the fault that is due, if any. `serve` is not called when the fault comes
-  /// instead of the answer.
+  /// Returns the result of `serve` with the next planned fault applied. Doesn't call `serve` if the fault
+  /// replaces the answer.
   HTTPAnswer answer(const HTTPReceived& received) final;
 
  protected:
@@ -28,7 +28,7 @@ class FaultyEndpoint : public Endpoint {
         _faults(services.faults),
         _target(target) {}
 
-  /// The good answer. `fault` is what becomes of it afterwards, or null.
+  /// Returns the good answer. `fault` is what will be applied to it, or null.
   virtual HTTPAnswer serve(const HTTPReceived& received, const CollectorFault* fault) = 0;
 
   Console& _console;

@@ -28,7 +28,7 @@ constexpr std::chrono::seconds kIdleTimeout{300};   // between requests, and for
 constexpr std::chrono::seconds kBodyTimeout{120};   // for a request's body, and for writing an answer
 constexpr std::chrono::seconds kGoodbyeTimeout{2};  // for the peer to read the last answer and close
 constexpr std::uint32_t kMaximumHead = 64 * 1024;   // bytes
-constexpr std::size_t kMaximumDrain = 256UL << 20;  // bytes read and forgotten after a refusal
+constexpr std::size_t kMaximumDrain = 256UL << 20;  // bytes read and discarded after a refusal
 constexpr std::size_t kSlowPieces = 10;
 constexpr std::string_view kGarbage = "\x16\x03\x03 this is no HTTP \xff\xfe\r\n\r\n";
 
@@ -84,7 +84,7 @@ class StreamConnection final : public HTTPConnection,
   }
 
  private:
-  /// A completion that keeps the connection alive and does nothing once it has ended.
+  /// Wraps a completion handler: it keeps the connection alive and is skipped once the connection has ended.
   template <class... Arguments>
   auto bound(void (StreamConnection::*method)(ErrorCode, Arguments...)) {
     return [self = this->shared_from_this(), method](ErrorCode error, Arguments... arguments) {
@@ -273,7 +273,8 @@ class StreamConnection final : public HTTPConnection,
 
   // --- Ending ---
 
-  /// The peer learns of the end first, so that nothing it still reads is lost to a reset.
+  /// Ends the stream and waits for the peer to close, so that no reset discards data that the peer has yet to
+  /// read.
   void sayGoodbye() {
     tcp().expires_after(kGoodbyeTimeout);
     if constexpr (kTLS) {
@@ -286,7 +287,7 @@ class StreamConnection final : public HTTPConnection,
   }
   void onShutdown(ErrorCode) { close(); }
 
-  /// The peer of a refused request may still be sending it and reads the answer only afterwards.
+  /// The peer of a refused request may still be sending it, and reads the answer only afterwards.
   void onRefusalSent(ErrorCode error, std::size_t) {
     if (error) return close();
     tcp().expires_after(kGoodbyeTimeout);
@@ -317,8 +318,8 @@ class StreamConnection final : public HTTPConnection,
   bool _keepAlive = false;
   bool _isHead = false;
   std::string _out;         // what is being written
-  std::size_t _sent = 0;    // bytes of a slow body
-  std::uint64_t _left = 0;  // bytes of a huge body
+  std::size_t _sent = 0;    // bytes sent of a slow body
+  std::uint64_t _left = 0;  // bytes left of a huge body
 
   std::array<char, 16 * 1024> _scratch;
   std::size_t _drained = 0;

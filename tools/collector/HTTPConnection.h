@@ -11,17 +11,17 @@
 
 namespace vesk {
 
-/// Reads requests and writes answers until either end closes. Everything runs on the server's one thread.
+/// Reads requests and writes answers until either end closes. Runs on the server's thread.
 class HTTPConnection {
  public:
-  /// The server, as its connections see it; outlives them.
+  /// The server's interface for its connections. Outlives them.
   class Owner {
    public:
     virtual ~Owner() = default;
-    /// Never throws.
+    /// Must not throw.
     virtual HTTPAnswer answerTo(const HTTPReceived& received) noexcept = 0;
     virtual void connectionRefused(const std::string& line) noexcept = 0;
-    /// The last call; the owner lets go of the connection.
+    /// The connection's last call; the owner drops its reference.
     virtual void connectionEnded(const std::shared_ptr<HTTPConnection>& connection) noexcept = 0;
   };
 
@@ -36,9 +36,9 @@ class HTTPConnection {
   virtual ~HTTPConnection() = default;
 
   virtual void start() = 0;
-  /// Sends the answer that is held, if there is one.
+  /// Sends the held answer, if any.
   virtual void release() = 0;
-  /// Ends the connection; what is under way is cancelled.
+  /// Ends the connection and cancels pending operations.
   virtual void close() = 0;
 };
 

@@ -3,7 +3,7 @@
 namespace vesk {
 
 namespace {
-// The program never sets a locale, so that names of days and months are English.
+// Names of days and months are English because the program never sets a locale.
 constexpr char kFormat[] = "%a, %d %b %Y %H:%M:%S GMT";
 }  // namespace
 

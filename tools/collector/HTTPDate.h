@@ -1,4 +1,4 @@
-// Points in time as HTTP headers write them.
+// Dates in the format of HTTP headers.
 #pragma once
 
 #include <ctime>
@@ -11,7 +11,7 @@ namespace vesk {
 /// "Tue, 24 Nov 2026 20:31:29 GMT".
 std::string httpDate(std::time_t time);
 
-/// Reads that form only; nothing for any other text.
+/// Parses that format only; nullopt for any other text.
 std::optional<std::time_t> timeFromHTTPDate(std::string_view text);
 
 }  // namespace vesk

@@ -39,7 +39,7 @@ std::string_view reasonOf(unsigned status) {
   return found == kReasons.end() ? "Status" : found->text;
 }
 
-/// Inflates one gzip member that must fill all of `compressed`.
+/// Inflates a single gzip member, which must span all of `compressed`.
 class Inflater {
  public:
   Inflater() {

@@ -77,7 +77,7 @@ class HTTPServer::Core : public HTTPConnection::Owner {
     try {
       if (_options.onRefused) _options.onRefused(line);
     } catch (const std::exception&) {
-      // Nobody is left to be told.
+      // There is nowhere to report this.
     }
   }
 
@@ -107,7 +107,7 @@ class HTTPServer::Core : public HTTPConnection::Owner {
       _acceptor.listen();
       _port = _acceptor.local_endpoint().port();
     } catch (const boost::system::system_error& error) {
-      // what() would name a source file of the library.
+      // what() would contain the name of one of the library's source files.
       const std::string port = "port " + std::to_string(_options.port);
       throw std::runtime_error("can't listen on " + _options.address +
                                (error.code() == asio::error::address_in_use
@@ -125,8 +125,8 @@ class HTTPServer::Core : public HTTPConnection::Owner {
     });
   }
 
-  /// Out of descriptors, most likely: the listening socket stays readable, so asking again at once would
-  /// spin.
+  /// Accepting fails mostly for lack of descriptors. The listening socket stays readable then, so an
+  /// immediate retry would spin.
   void acceptLater() {
     _again.expires_after(std::chrono::milliseconds(100));
     _again.async_wait([this](ErrorCode error) {
@@ -163,7 +163,7 @@ class HTTPServer::Core : public HTTPConnection::Owner {
   std::atomic<std::size_t> _accepted = 0;
   std::atomic<std::size_t> _open = 0;
 
-  // Only on `_thread`, once it runs.
+  // Only used on `_thread` once it runs.
   asio::io_context _context{1};
   tcp::acceptor _acceptor;
   asio::steady_timer _again;

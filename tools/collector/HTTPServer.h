@@ -1,4 +1,4 @@
-// An HTTP/1.1 server for development and tests: real sockets and TLS, and every kind of bad answer on demand.
+// An HTTP/1.1 server for development and tests, with real sockets, TLS and faults on request.
 #pragma once
 
 #include <cstddef>
@@ -12,51 +12,51 @@
 
 namespace vesk {
 
-/// What a TLS server shows and proves, as PEM texts.
+/// A TLS server's certificate and key, in PEM form.
 struct TLSIdentity {
   std::string certificateChain;  ///< leaf first
   std::string privateKey;
 };
 
-/// Listens from construction to `stop`. Requests on one connection are answered in their order; connections
-/// are kept alive.
+/// Listens from construction to `stop`. Answers the requests of a connection in order and keeps connections
+/// alive.
 class HTTPServer {
  public:
   struct Options {
     std::string address = "127.0.0.1";                ///< numeric
-    std::uint16_t port = 0;                           ///< 0: any free one
-    std::optional<TLSIdentity> tls{};                 ///< HTTPS when set
-    std::size_t maximumBody = std::size_t{64} << 20;  ///< bytes; a longer one is answered with 413
+    std::uint16_t port = 0;                           ///< 0: any free port
+    std::optional<TLSIdentity> tls{};                 ///< HTTPS if set
+    std::size_t maximumBody = std::size_t{64} << 20;  ///< bytes; longer bodies are answered with 413
     std::size_t maximumConnections = 1024;            ///< further ones are closed at once
-    /// Told, on the server's thread, in one line what arrived that never reached the handler: no HTTP, no
-    /// TLS, too large.
+    /// Called on the server's thread with one line about input that never reached the handler: not HTTP, not
+    /// TLS, or too large.
     std::function<void(const std::string& line)> onRefused{};
   };
 
-  /// Called on the server's thread, one request at a time; must not block (that is what `Fault::Hold` is
-  /// for). What it throws becomes a 500.
+  /// Called on the server's thread, one request at a time. Must not block (use `Fault::Hold` instead).
+  /// Exceptions become a 500.
   using Handler = std::function<HTTPAnswer(const HTTPReceived&)>;
 
-  /// Listens, then starts the thread. Throws std::runtime_error with a clear message when the address can't
-  /// be bound or the identity can't be used. An address whose previous server has just stopped can be bound.
+  /// Listens, then starts the thread. Throws std::runtime_error with a clear message if the address can't be
+  /// bound or the identity can't be used. Can bind an address whose previous server has just stopped.
   HTTPServer(Options options, Handler handler);
   ~HTTPServer();
   HTTPServer(const HTTPServer&) = delete;
   HTTPServer& operator=(const HTTPServer&) = delete;
 
-  /// The port that it listens (or listened) on.
+  /// The port, also after `stop`.
   std::uint16_t port() const;
-  /// "https://localhost:4711", without a trailing slash; plain HTTP: "http://127.0.0.1:4711".
+  /// Without a trailing slash: "https://localhost:4711", or "http://127.0.0.1:4711" for plain HTTP.
   std::string baseURL() const;
 
-  /// Sends every answer that is held at this moment. Any thread.
+  /// Sends all answers that are currently held. Thread-safe.
   void releaseHeld();
-  /// Closes all connections, stalled ones too, and ends the thread: the handler does not run any more once
-  /// this has returned. May be called twice; not from the handler.
+  /// Closes all connections, including stalled ones, and ends the thread. The handler is not called after
+  /// this returns. May be called twice, but not from the handler.
   void stop();
 
   std::size_t connectionsAccepted() const;
-  /// Those open at this moment.
+  /// The number of currently open connections.
   std::size_t connectionsOpen() const;
 
  private:

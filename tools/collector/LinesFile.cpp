@@ -13,7 +13,7 @@ namespace vesk {
 int appendLines(const std::filesystem::path& path, std::string_view lines) {
   FileDescriptor file(::open(path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0644));
   if (!file) return errno;
-  // Others append to the file, too, and must not do so before a torn line is gone again.
+  // Others also append to the file. They must not write before a torn line is removed.
   ::flock(file.get(), LOCK_EX);
   ssize_t written = ::write(file.get(), lines.data(), lines.size());
   if (written < 0) return errno;

@@ -1,4 +1,4 @@
-// Files to which the collector adds lines.
+// Files to which the collector appends lines.
 #pragma once
 
 #include <filesystem>
@@ -6,8 +6,8 @@
 
 namespace vesk {
 
-/// Appends whole lines in one write, so that those of several threads do not mix: all of them, or none. The
-/// file is opened each time, so that it may be moved away. 0, or the system's error number.
+/// Appends all lines in one write or none of them, so that lines of different threads don't mix. Opens the
+/// file each time, so that it may be moved away. Returns 0 or the error number.
 [[nodiscard]] int appendLines(const std::filesystem::path& file, std::string_view lines);
 
 }  // namespace vesk

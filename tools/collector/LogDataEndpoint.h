@@ -1,4 +1,4 @@
-// Takes uploads of log data.
+// Receives uploads of log data.
 #pragma once
 
 #include <filesystem>
@@ -8,11 +8,11 @@
 
 namespace vesk {
 
-/// Stores each keyed archive that is posted as a file of its own and answers with the file's path, which is
-/// what the sender announces as location. Anything else is refused with 400 or 405.
+/// Stores each posted keyed archive in a file of its own and answers with the file's path, which the sender
+/// reports as location. Refuses anything else with 400 or 405.
 class LogDataEndpoint : public FaultyEndpoint {
  public:
-  /// `directory` is made when the first upload arrives.
+  /// `directory` is created with the first upload.
   LogDataEndpoint(const CollectorServices& services, std::filesystem::path directory);
 
  private:

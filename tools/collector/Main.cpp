@@ -1,4 +1,4 @@
-// veskcollector: arguments, start, and the wait for the signal to end.
+// veskcollector: parses arguments, starts the collector and waits for the signal to end.
 #include <fcntl.h>
 #include <signal.h>
 #include <unistd.h>
@@ -29,10 +29,11 @@ struct Arguments {
   bool lenient = false;
   double loss = 0;
   std::uint32_t lossSeed = 1;
-  std::string archive;  // to be shown
+  std::string archive;  // archive to show
 };
 
-/// A descriptor that the parent left closed would be given to the next file, and lines for people go there.
+/// Opens standard descriptors that the parent left closed. Otherwise the next opened file would get one of
+/// them and receive the program's output.
 void occupyStandardDescriptors() {
   for (int descriptor : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO})
     if (::fcntl(descriptor, F_GETFD) < 0) ::open("/dev/null", O_RDWR);

@@ -1,4 +1,4 @@
-// Files that are saved as they arrive.
+// Saves received files.
 #pragma once
 
 #include <atomic>
@@ -9,10 +9,10 @@
 
 namespace vesk {
 
-/// Saves files in one directory, each under a number that no file there had before. Thread-safe.
+/// Saves files in one directory, each under a number that is not used there yet. Thread-safe.
 class NumberedFiles {
  public:
-  /// `directory` is made when the first file is saved.
+  /// `directory` is created with the first file.
   explicit NumberedFiles(std::filesystem::path directory) : _directory(std::move(directory)) {}
 
   /// Saves `bytes` under the next number, followed by `ending`, and returns the path. Throws

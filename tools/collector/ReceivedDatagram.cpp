@@ -11,7 +11,7 @@ namespace {
 
 constexpr std::size_t kShownOfAPayload = 1200;  // bytes
 
-/// The next equals sign that is not behind an odd number of backslashes.
+/// Finds the next equals sign that is not escaped, that is, not preceded by an odd number of backslashes.
 std::size_t findPlainEquals(std::string_view text, std::size_t from) {
   bool isEscaped = false;
   for (std::size_t i = from; i < text.size(); ++i) {
@@ -30,7 +30,7 @@ std::string withoutEscapes(std::string_view value) {
   return plain;
 }
 
-/// " a=y b=xx": a key reaches from the last space to its equals sign; the first one from the start.
+/// " a=y b=xx": a key extends from the last space before its equals sign; the first key from the start.
 Dictionary payloadFrom(std::string_view text) {
   MutableDictionary payload;
   std::size_t keyStart = 1;
@@ -41,7 +41,7 @@ Dictionary payloadFrom(std::string_view text) {
     while (next != std::string_view::npos) {
       end = text.rfind(' ', next);
       if (end != std::string_view::npos && end > equals) break;
-      next = findPlainEquals(text, next + 1);  // of a key that has one itself
+      next = findPlainEquals(text, next + 1);  // this equals sign is part of the key
       end = text.size();
     }
     keyStart = std::min(keyStart, equals);

@@ -1,4 +1,4 @@
-// Datagrams of dashboards as text: for a person, and as JSON lines.
+// Formats datagrams of dashboards as readable text and as JSON lines.
 #pragma once
 
 #include <optional>
@@ -11,30 +11,29 @@
 
 namespace vesk {
 
-/// One datagram as it arrived.
+/// One received datagram.
 struct ReceivedDatagram {
   DashboardHeader header;
-  Dictionary payload;  ///< texts without their escapes
+  Dictionary payload;  ///< unescaped text
   std::string peer;    ///< "127.0.0.1:40312"
   WallTime received;
-  bool isCut = false;    ///< the text fills the datagram, so that something may be missing
-  bool isAgain = false;  ///< to the byte the same has been there before
+  bool isCut = false;    ///< the text fills the datagram, so it may have been cut
+  bool isAgain = false;  ///< an identical datagram has arrived before
 };
 
 struct DatagramOutcome {
   std::optional<ReceivedDatagram> datagram;
-  std::string problem;  ///< why there is none, for a person
+  std::string problem;  ///< readable reason if there is no datagram
 };
 
-/// Decodes header and text. Keys travel without escapes, so that one with an equals sign or a space in it can
-/// be taken for something else; nothing that arrives makes this fail but a header that is none, and
-/// a length that no datagram has.
+/// Decodes header and text. Keys are not escaped, so a key with an equals sign or a space may be misread.
+/// Fails only for an invalid header or length.
 DatagramOutcome readDashboardDatagram(std::string_view bytes);
 
-/// One line, without line feed and control characters.
+/// One line without control characters and line feed.
 std::string readableText(const ReceivedDatagram& datagram);
-/// A JSON object of "received", "sent", "peer", "again", "cut", "reliable", "device", "sender", "clientType",
-/// "clientVersion", "sessionID", "eventID", "method", "status" and "payload", with its line feed.
+/// A JSON object with its line feed: "received", "sent", "peer", "again", "cut", "reliable", "device",
+/// "sender", "clientType", "clientVersion", "sessionID", "eventID", "method", "status" and "payload".
 std::string jsonLine(const ReceivedDatagram& datagram);
 
 }  // namespace vesk

@@ -1,4 +1,4 @@
-// Serves a folder of storebags, signed on the fly.
+// Serves a folder of storebags, signing each one when it is requested.
 #pragma once
 
 #include <chrono>
@@ -10,12 +10,12 @@
 
 namespace vesk {
 
-/// Answers GET with the storebag that the last part of the path names, or with 304 and no body when
-/// If-Modified-Since names its date or a later one. A source with mistakes is answered with 500 and told on
-/// the console.
+/// Answers GET with the storebag named by the last component of the path, or with 304 and no body if
+/// If-Modified-Since is the storebag's date or later. A source with mistakes gives a 500 and a line on the
+/// console.
 class StorebagEndpoint : public FaultyEndpoint {
  public:
-  /// `maximumAge`: sent as "Cache-Control: max-age=…" when set.
+  /// `maximumAge`: sent as "Cache-Control: max-age=…" if set.
   StorebagEndpoint(const CollectorServices& services, StorebagFolder& folder, const SigningKey& key,
                    std::optional<std::chrono::seconds> maximumAge);
 

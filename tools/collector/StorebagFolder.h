@@ -1,4 +1,4 @@
-// A folder of readable storebag sources, with a Last-Modified date for each.
+// A folder of storebag sources, with a Last-Modified date for each.
 #pragma once
 
 #include <sys/stat.h>
@@ -15,7 +15,7 @@
 
 namespace vesk {
 
-/// Reads `<name>.toml` or else `<name>.json` afresh for each request. Thread-safe.
+/// Reads `<name>.toml`, or `<name>.json` if that doesn't exist, for each request. Thread-safe.
 class StorebagFolder {
  public:
   StorebagFolder(std::filesystem::path directory, StorebagChecks checks)
@@ -23,12 +23,12 @@ class StorebagFolder {
 
   struct Found {
     std::filesystem::path file;
-    /// The file's date, moved on by a second when the file changed within one: two versions never share a
-    /// date.
+    /// The file's date, advanced by a second if the file changed twice within one, so that two versions never
+    /// share a date.
     std::time_t lastModified = 0;
-    bool isNew = false;  ///< the first look at this version of the file
+    bool isNew = false;  ///< this version of the file has not been seen before
   };
-  /// Nothing when there is no such storebag, also for a name that would lead out of the folder.
+  /// Returns nullopt if there is no such storebag or the name would lead out of the folder.
   std::optional<Found> find(std::string_view name);
 
   /// Throws std::runtime_error with a message that names the file and the key.

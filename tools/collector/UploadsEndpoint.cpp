@@ -11,7 +11,7 @@ namespace {
 constexpr std::size_t kLongestName = 200;
 constexpr std::size_t kMaximumContents = std::size_t{1} << 30;
 
-/// The name that the query gives, made fit for a file in a directory of ours; empty when it gives none.
+/// The name from the query, sanitised for use in our directory; empty if there is none.
 std::string nameIn(const HTTPReceived& received) {
   std::string name = percentDecoded(received.query("filename").value_or("")).value_or("");
   for (char& c : name) {

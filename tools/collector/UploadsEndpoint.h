@@ -1,4 +1,4 @@
-// Takes uploaded files.
+// Receives uploaded files.
 #pragma once
 
 #include <filesystem>
@@ -9,13 +9,13 @@
 
 namespace vesk {
 
-/// Saves the body of every good upload as it came, compressed, under a number and the name that the query
-/// gives, tells so on the console and answers with a fixed text. What is no upload is refused with 400 or
-/// 405. An upload that meets a fault which comes instead of the answer has not been taken.
+/// Saves the body of every valid upload unchanged (compressed), under a number and the name given in the
+/// query, reports it on the console and answers with a fixed text. Refuses anything else with 400 or 405. An
+/// upload hit by a fault that replaces the answer is not accepted.
 class UploadsEndpoint : public FaultyEndpoint {
  public:
-  /// Bytes of a body that the servers must let through: the largest file that is uploaded, were it not
-  /// compressible at all.
+  /// Size in bytes of a body that the servers must accept: the largest file that may be uploaded, assuming
+  /// that it is incompressible.
   static constexpr std::size_t kMaximumBody = std::size_t{260} << 20;
 
   UploadsEndpoint(const CollectorServices& services, std::filesystem::path directory, std::string goodAnswer);

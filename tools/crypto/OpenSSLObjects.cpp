@@ -24,7 +24,7 @@ Memory reading(const std::string& text) {
   return checked(Memory(BIO_new_mem_buf(text.data(), static_cast<int>(text.size()))), "allocate memory");
 }
 
-/// Keeps a person from being asked for the password of an encrypted key, and a service from waiting for one.
+/// Refuses encrypted keys, for which OpenSSL would otherwise ask for a password.
 int noPassword(char*, int, int, void*) { return -1; }
 
 }  // namespace

@@ -1,4 +1,4 @@
-// Owners of the OpenSSL objects that the tools use, and their PEM texts. For sources only.
+// Owners of the OpenSSL objects that the tools use, and conversions from and to PEM. Include in sources only.
 #pragma once
 
 #include <openssl/bio.h>
@@ -39,7 +39,7 @@ Pointer checked(Pointer pointer, const char* step) {
 
 std::string toPEM(X509* certificate);
 std::string toPEM(EVP_PKEY* privateKey);
-/// Null when the text holds none.
+/// Null if the text contains none.
 Certificate certificateFromPEM(const std::string& text);
 Key privateKeyFromPEM(const std::string& text);
 

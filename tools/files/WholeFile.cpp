@@ -21,7 +21,7 @@ namespace {
   throw std::runtime_error("can't write " + path.string() + ": " + std::strerror(error));
 }
 
-/// A new file beside `path`, removed unless it was renamed to it.
+/// A new file beside `path`, removed unless it was renamed to `path`.
 class Replacement {
  public:
   explicit Replacement(const std::filesystem::path& path) : _path(path) {

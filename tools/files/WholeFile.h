@@ -1,4 +1,4 @@
-// Files that tools read and write as a whole.
+// Reads and writes whole files.
 #pragma once
 
 #include <sys/types.h>
@@ -10,13 +10,12 @@
 
 namespace vesk {
 
-/// The contents of a regular file of at most `limit` bytes. Throws std::runtime_error with a message that
-/// names the file and the cause.
+/// Returns the contents of a regular file of at most `limit` bytes. Throws std::runtime_error with a message
+/// that names the file and the cause.
 std::string readWholeFile(const std::filesystem::path& path, std::size_t limit = std::size_t{16} << 20);
 
-/// Replaces the file in one step: a reader sees the old contents or the new, and a failure leaves the old.
-/// The new file has exactly `mode`. Throws std::runtime_error with a message that names the file and the
-/// cause.
+/// Replaces the file atomically: readers see the old or the new contents, and a failure keeps the old. The
+/// new file has exactly `mode`. Throws std::runtime_error with a message that names the file and the cause.
 void writeWholeFile(const std::filesystem::path& path, std::string_view contents, mode_t mode);
 
 }  // namespace vesk

@@ -50,7 +50,7 @@ Value valueFrom(const json::value& read) {
 std::string located(std::string_view text, std::size_t offset, const std::string& words) {
   std::string_view before = text.substr(0, offset);
   auto line = std::count(before.begin(), before.end(), '\n') + 1;
-  auto column = offset - (before.rfind('\n') + 1) + 1;  // npos + 1 is the start of the text
+  auto column = offset - (before.rfind('\n') + 1) + 1;  // npos + 1 is 0, the start of the text
   return "line " + std::to_string(line) + ", column " + std::to_string(column) + ": " + words;
 }
 

@@ -1,4 +1,4 @@
-// Reading JSON, for the tools.
+// A JSON reader for the tools.
 #pragma once
 
 #include <cstddef>
@@ -10,15 +10,15 @@
 
 namespace vesk {
 
-/// A value, or what is wrong with the text (with line and column).
+/// A value, or an error with line and column.
 struct JSONOutcome {
   std::optional<Value> value;
   std::string error;
 };
 
-/// Reads one JSON value and nothing else but white space; arrays and objects may nest `depth` deep. Integers
-/// become signed ones where they fit, null becomes the null marker; objects keep their order, and a key that
-/// is repeated has its last value. Never throws on anything in `text`.
+/// Reads a single JSON value with optional white space around it. Arrays and objects may nest `depth` deep.
+/// Integers become signed if they fit; null becomes the null marker. Objects keep their order, and the last
+/// value of a repeated key wins. Doesn't throw for any `text`.
 JSONOutcome parseJSON(std::string_view text, std::size_t depth = 32);
 
 }  // namespace vesk

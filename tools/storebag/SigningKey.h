@@ -8,16 +8,16 @@
 
 namespace vesk {
 
-/// An RSA private key. Immutable, so that any thread may sign. Whatever fails throws std::runtime_error with
-/// a message that names the file or the step.
+/// An RSA private key. Immutable; thread-safe. Failures throw std::runtime_error with a message that names
+/// the file or the step.
 class SigningKey {
  public:
-  /// A new key of 2048 bits.
+  /// Creates a key of 2048 bits.
   static SigningKey generate();
   static SigningKey fromPEM(const std::string& pem);
   /// Reads the PEM file at `path`.
   static SigningKey fromFile(const std::filesystem::path& path);
-  /// The key in `directory`, made there when neither of its files exists.
+  /// Opens the key in `directory`, or creates it there if neither of its files exists.
   static SigningKey openOrCreate(const std::filesystem::path& directory);
 
   static std::filesystem::path privateKeyFile(const std::filesystem::path& directory) {
@@ -27,12 +27,12 @@ class SigningKey {
     return directory / "publicKey.der";
   }
 
-  /// Writes the two files (the private one with mode 0600), and makes the directory when it is missing.
+  /// Writes the two files (the private one with mode 0600) and creates the directory if it is missing.
   /// Refuses to replace either file.
   void save(const std::filesystem::path& directory) const;
 
   std::string privateKeyPEM() const;
-  /// The SubjectPublicKeyInfo, which is what the client library's resource "publicKey.der" holds.
+  /// The SubjectPublicKeyInfo in DER form, as in the client library's resource "publicKey.der".
   std::string publicKeyDER() const;
 
   /// The RSASSA-PKCS1-v1_5 signature with SHA-1 over `bytes`.

@@ -10,38 +10,39 @@
 
 namespace vesk {
 
-/// The XML property list with the entries "bag" (the payload, itself an XML property list, as base64) and
-/// "signature". Throws std::runtime_error when the payload holds what a property list can't carry.
+/// Returns an XML property list with the entries "bag" (the payload as a base64-encoded XML property list)
+/// and "signature". Throws std::runtime_error if the payload holds a value that a property list can't
+/// represent.
 std::string signStorebag(const Dictionary& payload, const SigningKey& key);
 
-/// The same with a signature over other bytes, for trying out what a daemon makes of it.
+/// Like `signStorebag`, but with an invalid signature, for testing how a daemon handles it.
 std::string signStorebagBadly(const Dictionary& payload, const SigningKey& key);
 
 enum class StorebagVerdict : unsigned char {
   Valid,
-  NoPropertyList,     ///< the document is no property list with a dictionary at its root
-  SignatureMissing,   ///< there is no text "signature"
-  SignatureNoBase64,  ///< or it decodes to nothing
-  BagMissing,         ///< there is no text "bag"
+  NoPropertyList,     ///< the document is not a property list with a dictionary at its root
+  SignatureMissing,   ///< there is no text under "signature"
+  SignatureNoBase64,  ///< it is not base64, or it is empty
+  BagMissing,         ///< there is no text under "bag"
   BagNoBase64,
-  PublicKeyUnusable,  ///< the key is no RSA public key in DER form
+  PublicKeyUnusable,  ///< the key is not an RSA public key in DER form
   SignatureMismatch,  ///< the signature was made over other bytes or with another key
-  PayloadUnreadable,  ///< signed well, but no property list with a dictionary at its root
+  PayloadUnreadable,  ///< signed correctly, but not a property list with a dictionary at its root
 };
 
-/// A sentence for a person.
+/// A readable sentence about the verdict.
 std::string_view explain(StorebagVerdict verdict);
 
 struct StorebagInspection {
   StorebagVerdict verdict = StorebagVerdict::NoPropertyList;
-  /// What the bag holds, whether or not the signature fits.
+  /// The bag's contents, whether or not the signature is valid.
   std::optional<Dictionary> payload;
 
   bool isValid() const { return verdict == StorebagVerdict::Valid; }
 };
 
-/// Verifies and takes apart a document, with the daemon's own parser and verification. Never throws on
-/// anything in `document` or the key.
+/// Verifies and decodes a document with the daemon's own parser and verification. Doesn't throw for any
+/// `document` or key.
 StorebagInspection inspectStorebag(std::string_view document, std::string_view publicKeyDER);
 
 }  // namespace vesk

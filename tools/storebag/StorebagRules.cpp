@@ -18,7 +18,7 @@ enum class Shape : unsigned char { Text, Number, NumberOrText, Boolean, Texts, D
 struct KeyRule {
   std::string_view key;
   Shape shape;
-  std::string_view withoutIt = {};  ///< what the key's absence means, when it is worth a warning
+  std::string_view withoutIt = {};  // the consequence of a missing key, if it deserves a warning
 };
 
 constexpr std::int64_t kSensibleTick = 50;  // ms, of a dashboard: its server may be 100 ms away

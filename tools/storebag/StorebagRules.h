@@ -1,4 +1,4 @@
-// What a storebag may hold, for those who write one.
+// Checks storebags for their authors.
 #pragma once
 
 #include <string>
@@ -8,10 +8,10 @@
 
 namespace vesk {
 
-/// What was found, each a line that begins with the place ("release.httpPost.clients[0].filters: …").
+/// Each finding is a line that begins with the place ("release.httpPost.clients[0].filters: …").
 struct StorebagFindings {
-  std::vector<std::string> errors;    ///< values of a wrong type: the daemon counts them as absent
-  std::vector<std::string> warnings;  ///< what is probably a mistake, though it is allowed
+  std::vector<std::string> errors;    ///< values of a wrong type, which the daemon treats as absent
+  std::vector<std::string> warnings;  ///< allowed, but probably a mistake
 };
 
 /// Checks the payload of a storebag, with its environment sections, backends and their profiles.

@@ -11,7 +11,7 @@ namespace vesk {
 
 namespace {
 
-constexpr std::size_t kMaximumSize = std::size_t{1} << 20;  // what the daemon accepts of a storebag
+constexpr std::size_t kMaximumSize = std::size_t{1} << 20;  // the daemon's limit for a storebag
 
 Dictionary fromJSON(const std::string& text) {
   JSONOutcome outcome = parseJSON(text);

@@ -1,4 +1,4 @@
-// A storebag as a person writes it: a readable TOML or JSON file.
+// The source of a storebag: a readable TOML or JSON file.
 #pragma once
 
 #include <filesystem>
@@ -9,10 +9,10 @@
 
 namespace vesk {
 
-/// What a value of a wrong type is.
+/// How a value of a wrong type is reported.
 enum class StorebagChecks : unsigned char {
   Strict,  ///< an error
-  Lenient  ///< one more warning: to try out what a daemon makes of it
+  Lenient  ///< a warning, for testing how a daemon handles it
 };
 
 struct StorebagSource {
@@ -20,8 +20,8 @@ struct StorebagSource {
   std::vector<std::string> warnings;  ///< lines that begin with the file's name
 };
 
-/// Reads the file, of at most 1 MiB, by the kind that its name ends in: ".toml" or ".json". Throws
-/// std::runtime_error with a message, possibly of several lines, that names the file and the key or the line.
+/// Reads a file of at most 1 MiB as TOML or JSON, depending on its extension (".toml" or ".json"). Throws
+/// std::runtime_error with a message, possibly of several lines, that names the file and the key or line.
 StorebagSource readStorebagSource(const std::filesystem::path& file,
                                   StorebagChecks checks = StorebagChecks::Strict);
 

@@ -13,7 +13,7 @@ namespace vesk {
 
 namespace {
 
-/// The value with everything that JSON has no form for as text.
+/// The value, with text in place of everything that JSON can't represent.
 Value readable(const Value& value) {
   if (const Bytes* bytes = value.bytes()) return base64Encode(bytes->view());
   if (const double* real = value.real(); real != nullptr && !std::isfinite(*real)) return describe(value);
@@ -30,7 +30,7 @@ Value readable(const Value& value) {
   return value;
 }
 
-/// Cut to whole seconds, as in a property list.
+/// Truncates to whole seconds, as in a property list.
 toml::date_time dateTimeFrom(const Date& date) {
   constexpr double kLastSecond = 253402300799;  // of the year 9999
   double seconds = std::floor(date.secondsSince1970);
@@ -42,7 +42,7 @@ toml::date_time dateTimeFrom(const Date& date) {
                          toml::time(calendar.tm_hour, calendar.tm_min, calendar.tm_sec), toml::time_offset());
 }
 
-/// Where a value goes: under a key of a table, or at the end of an array.
+/// Where to put a value: under a key of a table, or at the end of an array.
 struct Place {
   toml::table* table = nullptr;
   std::string_view key{};

@@ -7,9 +7,9 @@
 
 namespace vesk {
 
-/// What is read back from either form is equal to the payload as far as the form can carry it: bytes become
-/// their base64 text, and in JSON dates become numbers and what is not finite becomes a text. Throws
-/// std::runtime_error when there is no such text.
+/// Reading the text back gives an equal payload as far as the format allows: bytes become base64 text; in
+/// JSON, dates become numbers, and infinities and NaN become text. Throws std::runtime_error if the payload
+/// can't be represented.
 std::string storebagAsJSON(const Dictionary& payload);
 std::string storebagAsTOML(const Dictionary& payload);
 

@@ -14,7 +14,7 @@ void appendCode(std::string& shown, char c) {
   shown += code;
 }
 
-/// U+0080 to U+009F, which terminals obey as they do the first 32.
+/// U+0080 to U+009F, which terminals interpret as control characters like the first 32.
 bool isSecondControlSet(std::string_view text) {
   return text.size() > 1 && text[0] == '\xc2' && static_cast<unsigned char>(text[1]) < 0xa0;
 }

@@ -1,4 +1,4 @@
-// Text from others, made fit to be shown.
+// Makes untrusted text safe to show.
 #pragma once
 
 #include <string>
@@ -6,11 +6,12 @@
 
 namespace vesk {
 
-/// `text` with every control character, and whatever is not UTF-8, shown as \xNN, so that a peer can neither
-/// forge a line nor steer a terminal.
+/// Returns `text` with control characters and invalid UTF-8 as \xNN, so that a peer can neither forge a line
+/// nor control a terminal.
 std::string printable(std::string_view text);
 
-/// JSON carries nothing but UTF-8: where `bytes` are none, "?" stands for each byte above 127.
+/// Returns `bytes` for use in JSON, which must be UTF-8: if they are not valid UTF-8, "?" replaces each byte
+/// above 127.
 std::string printableUTF8(std::string_view bytes);
 
 }  // namespace vesk

@@ -20,7 +20,7 @@ namespace vesk {
 
 namespace {
 
-// "2026-11-24T23:58:25.042Z"; a time that no calendar holds is written as seconds.
+// "2026-11-24T23:58:25.042Z", or seconds for a time outside the calendar's range.
 std::string timeText(double seconds) {
   constexpr double kYear10000 = 253'402'300'800;
   char text[64];
@@ -37,7 +37,7 @@ std::string timeText(double seconds) {
   return text;
 }
 
-// As JSON carries it; what JSON can't carry (bytes, for one) as a description.
+// A JSON value, or a description if JSON can't represent it (for example bytes).
 Value carried(const std::optional<Dictionary>& dictionary) {
   if (!dictionary) return {};
   if (toJSON(*dictionary, JSONStyle::Compact)) return *dictionary;
@@ -49,7 +49,7 @@ std::string words(const std::optional<Dictionary>& dictionary) {
   return printable(toJSON(*dictionary, JSONStyle::Compact).value_or(describe(*dictionary)));
 }
 
-/// Prints on the session's thread and tells the main thread when there is nothing more to wait for.
+/// Prints on the session's thread and tells the main thread when it may stop waiting.
 class Receiver {
  public:
   Receiver(const Output& output, std::uint64_t enough)
@@ -65,11 +65,11 @@ class Receiver {
     }
     print(message);
     ++_received;
-    // Signals do not reach the session's thread, so a reader that has gone shows here only.
+    // Signals do not reach the session's thread, so the error state is the only sign of a closed pipe.
     if (_received == _enough || std::ferror(stdout)) end();
   }
 
-  /// Until now, an interrupt ended the process.
+  /// Until this is called, an interrupt ends the process.
   void waitForTheEnd() {
     sigset_t interrupts;
     sigemptyset(&interrupts);

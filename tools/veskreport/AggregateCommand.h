@@ -1,4 +1,4 @@
-// Shows the messages of a family of sessions as the aggregating client gets them.
+// Shows the messages of a family of sessions, as its aggregating client receives them.
 #pragma once
 
 #include "tools/veskreport/Invocation.h"
@@ -6,8 +6,8 @@
 
 namespace vesk {
 
-/// Runs until the daemon closes the aggregation, as many messages have come as were asked for, or SIGINT or
-/// SIGTERM arrives. Blocks these two for the process. Returns the exit status.
+/// Runs until the daemon closes the aggregation, the requested number of messages has arrived, or SIGINT or
+/// SIGTERM arrives. Blocks these two signals for the process. Returns the exit status.
 int runAggregate(const Invocation& invocation, const Output& output);
 
 }  // namespace vesk

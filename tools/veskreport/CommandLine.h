@@ -8,8 +8,8 @@
 namespace vesk {
 
 struct CommandLine {
-  std::optional<Invocation> invocation;  ///< absent: there is nothing to do but to exit
-  int exitStatus = 0;                    ///< then; help, version or what was wrong have been printed
+  std::optional<Invocation> invocation;  ///< absent if the tool should just exit
+  int exitStatus = 0;                    ///< used then; help, version or error have been printed
 };
 
 CommandLine parseCommandLine(int argc, char** argv);

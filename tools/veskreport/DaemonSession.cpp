@@ -11,7 +11,7 @@ namespace vesk {
 namespace {
 
 std::uint32_t randomSessionID() {
-  // Below 2^31: display URLs show it as a signed number.
+  // Below 2^31 because display URLs show it as a signed number.
   std::uniform_int_distribution<std::uint32_t> anyButNone(1, 0x7fffffff);
   std::random_device device;
   return anyButNone(device);

@@ -11,23 +11,24 @@
 
 namespace vesk {
 
-/// A session under the identity that the command line gives.
+/// A session with the identity from the command line.
 class DaemonSession {
  public:
   DaemonSession(const ClientIdentity& identity, const Output& output);
 
-  /// Each returns kExitDone, or the exit status of a failure that it has reported.
+  /// These return kExitDone, or the exit status of a failure that they have reported.
   [[nodiscard]] int connect();
-  /// Connects, configures and starts; with a handler, as an aggregating client. The handler outlives this.
+  /// Connects, configures and starts the session, as an aggregating client if there is a handler. The handler
+  /// must outlive this object.
   [[nodiscard]] int start(AggregationHandler aggregation = nullptr);
 
   VeskReporting& reporting() { return *_reporting; }
   const Dictionary& sessionInfo() const { return _sessionInfo; }
   const std::optional<Dictionary>& userInfo() const { return _userInfo; }
-  /// The enabled backends, once started.
+  /// The enabled backends; empty before `start`.
   const BackendNames& backends() const { return _backends; }
 
-  /// Reports a call that failed.
+  /// Reports a failed call.
   template <class Answer>
   int failed(const ReportingResult<Answer>& result) const {
     return failed(result.status, result.detail);

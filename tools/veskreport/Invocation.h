@@ -1,4 +1,4 @@
-// What the command line asks for.
+// The parsed command line.
 #pragma once
 
 #include <chrono>
@@ -9,7 +9,7 @@
 
 namespace vesk {
 
-/// How the tool introduces itself to the daemon; for every command that talks to it.
+/// How the tool identifies itself to the daemon, for all commands that use it.
 struct ClientIdentity {
   std::string root;
   std::string socket;
@@ -18,7 +18,7 @@ struct ClientIdentity {
   std::uint32_t sessionID = 0;
   std::string clientName;
   std::string serviceName;
-  std::vector<std::string> userInfo;  ///< further key=text and key:=json pairs
+  std::vector<std::string> userInfo;  ///< other key=text and key:=json pairs
   bool requireUserInfo = false;
   bool batch = false;
   std::chrono::milliseconds timeout{30'000};
@@ -40,14 +40,14 @@ struct UploadArguments {
 };
 
 struct PowerLogArguments {
-  std::string since;  ///< "90m" ago, or a time; empty: from the beginning
+  std::string since;  ///< a time, or an age such as "90m"; empty: from the beginning
 };
 
 struct StorebagArguments {
   std::string directory = ".";  ///< of a new key pair
   std::string privateKey;
   std::string publicKey;
-  std::string source;  ///< readable or signed, as the command needs it
+  std::string source;  ///< source or signed document, depending on the command
   std::string output;
   bool lenient = false;
 };
@@ -76,7 +76,7 @@ struct Invocation {
   UploadArguments upload;
   PowerLogArguments powerLog;
   StorebagArguments storebag;
-  std::uint64_t aggregateCount = 0;  ///< messages to wait for; 0: no end
+  std::uint64_t aggregateCount = 0;  ///< messages to wait for; 0: unlimited
 };
 
 }  // namespace vesk

@@ -43,7 +43,7 @@ std::optional<std::string> LineReader::takeLine() {
   return line;
 }
 
-// False when there is nothing more.
+// Returns false at the end of the input.
 bool LineReader::fill() {
   _buffer.erase(0, _at);
   _at = 0;

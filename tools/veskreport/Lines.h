@@ -1,4 +1,4 @@
-// Standard input, line by line.
+// Reads standard input line by line.
 #pragma once
 
 #include <cstddef>
@@ -8,19 +8,19 @@
 
 namespace vesk {
 
-/// Reads lines of at most 1 MiB from a descriptor, which stays the caller's. Empty lines are skipped.
+/// Reads lines of at most 1 MiB from a descriptor, which it does not own. Skips empty lines.
 class LineReader {
  public:
   explicit LineReader(int descriptor) noexcept : _descriptor(descriptor) {}
 
-  /// The next line without its end; nothing at the end of the input and after an error.
+  /// The next line without its line end; nullopt at the end of the input and after an error.
   std::optional<std::string> next();
 
-  /// Of the line that `next` returned last; the first is 1.
+  /// The number of the line that `next` returned last, starting at 1.
   std::uint64_t number() const noexcept { return _number; }
-  /// Bytes taken so far, for showing progress.
+  /// Bytes read so far, for showing progress.
   std::uint64_t bytes() const noexcept { return _bytes; }
-  /// Empty unless reading failed or a line is too long.
+  /// Empty unless reading failed or a line was too long.
   const std::string& error() const noexcept { return _error; }
 
  private:

@@ -8,7 +8,7 @@ namespace vesk {
 
 namespace {
 
-// Enough to keep the daemon busy; far from what the session's queue holds.
+// Enough to keep the daemon busy, and far below the limit of the session's queue.
 constexpr std::size_t kMaximumUnderway = 256;
 
 }  // namespace
@@ -38,7 +38,7 @@ int MessageStream::run() {
   return finish();
 }
 
-// With category and type from the command line, a line is a payload; else it is a whole message.
+// If the command line gives category and type, the line is a payload, otherwise a whole message.
 Dictionary MessageStream::parametersOf(const std::string& line, std::string& error) const {
   auto parsed = parsePayloadObject(line);
   if (!parsed.value) {

@@ -1,4 +1,4 @@
-// Messages from standard input, one a line.
+// Sends messages from standard input, one per line.
 #pragma once
 
 #include <chrono>
@@ -15,15 +15,15 @@
 
 namespace vesk {
 
-/// Sends many messages at once and reports each outcome. A line that is no message is reported, and the next
-/// lines are sent all the same.
+/// Sends many messages concurrently and reports each outcome. Reports an invalid line and continues with the
+/// next.
 class MessageStream {
  public:
-  /// `session` is started and outlives this object.
+  /// `session` must be started and outlive this object.
   MessageStream(DaemonSession& session, const MessageArguments& arguments, std::chrono::milliseconds timeout,
                 const Output& output);
 
-  /// Until the end of standard input. Returns the exit status.
+  /// Runs until the end of standard input. Returns the exit status.
   int run();
 
  private:

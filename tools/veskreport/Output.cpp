@@ -13,10 +13,10 @@ bool print(std::FILE* file, std::string_view bytes) {
   return std::fwrite(bytes.data(), 1, bytes.size(), file) == bytes.size() && std::fflush(file) == 0;
 }
 
-// One write for a line: others may write at the same time.
+// A single write per line, since others may write to the same file at the same time.
 bool printLine(std::FILE* file, std::string line) { return print(file, line += '\n'); }
 
-/// Texts of the tool's own, names of files among them, as JSON can carry them.
+/// Makes the tool's own text, which may contain file names, valid for JSON.
 Value carried(const Value& value) {
   const Text* text = value.text();
   return text ? Value(printableUTF8(text->view())) : value;
@@ -29,7 +29,7 @@ int Output::done(std::string_view line, const Dictionary& fields) const {
 }
 
 int Output::done(const std::vector<std::string>& lines, const Dictionary& fields) const {
-  if (std::ferror(stdout)) return kExitFailed;  // that was told when it happened
+  if (std::ferror(stdout)) return kExitFailed;  // already reported
   bool isWritten = true;
   if (_json) {
     isWritten = object("done", {}, fields);

@@ -11,7 +11,7 @@ namespace {
 
 bool isSendableText(std::string_view text) noexcept { return isValidUTF8(text, false); }
 
-// Null, or what no message can carry.
+// Null, or the reason why the value can't be sent.
 const char* complaintAbout(const Value& value) {
   if (const Text* text = value.text(); text && !isSendableText(text->view())) return "a text holds a NUL";
   if (const double* number = value.real(); number && !std::isfinite(*number))

@@ -1,4 +1,4 @@
-// What people and scripts write as payloads, turned into values that can be sent.
+// Parses payloads written by people and scripts.
 #pragma once
 
 #include <optional>
@@ -10,21 +10,21 @@
 
 namespace vesk {
 
-/// A value, or why there is none in words for the person who wrote it.
+/// A value, or a readable reason why there is none.
 template <class T>
 struct Parsed {
   std::optional<T> value;
   std::string error;
 };
 
-/// One JSON value. Refused is what no message can carry: a NUL in a text, a number out of range, anything
-/// nested deeper than 32.
+/// Parses one JSON value. Refuses what a message can't contain: a NUL in text, a number out of range, nesting
+/// deeper than 32.
 Parsed<Value> parsePayloadValue(std::string_view json);
 
-/// The same, but it has to be an object.
+/// Like `parsePayloadValue`, but the value must be an object.
 Parsed<Dictionary> parsePayloadObject(std::string_view json);
 
-/// `key=text` and `key:=json` arguments, in their order; each key once.
+/// Parses `key=text` and `key:=json` arguments, in order. Keys must be unique.
 Parsed<Dictionary> parsePairs(const std::vector<std::string>& arguments);
 
 }  // namespace vesk

@@ -14,7 +14,7 @@ namespace vesk {
 
 namespace {
 
-// Ages reach back to any time that a log can hold, and no time is out of the clock's range.
+// Covers any time that a log can hold, and stays within the clock's range.
 constexpr std::chrono::seconds kLongestAge = std::chrono::days(100'000);
 
 std::optional<std::chrono::seconds> unitNamed(char letter) {

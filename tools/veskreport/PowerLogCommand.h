@@ -10,11 +10,11 @@
 
 namespace vesk {
 
-/// Exit status.
+/// Returns the exit status.
 int runPowerLog(const Invocation& invocation, const Output& output);
 
-/// The time that `text` means: "90s", "15m", "2h" and "7d" before `now`, or a UTC time of the form
-/// "2026-11-24T18:30:00Z", of which the time of day and the "Z" may be left out. Nothing for any other text.
+/// Parses an age before `now` ("90s", "15m", "2h" or "7d") or a UTC time such as "2026-11-24T18:30:00Z",
+/// where the time of day and the "Z" are optional. Returns nullopt for any other text.
 std::optional<WallTime> timeMeantBy(const std::string& text, WallTime now);
 
 }  // namespace vesk

@@ -9,21 +9,21 @@
 
 namespace vesk {
 
-/// Shows itself only when standard error is a terminal, at most ten times a second.
+/// Only drawn if standard error is a terminal, at most ten times a second.
 class Progress {
  public:
-  /// `input`: what is worked through; its size is known when it is a regular file.
+  /// `input`: the descriptor being read; its size is known if it is a regular file.
   explicit Progress(int input) noexcept;
 
   void show(std::uint64_t items, std::uint64_t bytes);
-  /// For work whose progress nobody tells: a bar that moves, and the time since the first call.
+  /// For work of unknown progress: shows a moving bar and the time since the first call.
   void showWaiting(std::string_view what);
-  /// Leaves the line empty for other output. For any thread.
+  /// Clears the line for other output. Thread-safe.
   void clear();
 
  private:
   const bool _isTerminal;
-  const std::uint64_t _size;  ///< bytes; 0 when unknown
+  const std::uint64_t _size;  ///< bytes; 0 if unknown
   bool isDue();
   void draw(const std::string& line);
 

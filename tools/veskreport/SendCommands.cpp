@@ -17,7 +17,7 @@ Dictionary parametersOf(const MessageArguments& message, const std::optional<Dic
   return parameters.share();
 }
 
-// Tells why when the arguments are no payload, and returns kExitUsage.
+// Returns kExitUsage and reports the reason if the arguments are not a payload.
 int payloadOf(const MessageArguments& message, const Output& output, std::optional<Dictionary>& payload) {
   if (message.payload.empty()) return kExitDone;
   auto pairs = parsePairs(message.payload);
@@ -50,7 +50,7 @@ int runSend(const Invocation& invocation, const Output& output) {
   if (message.noWait) {
     auto status = session.reporting().sendMessage(parameters);
     if (status != ReportingStatus::Queued) return session.failed(status, "");
-    // Calls keep their order: the answer to another one shows that the message has left, or never will.
+    // Calls keep their order. The answer to this one shows that the message was sent or failed.
     auto next = session.reporting().fetchDisplayURL(invocation.identity.timeout);
     if (session.reporting().drops().invalid > 0) return session.failed(ReportingStatus::InvalidArgument, "");
     if (!next) return session.failed(next);

@@ -6,7 +6,7 @@
 
 namespace vesk {
 
-/// Each returns the exit status.
+/// These return the exit status.
 int runSend(const Invocation& invocation, const Output& output);
 int runSendOnce(const Invocation& invocation, const Output& output);
 

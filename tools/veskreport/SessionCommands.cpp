@@ -16,7 +16,7 @@ constexpr char kNoDisplayURL[] = "URL not available";
 
 List listOf(const BackendNames& names) { return List(std::vector<Value>(names.begin(), names.end())); }
 
-// The log data that the command line or standard input gives; nothing when a line is no JSON.
+// The log data from the command line or standard input; nullopt if a line is not JSON.
 std::optional<List> logDataOf(const UploadArguments& arguments, const Output& output) {
   if (!arguments.fromStandardInput) {
     return List(std::vector<Value>(arguments.logData.begin(), arguments.logData.end()));

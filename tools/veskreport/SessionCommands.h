@@ -1,4 +1,4 @@
-// The commands that do one thing in a session of their own.
+// The commands that perform one operation in a session of their own.
 #pragma once
 
 #include "tools/veskreport/Invocation.h"
@@ -6,7 +6,7 @@
 
 namespace vesk {
 
-/// Each returns the exit status.
+/// These return the exit status.
 int runStates(const Invocation& invocation, const Output& output);
 int runDisplayURL(const Invocation& invocation, const Output& output);
 int runFlush(const Invocation& invocation, const Output& output);

@@ -20,7 +20,7 @@ constexpr std::size_t kMaximumStorebag = std::size_t{1} << 20;
 constexpr std::size_t kMaximumKey = std::size_t{64} << 10;
 constexpr mode_t kReadableByAll = 0644;
 
-// The storebag code throws runtime errors whose words are meant for the person at the terminal.
+// The storebag code throws runtime errors with messages meant for the user.
 template <class Work>
 int reporting(const Output& output, const Work& work) {
   try {

@@ -1,4 +1,4 @@
-// The commands that make and examine storebags.
+// The commands that create and examine storebags.
 #pragma once
 
 #include "tools/veskreport/Invocation.h"
@@ -6,7 +6,7 @@
 
 namespace vesk {
 
-/// Each returns the exit status.
+/// These return the exit status.
 int runStorebagKeygen(const StorebagArguments& arguments, const Output& output);
 int runStorebagSign(const StorebagArguments& arguments, const Output& output);
 int runStorebagVerify(const StorebagArguments& arguments, const Output& output);
