@@ -69,7 +69,7 @@ void Counters::count(std::string_view backend, DropReason reason, std::uint64_t 
   try {
     (*rowFor(backend))[static_cast<std::size_t>(reason)].fetch_add(n, std::memory_order_relaxed);
   } catch (...) {
-    // No memory for a new name: the loss itself goes on being handled.
+    // Out of memory for a new name: this loss is not counted.
   }
 }
 

@@ -1,4 +1,4 @@
-// Counts what the daemon lost, by backend and reason.
+// Counts the daemon's losses by backend and reason.
 #pragma once
 
 #include <array>
@@ -13,32 +13,32 @@
 
 namespace vesk {
 
-/// Why messages or events did not get where they should.
+/// Why messages or events were lost.
 enum class DropReason : std::uint8_t {
-  StateDisabled,   ///< the backend is disabled: message dropped
-  TransportError,  ///< the post or upload failed before any answer
+  StateDisabled,   ///< the backend is disabled and dropped the message
+  TransportError,  ///< the post or upload failed without an answer
   NoURL,           ///< no URL is configured for this kind of post
   ServerError5xx,  ///< the server answered 500 to 599
-  OverBound,       ///< dropped from what the backend held, to stay under its bound
+  OverBound,       ///< dropped by the backend to stay within its limit
   BodyNotBuilt,    ///< the body could not be built
-  InvalidMessage,  ///< the message itself was refused
-  NoBackend,       ///< no backend was there to take it
+  InvalidMessage,  ///< the message was invalid
+  NoBackend,       ///< no backend was there to take the message
   UploadFailed,    ///< a file was not uploaded
-  NeverEnabled,    ///< still held when the session ended, because reporting was not enabled
-  Unacknowledged,  ///< a datagram that was not sent whole or never acknowledged, and given up
-  NotAggregated,   ///< the aggregating client did not take its copy: it does not read, or has gone
+  NeverEnabled,    ///< still held when the session ended, because reporting was never enabled
+  Unacknowledged,  ///< a datagram was not sent completely or never acknowledged, and was abandoned
+  NotAggregated,   ///< the aggregating client did not take its copy: it does not read, or is gone
   NotRecorded,     ///< a local record could not be written
-  AdaptorFailed,   ///< an adaptor was missing or did not take it
-  ServerRefused,   ///< the server answered, neither with success (2xx) nor with an error of its own (5xx)
-                   // the last one: kDropReasonCount follows from it
+  AdaptorFailed,   ///< an adaptor was missing or did not accept the message
+  ServerRefused,   ///< the server answered neither with success (2xx) nor with a server error (5xx)
+                   // kDropReasonCount depends on the last reason.
 };
 inline constexpr std::size_t kDropReasonCount = static_cast<std::size_t>(DropReason::ServerRefused) + 1;
 
-/// A word for it, for tools and logs: "state-disabled".
+/// A name for tools and logs, such as "state-disabled".
 std::string_view nameOfDropReason(DropReason reason) noexcept;
 
-/// Counters that only grow, for the life of the process. Thread-safe; counting takes a shared lock and one
-/// atomic addition, and neither waits for anyone nor throws.
+/// Counters that only grow, for the life of the process. Thread-safe. Counting takes a shared lock and one
+/// atomic addition; it neither blocks nor throws.
 class Counters {
  public:
   struct Count {
@@ -47,17 +47,17 @@ class Counters {
     std::uint64_t count;
   };
 
-  /// The process's own.
+  /// The process's instance.
   static Counters& shared();
 
   Counters() = default;
   Counters(const Counters&) = delete;
   Counters& operator=(const Counters&) = delete;
 
-  /// Adds `n` lost messages or events. Backend names beyond 64 different ones count under "other".
+  /// Adds `n` lost messages or events. After 64 different backend names, further names count as "other".
   void count(std::string_view backend, DropReason reason, std::uint64_t n = 1) noexcept;
 
-  /// Everything that is not zero, by backend name and reason.
+  /// All counts above zero, ordered by backend name and reason.
   std::vector<Count> snapshot() const;
 
  private:

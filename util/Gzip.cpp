@@ -53,7 +53,7 @@ const char* textForDeflate(int result) {
 
 const char* messageOf(const z_stream& stream) { return stream.msg ? stream.msg : "(null)"; }
 
-/// A deflate stream that is ready for one input.
+/// A deflate stream for one input at a time.
 class Deflater {
  public:
   explicit Deflater(bool useGzip) {
@@ -69,7 +69,7 @@ class Deflater {
 
   int initialisation() const { return _initialisation; }
   z_stream& stream() { return _stream; }
-  /// Makes the stream as good as a new one; false when it is none any more.
+  /// Prepares the stream for a new input. Returns false if that fails.
   bool reset() { return deflateReset(&_stream) == Z_OK; }
 
  private:
@@ -77,9 +77,9 @@ class Deflater {
   int _initialisation = Z_STREAM_ERROR;
 };
 
-/// Keeps a few streams for the next caller: making one takes 256 KiB of fresh memory, which costs several
-/// times as much as deflating a body of usual size. More callers at once get streams of their own, and so a
-/// thousand idle threads hold none.
+/// Keeps a few streams for reuse: creating one allocates 256 KiB, which costs several times as much as
+/// deflating a typical body. Additional concurrent callers get temporary streams, so that a thousand idle
+/// threads hold none.
 class DeflaterPool {
  public:
   explicit DeflaterPool(bool useGzip) : _useGzip(useGzip) {}
@@ -119,14 +119,14 @@ uInt limitedSize(std::size_t size) {
   return static_cast<uInt>(std::min<std::size_t>(size, std::numeric_limits<uInt>::max()));
 }
 
-/// Z_STREAM_END with the stream in `out`, or what went wrong.
+/// Returns Z_STREAM_END with the stream in `out`, or an error code.
 int deflateWhole(z_stream& stream, std::string_view data, CompressedBytes& out) {
   if (data.size() > std::numeric_limits<uInt>::max()) return Z_BUF_ERROR;
   // zlib does not write through this pointer; its interface lacks the const.
   stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(data.data()));
   stream.avail_in = static_cast<uInt>(data.size());
   const std::size_t bound = deflateBound(&stream, static_cast<uLong>(data.size()));
-  // Not filled with zeros: pages that the stream does not reach cost nothing.
+  // Not zeroed, so that pages which the stream does not reach use no memory.
   out.bytes.reset(new char[bound]);
   int result = Z_OK;
   while (result == Z_OK) {

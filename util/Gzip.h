@@ -1,4 +1,4 @@
-// Compression in one pass, with zlib's deflate.
+// One-pass compression with zlib's deflate.
 #pragma once
 
 #include <cstddef>
@@ -9,20 +9,20 @@
 
 namespace vesk {
 
-/// Bytes in a buffer that has room for more; what is not used of it was never touched.
+/// Bytes in a larger buffer whose unused part was never touched.
 struct CompressedBytes {
   std::unique_ptr<char[]> bytes;
   std::size_t size = 0;
 };
 
-/// `data` as one gzip stream (`useGzip`) or zlib stream; nothing, and one level-3 line, on any failure, of
-/// which empty data is one. Whole input and whole output are in memory at once. Thread-safe.
+/// Compresses `data` into one gzip (`useGzip`) or zlib stream. Returns nullopt, with a line of level 3, on
+/// any failure, including empty data. Input and output are completely in memory. Thread-safe.
 std::optional<CompressedBytes> compressToBuffer(bool useGzip, std::string_view data);
 
-/// The same as a text of its own.
+/// Like `compressToBuffer`, but returns a string.
 std::optional<std::string> compressDataWithZlibOrGzip(bool useGzip, std::string_view data);
 
-/// `data` as gzip stream.
+/// Compresses `data` into a gzip stream.
 std::optional<std::string> gzipDeflate(std::string_view data);
 
 }  // namespace vesk

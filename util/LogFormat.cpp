@@ -14,28 +14,28 @@ constexpr std::string_view kConversions = "@sdiuxXofFeEgG";
 constexpr int kWidest = 256;
 
 struct Placeholder {
-  std::string flags;       // with width and precision: what printf gets between "%" and the conversion
+  std::string flags;       // also width and precision: what goes between "%" and the conversion
   char conversion = 0;     // 0: not a placeholder
-  std::size_t length = 0;  // of the whole placeholder in the format
+  std::size_t length = 0;  // length of the placeholder in the format
 };
 
-/// Takes the characters at the beginning of `rest` that are among `set`.
+/// Removes the leading characters of `rest` that are in `set`, and returns them.
 std::string_view takeAll(std::string_view set, std::string_view& rest) {
   const std::string_view taken = rest.substr(0, rest.find_first_not_of(set));
   rest.remove_prefix(taken.size());
   return taken;
 }
 
-// A width or a precision, limited so that it can't fill the log with blanks.
+// Reads a width or precision, limited so that it can't fill the log with blanks.
 std::string takeNumber(std::string_view& rest) {
   const std::string_view digits = takeAll("0123456789", rest);
   if (digits.empty()) return {};
   int number = kWidest;
-  std::from_chars(digits.data(), digits.data() + digits.size(), number);  // unchanged beyond its range
+  std::from_chars(digits.data(), digits.data() + digits.size(), number);  // stays unchanged if out of range
   return std::to_string(std::min(number, kWidest));
 }
 
-/// `format` starts with "%".
+/// `format` must start with "%".
 Placeholder parsePlaceholder(std::string_view format) {
   Placeholder placeholder;
   std::string_view rest = format.substr(1);
@@ -55,7 +55,7 @@ Placeholder parsePlaceholder(std::string_view format) {
   return placeholder;
 }
 
-// The format is built here, from checked parts and for the very type of `value`.
+// The format was built here from checked parts and fits the type of `value`.
 template <class T>
 std::string printed(const std::string& format, T value) {
   char buffer[1024] = "";  // the largest double with 256 decimals takes 566
@@ -82,7 +82,7 @@ struct NumericForm {
   }
   std::string operator()(std::int64_t number) const {
     if (wants("fFeEgG")) return (*this)(static_cast<double>(number));
-    // A negative number is not shown as the huge one that "%u" would make of it.
+    // "%u" would show a negative number as a huge one.
     if (wants("diu")) return converted("ll", 'd', static_cast<long long>(number));
     return (*this)(static_cast<std::uint64_t>(number));
   }

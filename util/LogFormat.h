@@ -1,4 +1,4 @@
-// Formats of the message log, filled by type and not by trust.
+// Type-safe formats for the message log.
 #pragma once
 
 #include <cstdint>
@@ -13,8 +13,8 @@
 
 namespace vesk {
 
-/// One value for a placeholder of a log format. It remembers its own type, so a format that does not fit it
-/// still prints the value.
+/// One value for a placeholder of a log format. It knows its own type, so it is printed even if the
+/// placeholder doesn't fit it.
 class LogArgument {
  public:
   LogArgument(std::string_view text) noexcept : _value(text) {}                                 // NOLINT
@@ -31,7 +31,7 @@ class LogArgument {
       _value = static_cast<std::uint64_t>(number);
     }
   }
-  /// What is none prints "(null)".
+  /// An empty optional prints "(null)".
   template <class T>
   LogArgument(const std::optional<T>& value) noexcept  // NOLINT
       : LogArgument(value ? LogArgument(*value) : LogArgument(std::string_view("(null)"))) {}
@@ -44,13 +44,12 @@ class LogArgument {
   std::variant<std::string_view, std::int64_t, std::uint64_t, double> _value;
 };
 
-/// Fills the placeholders of `format` with `arguments`, in order:
-/// - "%@" and "%s" show any value in its plain form;
-/// - "%d", "%i", "%u", "%x", "%X", "%o", "%f", "%e" and "%g" show a number as printf does, with its flags,
-/// width
-///   and precision, and a text as it is. Length modifiers ("%ld") have no effect: a value knows its own size;
-/// - "%%" is a percent sign.
-/// A placeholder without a value stays as it stands; values without a placeholder are left out.
+/// Replaces the placeholders of `format` by `arguments`, in order:
+/// - "%@" and "%s" print any value in its plain form.
+/// - "%d", "%i", "%u", "%x", "%X", "%o", "%f", "%e" and "%g" print a number like printf, with flags, width
+///   and precision, and text unchanged. Length modifiers ("%ld") have no effect.
+/// - "%%" prints a percent sign.
+/// A placeholder without a value is printed unchanged; values without a placeholder are ignored.
 std::string formatLogMessage(std::string_view format, std::span<const LogArgument> arguments);
 
 }  // namespace vesk

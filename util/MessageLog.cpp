@@ -24,7 +24,8 @@ constexpr std::string_view kNameStart = "veskreportingd";
 constexpr std::string_view kNameEnd = "messageLog.diag";
 constexpr std::chrono::seconds kExpiryAge{86400};
 
-// Longer than any kernel's clock tick: two changes of a directory within one tick leave the same time in it.
+// Longer than a kernel clock tick: two changes of a directory within one tick leave the same modification
+// time.
 constexpr std::chrono::milliseconds kSettled{100};
 
 using LogFile = MessageLogFile;
@@ -43,18 +44,18 @@ std::string newLogFileName(WallTime now) {
          std::string(kNameEnd);
 }
 
-/// The seconds since 1970 in a log file's name, if they are a number of 32 bits.
+/// The seconds since 1970 in a log file's name, if they are a 32-bit number.
 std::optional<WallTime> dateInName(std::string_view name) {
   name.remove_prefix(name.find('_') + 1);
   name = name.substr(0, name.find('_'));
   std::int32_t seconds = 0;
   const auto [end, error] = std::from_chars(name.data(), name.data() + name.size(), seconds);
   if (error != std::errc() || end != name.data() + name.size()) return std::nullopt;
-  // From 2038 on the number is negative.
+  // The number is signed, so it is negative from 2038 on.
   return WallTime(std::chrono::seconds(static_cast<std::uint32_t>(seconds)));
 }
 
-/// Of the file that is open as `descriptor`, or else stands at `path`.
+/// The creation date of the file opened as `descriptor` or, without a descriptor, of the file at `path`.
 std::optional<WallTime> creationDate(const std::string& path, int descriptor = -1) {
   struct statx status {};
   const bool isOpen = descriptor >= 0;
@@ -80,15 +81,15 @@ void createDirectoryWithParents(const std::string& directory) {
   }
 }
 
-/// Whether it is one of the log's files. A directory of such a name can't be: the log never makes one and
-/// could not delete it either.
+/// Whether the entry is a log file. Directories are not: the log never creates one under such a name and
+/// could not delete it.
 bool isLogFile(const std::filesystem::directory_entry& entry) {
   std::error_code unknown;
   return isLogFileName(entry.path().filename().native()) &&
          (entry.is_symlink(unknown) || !entry.is_directory(unknown));
 }
 
-/// Paths of the log files in `directory`, which is created when it is missing.
+/// Paths of the log files in `directory`, which is created if missing.
 std::vector<std::string> listLogFiles(const std::string& directory) {
   std::vector<std::string> paths;
   std::error_code error;
@@ -106,7 +107,7 @@ std::vector<std::string> listLogFiles(const std::string& directory) {
   return {};
 }
 
-/// The newest file that has not expired; all others are deleted.
+/// Returns the newest file that has not expired and deletes all others.
 std::optional<LogFile> chooseCurrentFile(const std::vector<std::string>& paths, WallTime now) {
   std::optional<LogFile> best;
   for (const auto& path : paths) {
@@ -117,7 +118,7 @@ std::optional<LogFile> chooseCurrentFile(const std::vector<std::string>& paths, 
       if (file.created && *file.created > *best->created) std::swap(file, *best);
       deleteLogFile(file);
     } else {
-      // A best of unknown date gives way without being deleted.
+      // If the date of the best file is unknown, the file is replaced here without being deleted.
       best = std::move(file);
     }
   }
@@ -126,7 +127,7 @@ std::optional<LogFile> chooseCurrentFile(const std::vector<std::string>& paths, 
 
 std::optional<LogFile> createLogFile(const std::string& directory, WallTime now) {
   const std::string path = directory + "/" + newLogFileName(now);
-  // An existing file is kept: it can be there when the directory can't be listed.
+  // Keeps an existing file, which may be there if the directory can't be listed.
   FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0640));
   struct stat status {};
   if (!file || ::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) {
@@ -152,7 +153,7 @@ std::chrono::nanoseconds sinceEpoch(const timespec& time) {
   return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
 }
 
-/// Whether any later change of the directory's entries will show in its time.
+/// Whether every later change of the directory's entries will change its modification time.
 bool isSettled(const struct stat& directory) {
   timespec now{};
   ::clock_gettime(CLOCK_REALTIME, &now);
@@ -206,7 +207,7 @@ bool MessageLog::isStillChosen(const Current& current, WallTime now) const {
 }
 
 void MessageLog::write(std::string_view message) try {
-  // One lock for all logs: two of them may stand on one directory.
+  // One lock for all logs, since two of them may use the same directory.
   static Mutex mutex;
   MutexLock lock(mutex);
   const WallTime now = _clock.now();

@@ -35,7 +35,7 @@ void copyUniqueDeviceID(char* buffer, std::size_t size) {
   if (size == 0) return;
   auto identifier = QNCopyAnswer("UniqueDeviceID");
   if (!identifier) return;
-  // Half an identifier would be another one.
+  // A truncated identifier would be a different one.
   const std::size_t fitting = identifier->size() < size ? identifier->size() : 0;
   std::memcpy(buffer, identifier->data(), fitting);
   buffer[fitting] = '\0';

@@ -1,4 +1,4 @@
-// What device and build the daemon runs on, and small conversions that several units share.
+// Facts about the device and its build, and conversions that several units share.
 #pragma once
 
 #include <sys/time.h>
@@ -11,7 +11,7 @@
 
 namespace vesk {
 
-/// Facts of the device, asked for anew on every call; nothing when the device does not know one.
+/// Facts of the device, queried anew by each call; nullopt if unknown.
 std::optional<Text> deviceProductVersion();
 std::optional<Text> deviceBuildVersion();
 std::optional<Text> deviceProductType();
@@ -19,19 +19,19 @@ std::optional<Text> deviceName();
 std::optional<Text> deviceHardwareModel();
 std::optional<Text> deviceSerialNumber();
 
-/// Writes the device's unique identifier with a terminating NUL into `buffer`, and 0 into its last byte. The
-/// buffer keeps what it held when there is no identifier. One that does not fit with its terminator leaves an
-/// empty text; callers pass 41 bytes, for 40 digits.
+/// Writes the device's unique identifier with a terminating NUL into `buffer`. An identifier that doesn't fit
+/// gives an empty text. Always sets the buffer's last byte to 0. If there is no identifier, the rest of the
+/// buffer is unchanged. Callers pass 41 bytes, for 40 digits.
 void copyUniqueDeviceID(char* buffer, std::size_t size);
 
-/// True when the device runs an internal build. Found out on first use and fixed for the life of the process.
+/// True on an internal build. Determined on first use and fixed for the life of the process.
 bool isInternalBuild();
 
-/// Client name and service name of `userInfo`, lower-cased, with a colon between; what is missing is empty.
-/// Sessions with the same key belong together.
+/// Client name and service name of `userInfo` in lower case, separated by a colon. Missing names are empty.
+/// Sessions with the same key form a family.
 std::string correlationKeyForUserInfo(const Dictionary& userInfo);
 
-/// Seconds with microseconds.
+/// The time in seconds, with microsecond precision.
 double secondsFromTimeval(const timeval& time) noexcept;
 
 }  // namespace vesk

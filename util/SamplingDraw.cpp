@@ -7,7 +7,7 @@
 namespace vesk {
 
 double nextSamplingDraw() {
-  // The generator's state belongs to the whole process and is not protected by the C library.
+  // The generator's state is process-wide, and the C library doesn't protect it.
   static Mutex mutex;
   MutexLock lock(mutex);
   return ::drand48();  // NOLINT(concurrency-mt-unsafe)

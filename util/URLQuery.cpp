@@ -15,7 +15,7 @@ constexpr std::string_view kOthersInURL = "!$&'()*+,;=:@/?#[]%";
 
 bool isIn(std::string_view set, char c) { return set.find(c) != std::string_view::npos; }
 
-/// What follows the scheme when that is `scheme`, in letters of either case.
+/// The part after the scheme if the URL's scheme is `scheme`, ignoring case; otherwise empty.
 std::string_view afterScheme(std::string_view url, std::string_view scheme) {
   if (!equalsIgnoringASCIICase(url.substr(0, scheme.size()), scheme)) return {};
   return url.substr(scheme.size());

@@ -1,4 +1,4 @@
-// What URLs are made of.
+// Encoding and checking of URLs.
 #pragma once
 
 #include <string>
@@ -6,15 +6,14 @@
 
 namespace vesk {
 
-/// `text` with %XX for each byte that may not stand in a URL's query as it is. What separates the parts of a
-/// query ("&", "=", "?", "/") may, and stays.
+/// Percent-encodes each byte of `text` that is not allowed in a URL's query. Keeps the characters that
+/// structure a query ("&", "=", "?", "/").
 std::string encodedForURLQuery(std::string_view text);
 
-/// `url` with %XX for each byte that no URL may hold: a URL that is well-formed stays as it is.
+/// Percent-encodes each byte of `url` that is not allowed in a URL. A well-formed URL stays unchanged.
 std::string encodedForURL(std::string_view url);
 
-/// Whether `url` is an absolute http or https URL, spelt with nothing but the characters that URLs are made
-/// of.
+/// Whether `url` is an absolute http or https URL that consists only of characters allowed in URLs.
 bool isWebURL(std::string_view url);
 
 }  // namespace vesk
