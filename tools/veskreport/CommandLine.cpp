@@ -17,15 +17,15 @@ namespace {
 
 constexpr double kLongestTimeout = 86'400;
 constexpr std::string_view kStorebag = "storebag";
-constexpr double kUploadTimeout = 600;  // a file may be large and the line thin
+constexpr double kUploadTimeout = 600;  // a file may be large and the connection slow
 
-/// Ranges let a "nan" pass, which lies neither below nor above them.
+/// Rejects NaN, which a range check would accept.
 std::string isNumber(const std::string& text) {
   return std::isnan(std::strtod(text.c_str(), nullptr)) ? text + " is no number" : "";
 }
 
-// Where an option or argument takes several values, "[a,b]" would be taken for two. With a mark behind it, it
-// isn't; the mark goes when the value is taken.
+// CLI11 would split "[a,b]" into two values where an option or argument takes several. A mark appended to the
+// text prevents that; it is removed when the value is used.
 constexpr char kMark = '\0';
 
 void mark(std::string& argument) {
@@ -42,7 +42,7 @@ void unmarkValues(CLI::App& app) {
   for (CLI::App* sub : app.get_subcommands({})) unmarkValues(*sub);
 }
 
-/// How many letters must be added, taken away or replaced to make one of the other.
+/// The number of letters to insert, delete or replace to turn one into the other.
 std::size_t editDistance(std::string_view a, std::string_view b) {
   std::vector<std::size_t> row(b.size() + 1);
   std::iota(row.begin(), row.end(), 0U);
@@ -56,7 +56,7 @@ std::size_t editDistance(std::string_view a, std::string_view b) {
   return row.back();
 }
 
-/// Throws where `argument` should name a command of `app` and names none: CLI11 would only say that one is
+/// Throws if `argument` is not a command of `app` but should be. CLI11 would only say that a command is
 /// required.
 void checkCommand(const CLI::App& app, const std::string& argument) {
   constexpr std::size_t kSimilar = 2;  // edits
