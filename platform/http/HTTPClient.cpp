@@ -69,7 +69,7 @@ HTTPResult HTTPClient::perform(HTTPRequest request) {
   Completion completion;
   try {
     call = std::make_shared<Call>();
-    // Nothing here can fail, so that whoever waits is always let go.
+    // Nothing here can fail, so the waiting caller is always released.
     completion = [call](HTTPResult result) noexcept {
       call->result = std::move(result);
       call->done.release();

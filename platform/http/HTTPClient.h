@@ -1,4 +1,4 @@
-// The process's HTTP client: one shared connection pool, one thread of its own.
+// The process's HTTP client, with a shared connection pool and its own thread.
 #pragma once
 
 #include <atomic>
@@ -18,27 +18,27 @@
 namespace vesk {
 
 struct HTTPRequest {
-  /// What the client may do when the transport fails before any answer arrived.
+  /// Whether the client tries again if the transport fails without an answer.
   enum class Retry : unsigned char {
     Never,      ///< uploads and storebag fetches
-    UntilSent,  ///< posts: again with growing, jittered waits, for at most 60 s and while fewer than 8 MiB
-                ///< wait; also when the server's certificate could not be verified
+    UntilSent,  ///< posts: with growing, jittered waits, for at most 60 s and while fewer than 8 MiB
+                ///< wait; also if the server's certificate could not be verified
   };
 
   std::string method = "GET";
-  std::string url;  ///< only http and https are followed
-  /// Sent in this order. Names must be tokens and values must not hold control characters (such a header is
-  /// left out and logged). Nothing is added but Host, User-Agent, Accept and Content-Length, unless given.
+  std::string url;  ///< http or https only
+  /// Sent in this order. Names must be tokens, and values must not contain control characters; other headers
+  /// are left out and logged. Adds only Host, User-Agent, Accept and Content-Length, unless given.
   std::vector<std::pair<std::string, std::string>> headers;
   std::string body;
   /// From `start` to the last byte; for a post that may be retried, from the start of each attempt.
   std::chrono::milliseconds timeout{60'000};
-  /// A request that moves fewer bytes than that, to and fro, for as long as `slowFor` is given up as timed
-  /// out. 0: it may stand still until its timeout.
+  /// A request that moves fewer bytes in either direction for `slowFor` is failed as timed out. 0: it may
+  /// stall until its timeout.
   long leastBytesPerSecond = 0;
   std::chrono::seconds slowFor{120};
   Retry retry = Retry::Never;
-  /// Whose post it is: a user's number, or any. Owners take turns, and share what may wait.
+  /// The user that the post belongs to, or kNobody. Owners take turns and share the memory for waiting posts.
   std::uint32_t owner = kNobody;
 
   static constexpr std::uint32_t kNobody = 0xffffffff;
@@ -47,14 +47,14 @@ struct HTTPRequest {
 struct HTTPResponse {
   long status = 0;  ///< 100 to 599
   std::vector<std::pair<std::string, std::string>> headers;
-  /// At most `HTTPClient::Options::maximumBody` bytes; a longer answer is a transport error.
+  /// At most `HTTPClient::Options::maximumBody` bytes. A longer answer is a transport error.
   std::string body;
 
-  /// The first header of that name, compared without regard to case.
+  /// The value of the first header with that name, ignoring case.
   std::optional<std::string_view> header(std::string_view name) const;
 };
 
-/// The transport failed: there is no whole answer.
+/// A failure of the transport: there is no complete answer.
 struct HTTPError {
   enum class Kind : unsigned char {
     Connect,
@@ -72,65 +72,64 @@ struct HTTPError {
   std::string description;
 };
 
-/// Without an error, there is a response. With one there is a response, without its body, when the server's
-/// status had arrived: it decided about the request, whatever became of the rest.
+/// Without an error, there is a response. With an error, there is a response without a body if the server's
+/// status had arrived, since the status decides about the request.
 struct HTTPResult {
   std::optional<HTTPResponse> response;
   std::optional<HTTPError> error;
 };
 
-/// Sends requests. Thread-safe. TLS certificates are verified against the system's authorities or, when set,
-/// the file named by SSL_CERT_FILE. Redirects are not followed; no response is cached.
+/// Sends requests. Thread-safe. Verifies TLS certificates against the system's authorities or, if set, the
+/// file named by SSL_CERT_FILE. Doesn't follow redirects or cache responses.
 class HTTPClient {
  public:
-  /// Runs once per request, on the client's thread; must neither block nor throw. The result is its own, to
-  /// be moved from. What it captured is destroyed on that thread right after it ran.
+  /// Runs once per request, on the client's thread. Must neither block nor throw. It may move from the
+  /// result. Its captures are destroyed on that thread right after it ran.
   using Completion = std::function<void(HTTPResult)>;
 
   struct Options {
     std::string userAgent = "veskreportingd";
     std::size_t maximumBody = std::size_t{4} << 20;  ///< bytes of a response body
-    /// Bytes of post bodies that wait out an outage. When there is no more room, or too little memory, the
-    /// owner who has most waiting for a host gives way to one who has less.
+    /// Limit, in bytes, on the bodies of posts that wait during an outage. When the limit or `maximumMemory`
+    /// is reached, the owner with the most data waiting for a host loses posts to an owner with less.
     std::size_t maximumWaiting = std::size_t{8} << 20;
-    std::size_t maximumMemory = std::size_t{64} << 20;  ///< bytes of memory for all posts that wait
+    std::size_t maximumMemory = std::size_t{64} << 20;  ///< limit in bytes for all waiting posts
     std::chrono::milliseconds retryFor{60'000};         ///< from the first attempt of a post
-    std::chrono::milliseconds firstRetryAfter{200};     ///< doubled each time, up to 10 s, ±50 % jitter
+    std::chrono::milliseconds firstRetryAfter{200};     ///< doubles each time, up to 10 s, with ±50 % jitter
     std::chrono::milliseconds connectTimeout{15'000};
-    /// A post whose bytes nobody acknowledges for so long is sent again by another connection: after a change
-    /// of network, kept connections are dead and do not tell.
+    /// A post without TCP acknowledgements for this long is sent again on another connection: after a change
+    /// of network, kept connections are dead but report no error.
     std::chrono::milliseconds acknowledgedWithin{20'000};
-    /// Further requests to that host wait in order. Posts leave one connection to the other requests, so that
-    /// a fetch does not wait behind them.
+    /// Limit on connections to one host; further requests wait in order. Posts leave one connection to other
+    /// requests, so that a fetch does not wait behind posts.
     std::size_t maximumConnectionsPerHost = 8;
-    /// Called whenever the last outstanding request has ended, on any thread; must neither block nor throw.
+    /// Called on any thread whenever the last outstanding request has ended. Must neither block nor throw.
     std::function<void()> onIdle = nullptr;
   };
 
-  /// The thread and the libraries under it, which are large, start with the first request: a daemon that has
-  /// nothing to say is small.
+  /// The thread and the libraries it needs are started with the first request, since an idle daemon should
+  /// use little memory.
   explicit HTTPClient(Options options);
   HTTPClient();
-  /// Fails what is still outstanding with `Stopped` (completions run), then ends the thread. Not to be called
-  /// from a completion.
+  /// Fails outstanding requests with `Stopped`, running their completions, then ends the thread. Must not be
+  /// called from a completion.
   ~HTTPClient();
   HTTPClient(const HTTPClient&) = delete;
   HTTPClient& operator=(const HTTPClient&) = delete;
 
-  /// Returns at once. An owner's posts to one host are sent in the order of the calls as far as connections
-  /// allow. When the thread can not be started or there is no memory for the request, the completion runs
-  /// within this call.
+  /// Doesn't block. An owner's posts to one host are sent in the order of the calls as far as connections
+  /// allow. If the thread can't be started or memory runs out, the completion runs within this call.
   void start(HTTPRequest request, Completion completion);
 
-  /// Starts the request and blocks until it is completed. Not to be called from a completion.
+  /// Starts the request and blocks until it is completed. Must not be called from a completion.
   HTTPResult perform(HTTPRequest request);
 
-  /// From now on fails at once, with `Stopped`, what is not to be retried, be it under way, waiting or new: a
-  /// server that hangs no longer holds up those who wait for it. Posts go on, and those that wait for another
-  /// attempt have it now. Returns at once.
+  /// From now on fails all requests that are not posts with `Stopped`, including new ones, so that a server
+  /// that hangs delays no one. Posts continue, and those waiting for a retry are tried immediately. Doesn't
+  /// block.
   void stopAllButPosts();
 
-  /// Waits until nothing is outstanding, at most `timeout`; true when nothing was left.
+  /// Waits up to `timeout` for all requests to end. Returns true if none is outstanding.
   [[nodiscard]] bool waitUntilIdle(std::chrono::milliseconds timeout);
 
  private:

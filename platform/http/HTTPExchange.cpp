@@ -83,7 +83,7 @@ std::string_view HTTPExchange::host() const noexcept {
 }
 
 void HTTPExchange::complete(HTTPResult result) noexcept {
-  // What it captured is destroyed with it, here.
+  // The captures are destroyed here, still on behalf of the user.
   LogUser onBehalfOf(_user);
   auto completion = std::exchange(_completion, nullptr);
   if (completion) runCompletion(completion, std::move(result));
@@ -103,7 +103,7 @@ HTTPError httpError(HTTPError::Kind kind, std::string_view description) noexcept
   try {
     return {kind, std::string(description)};
   } catch (const std::bad_alloc&) {
-    return {kind, "out of memory"};  // so short that it lies in the string itself
+    return {kind, "out of memory"};  // short enough to need no allocation
   }
 }
 

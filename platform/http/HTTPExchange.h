@@ -1,4 +1,4 @@
-// One request on its way through the client, from `start` to its completion.
+// One request within the client, from `start` to its completion.
 #pragma once
 
 #include <chrono>
@@ -14,14 +14,14 @@
 
 namespace vesk {
 
-/// How many exchanges there are. Thread-safe.
+/// Counts the exchanges. Thread-safe.
 class HTTPOutstanding {
  public:
-  /// `becameNone`: as HTTPClient::Options::onIdle.
+  /// `becameNone`: see HTTPClient::Options::onIdle.
   explicit HTTPOutstanding(std::function<void()> becameNone = nullptr) : _whenNone(std::move(becameNone)) {}
   void add() noexcept;
   void remove() noexcept;
-  /// At most `timeout`; true when there are none.
+  /// Waits up to `timeout`. Returns true if there are none.
   bool waitUntilNone(std::chrono::milliseconds timeout);
 
  private:
@@ -31,13 +31,13 @@ class HTTPOutstanding {
   std::size_t _count VESK_GUARDED_BY(_mutex) = 0;
 };
 
-/// Owned by whoever has it in hand: the client's inbox, the schedule or a transfer. Its completion runs
-/// exactly once: when nobody else did it, the destructor does, so that no caller waits for ever.
+/// Owned by the client's inbox, the schedule or a transfer. Its completion runs exactly once, by the
+/// destructor if necessary, so that no caller waits for ever.
 class HTTPExchange {
  public:
   using Instant = std::chrono::steady_clock::time_point;
 
-  /// Counts among `outstanding`, which must outlive it, until what its completion captured is gone.
+  /// Counted by `outstanding`, which must outlive it, until the completion's captures are destroyed.
   HTTPExchange(HTTPRequest&& wanted, HTTPClient::Completion&& completion, Instant now,
                HTTPOutstanding& outstanding) noexcept;
   ~HTTPExchange();
@@ -45,12 +45,12 @@ class HTTPExchange {
   HTTPExchange& operator=(const HTTPExchange&) = delete;
 
   bool isPost() const noexcept { return request.retry == HTTPRequest::Retry::UntilSent; }
-  /// Scheme, host and port as they stand in the URL.
+  /// Scheme, host and port as written in the URL.
   std::string_view host() const noexcept;
-  /// When a request that is not retried must be over.
+  /// The time limit of a request that is not retried.
   Instant deadline() const noexcept { return started + request.timeout; }
   std::size_t bodySize() const noexcept { return request.body.size(); }
-  /// Memory that it holds while it waits, roughly.
+  /// Approximate memory that it uses while it waits.
   std::size_t cost() const noexcept { return _cost; }
 
   void complete(HTTPResult result) noexcept;
@@ -58,26 +58,26 @@ class HTTPExchange {
 
   HTTPRequest request;
   const Instant started;
-  Instant firstAttempt{};  ///< once `attempts` is not 0
+  Instant firstAttempt{};  ///< valid if `attempts` is not 0
   unsigned attempts = 0;
-  std::unique_ptr<HTTPExchange> next;  ///< in the queue that it is in
+  std::unique_ptr<HTTPExchange> next;  ///< in its queue
 
  private:
   const std::size_t _cost;
-  const std::uint32_t _user;  // on whose behalf it was made
+  const std::uint32_t _user;  // the user it was made for
   HTTPClient::Completion _completion;
   HTTPOutstanding& _outstanding;
 };
 
-/// Logs what it throws.
+/// Runs the completion and logs its exceptions.
 void runCompletion(const HTTPClient::Completion& completion, HTTPResult result) noexcept;
 
-/// An error that can be made when there is no memory for its description, too: it has a short one then.
+/// Creates an error. If memory runs out, its description becomes a short one.
 HTTPError httpError(HTTPError::Kind kind, std::string_view description) noexcept;
 inline HTTPError outOfMemory() noexcept { return httpError(HTTPError::Kind::OutOfMemory, "out of memory"); }
 inline HTTPError stopped() noexcept { return httpError(HTTPError::Kind::Stopped, "the client was stopped"); }
 
-/// Takes out, with a line in the log, every header that could break the request apart.
+/// Removes, and logs, headers that could break the request's framing.
 void removeUnsafeHeaders(HTTPRequest& request);
 
 }  // namespace vesk

@@ -1,4 +1,4 @@
-// Exchanges that wait in a row.
+// A queue of exchanges.
 #pragma once
 
 #include <memory>
@@ -8,8 +8,8 @@
 
 namespace vesk {
 
-/// First in, first out. Links what it holds by their own field, so that nothing here takes memory: an
-/// exchange that exists can always be passed on.
+/// First in, first out. Uses the exchanges' own links and never allocates, so an existing exchange can always
+/// be queued.
 class HTTPQueue {
  public:
   using Exchange = std::unique_ptr<HTTPExchange>;
@@ -17,14 +17,14 @@ class HTTPQueue {
   HTTPQueue() = default;
   HTTPQueue(const HTTPQueue&) = delete;
   HTTPQueue& operator=(const HTTPQueue&) = delete;
-  /// One by one: a long chain would destroy itself by recursion.
+  /// Destroys the exchanges one by one, since destroying a long chain would recurse.
   ~HTTPQueue() {
     while (pop()) {
     }
   }
 
   bool empty() const noexcept { return !_first; }
-  /// The first, or null; the others follow by their `next`.
+  /// The first exchange, or null. Follow `next` for the others.
   const HTTPExchange* front() const noexcept { return _first.get(); }
 
   void pushBack(Exchange exchange) noexcept {
@@ -37,7 +37,7 @@ class HTTPQueue {
     _first = std::move(exchange);
     if (!_last) _last = _first.get();
   }
-  /// The first, or null.
+  /// Removes and returns the first exchange, or null.
   Exchange pop() noexcept {
     Exchange first = std::move(_first);
     if (first) _first = std::move(first->next);

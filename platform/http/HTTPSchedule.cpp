@@ -12,7 +12,7 @@ namespace {
 constexpr std::chrono::seconds kLongestWait{10};
 constexpr char kTooMany[] = "too many posts wait to be sent";
 
-/// Whether a post to the same host would fail likewise.
+/// Whether other posts to the same host would fail in the same way.
 bool isOfTheHost(const HTTPError& error) {
   using Kind = HTTPError::Kind;
   return error.kind != Kind::BadURL && error.kind != Kind::OutOfMemory;
@@ -38,7 +38,7 @@ void HTTPSchedule::add(Exchange exchange) noexcept {
     return;
   }
   Lane& lane = laneOf(*host, *exchange);
-  // Where nothing is about to find out whether the host is back, this post does.
+  // If no other attempt will show whether the host is back, this post does not wait.
   const bool mustWait = host->outage && host->activePosts + host->queuedPosts > 0;
   if (mustWait && !makeRoom(waitingBodies, *host, lane, exchange->bodySize(), _maximumWaiting)) {
     exchange->fail(httpError(host->outage->kind, host->outage->description));
@@ -193,7 +193,7 @@ HTTPSchedule::Exchange HTTPSchedule::takePost(Host& host, Lane& lane) noexcept {
   return post;
 }
 
-// Waits are spread for the sake of servers with many devices; one device goes on at once, oldest first.
+// Waits are spread to spare servers with many devices. One device's posts resume immediately, oldest first.
 void HTTPSchedule::bringBack(Host& host) noexcept {
   Retries back;
   for (auto each = _retries.begin(); each != _retries.end();) {
@@ -255,7 +255,8 @@ void HTTPSchedule::beginOutage(Host& host, const HTTPExchange& exchange, const H
   }
   host.outage = httpError(error.kind, error.description);
   if (exchange.firstAttempt + _policy.retryFor > now) return;
-  // While a host swallows connections, few attempts fill its slots; posts behind them would wait without end.
+  // While a host swallows connections, a few attempts occupy its slots, and the posts behind them would wait
+  // without end.
   for (auto& [owner, lane] : host.lanes) {
     while (!lane.posts.empty() && lane.posts.front()->started + _policy.retryFor <= now) {
       takePost(host, lane)->fail(httpError(error.kind, error.description));

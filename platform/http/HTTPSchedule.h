@@ -1,4 +1,4 @@
-// Which request goes out next: the queues of each host, and the posts that wait for another attempt.
+// Decides which request is sent next: the queues of each host, and the posts that wait for a retry.
 #pragma once
 
 #include <cstddef>
@@ -15,8 +15,9 @@
 
 namespace vesk {
 
-/// Owns every exchange that is not being transferred. What is given up is completed there and then. Used by
-/// the client's thread only; reads no clock. Without memory it gives up the exchange that it has none for.
+/// Owns every exchange that is not being transferred. Completes an exchange with an error as soon as it is
+/// abandoned. Used only by the client's thread; doesn't read a clock. Abandons an exchange if it runs out of
+/// memory for it.
 class HTTPSchedule {
  public:
   using Instant = HTTPExchange::Instant;
@@ -24,41 +25,41 @@ class HTTPSchedule {
 
   explicit HTTPSchedule(const HTTPClient::Options& options);
 
-  /// Queues a new exchange, or gives it up at once when too much waits already.
+  /// Queues a new exchange, or abandons it at once if too much is waiting already.
   void add(Exchange exchange) noexcept;
 
-  /// Brings back the posts whose wait is over, gives up the requests whose time ran out in a queue, and
-  /// forgets the hosts that nothing is to be sent to.
+  /// Resumes the posts whose wait is over, abandons queued requests whose time is up, and forgets hosts
+  /// without requests.
   void advance(Instant now) noexcept;
 
-  /// The next exchange that a connection is free for, or null. It counts against its host until `answered` or
-  /// `failed` is called with it.
+  /// The next exchange for which a connection is free, or null. It counts against its host's limit until
+  /// `answered` or `failed` is called with it.
   Exchange next(Instant now) noexcept;
 
   void answered(const HTTPExchange& exchange) noexcept;
 
-  /// The transport failed. Keeps the exchange when `mayRetry` and the retry policy allow another attempt, and
-  /// gives it up else.
+  /// The transport failed. Keeps the exchange if `mayRetry` is set and the retry policy allows another
+  /// attempt; otherwise abandons it.
   void failed(Exchange exchange, HTTPError error, bool mayRetry, Instant now) noexcept;
 
-  /// Gives up, with `Stopped`, all that waits and is no post.
+  /// Fails all waiting requests that are not posts with `Stopped`.
   void stopAllButPosts() noexcept;
-  /// Posts that wait for another attempt have it next.
+  /// Ends the waits of all posts that wait for a retry.
   void retryNow() noexcept;
-  /// Gives up, with `Stopped`, all that waits, for the end.
+  /// Fails everything that waits with `Stopped`.
   void stopAll() noexcept;
 
-  /// When `advance` has something to do next; nothing when only events from outside can change anything.
+  /// The time at which `advance` is due; nullopt if only external events can change anything.
   std::optional<Instant> nextAdvance() const noexcept;
 
  private:
-  /// An owner's posts to a host. It is kept as long as the host, so that a post can always come back to it.
+  /// An owner's posts to a host. Kept as long as the host, so that a post can always return to it.
   struct Lane {
     HTTPQueue posts;
-    std::size_t bodies = 0;  ///< bytes of those in `posts` and `_retries`
-    std::size_t cost = 0;    ///< and their memory
+    std::size_t bodies = 0;  ///< bytes of the posts in `posts` and `_retries`
+    std::size_t cost = 0;    ///< approximate memory of the same posts
   };
-  /// Its posts in `_retries` wait because of its outage.
+  /// During an outage, the host's posts wait in `_retries`.
   struct Host {
     HTTPQueue requests;
     std::map<std::uint32_t, Lane> lanes;  ///< by owner
@@ -66,38 +67,38 @@ class HTTPSchedule {
     std::size_t queuedPosts = 0;
     std::size_t active = 0;
     std::size_t activePosts = 0;
-    std::optional<HTTPError> outage;  ///< how the last attempt failed, until there is an answer again
+    std::optional<HTTPError> outage;  ///< the last attempt's error, until an answer arrives
   };
   using Hosts = std::map<std::string, Host, std::less<>>;
   using Retries = std::multimap<Instant, Exchange>;
   using Measure = std::size_t (*)(const Host&, const Lane&) noexcept;
 
   static std::size_t memory(const Host& host, const Lane& lane) noexcept;
-  /// Bytes of bodies that wait for their host to come back.
+  /// Bytes of bodies that wait for the host to come back.
   static std::size_t waitingBodies(const Host& host, const Lane& lane) noexcept;
   static bool isUnused(const Hosts::value_type& entry) noexcept;
 
-  /// With the lane of a post. Null when there is no memory for new ones.
+  /// Also creates the lane for a post. Returns null if out of memory.
   Host* hostFor(const HTTPExchange& exchange) noexcept;
-  /// Of an exchange that the schedule has taken.
+  /// For an exchange that the schedule has accepted.
   Host& hostOf(const HTTPExchange& exchange) noexcept;
   static Lane& laneOf(Host& host, const HTTPExchange& exchange) noexcept;
 
-  /// It is counted in its lane already.
+  /// The post must already be counted in its lane.
   static void queueFirst(Host& host, Exchange post) noexcept;
-  /// Null when none is queued.
+  /// Returns null if no post is queued.
   static Exchange takePost(Host& host) noexcept;
   static Exchange takePost(Host& host, Lane& lane) noexcept;
   void bringBack(Host& host) noexcept;
 
-  /// Whether so much more fits into `bound`, when fuller lanes give way to this one.
+  /// Whether `size` more bytes fit within `bound`, after dropping posts from fuller lanes if necessary.
   bool makeRoom(Measure measure, const Host& host, const Lane& lane, std::size_t size,
                 std::size_t bound) noexcept;
   void dropOne(Host& host, Lane& lane) noexcept;
 
   void release(Host& host, const HTTPExchange& exchange) noexcept;
   void beginOutage(Host& host, const HTTPExchange& exchange, const HTTPError& error, Instant now) noexcept;
-  /// Whether `exchange` was taken, to be tried again.
+  /// Returns true if it took `exchange` for a retry.
   bool keepForRetry(Host& host, Exchange& exchange, Instant now) noexcept;
 
   const RetryPolicy _policy;

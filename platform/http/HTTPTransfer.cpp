@@ -61,7 +61,7 @@ Kind kindOf(CURLcode code) {
   }
 }
 
-/// Whether a failure without an answer is one that passes.
+/// Whether a failure without an answer is temporary.
 bool passes(CURLcode code, CURL* easy) {
   switch (kindOf(code)) {
     case Kind::Connect:
@@ -69,12 +69,12 @@ bool passes(CURLcode code, CURL* easy) {
     case Kind::Interrupted:
       return true;
     case Kind::TLS:
-      // A server that goes down in the middle of the handshake, or a certificate that can't be verified: a
-      // captive portal shows its own until the user has logged in.
+      // The server may have gone down during the handshake. A certificate that can't be verified may come
+      // from a captive portal before the user has logged in.
       return code == CURLE_SSL_CONNECT_ERROR || code == CURLE_PEER_FAILED_VERIFICATION ||
              code == CURLE_SSL_ISSUER_ERROR || code == CURLE_SSL_INVALIDCERTSTATUS;
     case Kind::Timeout: {
-      // Only when the request was not even sent: a server that has it may still be at work on it.
+      // Only if the request was not sent: a server that has it may still be processing it.
       curl_off_t sent = 0;
       curl_easy_getinfo(easy, CURLINFO_PRETRANSFER_TIME_T, &sent);
       return sent == 0;
@@ -94,7 +94,7 @@ void HTTPHeaderLines::clear() {
 void HTTPHeaderLines::add(std::string_view name, std::string_view value) {
   _starts.push_back(_text.size());
   _text += name;
-  // This is how libcurl wants a header that is sent without a value.
+  // libcurl's form for a header without a value.
   value = trimmed(value);
   if (value.empty()) {
     _text += ';';
@@ -131,7 +131,7 @@ HTTPTransfer::HTTPTransfer(const HTTPClient::Options& options, const std::option
   set(easy, CURLOPT_FOLLOWLOCATION, 0L);
   set(easy, CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_2TLS));
   set(easy, CURLOPT_USERAGENT, options.userAgent.c_str());
-  // A name server that does not answer must hold up neither the other requests nor the end of the process.
+  // A name server that does not answer must not delay other requests or the end of the process.
   set(easy, CURLOPT_QUICK_EXIT, 1L);
   if (authorities) {
     set(easy, CURLOPT_CAINFO, authorities->c_str());
@@ -161,7 +161,8 @@ std::optional<HTTPError> HTTPTransfer::prepare(std::unique_ptr<HTTPExchange>& ex
   _errorText[0] = '\0';
 
   set(handle(), CURLOPT_URL, request.url.c_str());
-  // libcurl resends on its own what a kept connection lost; what must not be sent twice gets a new one.
+  // libcurl resends a request that failed on a kept connection. Requests that must not be sent twice get a
+  // new connection.
   set(handle(), CURLOPT_FRESH_CONNECT, exchange->isPost() ? 0L : 1L);
   setMethod(request);
   setHeaders(request);
@@ -239,7 +240,7 @@ HTTPError HTTPTransfer::errorFrom(CURLcode code) const noexcept {
   return httpError(kindOf(code), _errorText[0] ? _errorText : curl_easy_strerror(code));
 }
 
-// An exception that went through libcurl would leave all of its transfers inside a callback for ever.
+// An exception thrown through libcurl would leave all of its transfers inside a callback for ever.
 template <HTTPTransfer::Add add>
 std::size_t HTTPTransfer::receive(char* bytes, std::size_t size, std::size_t count, void* transfer) noexcept {
   auto* self = static_cast<HTTPTransfer*>(transfer);
@@ -251,7 +252,7 @@ std::size_t HTTPTransfer::receive(char* bytes, std::size_t size, std::size_t cou
   }
 }
 
-// Only posts are sent again; the others rather wait for as long as they may.
+// Only for posts, which are sent again. Other requests should use their whole timeout.
 int HTTPTransfer::prepareSocket(void* transfer, curl_socket_t socket, curlsocktype) noexcept {
   const auto* self = static_cast<const HTTPTransfer*>(transfer);
   const auto limit = static_cast<unsigned>(self->_acknowledgedWithin.count());
@@ -265,7 +266,7 @@ bool HTTPTransfer::addHeader(std::string_view line) {
   _tooLarge = _headerBytes > kMaximumHeaders;
   if (_tooLarge) return false;
   if (line.starts_with("HTTP/")) {
-    // An interim answer came before; only the final one counts.
+    // Discards the headers of a preceding interim answer.
     _response.headers.clear();
     return true;
   }

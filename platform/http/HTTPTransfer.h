@@ -1,4 +1,4 @@
-// One libcurl easy handle, which carries one exchange after another.
+// A libcurl easy handle that carries one exchange after another.
 #pragma once
 
 #include <curl/curl.h>
@@ -16,13 +16,13 @@
 
 namespace vesk {
 
-/// The header lines of one request in the form that libcurl reads, in two allocations that are kept from one
-/// request to the next.
+/// The header lines of a request in libcurl's form. Uses two allocations, which are reused for the next
+/// request.
 class HTTPHeaderLines {
  public:
   void clear();
   void add(std::string_view name, std::string_view value);
-  /// Tells libcurl not to add a header of its own.
+  /// Prevents libcurl from adding this header.
   void suppress(std::string_view name);
   /// Valid until the next change.
   curl_slist* link();
@@ -33,28 +33,28 @@ class HTTPHeaderLines {
   std::vector<curl_slist> _nodes;
 };
 
-/// Used by the client's thread only. Holds no more than one exchange at a time, which owns the bytes of the
-/// body while they are sent.
+/// Used only by the client's thread. Holds at most one exchange, which owns the body's bytes while they are
+/// sent.
 class HTTPTransfer {
  public:
   struct Outcome {
     HTTPResult result;
-    bool answered = false;  ///< some part of an answer arrived
-    bool mayRetry = false;  ///< nothing of an answer arrived, and another attempt may do better
+    bool answered = false;  ///< part of an answer arrived
+    bool mayRetry = false;  ///< no part of an answer arrived, and another attempt may succeed
   };
 
-  /// `authorities`: file of the certificate authorities, or the system's. Throws std::bad_alloc.
+  /// `authorities`: the file of certificate authorities; nullopt for the system's. Throws std::bad_alloc.
   HTTPTransfer(const HTTPClient::Options& options, const std::optional<std::string>& authorities);
 
   CURL* handle() const noexcept { return _easy.get(); }
   bool isBusy() const noexcept { return _exchange != nullptr; }
   bool isPost() const noexcept { return _exchange && _exchange->isPost(); }
 
-  /// Makes the handle ready to send `exchange` and takes it over, unless there is an error: then it can't be
-  /// sent. Throws std::bad_alloc.
+  /// Prepares the handle for `exchange` and takes ownership of it. Returns an error, and leaves the exchange
+  /// with the caller, if it can't be sent. Throws std::bad_alloc.
   std::optional<HTTPError> prepare(std::unique_ptr<HTTPExchange>& exchange, HTTPExchange::Instant now);
 
-  /// What became of it, once libcurl is done with the handle.
+  /// The outcome, once libcurl has finished with the handle.
   Outcome finish(CURLcode code) noexcept;
 
   std::unique_ptr<HTTPExchange> release() noexcept { return std::move(_exchange); }

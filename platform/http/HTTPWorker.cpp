@@ -19,7 +19,7 @@ namespace {
 constexpr long kKeptConnections = 32;
 
 CURLM* makeMulti(std::size_t connectionsPerHost) {
-  // The library is never shut down: other parts of the process may use it too.
+  // libcurl is never shut down, since other parts of the process may use it.
   static const CURLcode initialised = curl_global_init(CURL_GLOBAL_DEFAULT);
   CURLM* multi = initialised == CURLE_OK ? curl_multi_init() : nullptr;
   if (!multi) throw std::runtime_error("HTTPClient: libcurl can not be initialised");
@@ -28,7 +28,7 @@ CURLM* makeMulti(std::size_t connectionsPerHost) {
   return multi;
 }
 
-// Signals are for the main thread; a broken pipe shows as an error where it happens.
+// Signals are handled by the main thread. A broken pipe shows as a write error.
 void blockSignals() {
   sigset_t all;
   sigfillset(&all);
@@ -69,7 +69,7 @@ void HTTPClient::Worker::start(HTTPRequest& request, Completion& completion) {
   bool mustWake;
   {
     MutexLock lock(_mutex);
-    // What lies in the inbox already has woken the thread.
+    // If the inbox is not empty, the thread has already been woken.
     mustWake = _inbox.empty();
     _inbox.pushBack(std::move(exchange));
   }
@@ -92,7 +92,7 @@ bool HTTPClient::Worker::turn() noexcept {
   int running = 0;
   curl_multi_perform(_multi.get(), &running);
   bool freed = collectFinished();
-  // What ended made room: the next request starts before the thread sleeps.
+  // Ended transfers made room, so the next request starts before the thread sleeps.
   if (!freed) sleep();
   return true;
 }
@@ -176,7 +176,7 @@ void HTTPClient::Worker::sleep() noexcept {
   CURLMcode code = curl_multi_poll(_multi.get(), nullptr, 0, timeout, nullptr);
   if (code != CURLM_OK) {
     VESK_LOG_ERROR("HTTPClient: %s", curl_multi_strerror(code));
-    std::this_thread::sleep_for(std::chrono::milliseconds(100));  // it can't be waited for at present
+    std::this_thread::sleep_for(std::chrono::milliseconds(100));  // waiting is not possible at the moment
   }
 }
 
@@ -203,7 +203,7 @@ void HTTPClient::Worker::stop() noexcept {
   }
   _schedule.stopAll();
   for (bool more = true; more;) {
-    // A completion may have asked for more.
+    // A completion may have started further requests.
     HTTPQueue arrived;
     {
       MutexLock lock(_mutex);

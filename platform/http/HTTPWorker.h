@@ -18,18 +18,18 @@
 
 namespace vesk {
 
-/// Takes requests from any thread through an inbox and carries them out on a thread of its own, which sleeps
-/// without any timeout while there is nothing to do. A want of memory ends the one exchange that suffers from
-/// it: nothing that runs on the thread lets an exception out.
+/// Accepts requests from any thread through an inbox and performs them on its own thread, which sleeps
+/// without a timeout while idle. Running out of memory ends only the exchange concerned; no exception leaves
+/// the thread.
 class HTTPClient::Worker {
  public:
-  /// `postsOnly`: outlives it; who sets it calls `wake`.
+  /// `postsOnly` must outlive the worker; call `wake` after setting it.
   Worker(Options options, std::optional<std::string> authorities, const std::atomic<bool>& postsOnly);
   ~Worker();
   Worker(const Worker&) = delete;
   Worker& operator=(const Worker&) = delete;
 
-  /// Takes both over, unless it throws std::bad_alloc.
+  /// Takes ownership of both, unless it throws std::bad_alloc.
   void start(HTTPRequest& request, Completion& completion);
   void wake() noexcept;
   bool waitUntilIdle(std::chrono::milliseconds timeout) { return _outstanding.waitUntilNone(timeout); }
@@ -41,7 +41,7 @@ class HTTPClient::Worker {
   };
 
   void run() noexcept;
-  /// One round; false when it is time to stop.
+  /// One iteration. Returns false when it is time to stop.
   bool turn() noexcept;
   void stop() noexcept;
 
@@ -49,27 +49,27 @@ class HTTPClient::Worker {
   void stopAllButPosts() noexcept;
   void startReady() noexcept;
   void begin(Exchange exchange) noexcept;
-  /// Whether any transfer ended.
+  /// Returns true if any transfer ended.
   bool collectFinished() noexcept;
   void conclude(HTTPTransfer& transfer, CURLcode code) noexcept;
   void sleep() noexcept;
   HTTPTransfer& idleTransfer();
-  /// Takes a busy transfer out of libcurl's hands; gives what it carried.
+  /// Removes a busy transfer from libcurl and returns its exchange.
   Exchange interrupt(HTTPTransfer& transfer) noexcept;
 
   // Constant after construction.
   const Options _options;
   std::optional<std::string> _authorities;
-  std::unique_ptr<CURLM, FreeMulti> _multi;  ///< the client's thread's, but for waking it up
+  std::unique_ptr<CURLM, FreeMulti> _multi;  ///< used by the client's thread, except for waking it
   const std::atomic<bool>& _postsOnly;
 
-  HTTPOutstanding _outstanding;  // before all that holds exchanges
+  HTTPOutstanding _outstanding;  // declared before everything that holds exchanges
 
-  // The client's thread only.
+  // Only used by the client's thread.
   HTTPSchedule _schedule;
   std::vector<std::unique_ptr<HTTPTransfer>> _transfers;
   bool _hasStoppedOthers = false;
-  std::vector<HTTPTransfer*> _idle;  ///< those of `_transfers` that hold no exchange; has room for all
+  std::vector<HTTPTransfer*> _idle;  ///< those of `_transfers` without an exchange; has capacity for all
 
   Mutex _mutex;
   HTTPQueue _inbox VESK_GUARDED_BY(_mutex);

@@ -12,7 +12,7 @@ std::optional<RetryPolicy::Duration> RetryPolicy::waitAfter(unsigned failures, I
   Duration wait = std::min(firstWait, longestWait);
   for (unsigned i = 1; i < failures && wait < longestWait; ++i) wait = std::min(wait * 2, longestWait);
   auto spread = std::chrono::duration_cast<Duration>(wait * (0.5 + random));
-  // The last attempt is made when the time is up, not left out because a whole wait no longer fits.
+  // The last attempt is made at the time limit, even if a full wait no longer fits.
   return std::min(spread, left);
 }
 
