@@ -1,4 +1,4 @@
-// Locks that processes share by the name of a file.
+// Locks between processes, identified by a file's path.
 #pragma once
 
 #include <chrono>
@@ -8,9 +8,10 @@
 
 namespace vesk {
 
-/// Opens the file at `path`, made as `makePrivateFile` does where it is missing, and locks it until `lock` is
-/// closed, against other processes and other descriptors of this one. Waits `patience` at most for another's
-/// lock to go. 0 or the system's error number, EWOULDBLOCK when another kept the lock; `lock` is empty then.
+/// Opens the file at `path`, creating it like `makePrivateFile` if missing, and locks it until `lock` is
+/// closed. The lock excludes other processes and other descriptors of this one. Waits up to `patience` for
+/// another holder. Returns 0 or the error number, EWOULDBLOCK if the lock is still held; `lock` is empty
+/// then.
 [[nodiscard]] int lockFile(FileDescriptor& lock, const std::string& path, std::chrono::milliseconds patience);
 
 }  // namespace vesk

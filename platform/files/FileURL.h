@@ -1,4 +1,4 @@
-// File URLs, as clients name the files that they upload.
+// File URLs, with which clients name the files that they upload.
 #pragma once
 
 #include <string>
@@ -6,8 +6,8 @@
 
 namespace vesk {
 
-/// The path of a file URL, with %XX decoded. Text without the scheme "file" counts as a path. Empty when the
-/// URL names another host, or when a decoded byte would be NUL.
+/// Returns the percent-decoded path of a file URL. Text without the scheme "file" is taken as a path. Returns
+/// an empty string if the URL names another host or a decoded byte would be NUL.
 std::string pathFromFileURL(std::string_view url);
 
 }  // namespace vesk

@@ -1,4 +1,4 @@
-// Descriptors of a library, in a process that may close them.
+// Descriptors of a library whose host process may close them.
 #pragma once
 
 #include <sys/stat.h>
@@ -9,8 +9,8 @@
 
 namespace vesk {
 
-/// Tells the file behind a descriptor from one that took over its number. Not for files without an inode of
-/// their own (eventfd, epoll).
+/// Identifies the file behind a descriptor, to notice if another file took over its number. Not for files
+/// without an inode of their own (eventfd, epoll).
 class DescriptorIdentity {
  public:
   DescriptorIdentity() noexcept = default;
@@ -30,8 +30,8 @@ class DescriptorIdentity {
   ino_t _inode = 0;
 };
 
-/// Owns a descriptor whose number the host may have closed (closefrom(3)) and given to a file of its own:
-/// such a number is left alone.
+/// Owns a descriptor that the host may have closed with closefrom(3). If the host has reused the number for
+/// another file, the destructor leaves that file open.
 class GuardedDescriptor {
  public:
   GuardedDescriptor() noexcept = default;
@@ -47,9 +47,9 @@ class GuardedDescriptor {
   }
   ~GuardedDescriptor() { letGo(); }
 
-  /// Whether it was given one.
+  /// Whether it holds a descriptor, which the host may have closed.
   explicit operator bool() const noexcept { return static_cast<bool>(_descriptor); }
-  /// Whether that is still open. A moment later it may not be.
+  /// Whether the descriptor is still open. The host may close it at any time.
   bool isOurs() const noexcept { return _identity.isAt(_descriptor.get()); }
   int get() const noexcept { return _descriptor.get(); }
 

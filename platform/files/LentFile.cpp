@@ -25,8 +25,8 @@ bool LentFile::isRegularAt(const std::string& path) const {
   if (::lstat(path.c_str(), &named) == 0) return S_ISREG(named.st_mode);
   if (errno != ENOENT) return true;
   const std::string parent = path.substr(0, path.rfind('/') + 1);
-  // A directory in which it is missing may be another one than the client sees under that path, as with
-  // PrivateTmp=. The kernel knows by which path the client opened its file.
+  // If the file is missing there, the client may see another directory under that path, as with PrivateTmp=.
+  // The kernel knows the path by which the client opened the file.
   return ::stat(parent.c_str(), &named) != 0 || wasOpenedAt(path);
 }
 
@@ -56,7 +56,7 @@ bool LentFile::removeFrom(const std::string& path, uid_t user) const {
   if (user != _status.st_uid && user != ::geteuid()) return false;
   auto slash = path.rfind('/');
   if (slash == std::string::npos) return false;
-  // The directory is held, so that both steps are about the same one whatever becomes of its path.
+  // Holds the directory open, so that both steps use the same one even if its path changes.
   const std::string parent(path, 0, slash + 1);
   FileDescriptor directory(::open(parent.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
   if (!directory) return false;

@@ -1,4 +1,4 @@
-// A file that a client has opened and lent: its bytes come through the descriptor, never by its path.
+// A file that a client opened and passed as a descriptor. Its bytes are read through the descriptor only.
 #pragma once
 
 #include <sys/stat.h>
@@ -12,34 +12,34 @@
 
 namespace vesk {
 
-/// The file is the client's, who may do anything to it meanwhile. Everything here is therefore said of the
-/// file as it was when this object was made. Used by one thread.
+/// The client may change its file at any time, so everything here refers to the file's state when this object
+/// was created. Not thread-safe.
 class LentFile {
  public:
-  /// Takes the descriptor, which may be none.
+  /// Takes ownership of the descriptor, which may be empty.
   explicit LentFile(FileDescriptor descriptor) noexcept;
 
-  /// Whether it is a regular file, still has a name, and `path` names a regular file. A path that this
-  /// process can't see, because of rights or of mounts of its own, is believed.
+  /// Whether the descriptor is a regular file that still has a name, and `path` names a regular file. A path
+  /// that this process can't see, because of permissions or its own mounts, is trusted.
   bool isRegularAt(const std::string& path) const;
 
-  /// Bytes.
+  /// Size in bytes.
   std::uint64_t size() const noexcept { return static_cast<std::uint64_t>(_status.st_size); }
 
   enum class Reading : unsigned char {
     Whole,
-    Unreadable,  ///< the client itself could not read it, or the device fails
-    Shrank,      ///< it has fewer bytes than it had
-    GivenUp      ///< `goOn` said so
+    Unreadable,  ///< the client itself could not read it, or the device failed
+    Shrank,      ///< it is shorter than before
+    GivenUp      ///< `goOn` returned false
   };
-  /// Reads the first `size()` bytes, however many follow by now; `bytes` is of no use unless they are Whole.
-  /// Leaves the client's position in the file alone. `goOn` is asked before each piece: the file's device may
-  /// be as slow as its client likes. Throws std::bad_alloc.
+  /// Reads the first `size()` bytes, even if the file has grown. `bytes` is only valid if the result is
+  /// Whole. Keeps the client's file position. Calls `goOn` before each piece, since the file's device may be
+  /// arbitrarily slow. Throws std::bad_alloc.
   [[nodiscard]] Reading read(std::string& bytes, const std::function<bool()>& goOn) const;
 
-  /// Removes the file from `path` when that still names this very file, unchanged, and when `user` owns it or
-  /// is this process's own user. False when it was left, for whatever reason. Whoever could make `path` name
-  /// another file between the look and the removal can remove files there himself.
+  /// Removes the file from `path` if that still names this unchanged file and its owner is `user` or this
+  /// process's user. Returns false if the file was not removed. The check and the removal are not atomic, but
+  /// anyone who could exchange the file in between has the right to remove it.
   bool removeFrom(const std::string& path, uid_t user) const;
 
  private:

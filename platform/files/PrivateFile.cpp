@@ -13,8 +13,8 @@ FileDescriptor makePrivateFile(const std::string& path) {
   struct stat directory {};
   if (file && ::geteuid() == 0 &&
       ::stat(std::filesystem::path(path).parent_path().c_str(), &directory) == 0) {
-    // Only what was made just now is given away: what stood there before could be anybody's. Without the
-    // right to do so it stays root's.
+    // Changes the owner of a newly created file only; an existing file could be anyone's. If this is not
+    // permitted, root keeps the file.
     static_cast<void>(::fchown(file.get(), directory.st_uid, directory.st_gid) == 0);
   }
   return file;

@@ -1,4 +1,4 @@
-// Files that a program makes for itself.
+// Creates files for the program's own use.
 #pragma once
 
 #include <string>
@@ -7,9 +7,9 @@
 
 namespace vesk {
 
-/// Makes a file at `path`, where nothing may stand yet (EEXIST), of mode 0600 and open for reading and
-/// writing. Root may come before the user whose directory it is, so what root makes belongs to the
-/// directory's owner. None, with errno.
+/// Creates a file at `path` with mode 0600, opened for reading and writing. Fails with EEXIST if something
+/// exists there. If root creates it, it belongs to the directory's owner, since that user needs it later.
+/// Returns an empty descriptor, with errno set, on failure.
 [[nodiscard]] FileDescriptor makePrivateFile(const std::string& path);
 
 }  // namespace vesk

@@ -12,8 +12,8 @@ std::string normalized(std::string_view prefix) {
 }
 
 std::string& storage() {
-  // Never destroyed: a session may be made while the process exits. The client library asks in any program:
-  // who starts a setuid one must not choose its daemon and files.
+  // Never destroyed: a session may be created while the process exits. Since the client library runs in any
+  // program, the caller of a setuid program must not be able to choose its daemon and files.
   static std::string& prefix = *new std::string([] {
     const char* fromEnvironment = ::secure_getenv("VESKREPORTINGD_ROOT");
     return normalized(fromEnvironment ? fromEnvironment : "");

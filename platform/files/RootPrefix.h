@@ -1,4 +1,4 @@
-// Where the daemon's files stand: every path of the project is written as on a device and resolved here.
+// The root prefix: paths in this project are written as on a device and resolved here.
 #pragma once
 
 #include <string>
@@ -6,20 +6,19 @@
 
 namespace vesk {
 
-/// The directory that stands for "/" (without a trailing slash; "" is the real root). What `setRootPrefix`
-/// set, else the environment variable VESKREPORTINGD_ROOT, else the real root. A program that runs with more
-/// rights than its caller (setuid, setgid, file capabilities) ignores the variable. Thread-safe after
-/// start-up.
+/// The directory that replaces "/", without a trailing slash; empty for the real root. Set by
+/// `setRootPrefix`, otherwise by the environment variable VESKREPORTINGD_ROOT. A program with more privileges
+/// than its caller (setuid, setgid, file capabilities) ignores the variable. Thread-safe after start-up.
 const std::string& rootPrefix();
 
-/// Called once, first thing in `main`, before any thread starts.
+/// Call at most once, at the beginning of `main`, before any thread starts.
 void setRootPrefix(std::string_view prefix);
 
-/// `path` (absolute) under the root prefix.
+/// Returns `path`, which must be absolute, below the root prefix.
 std::string pathUnderRoot(std::string_view path);
 
-/// Whether `name`, with an ending of ours behind it, names a file of the directory that it is put behind: not
-/// empty, without "/" and NUL, no leading ".".
+/// Whether `name` plus an extension is safe as a file name within a directory: not empty, no "/" or NUL, no
+/// leading ".".
 bool isPlainFileName(std::string_view name) noexcept;
 
 }  // namespace vesk

@@ -29,7 +29,7 @@ SmallFile readSmallFile(const std::string& path, std::size_t limit,
   if (std::string reason = objection ? objection(status) : std::string(); !reason.empty())
     return {std::nullopt, false, std::move(reason)};
 
-  // The size that the file system gives is only a hint: files of the kernel say 4096 or 0.
+  // The size from fstat is only a hint: kernel files report 4096 or 0.
   std::string bytes;
   char chunk[8192];
   while (true) {

@@ -14,7 +14,7 @@ namespace vesk {
 
 namespace {
 
-/// Why the file is not trusted; "" when it is.
+/// The reason why the file is not trusted; "" if it is trusted.
 std::string distrust(const struct stat& status, TrustedOwner owner) {
   const bool mayBeOwn = owner == TrustedOwner::OwnUser || !rootPrefix().empty();
   if (status.st_uid != 0 && !(mayBeOwn && status.st_uid == ::geteuid()))
@@ -27,7 +27,7 @@ std::string distrust(const struct stat& status, TrustedOwner owner) {
 
 void reportOnce(const std::string& path, const std::string& reason) {
   static Mutex mutex;
-  static std::set<std::string>& reported = *new std::set<std::string>;  // used until the process is gone
+  static std::set<std::string>& reported = *new std::set<std::string>;  // never destroyed
   {
     MutexLock lock(mutex);
     if (!reported.insert(path + '\n' + reason).second) return;

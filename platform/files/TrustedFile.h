@@ -1,4 +1,4 @@
-// Reads files that decide what the process trusts.
+// Reads files that determine what the process trusts.
 #pragma once
 
 #include <cstddef>
@@ -8,15 +8,15 @@
 
 namespace vesk {
 
-/// Who, besides root, may own a file that is trusted.
+/// Who may own a trusted file, besides root.
 enum class TrustedOwner : unsigned char {
-  Root,     ///< no other user; under a root prefix, the process's own user
+  Root,     ///< no other user; with a root prefix, also the process's own user
   OwnUser,  ///< the process's own user
 };
 
-/// As `readSmallFile`, but refuses a file that has another owner, or that its group or others may write to. A
-/// refusal is logged once in the life of the process, in a level-4 line with path and reason; its outcome is
-/// marked as `reported`.
+/// Like `readSmallFile`, but refuses a file with another owner or that is writable by its group or others.
+/// Logs each refusal once in the life of the process, in a level-4 line with path and reason, and marks the
+/// outcome as `reported`.
 SmallFile readTrustedFile(const std::string& path, std::size_t limit,
                           TrustedOwner owner = TrustedOwner::Root);
 

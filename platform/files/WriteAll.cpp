@@ -11,7 +11,7 @@ int writeAll(int descriptor, std::string_view bytes) noexcept {
     const ssize_t count = ::write(descriptor, bytes.data(), bytes.size());
     if (count < 0 && errno == EINTR) continue;
     if (count < 0) return errno;
-    if (count == 0) return EIO;  // no progress, and no reason given: trying again might never end
+    if (count == 0) return EIO;  // no progress and no error: retrying might never end
     bytes.remove_prefix(static_cast<std::size_t>(count));
   }
   return 0;
