@@ -3,7 +3,7 @@
 
 namespace vesk {
 
-/// Levels are the syslog priorities of the same numbers.
+/// The values are syslog priorities.
 enum class LogLevel : int { Error = 3, Warning = 4, Info = 6, Debug = 7 };
 
 }  // namespace vesk

@@ -8,7 +8,7 @@ namespace vesk {
 
 namespace {
 
-// Between two walks over all entries.
+// The minimum interval between two passes over all entries.
 constexpr std::chrono::seconds kLeastPause{1};
 
 }  // namespace
@@ -39,7 +39,7 @@ std::vector<LogRateLimit::LeftOut> LogRateLimit::takeAll() {
   return leftOut;
 }
 
-/// Forgets the windows that are over at `until`.
+/// Removes the windows that have ended by `until`.
 void LogRateLimit::endWindows(Time until, std::vector<LeftOut>& leftOut) {
   _nextEnd = Time::max();
   for (auto next = _entries.begin(); next != _entries.end();) {

@@ -1,4 +1,4 @@
-// How many lines a place in the code may log for a user.
+// Limits how many lines one place in the code may log for one user.
 #pragma once
 
 #include <chrono>
@@ -13,23 +13,23 @@
 
 namespace vesk {
 
-/// Lets the first lines of each call site and user through in every window, and counts the rest, so that a
-/// client's flood neither fills the log nor silences anybody else's lines. A function of the times that it is
-/// given. Thread-safe; its lock is held for a look-up only.
+/// Admits the first lines of each call site and user in every window and counts the rest, so that one client
+/// can't flood the log or suppress the lines of others. Depends only on the times it is given. Thread-safe;
+/// holds its lock only for a look-up.
 class LogRateLimit {
  public:
   using Time = std::chrono::steady_clock::time_point;
 
-  /// A window begins with its first line; the next one may begin up to a second late.
+  /// A window begins with its first line. The next one may begin up to a second late.
   static constexpr std::chrono::seconds kWindow{10};
-  /// Sites times users that logged within a window. Those in excess share one entry.
+  /// Limit on pairs of site and user within a window. Further pairs share one entry.
   static constexpr std::size_t kMaximumEntries = 4096;
 
-  /// What was left out in a window that is over.
+  /// The lines left out in a window that has ended.
   struct LeftOut {
     LogLevel level;
-    std::uint32_t user;  ///< LogUser::kNobody for the process itself and for those in excess
-    const char* format;  ///< of the lines
+    std::uint32_t user;  ///< LogUser::kNobody for the process itself and for the shared entry
+    const char* format;  ///< format of the lines
     std::uint64_t lines;
 
     friend bool operator==(const LeftOut&, const LeftOut&) = default;
@@ -37,16 +37,16 @@ class LogRateLimit {
 
   struct Verdict {
     bool mayWrite = false;
-    std::vector<LeftOut> leftOut{};  ///< to be told before the line
+    std::vector<LeftOut> leftOut{};  ///< to be reported before the line
   };
 
-  /// `lines`: for each site and user in a window, more than 0.
+  /// `lines`: how many lines to admit for each site and user in a window; must not be 0.
   explicit LogRateLimit(std::uint64_t lines) : _lines(lines) {}
 
-  /// A line of the call at `site`, which has a `format` that lives as long as the process.
+  /// Decides about a line of the call at `site`. Its `format` must live as long as the process.
   [[nodiscard]] Verdict admit(const void* site, std::uint32_t user, LogLevel level, const char* format,
                               Time now);
-  /// At the end: all that was left out and not told yet.
+  /// At the end: everything left out that was not reported yet.
   [[nodiscard]] std::vector<LeftOut> takeAll();
 
  private:
@@ -64,7 +64,7 @@ class LogRateLimit {
   const std::uint64_t _lines;
   Mutex _mutex;
   Entries _entries VESK_GUARDED_BY(_mutex);
-  Time _nextEnd VESK_GUARDED_BY(_mutex) = Time::max();  ///< of a window
+  Time _nextEnd VESK_GUARDED_BY(_mutex) = Time::max();  ///< end of the next window
 };
 
 }  // namespace vesk

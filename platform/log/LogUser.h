@@ -1,4 +1,4 @@
-// On whose behalf a thread works.
+// The user on whose behalf a thread works.
 #pragma once
 
 #include <cstdint>
@@ -6,8 +6,8 @@
 
 namespace vesk {
 
-/// While it lives, the lines that this thread logs count as those of a client's user (see
-/// SystemLog::setRateLimit). May be nested; work that is handed to another thread takes it along (WorkQueue,
+/// During its lifetime, lines that this thread logs count as lines of a client's user (see
+/// SystemLog::setRateLimit). May be nested. Work that is handed to another thread keeps its user (WorkQueue,
 /// HTTPClient).
 class LogUser {
  public:

@@ -14,7 +14,7 @@ namespace vesk {
 
 namespace {
 
-/// Holds SIGPIPE back from this thread. What the process itself does about the signal is its own business.
+/// Suppresses SIGPIPE for this thread and leaves the process's handling of the signal alone.
 class NoBrokenPipe {
  public:
   NoBrokenPipe() noexcept {
@@ -29,7 +29,7 @@ class NoBrokenPipe {
   NoBrokenPipe(const NoBrokenPipe&) = delete;
   NoBrokenPipe& operator=(const NoBrokenPipe&) = delete;
 
-  /// A write has raised the signal: it must not come once this object goes.
+  /// Call after a write has raised the signal, so that it is not delivered when this object is destroyed.
   void takeBack() noexcept {
     const timespec atOnce{};
     while (!_wasPending && ::sigtimedwait(&_signal, nullptr, &atOnce) < 0 && errno == EINTR) {
@@ -51,7 +51,7 @@ bool hasRoom(std::chrono::milliseconds patience) noexcept {
     ready = ::poll(&standardError, 1, limit);
   } while (ready < 0 && errno == EINTR);
   isStuck.store(ready == 0, std::memory_order_relaxed);
-  return standardError.revents == POLLOUT;  // and no error beside it: the reader has not gone
+  return standardError.revents == POLLOUT;  // an error beside it means that the reader is gone
 }
 
 }  // namespace

@@ -1,4 +1,4 @@
-// Lines on the standard error that a process shares with others.
+// Writes lines to the standard error that a process shares with others.
 #pragma once
 
 #include <chrono>
@@ -6,11 +6,11 @@
 
 namespace vesk {
 
-/// Writes `line` and a line's end in one piece, so that lines of several threads and processes do not mix. It
-/// waits at most `patience` for a reader that is behind, and then not again before that reader has caught up;
-/// a line without room is lost. Raises no SIGPIPE. Without patience a line is cut to what the smallest room
-/// of a pipe is sure to hold (PIPE_BUF, 4096 bytes), because the rest would have to wait. What remains is a
-/// writer on another thread or in another process that takes the room between the look at it and the write.
+/// Writes `line` with a line end in one piece, so that lines of several threads and processes don't mix.
+/// Waits up to `patience` for a slow reader, then not again until that reader has caught up. A line without
+/// room is lost. Raises no SIGPIPE. Without patience, a line is cut to PIPE_BUF (4096 bytes), because the
+/// rest might have to wait. The call can still block if another thread or process fills the pipe between the
+/// check and the write.
 void writeToStandardError(std::string line, std::chrono::milliseconds patience);
 
 }  // namespace vesk

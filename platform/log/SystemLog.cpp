@@ -28,9 +28,9 @@ struct LogState {
   bool toJournal = false;
 };
 
-// Replaced as a whole and read without a lock: a line is written from any thread, also under other locks.
-// States are few and are kept for ever, because a thread may still be reading an old one, even during process
-// exit.
+// Replaced as a whole and read without a lock, since lines are written from any thread, also under other
+// locks. The few states are never freed, because a thread may still be reading an old one, even during
+// process exit.
 std::atomic<const LogState*>& state() {
   static const LogState* initial = new LogState;
   static std::atomic<const LogState*> current{initial};
@@ -108,7 +108,7 @@ void emitLeftOut(const std::vector<LogRateLimit::LeftOut>& all, std::chrono::mil
   }
 }
 
-// None without a limit. Kept for ever, as states are.
+// Null without a limit. Never freed, like the states.
 std::atomic<LogRateLimit*> rateLimit{nullptr};
 
 }  // namespace
@@ -136,7 +136,7 @@ void SystemLog::close() noexcept {
     if (auto* limit = rateLimit.load()) emitLeftOut(limit->takeAll(), patience());
     changeState([](LogState& log) { log = LogState{{}, {}, log.sink, false}; });
   } catch (...) {
-    // Out of memory while stopping: the old state serves as well.
+    // Out of memory while closing: the old state stays.
   }
 }
 
@@ -169,7 +169,7 @@ void SystemLog::write(LogLevel level, const char& site, const char* format, ...)
     va_end(again);
     emit(level, line, patience());
   } catch (...) {
-    // A line that can't be formatted for want of memory is lost; the caller goes on.
+    // Out of memory: the line is lost and the caller continues.
   }
 }
 

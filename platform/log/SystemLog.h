@@ -1,4 +1,4 @@
-// The system log: numeric levels, to the journal or to stderr.
+// The system log: numeric levels, written to the journal or to stderr.
 #pragma once
 
 #include <atomic>
@@ -12,49 +12,48 @@
 
 namespace vesk {
 
-/// Writes the process's log lines, to stderr as "2026-11-24 20:31:29.123 name[pid] <level> text", in UTC.
-/// Where stderr is connected to the journal they go there instead: through `setJournal`, or as "<level>text",
-/// which the journal understands. Safe from any thread, also under other locks (it takes none but the rate
-/// limit's, for a look-up); never throws, raises no SIGPIPE. Control characters in a line are shown as \xNN,
-/// so that text from outside can't forge a line.
+/// Writes the process's log lines to stderr as "2026-11-24 20:31:29.123 name[pid] <level> text", in UTC. If
+/// stderr is connected to the journal, they go there instead: through `setJournal`, or as "<level>text",
+/// which the journal understands. Thread-safe, also under other locks; its only lock is the rate limit's,
+/// held for a look-up. Doesn't throw or raise SIGPIPE. Control characters in a line appear as \xNN, so that
+/// text from outside can't forge a line.
 class SystemLog {
  public:
   using Sink = std::function<void(LogLevel, std::string_view line)>;
 
-  /// Opens the log for a process. Lines appear without that (and after `close`) too, without its name.
+  /// Names the process and checks whether stderr is the journal. Lines are also written before this and after
+  /// `close`, without the name.
   static void open(std::string_view processName, std::string_view facility);
   static void close() noexcept;
 
-  /// Lines of a higher number than `level` are not formatted at all. Default: 6.
+  /// Lines with a higher number than `level` are not formatted. Default: 6.
   static void setLevel(int level) noexcept { _level.store(level, std::memory_order_relaxed); }
   static bool isOn(LogLevel level) noexcept {
     return static_cast<int>(level) <= _level.load(std::memory_order_relaxed);
   }
 
-  /// How long a line waits for a reader of stderr that is behind; a line that it has no room for then is
-  /// lost. Default: not at all, and lines are cut to 4096 bytes, because a library must not hold up its host.
-  /// A process of the project's own, whose lines somebody looks for, can wait a little.
+  /// How long a line waits for a slow reader of stderr before it is lost. Default: no wait, and lines are cut
+  /// to 4096 bytes, because a library must not block its host. The project's own processes, whose lines
+  /// matter to their users, can wait a little.
   static void setPatience(std::chrono::milliseconds patience) noexcept {
     _patience.store(static_cast<int>(patience.count()), std::memory_order_relaxed);
   }
 
-  /// Hands every line to `sink` instead; an empty sink restores the default. For hosts that have a log of
-  /// their own. The sink is called on the logging thread and must not log.
+  /// Sends every line to `sink` instead, for hosts with a log of their own. An empty sink restores the
+  /// default. The sink is called on the logging thread and must not log.
   static void setSink(Sink sink);
 
-  /// How to reach the journal with all that is known of a line; a function that may be called from any
-  /// thread.
+  /// Writes a line to the journal with all its fields. Must be thread-safe.
   using Journal = void (*)(LogLevel level, const std::string& line, const std::string& processName,
                            const std::string& facility);
   static void setJournal(Journal journal) noexcept { _journal.store(journal); }
   static Journal journal() noexcept { return _journal.load(); }
 
-  /// From now on, of the lines of one VESK_LOG for one user (LogUser) only the first `lines` in ten seconds
-  /// are written, and then one that gives the number of those left out. Level 3 is never limited. 0: no
-  /// limit, which is the default.
+  /// Limits the lines of each VESK_LOG for each user (LogUser) to the first `lines` in ten seconds, followed
+  /// by one with the number of lines left out. Level 3 is never limited. 0, the default, means no limit.
   static void setRateLimit(std::uint64_t lines);
 
-  /// `site` tells calls apart by its address. `format` lives as long as the process.
+  /// The address of `site` identifies the call. `format` must live as long as the process.
   static void write(LogLevel level, const char& site, const char* format, ...) noexcept
       __attribute__((format(printf, 3, 4)));
 
@@ -69,7 +68,7 @@ class SystemLog {
 
 }  // namespace vesk
 
-/// Evaluates and formats its arguments only when the level is on.
+/// Evaluates and formats its arguments only if the level is on.
 #define VESK_LOG(level, ...)                                     \
   do {                                                           \
     if (::vesk::SystemLog::isOn(level)) {                        \
