@@ -1,4 +1,4 @@
-// Text of protocols and files, whose letters are those of ASCII whatever the locale says.
+// Text of protocols and files, in ASCII regardless of the locale.
 #pragma once
 
 #include <span>
@@ -7,13 +7,13 @@
 
 namespace vesk {
 
-/// Without spaces, tabs and line ends at either end.
+/// Removes spaces, tabs and line ends from both ends.
 std::string_view trimmed(std::string_view text) noexcept;
 
-/// Whether the two are alike but for the case of ASCII letters.
+/// Whether the two differ at most in the case of ASCII letters.
 bool equalsIgnoringASCIICase(std::string_view a, std::string_view b) noexcept;
 
-/// Two lower-case hexadecimal digits a byte, in order.
+/// Two lower-case hexadecimal digits per byte.
 std::string hexLower(std::span<const unsigned char> bytes);
 
 }  // namespace vesk

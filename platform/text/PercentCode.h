@@ -1,4 +1,4 @@
-// Bytes in URLs.
+// Percent-encoding.
 #pragma once
 
 #include <optional>
@@ -7,10 +7,10 @@
 
 namespace vesk {
 
-/// `text` with %XX for each byte but letters, digits, "-._~" and the characters in `others`.
+/// Encodes all bytes of `text` as %XX, except letters, digits, "-._~" and the characters in `others`.
 std::string percentEncoded(std::string_view text, std::string_view others);
 
-/// `text` with its %XX decoded; nothing when one of them is NUL. What is no %XX stays as it is.
+/// Decodes each %XX in `text` and keeps everything else. Returns nullopt if a decoded byte is NUL.
 std::optional<std::string> percentDecoded(std::string_view text);
 
 }  // namespace vesk

@@ -1,4 +1,4 @@
-// Whether bytes are text, and where its characters end.
+// UTF-8 validation and truncation.
 #pragma once
 
 #include <cstddef>
@@ -9,8 +9,8 @@
 
 namespace vesk {
 
-/// Well-formed UTF-8: no overlong forms, no surrogates, nothing above U+10FFFF. A NUL is well-formed, and
-/// refused when `allowNUL` is false. Here to be inlined: every text of every message is looked at.
+/// Whether `text` is well-formed UTF-8: no overlong forms, no surrogates, nothing above U+10FFFF, and no NUL
+/// unless `allowNUL`. Inline because every text of every message is checked.
 inline bool isValidUTF8(std::string_view text, bool allowNUL = true) noexcept {
   const auto* at = reinterpret_cast<const unsigned char*>(text.data());
   const auto* end = at + text.size();
@@ -18,7 +18,7 @@ inline bool isValidUTF8(std::string_view text, bool allowNUL = true) noexcept {
     if (end - at >= 8) {
       std::uint64_t eight;
       std::memcpy(&eight, at, sizeof eight);
-      // Neither anything beyond ASCII among them nor a NUL, which borrows from above.
+      // All eight are ASCII and, unless allowed, none is NUL: subtracting 1 from a NUL sets its high bit.
       const std::uint64_t borrowed = allowNUL ? 0 : eight - 0x0101010101010101U;
       if (((eight | borrowed) & 0x8080808080808080U) == 0) {
         at += 8;
@@ -30,7 +30,7 @@ inline bool isValidUTF8(std::string_view text, bool allowNUL = true) noexcept {
     if (lead < 0x80) continue;
     int more = lead >= 0xF0 ? 3 : lead >= 0xE0 ? 2 : 1;
     if (lead < 0xC2 || lead > 0xF4 || end - at < more) return false;
-    // Overlong forms, surrogates and what lies above U+10FFFF show in the second byte.
+    // The second byte reveals overlong forms, surrogates and values above U+10FFFF.
     unsigned char low = lead == 0xE0 ? 0xA0 : lead == 0xF0 ? 0x90 : 0x80;
     unsigned char high = lead == 0xED ? 0x9F : lead == 0xF4 ? 0x8F : 0xBF;
     if (*at < low || *at > high) return false;
@@ -42,8 +42,7 @@ inline bool isValidUTF8(std::string_view text, bool allowNUL = true) noexcept {
   return true;
 }
 
-/// The start of `text` that fits into `size` bytes, in whole characters when the text is UTF-8. For texts
-/// that are shown.
+/// The longest prefix of at most `size` bytes that doesn't split a UTF-8 character. For text to be shown.
 inline std::string cutToWholeCharacters(std::string_view text, std::size_t size) {
   if (text.size() <= size) return std::string(text);
   for (int i = 0; i < 3 && size > 0 && (static_cast<unsigned char>(text[size]) & 0xC0) == 0x80; ++i) --size;

@@ -38,7 +38,7 @@ std::string lowerASCII(std::string_view text) {
   return out;
 }
 
-// ICU counts in 32 bits. What is longer than that does not occur, and is left as it is.
+// ICU uses 32-bit lengths. Longer text doesn't occur and is left unchanged.
 bool isTooLongForICU(std::string_view text) {
   return text.size() > static_cast<std::size_t>(std::numeric_limits<std::int32_t>::max() / 4);
 }
@@ -71,11 +71,11 @@ std::string lowercase(std::string_view text) {
 bool equalsIgnoringCase(std::string_view a, std::string_view b) {
   const std::size_t common = std::min(a.size(), b.size());
   for (std::size_t i = 0; i < common; ++i) {
-    // Some characters outside ASCII fold to ASCII (U+212A to "k"), so from here on folding has to decide.
+    // Some characters outside ASCII fold to ASCII (U+212A to "k"), so the rest is compared after folding.
     if (!isASCII(a[i]) || !isASCII(b[i])) return folded(a.substr(i)) == folded(b.substr(i));
     if (a[i] != b[i] && lowerASCII(a[i]) != lowerASCII(b[i])) return false;
   }
-  // Nothing folds to nothing.
+  // No character folds to an empty string.
   return a.size() == b.size();
 }
 
