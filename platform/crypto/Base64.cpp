@@ -8,7 +8,7 @@ namespace vesk {
 
 namespace {
 
-// The library counts in int; both are multiples of their group's size.
+// OpenSSL takes lengths as int. Both values are multiples of their group's size.
 constexpr std::size_t kBytesAtOnce = std::size_t{3} << 20;
 constexpr std::size_t kCharactersAtOnce = std::size_t{4} << 20;
 
@@ -23,7 +23,7 @@ const unsigned char* input(std::string_view bytes) {
 }  // namespace
 
 std::string base64Encode(std::string_view bytes) {
-  // One byte more than the text: the library ends each piece with a NUL.
+  // One byte more than the text, because OpenSSL ends each piece with a NUL.
   std::string text((bytes.size() + 2) / 3 * 4 + 1, '\0');
   std::size_t used = 0;
   while (!bytes.empty()) {
@@ -64,7 +64,7 @@ std::optional<std::string> base64Decode(std::string_view text) {
     used += static_cast<std::size_t>(size);
     rest.remove_prefix(piece.size());
   }
-  // The library counts the padding as bytes.
+  // OpenSSL counts the padding as bytes.
   bytes.resize(used - padding);
   return bytes;
 }

@@ -10,9 +10,9 @@ namespace vesk {
 /// Without line breaks.
 std::string base64Encode(std::string_view bytes);
 
-/// Skips every character that is neither in the alphabet nor "=" (line breaks, blanks). Nothing when what
-/// remains is no base64: its length is no multiple of four, or a "=" stands elsewhere than among the last
-/// two. Text without any character of the alphabet is zero bytes.
+/// Skips characters that are neither in the alphabet nor "=" (line breaks, blanks). Returns nullopt if the
+/// rest is not base64: its length is not a multiple of four, or a "=" occurs before the last two characters.
+/// Text without any character of the alphabet gives zero bytes.
 std::optional<std::string> base64Decode(std::string_view text);
 
 }  // namespace vesk

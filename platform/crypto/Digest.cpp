@@ -10,7 +10,7 @@ namespace vesk {
 
 namespace {
 
-// Looked up once: a look-up by name on each call costs several times the digest of a short text.
+// Fetched once: fetching by name costs several times as much as the digest of a short text.
 const EVP_MD* fetchDigest(const char* name) {
   EVP_MD* digest = EVP_MD_fetch(nullptr, name, nullptr);
   if (!digest) throw std::runtime_error(std::string("no digest ") + name);

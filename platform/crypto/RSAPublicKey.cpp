@@ -14,7 +14,7 @@ namespace vesk {
 
 namespace {
 
-// DigestInfo of SHA-1, up to the digest itself.
+// The DigestInfo of SHA-1 without the digest.
 constexpr std::array<unsigned char, 15> kSHA1DigestInfo = {0x30, 0x21, 0x30, 0x09, 0x06, 0x05, 0x2b, 0x0e,
                                                            0x03, 0x02, 0x1a, 0x05, 0x00, 0x04, 0x14};
 
@@ -26,8 +26,8 @@ struct FreeContext {
 };
 using KeyPointer = std::unique_ptr<EVP_PKEY, FreeKey>;
 
-// Errors are told by results; what the library queues for this thread must not surface in someone else's
-// call.
+// Errors are returned as results. OpenSSL's error queue is cleared so that it doesn't affect other callers on
+// this thread.
 struct ClearErrors {
   ~ClearErrors() { ERR_clear_error(); }
 };
@@ -43,7 +43,7 @@ KeyPointer decodeWhole(std::string_view der, Decode decode) {
 
 }  // namespace
 
-// The handle is the library's own object under another name, which keeps its header out of ours.
+// Handle is EVP_PKEY under another name, so that our header doesn't include OpenSSL's.
 void RSAPublicKey::FreeHandle::operator()(Handle* handle) const noexcept {
   EVP_PKEY_free(reinterpret_cast<EVP_PKEY*>(handle));
 }
@@ -63,8 +63,8 @@ std::optional<RSAPublicKey> RSAPublicKey::fromDER(std::string_view der) {
 }
 
 bool RSAPublicKey::verifySHA1(const SHA1Digest& digest, std::string_view signature) const {
-  // The signed block is recovered and compared as a whole. Naming SHA-1 as a signature digest instead would
-  // fail on systems whose policy forbids SHA-1 signatures.
+  // Recovers the signed block and compares all of it. Setting SHA-1 as the signature digest would fail on
+  // systems whose policy forbids SHA-1 signatures.
   ClearErrors clear;
   auto* key = reinterpret_cast<EVP_PKEY*>(_key.get());
   std::unique_ptr<EVP_PKEY_CTX, FreeContext> context(EVP_PKEY_CTX_new_from_pkey(nullptr, key, nullptr));

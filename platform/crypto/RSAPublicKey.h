@@ -9,17 +9,17 @@
 
 namespace vesk {
 
-/// An RSA public key. Movable; const use is safe from any thread.
+/// An RSA public key. Movable. Const operations are thread-safe.
 class RSAPublicKey {
  public:
-  /// Reads a SubjectPublicKeyInfo or a PKCS#1 RSAPublicKey. Nothing when `der` is neither, has anything
-  /// behind it, or holds a key of another kind.
+  /// Reads a SubjectPublicKeyInfo or a PKCS#1 RSAPublicKey. Returns nullopt if `der` is neither, has trailing
+  /// bytes, or holds another kind of key.
   static std::optional<RSAPublicKey> fromDER(std::string_view der);
 
   /// Whether `signature` is an RSASSA-PKCS1-v1_5 signature by this key over a message with that SHA-1 digest.
   bool verifySHA1(const SHA1Digest& digest, std::string_view signature) const;
 
-  /// Tells this key object from others in a log line; stays the same when it is moved.
+  /// Identifies this key object in log lines. Stays the same when the key is moved.
   const void* identity() const noexcept { return _key.get(); }
 
  private:

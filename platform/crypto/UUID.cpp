@@ -11,7 +11,7 @@ namespace vesk {
 
 UUIDBytes makeUUID() {
   UUIDBytes uuid;
-  // Asked for no more than 256 bytes, the kernel gives all of them.
+  // Requests of up to 256 bytes are never answered partially.
   if (::getrandom(uuid.data(), uuid.size(), 0) != static_cast<ssize_t>(uuid.size())) {
     throw std::system_error(errno, std::generic_category(), "getrandom");
   }
