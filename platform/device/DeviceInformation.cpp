@@ -27,8 +27,8 @@ namespace {
 constexpr std::size_t kLongestFact = 128;
 constexpr std::size_t kLargestFile = 64 * 1024;
 
-// Other services derive identifiers from the machine ID as well. The label keeps ours unlike theirs, and the
-// machine ID itself can't be told from either.
+// Other services also derive identifiers from the machine ID. The label makes ours different, and the machine
+// ID can't be computed from any of them.
 constexpr char kDeviceIDLabel[] = "com.corvane.veskreportingd device identifier 1\n";
 constexpr std::size_t kDeviceIDDigits = 40;
 
@@ -38,7 +38,7 @@ std::optional<std::string> factFromFile(std::string_view key) {
   return value ? stringForm(*value) : std::nullopt;
 }
 
-// A value of os-release is a shell word: plain, or in quotes, where a backslash takes the next character.
+// A value in os-release is a shell word: plain, or quoted, where a backslash escapes the next character.
 std::string unquoted(std::string_view word) {
   if (word.size() < 2 || (word.front() != '"' && word.front() != '\'') || word.back() != word.front()) {
     return std::string(word);
@@ -89,7 +89,7 @@ std::optional<std::string> factFromSystem(std::string_view key) {
   }
   if (key == "UniqueDeviceID") return deviceIdentifier();
   auto fact = firmwareFact(key);
-  // A virtual machine or a container has no firmware to ask; without a name of any kind it could not report.
+  // Virtual machines and containers have no firmware facts, but reporting needs a device name.
   return !fact && key == "DeviceName" ? osReleaseValue("NAME") : fact;
 }
 
@@ -112,7 +112,7 @@ std::optional<std::string> countryCode(std::string_view candidate) {
   return code;
 }
 
-// "language_COUNTRY.encoding@modifier", of which all but the language may be missing.
+// "language_COUNTRY.encoding@modifier", where everything but the language is optional.
 std::optional<std::string> countryOfLocale(std::string_view locale) {
   locale = locale.substr(0, locale.find_first_of(".@"));
   std::size_t separator = locale.find('_');
@@ -121,8 +121,8 @@ std::optional<std::string> countryOfLocale(std::string_view locale) {
 }
 
 int localOffset(std::time_t seconds) {
-  // localtime_r alone would keep the zone that the process started in. The C library replaces what it knows
-  // of the zone each time.
+  // tzset reads a changed zone; localtime_r alone would keep the zone from the start of the process. The lock
+  // is needed because tzset replaces the C library's state.
   static Mutex mutex;
   MutexLock lock(mutex);
   ::tzset();
@@ -151,7 +151,7 @@ std::optional<std::string> regionCode() {
 }
 
 int timezoneOffsetSeconds(WallTime time) {
-  // The last answer with its minute, in one word: zones change their offset at the start of a minute only.
+  // The last answer and its minute in one word. Time zones change their offset only at the start of a minute.
   static std::atomic<std::int64_t> lastAnswer{std::numeric_limits<std::int64_t>::min()};
   constexpr std::int64_t kOffsetRange = 1 << 20;
   const std::int64_t minute = std::chrono::floor<std::chrono::minutes>(time).time_since_epoch().count();

@@ -15,7 +15,7 @@ struct Source {
   const char* path;
 };
 
-// For each key in the order of preference.
+// In order of preference for each key.
 constexpr Source kSources[] = {
     {"ProductType", "/sys/class/dmi/id/product_name"},   {"ProductType", "/proc/device-tree/model"},
     {"DeviceName", "/sys/class/dmi/id/product_family"},  {"DeviceName", "/sys/class/dmi/id/product_name"},
@@ -24,7 +24,7 @@ constexpr Source kSources[] = {
     {"SerialNumber", "/proc/device-tree/serial-number"},
 };
 
-// Vendors ship these in place of an answer.
+// Placeholders that vendors leave.
 constexpr std::array<std::string_view, 9> kFillers = {"Default string",
                                                       "Not Applicable",
                                                       "Not Specified",
@@ -35,7 +35,8 @@ constexpr std::array<std::string_view, 9> kFillers = {"Default string",
                                                       "To Be Filled By O.E.M.",
                                                       "To be filled by O.E.M."};
 
-// Device-tree texts end with a NUL, and "compatible" is a row of them, the board's own first.
+// Device-tree text ends with a NUL. "compatible" is a sequence of such texts, of which the board's own is
+// first.
 std::string firstText(std::string_view bytes) {
   return std::string(trimmed(bytes.substr(0, bytes.find('\0'))));
 }

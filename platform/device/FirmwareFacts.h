@@ -1,4 +1,4 @@
-// What the firmware says about the machine: DMI on PCs, the device tree on boards.
+// Facts from the machine's firmware: DMI on PCs, the device tree on boards.
 #pragma once
 
 #include <optional>
@@ -7,8 +7,9 @@
 
 namespace vesk {
 
-/// The firmware's word for a fact of the device-information query, or nothing: "ProductType", "DeviceName",
-/// "HWModelStr", "SerialNumber". DMI gives serial numbers to root only. `root`: where /sys and /proc are.
+/// The firmware's value for a fact of the device-information query: "ProductType", "DeviceName", "HWModelStr"
+/// or "SerialNumber"; nullopt if there is none. DMI reveals serial numbers to root only. `root`: the
+/// directory with /sys and /proc.
 std::optional<std::string> firmwareFact(std::string_view key, const std::string& root = {});
 
 }  // namespace vesk
