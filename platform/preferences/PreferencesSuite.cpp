@@ -17,8 +17,8 @@ namespace {
 
 constexpr std::size_t kLongestPasswordEntry = std::size_t{16} << 10;
 
-/// Whether the account has a login shell. A service writes its state to the home of its account: if settings
-/// were read from there, a compromised daemon could redirect the next one to another server.
+/// Whether the account has a login shell. Settings are not read from a service account's home: the service
+/// can write there, so a compromised daemon could redirect later ones to another server.
 bool canLogIn(uid_t user) {
   std::vector<char> room(kLongestPasswordEntry);
   passwd entry{};
@@ -28,8 +28,8 @@ bool canLogIn(uid_t user) {
   return !shell.ends_with("/nologin") && !shell.ends_with("/false");
 }
 
-/// The same for this process's user. Looked up once: a sandbox no longer sees /etc/passwd once it is
-/// replaced.
+/// Whether this process's user can log in. Looked up once, because a sandboxed process can't see /etc/passwd
+/// after it has been replaced.
 bool isLoginUser() {
   constexpr std::uint64_t kKnown = 2;
   static std::atomic<std::uint64_t> last{0};  // user << 2, known, answer

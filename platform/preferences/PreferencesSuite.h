@@ -9,20 +9,21 @@
 
 namespace vesk {
 
-/// The preferences suite of one domain: /etc/veskreporting/preferences/<suite>.toml, and over it, key by key,
-/// $XDG_CONFIG_HOME/veskreporting/preferences/<suite>.toml ($HOME/.config when that variable is unset or not
-/// absolute). Both stand under the root prefix. A service's account, which has no login shell, reads
-/// only the first.
+/// The preferences suite of one domain: /etc/veskreporting/preferences/<suite>.toml, overridden key by key by
+/// $XDG_CONFIG_HOME/veskreporting/preferences/<suite>.toml ($HOME/.config if that variable is unset or not
+/// absolute). Both paths are below the root prefix. An account without a login shell, such as a service's,
+/// uses only the first file.
 ///
-/// The files are read when a suite is constructed and never again; whoever wants what they say now opens a
-/// suite now. A file that is missing is empty; one that is unusable, or not trusted (TrustedFile.h), is empty
-/// and costs one level-4 line. Safe to read from any thread.
+/// The files are read when the suite is constructed; later changes need a new suite. A missing file counts as
+/// empty. A malformed or untrusted file (TrustedFile.h) counts as empty and causes one level-4 line. Reading
+/// a suite is thread-safe.
 class PreferencesSuite {
  public:
-  /// A `suite` that is no plain file name (empty, more than 128 bytes, with a "/" or a leading ".") is empty.
+  /// The suite is empty if `suite` is not a plain file name (empty, more than 128 bytes, with a "/" or a
+  /// leading ".").
   explicit PreferencesSuite(std::string_view suite);
 
-  /// What the suite holds under `key`, a top-level key of the files.
+  /// The value under `key`, a top-level key of the files.
   std::optional<Value> valueForKey(std::string_view key) const;
 
  private:

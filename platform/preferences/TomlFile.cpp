@@ -74,7 +74,7 @@ Value valueFromNode(const toml::node& node) {
   return {};
 }
 
-/// The index behind the string that starts at `start`.
+/// The index after the string that starts at `start`.
 std::size_t endOfString(std::string_view text, std::size_t start) {
   const char quote = text[start];
   const std::string triple(3, quote);
@@ -96,7 +96,7 @@ std::size_t endOfString(std::string_view text, std::size_t start) {
   return text.size();
 }
 
-// A dotted key makes one table within another for each dot, and the parser releases those recursively.
+// A dotted key creates one nested table for each dot, and the parser frees them recursively.
 bool hasKeyOfManyParts(std::string_view text) {
   std::size_t dots = 0;
   for (std::size_t at = 0; at < text.size();) {

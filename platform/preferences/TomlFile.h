@@ -1,4 +1,4 @@
-// TOML documents as values.
+// Reads TOML documents as values.
 #pragma once
 
 #include <optional>
@@ -10,21 +10,21 @@
 
 namespace vesk {
 
-/// A document, or what is wrong with it (with line and column).
+/// A document, or an error with line and column.
 struct TomlOutcome {
   std::optional<Dictionary> document;
   std::string error;
 };
 
-/// Reads a TOML document of at most 1 MiB. Strings, integers, floats, booleans, arrays and tables become the
-/// values of those kinds. A date, or a date with time, becomes a date, taken as UTC when it names no offset;
-/// a time of day alone becomes its text. Arrays and inline tables may nest 32 deep, and a key may have 7
-/// parts: what reads this may stand on a small stack.
+/// Reads a TOML document of at most 1 MiB. Strings, integers, floats, booleans, arrays and tables become
+/// values of those kinds. A date with or without a time becomes a date, in UTC unless it has an offset; a
+/// time of day alone becomes its text. Arrays and inline tables may nest 32 deep, and a key may have 7 parts,
+/// so that a small stack suffices.
 TomlOutcome parseToml(std::string_view text);
 
-/// The document of the file at `path` (no root prefix is added), which has to be trusted (TrustedFile.h). A
-/// missing file is an empty document. One that is refused, can't be read or is no TOML costs one level-4 line
-/// that names it, and is an empty document too.
+/// Reads the file at `path`, without adding the root prefix. The file must be trusted (TrustedFile.h). A
+/// missing file gives an empty document. An untrusted, unreadable or malformed file also does, with one
+/// level-4 line that names it.
 Dictionary readTomlFile(const std::string& path, TrustedOwner owner = TrustedOwner::Root);
 
 }  // namespace vesk
