@@ -1,4 +1,4 @@
-// The marker that keeps an idle daemon from stopping while it has work.
+// Keeps an idle daemon from stopping while it has work.
 #pragma once
 
 #include <atomic>
@@ -7,26 +7,26 @@
 
 namespace vesk {
 
-/// Counts outstanding work. While the count is not zero the process is busy; when it falls to zero, the run
-/// loop's idle time starts. Thread-safe; neither operation blocks.
+/// Counts outstanding work. The process is busy while the count is not zero; when it falls to zero, the run
+/// loop's idle time starts. Thread-safe; no operation blocks.
 class BusyMarker {
  public:
-  /// Throws std::system_error when there is no descriptor left.
+  /// Throws std::system_error if no descriptor is left.
   BusyMarker();
 
-  /// Each `begin` is answered by one `end`.
+  /// Each `begin` must be followed by one `end`.
   void begin() noexcept;
   void end() noexcept;
   bool isBusy() const noexcept { return _count.load() > 0; }
 
-  /// Notes that work was done, which may have left memory behind that is free. Costs a wake-up of the run
-  /// loop only when none is due for that anyway.
+  /// Notes that work was done, which may have left free memory behind. Wakes the run loop unless it will look
+  /// anyway.
   void touch() noexcept;
-  /// Whether there was any since the last `takeTouch`.
+  /// Whether `touch` was called since the last `takeTouch`.
   bool isTouched() const noexcept { return _touched.load(); }
   bool takeTouch() noexcept { return _touched.exchange(false); }
 
-  /// Readable since the process last became busy or idle, or did work; for the run loop, which then calls
+  /// Readable after the process became busy or idle or did work. The run loop waits for it and then calls
   /// `acknowledge`.
   int descriptor() const noexcept { return _changed.get(); }
   void acknowledge() noexcept;

@@ -1,15 +1,15 @@
-// How many descriptors the process may have.
+// The limit on the process's descriptors.
 #pragma once
 
 #include <cstddef>
 
 namespace vesk {
 
-/// Takes all that the hard limit grants: the soft one is low by default for the sake of programs that use
-/// select(), which we don't, and each connection needs a few. To be called before threads start.
+/// Raises the soft limit to the hard limit. The default is low for programs that use select(), which we
+/// don't, and each connection needs several descriptors. Call before threads start.
 void raiseDescriptorLimit() noexcept;
 
-/// The soft limit; 0 when the system doesn't tell.
+/// The soft limit; 0 if unknown.
 std::size_t descriptorLimit() noexcept;
 
 }  // namespace vesk

@@ -1,6 +1,6 @@
 #include "platform/service/Journal.h"
 
-// Every line would come from the same place of the code.
+// Every line would have the same source location.
 #define SD_JOURNAL_SUPPRESS_LOCATION
 #include <systemd/sd-journal.h>
 

@@ -7,7 +7,7 @@
 
 namespace vesk {
 
-/// Writes one line to the journal, with the name of its process and its facility. For SystemLog::setJournal.
+/// Writes one line to the journal, with the process's name and facility. Use with SystemLog::setJournal.
 void writeToJournal(LogLevel level, const std::string& line, const std::string& processName,
                     const std::string& facility);
 

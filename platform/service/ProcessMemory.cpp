@@ -11,10 +11,10 @@ namespace vesk {
 
 namespace {
 
-constexpr int kKept = 512 * 1024;  // bytes at the top of a heap, and the least that is mapped by itself
+constexpr int kKept = 512 * 1024;  // bytes kept at the top of a heap; larger blocks are mapped separately
 constexpr int kMostArenas = 4;
 
-/// Only what is never written, and so can come back from its file unchanged.
+/// Releases only read-only pages, which can be reloaded unchanged from their file.
 int releaseObject(dl_phdr_info* object, std::size_t, void*) {
   const auto page = static_cast<std::uintptr_t>(::sysconf(_SC_PAGESIZE));
   for (int i = 0; i < object->dlpi_phnum; ++i) {

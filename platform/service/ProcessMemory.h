@@ -1,20 +1,19 @@
-// How much memory the process claims.
+// Controls the memory of the process.
 #pragma once
 
 namespace vesk {
 
-/// Has the allocator keep what a busy thread needs again at once: such a thread frees a batch's buffers a
-/// thousand times a second, and would give their pages back to the kernel and fetch them again each time. Few
-/// arenas, so that many threads do not hoard some each. To be called first of all.
+/// Makes the allocator keep memory that a busy thread needs again soon: it frees a batch's buffers a thousand
+/// times a second, and would otherwise return their pages to the kernel each time. Uses few arenas, so that
+/// threads don't each keep free memory. Call before anything else.
 void setUpAllocator() noexcept;
 
-/// Lets go of the pages of programs and libraries that only starting has touched, as relocating them does
-/// with most of them; whoever needs one again finds it in the page cache. Once the process has started; safe
-/// on any thread, at any time.
+/// Releases pages of programs and libraries that were only used during start-up, mostly for relocation. A
+/// page that is needed again is in the page cache. Call once the process has started. Thread-safe.
 void releaseStartUpPages() noexcept;
 
-/// Gives the pages of freed memory back to the kernel, those between used ones too. Takes some milliseconds
-/// after a busy time, during which threads that allocate may have to wait; safe on any thread, at any time.
+/// Returns the pages of freed memory to the kernel, including those between used ones. After a busy time this
+/// takes some milliseconds, during which threads that allocate may have to wait. Thread-safe.
 void releaseFreePages() noexcept;
 
 }  // namespace vesk

@@ -19,8 +19,8 @@ constexpr int kUtilityNice = 5;
 constexpr int kLowestNice = 19;
 constexpr int kUtilityDiskLevel = 6;
 
-// The kernel's numbers for ioprio_set. Its own header is C in some versions: it has a parameter named
-// "class".
+// The kernel's constants for ioprio_set. Some versions of its own header don't compile as C++, because of a
+// parameter named "class".
 constexpr int kPriorityOfProcess = 1;
 constexpr int kDiskClassShift = 13;
 constexpr int kDiskClassBestEffort = 2;

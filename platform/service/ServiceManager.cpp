@@ -16,7 +16,7 @@ std::optional<std::chrono::milliseconds> askedInterval() {
   std::uint64_t microseconds = 0;
   if (sd_watchdog_enabled(1, &microseconds) <= 0) return std::nullopt;
   auto limit = std::chrono::duration_cast<std::chrono::milliseconds>(std::chrono::microseconds(microseconds));
-  // Half of what the manager tolerates, as it recommends.
+  // Half of the manager's limit, as it recommends.
   return std::max(limit / 2, std::chrono::milliseconds(1));
 }
 

@@ -1,4 +1,4 @@
-// The service manager that started the process, if one did.
+// The service manager that started the process, if any.
 #pragma once
 
 #include <chrono>
@@ -9,24 +9,25 @@
 
 namespace vesk {
 
-/// Speaks the service manager's protocol: inherited sockets, readiness, watchdog. Without a manager
-/// every notification does nothing. Construct it before the process has other threads; the notifications are
+/// Implements the service manager's protocol: inherited sockets, readiness, watchdog. Without a manager,
+/// notifications do nothing. Construct it before the process has other threads; notifications are
 /// thread-safe.
 class ServiceManager {
  public:
-  /// Takes over what the environment names, and removes it from the environment. An inherited descriptor that
-  /// is no listening Unix stream socket, or a second socket, is closed and costs one level-4 line.
+  /// Takes over inherited sockets and removes their variables from the environment. Closes a descriptor that
+  /// is not a listening Unix stream socket, and any second socket, with one level-4 line each.
   ServiceManager();
 
-  /// True when the manager passed a socket: it listens for us while we don't run, so we may exit when idle.
+  /// True if the manager passed a socket. The manager then listens while we don't run, so we may exit when
+  /// idle.
   bool isSocketActivated() const noexcept { return _socketActivated; }
-  /// The inherited listening socket; none when there is none or it has been taken.
+  /// The inherited listening socket; empty if there was none or it has been taken.
   FileDescriptor takeListeningSocket() noexcept { return std::move(_socket); }
 
   void notifyReady() const noexcept;
   void notifyStopping() const noexcept;
 
-  /// How often the manager wants to hear from us; nothing when it does not watch.
+  /// The interval between pings; nullopt without a watchdog.
   std::optional<std::chrono::milliseconds> watchdogInterval() const noexcept { return _watchdogInterval; }
   void pingWatchdog() const noexcept;
 
