@@ -1,22 +1,23 @@
-// A shared library that is loaded by its path while the process runs.
+// A shared library that is loaded at run time.
 #pragma once
 
 #include <string>
 
 namespace vesk {
 
-/// Once loaded, a library stays for the life of the process: it may have started threads. Thread-safe as the
-/// dynamic linker is.
+/// A loaded library stays for the life of the process, since it may have started threads. As thread-safe as
+/// the dynamic linker.
 class LoadableBundle {
  public:
-  /// `path`: of the library, as it is.
+  /// `path`: of the library, used as it is.
   explicit LoadableBundle(std::string path);
 
-  /// Whether this process has the library already.
+  /// Whether this process has already loaded the library.
   bool isLoaded() const noexcept { return _handle != nullptr; }
-  /// Loads it, which runs its initialisers. False, with `error` set, when there is none or it is no library.
+  /// Loads the library, which runs its initialisers. Returns false, with `error` set, if the file is missing
+  /// or not a library.
   bool load();
-  /// What it exports under `name`, or null.
+  /// The address of the exported symbol `name`, or null.
   void* symbolNamed(const char* name) const noexcept;
 
   const std::string& path() const noexcept { return _path; }

@@ -21,7 +21,7 @@
 
 namespace vesk {
 
-/// Condition variables that wait on it are std::condition_variable_any.
+/// Use with std::condition_variable_any.
 class VESK_CAPABILITY("mutex") Mutex {
  public:
   void lock() VESK_ACQUIRE() { _mutex.lock(); }
@@ -31,7 +31,7 @@ class VESK_CAPABILITY("mutex") Mutex {
   std::mutex _mutex;
 };
 
-/// A lock that its holder may take again: the agent's monitor, which session operations re-enter.
+/// A recursive mutex: the agent's monitor, which session operations re-enter.
 class VESK_CAPABILITY("mutex") RecursiveMutex {
  public:
   void lock() VESK_ACQUIRE() { _mutex.lock(); }

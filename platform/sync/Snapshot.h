@@ -1,4 +1,4 @@
-// A value that is written and read as a whole.
+// A value that is loaded and stored as a whole.
 #pragma once
 
 #include <utility>
@@ -7,8 +7,8 @@
 
 namespace vesk {
 
-/// For what does not fit into std::atomic. Its lock is held for the length of a copy and no other is taken
-/// under it, so `T` should be cheap to copy.
+/// For types too large for std::atomic. Holds its lock while copying and takes no other lock meanwhile, so
+/// `T` should be cheap to copy.
 template <class T>
 class Snapshot {
  public:
@@ -18,7 +18,7 @@ class Snapshot {
   }
   void store(T value) {
     MutexLock lock(_mutex);
-    std::swap(_value, value);  // what it replaces is destroyed after the lock
+    std::swap(_value, value);  // the old value is destroyed after unlocking
   }
 
  private:

@@ -1,4 +1,4 @@
-// Dates for people, in UTC. The C library's own conversions share its time zone state between threads.
+// Readable dates in UTC. Avoids the C library's conversions, which share time zone state between threads.
 #pragma once
 
 #include <string>
@@ -7,7 +7,7 @@
 
 namespace vesk {
 
-/// "2026-11-24 20:31:29", without a fraction. Any time; thread-safe, takes no lock.
+/// "2026-11-24 20:31:29", without a fraction. Accepts any time. Thread-safe; takes no lock.
 std::string civilTime(WallTime time);
 
 }  // namespace vesk

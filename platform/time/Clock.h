@@ -1,4 +1,4 @@
-// The clocks, injected wherever a policy depends on time.
+// The clocks, which are injected wherever a policy depends on time.
 #pragma once
 
 #include <sys/time.h>
@@ -9,21 +9,20 @@ namespace vesk {
 
 using WallTime = std::chrono::sys_time<std::chrono::microseconds>;
 
-/// Wall-clock time; may jump either way. Thread-safe.
+/// Wall-clock time, which may jump forwards or backwards. Thread-safe.
 class WallClock {
  public:
   virtual ~WallClock() = default;
   virtual WallTime now() const = 0;
 
-  /// The machine's clock; lives as long as the process.
+  /// The machine's clock. Never destroyed.
   static const WallClock& system();
 };
 
-/// How long the machine has been up, the time that it slept included. Goes on evenly, whatever is done to the
-/// wall clock.
+/// The time since the machine started, including sleep. Independent of changes to the wall clock.
 std::chrono::seconds systemUptime() noexcept;
 
-/// A wall time as POSIX has it.
+/// Converts a wall time to POSIX form.
 inline timeval timevalFrom(WallTime time) {
   auto seconds = std::chrono::floor<std::chrono::seconds>(time);
   timeval value{};
@@ -32,7 +31,7 @@ inline timeval timevalFrom(WallTime time) {
   return value;
 }
 
-/// And back.
+/// Converts back.
 inline WallTime wallTimeFrom(const timeval& time) {
   return WallTime(std::chrono::seconds(time.tv_sec) + std::chrono::microseconds(time.tv_usec));
 }
