@@ -18,16 +18,16 @@ namespace {
 constexpr char kDescription[] = "Tellvue MQRC log";
 
 constexpr std::chrono::seconds kLeastTimeout{60};
-// Others wait for the room that a file takes while it is read.
+// Others wait for the memory that a file occupies while it is read.
 constexpr std::size_t kLeastRead = std::size_t{32} << 10;  // bytes a second
-// A large file may take a day on a thin line, but a server that takes next to nothing hangs.
+// A large file may take a day on a slow connection, but a server that accepts less than this hangs.
 constexpr std::size_t kLeastSent = std::size_t{1} << 10;
 
 std::chrono::seconds timeoutFor(std::size_t bytes, std::size_t bytesPerSecond) {
   return kLeastTimeout + std::chrono::seconds(bytes / bytesPerSecond);
 }
 
-/// Slashes behind a path belong to no component of it.
+/// Removes trailing slashes, which belong to no component of the path.
 std::string withoutTrailingSlashes(const std::string& path) {
   return path.substr(0, path.find_last_not_of('/') + 1);
 }
@@ -126,7 +126,7 @@ bool UploadBackend::upload(const std::string& path, const std::string& extension
 
 std::optional<std::string> UploadBackend::contentsOf(const LentFile& file) const {
   std::string contents;
-  // A file system may be slow on purpose, and others wait for the room that its file takes.
+  // A file system may be slow on purpose, and others wait for the memory that this file occupies.
   const auto deadline = std::chrono::steady_clock::now() + timeoutFor(file.size(), kLeastRead);
   LentFile::Reading reading = file.read(
       contents, [&] { return _services.uploads->isOpen() && std::chrono::steady_clock::now() < deadline; });

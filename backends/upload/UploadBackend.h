@@ -1,4 +1,4 @@
-// Uploads whole files that clients hand over.
+// The backend that uploads whole files for clients.
 #pragma once
 
 #include <memory>
@@ -10,22 +10,22 @@
 
 namespace vesk {
 
-/// Posts each file, compressed, to the server that the profile names, and removes it once the server's answer
-/// says "success". The bytes come through the descriptor that the client passed, so nobody can have a file
-/// uploaded that he could not read himself; the path only names it.
+/// Posts each file, compressed, to the server in the profile, and removes the file once the server has
+/// answered "success". The bytes are read through the descriptor that the client passed, so clients can only
+/// upload files that they can read; the path only names the file.
 class UploadBackend final : public VeskReportingBackend {
  public:
-  /// Bytes of the largest file.
+  /// Limit on the size of a file in bytes.
   static constexpr std::uint64_t kMaximumFile = std::uint64_t{256} << 20;
 
-  /// Nothing, and a line in the log, without a "post_url".
+  /// Returns null, with a line in the log, if the profile has no "post_url".
   static std::shared_ptr<UploadBackend> create(const std::string& name,
                                                const std::optional<Dictionary>& profile,
                                                const std::optional<Text>& productFamily,
                                                const BackendServices& services);
 
-  /// Blocks until the server has answered, the transfer has failed or the daemon stops. True when the file
-  /// was sent, whatever came of it; false when it was refused, and then it is as it was.
+  /// Blocks until the server has answered, the transfer has failed or the daemon stops. Returns true if the
+  /// file was sent, regardless of the outcome. Returns false if it was refused; the file is unchanged then.
   bool uploadFileAtPath(const std::string& path, const std::string& extensionToken) override;
 
   std::optional<std::string> uploadURL() const;
@@ -36,11 +36,11 @@ class UploadBackend final : public VeskReportingBackend {
                 const BackendServices& services);
 
   bool upload(const std::string& path, const std::string& extensionToken, const std::string& uploadURL);
-  /// The file's contents; nothing, and a line in the log, when it is refused.
+  /// The file's contents; nullopt, with a line in the log, if the file is refused.
   std::optional<std::string> contentsOf(const LentFile& file) const;
-  /// The request but for its body; nothing when the profile's URL is of no use.
+  /// The request without its body; nullopt if the profile's URL is unusable.
   std::optional<HTTPRequest> requestFor(const std::string& path, const std::string& uploadURL) const;
-  /// Whether the server has the file.
+  /// Whether the server has accepted the file.
   bool accepted(const HTTPResult& result, const std::string& uploadURL) const;
 
   std::optional<std::string> _uploadURL VESK_GUARDED_BY(_mutex);

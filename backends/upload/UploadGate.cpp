@@ -45,7 +45,7 @@ std::optional<UploadGate::Pass> UploadGate::enter(Kind kind, uid_t user, std::si
 HTTPResult UploadGate::perform(HTTPClient& http, HTTPRequest request) {
   HTTPResult result = http.perform(std::move(request));
   if (result.error && result.error->kind == HTTPError::Kind::Stopped) {
-    result.error->description = "the daemon stops";  // in the log's words
+    result.error->description = "the daemon stops";  // wording of the log line
   }
   return result;
 }

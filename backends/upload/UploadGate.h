@@ -1,4 +1,4 @@
-// How many files are uploaded at once, and the end of all uploads when the daemon stops.
+// Limits concurrent uploads, and ends all uploads when the daemon stops.
 #pragma once
 
 #include <sys/types.h>
@@ -16,9 +16,9 @@
 
 namespace vesk {
 
-/// One for all upload backends of a process. Sessions upload on their own threads; the gate keeps them from
-/// taking all memory, and all connections to a server that others need as well. Thread-safe; its lock is a
-/// leaf, and no other lock may be held by who waits here.
+/// Shared by all upload backends of a process. Sessions upload on their own threads; the gate keeps them from
+/// using all memory, or all connections to a server that others need too. Thread-safe. Its lock is a leaf,
+/// and a caller that waits here must hold no other lock.
 class UploadGate {
   enum Kind : std::size_t { File, SmallLogData };
 
@@ -26,16 +26,16 @@ class UploadGate {
   struct Limits {
     std::size_t uploads = 3;                     ///< of the eight connections to a host
     std::size_t bytes = std::size_t{768} << 20;  ///< of files and compressed files in memory
-    /// A user whose files or servers hang leaves this much to the others.
+    /// Limits of one user, so that slow files or servers leave room for other users.
     std::size_t uploadsOfUser = 2;
     std::size_t bytesOfUser = std::size_t{512} << 20;
-    /// Small log data has places of its own, so that neither waits for the other's slow servers.
+    /// Small log data has separate slots, so that neither kind waits for the other's slow servers.
     std::size_t smallUploads = 3;
     std::size_t smallUploadsOfUser = 2;
-    std::chrono::milliseconds patience = std::chrono::minutes(1);  ///< how long one waits to be let in
+    std::chrono::milliseconds patience = std::chrono::minutes(1);  ///< how long a caller waits to be admitted
   };
 
-  /// The right to have an upload under way. Must not outlive the gate.
+  /// Permission to perform an upload. Must not outlive the gate.
   class Pass {
    public:
     Pass(UploadGate& gate, Kind kind, uid_t user, std::size_t bytes) noexcept
@@ -49,7 +49,7 @@ class UploadGate {
     ~Pass() {
       if (_gate) _gate->leave(_kind, _user, {1, _bytes});
     }
-    /// It needs no more than that from now on.
+    /// Returns the part of its memory share above `bytes`.
     void shrinkTo(std::size_t bytes);
 
    private:
@@ -64,22 +64,23 @@ class UploadGate {
   UploadGate(const UploadGate&) = delete;
   UploadGate& operator=(const UploadGate&) = delete;
 
-  /// Whose an upload is that no user in particular asked for.
+  /// The user of uploads without a particular user.
   static constexpr uid_t kNobody = static_cast<uid_t>(-1);
 
-  /// Waits until there is room for an upload that needs so many bytes, of that user's; nothing when there was
-  /// none in time, or the gate is closed. Throws std::bad_alloc.
+  /// Waits for room for a user's upload that needs `bytes` of memory. Returns nullopt if there was none in
+  /// time or the gate is closed. Throws std::bad_alloc.
   [[nodiscard]] std::optional<Pass> enter(uid_t user, std::size_t bytes);
 
-  /// Log data of fewer bytes counts as small.
+  /// Log data below this size in bytes counts as small.
   static constexpr std::size_t kSmallLogData = std::size_t{1} << 20;
-  /// The same for log data: beside the files when it is small, otherwise as a file.
+  /// Like `enter`, for log data: in the separate slots if it is small, otherwise like a file.
   [[nodiscard]] std::optional<Pass> enterWithLogData(uid_t user, std::size_t bytes);
 
-  /// Sends the request and waits for its end, which comes at once when the client no longer serves uploads.
+  /// Sends the request and waits for its result, which is immediate once the client has stopped serving
+  /// uploads.
   static HTTPResult perform(HTTPClient& http, HTTPRequest request);
 
-  /// Nobody is let in or waits for that any more: the daemon stops.
+  /// Admits no more uploads and ends all waits, because the daemon stops.
   void close();
   bool isOpen() const;
 
@@ -88,11 +89,11 @@ class UploadGate {
     std::size_t uploads = 0;
     std::size_t bytes = 0;
   };
-  /// Uploads that share their places.
+  /// Uploads that share their slots.
   struct Lane {
     Share limit, limitOfUser;
     Share all{};
-    std::map<uid_t, Share> ofUser{};  ///< those who have some
+    std::map<uid_t, Share> ofUser{};  ///< users with uploads in progress
   };
   std::optional<Pass> enter(Kind kind, uid_t user, std::size_t bytes);
   void leave(Kind kind, uid_t user, Share share);
@@ -101,7 +102,7 @@ class UploadGate {
   const std::chrono::milliseconds _patience;
   mutable Mutex _mutex;
   std::condition_variable_any _changed;
-  std::array<Lane, 2> _lanes VESK_GUARDED_BY(_mutex);  ///< by their kind
+  std::array<Lane, 2> _lanes VESK_GUARDED_BY(_mutex);  ///< by Kind
   bool _closed VESK_GUARDED_BY(_mutex) = false;
 };
 
