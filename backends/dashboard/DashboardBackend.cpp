@@ -14,19 +14,19 @@ namespace vesk {
 namespace {
 
 constexpr char kQueueLabel[] = "com.corvane.VeskReporting.networkProc";
-/// Longer than anything lives; the clock still holds a time that far away.
+/// The longest tick: longer than any process runs, but within the clock's range.
 constexpr auto kLongestTick =
     std::chrono::duration_cast<std::chrono::milliseconds>(TimedQueue::Clock::duration::max()) / 4;
 constexpr std::int64_t kMicrosecondsPerStep = 4000;
 
-/// What a profile says of the server and the delivery.
+/// The server and delivery settings of a profile.
 struct Settings {
   IPv4Endpoint server;
   bool isReliable = true;
   std::chrono::milliseconds tick = DashboardDelivery::kDefaultTick;
 };
 
-/// What is no address stands for all ones, to which nothing can be connected.
+/// Invalid addresses map to 255.255.255.255, to which connecting fails.
 IPv4Endpoint serverAt(std::string_view ip, std::uint16_t port) {
   return IPv4Endpoint::parse(ip, port).value_or(IPv4Endpoint{0xFFFF'FFFF, port});
 }
@@ -39,7 +39,7 @@ std::chrono::milliseconds tickFrom(std::int64_t reliable) {
   return DashboardDelivery::kDefaultTick;
 }
 
-/// Nothing, and a line, when the server can't be told.
+/// Returns nullopt, and logs a line, if the profile does not specify the server.
 std::optional<Settings> settingsFrom(const std::string& name, const Dictionary& profile) {
   auto ip = profileText(name, profile, "ip");
   if (!ip) {
@@ -109,7 +109,7 @@ std::shared_ptr<DashboardBackend> DashboardBackend::createConnected(
   std::shared_ptr<DashboardBackend> backend(
       new DashboardBackend(name, profile, productFamily.value_or(Text()), delivery, services));
   if (!profile) settings = settingsFrom(serverIP, serverPort);
-  if (!settings) return nullptr;  // the backend's end gives everything back, here and below
+  if (!settings) return nullptr;  // here and below, the destructor cleans up
   if (settings->isReliable) delivery->useReliableUDP();
   if (!delivery->connect(settings->server)) {
     VESK_LOG_ERROR("DashboardBackend(initWithName): socket connect() failed.");
@@ -133,8 +133,8 @@ DashboardBackend::DashboardBackend(const std::string& name, const std::optional<
   _displayURL = profileText(name, _profile, "display_url");
 }
 
-// For a backend that its session never came to clean up. Without memory the delivery isn't told, and lets go
-// of everything once nothing is pending any more.
+// For a backend whose session never cleaned it up. If memory runs out, the delivery is not informed and ends
+// once nothing is pending.
 DashboardBackend::~DashboardBackend() {
   try {
     _delivery->cleanup();

@@ -1,4 +1,4 @@
-// The backend that reports each message as one UDP datagram to a dashboard.
+// The backend that reports each message as a UDP datagram to a dashboard.
 #pragma once
 
 #include <memory>
@@ -10,16 +10,18 @@
 
 namespace vesk {
 
-/// Encodes messages on the session's thread and hands the datagrams to its delivery, which does the rest on
-/// its own queue and may outlive the backend (DashboardDelivery.h). The text of a datagram is the answer.
+/// Encodes messages on the session's thread and passes the datagrams to its delivery, which works on its own
+/// queue and may outlive the backend (DashboardDelivery.h). The answer to a message is the datagram's text.
 class DashboardBackend final : public VeskReportingBackend {
  public:
-  /// From a storebag's profile. Null, and a level-3 line, when the profile or the system doesn't allow it.
+  /// Creates a backend from a storebag's profile. Returns null, with a level-3 line, if the profile is
+  /// unusable or the system refuses.
   static std::shared_ptr<DashboardBackend> create(const std::string& name,
                                                   const std::optional<Dictionary>& profile,
                                                   const std::optional<Text>& productFamily,
                                                   const BackendServices& services);
-  /// Without a profile; delivery is reliable. Null, without a line, when there is no address.
+  /// Creates a backend without a profile; its delivery is reliable. Returns null, without a line, if there is
+  /// no address.
   static std::shared_ptr<DashboardBackend> create(const std::string& name,
                                                   const std::optional<std::string>& serverIP,
                                                   std::uint16_t serverPort,
@@ -27,8 +29,9 @@ class DashboardBackend final : public VeskReportingBackend {
                                                   const BackendServices& services);
   ~DashboardBackend() override;
 
-  /// Uploads `logData` as keyed archive and announces where the server put it; waits for its turn among the
-  /// uploads of its size (UploadGate.h) and then for the server, 120 s at most, without any lock.
+  /// Uploads `logData` as keyed archive and reports the location that the server returns. Waits for its turn
+  /// among the uploads of its size (UploadGate.h) and then for the server, at most 120 s. Holds no lock
+  /// meanwhile.
   bool uploadLogData(const List& logData) override;
 
   bool isReliable() const noexcept { return _delivery->isReliable(); }
@@ -53,7 +56,7 @@ class DashboardBackend final : public VeskReportingBackend {
                                                            const std::optional<Text>& productFamily,
                                                            const BackendServices& services);
 
-  /// All but the length.
+  /// The header without the length.
   DashboardHeader headerFor(const timeval& timestamp, std::uint16_t method, std::uint16_t respCode,
                             std::uint16_t eventID) const VESK_EXCLUDES(_mutex);
 

@@ -1,5 +1,5 @@
-// The dashboard's datagrams: a header of 64 bytes, then the text. docs/dashboard.md describes them; this is
-// the one place that knows their layout, for the daemon and for the collector.
+// The dashboard's datagrams: a header of 64 bytes, then text. docs/dashboard.md describes them. Only this
+// file knows their layout, for the daemon and the collector.
 #pragma once
 
 #include <array>
@@ -12,16 +12,16 @@
 namespace vesk {
 
 inline constexpr std::size_t kDashboardHeaderSize = 64;
-inline constexpr std::size_t kDashboardTextArea = 1024;  ///< of which the last byte stays unused
+inline constexpr std::size_t kDashboardTextArea = 1024;  ///< bytes; the last one stays unused
 inline constexpr std::size_t kDashboardBufferSize = kDashboardHeaderSize + kDashboardTextArea;
 inline constexpr std::size_t kDashboardLongestDatagram = kDashboardBufferSize - 1;
 inline constexpr std::size_t kDashboardDeviceIDSize = 40;
 
-/// An acknowledgement is any datagram that is long enough to carry the event ID where the datagram had it.
+/// Any datagram that is long enough to contain an event ID, at the same offset, is an acknowledgement.
 inline constexpr std::size_t kDashboardEventIDOffset = 60;
 inline constexpr std::size_t kDashboardShortestAcknowledgement = kDashboardEventIDOffset + 2;
 
-/// What the header carries, in host order and with its complements undone.
+/// The header's contents in host byte order, with complements undone.
 struct DashboardHeader {
   std::uint8_t libraryVersionMajor = 0;
   std::uint8_t clientType = 0;
@@ -32,28 +32,28 @@ struct DashboardHeader {
   std::uint16_t length = 0;  ///< of the whole datagram
   std::uint16_t method = 0;
   std::uint16_t respCode = 0;
-  std::array<char, kDashboardDeviceIDSize> deviceID{};  ///< not terminated; NULs when it is shorter
+  std::array<char, kDashboardDeviceIDSize> deviceID{};  ///< not terminated; padded with NULs
   std::uint16_t eventID = 0;
-  bool isReliable = false;  ///< an acknowledgement is waited for
+  bool isReliable = false;  ///< the sender waits for an acknowledgement
   bool isWithoutProfile = false;
 
-  /// Up to the first NUL.
+  /// The device ID up to the first NUL.
   std::string_view deviceIDText() const noexcept;
   unsigned milliseconds() const noexcept { return subsecond * 4u; }
   friend bool operator==(const DashboardHeader&, const DashboardHeader&) = default;
 };
 
-/// Writes 64 bytes.
+/// Writes 64 bytes to `out`.
 void encodeDashboardHeader(const DashboardHeader& header, char* out) noexcept;
-/// Nothing for fewer than 64 bytes, for a version byte other than 1, or when the datagram's length is not the
-/// one that it states.
+/// Returns nullopt if there are fewer than 64 bytes, the version byte is not 1, or the stated length differs
+/// from the datagram's.
 std::optional<DashboardHeader> decodeDashboardHeader(std::string_view datagram) noexcept;
-/// The event ID that an acknowledgement carries; nothing when it is too short for one.
+/// The event ID in an acknowledgement; nullopt if the datagram is too short for one.
 std::optional<std::uint16_t> eventIDOfAcknowledgement(std::string_view datagram) noexcept;
 
-/// The line for the local message log, made from the datagram, so that it shows the values as they travel. At
-/// most 1151 bytes. Nothing for what is no datagram, and when the line is not UTF-8, as after a cut through a
-/// character.
+/// The line for the local message log, at most 1151 bytes. Built from the datagram, so that it shows the
+/// values as sent. Returns nullopt for a malformed datagram, or if the line is not UTF-8, for example because
+/// a character was cut.
 std::optional<std::string> writeLocalLog(std::string_view datagram);
 
 }  // namespace vesk

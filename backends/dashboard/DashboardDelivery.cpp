@@ -15,7 +15,7 @@ namespace vesk {
 
 namespace {
 
-/// Ticks before a retransmission, by the retransmissions made so far; their number is the most that are made.
+/// The ticks before each retransmission. The array's size is the maximum number of retransmissions.
 constexpr std::array<std::int32_t, 4> kTicksBeforeRetransmit{2, 3, 5, 9};
 
 }  // namespace
@@ -52,7 +52,7 @@ bool DashboardDelivery::connect(const IPv4Endpoint& server) {
   return true;
 }
 
-// Only once it is connected: before, anybody's datagrams would be read.
+// Only call this once connected: an unconnected socket would read anyone's datagrams.
 void DashboardDelivery::watchForAnswers() {
   try {
     _readSource = _networkProcQueue->makeReadSource(_socket.sharedDescriptor(), [weak = weak_from_this()] {
@@ -87,12 +87,12 @@ void DashboardDelivery::send(std::unique_ptr<Buffer> buffer, std::uint16_t lengt
       isFirst = _handedOver.empty();
       _handedOver.push_back({std::move(buffer), length, eventNumber});
     }
-    // The task that is under way already takes this datagram along.
+    // The task that is already queued takes this datagram along.
     if (isFirst) _networkProcQueue->submit([self = shared_from_this()] { self->sendHandedOver(); });
-  } catch (const std::exception&) {  // no memory
+  } catch (const std::exception&) {  // out of memory
     MutexLock lock(_mutex);
     if (!isFirst) return countLost(DropReason::OverBound);
-    // No task comes for the list; left in place, it would keep all later datagrams waiting for one.
+    // No task will handle the list. If it stayed, later datagrams would wait for such a task for ever.
     countLost(DropReason::OverBound, std::max<std::size_t>(_handedOver.size(), 1));
     _handedOver.clear();
   }
@@ -113,9 +113,9 @@ void DashboardDelivery::cleanup() {
     });
     return;
   }
-  // Waited for: a client that makes deliveries faster than the queue ends them would pile up their sockets.
+  // Waits, so that a client that creates deliveries faster than the queue ends them can't accumulate sockets.
   std::promise<void> ended;
-  auto end = ended.get_future();  // also ready when the queue was stopped and drops the work
+  auto end = ended.get_future();  // also ready if the queue is stopped and drops the work
   _networkProcQueue->submit(
       [self = shared_from_this(), ended = std::make_shared<std::promise<void>>(std::move(ended))] {
         self->cleanupSources();
@@ -140,7 +140,7 @@ void DashboardDelivery::sendHandedOver() {
   if (!datagrams.empty()) waitForRoom(std::move(datagrams));
 }
 
-/// Puts them back, before what was handed over meanwhile.
+/// Puts the datagrams back, before those handed over meanwhile.
 void DashboardDelivery::waitForRoom(std::vector<HandedOver> datagrams) {
   try {
     _networkProcQueue->submitAfter(kRoomWait, [self = shared_from_this()] {
@@ -156,13 +156,13 @@ void DashboardDelivery::waitForRoom(std::vector<HandedOver> datagrams) {
     datagrams.insert(datagrams.end(), std::make_move_iterator(_handedOver.begin()),
                      std::make_move_iterator(_handedOver.end()));
     _handedOver = std::move(datagrams);
-  } catch (const std::exception&) {  // no memory
+  } catch (const std::exception&) {  // out of memory
     countLost(DropReason::OverBound, datagrams.size());
   }
 }
 
 bool DashboardDelivery::tryToSendMsg(const char* bytes, std::uint16_t length, std::uint16_t eventNumber) {
-  if (!_timer) {  // torn down: nobody would try again
+  if (!_timer) {  // torn down: there will be no further attempt
     countLost(DropReason::Unacknowledged);
     return true;
   }
@@ -181,8 +181,8 @@ bool DashboardDelivery::tryToSendMsg(const char* bytes, std::uint16_t length, st
   return true;
 }
 
-/// The connection keeps the address that the device had when it was made. Once that is gone, another is
-/// looked for, at most once a tick.
+/// The connection keeps the device's address from when it was made. When that address is gone, reconnects to
+/// find another, at most once per tick.
 UDPSocket::Outcome DashboardDelivery::transmit(std::string_view datagram) {
   const auto outcome = _socket.send(datagram);
   if (outcome != UDPSocket::Outcome::NoRoute || std::exchange(_hasReconnected, true)) return outcome;
@@ -217,7 +217,7 @@ void DashboardDelivery::myPeriodicTask() {
   if (_cleanupState != Running) {
     continueShutdown();
   } else if (_messageQueue.empty() && _timer) {
-    _timer->pause();  // until there is something to look after again
+    _timer->pause();  // until there are datagrams to watch again
   }
 }
 
@@ -240,7 +240,7 @@ void DashboardDelivery::walkQueue() {
   }
 }
 
-/// One tick of a datagram that waits for its acknowledgement; false once it is given up.
+/// One tick of a datagram that waits for its acknowledgement. Returns false once it is abandoned.
 bool DashboardDelivery::keepsWaiting(UDPPacketToSend& packet) {
   const auto retransmits = static_cast<std::size_t>(packet.numberOfRetransmits());
   if (retransmits >= kTicksBeforeRetransmit.size()) {
@@ -265,7 +265,7 @@ void DashboardDelivery::continueShutdown() {
     _cleanupState = LastResortScheduled;
     VESK_LOG_DEBUG("DashboardBackend(myPeriodicTask): scheduled last resort clean-up in %d ms.",
                    static_cast<int>(kLastResort.count()));
-    // The timer goes on and holds this; once it doesn't, there is nothing left to do.
+    // The timer normally keeps this object alive. Once it doesn't, there is nothing left to do.
     _networkProcQueue->submitAfter(kLastResort, [weak = weak_from_this()] {
       if (auto self = weak.lock()) self->cleanupSources();
     });
@@ -276,7 +276,7 @@ void DashboardDelivery::keepTicking() {
   if (_timer && _timer->isPaused()) _timer->resume([self = shared_from_this()] { self->myPeriodicTask(); });
 }
 
-// Whoever calls this holds a reference: what the sources held may have been the last others.
+// The caller must hold a reference, since the sources may have held the last others.
 void DashboardDelivery::cleanupSources() {
   _timer.reset();
   _readSource.reset();

@@ -1,4 +1,4 @@
-// How a dashboard's datagrams get to the server: queue, retransmissions, acknowledgements, orderly shutdown.
+// The delivery of a dashboard's datagrams: queue, retransmissions, acknowledgements and shutdown.
 #pragma once
 
 #include <array>
@@ -22,14 +22,14 @@
 
 namespace vesk {
 
-/// The network half of a dashboard backend. Everything that touches the socket, the queue of datagrams or the
-/// state of the shutdown runs on one serial queue.
+/// The network half of a dashboard backend. A serial queue runs everything that uses the socket, the queued
+/// datagrams or the shutdown's state.
 ///
-/// Life: the backend holds it, and so do the work on the queue and, while datagrams are pending, the timer;
-/// the read source and the last resort do not. So it outlives its backend until the last datagram has gone
-/// or 9.5 s are over, and then lets go of everything. When the queue's threads are stopped before, it goes
-/// with its handlers. The socket is closed by the teardown, or with the object. Only so many may outlive
-/// their backends at a time; from `cleanup` to its teardown each takes a place.
+/// Owned by the backend, by the work on the queue and, while datagrams are pending, by the timer, but not by
+/// the read source and the last-resort task. It therefore outlives its backend until the last datagram is
+/// done or 9.5 s have passed. If the queue's threads are stopped before that, it is destroyed with its
+/// handlers. The socket is closed by the teardown or the destructor. The number of deliveries that outlive
+/// their backends is limited: each takes a slot from `cleanup` to its teardown.
 class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery> {
  public:
   using Buffer = std::array<char, kDashboardBufferSize>;
@@ -38,35 +38,35 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   static constexpr std::chrono::milliseconds kLastResort{9'500};
   static constexpr std::size_t kMaximumQueued = 50;
   static constexpr std::size_t kMaximumHandedOver = 1024;
-  /// What the system has no room for is tried again after this.
+  /// The delay before a datagram is sent again if the system had no room for it.
   static constexpr std::chrono::milliseconds kRoomWait{10};
 
-  /// `socket` is open. Drops are counted in `counters` under `backendName`.
+  /// `socket` must be open. Drops are counted in `counters` under `backendName`.
   DashboardDelivery(UDPSocket socket, std::shared_ptr<TimedQueue> networkProcQueue,
                     std::shared_ptr<DashboardLinger> linger, Counters& counters, std::string backendName);
   ~DashboardDelivery();
   DashboardDelivery(const DashboardDelivery&) = delete;
   DashboardDelivery& operator=(const DashboardDelivery&) = delete;
 
-  // --- Construction: in this order, on one thread. After a failure, `cleanup` gives everything back.
+  // --- Construction: in this order, on one thread. After a failure, call `cleanup`.
 
-  /// Switches reliable delivery on if the socket can be bound.
+  /// Enables reliable delivery if the socket can be bound.
   void useReliableUDP();
-  /// False when the system refuses.
+  /// Returns false if the system refuses.
   [[nodiscard]] bool connect(const IPv4Endpoint& server);
-  /// Starts the periodic task. False when there is no timer to be had.
+  /// Starts the periodic task. Returns false if no timer is available.
   [[nodiscard]] bool start(std::chrono::milliseconds tick);
 
   // --- From any thread
 
   /// Constant once constructed.
   bool isReliable() const noexcept { return _reliableUDP; }
-  /// Sends the first `length` bytes. Never waits for the network; what is sent faster than the system takes
-  /// it is bounded, the excess dropped and counted, as is what there is no memory for.
+  /// Sends the first `length` bytes. Never waits for the network. Datagrams that the system can't take yet
+  /// are queued up to a limit; beyond it, or if memory runs out, they are dropped and counted.
   void send(std::unique_ptr<Buffer> buffer, std::uint16_t length, std::uint16_t eventNumber);
-  /// Asks for the shutdown: at once when nothing is pending, else when nothing is any more, 9.5 s after the
-  /// next tick at the latest. When no place is left, tears down at once what then counts as unacknowledged,
-  /// and waits for that. Safe to call twice; not from the queue.
+  /// Requests the shutdown. It happens once nothing is pending, at the latest 9.5 s after the next tick. If
+  /// no slot is free, it happens at once, counts pending datagrams as unacknowledged, and this call waits for
+  /// it. Safe to call twice. Must not be called from the queue.
   void cleanup();
 
  private:
@@ -82,7 +82,7 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   // On the queue.
   void sendHandedOver();
   void waitForRoom(std::vector<HandedOver> datagrams);
-  /// False, and nothing has happened, when the system has no room for it.
+  /// Returns false, without any effect, if the system has no room for the datagram.
   [[nodiscard]] bool tryToSendMsg(const char* bytes, std::uint16_t length, std::uint16_t eventNumber);
   void append(UDPPacketToSend packet);
   UDPSocket::Outcome transmit(std::string_view datagram);
@@ -104,7 +104,7 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   const std::string _backendName;
   bool _reliableUDP = false;
 
-  // On the queue only, once constructed.
+  // Only used on the queue, once constructed.
   UDPSocket _socket;
   IPv4Endpoint _server;
   bool _hasReconnected = false;  ///< since the last tick
@@ -112,7 +112,7 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   std::unique_ptr<TimedQueue::Source> _readSource;
   std::optional<Metronome> _timer;
   CleanupState _cleanupState = Running;
-  bool _waitsForRoom = false;  ///< what is handed over, and work on the queue comes back to it
+  bool _waitsForRoom = false;  ///< datagrams are in `_handedOver`, and a queued task will send them
 
   // Guarded by _mutex, a leaf.
   Mutex _mutex;

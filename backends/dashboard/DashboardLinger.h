@@ -1,4 +1,4 @@
-// How many dashboards may wait for acknowledgements after their sessions' end.
+// Limits how many dashboards may wait for acknowledgements after their sessions' end.
 #pragma once
 
 #include <cstddef>
@@ -6,10 +6,10 @@
 
 namespace vesk {
 
-/// A place for each delivery that outlives its backend (DashboardDelivery.h); shared by all of a process.
+/// One slot for each delivery that outlives its backend (DashboardDelivery.h). Shared by the whole process.
 using DashboardLinger = std::counting_semaphore<>;
 
-/// As many as an orderly stop may end at once: one a connection.
+/// As many as an orderly stop may end at once: one per connection.
 inline constexpr std::size_t kMaximumLingering = 4096;
 
 }  // namespace vesk

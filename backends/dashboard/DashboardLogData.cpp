@@ -1,4 +1,4 @@
-// The upload of log data, and the message that tells where the server put it.
+// Uploads log data and sends a message with its location.
 #include "backends/dashboard/DashboardBackend.h"
 #include "platform/log/SystemLog.h"
 #include "platform/plist/KeyedArchive.h"
@@ -22,7 +22,8 @@ HTTPRequest requestFor(const std::string& url, std::string body) {
   return request;
 }
 
-/// Why `result` gives no location; null when it does. An answer without a body is no data.
+/// The reason why `result` has no location; null if it has one. An answer without a body counts as missing
+/// data.
 const char* problemWith(const HTTPResult& result) {
   if (result.error) return result.error->description.c_str();
   if (!result.response || result.response->body.empty()) return "(null)";

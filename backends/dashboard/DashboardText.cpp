@@ -12,7 +12,7 @@ namespace {
 
 constexpr std::string_view kSpecial = "\n\\=";
 
-/// One pair before it is written. A text is referred to, not copied.
+/// A pair to be written. Refers to its text without a copy.
 struct Pair {
   explicit Pair(const DictionaryEntry& entry) : key(entry.key.view()) {
     if (const Text* valueText = entry.value.text()) {
@@ -26,7 +26,7 @@ struct Pair {
 
   std::string_view description() const { return isReferred ? referred : std::string_view(made); }
 
-  /// UTF-16 code units: one a character, two beyond the first 65,536.
+  /// UTF-16 code units: one per character, two for those above U+FFFF.
   static std::size_t unitsIn(std::string_view utf8) {
     std::size_t count = 0;
     for (char c : utf8) {
@@ -44,7 +44,7 @@ struct Pair {
   std::size_t units = 0;
 };
 
-/// Takes what fits.
+/// A fixed buffer that cuts off what doesn't fit.
 class Area {
  public:
   Area(char* start, std::size_t size) : _start(start), _room(size - 1) {}

@@ -10,16 +10,16 @@
 
 namespace vesk {
 
-/// A text as it is, a number as decimal text, "null" for anything else and for none.
+/// Text unchanged, numbers as decimal text, "null" for any other value or none.
 std::string descriptionForObject(const std::optional<Value>& object);
 
-/// Without newlines, with each backslash doubled and each "=" behind a backslash of its own; "empty" for what
-/// is empty then.
+/// Removes newlines, doubles each backslash and escapes each "=" with a backslash. Returns "empty" if nothing
+/// is left.
 std::string sanitize(std::string_view text);
 
-/// Writes " key=value" for each entry, shortest value first (in UTF-16 code units, before sanitising), into
-/// `area` of `size` bytes and gives the length. The last byte of the area is never used; what does not fit is
-/// cut off. Keys are written as they are.
+/// Writes " key=value" for each entry into `area` of `size` bytes and returns the length. Shorter values come
+/// first, by UTF-16 code units before sanitising. Never uses the last byte of the area; cuts off what does
+/// not fit. Writes keys unchanged.
 std::size_t writePayloadText(const Dictionary& payload, char* area, std::size_t size);
 
 }  // namespace vesk

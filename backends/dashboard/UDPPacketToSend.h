@@ -1,4 +1,4 @@
-// A datagram that still has to go out or to be acknowledged.
+// A datagram that still has to be sent or acknowledged.
 #pragma once
 
 #include <cstdint>
@@ -7,11 +7,11 @@
 
 namespace vesk {
 
-/// Touched on its backend's network queue only.
+/// Only used on its backend's network queue.
 class UDPPacketToSend {
  public:
   enum State : std::int32_t {
-    Unsent = 0,  ///< not yet sent whole
+    Unsent = 0,  ///< not yet sent completely
     Sent = 1,    ///< waiting for its acknowledgement
   };
 
