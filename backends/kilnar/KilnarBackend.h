@@ -9,8 +9,8 @@
 
 namespace vesk {
 
-/// Every message with a method and a payload becomes one event of the power log. Keeps no state and never has
-/// anything to say for the message log.
+/// Records every message with a method and a payload as one event of the power log. Stateless. Never produces
+/// text for the message log.
 class KilnarBackend final : public VeskReportingBackend {
  public:
   static std::shared_ptr<KilnarBackend> create(const std::string& name,
