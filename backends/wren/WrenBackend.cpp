@@ -18,7 +18,7 @@ constexpr char kAdaptorBundle[] =
 constexpr char kLibraryInBundle[] = "/ZKSPerformance.so";
 constexpr char kStateDirectory[] = "/var/lib/veskreportingd";
 
-/// The bundle that has the adaptor for a client type.
+/// The path of the bundle with the adaptor for a client type.
 std::optional<std::string> bundleForClientType(std::int32_t clientType) {
   if (clientType == 7 || clientType == 11) return pathUnderRoot(kAdaptorBundle) + kLibraryInBundle;
   return std::nullopt;
@@ -29,17 +29,16 @@ void writeLine(int level, const char* line) {
   VESK_LOG(static_cast<LogLevel>(level), "WrenAdaptor: %s", line ? line : "");
 }
 
-/// Short, where there is no memory for more.
+/// Returns a short text if memory runs out.
 std::string textOf(const char* problem) noexcept {
   try {
     return problem;
   } catch (const std::bad_alloc&) {
-    return "out of memory";  // which fits into any string
+    return "out of memory";  // short enough to need no allocation
   }
 }
 
-/// Runs what an adaptor does. Whatever it throws ends here; the text of it comes back, or null when all went
-/// well.
+/// Runs an adaptor's code and catches all its exceptions. Returns the error text, or nullopt on success.
 template <class Call>
 std::optional<std::string> guarded(const Call& call) noexcept {
   try {
@@ -62,7 +61,7 @@ std::shared_ptr<WrenBackend> WrenBackend::create(const std::string& name,
   auto bundle = bundleForClientType(clientType);
   if (!bundle) {
     VESK_LOG_ERROR("WrenBackend(initWithName): No matching bundle found for client type %d", clientType);
-    nextSamplingDraw();  // one that is refused takes its place in the sequence all the same
+    nextSamplingDraw();  // a refused backend must still consume its draw
     return nullptr;
   }
   return std::shared_ptr<WrenBackend>(new WrenBackend(
@@ -102,7 +101,7 @@ void WrenBackend::makeAdaptor() noexcept {
     if (made && made->version != VESK_WREN_ADAPTOR_VERSION) {
       VESK_LOG_DEBUG("WrenBackend(initWithName): %s is made for version %u", _clientBundle.path().c_str(),
                      made->version);
-      return;  // how it would be released is not known either
+      return;  // it is not known how to release such an adaptor
     }
     _wrenAdaptor.reset(made);
   });

@@ -1,4 +1,4 @@
-// Hands messages to the device's wireless diagnostics.
+// The backend that passes messages to the device's wireless diagnostics.
 #pragma once
 
 #include <VeskReporting/WrenAdaptor.h>
@@ -12,18 +12,18 @@
 
 namespace vesk {
 
-/// Forwards every message to an adaptor that a shared library makes; what that does with it is not known
-/// here. The adaptor runs on the thread that sends the message, one message at a time, and may take its time:
-/// until it returns the session's next message waits, but nothing else that is asked of the backend. Without
-/// an adaptor, or without its forwarding operation, each message costs a line in the log and is dropped.
+/// Forwards every message to an adaptor that a shared library creates. The adaptor runs on the thread that
+/// sends the message, one message at a time. If it is slow, the session's next message waits, but no other
+/// operation of the backend does. If the adaptor or its forwarding operation is missing, each message is
+/// dropped with a line in the log.
 class WrenBackend final : public VeskReportingBackend {
  public:
-  /// Nothing, and a line in the log, for a client type that has no adaptor.
+  /// Returns null, with a line in the log, for a client type without an adaptor.
   static std::shared_ptr<WrenBackend> create(const std::string& name,
                                              const std::optional<Dictionary>& profile,
                                              const std::optional<Text>& productFamily,
                                              std::int32_t clientType, const BackendServices& services);
-  /// Without a client type: nothing.
+  /// Always returns null, since there is no client type.
   static std::shared_ptr<WrenBackend> create(const std::string& name,
                                              const std::optional<Dictionary>& profile,
                                              const std::optional<Text>& productFamily,
@@ -43,7 +43,7 @@ class WrenBackend final : public VeskReportingBackend {
                                                std::int32_t flag) override VESK_REQUIRES(_sendMutex)
       VESK_EXCLUDES(_mutex);
   void makeAdaptor() noexcept;
-  /// What went wrong comes back; nothing: all went well.
+  /// Returns the error text, or nullopt on success.
   std::optional<std::string> forwardTo(VeskWrenSendMessage forward, std::uint16_t method,
                                        std::uint16_t respCode,
                                        const std::optional<Dictionary>& payload) noexcept

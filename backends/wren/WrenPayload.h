@@ -1,4 +1,4 @@
-// A payload as adaptors see it.
+// A payload in the form that adaptors receive.
 #pragma once
 
 #include <VeskReporting/WrenAdaptor.h>
@@ -10,7 +10,7 @@
 
 namespace vesk {
 
-/// The C view of a dictionary. It borrows the dictionary's texts and bytes, which must outlive it.
+/// The C view of a dictionary. Refers to the dictionary's text and bytes, so the dictionary must outlive it.
 class WrenPayload {
  public:
   explicit WrenPayload(const Dictionary& dictionary) : _view(viewOf(dictionary)) {}
@@ -24,7 +24,7 @@ class WrenPayload {
   VeskListView viewOf(const List& list);
   VeskValueView viewOf(const Value& value);
 
-  // What the views point to; nothing in them moves once it is pointed to.
+  // The targets of the views' pointers; a deque never moves its elements.
   std::deque<std::vector<VeskEntryView>> _entries;
   std::deque<std::vector<VeskValueView>> _values;
   VeskDictionaryView _view;

@@ -1,8 +1,8 @@
-/* The adaptor through which veskreportingd hands messages to a device's wireless diagnostics.
+/* The adaptor through which veskreportingd passes messages to a device's wireless diagnostics.
  *
  * An adaptor is a shared library in the daemon's adaptor bundle. It exports one C function, WrenAdaptor,
- * which makes an adaptor: a table of operations that the daemon finds by their names. docs/adaptor.md says
- * where the library goes and what it may do. For C99 and later, and C++. */
+ * which creates an adaptor: a table of operations that the daemon finds by name. docs/adaptor.md says where
+ * to install the library and what it may do. For C99 and later, and C++. */
 #ifndef VESKREPORTING_WRENADAPTOR_H
 #define VESKREPORTING_WRENADAPTOR_H
 
@@ -16,8 +16,8 @@ extern "C" {
 #define VESK_WREN_ADAPTOR_VERSION 1u
 
 /* ---- Payloads -------------------------------------------------------------------------------------------
- * What a message says, for reading only. Everything that can be reached from a view belongs to the daemon and
- * is gone when the operation that got the view returns: an adaptor that needs it longer copies it. */
+ * A message's contents, read-only. Everything reachable from a view belongs to the daemon and is valid until
+ * the operation that received the view returns. An adaptor that needs it longer must copy it. */
 
 enum VeskValueKind {
   VeskValueNone = 0, /* the null marker */
@@ -35,7 +35,7 @@ enum VeskValueKind {
 typedef struct VeskValueView VeskValueView;
 typedef struct VeskEntryView VeskEntryView;
 
-/* Texts are UTF-8 without NUL inside; no NUL follows them. `data` may be null when `length` is 0. */
+/* UTF-8 text without NUL; not NUL-terminated. `data` may be null if `length` is 0. */
 typedef struct VeskTextView {
   const char* data;
   size_t length; /* bytes */
@@ -46,13 +46,13 @@ typedef struct VeskListView {
   size_t count;
 } VeskListView;
 
-/* Keys are unique and stand in the order in which the client gave them. */
+/* Keys are unique, in the client's order. */
 typedef struct VeskDictionaryView {
   const VeskEntryView* entries;
   size_t count;
 } VeskDictionaryView;
 
-/* Skip a value whose kind is not known: later versions may add some. Lists and dictionaries are at most 64
+/* Skip values of unknown kinds, since later versions may add some. Lists and dictionaries nest at most 64
  * levels deep. */
 struct VeskValueView {
   uint32_t kind; /* an enum VeskValueKind */
@@ -61,7 +61,7 @@ struct VeskValueView {
     int64_t signedInteger;
     uint64_t unsignedInteger;
     double real;
-    double secondsSince1970; /* a date; any double */
+    double secondsSince1970; /* a date; may be any double */
     VeskTextView text;
     VeskTextView bytes; /* any bytes */
     VeskListView list;
@@ -79,7 +79,7 @@ struct VeskEntryView {
 
 typedef struct VeskWrenAdaptor VeskWrenAdaptor;
 
-/* Cast to the type that belongs to the operation's name. */
+/* Cast to the function type that belongs to the operation's name. */
 typedef void (*VeskWrenFunction)(void);
 
 typedef struct VeskWrenOperation {
@@ -87,30 +87,29 @@ typedef struct VeskWrenOperation {
   VeskWrenFunction function;
 } VeskWrenOperation;
 
-/* The one operation that the daemon calls. */
+/* The only operation that the daemon calls. */
 #define VESK_WREN_SEND_MESSAGE "sendMessageWithMethod:respCode:dict:"
 typedef void (*VeskWrenSendMessage)(VeskWrenAdaptor* adaptor, uint16_t method, uint16_t respCode,
                                     const VeskDictionaryView* dict); /* never null */
 
-/* Usually the first member of a larger structure of the adaptor's own. Must stay as it is until it is
- * released. */
+/* Usually the first member of the adaptor's own, larger structure. Must not change until it is released. */
 struct VeskWrenAdaptor {
   uint32_t version;                          /* VESK_WREN_ADAPTOR_VERSION */
   const char* description;                   /* for log lines; may be null */
-  const VeskWrenOperation* operations;       /* ends with one whose name is null; may be null */
-  void (*release)(VeskWrenAdaptor* adaptor); /* may be null; the last call that it gets */
+  const VeskWrenOperation* operations;       /* ends with a null name; may be null */
+  void (*release)(VeskWrenAdaptor* adaptor); /* the last call; may be null */
 };
 
-/* What the daemon offers. It and all that is in it last until the adaptor was released. */
+/* What the daemon offers. Valid, with everything in it, until the adaptor has been released. */
 typedef struct VeskWrenHost {
   uint32_t version;                         /* VESK_WREN_ADAPTOR_VERSION of the daemon */
-  const char* stateDirectory;               /* where the daemon's sandbox lets an adaptor keep files */
-  void (*log)(int level, const char* line); /* 3 error, 4 warning, 6 information, 7 debugging; any thread */
+  const char* stateDirectory;               /* where the daemon's sandbox lets an adaptor store files */
+  void (*log)(int level, const char* line); /* 3 error, 4 warning, 6 info, 7 debug; thread-safe */
 } VeskWrenHost;
 
-/* The name and the type of the function that the library exports. It makes an adaptor for one session, or
- * null when it can't; the daemon has a session's adaptor do one thing at a time, those of different sessions
- * may be at work at once. */
+/* The name and type of the function that the library exports. It returns an adaptor for one session, or null
+ * if it can't create one. The daemon makes one call at a time to a session's adaptor; adaptors of different
+ * sessions may run concurrently. */
 #define VESK_WREN_ADAPTOR_FACTORY "WrenAdaptor"
 typedef VeskWrenAdaptor* (*VeskWrenAdaptorFactory)(const VeskWrenHost* host);
 
