@@ -1,4 +1,4 @@
-// An agent with real backends and a real collector behind it, whose sessions are driven by hand.
+// An agent with real backends and a real collector. Tests drive its sessions directly.
 #pragma once
 
 #include <map>
@@ -8,7 +8,7 @@
 
 namespace vesk::test {
 
-/// A connection without a peer: keeps what it is given, and what is sent to its client.
+/// A connection without a peer. Stores the handlers, and the calls sent to the client.
 class RecordingConnection final : public IPCConnection {
  public:
   std::string description() const override { return "recording connection"; }
@@ -22,8 +22,8 @@ class RecordingConnection final : public IPCConnection {
     _handlers = {};
   }
   void interrupt() { _handlers.interruption(); }
-  /// The messages that its client was handed, each as "102: 1700000000.000000 3/2 {a: text}" (who sent it,
-  /// when, what), or "closing: 0.000000 0/0".
+  /// The messages sent to the client, each as "102: 1700000000.000000 3/2 {a: text}" (sender, time, contents)
+  /// or "closing: 0.000000 0/0".
   std::vector<std::string> told() const {
     std::vector<std::string> lines;
     for (const auto& call : calls) {
@@ -44,9 +44,10 @@ class RecordingConnection final : public IPCConnection {
   }
 
   std::vector<IPCOutgoingCall> calls;
-  std::function<void(std::size_t)> lose;  ///< tells of calls that were never sent
+  std::function<void(std::size_t)> lose;  ///< reports calls that were never sent
   bool clientIsGone = false;
-  std::function<void(const IPCOutgoingCall&)> onCall;  ///< by the sender, who may hold the agent's monitor
+  std::function<void(const IPCOutgoingCall&)>
+      onCall;  ///< called on the sender's thread, which may hold the agent's monitor
 
  private:
   IPCHandlers _handlers;
@@ -54,7 +55,7 @@ class RecordingConnection final : public IPCConnection {
 
 class AgentHarness;
 
-/// A session and the connection that it believes to have; that ends with it.
+/// A session and its connection, which ends with it.
 struct DrivenSession {
   explicit DrivenSession(AgentHarness& harness);
   ~DrivenSession() {
@@ -112,7 +113,7 @@ class AgentHarness : public BackendHarness {
             busyMarker)) {}
 
   DrivenSession newSession() { return DrivenSession(*this); }
-  /// What sessions lost, as they count it; backends count under their own names.
+  /// The session's own losses; backends count under their own names.
   std::uint64_t dropped(DropReason reason) const {
     std::uint64_t sum = 0;
     for (const auto& count : counters.snapshot())

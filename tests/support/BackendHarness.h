@@ -1,5 +1,5 @@
-// What a backend needs to work in a test: a real HTTP client, a real server that keeps what it gets, a clock
-// to turn.
+// What a backend needs in a test: a real HTTP client, a real server that records posts, and a clock that the
+// test sets.
 #pragma once
 
 #include <VeskReporting/VeskReportingKeys.h>
@@ -27,7 +27,7 @@ class HandClock final : public WallClock {
   std::atomic<std::int64_t> _microseconds{0};
 };
 
-/// One post as the server got it.
+/// One post as the server received it.
 struct ReceivedPost {
   HTTPReceived request;
   boost::json::object body;
@@ -48,7 +48,7 @@ class BackendHarness {
                  [this] { return region; }},
         _server({}, [this](const HTTPReceived& request) { return receive(request); }) {}
 
-  /// All posts that arrived, once nothing is under way any more.
+  /// All posts so far, after waiting for outstanding requests.
   std::vector<ReceivedPost> posts() {
     if (!_http.waitUntilIdle(std::chrono::seconds(60))) throw std::runtime_error("posts do not end");
     std::lock_guard lock(_mutex);

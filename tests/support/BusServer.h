@@ -1,4 +1,4 @@
-// A server's sd-bus that is fed with bytes, and its view of what a message says.
+// A server-side sd-bus connection that is fed with bytes, and the values it reads from a message.
 #pragma once
 
 #include <sys/socket.h>
@@ -20,7 +20,7 @@ struct BusMessageReleaser {
 };
 using BusMessageHandle = std::unique_ptr<sd_bus_message, BusMessageReleaser>;
 
-/// Its client is authenticated and may send descriptors. Aborts on what can't happen.
+/// Its client is authenticated and may send descriptors. Aborts on unexpected failures.
 class BusServer {
  public:
   BusServer() {
@@ -42,7 +42,7 @@ class BusServer {
     if (!condition) std::abort();
   }
 
-  /// The message that `bytes` are to sd-bus; null when they are none.
+  /// Parses `bytes` with sd-bus. Returns null if they are not a message.
   BusMessageHandle read(const std::string& bytes) {
     write(bytes);
     return receive();
@@ -67,7 +67,8 @@ class BusServer {
   std::unique_ptr<sd_bus, Closer> _bus;
 };
 
-/// What is left of the container that `message` is in, as our values; false when sd-bus finds a fault.
+/// Appends the rest of the container that `message` is in, as our values. Returns false if sd-bus finds an
+/// error.
 inline bool readBySdBus(sd_bus_message* message, std::vector<Value>& out) {
   for (;;) {
     char type = 0;

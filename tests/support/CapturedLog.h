@@ -1,4 +1,4 @@
-// The system log, caught for the length of a test.
+// Captures the system log during a test.
 #pragma once
 
 #include <algorithm>
@@ -11,7 +11,7 @@
 
 namespace vesk::test {
 
-/// Collects every line of every level while it lives.
+/// Collects the lines of all levels during its lifetime.
 class CapturedLog {
  public:
   CapturedLog() {
@@ -30,12 +30,12 @@ class CapturedLog {
     std::lock_guard lock(_mutex);
     return _lines;
   }
-  /// How many lines are exactly this.
+  /// How many lines of that level are exactly `line`.
   long count(int level, std::string_view line) const {
     auto all = lines();
     return std::count(all.begin(), all.end(), std::pair<int, std::string>(level, line));
   }
-  /// How many lines of that level contain this.
+  /// How many lines of that level contain `part`.
   long countContaining(int level, std::string_view part) const {
     auto all = lines();
     return std::count_if(all.begin(), all.end(), [&](const auto& line) {

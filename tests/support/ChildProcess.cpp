@@ -19,7 +19,7 @@ namespace vesk::test {
 
 namespace {
 
-/// Opened for appending: the position of a file in memory is not locked between threads that write.
+/// Opened for appending, because threads that write don't lock the position of a file in memory.
 FileDescriptor fileHolding(const std::string& text = {}) {
   FileDescriptor file(::memfd_create("child", MFD_CLOEXEC));
   if (!file || ::write(file.get(), text.data(), text.size()) != static_cast<ssize_t>(text.size()))

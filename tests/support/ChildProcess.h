@@ -1,4 +1,4 @@
-// A program under test, run as a process of its own.
+// A program under test, run in its own process.
 #pragma once
 
 #include <sys/types.h>
@@ -15,21 +15,21 @@
 
 namespace vesk::test {
 
-/// Starts with construction and is killed with destruction. Its output goes into files in memory, so that it
-/// never waits for its reader.
+/// Starts the program on construction and kills it on destruction. Output goes to files in memory, so that
+/// the program never waits for its reader.
 class ChildProcess {
  public:
-  /// Long enough for a sanitized build on a busy machine; a test that waits this long has failed.
+  /// Long enough for a sanitized build on a busy machine. A test that waits this long has failed.
   static constexpr std::chrono::seconds kPatience{60};
 
   struct Options {
     std::vector<std::string> command;                  ///< program (path or name in PATH) and arguments
     std::map<std::string, std::string> environment{};  ///< added to the test's own
-    std::string input{};                               ///< what it reads on standard input
-    bool outputClosed = false;                         ///< runs without a standard output
+    std::string input{};                               ///< standard input
+    bool outputClosed = false;                         ///< runs without standard output
   };
 
-  /// Throws std::runtime_error when the program can't be started.
+  /// Throws std::runtime_error if the program can't be started.
   explicit ChildProcess(Options options);
   explicit ChildProcess(std::vector<std::string> command) : ChildProcess(Options{std::move(command)}) {}
   ~ChildProcess();
@@ -39,16 +39,15 @@ class ChildProcess {
   pid_t pid() const { return _pid; }
   void signal(int number) const;
 
-  /// The exit status once it has ended, 128 + the signal when one ended it; nothing when it still runs after
-  /// `patience`.
+  /// The exit status, or 128 + the signal that ended it; nullopt if it still runs after `patience`.
   std::optional<int> wait(std::chrono::milliseconds patience = kPatience);
 
-  /// What it wrote so far.
+  /// The output so far.
   std::string output() const;
   std::string errors() const;
 
-  /// Waits until it has written `text` to standard output or error, `count` times in all; false when it ended
-  /// or kPatience ran out before.
+  /// Waits until it has written `text` to standard output or error, `count` times in all. Returns false if it
+  /// ends first, or after kPatience.
   bool waitForText(std::string_view text, int count = 1) const;
 
  private:
@@ -61,13 +60,13 @@ class ChildProcess {
   std::optional<int> _status;
 };
 
-/// Looks again and again until it is so; false when ChildProcess::kPatience ran out before.
+/// Polls until the condition holds. Returns false after ChildProcess::kPatience.
 template <class Condition>
 bool eventually(Condition isSo) {
   const auto deadline = std::chrono::steady_clock::now() + ChildProcess::kPatience;
   while (!isSo()) {
     if (std::chrono::steady_clock::now() > deadline) return false;
-    std::this_thread::sleep_for(std::chrono::milliseconds(5));  // between two looks
+    std::this_thread::sleep_for(std::chrono::milliseconds(5));
   }
   return true;
 }

@@ -1,4 +1,4 @@
-// Clients of a daemon that only keeps a record.
+// Tests of clients against a daemon that only records calls.
 #pragma once
 
 #include <VeskReporting/VeskReporting.h>
@@ -9,7 +9,7 @@
 
 namespace vesk::test {
 
-/// No daemon is there until a test starts one.
+/// No daemon runs until a test starts one.
 class ClientHarness : public testing::Test {
  protected:
   ReportingOptions options() const {

@@ -41,7 +41,7 @@ DaemonHarness::DaemonHarness(std::vector<std::string> collectorArguments) {
   std::filesystem::copy(VESK_SHARE_DIRECTORY, root / "usr/share/veskreporting",
                         std::filesystem::copy_options::recursive);
   for (const auto& file : std::filesystem::recursive_directory_iterator(root / "usr/share")) {
-    using std::filesystem::perms;  // of a checkout, whose group may write to it
+    using std::filesystem::perms;  // a checkout's group may have write permission
     permissions(file.path(), perms::group_write | perms::others_write, std::filesystem::perm_options::remove);
   }
   for (const char* directory :
@@ -102,7 +102,7 @@ void DaemonHarness::launchDaemon(std::vector<std::string> arguments) {
   if (std::find(arguments.begin(), arguments.end(), "--log-level") == arguments.end())
     command.insert(command.end(), {"--log-level", "7"});
   command.insert(command.end(), arguments.begin(), arguments.end());
-  // A confined daemon may not be traced, which is how leaks are looked for.
+  // LeakSanitizer needs tracing, which the sandbox forbids.
   const char* asan = std::getenv("ASAN_OPTIONS");
   const std::string withoutLeaks = (asan ? std::string(asan) + ":" : std::string()) + "detect_leaks=0";
   _daemon = std::make_unique<ChildProcess>(ChildProcess::Options{
@@ -139,7 +139,7 @@ std::vector<boost::json::object> DaemonHarness::linesOf(const std::string& file)
   std::vector<boost::json::object> all;
   std::istringstream lines(root.read(file));
   for (std::string line; std::getline(lines, line);) {
-    if (lines.eof()) break;  // the line that is being written
+    if (lines.eof()) break;  // incomplete line
     all.push_back(boost::json::parse(line).as_object());
   }
   return all;

@@ -1,4 +1,4 @@
-// The real daemon and the real collector, as processes under a root of their own.
+// The real daemon and the real collector, as processes below a temporary root.
 #pragma once
 
 #include <VeskReporting/VeskReporting.h>
@@ -17,46 +17,48 @@
 
 namespace vesk::test {
 
-/// A collector and a daemon that trusts it, with a release-environment storebag for client type 5 ("zelko").
+/// A collector and a daemon that trusts it, with a storebag for client type 5 ("zelko") in the release
+/// environment.
 class DaemonHarness {
  public:
-  /// The daemon is started by `startDaemon`, so that a test can lay out the root first.
-  /// `collectorArguments` are added to those of the first start.
+  /// Starts the collector. Tests start the daemon with `startDaemon`, after preparing the root.
+  /// `collectorArguments` are only used for this first start.
   explicit DaemonHarness(std::vector<std::string> collectorArguments = {});
 
-  /// Again on the same ports, after `stopCollector`.
+  /// Restarts the collector on the same ports, after `stopCollector`.
   void startCollector(std::vector<std::string> arguments = {});
-  /// In order: an event that it has saved is saved whole.
+  /// Stops it in an orderly way, so that every saved event is complete.
   void stopCollector();
-  /// Waits until clients are accepted.
+  /// Starts the daemon and waits until it accepts clients.
   void startDaemon(std::vector<std::string> arguments = {});
-  /// The same without waiting.
+  /// Like `startDaemon`, without waiting.
   void launchDaemon(std::vector<std::string> arguments = {});
-  /// Ends it by SIGTERM and gives its exit status.
+  /// Ends the daemon with SIGTERM and returns its exit status.
   int stopDaemon();
   ChildProcess& daemon() const { return *_daemon; }
   ChildProcess& collector() { return *_collector; }
 
-  /// Writes a storebag source; the text may say @EVENTS@, @LOGDATA@ and @UDPPORT@ for the collector's
-  /// HTTPS URLs of events and log data and its port for datagrams.
+  /// Writes a storebag source. In its text, @EVENTS@ and @LOGDATA@ are replaced by the collector's HTTPS URLs
+  /// for events and log data, and @UDPPORT@ by its datagram port.
   void writeStorebag(const std::string& name, std::string source);
-  /// A line of the daemon's preferences or of the device's facts; `value` as TOML writes it, "" for no line.
+  /// Sets a line of the daemon's preferences or the device's facts. `value` is TOML; "" removes the line.
   void setPreference(const std::string& key, const std::string& value) { _preferences[key] = value; }
   void setDeviceFact(const std::string& key, const std::string& value) { _deviceFacts[key] = value; }
 
   std::string socketPath() const;
   ReportingOptions clientOptions() const;
 
-  /// The lines of the collector's event file, once `enough` says so; throws after ChildProcess::kPatience.
+  /// Waits for the collector's event file until `enough` returns true, and returns its lines. Throws after
+  /// ChildProcess::kPatience.
   using Enough = std::function<bool(const std::vector<boost::json::object>&)>;
   std::vector<boost::json::object> waitForEvents(const Enough& enough) {
     return waitForLines("events.jsonl", enough);
   }
-  /// The same of the datagrams that it took.
+  /// Like `waitForEvents`, for the datagrams that the collector accepted.
   std::vector<boost::json::object> waitForDatagrams(const Enough& enough) {
     return waitForLines("collector/datagrams.jsonl", enough);
   }
-  /// Until that many events of method `method` are there; gives those.
+  /// Waits for `count` events with method `method`, and returns them.
   std::vector<boost::json::object> waitForEventsOfMethod(int method, std::size_t count);
 
   void setFault(const std::string& fault);
@@ -83,7 +85,7 @@ inline Dictionary message(int category, Dictionary payload = {}, int flag = 0) {
 }
 inline bool queued(ReportingStatus status) { return status == ReportingStatus::Queued; }
 
-/// A session of client type 5, configured and started.
+/// A configured and started session of client type 5.
 struct RoadClient {
   explicit RoadClient(const DaemonHarness& harness, Dictionary moreSessionInfo = {},
                       std::optional<Dictionary> userInfo = std::nullopt,

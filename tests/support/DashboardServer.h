@@ -1,4 +1,4 @@
-// A dashboard server that answers only when it is told to.
+// A dashboard server that answers only on request.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -23,14 +23,14 @@ class DashboardServer {
 
   IPv4Endpoint endpoint() const { return _endpoint; }
 
-  /// What has arrived since the last call; loopback delivers before `send` returns.
+  /// Datagrams that arrived since the last call. On loopback they arrive before `send` returns.
   std::vector<std::string> take() {
     std::vector<std::string> datagrams;
     char buffer[2048];
     while (auto size = _socket.receive(buffer, &_client)) datagrams.emplace_back(buffer, *size);
     return datagrams;
   }
-  /// The next that arrives, in real time.
+  /// Waits for the next datagram, in real time.
   std::string next() {
     pollfd arrival{_socket.descriptor(), POLLIN, 0};
     EXPECT_EQ(::poll(&arrival, 1, 60'000), 1);
@@ -43,7 +43,7 @@ class DashboardServer {
     for (const auto& datagram : take()) ids.push_back(eventIDOfAcknowledgement(datagram).value_or(0xFFFF));
     return ids;
   }
-  /// To whoever sent last.
+  /// Sends to the last sender.
   void send(std::string_view datagram) { EXPECT_TRUE(_socket.sendTo(_client, datagram)); }
   void acknowledge(std::uint16_t eventID, std::size_t size = kDashboardShortestAcknowledgement) {
     std::string datagram(kDashboardShortestAcknowledgement, '\0');
@@ -58,7 +58,7 @@ class DashboardServer {
   IPv4Endpoint _client;
 };
 
-/// Descriptors that a process has open.
+/// The number of descriptors that a process has open.
 inline long openDescriptors(const std::string& process = "self") {
   auto files = std::filesystem::directory_iterator("/proc/" + process + "/fd");
   return std::distance(begin(files), end(files));

@@ -40,7 +40,7 @@ class FamilyHarness : public ::testing::Test {
     return Dictionary{{kVeskReportingUserInfoClientName, client},
                       {kVeskReportingUserInfoServiceName, "Calls"}};
   }
-  /// Realtime, unless another flag is given.
+  /// A realtime message, unless another flag is given.
   static Dictionary message(int flag = 1, std::string text = "text") {
     return Dictionary{
         {"category", 3}, {"type", 2}, {"flag", flag}, {"payload", Dictionary{{"a", std::move(text)}}}};
@@ -50,7 +50,7 @@ class FamilyHarness : public ::testing::Test {
   }
 
   AgentHarness harness;
-  std::optional<BackendNames> names;  // what the last start answered
+  std::optional<BackendNames> names;  // the answer to the last start
 };
 
 }  // namespace vesk::test

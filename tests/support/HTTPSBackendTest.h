@@ -1,4 +1,4 @@
-// HTTPS backends that a test builds from client entries, and what arrives of their events.
+// HTTPS backends built from client entries, and the events that arrive from them.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -20,7 +20,7 @@ inline Dictionary userNamed(const char* client, const char* service = "MyCallSer
   return {{kVeskReportingUserInfoClientName, client}, {kVeskReportingUserInfoServiceName, service}};
 }
 
-/// What a session tells a backend.
+/// What a session passes to a backend.
 struct Stamp {
   bool requireUserInfo = true;
   std::optional<Dictionary> userInfo = userNamed("Camera");
@@ -33,7 +33,7 @@ class HTTPSBackendTest : public ::testing::Test {
  protected:
   static constexpr double kStart = 1'000'000'019.7;
 
-  /// A client entry by which everything is reported, with `changes`, and without one key.
+  /// A client entry that reports everything, with `changes` applied and without the key `without`.
   Dictionary entry(const Dictionary& changes = {}, std::string_view without = "") const {
     MutableDictionary whole(Dictionary{{"post_url", harness.url()},
                                        {"realtime_post_url", harness.url("/realtime")},
@@ -76,20 +76,20 @@ class HTTPSBackendTest : public ::testing::Test {
                                          int method = 3, std::int32_t flag = 0, std::uint16_t status = 2) {
     return backend.sendMessage(payload, at(kStart + 5.25), static_cast<std::uint16_t>(method), status, flag);
   }
-  /// The message that ends a session.
+  /// Sends the message that ends a session.
   static std::optional<std::string> sendStop(VeskReportingBackend& backend,
                                              const std::optional<Dictionary>& payload = Dictionary()) {
     return send(backend, payload, 0, 0, 1);
   }
 
-  /// The posts since the last time.
+  /// The posts since the last call.
   std::vector<ReceivedPost> takeAll() {
     auto posts = harness.posts();
     const std::size_t taken = std::exchange(_taken, posts.size());
     return {posts.begin() + static_cast<std::ptrdiff_t>(taken), posts.end()};
   }
   ReceivedPost take() { return takeAll().at(0); }
-  /// Where the posts since the last time went, and how many events they had: "/post 1".
+  /// The targets of the posts since the last call with their numbers of events: "/post 1".
   Lines takeTargets() {
     Lines all;
     for (const auto& post : takeAll())
@@ -97,7 +97,7 @@ class HTTPSBackendTest : public ::testing::Test {
     std::sort(all.begin(), all.end());
     return all;
   }
-  /// The lines of HTTPS backends and the factory, behind their levels and without what all `begin` with.
+  /// The lines of HTTPS backends and the factory, each after its level, without the common prefix `begin`.
   static Lines linesOf(const CapturedLog& log, std::string_view begin = "") {
     Lines all;
     for (const auto& [level, line] : log.lines())

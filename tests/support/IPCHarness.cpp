@@ -167,7 +167,7 @@ void RawClient::send(std::string_view bytes) {
       continue;
     }
     pollfd poll{_socket.get(), POLLOUT, 0};
-    if (errno != EAGAIN || ::poll(&poll, 1, 30'000) <= 0) return;  // refused in the midst of it
+    if (errno != EAGAIN || ::poll(&poll, 1, 30'000) <= 0) return;  // the connection was refused while sending
   }
 }
 
@@ -200,7 +200,7 @@ bool RawClient::isClosed() {
 }
 
 std::string RawClient::bytesDictionary(std::size_t size, int depth) {
-  Marshalled entry(false);  // stands at a multiple of 8
+  Marshalled entry(false);  // starts at a multiple of 8
   entry.text("k");
   entry.signature("ay");
   entry.number(static_cast<std::uint32_t>(size));

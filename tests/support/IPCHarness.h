@@ -1,4 +1,4 @@
-// A listener with recording sessions behind it, and clients that are driven by hand.
+// A listener with recording sessions, and clients that tests drive directly.
 #pragma once
 
 #include "platform/ipc/BusClient.h"
@@ -9,9 +9,9 @@
 
 namespace vesk::test {
 
-/// A message's "do" decides what becomes of it: "throw", "abandon",
-/// "farewell" (the destruction calls the client); else it is answered with its "n" and as many dots as its
-/// "pad" says. Tokens are left to the test.
+/// The entry "do" of a message selects its treatment: "throw", "abandon", or "farewell" (the destructor calls
+/// the client). Otherwise the answer is the entry "n" followed by as many dots as the entry "pad" says. The
+/// test takes care of tokens.
 class ActingSession final : public RecordingSession {
  public:
   ActingSession(Record& record, std::shared_ptr<IPCConnection> connection)
@@ -37,7 +37,7 @@ class TestService : public IPCListenerDelegate {
 
   const std::string& path() const { return _path; }
   IPCListener& listener() { return *_listener; }
-  /// The connection accepted as the `index`th, while somebody holds it.
+  /// The `index`th accepted connection, or null if it has been destroyed.
   std::shared_ptr<IPCConnection> connection(std::size_t index = 0);
 
   std::function<void()> onInvalidation;
@@ -51,7 +51,7 @@ class TestService : public IPCListenerDelegate {
   std::unique_ptr<IPCListener> _listener;
 };
 
-/// A client of the library's kind, run by the test's thread.
+/// A client as in the library, run on the test's thread.
 class TestClient : public IPCExportedObject {
  public:
   explicit TestClient(const TestService& service);
@@ -60,12 +60,12 @@ class TestClient : public IPCExportedObject {
   const char* interfaceName() const override { return wire::kReplyInterface; }
   void handle(IPCIncomingCall& call) override;
 
-  /// Runs the client until the predicate holds; false when it takes half a minute or the connection ends.
+  /// Runs the client until the predicate holds. Returns false after half a minute or if the connection ends.
   bool runUntil(const std::function<bool()>& predicate);
-  /// Runs the client until the connection has ended.
+  /// Runs the client until the connection ends.
   bool runToEnd();
 
-  /// The answer's texts in one line, or the last part of the error's name.
+  /// Calls and returns the answer's texts in one line, or the last part of the error's name.
   std::string call(const char* member, std::vector<IPCArgument> arguments = {},
                    const char* interfaceName = wire::kSessionInterface);
   void post(const char* member, std::vector<IPCArgument> arguments = {});
@@ -78,7 +78,7 @@ class TestClient : public IPCExportedObject {
   std::unique_ptr<BusClient> _bus;
 };
 
-/// A client that writes bytes.
+/// A client that writes raw bytes.
 class RawClient {
  public:
   explicit RawClient(const TestService& service) : RawClient(service.path()) {}
@@ -86,10 +86,10 @@ class RawClient {
 
   int fd() const { return _socket.get(); }
   void send(std::string_view bytes);
-  /// One line of the authentication's answers; empty when the connection ended.
+  /// One line of the authentication's answers; empty if the connection has ended.
   std::string line();
   void authenticate();
-  /// Waits for the other end to close.
+  /// Waits for the peer to close.
   bool isClosed();
   void close() { _socket.reset(); }
 

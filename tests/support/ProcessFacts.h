@@ -1,4 +1,4 @@
-// What a process holds, as the kernel sees it.
+// A process's resources, as reported by the kernel.
 #pragma once
 
 #include <sys/types.h>

@@ -1,4 +1,4 @@
-// The daemon's end of the protocol, on real sockets, with sessions that only keep a record.
+// The daemon's end of the protocol, on real sockets, with sessions that only record calls.
 #pragma once
 
 #include "platform/ipc/IPCListener.h"
@@ -12,7 +12,7 @@ class RecordingDaemon : private IPCListenerDelegate {
   /// Ends all connections.
   ~RecordingDaemon() override;
 
-  /// To the client that connected last.
+  /// Sends to the client that connected last.
   void sendToClient(const std::optional<Dictionary>& sessionInfo, double timestamp, std::uint16_t category,
                     std::uint16_t type, const std::optional<Dictionary>& payload);
 

@@ -1,4 +1,4 @@
-// A server that keeps what it gets and answers as a test wants.
+// A server that records requests and answers as the test decides.
 #pragma once
 
 #include <mutex>
@@ -10,7 +10,7 @@ namespace vesk::test {
 
 class RecordingServer {
  public:
-  /// `count`: requests before this one.
+  /// `count`: the number of earlier requests.
   using Answer = std::function<HTTPAnswer(const HTTPReceived& request, std::size_t count)>;
 
   explicit RecordingServer(Answer answer = {}, HTTPServer::Options options = {})
@@ -22,13 +22,13 @@ class RecordingServer {
     std::lock_guard lock(_mutex);
     _answer = std::move(next);
   }
-  /// The same to all requests from now on.
+  /// Gives the same answer to all further requests.
   void answerWith(HTTPAnswer next) {
     answerWith([next = std::move(next)](const HTTPReceived&, std::size_t) { return next; });
   }
-  /// Goes down; its port refuses connections.
+  /// Stops the server, so that its port refuses connections.
   void stop() { _server->stop(); }
-  /// Comes back on the same port.
+  /// Starts the server again on the same port.
   void start() {
     if (_server) _options.port = _server->port();
     _server = std::make_unique<HTTPServer>(_options,
@@ -65,7 +65,7 @@ class RecordingServer {
   std::unique_ptr<HTTPServer> _server;
 };
 
-/// An answer that is badly delivered.
+/// An answer delivered with a fault.
 inline HTTPAnswer faulty(HTTPAnswer::Fault fault, std::string body = "some text") {
   HTTPAnswer answer;
   answer.fault = fault;

@@ -1,4 +1,4 @@
-// Sessions that only keep a record of what they are told.
+// Sessions that only record their calls.
 #pragma once
 
 #include <unistd.h>
@@ -15,16 +15,16 @@
 
 namespace vesk::test {
 
-/// What the sessions of one daemon were told, in that order, and what they answer. Outlives the daemon, as a
-/// test may start another one on the same socket. For any thread.
+/// Records the calls of a daemon's sessions, in order, and determines their answers. Outlives the daemon, so
+/// that a test can start another one on the same socket. Thread-safe.
 class Record {
  public:
-  /// Answers are kept back until `release`.
+  /// Answers are held until `release`.
   std::atomic<bool> holdsAnswers{false};
-  /// Answers are never given: their callers get an error.
+  /// Answers are dropped, so callers receive an error.
   std::atomic<bool> abandonsAnswers{false};
 
-  /// What startConfig and fetchStates answer.
+  /// Sets the answer of startConfig and fetchStates.
   void setBackends(std::optional<BackendNames> names) {
     std::lock_guard lock(_mutex);
     _backends = std::move(names);
@@ -60,7 +60,7 @@ class Record {
     std::lock_guard lock(_mutex);
     return countLocked(beginning);
   }
-  /// False when there are not that many within a minute.
+  /// Waits up to a minute for that number of lines. Returns false if there are fewer.
   bool waitFor(std::string_view beginning, std::size_t number = 1) const {
     std::unique_lock lock(_mutex);
     return _changed.wait_for(lock, std::chrono::minutes(1), [&] { return countLocked(beginning) >= number; });

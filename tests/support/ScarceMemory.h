@@ -1,5 +1,5 @@
-// Memory that runs out on one thread. Include it in the one source file of a test program that replaces
-// operator new.
+// Simulates out-of-memory on one thread. Replaces operator new, so include it in only one source file of a
+// test program.
 #pragma once
 
 #include <cstdlib>
@@ -8,8 +8,8 @@
 
 namespace vesk::test {
 
-/// The next allocation on the thread that makes it fails; not in sanitized builds, whose own operator new
-/// has to stay.
+/// Makes the thread's next allocation fail. Does nothing in sanitized builds, which need their own operator
+/// new.
 class ScarceMemory {
  public:
   ScarceMemory() { _isScarce = true; }

@@ -7,7 +7,7 @@
 
 namespace vesk::test {
 
-/// The outer document of a bag and the signature over some bytes.
+/// The outer document with `bag` and a signature over `signedBytes`.
 inline Dictionary storebagDocument(const TestSigningKey& key, const std::string& bag,
                                    const std::string& signedBytes) {
   return {{"signature", base64Encode(key.sign(signedBytes))}, {"bag", base64Encode(bag)}};

@@ -1,4 +1,4 @@
-// A serial queue whose time stands still until a test moves it.
+// A serial queue with simulated time, which the test advances.
 #pragma once
 
 #include <poll.h>
@@ -10,7 +10,7 @@
 
 namespace vesk::test {
 
-/// Everything runs on the test's thread, inside `run` and `advance`.
+/// Everything runs on the test's thread, within `run` and `advance`.
 class SimulatedQueue final : public TimedQueue, public std::enable_shared_from_this<SimulatedQueue> {
  public:
   Clock::time_point now() const override { return _now; }
@@ -37,7 +37,7 @@ class SimulatedQueue final : public TimedQueue, public std::enable_shared_from_t
     return std::make_unique<Held>(entry);
   }
 
-  /// What is due now, and what is readable.
+  /// Runs what is due and handles what is readable.
   void run() { advance(std::chrono::milliseconds::zero()); }
   void advance(std::chrono::milliseconds by) {
     const auto end = _now + by;
@@ -53,7 +53,7 @@ class SimulatedQueue final : public TimedQueue, public std::enable_shared_from_t
     }
     _now = end;
   }
-  /// Lets go of all work, as a pool that stops does: what it holds may hold this queue.
+  /// Drops all work, like a stopping pool: the work may hold this queue.
   void stop() {
     _isStopped = true;
     for (auto* list : {&_entries, &_readers}) {
@@ -64,7 +64,7 @@ class SimulatedQueue final : public TimedQueue, public std::enable_shared_from_t
       }
     }
   }
-  /// Timers and delayed work that still wait.
+  /// The number of waiting timers and delayed tasks.
   std::size_t waiting() {
     std::erase_if(_entries, [](const auto& entry) { return !entry->work; });
     return _entries.size();
@@ -115,7 +115,7 @@ class SimulatedQueue final : public TimedQueue, public std::enable_shared_from_t
   bool _isStopped = false;
 };
 
-/// Every backend gets the same queue.
+/// Gives every backend the same queue.
 class SimulatedQueues final : public TimedQueueMaker {
  public:
   ~SimulatedQueues() override { queue->stop(); }

@@ -1,4 +1,4 @@
-// System calls on sockets that fail as a test wants; SocketFaults.cpp puts itself before the C library.
+// Makes system calls on sockets fail. SocketFaults.cpp overrides the C library's functions.
 #pragma once
 
 #include <cerrno>
@@ -6,10 +6,10 @@
 
 namespace vesk::test {
 
-/// What happens to the calling thread's next calls.
+/// Faults for the calling thread's next calls.
 struct SocketFaults {
   static constexpr int kShort = -1;
-  /// One for each call of `send`: 0 lets it through, kShort sends too little, others are errors.
+  /// One entry for each call of `send`: 0 succeeds, kShort sends too little, other values are errors.
   static inline thread_local std::deque<int> sends;
   static inline thread_local int bindError = 0;
   static inline thread_local int socketError = 0;

@@ -1,4 +1,4 @@
-// A root prefix of the test program's own, in place before anything reads a file below it.
+// A root prefix for the test program, set before anything reads a file below it.
 #pragma once
 
 #include "platform/files/RootPrefix.h"
@@ -6,7 +6,7 @@
 
 namespace vesk::test {
 
-/// Include it in the one source file of a test program that needs an empty root.
+/// Include in only one source file of a test program. The root is initially empty.
 inline const TempDirectory& testRoot() {
   static const TempDirectory directory;
   return directory;

@@ -1,4 +1,4 @@
-// An RSA key of a test's own.
+// An RSA key for tests.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -21,7 +21,7 @@ class TestSigningKey {
   std::string publicKeyInfo() const {
     return encoded([this](unsigned char** out) { return i2d_PUBKEY(_key.get(), out); });
   }
-  /// The public key in the form of its own kind: PKCS#1 for RSA.
+  /// The public key in its type's own format: PKCS#1 for RSA.
   std::string bareKey() const {
     return encoded([this](unsigned char** out) { return i2d_PublicKey(_key.get(), out); });
   }

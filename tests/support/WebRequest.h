@@ -1,4 +1,4 @@
-// HTTP requests for tests, made with a client that is none of the project's own.
+// HTTP requests for tests, made with a client independent of the project's own.
 #pragma once
 
 #include <curl/curl.h>
@@ -15,10 +15,10 @@ struct WebAnswer {
   std::string body;
 };
 
-/// A client that keeps its connection alive between requests, as curl does.
+/// A client that keeps its connection alive between requests, like curl.
 class WebClient {
  public:
-  /// `authorityFile`: PEM file to verify HTTPS servers against; empty: the system's.
+  /// `authorityFile`: PEM file to verify HTTPS servers with; empty for the system's authorities.
   explicit WebClient(std::string authorityFile = {})
       : _authorityFile(std::move(authorityFile)), _curl(curl_easy_init()) {}
 

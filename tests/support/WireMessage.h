@@ -57,7 +57,7 @@ inline std::string wholeMessage(std::string_view start, const std::string& field
   return whole.take();
 }
 
-/// A one-way call as it goes over the wire.
+/// A one-way call in wire format.
 inline std::string wireMessage(const char* member, const std::string& signature, const std::string& body,
                                WireHeader header = {}) {
   using namespace std::string_view_literals;

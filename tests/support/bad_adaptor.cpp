@@ -1,4 +1,4 @@
-// Adaptors that are of no use, each for its reason; which one, the build says.
+// Faulty adaptors. The build selects the fault.
 #include <VeskReporting/WrenAdaptor.h>
 
 #include <fcntl.h>
@@ -11,7 +11,7 @@ namespace {
 
 std::string pipePath;
 
-/// Hangs until somebody has opened the pipe and closed it again.
+/// Blocks until the pipe has been opened and closed by its other end.
 [[maybe_unused]] void hang(VeskWrenAdaptor*, uint16_t, uint16_t, const VeskDictionaryView*) {
   char byte = 0;
   const int pipe = ::open(pipePath.c_str(), O_RDONLY);
