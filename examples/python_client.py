@@ -1,10 +1,10 @@
 #!/usr/bin/python3
-"""Sends a message over veskreportingd, knowing nothing of it but its D-Bus interface.
+"""Sends a message to veskreportingd using only its D-Bus interface.
 
-There is no bus in between: the connection goes to the daemon's own socket, and messages name no destination.
+There is no message bus: the connection goes to the daemon's own socket, and messages name no destination.
 docs/wire.md describes the members. Needs GLib's D-Bus (Debian: python3-gi).
 
-Exit status: 0 when the daemon has taken the message, 1 when something failed, 2 for wrong usage.
+Exit status: 0 if the daemon has taken the message, 1 if something failed, 2 for wrong usage.
 """
 
 import argparse
