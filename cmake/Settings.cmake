@@ -14,7 +14,7 @@ if(CCACHE_PROGRAM)
   set(CMAKE_CXX_COMPILER_LAUNCHER ${CCACHE_PROGRAM})
 endif()
 
-# Line tables are what a profile or a trace needs; whole type information doubles the time of a build.
+# Profiles and stack traces need line tables; full type information doubles the build time.
 set(CMAKE_CXX_FLAGS_RELWITHDEBINFO "-O2 -g1 -DNDEBUG")
 
 set(VESK_SANITIZE "" CACHE STRING "Sanitizers to build with, as for -fsanitize=")
@@ -36,7 +36,7 @@ if(VESK_SANITIZE)
   add_compile_options(-fsanitize=${VESK_SANITIZE} -fno-sanitize-recover=all -fno-omit-frame-pointer -O1 -g1)
   add_link_options(-fsanitize=${VESK_SANITIZE})
   if(VESK_SANITIZE MATCHES thread)
-    # ThreadSanitizer does not know fences; Boost.Asio's handlers are ordered by its locks without them.
+    # ThreadSanitizer doesn't understand fences; Boost.Asio's locks order its handlers without them.
     add_compile_definitions(BOOST_ASIO_DISABLE_FENCED_BLOCK)
   endif()
 else()
@@ -54,8 +54,9 @@ function(vesk_library name)
   target_link_libraries(${name} PUBLIC ${ARG_LINK} PRIVATE ${ARG_PRIVATE})
 endfunction()
 
-# vesk_test(NAME [FIRST | LAST] SOURCES… LINK … [TIMEOUT …]): a GoogleTest program. In a parallel run the FIRST start before
-# all others: quick tests of the system's purpose, so that a break shows at once. The LAST are slow.
+# vesk_test(NAME [FIRST | LAST] SOURCES… LINK … [TIMEOUT …]): a GoogleTest program. In a parallel run, FIRST
+# programs start before all others: quick tests of the system's purpose, so that a break shows at once. LAST
+# programs are slow.
 function(vesk_test name)
   cmake_parse_arguments(ARG "FIRST;LAST" "TIMEOUT" "SOURCES;LINK" ${ARGN})
   set(cost 50)

@@ -1,6 +1,5 @@
-# Sourced by scripts that run the daemon and a collector under a temporary root: starts them, waits until they are
-# ready, and ends them and removes everything when the script ends, however it does. Run from the project's
-# directory.
+# Sourced by scripts that run the daemon and a collector under a temporary root. Starts them, waits until they are
+# ready, and stops them and removes everything however the script ends. Run from the project's directory.
 # shellcheck shell=bash
 
 # make_root: sets `root`, laid out as the daemon expects, without a key and without preferences.
@@ -17,7 +16,7 @@ make_root() {
   chmod -R go-w "$root/usr/share/veskreporting"
 }
 
-# start NAME COMMAND…: runs it in the background with its output in $root/log/NAME.
+# start NAME COMMAND…: runs it in the background, with its output in $root/log/NAME.
 start() {
   local name=$1
   shift
@@ -25,8 +24,8 @@ start() {
   processes[$name]=$!
 }
 
-# wait_for NAME TEXT [FILE]: until there is TEXT in FILE (the program's output); fails, with that output, when the
-# program ends before, or takes a minute.
+# wait_for NAME TEXT [FILE]: waits until FILE (the program's output by default) contains TEXT. Fails, and shows the
+# output, if the program ends first or a minute has passed.
 wait_for() {
   local name=$1 text=$2 file=${3:-$root/log/$1}
   if ! timeout 60 grep -q -m1 -F -- "$text" < <(tail -n +1 -F --pid="${processes[$name]}" "$file" 2>/dev/null); then
@@ -36,7 +35,7 @@ wait_for() {
   fi
 }
 
-# stop NAME: ends it in order; its exit status.
+# stop NAME: stops it in order; returns its exit status.
 stop() {
   local process=${processes[$1]}
   unset "processes[$1]"
@@ -55,10 +54,10 @@ clean_up() {
   exit "$status"
 }
 
-# fact NAME: what the collector's ready file says.
+# fact NAME: prints that entry of the collector's ready file.
 fact() { sed -n "s/^ *\"$1\": \"\{0,1\}\([^\"]*[^\",]\)\"\{0,1\},\{0,1\}$/\1/p" "$root/ready.json"; }
 
-# start_collector BIN [OPTION…]: on free ports, with the example storebag; the daemon under this root will trust it.
+# start_collector BIN [OPTION…]: starts it on free ports, with the example storebag; the daemon under this root trusts it.
 start_collector() {
   local bin=$1
   shift
@@ -81,7 +80,7 @@ RegionCode = "DE"
 EOF
 }
 
-# start_daemon BIN [OPTION…]: until it accepts clients.
+# start_daemon BIN [OPTION…]: starts it and waits until it accepts clients.
 start_daemon() {
   local bin=$1
   shift
