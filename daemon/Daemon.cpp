@@ -18,7 +18,7 @@
 #include "platform/queue/TimedQueuePool.h"
 #include "platform/service/DescriptorLimit.h"
 #include "protocol/WireNames.h"
-#include "storebag/StorebagNaming.h"
+#include "storebag/Settings.h"
 #include "util/Counters.h"
 
 namespace vesk {

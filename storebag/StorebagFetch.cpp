@@ -9,6 +9,7 @@
 #include "platform/log/SystemLog.h"
 #include "platform/plist/PropertyList.h"
 #include "platform/text/ASCII.h"
+#include "storebag/Settings.h"
 #include "storebag/StorebagFallback.h"
 #include "storebag/StorebagNaming.h"
 #include "storebag/StorebagProfile.h"

@@ -1,12 +1,10 @@
-// Maps client types to storebags and environments to their sections, and reads the daemon's settings.
+// Which storebag a client type uses, and which section of it applies to an environment.
 #pragma once
 
 #include <cstdint>
 #include <optional>
 #include <string>
 #include <string_view>
-
-#include <VeskReporting/values/Value.h>
 
 namespace vesk {
 
@@ -15,33 +13,5 @@ std::optional<std::string_view> storebagNameForClientType(std::int32_t clientTyp
 
 /// The name of an environment type's section; nullopt for types other than 1 to 4.
 std::optional<std::string_view> environmentNameForType(std::int32_t environmentType);
-
-/// The environment types that the daemon chooses without a setting.
-inline constexpr std::int32_t kInternalEnvironment = 2;
-inline constexpr std::int32_t kSeedEnvironment = 3;
-
-/// The environment type for a setting. Logs an unusable one.
-std::int32_t environmentTypeForPreference(const std::optional<Value>& preference);
-
-/// Sets the process's environment type from the daemon's preferences. Called once, by
-/// `currentEnvironmentType`; call that instead.
-void userDefaultsEnvironment();
-
-/// Determined on first use and fixed for the life of the process. Thread-safe.
-std::int32_t currentEnvironmentType();
-
-/// A setting of the daemon's preferences suite as text (a number as decimal text), read anew by each call.
-std::optional<std::string> preferenceStringForKey(std::string_view key);
-
-/// A setting that must be an integer of at least `least`. Logs an unusable one and treats it as absent.
-std::optional<std::uint64_t> preferenceNumberForKey(std::string_view key, std::uint64_t least);
-
-/// The base URL of the storebag server, without a trailing slash: `override` unchanged, or the server for the
-/// kind of build.
-std::string storebagServerBaseURLFor(const std::optional<std::string>& override, bool internalBuild);
-
-/// The base URL for this device. The setting is read on first use and fixed for the life of the process.
-/// Thread-safe.
-std::string storebagServerBaseURL();
 
 }  // namespace vesk

@@ -3,9 +3,9 @@
 
 #include <cstdlib>
 
+#include "storebag/Settings.h"
 #include "storebag/StorebagFallback.h"
 #include "storebag/StorebagFetch.h"
-#include "storebag/StorebagNaming.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/RecordingServer.h"
 #include "tests/support/SignedStorebag.h"

@@ -5,6 +5,7 @@
 
 #include <limits>
 
+#include "storebag/Settings.h"
 #include "storebag/StorebagFallback.h"
 #include "storebag/StorebagNaming.h"
 #include "storebag/StorebagProfile.h"

@@ -7,6 +7,7 @@
 
 #include "platform/device/DeviceInformation.h"
 #include "platform/device/FirmwareFacts.h"
+#include "storebag/Settings.h"
 #include "tests/support/TestRoot.h"
 #include "util/ReportingdUtil.h"
 #include "util/URLQuery.h"

@@ -1,7 +1,7 @@
 #include "backends/https/HTTPSPostBackend.h"
 
 #include "platform/log/SystemLog.h"
-#include "storebag/StorebagNaming.h"
+#include "storebag/Settings.h"
 #include "storebag/StorebagProfile.h"
 
 namespace vesk {

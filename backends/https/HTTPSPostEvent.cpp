@@ -6,7 +6,7 @@
 #include "backends/https/HTTPSPostBackend.h"
 #include "backends/https/SenderCodes.h"
 #include "platform/device/DeviceInformation.h"
-#include "storebag/StorebagNaming.h"
+#include "storebag/Settings.h"
 #include "util/ReportingdUtil.h"
 #include "values/Conversions.h"
 

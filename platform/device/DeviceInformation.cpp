@@ -12,7 +12,6 @@
 #include "platform/device/FirmwareFacts.h"
 #include "platform/files/RootPrefix.h"
 #include "platform/files/SmallFile.h"
-#include "platform/preferences/PreferencesSuite.h"
 #include "platform/preferences/TomlFile.h"
 #include "platform/sync/Mutex.h"
 #include "platform/text/ASCII.h"
@@ -161,11 +160,6 @@ int timezoneOffsetSeconds(WallTime time) {
   const int offset = localOffset(static_cast<std::time_t>(minute * 60));
   lastAnswer.store((minute << 20) | (offset + kOffsetRange / 2), std::memory_order_relaxed);
   return offset;
-}
-
-bool diagnosticsSubmissionConsent() {
-  auto value = PreferencesSuite("com.corvane.veskreporting").valueForKey("diagnosticsSubmission");
-  return value && value->boolean() && *value->boolean();
 }
 
 }  // namespace vesk

@@ -1,4 +1,4 @@
-// Facts about the device, and its user's consent.
+// What device this is.
 #pragma once
 
 #include <optional>
@@ -32,9 +32,5 @@ std::optional<std::string> regionCode();
 /// /etc/localtime within a minute. Thread-safe, and cheap enough for every event: one atomic load within a
 /// minute.
 int timezoneOffsetSeconds(WallTime time);
-
-/// The user's consent to diagnostics submission: the boolean `diagnosticsSubmission` in the preferences suite
-/// "com.corvane.veskreporting". False if not set.
-bool diagnosticsSubmissionConsent();
 
 }  // namespace vesk
