@@ -93,9 +93,9 @@ std::optional<std::string> HTTPSPostBackend::createMessageForPostAndLogging(
     JSONWriter writer(style, 128 + events.size() * kExpectedEventSize);
     writer.beginObject();
     writer.key("postTime");
-    writer.number(postTime);
+    writer.value(postTime);
     writer.key("clientId");
-    writer.text(post.clientID);
+    writer.value(post.clientID);
     writer.key("events");
     writer.beginArray();
     for (const auto& held : events) writer.value(held.event);

@@ -1,228 +1,159 @@
 #include "platform/json/JSONWriter.h"
 
-#include <algorithm>
-#include <array>
-#include <limits>
+#include <charconv>
+#include <cmath>
+#include <cstdint>
+#include <cstring>
+#include <utility>
 
-#include "platform/json/JSONOutput.h"
 #include "platform/unicode/UTF8.h"
 
 namespace vesk {
 
 namespace {
 
-constexpr std::size_t kDeepest = 64;
+constexpr std::size_t kMaxDepth = 64;
 
-}  // namespace
-
-/// Follows the order of calls, so that RapidJSON, which asserts it, never sees a wrong one.
-class JSONWriter::Impl {
- public:
-  virtual ~Impl() = default;
-
-  bool good() const { return _isGood; }
-  virtual std::string take() = 0;
-
-  void key(std::string_view key) {
-    const bool isInOrder = _depth > 0 && !_levels[_depth - 1].isArray && !_levels[_depth - 1].hasKey;
-    if (!check(isInOrder)) return;
-    _levels[_depth - 1].hasKey = true;
-    check(writeKey(key));
+/// How many characters at the start of `text` are ASCII that a JSON string holds as it is.
+std::size_t plainPrefix(std::string_view text) {
+  constexpr std::uint64_t kOnes = 0x0101010101010101u;
+  std::size_t at = 0;
+  for (; text.size() - at >= sizeof(std::uint64_t); at += sizeof(std::uint64_t)) {
+    std::uint64_t eight;
+    std::memcpy(&eight, text.data() + at, sizeof eight);
+    // Each term sets a byte's high bit: for control characters, quotes, backslashes, bytes beyond ASCII.
+    const std::uint64_t special = (eight - kOnes * 0x20) | ((eight ^ (kOnes * '"')) - kOnes) |
+                                  ((eight ^ (kOnes * '\\')) - kOnes) | eight;
+    if ((special & (kOnes * 0x80)) != 0) break;
   }
+  auto isPlain = [](unsigned char c) { return c >= 0x20 && c < 0x80 && c != '"' && c != '\\'; };
+  while (at < text.size() && isPlain(static_cast<unsigned char>(text[at]))) ++at;
+  return at;
+}
 
-  void open(bool isArray) {
-    if (!beginValue() || !check(_depth < kDeepest)) return;
-    _levels[_depth++] = {isArray, false};
-    check(isArray ? writeStartArray() : writeStartObject());
-  }
-
-  void close(bool isArray) {
-    if (!check(_depth > 0 && _levels[_depth - 1].isArray == isArray && !_levels[_depth - 1].hasKey)) return;
-    --_depth;
-    check(isArray ? writeEndArray() : writeEndObject());
-  }
-
-  /// Writes one value with `write` when one may stand here.
-  template <class Write>
-  void value(Write write) {
-    if (beginValue()) check(write(*this, _depth));
-  }
-
-  bool isComplete() const { return _isGood && _hasRoot && _depth == 0; }
-
-  // One value or part, without a look at the order; false when it can't be written.
-  virtual bool writeKey(std::string_view key) = 0;
-  virtual bool writeText(std::string_view text) = 0;
-  virtual bool writeScalar(const Value& value) = 0;
-  virtual bool writeValue(const Value& value, std::size_t depth) = 0;
-  virtual bool writeEntries(const DictionaryEntry* begin, const DictionaryEntry* end, std::size_t depth) = 0;
-  virtual bool writeList(const List& list, std::size_t depth) = 0;
-  virtual bool writeStartObject() = 0;
-  virtual bool writeEndObject() = 0;
-  virtual bool writeStartArray() = 0;
-  virtual bool writeEndArray() = 0;
-
- private:
-  struct Level {
-    bool isArray;
-    bool hasKey;
-  };
-
-  bool check(bool isGood) {
-    _isGood = _isGood && isGood;
-    return _isGood;
-  }
-
-  bool beginValue() {
-    if (_depth == 0) {
-      if (!check(!_hasRoot)) return false;
-      _hasRoot = true;
-      return true;
-    }
-    Level& level = _levels[_depth - 1];
-    if (!check(level.isArray || level.hasKey)) return false;
-    level.hasKey = false;
-    return true;
-  }
-
-  bool _isGood = true;
-  bool _hasRoot = false;
-  std::size_t _depth = 0;
-  std::array<Level, kDeepest> _levels{};
-};
-
-namespace {
-
-template <class Writer>
-class StyledImpl final : public JSONWriter::Impl {
- public:
-  explicit StyledImpl(std::size_t reserve) : _output(reserve), _writer(_output) {}
-
-  std::string take() override { return _output.take(); }
-
-  bool writeKey(std::string_view key) override { return writeText(key); }
-
-  bool writeText(std::string_view text) override {
-    if (text.size() > kLongestText) return false;
-    if (text.empty()) return _writer.String("", 0);
-    // RapidJSON validates as it goes, but takes as many bytes as the first of a sequence announces, be they
-    // beyond the end of the text.
-    const std::string_view end = text.substr(text.size() - std::min<std::size_t>(text.size(), 3));
-    const bool mayRunOver = std::any_of(end.begin(), end.end(), [](char c) { return (c & 0x80) != 0; });
-    if (mayRunOver && !isValidUTF8(text)) return false;
-    return _writer.String(text.data(), static_cast<rapidjson::SizeType>(text.size()));
-  }
-
-  bool writeReal(double number) { return std::isfinite(number) && _writer.Double(number); }
-
-  bool writeScalar(const Value& value) override {
-    switch (value.kind()) {
-      case Value::Kind::None:
-        return _writer.Null();
-      case Value::Kind::Boolean:
-        return _writer.Bool(*value.boolean());
-      case Value::Kind::Signed:
-        return _writer.Int64(*value.signedInteger());
-      case Value::Kind::Unsigned:
-        return _writer.Uint64(*value.unsignedInteger());
-      case Value::Kind::Double:
-        return writeReal(*value.real());
-      case Value::Kind::Date:
-        return writeReal(value.date()->secondsSince1970);
-      case Value::Kind::Text:
-        return writeText(value.text()->view());
-      default:
-        return false;
-    }
-  }
-
-  bool writeValue(const Value& value, std::size_t depth) override {
-    if (const Dictionary* dictionary = value.dictionary()) {
-      return writeEntries(dictionary->begin(), dictionary->end(), depth);
-    }
-    if (const List* list = value.list()) return writeList(*list, depth);
-    return writeScalar(value);
-  }
-
-  bool writeEntries(const DictionaryEntry* begin, const DictionaryEntry* end, std::size_t depth) override {
-    if (depth >= kDeepest || !_writer.StartObject()) return false;
-    for (const DictionaryEntry* entry = begin; entry != end; ++entry) {
-      if (!writeText(entry->key.view()) || !writeValue(entry->value, depth + 1)) return false;
-    }
-    return _writer.EndObject();
-  }
-
-  bool writeList(const List& list, std::size_t depth) override {
-    if (depth >= kDeepest || !_writer.StartArray()) return false;
-    for (const Value& value : list) {
-      if (!writeValue(value, depth + 1)) return false;
-    }
-    return _writer.EndArray();
-  }
-
-  bool writeStartObject() override { return _writer.StartObject(); }
-  bool writeEndObject() override { return _writer.EndObject(); }
-  bool writeStartArray() override { return _writer.StartArray(); }
-  bool writeEndArray() override { return _writer.EndArray(); }
-
- private:
-  // RapidJSON counts in 32 bits and reserves up to six bytes for one.
-  static constexpr std::size_t kLongestText = std::numeric_limits<rapidjson::SizeType>::max() / 8;
-
-  JSONOutput _output;
-  Writer _writer;
-};
-
-}  // namespace
-
-JSONWriter::JSONWriter(JSONStyle style, std::size_t reserve) {
-  if (style == JSONStyle::Pretty) {
-    _impl = std::make_unique<StyledImpl<PrettyJSONWriter>>(reserve);
+void appendEscaped(std::string& text, char c) {
+  constexpr char kDigits[] = "0123456789ABCDEF";
+  constexpr std::string_view kSpecial = "\"\\\b\f\n\r\t";
+  if (auto at = kSpecial.find(c); at != kSpecial.npos) {
+    text += {'\\', "\"\\bfnrt"[at]};
+  } else if (static_cast<unsigned char>(c) < 0x20) {
+    text += {'\\', 'u', '0', '0', kDigits[c >> 4], kDigits[c & 15]};
   } else {
-    _impl = std::make_unique<StyledImpl<CompactJSONWriter>>(reserve);
+    text += c;
   }
 }
 
-JSONWriter::JSONWriter(JSONWriter&&) noexcept = default;
-JSONWriter& JSONWriter::operator=(JSONWriter&&) noexcept = default;
-JSONWriter::~JSONWriter() = default;
+}  // namespace
 
-void JSONWriter::beginObject() { _impl->open(false); }
-void JSONWriter::endObject() { _impl->close(false); }
-void JSONWriter::beginArray() { _impl->open(true); }
-void JSONWriter::endArray() { _impl->close(true); }
-void JSONWriter::key(std::string_view key) { _impl->key(key); }
+JSONWriter::JSONWriter(JSONStyle style, std::size_t reserve) : _isPretty(style == JSONStyle::Pretty) {
+  _text.reserve(reserve);
+}
+
+void JSONWriter::breakLine() {
+  if (_isPretty) _text.append(1, '\n').append(4 * _depth, ' ');
+}
+
+/// What stands before a value or a key.
+void JSONWriter::separate() {
+  if (std::exchange(_isMember, false)) return;
+  if (!std::exchange(_isFirst, false)) _text += ',';
+  if (_depth > 0) breakLine();
+}
+
+bool JSONWriter::open(char bracket) {
+  if (_depth == kMaxDepth) _isGood = false;
+  if (!_isGood) return false;
+  separate();
+  _text += bracket;
+  ++_depth;
+  _isFirst = true;
+  return true;
+}
+
+void JSONWriter::close(char bracket) {
+  if (!_isGood) return;
+  --_depth;
+  if (!std::exchange(_isFirst, false)) breakLine();
+  _text += bracket;
+}
+
+void JSONWriter::quote(std::string_view text) {
+  _text += '"';
+  for (bool isChecked = false; !text.empty();) {
+    const std::size_t plain = plainPrefix(text);
+    _text.append(text.data(), plain);
+    text.remove_prefix(plain);
+    if (text.empty()) break;
+    if (!std::exchange(isChecked, true) && !isValidUTF8(text)) _isGood = false;
+    appendEscaped(_text, text.front());
+    text.remove_prefix(1);
+  }
+  _text += '"';
+}
+
+void JSONWriter::key(std::string_view key) {
+  separate();
+  quote(key);
+  _text += ':';
+  if (_isPretty) _text += ' ';
+  _isMember = true;
+}
+
+template <class Integer>
+void JSONWriter::integer(Integer number) {
+  char digits[24];
+  _text.append(digits, std::to_chars(digits, std::end(digits), number).ptr);
+}
+
+void JSONWriter::real(double number) {
+  _isGood = _isGood && std::isfinite(number);
+  const double size = std::fabs(number);
+  const bool isShort = size == 0 || (size >= 1e-6 && size < 1e21);
+  const auto format = isShort ? std::chars_format::fixed : std::chars_format::scientific;
+  char digits[32];
+  const std::string_view written(digits, std::to_chars(digits, std::end(digits), number, format).ptr);
+  _text.append(written);
+  // So that readers know it for a double.
+  if (isShort && written.find('.') == written.npos) _text.append(".0");
+}
 
 void JSONWriter::value(const Value& value) {
-  _impl->value([&](Impl& impl, std::size_t depth) { return impl.writeValue(value, depth); });
-}
-
-void JSONWriter::value(const Dictionary& dictionary) {
-  _impl->value([&](Impl& impl, std::size_t depth) {
-    return impl.writeEntries(dictionary.begin(), dictionary.end(), depth);
-  });
+  if (!_isGood) return;
+  if (const Dictionary* dictionary = value.dictionary()) {
+    return object(dictionary->begin(), dictionary->end());
+  }
+  if (const List* list = value.list()) {
+    if (!open('[')) return;
+    for (const Value& item : *list) this->value(item);
+    return close(']');
+  }
+  separate();
+  if (const Text* text = value.text()) return quote(text->view());
+  if (const std::int64_t* number = value.signedInteger()) return integer(*number);
+  if (const std::uint64_t* number = value.unsignedInteger()) return integer(*number);
+  if (const double* number = value.real()) return real(*number);
+  if (const Date* date = value.date()) return real(date->secondsSince1970);
+  if (const bool* flag = value.boolean()) _text.append(*flag ? "true" : "false");
+  if (value.isNone()) _text.append("null");
+  if (value.bytes()) _isGood = false;
 }
 
 void JSONWriter::value(const MutableDictionary& dictionary) {
-  _impl->value([&](Impl& impl, std::size_t depth) {
-    const auto& entries = dictionary.entries();
-    return impl.writeEntries(entries.data(), entries.data() + entries.size(), depth);
-  });
+  object(dictionary.entries().data(), dictionary.entries().data() + dictionary.size());
 }
 
-void JSONWriter::value(const List& list) {
-  _impl->value([&](Impl& impl, std::size_t depth) { return impl.writeList(list, depth); });
+void JSONWriter::object(const DictionaryEntry* begin, const DictionaryEntry* end) {
+  if (!open('{')) return;
+  for (const DictionaryEntry* entry = begin; entry != end; ++entry) {
+    key(entry->key.view());
+    value(entry->value);
+  }
+  close('}');
 }
-
-void JSONWriter::text(std::string_view text) {
-  _impl->value([&](Impl& impl, std::size_t) { return impl.writeText(text); });
-}
-
-void JSONWriter::number(double number) { value(Value(number)); }
 
 std::optional<std::string> JSONWriter::finish() {
-  if (!_impl->isComplete()) return std::nullopt;
-  return _impl->take();
+  if (!_isGood) return std::nullopt;
+  return std::move(_text);
 }
 
 std::optional<std::string> toJSON(const Value& value, JSONStyle style) {
