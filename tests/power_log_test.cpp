@@ -3,12 +3,12 @@
 
 #include "backends/BackendFactory.h"
 #include "platform/powerlog/PowerLog.h"
-#include "platform/powerlog/PowerLogReader.h"
 #include "tests/support/BackendHarness.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/DaemonHarness.h"
 #include "tests/support/TempDirectory.h"
 #include "tools/veskreport/PowerLogCommand.h"
+#include "tools/veskreport/PowerLogReader.h"
 
 namespace vesk::test {
 namespace {
@@ -19,13 +19,8 @@ class PowerLogTest : public testing::Test {
     PowerLog::Options made;
     made.path = path;
     made.clock = &clock;
-    made.uptime = [this] { return uptime; };
     made.onLost = [this](std::uint64_t events) { lost += events; };
     return made;
-  }
-  void pass(std::chrono::seconds time) {
-    clock.advance(time);
-    uptime += time;
   }
   void record(PowerLog& powerLog, Dictionary dictionary = {{"k", 1}}) {
     powerLog.KLLogRegisteredEvent(28, "Rookery-Vesk", dictionary, std::nullopt);
@@ -45,7 +40,6 @@ class PowerLogTest : public testing::Test {
   TempDirectory directory;
   const std::string path = directory.path() / "power-log.sqlite";
   HandClock clock;
-  std::chrono::seconds uptime{60};
   std::atomic<std::uint64_t> lost{0};
 };
 
@@ -87,12 +81,12 @@ TEST_F(PowerLogTest, KeepsWhatIsYoungEnoughAndNotTooMuch) {
   PowerLog powerLog(few);
   for (int i = 0; i < 5; ++i) {
     record(powerLog, {{"i", i}});
-    pass(std::chrono::days(1));
+    clock.advance(std::chrono::days(1));
   }
   ASSERT_EQ(events().size(), 3u);
   EXPECT_EQ(events().at(0).dictionary, R"({"i":2})");
   EXPECT_EQ(events(clock.now() - std::chrono::days(2)).size(), 2u);
-  pass(std::chrono::days(9));
+  clock.advance(std::chrono::days(9));
   record(powerLog, {{"i", 5}});
   EXPECT_EQ(events().size(), 1u);
   record(powerLog, {{"text", std::string(100, 'x')}});
@@ -101,6 +95,21 @@ TEST_F(PowerLogTest, KeepsWhatIsYoungEnoughAndNotTooMuch) {
   PowerLog unwritable(few);
   record(unwritable);
   EXPECT_EQ(lost, 2u);
+}
+
+TEST_F(PowerLogTest, BeginsADamagedFileAnew) {
+  std::ofstream(path) << std::string(4096, 'x');
+  PowerLog powerLog(options());
+  CapturedLog log;
+  record(powerLog);
+  record(powerLog);
+  EXPECT_EQ(events().size(), 2u);
+  EXPECT_EQ(lost, 0u);
+  EXPECT_TRUE(std::filesystem::exists(path + ".corrupt"));
+  EXPECT_EQ(log.lines().size(), 1u);
+  std::filesystem::remove(path);
+  record(powerLog);
+  EXPECT_EQ(events().size(), 1u) << "after somebody removed it";
 }
 
 TEST(PowerLogRoad, TheDaemonRecordsAndTheToolShows) {

@@ -1,12 +1,11 @@
 #include "platform/powerlog/PowerLog.h"
 
-#include <exception>
+#include <system_error>
 #include <utility>
 
 #include "platform/crypto/Base64.h"
 #include "platform/json/JSONWriter.h"
 #include "platform/log/SystemLog.h"
-#include "platform/powerlog/PowerLogStore.h"
 #include "values/Conversions.h"
 
 namespace vesk {
@@ -35,13 +34,10 @@ Value forJSON(const Value& value) {
   return List(std::move(items));
 }
 
-std::size_t sizeOf(const PowerLogEvent& event) {
-  return sizeof event + event.name.size() + event.dictionary.size();
-}
-
 }  // namespace
 
-PowerLog::PowerLog(Options options) : _options(std::move(options)) {}
+PowerLog::PowerLog(Options options)
+    : _options(std::move(options)), _file(_options.path, _options.maximumRows) {}
 
 PowerLog::~PowerLog() {
   std::thread thread;
@@ -55,24 +51,25 @@ PowerLog::~PowerLog() {
 }
 
 void PowerLog::KLLogRegisteredEvent(std::uint32_t identifier, std::string_view name,
-                                    const Dictionary& dictionary, const std::optional<Value>&) noexcept {
-  try {
-    auto json = toJSON(forJSON(dictionary), JSONStyle::Compact);
-    if (!json || json->size() > _options.maximumEvent) return lost(1);
-    keep({identifier, std::string(name), _options.clock->now(), std::move(*json)});
-  } catch (const std::exception&) {
-    lost(1);  // no memory, or no thread
-  }
+                                    const Dictionary& dictionary, const std::optional<Value>&) {
+  auto json = toJSON(forJSON(dictionary), JSONStyle::Compact);
+  const bool isSmall = json && json->size() <= _options.maximumEvent;
+  if (!isSmall || !keep({identifier, std::string(name), _options.clock->now(), std::move(*json)})) lost(1);
 }
 
-void PowerLog::keep(PowerLogEvent event) {
+bool PowerLog::keep(PowerLogEvent event) {
   MutexLock lock(_mutex);
-  const std::size_t size = sizeOf(event);
-  if (_stopping || _waitingBytes + size > _options.maximumWaiting) return lost(1);
-  if (!_thread.joinable()) _thread = std::thread([this] { run(); });
+  const std::size_t size = sizeof event + event.name.size() + event.dictionary.size();
+  if (_stopping || _waitingBytes + size > _options.maximumWaiting) return false;
+  try {
+    if (!_thread.joinable()) _thread = std::thread([this] { run(); });
+  } catch (const std::system_error&) {
+    return false;
+  }
   _waiting.push_back(std::move(event));
   _waitingBytes += size;
   if (!_isWriting) _changed.notify_all();
+  return true;
 }
 
 void PowerLog::flush() {
@@ -80,14 +77,11 @@ void PowerLog::flush() {
   while (!_waiting.empty() || _isWriting) _changed.wait(_mutex);
 }
 
-void PowerLog::lost(std::uint64_t events) const noexcept {
+void PowerLog::lost(std::uint64_t events) const {
   if (_options.onLost) _options.onLost(events);
 }
 
-void PowerLog::run() noexcept {
-  PowerLogStore store(
-      _options.path,
-      {.age = _options.maximumAge, .rows = _options.maximumRows, .patience = _options.patience});
+void PowerLog::run() {
   while (true) {
     std::vector<PowerLogEvent> batch;
     {
@@ -100,22 +94,19 @@ void PowerLog::run() noexcept {
       _waitingBytes = 0;
       _isWriting = true;
     }
-    write(store, batch);
+    write(batch);
   }
 }
 
-void PowerLog::write(PowerLogStore& store, const std::vector<PowerLogEvent>& events) noexcept {
-  std::string error;
-  try {
-    error = store.append(events, {_options.clock->now(), _options.uptime()});
-  } catch (const std::exception& exception) {
-    error = exception.what();
-  }
+void PowerLog::write(const std::vector<PowerLogEvent>& events) {
+  const std::string error = _file.append(events, _options.clock->now());
   if (!error.empty()) {
     lost(events.size());
-    if (!_failing) VESK_LOG_ERROR("PowerLog: %s: %s; events are lost", _options.path.c_str(), error.c_str());
+    if (!_isFailing) {
+      VESK_LOG_ERROR("PowerLog: %s: %s; events are lost", _options.path.c_str(), error.c_str());
+    }
   }
-  _failing = !error.empty();
+  _isFailing = !error.empty();
 }
 
 }  // namespace vesk

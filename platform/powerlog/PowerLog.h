@@ -1,7 +1,6 @@
 // The device's log of power and energy events.
 #pragma once
 
-#include <chrono>
 #include <condition_variable>
 #include <cstddef>
 #include <cstdint>
@@ -13,28 +12,22 @@
 #include <vector>
 
 #include <VeskReporting/values/Value.h>
-#include "platform/powerlog/PowerLogEvent.h"
+#include "platform/powerlog/PowerLogFile.h"
 #include "platform/sync/Mutex.h"
 #include "platform/time/Clock.h"
 
 namespace vesk {
 
-class PowerLogStore;
-
-/// Records events in a file, on a thread of its own: whoever records one waits neither for the disk nor for
-/// another process. Thread-safe; its lock is a leaf.
+/// Records events in a file, on a thread of its own: callers wait neither for the disk nor for another
+/// process. Thread-safe; its lock is a leaf.
 class PowerLog {
  public:
   struct Options {
     std::string path;
-    std::chrono::seconds maximumAge = std::chrono::days(7);
     std::int64_t maximumRows = 100'000;
-    std::size_t maximumWaiting = std::size_t{4} << 20;             ///< bytes of events that wait for the disk
-    std::size_t maximumEvent = std::size_t{64} << 10;              ///< bytes of one event
-    std::chrono::milliseconds patience = std::chrono::seconds(5);  ///< with another process that writes
+    std::size_t maximumWaiting = std::size_t{4} << 20;  ///< bytes of events that wait for the disk
+    std::size_t maximumEvent = std::size_t{64} << 10;   ///< bytes of one event
     const WallClock* clock = &WallClock::system();
-    /// How long the machine has been up, asleep or not.
-    std::function<std::chrono::seconds()> uptime = &systemUptime;
     /// Told how many events were lost, on any thread; must not block or throw.
     std::function<void(std::uint64_t events)> onLost;
   };
@@ -45,20 +38,19 @@ class PowerLog {
   PowerLog(const PowerLog&) = delete;
   PowerLog& operator=(const PowerLog&) = delete;
 
-  /// Records an event under its registered identifier. What JSON has no form for becomes text (bytes, as
-  /// base64) or -1 (numbers that are not finite). `context` is not used. An event that can't be kept is lost
-  /// and told to `onLost`.
+  /// Records an event under its registered identifier. Bytes become base64 text, numbers that are not finite
+  /// become -1. `context` is not used. An event that can't be kept is lost and told to `onLost`.
   void KLLogRegisteredEvent(std::uint32_t identifier, std::string_view name, const Dictionary& dictionary,
-                            const std::optional<Value>& context) noexcept;
+                            const std::optional<Value>& context);
 
   /// Waits until everything recorded before is in the file or lost.
   void flush();
 
  private:
-  void keep(PowerLogEvent event);
-  void lost(std::uint64_t events) const noexcept;
-  void run() noexcept;
-  void write(PowerLogStore& store, const std::vector<PowerLogEvent>& events) noexcept;
+  bool keep(PowerLogEvent event);
+  void lost(std::uint64_t events) const;
+  void run();
+  void write(const std::vector<PowerLogEvent>& events);
 
   const Options _options;
 
@@ -70,7 +62,9 @@ class PowerLog {
   bool _stopping VESK_GUARDED_BY(_mutex) = false;
   std::thread _thread VESK_GUARDED_BY(_mutex);  ///< started by the first event
 
-  bool _failing = false;  ///< the thread's: a failure was logged and not over yet
+  // The thread's.
+  PowerLogFile _file;
+  bool _isFailing = false;  ///< a failure was logged and isn't over yet
 };
 
 }  // namespace vesk

@@ -1,4 +1,4 @@
-// SQLite's handles with destructors. Private to platform/powerlog.
+// SQLite's handles with destructors, for those who write and read the power log.
 #pragma once
 
 #include <sqlite3.h>

@@ -1,7 +1,5 @@
 #include "platform/time/Clock.h"
 
-#include <ctime>
-
 namespace vesk {
 
 namespace {
@@ -14,12 +12,6 @@ class SystemWallClock final : public WallClock {
 };
 
 }  // namespace
-
-std::chrono::seconds systemUptime() noexcept {
-  timespec time{};
-  ::clock_gettime(CLOCK_BOOTTIME, &time);
-  return std::chrono::seconds(time.tv_sec);
-}
 
 const WallClock& WallClock::system() {
   static const SystemWallClock clock;

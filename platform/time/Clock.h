@@ -19,9 +19,6 @@ class WallClock {
   static const WallClock& system();
 };
 
-/// The time since the machine started, including sleep. Independent of changes to the wall clock.
-std::chrono::seconds systemUptime() noexcept;
-
 /// Converts a wall time to POSIX form.
 inline timeval timevalFrom(WallTime time) {
   auto seconds = std::chrono::floor<std::chrono::seconds>(time);

@@ -5,10 +5,10 @@
 #include <filesystem>
 
 #include "platform/files/RootPrefix.h"
-#include "platform/powerlog/PowerLogReader.h"
 #include "platform/time/CivilTime.h"
 #include "tools/json/JSONReader.h"
 #include "tools/text/Printable.h"
+#include "tools/veskreport/PowerLogReader.h"
 
 namespace vesk {
 

@@ -1,4 +1,4 @@
-#include "platform/powerlog/PowerLogReader.h"
+#include "tools/veskreport/PowerLogReader.h"
 
 #include <cmath>
 #include <vector>

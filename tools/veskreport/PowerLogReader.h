@@ -4,7 +4,7 @@
 #include <functional>
 #include <string>
 
-#include "platform/powerlog/PowerLogEvent.h"
+#include "platform/powerlog/PowerLogFile.h"
 
 namespace vesk {
 
