@@ -3,8 +3,10 @@
 #include <cstdint>
 #include <cstdlib>
 
+#include "platform/plist/KeyedArchive.h"
 #include "platform/plist/PropertyList.h"
 #include "tools/collector/ArchiveText.h"
+#include "tools/plist/XMLPropertyListWriter.h"
 
 namespace {
 

@@ -4,7 +4,6 @@
 #include "backends/BackendFactory.h"
 #include "backends/dashboard/DashboardBackend.h"
 #include "backends/dashboard/DashboardText.h"
-#include "platform/plist/KeyedArchive.h"
 #include "tests/support/BackendHarness.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/DashboardServer.h"
@@ -12,6 +11,7 @@
 #include "tests/support/ScarceMemory.h"
 #include "tests/support/SimulatedQueues.h"
 #include "tests/support/SocketFaults.h"
+#include "tools/plist/KeyedArchiveReader.h"
 
 namespace vesk::test {
 namespace {

@@ -4,6 +4,7 @@
 #include "platform/plist/KeyedArchive.h"
 #include "tests/support/ChildProcess.h"
 #include "tests/support/TempDirectory.h"
+#include "tools/plist/KeyedArchiveReader.h"
 
 namespace vesk::test {
 namespace {
@@ -89,7 +90,7 @@ TEST(KeyedArchive, RefusesWhatIsNoArchive) {
       {*writeBinaryPropertyList(Dictionary{}), "no keyed archive: another archiver made it"},
       {document({}), "no keyed archive: it has no objects or no root"},
       {document({"$null", 1}, uid(2)), "a reference to no object"},
-      {document({"$null", list({uid(1)}), listClass}), "an object that holds itself"},
+      {document({"$null", list({uid(1)}), listClass}), "nested deeper than 64"},
       {document({"$null", Dictionary{{"$class", uid(2)}}, Dictionary{{"$classname", "Bus"}}}),
        "an object of an unknown class or form"},
       {document({"$null", Dictionary{{"$class", uid(2)}}, listClass}), "a list without items"},

@@ -3,6 +3,7 @@
 #include <cmath>
 
 #include "platform/plist/PropertyList.h"
+#include "tools/plist/XMLPropertyListWriter.h"
 
 namespace vesk {
 namespace {

@@ -3,6 +3,7 @@
 
 #include <cstdlib>
 
+#include "platform/plist/PropertyList.h"
 #include "storebag/Settings.h"
 #include "storebag/StorebagFallback.h"
 #include "storebag/StorebagFetch.h"

@@ -3,6 +3,7 @@
 #include "platform/crypto/Base64.h"
 #include "platform/plist/PropertyList.h"
 #include "tests/support/TempDirectory.h"
+#include "tools/plist/XMLPropertyListWriter.h"
 #include "tools/storebag/SigningKey.h"
 #include "tools/storebag/StorebagDocument.h"
 #include "tools/storebag/StorebagSource.h"

@@ -1,8 +1,9 @@
 #include <algorithm>
 #include <bit>
-#include <cstring>
+#include <utility>
+#include <vector>
 
-#include "platform/plist/ObjectGraphReader.h"
+#include "platform/plist/PropertyListFormats.h"
 #include "platform/unicode/Unicode.h"
 
 namespace vesk {
@@ -45,17 +46,22 @@ std::optional<Trailer> readTrailer(std::string_view bytes) {
   return trailer;
 }
 
-class BinaryReader final : private ObjectGraphReader {
+/// Reads the objects from the root down, each one anew at every reference to it.
+class BinaryReader {
  public:
   BinaryReader(std::string_view bytes, const Trailer& trailer, PropertyListFlavor flavor,
                const PropertyListLimits& limits)
-      : ObjectGraphReader(limits),
-        _objects(bytes.substr(0, trailer.offsetTable)),
+      : _objects(bytes.substr(0, trailer.offsetTable)),
         _offsets(bytes.substr(trailer.offsetTable, trailer.objectCount * trailer.offsetSize)),
         _trailer(trailer),
-        _flavor(flavor) {}
+        _flavor(flavor),
+        _budget(limits) {}
 
-  PropertyListOutcome read() { return readFrom(_trailer.rootObject); }
+  PropertyListOutcome read() {
+    auto root = readObject(_trailer.rootObject, 1);
+    if (!root) return {std::nullopt, _error};
+    return {std::move(root), {}};
+  }
 
  private:
   /// Where an object's payload starts, and what its marker says.
@@ -65,34 +71,69 @@ class BinaryReader final : private ObjectGraphReader {
     std::size_t payload;
   };
 
-  bool readObject(Index index, std::size_t depth, Object& object) override {
+  /// Keeps the first error.
+  std::nullopt_t fail(std::string error) {
+    if (_error.empty()) _error = std::move(error);
+    return std::nullopt;
+  }
+
+  std::optional<Value> readObject(std::uint64_t index, std::size_t depth) {
     if (index >= _trailer.objectCount) return fail("reference to no object");
     auto marker = readMarker(bigEndian(_offsets.substr(index * _trailer.offsetSize, _trailer.offsetSize)));
-    if (!marker) return false;
-    const std::size_t count = marker->count;
-    auto referenceAt = [&](std::size_t place) {
-      const std::size_t start = marker->payload + place * _trailer.referenceSize;
-      return bigEndian(_objects.substr(start, _trailer.referenceSize));
-    };
-    switch (marker->kind) {
-      case 0xA:
-        return hasRoomFor(*marker, 1) && readList(count, referenceAt, depth, object);
-      case 0xD: {
-        auto itemAt = [&](std::size_t place) { return referenceAt(count + place); };
-        return hasRoomFor(*marker, 2) && readDictionary(count, referenceAt, itemAt, depth, object);
-      }
-      default:
-        break;
-    }
+    if (!marker) return std::nullopt;
+    if (marker->kind == 0xA) return readList(*marker, depth);
+    if (marker->kind == 0xD) return readDictionary(*marker, depth);
     auto value = leafAt(*marker);
-    return value ? readLeaf(*std::move(value), object) : fail("an object that can't be read");
+    if (!value) return fail("an object that can't be read");
+    if (!_budget.addLeaf(*value)) return fail(_budget.error());
+    return value;
+  }
+
+  std::optional<Value> readList(const Marker& list, std::size_t depth) {
+    if (!beginContainer(list, 1, depth)) return std::nullopt;
+    std::vector<Value> values;
+    for (std::size_t i = 0; i < list.count; ++i) {
+      auto item = readObject(referenceAt(list, i), depth + 1);
+      if (!item) return std::nullopt;
+      values.push_back(*std::move(item));
+    }
+    return List(std::move(values));
+  }
+
+  std::optional<Value> readDictionary(const Marker& dictionary, std::size_t depth) {
+    if (!beginContainer(dictionary, 2, depth)) return std::nullopt;
+    MutableDictionary entries;
+    for (std::size_t i = 0; i < dictionary.count; ++i) {
+      auto key = readObject(referenceAt(dictionary, i), depth + 1);
+      if (key && !key->text()) return fail("a key that is no text");
+      auto item = key ? readObject(referenceAt(dictionary, dictionary.count + i), depth + 1) : std::nullopt;
+      if (!item) return std::nullopt;
+      entries.append(*key->text(), *std::move(item));
+    }
+    return entries.shareUnique();
+  }
+
+  /// Whether it may stand at `depth` and all its references are there.
+  bool beginContainer(const Marker& container, std::size_t referencesPerEntry, std::size_t depth) {
+    const std::size_t room = (_objects.size() - std::min(container.payload, _objects.size())) /
+                             (_trailer.referenceSize * referencesPerEntry);
+    if (container.count > room) {
+      fail("a container that reaches over the end");
+    } else if (!_budget.addContainer(depth)) {
+      fail(_budget.error());
+    }
+    return _error.empty();
+  }
+
+  std::uint64_t referenceAt(const Marker& container, std::size_t place) const {
+    return bigEndian(
+        _objects.substr(container.payload + place * _trailer.referenceSize, _trailer.referenceSize));
   }
 
   std::optional<Marker> readMarker(std::uint64_t offset) {
     // An object before the first byte after the magic number, or in the table of offsets, is none.
     if (offset < kBinaryPropertyListMagic.size() || offset >= _objects.size()) {
-      fail("an offset outside of the objects");
-      return std::nullopt;
+      return fail("an offset outside of the objects");
     }
     const unsigned byte = static_cast<unsigned char>(_objects[offset]);
     Marker marker{byte >> 4, byte & 0xF, offset + 1};
@@ -102,10 +143,7 @@ class BinaryReader final : private ObjectGraphReader {
     auto sizeMarker = bytesAt(marker.payload, 1);
     const unsigned exponent = sizeMarker ? static_cast<unsigned char>((*sizeMarker)[0]) ^ 0x10u : 4;
     auto length = exponent <= 3 ? bytesAt(marker.payload + 1, std::size_t{1} << exponent) : std::nullopt;
-    if (!length) {
-      fail("a length that can't be read");
-      return std::nullopt;
-    }
+    if (!length) return fail("a length that can't be read");
     marker.count = bigEndian(*length);
     marker.payload += 1 + length->size();
     return marker;
@@ -187,17 +225,12 @@ class BinaryReader final : private ObjectGraphReader {
     return Value(Dictionary{{Text(kUIDKey), Value(bigEndian(*bytes))}});
   }
 
-  /// Whether all references of a container are there.
-  bool hasRoomFor(const Marker& marker, std::uint64_t referencesPerEntry) {
-    const std::uint64_t room = (_objects.size() - std::min(marker.payload, _objects.size())) /
-                               (_trailer.referenceSize * referencesPerEntry);
-    return marker.count <= room || fail("a container that reaches over the end");
-  }
-
   const std::string_view _objects;  // the magic number and the objects
   const std::string_view _offsets;
   const Trailer _trailer;
   const PropertyListFlavor _flavor;
+  PropertyListBudget _budget;
+  std::string _error;
 };
 
 }  // namespace

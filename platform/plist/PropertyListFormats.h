@@ -1,8 +1,9 @@
-// The two encodings of property lists, for PropertyList.cpp.
+// The two encodings of property lists, and the limits that their readers share.
 #pragma once
 
 #include <string>
 #include <string_view>
+#include <utility>
 
 #include "platform/plist/PropertyList.h"
 
@@ -18,28 +19,39 @@ PropertyListOutcome parseXMLPropertyList(std::string_view bytes, const PropertyL
 PropertyListOutcome parseBinaryPropertyList(std::string_view bytes, PropertyListFlavor flavor,
                                             const PropertyListLimits& limits);
 
-/// Counts what a document costs and says when it is too much.
+/// Counts what a document costs. Each operation returns false once a limit is passed; `error` says which.
 class PropertyListBudget {
  public:
   explicit PropertyListBudget(const PropertyListLimits& limits) : _limits(limits) {}
 
-  bool add(std::size_t nodes, std::size_t contentBytes) {
-    _nodes += nodes;
+  bool addContainer(std::size_t depth) {
+    if (depth > _limits.depth) return refuse("nested deeper than " + std::to_string(_limits.depth));
+    return addLeaf(0);
+  }
+  bool addLeaf(std::size_t contentBytes) {
+    if (++_nodes > _limits.nodes) return refuse("more than " + std::to_string(_limits.nodes) + " values");
     _contentBytes += contentBytes;
-    return _nodes <= _limits.nodes && _contentBytes <= _limits.contentBytes;
+    if (_contentBytes <= _limits.contentBytes) return true;
+    return refuse("more than " + std::to_string(_limits.contentBytes) + " bytes of content");
   }
-  bool allowsDepth(std::size_t depth) const { return depth <= _limits.depth; }
+  bool addLeaf(const Value& value) {
+    const Text* text = value.text();
+    const Bytes* bytes = value.bytes();
+    return addLeaf(text ? text->size() : bytes ? bytes->size() : 0);
+  }
 
-  std::string depthError() const { return "nested deeper than " + std::to_string(_limits.depth); }
-  std::string sizeError() const {
-    return _nodes > _limits.nodes ? "more than " + std::to_string(_limits.nodes) + " values"
-                                  : "more than " + std::to_string(_limits.contentBytes) + " bytes of content";
-  }
+  const std::string& error() const { return _error; }
 
  private:
+  bool refuse(std::string error) {
+    _error = std::move(error);
+    return false;
+  }
+
   const PropertyListLimits& _limits;
   std::size_t _nodes = 0;
   std::size_t _contentBytes = 0;
+  std::string _error;
 };
 
 }  // namespace vesk

@@ -2,19 +2,12 @@
 
 #include <charconv>
 #include <chrono>
-#include <cmath>
-#include <cstdio>
+
+#include "platform/text/ASCII.h"
 
 namespace vesk {
 
 namespace {
-
-std::string_view trimmed(std::string_view text) {
-  constexpr std::string_view kSpace = " \t\r\n";
-  const std::size_t first = text.find_first_not_of(kSpace);
-  if (first == std::string_view::npos) return {};
-  return text.substr(first, text.find_last_not_of(kSpace) - first + 1);
-}
 
 /// The whole of `text` as a number, digits only.
 std::optional<std::uint64_t> digits(std::string_view text, int base) {
@@ -61,12 +54,6 @@ std::optional<double> realFromPropertyListText(std::string_view text) {
   return number;
 }
 
-std::string propertyListTextFromReal(double number) {
-  char text[64];
-  auto [end, error] = std::to_chars(text, text + sizeof text, number);
-  return {text, end};
-}
-
 std::optional<Date> dateFromPropertyListText(std::string_view text) {
   using namespace std::chrono;
   text = trimmed(text);
@@ -83,27 +70,6 @@ std::optional<Date> dateFromPropertyListText(std::string_view text) {
   if (!date.ok() || *hour > 23 || *minute > 59 || *second > 59) return std::nullopt;
   const auto time = sys_days(date) + hours(*hour) + minutes(*minute) + seconds(*second);
   return Date{static_cast<double>(sys_seconds(time).time_since_epoch().count())};
-}
-
-std::optional<std::string> propertyListTextFromDate(Date date) {
-  using namespace std::chrono;
-  constexpr sys_seconds kFirst = sys_days(year(1) / 1 / 1);
-  constexpr sys_seconds kAfterLast = sys_days(year(10000) / 1 / 1);
-  const double wholeSeconds = std::floor(date.secondsSince1970);
-  if (!(wholeSeconds >= static_cast<double>(kFirst.time_since_epoch().count())) ||
-      !(wholeSeconds < static_cast<double>(kAfterLast.time_since_epoch().count()))) {
-    return std::nullopt;
-  }
-  const sys_seconds time{seconds(static_cast<std::int64_t>(wholeSeconds))};
-  const auto dayStart = floor<days>(time);
-  const year_month_day calendar(dayStart);
-  const hh_mm_ss clock(time - dayStart);
-  char text[32];
-  std::snprintf(text, sizeof text, "%04d-%02u-%02uT%02d:%02d:%02dZ", static_cast<int>(calendar.year()),
-                static_cast<unsigned>(calendar.month()), static_cast<unsigned>(calendar.day()),
-                static_cast<int>(clock.hours().count()), static_cast<int>(clock.minutes().count()),
-                static_cast<int>(clock.seconds().count()));
-  return text;
 }
 
 }  // namespace vesk

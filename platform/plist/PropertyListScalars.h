@@ -1,8 +1,7 @@
-// The texts that XML property lists write numbers and dates as.
+// Numbers and dates in XML property lists.
 #pragma once
 
 #include <optional>
-#include <string>
 #include <string_view>
 
 #include <VeskReporting/values/Value.h>
@@ -14,9 +13,7 @@ namespace vesk {
 std::optional<Value> integerFromPropertyListText(std::string_view text);
 /// A decimal number, "nan" or an infinity.
 std::optional<double> realFromPropertyListText(std::string_view text);
-std::string propertyListTextFromReal(double number);
 /// "2026-11-24T20:31:29Z".
 std::optional<Date> dateFromPropertyListText(std::string_view text);
-std::optional<std::string> propertyListTextFromDate(Date date);
 
 }  // namespace vesk

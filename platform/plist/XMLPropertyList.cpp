@@ -2,7 +2,6 @@
 
 #include <array>
 #include <memory>
-#include <new>
 #include <optional>
 #include <vector>
 
@@ -89,8 +88,9 @@ class XMLReader {
       return fail("unknown element <" + cutToWholeCharacters(name, kShown) + ">");
     if (!mayStart(element)) return fail("element <" + std::string(name) + "> may not stand here");
     // The plist element itself is no container of the value.
-    if (isContainer(element) && !_budget.allowsDepth(_frames.size())) return fail(_budget.depthError());
-    if (element != Element::PList && !_budget.add(1, 0)) return fail(_budget.sizeError());
+    const bool isCheap = element == Element::PList ||
+                         (isContainer(element) ? _budget.addContainer(_frames.size()) : _budget.addLeaf(0));
+    if (!isCheap) return fail(_budget.error());
     _frames.push_back({element, {}, {}});
   }
 
@@ -181,36 +181,31 @@ class XMLReader {
     }
   }
 
-  // --- Expat calls these; no exception may pass through it, and after a failure it may still call.
+  // --- Expat calls these, even after a failure. No exception may pass through it.
 
   template <class Handle>
-  static void guarded(void* self, Handle handle) noexcept {
+  static void handle(void* self, Handle handle) noexcept {
     auto& reader = *static_cast<XMLReader*>(self);
-    if (!reader._error.empty()) return;
-    try {
-      handle(reader);
-    } catch (const std::bad_alloc&) {
-      reader.fail("out of memory");
-    }
+    if (reader._error.empty()) handle(reader);
   }
   static void onStart(void* self, const XML_Char* name, const XML_Char**) {
-    guarded(self, [&](XMLReader& reader) { reader.start(name); });
+    handle(self, [&](XMLReader& reader) { reader.start(name); });
   }
   static void onEnd(void* self, const XML_Char*) {
-    guarded(self, [](XMLReader& reader) { reader.end(); });
+    handle(self, [](XMLReader& reader) { reader.end(); });
   }
   static void onText(void* self, const XML_Char* text, int size) {
-    guarded(self, [&](XMLReader& reader) { reader.text({text, static_cast<std::size_t>(size)}); });
+    handle(self, [&](XMLReader& reader) { reader.text({text, static_cast<std::size_t>(size)}); });
   }
   static void onDoctype(void* self, const XML_Char*, const XML_Char*, const XML_Char*,
                         int hasInternalSubset) {
     // Only declarations in the document itself could define entities: the one it refers to is never fetched.
-    guarded(self, [&](XMLReader& reader) {
+    handle(self, [&](XMLReader& reader) {
       if (hasInternalSubset) reader.fail("declarations are not allowed");
     });
   }
   static void onSkippedEntity(void* self, const XML_Char*, int) {
-    guarded(self, [](XMLReader& reader) { reader.fail("unknown entity"); });
+    handle(self, [](XMLReader& reader) { reader.fail("unknown entity"); });
   }
 
   XML_Parser _parser;

@@ -2,8 +2,8 @@
 #pragma once
 
 #include "platform/crypto/Base64.h"
-#include "platform/plist/PropertyList.h"
 #include "tests/support/TestSigningKey.h"
+#include "tools/plist/XMLPropertyListWriter.h"
 
 namespace vesk::test {
 

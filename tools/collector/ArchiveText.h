@@ -4,7 +4,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/plist/KeyedArchive.h"
+#include "tools/plist/KeyedArchiveReader.h"
 
 namespace vesk {
 

@@ -5,6 +5,7 @@
 #include "platform/crypto/Base64.h"
 #include "platform/crypto/RSAPublicKey.h"
 #include "platform/plist/PropertyList.h"
+#include "tools/plist/XMLPropertyListWriter.h"
 
 namespace vesk {
 

@@ -1,11 +1,44 @@
+#include "tools/plist/XMLPropertyListWriter.h"
+
+#include <charconv>
+#include <chrono>
+#include <cmath>
+#include <cstdio>
+
 #include "platform/crypto/Base64.h"
-#include "platform/plist/PropertyListFormats.h"
-#include "platform/plist/PropertyListScalars.h"
+#include "platform/plist/PropertyList.h"
 #include "platform/unicode/UTF8.h"
 
 namespace vesk {
 
 namespace {
+
+std::string textFromReal(double number) {
+  char text[64];
+  auto [end, error] = std::to_chars(text, text + sizeof text, number);
+  return {text, end};
+}
+
+std::optional<std::string> textFromDate(Date date) {
+  using namespace std::chrono;
+  constexpr sys_seconds kFirst = sys_days(year(1) / 1 / 1);
+  constexpr sys_seconds kAfterLast = sys_days(year(10000) / 1 / 1);
+  const double wholeSeconds = std::floor(date.secondsSince1970);
+  if (!(wholeSeconds >= static_cast<double>(kFirst.time_since_epoch().count())) ||
+      !(wholeSeconds < static_cast<double>(kAfterLast.time_since_epoch().count()))) {
+    return std::nullopt;
+  }
+  const sys_seconds time{seconds(static_cast<std::int64_t>(wholeSeconds))};
+  const auto dayStart = floor<days>(time);
+  const year_month_day calendar(dayStart);
+  const hh_mm_ss clock(time - dayStart);
+  char text[32];
+  std::snprintf(text, sizeof text, "%04d-%02u-%02uT%02d:%02d:%02dZ", static_cast<int>(calendar.year()),
+                static_cast<unsigned>(calendar.month()), static_cast<unsigned>(calendar.day()),
+                static_cast<int>(clock.hours().count()), static_cast<int>(clock.minutes().count()),
+                static_cast<int>(clock.seconds().count()));
+  return text;
+}
 
 /// Writes one value; every operation tells whether it could.
 class XMLWriter {
@@ -21,13 +54,13 @@ class XMLWriter {
       case Value::Kind::Unsigned:
         return writeElement("integer", std::to_string(*value.unsignedInteger()), indent);
       case Value::Kind::Double:
-        return writeElement("real", propertyListTextFromReal(*value.real()), indent);
+        return writeElement("real", textFromReal(*value.real()), indent);
       case Value::Kind::Text:
         return writeText("string", value.text()->view(), indent);
       case Value::Kind::Bytes:
         return writeElement("data", base64Encode(value.bytes()->view()), indent);
       case Value::Kind::Date: {
-        auto text = propertyListTextFromDate(*value.date());
+        auto text = textFromDate(*value.date());
         return text && writeElement("date", *text, indent);
       }
       case Value::Kind::List:
