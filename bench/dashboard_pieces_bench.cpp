@@ -10,7 +10,7 @@
 #include "backends/dashboard/DashboardText.h"
 #include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
-#include "platform/queue/TimedQueuePool.h"
+#include "platform/queue/QueueThread.h"
 #include "util/MessageLog.h"
 
 namespace vesk {
@@ -52,7 +52,7 @@ struct Sender {
 
   Sink sink;
   Counters counters;
-  TimedQueuePool queues{1};
+  QueueThread queues;
   HTTPClient http;
   BackendServices services{http, WallClock::system(), counters, queues, {}, {}, {}};
   std::shared_ptr<VeskReportingBackend> backend;

@@ -12,7 +12,7 @@
 #include "platform/ipc/MessageReader.h"
 #include "platform/ipc/MessageWriter.h"
 #include "platform/json/JSONWriter.h"
-#include "platform/queue/TimedQueuePool.h"
+#include "platform/queue/QueueThread.h"
 #include "util/Gzip.h"
 
 namespace vesk {
@@ -67,7 +67,7 @@ class Services {
  private:
   HTTPClient _http;
   Counters _counters;
-  TimedQueuePool _queues{1};
+  QueueThread _queues;
 };
 
 /// A whole message as a client sends it.

@@ -15,7 +15,7 @@
 #include "platform/ipc/IPCListener.h"
 #include "platform/log/SystemLog.h"
 #include "platform/powerlog/PowerLog.h"
-#include "platform/queue/TimedQueuePool.h"
+#include "platform/queue/QueueThread.h"
 #include "platform/service/DescriptorLimit.h"
 #include "protocol/WireNames.h"
 #include "storebag/Settings.h"
@@ -130,7 +130,7 @@ struct Daemon::Parts {
   }
 
   // Sending a datagram doesn't block, so one thread serves all backends.
-  TimedQueuePool networkQueues{1};
+  QueueThread networkQueues;
   // Declared before the client: posts that complete while the client ends still use the services.
   BackendServices backendServices;
   SessionServices sessionServices;

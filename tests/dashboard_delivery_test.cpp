@@ -4,7 +4,7 @@
 #include <numeric>
 
 #include "backends/dashboard/DashboardDelivery.h"
-#include "platform/queue/TimedQueuePool.h"
+#include "platform/queue/QueueThread.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/DashboardServer.h"
 #include "tests/support/SimulatedQueues.h"
@@ -296,12 +296,12 @@ TEST(UDPSocketTest, FindsAnotherWayOrReceivesNothing) {
 }
 
 /// In real time, towards `server`.
-std::shared_ptr<DashboardDelivery> reliableOn(TimedQueuePool& pool, const DashboardServer& server,
+std::shared_ptr<DashboardDelivery> reliableOn(QueueThread& thread, const DashboardServer& server,
                                               std::shared_ptr<DashboardLinger> linger, Counters& counters,
                                               milliseconds tick) {
   UDPSocket socket;
   EXPECT_EQ(socket.open(), 0);
-  auto delivery = std::make_shared<DashboardDelivery>(std::move(socket), pool.makeQueue("test"),
+  auto delivery = std::make_shared<DashboardDelivery>(std::move(socket), thread.makeQueue("test"),
                                                       std::move(linger), counters, "dashboard");
   delivery->useReliableUDP();
   EXPECT_TRUE(delivery->connect(server.endpoint()));
@@ -314,16 +314,16 @@ TEST(DeliveryOnThreads, SendsAgainUntilAnsweredInRealTime) {
   Counters counters;
   DashboardServer server;
   {
-    TimedQueuePool pool(1);
+    QueueThread thread;
     auto delivery =
-        reliableOn(pool, server, std::make_shared<DashboardLinger>(1), counters, milliseconds(10));
+        reliableOn(thread, server, std::make_shared<DashboardLinger>(1), counters, milliseconds(10));
     delivery->send(std::make_unique<DashboardDelivery::Buffer>(), kDashboardHeaderSize, 0);
     const auto first = server.next();
     EXPECT_EQ(server.next(), first);
     server.send(first);
     delivery->cleanup();
     delivery.reset();
-    EXPECT_TRUE(pool.waitUntilUnused(std::chrono::minutes(1)));
+    EXPECT_TRUE(thread.waitUntilUnused(std::chrono::minutes(1)));
   }
   EXPECT_EQ(openDescriptors(), before + 1) << "the server's";
   EXPECT_TRUE(counters.snapshot().empty());
@@ -336,18 +336,18 @@ TEST(DeliveryOnThreads, EndAtOnceBeyondTheirPlacesAndLeaveNothingBehindWhenStopp
   auto linger = std::make_shared<DashboardLinger>(kPlaces);
   {
     DashboardServer server;  // that does not answer
-    TimedQueuePool pool(1);
+    QueueThread thread;
     const long started = openDescriptors();
     for (int i = 0; i < 3 * kPlaces; ++i) {
-      auto delivery = reliableOn(pool, server, linger, counters, milliseconds(500));
+      auto delivery = reliableOn(thread, server, linger, counters, milliseconds(500));
       delivery->send(std::make_unique<DashboardDelivery::Buffer>(), kDashboardHeaderSize, 1);
       delivery->cleanup();
-      EXPECT_LE(openDescriptors(), started + kPlaces + 4) << "three are the pool's, one may be on its way";
+      EXPECT_LE(openDescriptors(), started + kPlaces + 4) << "three are the thread's, one may be on its way";
     }
-    EXPECT_FALSE(pool.waitUntilUnused(milliseconds(1)));
+    EXPECT_FALSE(thread.waitUntilUnused(milliseconds(1)));
     EXPECT_GE(server.take().size(), 3u * kPlaces) << "each went out, some maybe again";
-    pool.stop();
-    EXPECT_TRUE(pool.waitUntilUnused(milliseconds(1)));
+    thread.stop();
+    EXPECT_TRUE(thread.waitUntilUnused(milliseconds(1)));
   }
   EXPECT_EQ(openDescriptors(), before);
   ASSERT_EQ(counters.snapshot().size(), 1u);

@@ -5,7 +5,7 @@
 
 #include "platform/log/LogRateLimit.h"
 #include "platform/log/LogUser.h"
-#include "platform/queue/WorkQueue.h"
+#include "platform/queue/QueueThread.h"
 #include "tests/support/CapturedLog.h"
 
 namespace vesk::test {
@@ -61,11 +61,11 @@ TEST(SystemLog, LimitsAllButErrorsForEachUserOnWhoseBehalfAThreadWorks) {
   {
     LogUser user(7);
     flood("client");
-    WorkQueuePool pool(1);
-    WorkQueue queue(pool);
+    QueueThread thread;
+    auto queue = thread.makeQueue("queue");
     std::promise<void> done;
-    queue.submit([&] { flood("queue"); });
-    queue.submitAfter(0ms, [&] {
+    queue->submit([&] { flood("queue"); });
+    queue->submitAfter(0ms, [&] {
       flood("timer");
       done.set_value();
     });

@@ -1,12 +1,15 @@
-// Serial queues and timers, on real threads.
+// Serial queues and timers, on their real thread.
 #include <gtest/gtest.h>
 
-#include <atomic>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
 #include <future>
 #include <optional>
 #include <stdexcept>
 
-#include "platform/queue/WorkQueue.h"
+#include "platform/queue/QueueThread.h"
 #include "tests/support/CapturedLog.h"
 
 namespace vesk {
@@ -17,69 +20,79 @@ using std::chrono::milliseconds;
 class Queues : public testing::Test {
  protected:
   /// Waits until everything submitted to the queue before has run.
-  static void drain(WorkQueue& queue) {
+  void drain() {
     std::promise<void> done;
-    queue.submit([&done] { done.set_value(); });
+    queue->submit([&done] { done.set_value(); });
     done.get_future().wait();
   }
 
-  WorkQueuePool pool{3};
-  WorkQueue queue{pool};
-  std::promise<void> done;
+  QueueThread thread;
+  std::shared_ptr<TimedQueue> queue = thread.makeQueue("queue");
 };
-using WorkTimerTest = Queues;
 
-TEST_F(Queues, RunsItsWorkOneAtATimeInOrder) {
+TEST_F(Queues, RunTheirWorkInOrder) {
   std::vector<int> order;  // guarded by the queue itself
-  std::atomic<int> inside{0};
-  for (int i = 0; i < 500; ++i) {
-    queue.submit([&, i] {
-      EXPECT_EQ(inside.fetch_add(1), 0);
-      order.push_back(i);
-      inside.fetch_sub(1);
-    });
-  }
-  drain(queue);
+  for (int i = 0; i < 500; ++i) queue->submit([&, i] { order.push_back(i); });
+  drain();
   ASSERT_EQ(order.size(), 500u);
   EXPECT_TRUE(std::is_sorted(order.begin(), order.end()));
 }
 
 TEST_F(Queues, GoOnAfterWorkThatThrows) {
   test::CapturedLog log;
-  queue.submit([] { throw std::runtime_error("broken"); });
-  queue.submit([] { throw 7; });
-  drain(queue);
-  EXPECT_EQ(log.countContaining(3, ""), 2);
+  queue->submit([] { throw std::runtime_error("broken"); });
+  queue->submit([] { throw 7; });
+  drain();
+  EXPECT_EQ(log.count(3, "queue: work failed: broken"), 1);
+  EXPECT_EQ(log.count(3, "queue: work failed"), 1);
 }
 
-TEST_F(WorkTimerTest, RepeatsUntilItCancelsItself) {
+TEST_F(Queues, TimersRepeatUntilTheyCancelThemselves) {
   int fired = 0;
-  WorkTimer timer;
-  queue.submit([&] {
-    timer = WorkTimer(queue, milliseconds(0), milliseconds(1), [&] {
+  std::promise<void> done;
+  std::unique_ptr<TimedQueue::Source> timer;
+  queue->submit([&] {
+    timer = queue->makeTimer(milliseconds(0), milliseconds(1), [&] {
       if (++fired < 3) return;
-      timer.cancel();
-      timer.cancel();
+      timer.reset();
       done.set_value();
     });
   });
   done.get_future().wait();
   std::promise<void> later;
-  queue.submitAfter(milliseconds(20), [&] { later.set_value(); });
+  queue->submitAfter(milliseconds(20), [&] { later.set_value(); });
   later.get_future().wait();
   EXPECT_EQ(fired, 3);
 }
 
-TEST(WorkQueuePool, StopDestroysWhatHasNotRun) {
+TEST_F(Queues, SourcesLetGoOfTheirDescriptorWhenDestroyedElsewhere) {
+  std::array<int, 2> ends{};
+  ASSERT_EQ(::pipe(ends.data()), 0);
+  FileDescriptor writer(ends[1]);
+  auto reader = std::make_shared<const FileDescriptor>(ends[0]);
+  std::promise<void> read;
+  auto source = queue->makeReadSource(reader, [&] {
+    char byte;
+    EXPECT_EQ(::read(reader->get(), &byte, 1), 1);
+    read.set_value();
+  });
+  ASSERT_EQ(::write(writer.get(), "x", 1), 1);
+  read.get_future().wait();
+  source.reset();
+  drain();
+  EXPECT_EQ(reader.use_count(), 1);
+}
+
+TEST(QueueThread, StopDestroysWhatHasNotRun) {
   auto token = std::make_shared<int>(1);
-  std::optional<WorkQueuePool> pool(std::in_place, 1);
-  WorkQueue queue(*pool);
-  WorkTimer timer(queue, std::chrono::hours(1), milliseconds(0), [token, queue] {});
-  queue.submitAfter(std::chrono::hours(1), [token, queue] {});
-  pool->stop();
-  pool.reset();
-  queue.submit([token] { ADD_FAILURE(); });
-  WorkTimer late(queue, milliseconds(0), milliseconds(1), [token] { ADD_FAILURE(); });
+  std::optional<QueueThread> thread(std::in_place);
+  auto queue = thread->makeQueue("queue");
+  auto timer = queue->makeTimer(std::chrono::hours(1), milliseconds(1), [token, queue] {});
+  queue->submitAfter(std::chrono::hours(1), [token, queue] {});
+  thread->stop();
+  thread.reset();
+  queue->submit([token] { ADD_FAILURE(); });
+  auto late = queue->makeTimer(milliseconds(0), milliseconds(1), [token] { ADD_FAILURE(); });
   EXPECT_EQ(token.use_count(), 1);
 }
 

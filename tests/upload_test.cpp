@@ -14,7 +14,7 @@
 #include "backends/BackendFactory.h"
 #include "backends/upload/UploadBackend.h"
 #include "platform/ipc/ExtensionTokens.h"
-#include "platform/queue/TimedQueuePool.h"
+#include "platform/queue/QueueThread.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/RecordingServer.h"
 #include "tests/support/ScarceMemory.h"
@@ -77,7 +77,7 @@ class UploadTest : public testing::Test {
   std::function<HTTPAnswer()> answer = [] { return says("success"); };
   RecordingServer server{[this](const HTTPReceived&, std::size_t) { return answer(); }};
   HTTPClient http;
-  TimedQueuePool queues{1};
+  QueueThread queues;
   BackendServices services{http, WallClock::system(), counters, queues, {}, {}, {}};
   std::shared_ptr<UploadBackend> backend = make(server.url("/upload"));
 };

@@ -7,7 +7,7 @@
 namespace vesk {
 
 /// During its lifetime, lines that this thread logs count as lines of a client's user (see
-/// SystemLog::setRateLimit). May be nested. Work that is handed to another thread keeps its user (WorkQueue,
+/// SystemLog::setRateLimit). May be nested. Work that is handed to another thread keeps its user (TimedQueue,
 /// HTTPClient).
 class LogUser {
  public:

@@ -6,7 +6,6 @@
 
 #include <cerrno>
 #include <cstring>
-#include <new>
 #include <utility>
 
 namespace vesk {
@@ -63,15 +62,11 @@ std::string IPv4Endpoint::text() const {
   return dotted + std::to_string(port);
 }
 
-int UDPSocket::open() noexcept {
+int UDPSocket::open() {
   FileDescriptor descriptor(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
   if (!descriptor) return errno;
-  try {
-    _descriptor = std::make_shared<const FileDescriptor>(std::move(descriptor));
-    return 0;
-  } catch (const std::bad_alloc&) {
-    return ENOMEM;
-  }
+  _descriptor = std::make_shared<const FileDescriptor>(std::move(descriptor));
+  return 0;
 }
 
 int UDPSocket::bind(const IPv4Endpoint& local) noexcept {

@@ -32,7 +32,7 @@ class UDPSocket {
  public:
   /// Opens nothing.
   UDPSocket() noexcept = default;
-  [[nodiscard]] int open() noexcept;
+  [[nodiscard]] int open();
   [[nodiscard]] int bind(const IPv4Endpoint& local) noexcept;
   /// To the wildcard address and a port that the system picks.
   [[nodiscard]] int bindToAnyPort() noexcept { return bind({}); }

@@ -2,22 +2,26 @@
 #pragma once
 
 #include <chrono>
+#include <functional>
 #include <memory>
 
 #include "platform/files/FileDescriptor.h"
-#include "platform/queue/WorkQueue.h"
 
 namespace vesk {
 
+/// Runs on a queue; must not block for long. What it throws is logged.
+using Work = std::function<void()>;
+
 /// Runs work one at a time, in order, and calls handlers at times and when descriptors are readable; its own
-/// clock says when. A WorkQueue in the daemon; a test may stand in for the clock and turn it by hand.
-/// Thread-safe.
+/// clock says when. QueueThread makes those of the daemon; a test may stand in for the clock and turn it by
+/// hand. Thread-safe.
 class TimedQueue {
  public:
   using Clock = std::chrono::steady_clock;
 
   /// Calls its handler until it is destroyed. Destroyed on the queue, the handler is not called any more;
-  /// elsewhere, a call that has begun may still go on. What the handler captured goes with it.
+  /// elsewhere, the handler may be called until the queue gets to know of it. What the handler captured goes
+  /// with it.
   class Source {
    public:
     virtual ~Source() = default;
@@ -28,10 +32,13 @@ class TimedQueue {
   virtual void submit(Work work) = 0;
   /// Once, not before `delay` is over. Can't be taken back.
   virtual void submitAfter(std::chrono::milliseconds delay, Work work) = 0;
-  /// Fires after `first`, then every `interval`, which is more than zero.
+  /// Fires after `first`, then every `interval`, which is more than zero. Firings that were missed are not
+  /// made up for.
   virtual std::unique_ptr<Source> makeTimer(std::chrono::milliseconds first,
                                             std::chrono::milliseconds interval, Work handler) = 0;
-  /// As ReadSource.
+  /// Calls its handler whenever the descriptor has something to read, and again while anything is left. Keeps
+  /// its share of the descriptor until it has stopped watching. Throws std::system_error for a descriptor
+  /// that can't be watched.
   virtual std::unique_ptr<Source> makeReadSource(std::shared_ptr<const FileDescriptor> descriptor,
                                                  Work handler) = 0;
 };

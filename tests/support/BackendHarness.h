@@ -10,7 +10,7 @@
 #include <stdexcept>
 
 #include "backends/VeskReportingBackend.h"
-#include "platform/queue/TimedQueuePool.h"
+#include "platform/queue/QueueThread.h"
 #include "tools/collector/HTTPServer.h"
 
 namespace vesk::test {
@@ -68,7 +68,7 @@ class BackendHarness {
 
   HandClock clock;
   Counters counters;
-  TimedQueuePool networkQueues{1};
+  QueueThread networkQueues;
   bool consent = true;
   std::optional<std::string> region = "US";
 
