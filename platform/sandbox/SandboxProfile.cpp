@@ -1,7 +1,9 @@
 #include "platform/sandbox/SandboxProfile.h"
 
+#include <algorithm>
 #include <cstdlib>
 #include <filesystem>
+#include <iterator>
 #include <system_error>
 
 #include "platform/files/RootPrefix.h"
@@ -65,11 +67,9 @@ std::vector<std::string> texts(const std::string& where, const Value& value) {
 
 void addPaths(std::vector<SandboxPath>& paths, const std::string& where, const DictionaryEntry& entry,
               bool underRoot) {
-  const PathKey* key = nullptr;
-  for (const PathKey& known : kPathKeys) {
-    if (entry.key == known.name) key = &known;
-  }
-  if (!key) fail(where, "unknown key");
+  const auto* key =
+      std::ranges::find_if(kPathKeys, [&](const auto& known) { return entry.key == known.name; });
+  if (key == std::end(kPathKeys)) fail(where, "unknown key");
   for (const std::string& written : texts(where, entry.value)) {
     if (!written.starts_with('/') && !written.starts_with('$')) {
       fail(where, inQuotes(written) + " is no absolute path");
@@ -80,63 +80,48 @@ void addPaths(std::vector<SandboxPath>& paths, const std::string& where, const D
   }
 }
 
-const Dictionary& table(const DictionaryEntry& entry) {
-  const Dictionary* dictionary = entry.value.dictionary();
-  if (!dictionary) fail(entry.key.string(), "must be a table");
-  return *dictionary;
-}
-
-bool isRequired(const Value& value) {
-  if (value == Value("required")) return true;
-  if (value == Value("if-available")) return false;
-  fail("landlock", "must be \"required\" or \"if-available\"");
-}
-
-std::vector<std::uint16_t> connectPorts(const Dictionary& network) {
+std::vector<std::uint16_t> ports(const std::string& where, const Value& value) {
   std::vector<std::uint16_t> ports;
-  for (const DictionaryEntry& entry : network) {
-    const std::string where = "network." + entry.key.string();
-    if (!(entry.key == "connect")) fail(where, "unknown key");
-    const List* list = entry.value.list();
-    if (!list) fail(where, "must be a list of ports");
-    for (const Value& port : *list) {
-      const std::int64_t number = port.asInteger().value_or(0);
-      if (number < 1 || number > 65535) fail(where, "must be a list of ports");
-      ports.push_back(static_cast<std::uint16_t>(number));
-    }
+  const List* list = value.list();
+  if (!list) fail(where, "must be a list of ports");
+  for (const Value& port : *list) {
+    const std::int64_t number = port.asInteger().value_or(0);
+    if (number < 1 || number > 65535) fail(where, "must be a list of ports");
+    ports.push_back(static_cast<std::uint16_t>(number));
   }
   return ports;
 }
 
-std::vector<std::string> deniedCalls(const Dictionary& calls) {
-  std::vector<std::string> groups;
-  for (const DictionaryEntry& entry : calls) {
-    std::string where = "calls." + entry.key.string();
-    if (!(entry.key == "deny")) fail(where, "unknown key");
-    groups = texts(where, entry.value);
-    for (const std::string& group : groups) {
+void readEntry(SandboxProfile& profile, const Text& table, const DictionaryEntry& entry) {
+  const std::string where = table.string() + "." + entry.key.string();
+  if (table == "machine" || table == "root") {
+    addPaths(profile.paths, where, entry, table == "root");
+  } else if (where == "network.connect") {
+    profile.connectPorts = ports(where, entry.value);
+  } else if (where == "calls.deny") {
+    profile.deniedCalls = texts(where, entry.value);
+    for (const std::string& group : profile.deniedCalls) {
       if (!isCallGroup(group)) fail(where, "unknown group " + inQuotes(group));
     }
+  } else {
+    fail(where, "unknown key");
   }
-  return groups;
 }
 
 SandboxProfile profileFrom(const Dictionary& document) {
+  constexpr std::string_view kTables[] = {"machine", "root", "network", "calls"};
   SandboxProfile profile;
   for (const DictionaryEntry& entry : document) {
+    const std::string where = entry.key.string();
     if (entry.key == "landlock") {
-      profile.landlockRequired = isRequired(entry.value);
-    } else if (entry.key == "machine" || entry.key == "root") {
-      for (const DictionaryEntry& paths : table(entry)) {
-        addPaths(profile.paths, entry.key.string() + "." + paths.key.string(), paths, entry.key == "root");
-      }
-    } else if (entry.key == "network") {
-      profile.connectPorts = connectPorts(table(entry));
-    } else if (entry.key == "calls") {
-      profile.deniedCalls = deniedCalls(table(entry));
-    } else {
-      fail(entry.key.string(), "unknown key");
+      profile.landlockRequired = entry.value == Value("required");
+      if (profile.landlockRequired || entry.value == Value("if-available")) continue;
+      fail(where, "must be \"required\" or \"if-available\"");
     }
+    if (std::ranges::find(kTables, where) == std::end(kTables)) fail(where, "unknown key");
+    const Dictionary* table = entry.value.dictionary();
+    if (!table) fail(where, "must be a table");
+    for (const DictionaryEntry& each : *table) readEntry(profile, entry.key, each);
   }
   return profile;
 }

@@ -11,8 +11,9 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
-#include <initializer_list>
+#include <cstdint>
 #include <memory>
 #include <system_error>
 
@@ -20,44 +21,12 @@ namespace vesk {
 
 namespace {
 
-/// A filter under construction. The first error sticks.
-class Filter {
- public:
-  Filter() : _context(seccomp_init(SCMP_ACT_ALLOW), &seccomp_release) {
-    if (!_context) {
-      note(-ENOMEM);
-      return;
-    }
-    note(seccomp_attr_set(_context.get(), SCMP_FLTATR_ACT_BADARCH, SCMP_ACT_KILL_PROCESS));
-    note(seccomp_attr_set(_context.get(), SCMP_FLTATR_CTL_TSYNC, 1));
-    note(seccomp_attr_set(_context.get(), SCMP_FLTATR_CTL_OPTIMIZE, 2));
-  }
-
-  /// By name, because a build machine's headers need not know every call that the library knows. A call that
-  /// this architecture does not have is none to deny.
-  void deny(std::initializer_list<const char*> calls, std::initializer_list<scmp_arg_cmp> when = {},
-            int error = EPERM) {
-    for (const char* call : calls) {
-      int number = seccomp_syscall_resolve_name(call);
-      if (!_context || number < 0) continue;
-      note(seccomp_rule_add_array(_context.get(), SCMP_ACT_ERRNO(static_cast<std::uint32_t>(error)), number,
-                                  static_cast<unsigned>(when.size()), when.begin()));
-    }
-  }
-
-  /// The error number, or 0.
-  int load() {
-    if (_error == 0) note(seccomp_load(_context.get()));
-    return -_error;
-  }
-
- private:
-  void note(int result) {
-    if (result < 0 && _error == 0) _error = result;
-  }
-
-  std::unique_ptr<void, void (*)(scmp_filter_ctx)> _context;
-  int _error = 0;
+/// Calls of a group that are denied, all or when every condition on their arguments holds.
+struct Rule {
+  std::string_view group;
+  std::vector<const char*> calls;
+  std::vector<scmp_arg_cmp> when = {};
+  int error = EPERM;
 };
 
 // The comparisons of libseccomp's macros, without their compound literals, which C++ lacks.
@@ -74,9 +43,6 @@ scmp_arg_cmp hasBits(unsigned argument, std::uint64_t bits) { return hasBits(arg
 constexpr std::uint64_t kPriorityOfProcess = 1;
 constexpr std::uint64_t kAskForPersonality = 0xffffffff;
 
-void denyExecute(Filter& filter) { filter.deny({"execve", "execveat"}); }
-
-// Threads are made with clone. The flags of clone3 stand in memory, where a filter can't see them.
 constexpr unsigned kCloneFlags =
 #if defined(__s390x__)
     1;
@@ -84,168 +50,141 @@ constexpr unsigned kCloneFlags =
     0;
 #endif
 
-void denyProcesses(Filter& filter) {
-  filter.deny({"fork", "vfork"});
-  filter.deny({"clone"}, {hasBits(kCloneFlags, CLONE_THREAD, 0)});
-  filter.deny({"clone3"}, {}, ENOSYS);
-}
+// Calls stand by name, because a build machine's headers need not know every call that the library knows.
+std::vector<Rule> allRules() {
+  const auto self = static_cast<std::uint64_t>(::getpid());
+  std::vector<Rule> rules = {
+      {"execute", {"execve", "execveat"}},
 
-void denyNamespaces(Filter& filter) {
-  filter.deny({"unshare", "setns"});
+      // Threads are made with clone. The flags of clone3 stand in memory, where a filter can't see them.
+      {"processes", {"fork", "vfork"}},
+      {"processes", {"clone"}, {hasBits(kCloneFlags, CLONE_THREAD, 0)}},
+      {"processes", {"clone3"}, {}, ENOSYS},
+
+      {"other-processes", {"kill", "tgkill", "rt_sigqueueinfo", "rt_tgsigqueueinfo"}, {isOther(0, self)}},
+      {"other-processes",
+       {"prlimit64", "migrate_pages", "move_pages", "sched_setscheduler", "sched_setparam", "sched_setattr",
+        "sched_setaffinity"},
+       {isOther(0, 0)}},
+      // The first argument says whether the second is a process, a group or a user.
+      {"other-processes", {"setpriority", "ioprio_set"}, {isOther(1, 0)}},
+      {"other-processes", {"setpriority"}, {isOther(0, PRIO_PROCESS)}},
+      {"other-processes", {"ioprio_set"}, {isOther(0, kPriorityOfProcess)}},
+      {"other-processes", {"tkill", "pidfd_send_signal", "process_mrelease"}},
+
+      {"trace",
+       {"ptrace", "process_vm_readv", "process_vm_writev", "process_madvise", "pidfd_getfd", "kcmp",
+        "perf_event_open"}},
+
+      {"namespaces", {"unshare", "setns"}},
+      {"namespaces", {"clone3"}, {}, ENOSYS},
+
+      {"mounts",
+       {"mount", "umount", "umount2", "pivot_root", "chroot", "move_mount", "open_tree", "fsopen", "fsconfig",
+        "fsmount", "fspick", "mount_setattr", "swapon", "swapoff", "quotactl", "quotactl_fd"}},
+
+      {"kernel", {"kexec_load", "kexec_file_load", "init_module",   "finit_module",   "delete_module",
+                  "bpf",        "reboot",          "iopl",          "ioperm",         "syslog",
+                  "acct",       "sethostname",     "setdomainname", "lookup_dcookie", "uselib",
+                  "vm86",       "vm86old",         "modify_ldt",    "_sysctl",        "nfsservctl",
+                  "vhangup",    "fanotify_init"}},
+
+      {"clock",
+       {"settimeofday", "clock_settime", "clock_settime64", "clock_adjtime", "clock_adjtime64", "adjtimex",
+        "stime"}},
+
+      {"identity",
+       {"setuid", "setuid32", "setgid", "setgid32", "setreuid", "setreuid32", "setregid", "setregid32",
+        "setresuid", "setresuid32", "setresgid", "setresgid32", "setfsuid", "setfsuid32", "setfsgid",
+        "setfsgid32", "setgroups", "setgroups32", "capset"}},
+
+      {"ownership",
+       {"chown", "chown32", "lchown", "lchown32", "fchownat", "setxattr", "lsetxattr", "removexattr",
+        "lremovexattr"}},
+
+      {"modes", {"chmod", "fchmod", "fchmodat", "fchmodat2"}},
+
+      // A file that is open for reading only gets truncated all the same, with no right to write.
+      {"truncation", {"truncate", "truncate64"}},
+      {"truncation", {"open"}, {hasBits(1, O_ACCMODE | O_TRUNC, O_RDONLY | O_TRUNC)}},
+      {"truncation", {"openat"}, {hasBits(2, O_ACCMODE | O_TRUNC, O_RDONLY | O_TRUNC)}},
+      {"truncation", {"openat2"}, {}, ENOSYS},
+
+      {"handles", {"open_by_handle_at"}},
+      {"devices", {"mknod", "mknodat"}},
+      {"devices", {"ioctl"}, {isEqual(1, TIOCSTI)}},
+      {"keys", {"add_key", "request_key", "keyctl"}},
+      {"faults", {"userfaultfd"}},
+      {"io-uring", {"io_uring_setup", "io_uring_enter", "io_uring_register"}},
+
+      {"sockets", {"socket"}, {{0, SCMP_CMP_GT, AF_MAX, 0}}},
+      {"sockets", {"socket"}, {isEqual(0, AF_NETLINK), isOther(2, NETLINK_ROUTE)}},
+      {"sockets", {"socket"}, {isEqual(0, AF_INET), hasBits(1, 0xf, SOCK_RAW)}},
+      {"sockets", {"socket"}, {isEqual(0, AF_INET6), hasBits(1, 0xf, SOCK_RAW)}},
+
+      {"writable-code", {"mmap", "mmap2"}, {hasBits(2, PROT_WRITE | PROT_EXEC)}},
+      // A file could be mapped twice, to write and to execute. Libraries are mapped privately.
+      {"writable-code", {"mmap", "mmap2"}, {hasBits(2, PROT_EXEC), hasBits(3, MAP_TYPE, MAP_SHARED)}},
+      {"writable-code",
+       {"mmap", "mmap2"},
+       {hasBits(2, PROT_EXEC), hasBits(3, MAP_TYPE, MAP_SHARED_VALIDATE)}},
+      {"writable-code", {"memfd_create", "memfd_secret"}},
+      {"writable-code", {"personality"}, {isOther(0, kAskForPersonality)}},  // READ_IMPLIES_EXEC is one
+      {"writable-code", {"mprotect", "pkey_mprotect"}, {hasBits(2, PROT_EXEC)}},
+      {"writable-code", {"shmat"}, {hasBits(2, SHM_EXEC)}},
+
+      {"new-code", {"mmap", "mmap2"}, {hasBits(2, PROT_EXEC)}},
+  };
   for (unsigned flag : {CLONE_NEWNS, CLONE_NEWCGROUP, CLONE_NEWUTS, CLONE_NEWIPC, CLONE_NEWUSER, CLONE_NEWPID,
                         CLONE_NEWNET}) {
-    filter.deny({"clone"}, {hasBits(kCloneFlags, flag)});
+    rules.push_back({"namespaces", {"clone"}, {hasBits(kCloneFlags, flag)}});
   }
-  filter.deny({"clone3"}, {}, ENOSYS);
-}
-
-void denyOtherProcesses(Filter& filter) {
-  auto self = static_cast<std::uint64_t>(::getpid());
-  filter.deny({"kill", "tgkill", "rt_sigqueueinfo", "rt_tgsigqueueinfo"}, {isOther(0, self)});
-  filter.deny({"prlimit64", "migrate_pages", "move_pages", "sched_setscheduler", "sched_setparam",
-               "sched_setattr", "sched_setaffinity"},
-              {isOther(0, 0)});
-  // The first argument says whether the second is a process, a group or a user.
-  filter.deny({"setpriority", "ioprio_set"}, {isOther(1, 0)});
-  filter.deny({"setpriority"}, {isOther(0, PRIO_PROCESS)});
-  filter.deny({"ioprio_set"}, {isOther(0, kPriorityOfProcess)});
-  filter.deny({"tkill", "pidfd_send_signal", "process_mrelease"});
-}
-
-void denyTrace(Filter& filter) {
-  filter.deny({"ptrace", "process_vm_readv", "process_vm_writev", "process_madvise", "pidfd_getfd", "kcmp",
-               "perf_event_open"});
-}
-
-void denyMounts(Filter& filter) {
-  filter.deny({"mount", "umount", "umount2", "pivot_root", "chroot", "move_mount", "open_tree", "fsopen",
-               "fsconfig", "fsmount", "fspick", "mount_setattr", "swapon", "swapoff", "quotactl",
-               "quotactl_fd"});
-}
-
-void denyKernel(Filter& filter) {
-  filter.deny({"kexec_load", "kexec_file_load", "init_module",   "finit_module",   "delete_module",
-               "bpf",        "reboot",          "iopl",          "ioperm",         "syslog",
-               "acct",       "sethostname",     "setdomainname", "lookup_dcookie", "uselib",
-               "vm86",       "vm86old",         "modify_ldt",    "_sysctl",        "nfsservctl",
-               "vhangup",    "fanotify_init"});
-}
-
-void denyClock(Filter& filter) {
-  filter.deny({"settimeofday", "clock_settime", "clock_settime64", "clock_adjtime", "clock_adjtime64",
-               "adjtimex", "stime"});
-}
-
-void denyIdentity(Filter& filter) {
-  filter.deny({"setuid", "setuid32", "setgid", "setgid32", "setreuid", "setreuid32", "setregid", "setregid32",
-               "setresuid", "setresuid32", "setresgid", "setresgid32", "setfsuid", "setfsuid32", "setfsgid",
-               "setfsgid32", "setgroups", "setgroups32", "capset"});
-}
-
-void denyOwnership(Filter& filter) {
-  filter.deny({"chown", "chown32", "lchown", "lchown32", "fchownat", "setxattr", "lsetxattr", "removexattr",
-               "lremovexattr"});
-}
-
-void denyModes(Filter& filter) { filter.deny({"chmod", "fchmod", "fchmodat", "fchmodat2"}); }
-
-void denyTruncation(Filter& filter) {
-  filter.deny({"truncate", "truncate64"});
-  // A file that is open for reading only gets truncated all the same, with no right to write.
-  filter.deny({"open"}, {hasBits(1, O_ACCMODE | O_TRUNC, O_RDONLY | O_TRUNC)});
-  filter.deny({"openat"}, {hasBits(2, O_ACCMODE | O_TRUNC, O_RDONLY | O_TRUNC)});
-  filter.deny({"openat2"}, {}, ENOSYS);
-}
-
-void denyHandles(Filter& filter) { filter.deny({"open_by_handle_at"}); }
-
-void denyDevices(Filter& filter) {
-  filter.deny({"mknod", "mknodat"});
-  filter.deny({"ioctl"}, {isEqual(1, TIOCSTI)});
-}
-
-void denyKeys(Filter& filter) { filter.deny({"add_key", "request_key", "keyctl"}); }
-
-void denyFaults(Filter& filter) { filter.deny({"userfaultfd"}); }
-
-void denyIoUring(Filter& filter) { filter.deny({"io_uring_setup", "io_uring_enter", "io_uring_register"}); }
-
-void denySockets(Filter& filter) {
   // One comparison per argument and rule: "none of these" has to be spelt out.
   for (std::uint64_t family = 0; family <= AF_MAX; ++family) {
     if (family == AF_UNIX || family == AF_INET || family == AF_INET6 || family == AF_NETLINK) continue;
-    filter.deny({"socket"}, {isEqual(0, family)});
+    rules.push_back({"sockets", {"socket"}, {isEqual(0, family)}});
   }
-  filter.deny({"socket"}, {{0, SCMP_CMP_GT, AF_MAX, 0}});
-  filter.deny({"socket"}, {isEqual(0, AF_NETLINK), isOther(2, NETLINK_ROUTE)});
-  for (std::uint64_t family : {AF_INET, AF_INET6}) {
-    filter.deny({"socket"}, {isEqual(0, family), hasBits(1, 0xf, SOCK_RAW)});
-  }
+  return rules;
 }
 
-void denyWritableCode(Filter& filter) {
-  filter.deny({"mmap", "mmap2"}, {hasBits(2, PROT_WRITE | PROT_EXEC)});
-  // A file could be mapped twice, to write and to execute. Libraries are mapped privately.
-  filter.deny({"mmap", "mmap2"}, {hasBits(2, PROT_EXEC), hasBits(3, MAP_TYPE, MAP_SHARED)});
-  filter.deny({"mmap", "mmap2"}, {hasBits(2, PROT_EXEC), hasBits(3, MAP_TYPE, MAP_SHARED_VALIDATE)});
-  filter.deny({"memfd_create", "memfd_secret"});
-  filter.deny({"personality"}, {isOther(0, kAskForPersonality)});  // READ_IMPLIES_EXEC is one
-  filter.deny({"mprotect", "pkey_mprotect"}, {hasBits(2, PROT_EXEC)});
-  filter.deny({"shmat"}, {hasBits(2, SHM_EXEC)});
+/// Returns 0 or a negative error number, as the library does.
+int add(scmp_filter_ctx filter, const Rule& rule) {
+  for (const char* call : rule.calls) {
+    const int number = seccomp_syscall_resolve_name(call);
+    if (number < 0) continue;  // this architecture doesn't have it
+    const int result =
+        seccomp_rule_add_array(filter, SCMP_ACT_ERRNO(static_cast<std::uint32_t>(rule.error)), number,
+                               static_cast<unsigned>(rule.when.size()), rule.when.data());
+    if (result < 0) return result;
+  }
+  return 0;
 }
 
-void denyNewCode(Filter& filter) { filter.deny({"mmap", "mmap2"}, {hasBits(2, PROT_EXEC)}); }
-
-struct Group {
-  std::string_view name;
-  void (*deny)(Filter&);
-};
-constexpr Group kGroups[] = {
-    {"execute", denyExecute},
-    {"processes", denyProcesses},
-    {"other-processes", denyOtherProcesses},
-    {"trace", denyTrace},
-    {"namespaces", denyNamespaces},
-    {"mounts", denyMounts},
-    {"kernel", denyKernel},
-    {"clock", denyClock},
-    {"identity", denyIdentity},
-    {"ownership", denyOwnership},
-    {"modes", denyModes},
-    {"truncation", denyTruncation},
-    {"handles", denyHandles},
-    {"devices", denyDevices},
-    {"keys", denyKeys},
-    {"faults", denyFaults},
-    {"io-uring", denyIoUring},
-    {"sockets", denySockets},
-    {"writable-code", denyWritableCode},
-    {"new-code", denyNewCode},
-};
-
-const Group* groupNamed(std::string_view name) {
-  for (const Group& group : kGroups) {
-    if (group.name == name) return &group;
+int load(const std::vector<std::string>& groups) {
+  const std::unique_ptr<void, void (*)(scmp_filter_ctx)> filter(seccomp_init(SCMP_ACT_ALLOW),
+                                                                &seccomp_release);
+  if (!filter) return -ENOMEM;
+  int result = seccomp_attr_set(filter.get(), SCMP_FLTATR_ACT_BADARCH, SCMP_ACT_KILL_PROCESS);
+  if (result == 0) result = seccomp_attr_set(filter.get(), SCMP_FLTATR_CTL_TSYNC, 1);
+  if (result == 0) result = seccomp_attr_set(filter.get(), SCMP_FLTATR_CTL_OPTIMIZE, 2);
+  for (const Rule& rule : allRules()) {
+    if (result == 0 && std::ranges::find(groups, rule.group) != groups.end())
+      result = add(filter.get(), rule);
   }
-  return nullptr;
+  return result == 0 ? seccomp_load(filter.get()) : result;
 }
 
 }  // namespace
 
-bool isCallGroup(std::string_view name) { return groupNamed(name) != nullptr; }
+bool isCallGroup(std::string_view name) {
+  const auto rules = allRules();
+  return std::ranges::find(rules, name, &Rule::group) != rules.end();
+}
 
 std::optional<std::string> denyCalls(const std::vector<std::string>& groups) {
-  if (groups.empty()) return std::nullopt;
-  Filter filter;
-  for (const std::string& name : groups) {
-    const Group* group = groupNamed(name);
-    if (!group) return "unknown group of calls \"" + name + "\"";
-    group->deny(filter);
-  }
-  if (int error = filter.load(); error != 0) {
-    return "the system-call filter can't be loaded: " + std::generic_category().message(error);
-  }
-  return std::nullopt;
+  const int result = groups.empty() ? 0 : load(groups);
+  if (result == 0) return std::nullopt;
+  return "the system-call filter can't be loaded: " + std::generic_category().message(-result);
 }
 
 }  // namespace vesk

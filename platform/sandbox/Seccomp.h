@@ -14,7 +14,7 @@ namespace vesk {
 ///
 /// The filter denies what a daemon has no business with and allows the rest. The other way round, a list of
 /// what is allowed, would have to name every call that the libraries' next versions may choose to make.
-/// Returns what went wrong.
+/// `groups` are known ones. Returns what went wrong.
 [[nodiscard]] std::optional<std::string> denyCalls(const std::vector<std::string>& groups);
 
 /// Whether there is a group of that name. The groups:
