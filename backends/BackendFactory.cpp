@@ -17,21 +17,15 @@ namespace vesk {
 
 namespace {
 
-using Profile = std::optional<Dictionary>;
-using Family = std::optional<Text>;
-using Maker = std::shared_ptr<VeskReportingBackend> (*)(const std::string& name, const Profile& profile,
-                                                        const Family& productFamily, std::int32_t clientType,
+using Maker = std::shared_ptr<VeskReportingBackend> (*)(const std::string& name,
+                                                        const std::optional<Dictionary>& profile,
+                                                        const BackendIdentity& identity,
                                                         const BackendServices& services);
 
 template <class Backend>
-std::shared_ptr<VeskReportingBackend> make(const std::string& name, const Profile& profile,
-                                           const Family& productFamily, std::int32_t clientType,
-                                           const BackendServices& services) {
-  if constexpr (requires { Backend::create(name, profile, productFamily, clientType, services); }) {
-    return Backend::create(name, profile, productFamily, clientType, services);
-  } else {
-    return Backend::create(name, profile, productFamily, services);
-  }
+std::shared_ptr<VeskReportingBackend> make(const std::string& name, const std::optional<Dictionary>& profile,
+                                           const BackendIdentity& identity, const BackendServices& services) {
+  return Backend::create(name, profile, identity, services);
 }
 
 constexpr struct {
@@ -46,14 +40,15 @@ constexpr struct {
 
 }  // namespace
 
-std::shared_ptr<VeskReportingBackend> newBackendWithName(const std::string& name, const Profile& profile,
-                                                         const Family& productFamily, std::int32_t clientType,
+std::shared_ptr<VeskReportingBackend> newBackendWithName(const std::string& name,
+                                                         const std::optional<Dictionary>& profile,
+                                                         const BackendIdentity& identity,
                                                          const BackendServices& services) {
   const auto known = std::find_if(std::begin(kBackends), std::end(kBackends),
                                   [&](const auto& backend) { return backend.name == name; });
   const bool hasNone = name == kVeskReportingBackendWren && deviceProductType() == Text::literal("Bramble");
   if (known != std::end(kBackends) && !hasNone) {
-    return known->make(name, profile, productFamily, clientType, services);
+    return known->make(name, profile, identity, services);
   }
   VESK_LOG_ERROR("VeskReportingBackend(newBackendWithName): %s", name.c_str());
   return nullptr;

@@ -1,7 +1,6 @@
 // Makes backends by their names in the storebag.
 #pragma once
 
-#include <cstdint>
 #include <memory>
 #include <optional>
 #include <string>
@@ -14,8 +13,7 @@ namespace vesk {
 /// on a "Bramble" device (both with a line of level 3), and when the backend can't use `profile`.
 std::shared_ptr<VeskReportingBackend> newBackendWithName(const std::string& name,
                                                          const std::optional<Dictionary>& profile,
-                                                         const std::optional<Text>& productFamily,
-                                                         std::int32_t clientType,
+                                                         const BackendIdentity& identity,
                                                          const BackendServices& services);
 
 }  // namespace vesk

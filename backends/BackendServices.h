@@ -30,11 +30,11 @@ struct BackendServices {
   TimedQueueMaker& networkQueues;
   /// A stable identifier of this installation: for true the one that respects the user's diagnostics consent,
   /// for false the one that is used when a storebag overrides it.
-  std::function<std::string(bool respectsConsent)> persistentIdentifierForDNU;
+  std::function<std::string(bool respectsConsent)> persistentIdentifierForDNU{};
   /// Whether the user agreed to the submission of diagnostics.
-  std::function<bool()> diagnosticsSubmissionConsent;
+  std::function<bool()> diagnosticsSubmissionConsent{};
   /// The two-letter country code of the current locale, when it has one.
-  std::function<std::optional<std::string>()> regionCode;
+  std::function<std::optional<std::string>()> regionCode{};
   /// What keeps uploads in bounds; closed when the daemon stops.
   std::shared_ptr<UploadGate> uploads = std::make_shared<UploadGate>();
   /// Where power-log backends record; without one they record nothing.

@@ -1,11 +1,8 @@
 #include "backends/VeskReportingBackend.h"
 
 #include "platform/crypto/Digest.h"
-#include "platform/log/SystemLog.h"
 #include "platform/text/ASCII.h"
-#include "util/ReportingdUtil.h"
 #include "util/SamplingDraw.h"
-#include "values/Conversions.h"
 
 namespace vesk {
 
@@ -16,18 +13,15 @@ std::optional<Text> textFrom(const std::optional<std::string>& text) {
   return Text(*text);
 }
 
-std::uint8_t versionPiece(std::string_view piece) { return static_cast<std::uint8_t>(leadingInteger(piece)); }
-
 }  // namespace
 
-VeskReportingBackend::VeskReportingBackend(const std::string& name, const Dictionary& profile,
-                                           const Text& productFamily, const BackendServices& services)
-    : _profile(profile),
+VeskReportingBackend::VeskReportingBackend(const std::string& name, const std::optional<Dictionary>& profile,
+                                           const BackendIdentity& identity, const BackendServices& services)
+    : _profile(profile.value_or(Dictionary())),
       _name(name),
-      _productFamily(productFamily),
+      _identity(identity),
       _services(services),
-      _samplingFactor(nextSamplingDraw()),
-      _heldBytes(std::make_shared<HeldAccount>(HeldBudget::Limits().ofSession)) {}
+      _samplingFactor(nextSamplingDraw()) {}
 
 std::string VeskReportingBackend::convertIntoSHA256(std::string_view text) { return hexLower(sha256(text)); }
 
@@ -89,77 +83,6 @@ void VeskReportingBackend::setCombinedSessionIDString(const std::optional<std::s
 void VeskReportingBackend::setUserInfoDict(const std::optional<Dictionary>& userInfo) {
   MutexLock lock(_mutex);
   _userInfoDict = userInfo;
-}
-
-void VeskReportingBackend::setSessionID(std::uint32_t sessionID) {
-  MutexLock lock(_mutex);
-  _sessionID = sessionID;
-}
-
-void VeskReportingBackend::setCompType(std::int32_t clientType) {
-  MutexLock lock(_mutex);
-  _compType = clientType;
-}
-
-void VeskReportingBackend::setClientVersion(std::uint16_t version) {
-  MutexLock lock(_mutex);
-  _clientVersion = version;
-}
-
-void VeskReportingBackend::setUdid(std::string_view udid) {
-  MutexLock lock(_mutex);
-  _udid = udid;
-}
-
-void VeskReportingBackend::setProductVersion(const std::optional<Text>& version) {
-  MutexLock lock(_mutex);
-  _productVersion = version;
-}
-
-void VeskReportingBackend::setBuildVersion(const std::optional<Text>& version) {
-  MutexLock lock(_mutex);
-  _buildVersion = version;
-}
-
-void VeskReportingBackend::setHardwareType(const std::optional<Text>& type) {
-  MutexLock lock(_mutex);
-  _hardwareType = type;
-}
-
-void VeskReportingBackend::setIsInternal(bool isInternal) {
-  MutexLock lock(_mutex);
-  _isInternal = isInternal;
-}
-
-void VeskReportingBackend::setRequireUserInfo(bool require) {
-  MutexLock lock(_mutex);
-  _requireUserInfo = require;
-}
-
-void VeskReportingBackend::setBatchEvents(bool batch) {
-  MutexLock lock(_mutex);
-  _batchEvents = batch;
-}
-
-void VeskReportingBackend::setSelfVersion(std::string_view version) {
-  MutexLock lock(_mutex);
-  auto dot = version.find('.');
-  _selfVersionMajor = versionPiece(version.substr(0, dot));
-  _selfVersionMinor = 0;
-  if (dot != std::string_view::npos) {
-    auto rest = version.substr(dot + 1);
-    _selfVersionMinor = versionPiece(rest.substr(0, rest.find('.')));
-  }
-}
-
-void VeskReportingBackend::setStartTimestamp(const timeval& timestamp) {
-  MutexLock lock(_mutex);
-  _startTimeStamp = secondsFromTimeval(timestamp);
-}
-
-void VeskReportingBackend::setHeldBytes(HeldBytes heldBytes) {
-  MutexLock sending(_sendMutex);
-  _heldBytes = std::move(heldBytes);
 }
 
 }  // namespace vesk

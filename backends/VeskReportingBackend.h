@@ -11,8 +11,8 @@
 #include <string_view>
 
 #include <VeskReporting/values/Value.h>
+#include "backends/BackendIdentity.h"
 #include "backends/BackendServices.h"
-#include "backends/https/EventBatch.h"
 #include "platform/sync/Mutex.h"
 #include "platform/sync/Snapshot.h"
 
@@ -105,28 +105,9 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
   void setCombinedSessionIDString(const std::optional<std::string>& sessionID);
   void setUserInfoDict(const std::optional<Dictionary>& userInfo);
 
-  // Set once, by the session that creates the backend, before any message.
-  void setSessionID(std::uint32_t sessionID);
-  void setCompType(std::int32_t clientType);
-  void setClientVersion(std::uint16_t version);
-  void setUdid(std::string_view udid);
-  void setProductVersion(const std::optional<Text>& version);
-  void setBuildVersion(const std::optional<Text>& version);
-  void setHardwareType(const std::optional<Text>& type);
-  void setIsInternal(bool isInternal);
-  void setRequireUserInfo(bool require);
-  void setBatchEvents(bool batch);
-  /// "7.2.9" gives 7 and 2; what does not fit into 8 bits is cut.
-  void setSelfVersion(std::string_view version);
-  void setStartTimestamp(const timeval& timestamp);
-  /// Shares the account of held bytes with the session's other backends.
-  void setHeldBytes(HeldBytes heldBytes);
-  /// Whose share of what may wait its posts and uploads take.
-  void setUser(uid_t user) noexcept { _user.store(user); }
-
  protected:
-  VeskReportingBackend(const std::string& name, const Dictionary& profile, const Text& productFamily,
-                       const BackendServices& services);
+  VeskReportingBackend(const std::string& name, const std::optional<Dictionary>& profile,
+                       const BackendIdentity& identity, const BackendServices& services);
 
   virtual std::optional<std::string> sendMessageInTurn(const std::optional<Dictionary>& payload,
                                                        const timeval& timestamp, std::uint16_t method,
@@ -145,39 +126,23 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
   // Constant after construction.
   const Dictionary _profile;
   const std::string _name;
-  const Text _productFamily;
+  const BackendIdentity _identity;
   const BackendServices& _services;
 
   // Synchronised by themselves.
   std::atomic<std::int32_t> _state{BackendStatePending};
   std::atomic<std::int32_t> _hierarchy{0};
   std::atomic<double> _samplingFactor;
-  std::atomic<uid_t> _user{UploadGate::kNobody};
   Snapshot<std::optional<Value>> _samplingThreshold;  // a number
 
   // Guarded by _sendMutex.
   Mutex _sendMutex;
   std::uint16_t _eventID VESK_GUARDED_BY(_sendMutex) = 0;
-  HeldBytes _heldBytes VESK_GUARDED_BY(_sendMutex);
 
   // Guarded by _mutex.
   mutable Mutex _mutex VESK_ACQUIRED_AFTER(_sendMutex);
-  std::optional<Text> _productVersion VESK_GUARDED_BY(_mutex);
-  std::optional<Text> _buildVersion VESK_GUARDED_BY(_mutex);
-  std::optional<Text> _hardwareType VESK_GUARDED_BY(_mutex);
-  double _startTimeStamp VESK_GUARDED_BY(_mutex) = 0;  // seconds since 1970
-  std::uint32_t _sessionID VESK_GUARDED_BY(_mutex) = 0;
   std::optional<Text> _combinedSessionIDString VESK_GUARDED_BY(_mutex);
-  std::int32_t _compType VESK_GUARDED_BY(_mutex) = 0;
-  std::uint16_t _clientVersion VESK_GUARDED_BY(_mutex) = 0;
-  std::uint8_t _selfVersionMajor VESK_GUARDED_BY(_mutex) = 0;
-  std::uint8_t _selfVersionMinor VESK_GUARDED_BY(_mutex) = 0;
-  bool _isInternal VESK_GUARDED_BY(_mutex) = false;
-  bool _requireUserInfo VESK_GUARDED_BY(_mutex) = false;
-  bool _batchEvents VESK_GUARDED_BY(_mutex) = false;
   std::optional<Dictionary> _userInfoDict VESK_GUARDED_BY(_mutex);
-  // A copy: a post that is under way may outlive the session that owns the buffer it came from.
-  std::string _udid VESK_GUARDED_BY(_mutex);
   std::optional<std::string> _displayURL VESK_GUARDED_BY(_mutex);
 };
 

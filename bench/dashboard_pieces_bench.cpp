@@ -38,12 +38,13 @@ struct Sink {
 struct Sender {
   Sender() {
     Dictionary profile{{"ip", "127.0.0.1"}, {"port", static_cast<int>(sink.socket.localEndpoint()->port)}};
-    backend = newBackendWithName("dashboard", profile, Text("Phone"), 5, services);
+    backend = newBackendWithName("dashboard", profile,
+                                 {._sessionID = 77,
+                                  ._compType = 5,
+                                  ._udid = "0123456789abcdef0123456789abcdef01234567",
+                                  ._selfVersionMajor = 7},
+                                 services);
     if (!backend) std::abort();
-    backend->setSelfVersion("7.0");
-    backend->setCompType(5);
-    backend->setSessionID(77);
-    backend->setUdid("0123456789abcdef0123456789abcdef01234567");
   }
   ~Sender() {
     backend.reset();
@@ -54,7 +55,8 @@ struct Sender {
   Counters counters;
   QueueThread queues;
   HTTPClient http;
-  BackendServices services{http, WallClock::system(), counters, queues, {}, {}, {}};
+  BackendServices services{
+      .http = http, .clock = WallClock::system(), .counters = counters, .networkQueues = queues};
   std::shared_ptr<VeskReportingBackend> backend;
 };
 

@@ -41,14 +41,15 @@ std::shared_ptr<VeskReportingBackend> makeBackend(BackendServices& services) {
                    {"filters", List{Dictionary{{"key", "username"}, {"action", "sha256"}},
                                     Dictionary{{"key", "secret"}, {"action", "remove"}}}}};
   auto backend = newBackendWithName(kVeskReportingBackendHTTPPost, Dictionary{{"clients", List{entry}}},
-                                    Text("Phone"), 5, services);
-  backend->setRequireUserInfo(true);
+                                    {._compType = 5,
+                                     ._productVersion = Text("12.1"),
+                                     ._buildVersion = Text("21B91"),
+                                     ._hardwareType = Text("Phone7,2"),
+                                     ._productFamily = Text("Phone"),
+                                     ._requireUserInfo = true,
+                                     ._selfVersionMajor = 7},
+                                    services);
   backend->setUserInfoDict(kUserInfo);
-  backend->setCompType(5);
-  backend->setProductVersion(Text("12.1"));
-  backend->setBuildVersion(Text("21B91"));
-  backend->setHardwareType(Text("Phone7,2"));
-  backend->setSelfVersion("7.0");
   backend->setCombinedSessionIDString("q2hyb25vbWV0ZXIgdGVzdA==");
   backend->updateState();
   return backend;
@@ -56,13 +57,14 @@ std::shared_ptr<VeskReportingBackend> makeBackend(BackendServices& services) {
 
 class Services {
  public:
-  BackendServices services{_http,
-                           WallClock::system(),
-                           _counters,
-                           _queues,
-                           [](bool) { return std::string("3E8B9C50-6E5C-4B0E-9D43-0F6B8E5C7A11"); },
-                           [] { return true; },
-                           [] { return std::optional<std::string>("US"); }};
+  BackendServices services{
+      .http = _http,
+      .clock = WallClock::system(),
+      .counters = _counters,
+      .networkQueues = _queues,
+      .persistentIdentifierForDNU = [](bool) { return std::string("3E8B9C50-6E5C-4B0E-9D43-0F6B8E5C7A11"); },
+      .diagnosticsSubmissionConsent = [] { return true; },
+      .regionCode = [] { return std::optional<std::string>("US"); }};
 
  private:
   HTTPClient _http;

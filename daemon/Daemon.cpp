@@ -102,17 +102,17 @@ void logLosses() {
 
 struct Daemon::Parts {
   Parts(ServiceManager& serviceManager, BusyMarker& busyMarker)
-      : backendServices{http,
-                        WallClock::system(),
-                        Counters::shared(),
-                        networkQueues,
-                        [](bool respectsConsent) { return persistentIdentifierForDNU(respectsConsent); },
-                        diagnosticsSubmissionConsent,
-                        regionCode,
-                        std::make_shared<UploadGate>(),
-                        std::make_shared<PowerLog>(powerLogOptions()),
-                        dashboardLinger()},
-        sessionServices{backendServices, clientLibraryVersion()},
+      : backendServices{.http = http,
+                        .clock = WallClock::system(),
+                        .counters = Counters::shared(),
+                        .networkQueues = networkQueues,
+                        .persistentIdentifierForDNU =
+                            [](bool respectsConsent) { return persistentIdentifierForDNU(respectsConsent); },
+                        .diagnosticsSubmissionConsent = diagnosticsSubmissionConsent,
+                        .regionCode = regionCode,
+                        .powerLog = std::make_shared<PowerLog>(powerLogOptions()),
+                        .dashboardLinger = dashboardLinger()},
+        sessionServices{.backends = backendServices, .libraryVersion = clientLibraryVersion()},
         http(httpOptions(busyMarker)),
         agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetcher(), busyMarker)),
         listener(listenerOptions(serviceManager)) {

@@ -45,13 +45,11 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   const Value profile = withoutAddresses(*outcome.value);
   if (!profile.dictionary()) return 0;
   for (bool knowsUser : {false, true}) {
-    auto backend = newBackendWithName("httpPost", *profile.dictionary(), Text("Phone"), 5, harness.services);
+    auto backend = newBackendWithName(
+        "httpPost", *profile.dictionary(),
+        {._compType = 5, ._productFamily = Text("Phone"), ._requireUserInfo = knowsUser}, harness.services);
     if (!backend) continue;
-    backend->setCompType(5);
-    if (knowsUser) {
-      backend->setRequireUserInfo(true);
-      backend->setUserInfoDict(Dictionary{{"clientName", "Camera"}, {"serviceName", "Clips"}});
-    }
+    if (knowsUser) backend->setUserInfoDict(Dictionary{{"clientName", "Camera"}, {"serviceName", "Clips"}});
     backend->updateState();
     timeval now{1'700'000'000, 250'000};
     for (std::uint16_t i = 0; i < 4; ++i) {

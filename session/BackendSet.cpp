@@ -12,58 +12,27 @@ namespace vesk {
 
 namespace {
 
-/// The identity that all backends of a set share.
-struct SetIdentity {
-  SetIdentity(const Dictionary& sessionInfo, const BackendServices& services)
-      : startTimestamp(timevalFrom(services.clock.now())),
-        productVersion(deviceProductVersion()),
-        buildVersion(deviceBuildVersion()),
-        productType(deviceProductType()),
-        productFamily(deviceName()),
-        isInternal(isInternalBuild()),
-        sessionID(number(sessionInfo, kVeskReportingSessionInfoSessionID)),
-        clientType(number(sessionInfo, kVeskReportingSessionInfoClientType)),
-        clientVersion(
-            static_cast<std::uint16_t>(number(sessionInfo, kVeskReportingSessionInfoClientVersion))),
-        requireUserInfo(flag(sessionInfo, kVeskReportingSessionInfoRequireUserInfo)),
-        batchEvents(flag(sessionInfo, kVeskReportingSessionInfoBatchEvent)) {}
-
-  static std::int32_t number(const Dictionary& sessionInfo, std::string_view key) {
-    return static_cast<std::int32_t>(integerForKey(sessionInfo, key).value_or(0));
-  }
-  static bool flag(const Dictionary& sessionInfo, std::string_view key) {
-    return booleanForKey(sessionInfo, key).value_or(false);
-  }
-
-  timeval startTimestamp;
-  std::optional<Text> productVersion;
-  std::optional<Text> buildVersion;
-  std::optional<Text> productType;
-  std::optional<Text> productFamily;
-  bool isInternal;
-  std::int32_t sessionID;
-  std::int32_t clientType;
-  std::uint16_t clientVersion;
-  bool requireUserInfo;
-  bool batchEvents;
-};
-
-void stamp(VeskReportingBackend& backend, const SetIdentity& identity,
-           const std::optional<Dictionary>& userInfo, std::string_view deviceID,
-           const std::string& libraryVersion) {
-  backend.setSessionID(static_cast<std::uint32_t>(identity.sessionID));
-  backend.setCompType(identity.clientType);
-  backend.setClientVersion(identity.clientVersion);
-  backend.setUdid(deviceID);
-  backend.setProductVersion(identity.productVersion);
-  backend.setBuildVersion(identity.buildVersion);
-  backend.setHardwareType(identity.productType);
-  backend.setIsInternal(identity.isInternal);
-  backend.setRequireUserInfo(identity.requireUserInfo);
-  backend.setBatchEvents(identity.batchEvents);
-  backend.setUserInfoDict(userInfo);
-  backend.setSelfVersion(libraryVersion);
-  backend.setStartTimestamp(identity.startTimestamp);
+BackendIdentity identityFrom(const Dictionary& sessionInfo, std::string_view deviceID,
+                             const std::string& libraryVersion, uid_t user, const BackendServices& services) {
+  const auto number = [&](std::string_view key) { return integerForKey(sessionInfo, key).value_or(0); };
+  const auto flag = [&](std::string_view key) { return booleanForKey(sessionInfo, key).value_or(false); };
+  BackendIdentity identity{
+      ._sessionID = static_cast<std::uint32_t>(number(kVeskReportingSessionInfoSessionID)),
+      ._compType = static_cast<std::int32_t>(number(kVeskReportingSessionInfoClientType)),
+      ._clientVersion = static_cast<std::uint16_t>(number(kVeskReportingSessionInfoClientVersion)),
+      ._udid = std::string(deviceID),
+      ._productVersion = deviceProductVersion(),
+      ._buildVersion = deviceBuildVersion(),
+      ._hardwareType = deviceProductType(),
+      ._productFamily = deviceName(),
+      ._isInternal = isInternalBuild(),
+      ._requireUserInfo = flag(kVeskReportingSessionInfoRequireUserInfo),
+      ._batchEvents = flag(kVeskReportingSessionInfoBatchEvent),
+      ._startTimeStamp = secondsFromTimeval(timevalFrom(services.clock.now())),
+      ._user = user,
+      ._heldBytes = services.heldBudget->accountFor(user)};
+  identity.setSelfVersion(libraryVersion);
+  return identity;
 }
 
 // Like any value of the wrong type, a profile that is not a dictionary counts as absent.
@@ -88,17 +57,13 @@ std::optional<BackendSet> createBackends(const std::optional<Dictionary>& storeb
     VESK_LOG_ERROR("createBackends: Attempted to create backends with nil session info");
     return std::nullopt;
   }
-  SetIdentity identity(*sessionInfo, services);
-  const HeldBytes heldBytes = services.heldBudget->accountFor(user);
+  const BackendIdentity identity = identityFrom(*sessionInfo, deviceID, libraryVersion, user, services);
   BackendSet backends;
   for (const DictionaryEntry& entry : *storebag) {
     std::string name = entry.key.string();
-    auto backend =
-        newBackendWithName(name, profileFrom(entry), identity.productFamily, identity.clientType, services);
+    auto backend = newBackendWithName(name, profileFrom(entry), identity, services);
     if (!backend) continue;
-    stamp(*backend, identity, userInfo, deviceID, libraryVersion);
-    backend->setHeldBytes(heldBytes);
-    backend->setUser(user);
+    backend->setUserInfoDict(userInfo);
     backends.emplace_back(std::move(name), std::move(backend));
   }
   return backends;

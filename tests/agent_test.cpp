@@ -51,7 +51,7 @@ class AgentStorebags : public testing::Test {
 
   CapturedLog log;
   BackendHarness harness;
-  SessionServices sessionServices{harness.services, "7.3"};
+  SessionServices sessionServices{.backends = harness.services, .libraryVersion = "7.3"};
   BusyMarker busyMarker;
   Outcome next;
   std::function<void()> duringFetch;

@@ -40,8 +40,7 @@ class BackendConcurrency : public ::testing::Test {
                                                                         {"filters", List{}},
                                                                         {"sampling_threshold", 1},
                                                                         {"expedite", 0}}}}},
-                                 Text("Phone"), 5, services);
-    backend->setRequireUserInfo(true);
+                                 {._productFamily = Text("Phone"), ._requireUserInfo = true}, services);
     backend->setUserInfoDict(Dictionary{{kVeskReportingUserInfoClientName, "Camera"}});
     backend->setCombinedSessionIDString("own");
     backend->updateState();
@@ -59,13 +58,13 @@ class BackendConcurrency : public ::testing::Test {
   BackendHarness harness;
   GatedClock clock;
   HTTPClient http{HTTPClient::Options{.maximumConnectionsPerHost = 1}};
-  BackendServices services{http,
-                           clock,
-                           harness.counters,
-                           harness.networkQueues,
-                           harness.services.persistentIdentifierForDNU,
-                           harness.services.diagnosticsSubmissionConsent,
-                           harness.services.regionCode};
+  BackendServices services{.http = http,
+                           .clock = clock,
+                           .counters = harness.counters,
+                           .networkQueues = harness.networkQueues,
+                           .persistentIdentifierForDNU = harness.services.persistentIdentifierForDNU,
+                           .diagnosticsSubmissionConsent = harness.services.diagnosticsSubmissionConsent,
+                           .regionCode = harness.services.regionCode};
   std::shared_ptr<VeskReportingBackend> backend;
 };
 

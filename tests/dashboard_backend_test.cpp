@@ -30,17 +30,20 @@ class Dashboard : public testing::Test {
     return entries.share();
   }
   std::shared_ptr<VeskReportingBackend> make(const std::optional<Dictionary>& profile) {
-    return stamped(newBackendWithName("dashboard", profile, Text("Phone"), 5, _services));
+    return make(profile, identity());
   }
-  std::shared_ptr<VeskReportingBackend> stamped(std::shared_ptr<VeskReportingBackend> backend) {
-    if (!backend) return nullptr;
-    backend->setSelfVersion("7.2");
-    backend->setCompType(5);
-    backend->setSessionID(0x01020304);
-    backend->setClientVersion(0x0506);
-    backend->setUdid(kUdid);
-    backend->updateState();
+  std::shared_ptr<VeskReportingBackend> make(const std::optional<Dictionary>& profile,
+                                             const BackendIdentity& identity) {
+    auto backend = newBackendWithName("dashboard", profile, identity, _services);
+    if (backend) backend->updateState();
     return backend;
+  }
+  static BackendIdentity identity() {
+    return {._sessionID = 0x01020304,
+            ._compType = 5,
+            ._clientVersion = 0x0506,
+            ._udid = kUdid,
+            ._selfVersionMajor = 7};
   }
   /// The one datagram that a message becomes.
   std::string datagramOf(VeskReportingBackend& backend, const std::optional<Dictionary>& payload) {
@@ -53,7 +56,10 @@ class Dashboard : public testing::Test {
   DashboardServer _server;
   BackendHarness _harness;
   SimulatedQueues _queues;
-  BackendServices _services{_harness.services.http, _harness.clock, _harness.counters, _queues, {}, {}, {}};
+  BackendServices _services{.http = _harness.services.http,
+                            .clock = _harness.clock,
+                            .counters = _harness.counters,
+                            .networkQueues = _queues};
   CapturedLog _log;
 };
 
@@ -73,11 +79,11 @@ TEST_F(Dashboard, HeadersCarryWhatFitsIntoThem) {
   auto carries = [this](timeval when, std::int32_t clientType, std::uint32_t session, std::uint16_t version,
                         std::string udid, const std::string& first, const std::string& line) {
     SCOPED_TRACE(line);
-    auto backend = make(profile());
-    backend->setCompType(clientType);
-    backend->setSessionID(session);
-    backend->setClientVersion(version);
-    backend->setUdid(udid);
+    auto backend = make(profile(), {._sessionID = session,
+                                    ._compType = clientType,
+                                    ._clientVersion = version,
+                                    ._udid = udid,
+                                    ._selfVersionMajor = 7});
     EXPECT_EQ(backend->sendMessage(std::nullopt, when, 0, 0xFFFF, 3), line + "     1     0 65535 ");
     _queues.queue->run();
     udid.resize(40);
@@ -94,14 +100,16 @@ TEST_F(Dashboard, HeadersCarryWhatFitsIntoThem) {
 }
 
 TEST_F(Dashboard, NumbersItsMessagesAndNamesTheirSenders) {
-  auto backend = make(profile());
-  backend->setSelfVersion("263.1");
-  const char* const codes[] = {"QX", "WB", "JYP", "KF", "UZ", "HD", "EP", "YW", "BQ", "FX", "DJ", "OZ", "-"};
-  for (int i = 1; i < 0x1234; ++i) {
-    backend->setCompType(i % 13);
-    const auto line = backend->sendMessage(std::nullopt, kWhen, 0, 0, 0).value();
-    ASSERT_NE(line.find(" 127.0.0.1 "s + codes[i % 13] + "  1286 "), std::string::npos) << line;
+  auto sender = identity();
+  sender.setSelfVersion("263.1");
+  sender._compType = 0;
+  for (const char* code : {"QX", "WB", "JYP", "KF", "UZ", "HD", "EP", "YW", "BQ", "FX", "DJ", "OZ", "-"}) {
+    const std::string line = make(profile(), sender)->sendMessage(std::nullopt, kWhen, 0, 0, 0).value();
+    EXPECT_NE(line.find(" 127.0.0.1 "s + code + "  1286 "), std::string::npos) << line;
+    ++sender._compType;
   }
+  auto backend = make(profile(), sender);
+  for (int i = 1; i < 0x1234; ++i) backend->sendMessage(std::nullopt, kWhen, 0, 0, 0);
   _queues.queue->run();
   _server.take();
   const auto datagram = datagramOf(*backend, std::nullopt);
@@ -117,10 +125,9 @@ TEST_F(Dashboard, TellsDeliveryAndOriginInItsFlags) {
   };
   for (const auto& [profile, bindError, flags] : cases) {
     SocketFaults::bindError = bindError;
-    auto backend = profile
-                       ? make(profile)
-                       : stamped(DashboardBackend::create("dashboard", std::string("127.0.0.1"),
-                                                          _server.endpoint().port, Text("Phone"), _services));
+    auto backend = profile ? make(profile)
+                           : DashboardBackend::create("dashboard", std::string("127.0.0.1"),
+                                                      _server.endpoint().port, identity(), _services);
     SocketFaults::bindError = 0;
     ASSERT_TRUE(backend);
     _queues.queue->run();
@@ -317,8 +324,7 @@ TEST_F(Dashboard, SaysWhatItDoesInTheSystemLog) {
     EXPECT_EQ(_log.lines(), lines);
   }
   _log.clear();
-  EXPECT_FALSE(
-      DashboardBackend::create("dashboard", std::optional<std::string>(), 1, Text("Phone"), _services));
+  EXPECT_FALSE(DashboardBackend::create("dashboard", std::optional<std::string>(), 1, identity(), _services));
   EXPECT_EQ(_log.lines(), Lines{});
 }
 
@@ -403,14 +409,16 @@ TEST_F(Dashboard, UploadsLogDataAndAnnouncesWhereItWent) {
   _services.uploads = std::make_shared<UploadGate>(UploadGate::Limits{
       .uploads = 1, .uploadsOfUser = 1, .smallUploads = 2, .smallUploadsOfUser = 1, .patience = {}});
   for (const bool isSmall : {false, true}) {
-    auto limited = make(profile(Dictionary{{"post_url", server.url("/log")}}));
-    limited->setUser(7);
+    auto client = identity();
+    client._user = 7;
+    auto limited = make(profile(Dictionary{{"post_url", server.url("/log")}}), client);
     auto another = isSmall ? _services.uploads->enterWithLogData(7, 0) : _services.uploads->enter(7, 0);
     EXPECT_TRUE(limited->uploadLogData(isSmall ? large : List{1})) << "each kind has places of its own";
     _log.clear();
     EXPECT_FALSE(limited->uploadLogData(isSmall ? List{1} : large));
     refused(failed + "too many uploads are under way)");
-    limited->setUser(8);
+    client._user = 8;
+    limited = make(profile(Dictionary{{"post_url", server.url("/log")}}), client);
     EXPECT_EQ(limited->uploadLogData(isSmall ? List{1} : large), isSmall) << "another user's place";
     another.reset();
     EXPECT_TRUE(limited->uploadLogData(isSmall ? List{1} : large));

@@ -53,10 +53,11 @@ TEST_F(HTTPSBatch, HeldEventsGoFirstOnceEnabled) {
       {2, true, {"7 Sending 2, 1, 1"}},
       {0, false, {"7 Sending 0, 0, 1"}}};
   for (const auto& [state, batch, lines] : cases) {
-    auto backend = make(entry(), {.batchEvents = true});
+    auto backend = make(List{entry({{"client", "Camera"}}), entry({{"expedite", batch ? 0 : 1}})},
+                        {.batchEvents = true});
     send(*backend);
+    update(*backend, userNamed("Other"));
     backend->setState(state);
-    backend->setBatchEvents(batch);
     CapturedLog log;
     send(*backend, Dictionary(), 3, MessageFlagRealtime);
     EXPECT_EQ(takeAll().size(), lines.size() > 1 ? 2u : 1u);

@@ -24,7 +24,7 @@ TEST_F(HTTPSEvent, RecordIsThePayloadUnderTheComputedFieldsUnderTheUserInfo) {
             R"("_osVersion":"mine","_internal":2,"_reportVers":"7.2","_timezoneOffset":0,)"
             R"("clientName":"Camera"}]})")
       << "an unknown build is left out, also where the payload has one";
-  backend->setBuildVersion(Text("16B92"));
+  backend = make(entry(), {.build = Text("16B92")});
   backend->setCombinedSessionIDString(std::nullopt);
   send(*backend, Dictionary{{"_sessionID", "mine"}});
   const auto event = take().event();
@@ -33,7 +33,6 @@ TEST_F(HTTPSEvent, RecordIsThePayloadUnderTheComputedFieldsUnderTheUserInfo) {
 }
 
 TEST_F(HTTPSEvent, TimesCountFromTheMinuteOfTheStart) {
-  auto backend = make(entry());
   const std::tuple<double, double, std::int64_t, double> cases[] = {
       {59.5, 60, 0, 0.5},
       {60, 60, 60, 60},
@@ -42,8 +41,7 @@ TEST_F(HTTPSEvent, TimesCountFromTheMinuteOfTheStart) {
       {5e9, 5e9 + 1, 2'147'483'640, 2'147'483'641},
       {-5e9, -5e9, -2'147'483'640, -2'147'483'640}};
   for (const auto& [start, message, startTS, clientTS] : cases) {
-    backend->setStartTimestamp(at(start));
-    backend->sendMessage(Dictionary(), at(message), 3, 2, 0);
+    make(entry(), {.start = start})->sendMessage(Dictionary(), at(message), 3, 2, 0);
     const auto event = take().event();
     EXPECT_EQ(event.at("_startTS"), startTS);
     for (const char* key : {"_clientTS", "eventTime"}) EXPECT_EQ(event.at(key), clientTS) << key;
@@ -51,11 +49,9 @@ TEST_F(HTTPSEvent, TimesCountFromTheMinuteOfTheStart) {
 }
 
 TEST_F(HTTPSEvent, SelfVersionHasTwoPartsOfEightBits) {
-  auto backend = make(entry());
   for (const auto& [version, sent] :
        {std::pair("7", "7.0"), {"7.2.9", "7.2"}, {"300.257", "44.1"}, {"x.3", "0.3"}, {"", "0.0"}}) {
-    backend->setSelfVersion(version);
-    send(*backend);
+    send(*make(entry(), {.selfVersion = version}));
     EXPECT_EQ(take().event().at("_reportVers"), sent);
   }
 }
@@ -79,7 +75,7 @@ void tellEnvironment(const char* preferences, const char* facts, const char* zon
   ::setenv("TZ", zone, 1);
   BackendHarness harness;
   const Dictionary profile{{"clients", List{Dictionary{{"post_url", harness.url()}}}}};
-  auto backend = newBackendWithName("httpPost", profile, Text("Phone"), 5, harness.services);
+  auto backend = newBackendWithName("httpPost", profile, {._productFamily = Text("Phone")}, harness.services);
   backend->updateState();
   backend->sendMessage(Dictionary(), at(0), 3, 2, 0);
   const auto event = harness.posts().at(0).event();
@@ -107,10 +103,8 @@ TEST_F(HTTPSEvent, InternalBuildsTellMoreWhereTheStorebagAsks) {
       {1, false, 7, "the-udid", "session-text", "id-respecting"},
       {1, true, 7, "", 4'000'000'000, "id-respecting"}};
   for (const auto& [extras, isInternal, clientType, udid, sessionID, clientId] : cases) {
-    auto backend =
-        make(entry({{"extras_on_internal", extras}}), {.isInternal = isInternal, .clientType = clientType});
-    backend->setUdid(udid);
-    send(*backend);
+    send(*make(entry({{"extras_on_internal", extras}}),
+               {.isInternal = isInternal, .clientType = clientType, .udid = udid}));
     const auto post = take();
     EXPECT_EQ(post.event().at("_sessionID"), sessionID);
     EXPECT_EQ(post.body.at("clientId"), clientId);

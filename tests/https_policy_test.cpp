@@ -265,7 +265,7 @@ TEST_F(HTTPSPolicy, FactoryKnowsSixNames) {
                            {"display_url", "http://display/"}};
   const auto built = [&](const char* name, const std::optional<Dictionary>& with,
                          const std::optional<Text>& family = Text("Phone")) {
-    return newBackendWithName(name, with, family, 7, harness.services);
+    return newBackendWithName(name, with, {._compType = 7, ._productFamily = family}, harness.services);
   };
   for (const char* name : {"httpPost", "httpPost2", "dashboard", "uploadServer", "kilnar", "wren"}) {
     const auto backend = built(name, profile);

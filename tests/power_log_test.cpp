@@ -47,7 +47,7 @@ TEST_F(PowerLogTest, TheBackendRecordsMessagesThatHaveMethodAndPayload) {
   BackendHarness harness;
   CapturedLog log;
   harness.services.powerLog = std::make_shared<PowerLog>(options());
-  auto backend = newBackendWithName("kilnar", std::nullopt, std::nullopt, 5, harness.services);
+  auto backend = newBackendWithName("kilnar", std::nullopt, {}, harness.services);
   ASSERT_TRUE(backend);
   const std::tuple<std::uint16_t, std::optional<Dictionary>, const char*> cases[] = {
       {5, Dictionary{{"k", "v"}}, R"({"k":"v","method":5,"respCode":200,"event":1})"},
@@ -70,7 +70,7 @@ TEST_F(PowerLogTest, TheBackendRecordsMessagesThatHaveMethodAndPayload) {
   EXPECT_EQ(events().back().time, clock.now());
   EXPECT_EQ(log.lines().size(), 0u);
   harness.services.powerLog = nullptr;
-  auto without = newBackendWithName("kilnar", Dictionary(), Text("Phone"), 5, harness.services);
+  auto without = newBackendWithName("kilnar", Dictionary(), {}, harness.services);
   EXPECT_EQ(without->sendMessage(Dictionary{{"k", 1}}, timeval{}, 5, 200, 0), std::nullopt);
 }
 

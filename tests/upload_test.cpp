@@ -54,13 +54,10 @@ int openCount(const struct stat& file) {
 
 class UploadTest : public testing::Test {
  protected:
-  std::shared_ptr<UploadBackend> make(const std::string& url) {
-    auto made = std::dynamic_pointer_cast<UploadBackend>(
+  std::shared_ptr<UploadBackend> make(const std::string& url, std::uint32_t sessionID = 4'000'000'000) {
+    return std::dynamic_pointer_cast<UploadBackend>(
         newBackendWithName("uploadServer", Dictionary{{"post_url", url}, {"display_url", "https://show"}},
-                           std::nullopt, 5, services));
-    made->setUdid("udid");
-    made->setSessionID(4'000'000'000);
-    return made;
+                           {._sessionID = sessionID, ._udid = "udid"}, services));
   }
   bool upload(const std::string& path) { return backend->uploadFileAtPath(path, token(opened(path))); }
   std::string file(const std::string& name = "a.log", const std::string& contents = "contents") {
@@ -78,7 +75,8 @@ class UploadTest : public testing::Test {
   RecordingServer server{[this](const HTTPReceived&, std::size_t) { return answer(); }};
   HTTPClient http;
   QueueThread queues;
-  BackendServices services{http, WallClock::system(), counters, queues, {}, {}, {}};
+  BackendServices services{
+      .http = http, .clock = WallClock::system(), .counters = counters, .networkQueues = queues};
   std::shared_ptr<UploadBackend> backend = make(server.url("/upload"));
 };
 
@@ -93,7 +91,7 @@ TEST_F(UploadTest, SendsTheWholeFileUnderItsName) {
     const std::string path = file(name, contents) + behind;
     FileDescriptor descriptor = opened(directory / name);
     ::lseek(descriptor.get(), 100, SEEK_SET);
-    backend->setSessionID(sessionID);
+    backend = make(server.url("/upload"), sessionID);
     log.clear();
     EXPECT_TRUE(backend->uploadFileAtPath(path, token(std::move(descriptor))));
     const HTTPReceived request = server.requests().at(count++);
@@ -263,7 +261,7 @@ TEST_F(UploadTest, AServerThatCanNotBeReachedCostsNothing) {
   const std::optional<Dictionary> profiles[] = {std::nullopt, Dictionary{{"display_url", "https://show"}}};
   for (const auto& profile : profiles) {
     log.clear();
-    EXPECT_FALSE(newBackendWithName("uploadServer", profile, Text("Phone"), 5, services));
+    EXPECT_FALSE(newBackendWithName("uploadServer", profile, {}, services));
     EXPECT_EQ(log.lines(),
               (std::vector<Line>{{3, "UploadBackend(initWithName): can't resolve upload post URL."}}));
   }

@@ -77,24 +77,24 @@ std::shared_ptr<TimedQueue> networkQueue(const BackendServices& services) {
 
 std::shared_ptr<DashboardBackend> DashboardBackend::create(const std::string& name,
                                                            const std::optional<Dictionary>& profile,
-                                                           const std::optional<Text>& productFamily,
+                                                           const BackendIdentity& identity,
                                                            const BackendServices& services) {
-  return createConnected(name, profile, std::nullopt, 0, productFamily, services);
+  return createConnected(name, profile, std::nullopt, 0, identity, services);
 }
 
 std::shared_ptr<DashboardBackend> DashboardBackend::create(const std::string& name,
                                                            const std::optional<std::string>& serverIP,
                                                            std::uint16_t serverPort,
-                                                           const std::optional<Text>& productFamily,
+                                                           const BackendIdentity& identity,
                                                            const BackendServices& services) {
   if (!serverIP) return nullptr;
-  return createConnected(name, std::nullopt, serverIP, serverPort, productFamily, services);
+  return createConnected(name, std::nullopt, serverIP, serverPort, identity, services);
 }
 
 std::shared_ptr<DashboardBackend> DashboardBackend::createConnected(
     const std::string& name, const std::optional<Dictionary>& profile,
-    const std::optional<std::string>& serverIP, std::uint16_t serverPort,
-    const std::optional<Text>& productFamily, const BackendServices& services) {
+    const std::optional<std::string>& serverIP, std::uint16_t serverPort, const BackendIdentity& identity,
+    const BackendServices& services) {
   auto settings = profile ? settingsFrom(name, *profile) : std::nullopt;
   if (profile && !settings) return nullptr;
   UDPSocket socket;
@@ -107,7 +107,7 @@ std::shared_ptr<DashboardBackend> DashboardBackend::createConnected(
   auto delivery = std::make_shared<DashboardDelivery>(std::move(socket), std::move(queue),
                                                       services.dashboardLinger, services.counters, name);
   std::shared_ptr<DashboardBackend> backend(
-      new DashboardBackend(name, profile, productFamily.value_or(Text()), delivery, services));
+      new DashboardBackend(name, profile, identity, delivery, services));
   if (!profile) settings = settingsFrom(serverIP, serverPort);
   if (!settings) return nullptr;  // here and below, the destructor cleans up
   if (settings->isReliable) delivery->useReliableUDP();
@@ -123,9 +123,10 @@ std::shared_ptr<DashboardBackend> DashboardBackend::createConnected(
 }
 
 DashboardBackend::DashboardBackend(const std::string& name, const std::optional<Dictionary>& profile,
-                                   const Text& productFamily, std::shared_ptr<DashboardDelivery> delivery,
+                                   const BackendIdentity& identity,
+                                   std::shared_ptr<DashboardDelivery> delivery,
                                    const BackendServices& services)
-    : VeskReportingBackend(name, profile.value_or(Dictionary()), productFamily, services),
+    : VeskReportingBackend(name, profile, identity, services),
       _usingProfile(profile.has_value()),
       _postURL(profileText(name, _profile, "post_url")),
       _delivery(std::move(delivery)) {
@@ -152,12 +153,12 @@ DashboardHeader DashboardBackend::headerFor(const timeval& timestamp, std::uint1
   header.eventID = eventID;
   header.isReliable = _delivery->isReliable();
   header.isWithoutProfile = !_usingProfile;
-  MutexLock lock(_mutex);
-  header.libraryVersionMajor = _selfVersionMajor;
-  header.clientType = static_cast<std::uint8_t>(_compType);
-  header.sessionID = _sessionID;
-  header.clientVersion = _clientVersion;
-  std::copy_n(_udid.begin(), std::min(_udid.size(), header.deviceID.size()), header.deviceID.begin());
+  header.libraryVersionMajor = _identity._selfVersionMajor;
+  header.clientType = static_cast<std::uint8_t>(_identity._compType);
+  header.sessionID = _identity._sessionID;
+  header.clientVersion = _identity._clientVersion;
+  const std::string& udid = _identity._udid;
+  std::copy_n(udid.begin(), std::min(udid.size(), header.deviceID.size()), header.deviceID.begin());
   return header;
 }
 

@@ -18,14 +18,13 @@ class DashboardBackend final : public VeskReportingBackend {
   /// unusable or the system refuses.
   static std::shared_ptr<DashboardBackend> create(const std::string& name,
                                                   const std::optional<Dictionary>& profile,
-                                                  const std::optional<Text>& productFamily,
+                                                  const BackendIdentity& identity,
                                                   const BackendServices& services);
   /// Creates a backend without a profile; its delivery is reliable. Returns null, without a line, if there is
   /// no address.
   static std::shared_ptr<DashboardBackend> create(const std::string& name,
                                                   const std::optional<std::string>& serverIP,
-                                                  std::uint16_t serverPort,
-                                                  const std::optional<Text>& productFamily,
+                                                  std::uint16_t serverPort, const BackendIdentity& identity,
                                                   const BackendServices& services);
   ~DashboardBackend() override;
 
@@ -46,19 +45,19 @@ class DashboardBackend final : public VeskReportingBackend {
 
  private:
   DashboardBackend(const std::string& name, const std::optional<Dictionary>& profile,
-                   const Text& productFamily, std::shared_ptr<DashboardDelivery> delivery,
+                   const BackendIdentity& identity, std::shared_ptr<DashboardDelivery> delivery,
                    const BackendServices& services);
 
   static std::shared_ptr<DashboardBackend> createConnected(const std::string& name,
                                                            const std::optional<Dictionary>& profile,
                                                            const std::optional<std::string>& serverIP,
                                                            std::uint16_t serverPort,
-                                                           const std::optional<Text>& productFamily,
+                                                           const BackendIdentity& identity,
                                                            const BackendServices& services);
 
   /// The header without the length.
   DashboardHeader headerFor(const timeval& timestamp, std::uint16_t method, std::uint16_t respCode,
-                            std::uint16_t eventID) const VESK_EXCLUDES(_mutex);
+                            std::uint16_t eventID) const;
 
   // Constant after construction.
   const bool _usingProfile;

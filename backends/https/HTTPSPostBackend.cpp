@@ -25,25 +25,26 @@ void noteMissingFamily(const std::string& name) {
 
 std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::create(const std::string& name,
                                                            const std::optional<Dictionary>& profile,
-                                                           const std::optional<Text>& productFamily,
+                                                           const BackendIdentity& identity,
                                                            const BackendServices& services) {
-  if (!productFamily) noteMissingFamily(name);
-  if (!profile || !productFamily) return nullptr;
+  if (!identity._productFamily) noteMissingFamily(name);
+  if (!profile || !identity._productFamily) return nullptr;
   if (!profileList(name, *profile, "clients")) {
     VESK_LOG_ERROR("HTTPSPostBackend(initWithName): can't find the client list.");
     return nullptr;
   }
-  return std::shared_ptr<HTTPSPostBackend>(new HTTPSPostBackend(name, *profile, *productFamily, services));
+  return std::shared_ptr<HTTPSPostBackend>(new HTTPSPostBackend(name, *profile, identity, services));
 }
 
 HTTPSPostBackend::HTTPSPostBackend(const std::string& name, const Dictionary& profile,
-                                   const Text& productFamily, const BackendServices& services)
-    : VeskReportingBackend(name, profile, productFamily, services),
+                                   const BackendIdentity& identity, const BackendServices& services)
+    : VeskReportingBackend(name, profile, identity, services),
       _dnuEnabled(services.diagnosticsSubmissionConsent()),
       _uuidRespectDnu(services.persistentIdentifierForDNU(true)),
       _uuidOverrideDnu(services.persistentIdentifierForDNU(false)),
       _eventThreshold(kDefaultEventThreshold) {
   MutexLock lock(_mutex);
+  _batchEvents = identity._batchEvents;
   _postURL = preferenceStringForKey("httpsPostURL");
   if (_postURL) {
     VESK_LOG_DEBUG("HTTPSPostBackend(initWithName): Using user default '%s' for postURL", _postURL->c_str());
@@ -102,7 +103,7 @@ std::optional<std::string> HTTPSPostBackend::sendMessageInTurn(const std::option
       _state.compare_exchange_strong(expected, BackendStateEnabled);
     }
     batchEvents = _batchEvents;
-    requireUserInfo = _requireUserInfo;
+    requireUserInfo = _identity._requireUserInfo;
     if (mustHold(flag)) {
       earlier = batchEvent(std::move(event));
     } else {
@@ -123,10 +124,10 @@ bool HTTPSPostBackend::mustHold(std::int32_t flag) const {
   const std::int32_t currentState = state();
   const bool hold =
       !isRealtime(flag) && (currentState == BackendStatePending || currentState == BackendStateOverride ||
-                            _batchEvents || (_requireUserInfo && !_userInfoDict));
+                            _batchEvents || (_identity._requireUserInfo && !_userInfoDict));
   if (hold) {
     VESK_LOG_DEBUG("HTTPSPostBackend(sendMessage): Batching %d, %d, %d", currentState, _batchEvents,
-                   _requireUserInfo);
+                   _identity._requireUserInfo);
   }
   return hold;
 }
@@ -163,7 +164,7 @@ HTTPSPostBackend::PostToBuild HTTPSPostBackend::batchEvent(MutableDictionary eve
     full = takeBatch();
     count = 0;
   }
-  if (!_batchedEvents) _batchedEvents = std::make_unique<EventBatch>(_heldBytes);
+  if (!_batchedEvents) _batchedEvents = std::make_unique<EventBatch>(_identity._heldBytes);
   _batchedEvents->add(std::move(event));
   _eventMethodCounts[method] = count + 1;
   return full;
@@ -173,7 +174,7 @@ bool HTTPSPostBackend::holdsEvents() const { return _batchedEvents && _batchedEv
 
 // Enabled, a full batch is simply sent. Otherwise nothing may be sent yet, and the oldest events have to go.
 void HTTPSPostBackend::boundHeldEvents() {
-  if (!_heldBytes->exceeded()) return;
+  if (!_identity._heldBytes->exceeded()) return;
   PostToBuild full;
   {
     MutexLock lock(_mutex);
@@ -214,7 +215,7 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesInTurn() {
 // --- Taking events out to be posted
 
 HTTPSPostBackend::PostToBuild HTTPSPostBackend::takeBatch() {
-  if (!holdsEvents() || state() != BackendStateEnabled || (_requireUserInfo && !_userInfoDict)) {
+  if (!holdsEvents() || state() != BackendStateEnabled || (_identity._requireUserInfo && !_userInfoDict)) {
     return nullptr;
   }
   VESK_LOG_DEBUG("HTTPSPostBackend(flushMessages): called");
@@ -238,7 +239,7 @@ HTTPSPostBackend::PostToBuild HTTPSPostBackend::takeBatchBeforeSingleEvent() {
 
 HTTPSPostBackend::PostToBuild HTTPSPostBackend::takeSingleEvent(MutableDictionary event, std::uint16_t method,
                                                                 std::uint16_t respCode, std::int32_t flag) {
-  auto single = std::make_unique<EventBatch>(_heldBytes);
+  auto single = std::make_unique<EventBatch>(_identity._heldBytes);
   single->add(std::move(event));
   return makePost(std::move(single), flag, method, respCode);
 }

@@ -23,7 +23,7 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   /// Nothing when profile or product family are missing, or when the profile has no `clients`.
   static std::shared_ptr<HTTPSPostBackend> create(const std::string& name,
                                                   const std::optional<Dictionary>& profile,
-                                                  const std::optional<Text>& productFamily,
+                                                  const BackendIdentity& identity,
                                                   const BackendServices& services);
   ~HTTPSPostBackend() override;
 
@@ -62,7 +62,7 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   };
   using PostToBuild = std::unique_ptr<Post>;
 
-  HTTPSPostBackend(const std::string& name, const Dictionary& profile, const Text& productFamily,
+  HTTPSPostBackend(const std::string& name, const Dictionary& profile, const BackendIdentity& identity,
                    const BackendServices& services);
 
   // Configuration.
@@ -126,6 +126,7 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   // Whether they come from the preferences.
   bool _useDefaultPostURL VESK_GUARDED_BY(_mutex) = false;
   bool _useDefaultRealtimePostURL VESK_GUARDED_BY(_mutex) = false;
+  bool _batchEvents VESK_GUARDED_BY(_mutex) = false;
   std::unique_ptr<EventBatch> _batchedEvents VESK_GUARDED_BY(_mutex);
   EventFilters _filters VESK_GUARDED_BY(_mutex);
   // 0 consent respected; overridden: 1 without it, 2 with it.

@@ -90,7 +90,7 @@ std::int32_t HTTPSPostBackend::updateBackendStateLocked() {
   }
 
   if (matching) updateExpedite(*matching);
-  if (!_requireUserInfo) return stateWithoutUserInfo(*clients);
+  if (!_identity._requireUserInfo) return stateWithoutUserInfo(*clients);
   if (!_userInfoDict) return BackendStatePending;
   return matching ? stateForEntry(*matching, clientName) : BackendStateDisabled;
 }
@@ -157,9 +157,9 @@ bool HTTPSPostBackend::placeAndDeviceAllow(const Dictionary& entry) {
   const Value* whitelist = entry.find("device_whitelist");
   const bool namesNone = !devices || devices->empty();
   if (whitelist && namesNone && !(whitelist->list() && whitelist->list()->empty())) devices = {{""}};
-  if (!matchStringWithList(devices, _productFamily.view(), true)) {
+  if (!matchStringWithList(devices, _identity._productFamily->view(), true)) {
     VESK_LOG_DEBUG("HTTPSPostBackend(updateBackendState): (%s) isn't in device list %s",
-                   _productFamily.string().c_str(), printed(devices).c_str());
+                   _identity._productFamily->string().c_str(), printed(devices).c_str());
     return false;
   }
   return true;

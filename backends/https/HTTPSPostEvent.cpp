@@ -42,30 +42,31 @@ MutableDictionary HTTPSPostBackend::createEventDictfromPayload(const std::option
                                                                std::uint16_t eventID) const {
   std::size_t userInfoSize = _userInfoDict ? _userInfoDict->size() : 0;
   MutableDictionary event(payload.value_or(Dictionary()), kFixedFields + userInfoSize);
-  std::int32_t startTS = startOfMinute(_startTimeStamp);
-  double clientTS = finiteOrMinusOne(startTS + (secondsFromTimeval(timestamp) - _startTimeStamp));
+  std::int32_t startTS = startOfMinute(_identity._startTimeStamp);
+  double clientTS = finiteOrMinusOne(startTS + (secondsFromTimeval(timestamp) - _identity._startTimeStamp));
 
   event.set(Text::literal("_startTS"), startTS);
-  setIfKnown(event, Text::literal("_sender"), senderCodeForClientType(_compType));
-  event.set(Text::literal("_clientVersion"), static_cast<unsigned>(_clientVersion));
+  setIfKnown(event, Text::literal("_sender"), senderCodeForClientType(_identity._compType));
+  event.set(Text::literal("_clientVersion"), static_cast<unsigned>(_identity._clientVersion));
   setIfKnown(event, Text::literal("_sessionID"), _combinedSessionIDString);
-  if (_extrasOnInternal != 0 && _isInternal && _compType == kClientTypeWithNumericSessionID) {
-    event.set(Text::literal("_sessionID"), _sessionID);
+  if (_extrasOnInternal != 0 && _identity._isInternal &&
+      _identity._compType == kClientTypeWithNumericSessionID) {
+    event.set(Text::literal("_sessionID"), _identity._sessionID);
   }
   event.set(Text::literal("_eventNumber"), static_cast<unsigned>(eventID));
   event.set(Text::literal("_method"), static_cast<unsigned>(method));
   event.set(Text::literal("_status"), static_cast<unsigned>(respCode));
   event.set(Text::literal("_clientTS"), clientTS);
   event.set(Text::literal("eventTime"), clientTS);
-  event.set(Text::literal("_productFamily"), _productFamily);
-  setIfKnown(event, Text::literal("_productModel"), _hardwareType);
-  setIfKnown(event, Text::literal("_osVersion"), _productVersion);
-  setIfKnown(event, Text::literal("_build"), _buildVersion);
+  setIfKnown(event, Text::literal("_productFamily"), _identity._productFamily);
+  setIfKnown(event, Text::literal("_productModel"), _identity._hardwareType);
+  setIfKnown(event, Text::literal("_osVersion"), _identity._productVersion);
+  setIfKnown(event, Text::literal("_build"), _identity._buildVersion);
   event.set(Text::literal("_internal"), currentEnvironmentType() == kSeedEnvironment ? 2
                                         : isInternalBuild()                          ? 1
                                                                                      : 0);
   event.set(Text::literal("_reportVers"),
-            std::to_string(_selfVersionMajor) + "." + std::to_string(_selfVersionMinor));
+            std::to_string(_identity._selfVersionMajor) + "." + std::to_string(_identity._selfVersionMinor));
   event.set(Text::literal("_timezoneOffset"), timezoneOffsetSeconds(wallTimeFrom(timestamp)));
   return event;
 }

@@ -53,7 +53,7 @@ std::string headerValue(const Text& text) {
 }  // namespace
 
 std::string HTTPSPostBackend::clientIdentifier() const {
-  if (_extrasOnInternal != 0 && _isInternal && !_udid.empty()) return _udid;
+  if (_extrasOnInternal != 0 && _identity._isInternal && !_identity._udid.empty()) return _identity._udid;
   return _dnuType == 0 ? _uuidRespectDnu : _uuidOverrideDnu;
 }
 
@@ -120,8 +120,9 @@ HTTPSPostBackend::Headers HTTPSPostBackend::postHeaders(std::optional<std::uint1
       headers.emplace_back("X-Vesk-Service-Name", headerValue(*name));
     }
   }
-  if (_isInternal) headers.emplace_back("X-Vesk-Internal-Build", "1");
-  if (auto sender = senderCodeForClientType(_compType)) headers.emplace_back("X-Vesk-Sender", *sender);
+  if (_identity._isInternal) headers.emplace_back("X-Vesk-Internal-Build", "1");
+  if (auto sender = senderCodeForClientType(_identity._compType))
+    headers.emplace_back("X-Vesk-Sender", *sender);
   if (method && responseCode) {
     headers.emplace_back("X-Vesk-Event-Map", std::to_string(*method) + " " + std::to_string(*responseCode));
   }
@@ -139,7 +140,7 @@ void HTTPSPostBackend::postJSONMessage(Post post, std::string json, std::size_t 
   request.method = "POST";
   request.url = std::move(*post.url);
   request.retry = HTTPRequest::Retry::UntilSent;
-  request.owner = _user.load();
+  request.owner = _identity._user;
   request.headers = std::move(post.headers);
   auto compressed = gzipDeflate(json);
   bool sendCompressed = compressed && compressed->size() < json.size();

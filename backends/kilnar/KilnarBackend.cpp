@@ -13,10 +13,9 @@ constexpr char kEventName[] = "Rookery-Vesk";
 
 std::shared_ptr<KilnarBackend> KilnarBackend::create(const std::string& name,
                                                      const std::optional<Dictionary>& profile,
-                                                     const std::optional<Text>& productFamily,
+                                                     const BackendIdentity& identity,
                                                      const BackendServices& services) {
-  return std::shared_ptr<KilnarBackend>(
-      new KilnarBackend(name, profile.value_or(Dictionary()), productFamily.value_or(Text()), services));
+  return std::shared_ptr<KilnarBackend>(new KilnarBackend(name, profile, identity, services));
 }
 
 std::optional<std::string> KilnarBackend::sendMessageInTurn(const std::optional<Dictionary>& payload,

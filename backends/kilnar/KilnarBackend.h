@@ -15,7 +15,7 @@ class KilnarBackend final : public VeskReportingBackend {
  public:
   static std::shared_ptr<KilnarBackend> create(const std::string& name,
                                                const std::optional<Dictionary>& profile,
-                                               const std::optional<Text>& productFamily,
+                                               const BackendIdentity& identity,
                                                const BackendServices& services);
 
  private:

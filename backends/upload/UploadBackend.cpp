@@ -38,24 +38,23 @@ std::string lastComponentOf(const std::string& path) { return path.substr(path.r
 
 std::shared_ptr<UploadBackend> UploadBackend::create(const std::string& name,
                                                      const std::optional<Dictionary>& profile,
-                                                     const std::optional<Text>& productFamily,
+                                                     const BackendIdentity& identity,
                                                      const BackendServices& services) {
   auto postURL = profile ? profileText(name, *profile, "post_url") : std::nullopt;
   if (!postURL) {
     VESK_LOG_ERROR("UploadBackend(initWithName): can't resolve upload post URL.");
     return nullptr;
   }
-  std::shared_ptr<UploadBackend> backend(
-      new UploadBackend(name, *profile, productFamily.value_or(Text()), services));
+  std::shared_ptr<UploadBackend> backend(new UploadBackend(name, *profile, identity, services));
   MutexLock lock(backend->_mutex);
   backend->_uploadURL = postURL;
   backend->_displayURL = profileText(name, *profile, "display_url");
   return backend;
 }
 
-UploadBackend::UploadBackend(const std::string& name, const Dictionary& profile, const Text& productFamily,
-                             const BackendServices& services)
-    : VeskReportingBackend(name, profile, productFamily, services) {}
+UploadBackend::UploadBackend(const std::string& name, const Dictionary& profile,
+                             const BackendIdentity& identity, const BackendServices& services)
+    : VeskReportingBackend(name, profile, identity, services) {}
 
 std::optional<std::string> UploadBackend::uploadURL() const {
   MutexLock lock(_mutex);
@@ -147,16 +146,9 @@ std::optional<std::string> UploadBackend::contentsOf(const LentFile& file) const
 
 std::optional<HTTPRequest> UploadBackend::requestFor(const std::string& path,
                                                      const std::string& uploadURL) const {
-  std::string udid;
-  std::uint32_t sessionID = 0;
-  {
-    MutexLock lock(_mutex);
-    udid = _udid;
-    sessionID = _sessionID;
-  }
   HTTPRequest request;
   request.method = "POST";
-  request.url = uploadURL + "?uuid=" + udid + "&sequence=" + std::to_string(sessionID) +
+  request.url = uploadURL + "?uuid=" + _identity._udid + "&sequence=" + std::to_string(_identity._sessionID) +
                 "&description=" + encodedForURLQuery(kDescription) +
                 "%20(Uploaded%20by%20ZKS)&filename=" + encodedForURLQuery(lastComponentOf(path) + ".gz") +
                 "&raw=true";

@@ -21,7 +21,7 @@ class UploadBackend final : public VeskReportingBackend {
   /// Returns null, with a line in the log, if the profile has no "post_url".
   static std::shared_ptr<UploadBackend> create(const std::string& name,
                                                const std::optional<Dictionary>& profile,
-                                               const std::optional<Text>& productFamily,
+                                               const BackendIdentity& identity,
                                                const BackendServices& services);
 
   /// Blocks until the server has answered, the transfer has failed or the daemon stops. Returns true if the
@@ -32,7 +32,7 @@ class UploadBackend final : public VeskReportingBackend {
   void setUploadURL(const std::optional<std::string>& url);
 
  private:
-  UploadBackend(const std::string& name, const Dictionary& profile, const Text& productFamily,
+  UploadBackend(const std::string& name, const Dictionary& profile, const BackendIdentity& identity,
                 const BackendServices& services);
 
   bool upload(const std::string& path, const std::string& extensionToken, const std::string& uploadURL);

@@ -55,29 +55,24 @@ std::optional<std::string> guarded(const Call& call) noexcept {
 
 std::shared_ptr<WrenBackend> WrenBackend::create(const std::string& name,
                                                  const std::optional<Dictionary>& profile,
-                                                 const std::optional<Text>& productFamily,
-                                                 std::int32_t clientType, const BackendServices& services) {
-  VESK_LOG_INFO("WrenBackend(initWithName): Loading Wren adaptor class for client type %d", clientType);
-  auto bundle = bundleForClientType(clientType);
+                                                 const BackendIdentity& identity,
+                                                 const BackendServices& services) {
+  VESK_LOG_INFO("WrenBackend(initWithName): Loading Wren adaptor class for client type %d",
+                identity._compType);
+  auto bundle = bundleForClientType(identity._compType);
   if (!bundle) {
-    VESK_LOG_ERROR("WrenBackend(initWithName): No matching bundle found for client type %d", clientType);
+    VESK_LOG_ERROR("WrenBackend(initWithName): No matching bundle found for client type %d",
+                   identity._compType);
     nextSamplingDraw();  // a refused backend must still consume its draw
     return nullptr;
   }
-  return std::shared_ptr<WrenBackend>(new WrenBackend(
-      name, profile.value_or(Dictionary()), productFamily.value_or(Text()), services, std::move(*bundle)));
+  return std::shared_ptr<WrenBackend>(new WrenBackend(name, profile, identity, services, std::move(*bundle)));
 }
 
-std::shared_ptr<WrenBackend> WrenBackend::create(const std::string& name,
-                                                 const std::optional<Dictionary>& profile,
-                                                 const std::optional<Text>& productFamily,
-                                                 const BackendServices& services) {
-  return create(name, profile, productFamily, 0, services);
-}
-
-WrenBackend::WrenBackend(const std::string& name, const Dictionary& profile, const Text& productFamily,
-                         const BackendServices& services, std::string bundlePath)
-    : VeskReportingBackend(name, profile, productFamily, services),
+WrenBackend::WrenBackend(const std::string& name, const std::optional<Dictionary>& profile,
+                         const BackendIdentity& identity, const BackendServices& services,
+                         std::string bundlePath)
+    : VeskReportingBackend(name, profile, identity, services),
       _clientBundle(std::move(bundlePath)),
       _stateDirectory(pathUnderRoot(kStateDirectory)),
       _host{VESK_WREN_ADAPTOR_VERSION, _stateDirectory.c_str(), &writeLine} {

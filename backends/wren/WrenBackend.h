@@ -21,12 +21,7 @@ class WrenBackend final : public VeskReportingBackend {
   /// Returns null, with a line in the log, for a client type without an adaptor.
   static std::shared_ptr<WrenBackend> create(const std::string& name,
                                              const std::optional<Dictionary>& profile,
-                                             const std::optional<Text>& productFamily,
-                                             std::int32_t clientType, const BackendServices& services);
-  /// Always returns null, since there is no client type.
-  static std::shared_ptr<WrenBackend> create(const std::string& name,
-                                             const std::optional<Dictionary>& profile,
-                                             const std::optional<Text>& productFamily,
+                                             const BackendIdentity& identity,
                                              const BackendServices& services);
 
  private:
@@ -34,8 +29,8 @@ class WrenBackend final : public VeskReportingBackend {
     void operator()(VeskWrenAdaptor* adaptor) const noexcept;
   };
 
-  WrenBackend(const std::string& name, const Dictionary& profile, const Text& productFamily,
-              const BackendServices& services, std::string bundlePath);
+  WrenBackend(const std::string& name, const std::optional<Dictionary>& profile,
+              const BackendIdentity& identity, const BackendServices& services, std::string bundlePath);
 
   std::optional<std::string> sendMessageInTurn(const std::optional<Dictionary>& payload,
                                                const timeval& timestamp, std::uint16_t method,

@@ -121,7 +121,7 @@ class AgentHarness : public BackendHarness {
     return sum;
   }
 
-  SessionServices sessionServices{services, "7.3"};
+  SessionServices sessionServices{.backends = services, .libraryVersion = "7.3"};
   BusyMarker busyMarker;
   std::map<std::int32_t, Dictionary> storebags;  ///< sections by client type
   std::shared_ptr<ReportingdAgent> agent;

@@ -39,13 +39,14 @@ struct ReceivedPost {
 class BackendHarness {
  public:
   BackendHarness()
-      : services{_http,
-                 clock,
-                 counters,
-                 networkQueues,
-                 [](bool respects) { return std::string(respects ? "id-respecting" : "id-overriding"); },
-                 [this] { return consent; },
-                 [this] { return region; }},
+      : services{.http = _http,
+                 .clock = clock,
+                 .counters = counters,
+                 .networkQueues = networkQueues,
+                 .persistentIdentifierForDNU =
+                     [](bool respects) { return std::string(respects ? "id-respecting" : "id-overriding"); },
+                 .diagnosticsSubmissionConsent = [this] { return consent; },
+                 .regionCode = [this] { return region; }},
         _server({}, [this](const HTTPReceived& request) { return receive(request); }) {}
 
   /// All posts so far, after waiting for outstanding requests.

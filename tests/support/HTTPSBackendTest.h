@@ -27,6 +27,10 @@ struct Stamp {
   bool batchEvents = false;
   bool isInternal = false;
   std::int32_t clientType = 5;
+  std::string udid = "the-udid";
+  std::optional<Text> build = std::nullopt;
+  std::string selfVersion = "7.2.9";
+  double start = 1'000'000'019.7;
 };
 
 class HTTPSBackendTest : public ::testing::Test {
@@ -45,20 +49,22 @@ class HTTPSBackendTest : public ::testing::Test {
     return whole.share();
   }
   std::shared_ptr<HTTPSPostBackend> make(List clients, const Stamp& stamp = {}) {
+    BackendIdentity identity{._sessionID = 4'000'000'000,
+                             ._compType = stamp.clientType,
+                             ._clientVersion = 3,
+                             ._udid = stamp.udid,
+                             ._productVersion = Text("12.1"),
+                             ._buildVersion = stamp.build,
+                             ._hardwareType = Text("Phone7,2"),
+                             ._productFamily = Text("Phone"),
+                             ._isInternal = stamp.isInternal,
+                             ._requireUserInfo = stamp.requireUserInfo,
+                             ._batchEvents = stamp.batchEvents,
+                             ._startTimeStamp = stamp.start};
+    identity.setSelfVersion(stamp.selfVersion);
     auto backend = std::static_pointer_cast<HTTPSPostBackend>(
         newBackendWithName(kVeskReportingBackendHTTPPost, Dictionary{{"clients", std::move(clients)}},
-                           Text("Phone"), 5, harness.services));
-    backend->setSessionID(4'000'000'000);
-    backend->setCompType(stamp.clientType);
-    backend->setClientVersion(3);
-    backend->setUdid("the-udid");
-    backend->setProductVersion(Text("12.1"));
-    backend->setHardwareType(Text("Phone7,2"));
-    backend->setIsInternal(stamp.isInternal);
-    backend->setRequireUserInfo(stamp.requireUserInfo);
-    backend->setBatchEvents(stamp.batchEvents);
-    backend->setSelfVersion("7.2.9");
-    backend->setStartTimestamp(at(kStart));
+                           identity, harness.services));
     backend->setCombinedSessionIDString("session-text");
     backend->setSamplingFactor(0.30);
     update(*backend, stamp.userInfo);
