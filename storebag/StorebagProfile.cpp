@@ -34,18 +34,11 @@ std::optional<std::string> profileText(std::string_view backendName, const Dicti
   return value->text()->string();
 }
 
-std::optional<Value> profileNumber(std::string_view backendName, const Dictionary& profile,
-                                   std::string_view key) {
-  auto* value = find(backendName, profile, key, [](const Value& v) { return v.isNumber(); });
-  if (!value) return std::nullopt;
-  return *value;
-}
-
 std::optional<std::int64_t> profileInteger(std::string_view backendName, const Dictionary& profile,
                                            std::string_view key) {
-  auto number = profileNumber(backendName, profile, key);
-  if (!number) return std::nullopt;
-  return number->asInteger();
+  auto* value = find(backendName, profile, key, [](const Value& v) { return v.isNumber(); });
+  if (!value) return std::nullopt;
+  return value->asInteger();
 }
 
 std::optional<std::int64_t> profileIntegerOrNumericText(std::string_view backendName,
@@ -61,23 +54,6 @@ std::optional<List> profileList(std::string_view backendName, const Dictionary& 
   auto* value = find(backendName, profile, key, [](const Value& v) { return v.list() != nullptr; });
   if (!value) return std::nullopt;
   return *value->list();
-}
-
-std::optional<std::vector<std::string>> profileTextList(std::string_view backendName,
-                                                        const Dictionary& profile, std::string_view key) {
-  auto list = profileList(backendName, profile, key);
-  if (!list) return std::nullopt;
-  std::vector<std::string> texts;
-  const Value* wrong = nullptr;
-  for (const Value& element : *list) {
-    if (const Text* text = element.text()) {
-      texts.push_back(text->string());
-    } else if (!wrong) {
-      wrong = &element;
-    }
-  }
-  if (wrong) reportWrongType(backendName, key, *wrong);
-  return texts;
 }
 
 std::optional<Dictionary> profileDictionary(std::string_view backendName, const Dictionary& profile,

@@ -5,7 +5,6 @@
 #include <optional>
 #include <string>
 #include <string_view>
-#include <vector>
 
 #include <VeskReporting/values/Value.h>
 
@@ -18,9 +17,6 @@ void reportWrongType(std::string_view backendName, std::string_view key, const V
 /// type counts as absent, with one line that names the backend and the key.
 std::optional<std::string> profileText(std::string_view backendName, const Dictionary& profile,
                                        std::string_view key);
-/// Boolean, integer or double, unconverted.
-std::optional<Value> profileNumber(std::string_view backendName, const Dictionary& profile,
-                                   std::string_view key);
 /// A number, converted to an integer by `Value::asInteger`.
 std::optional<std::int64_t> profileInteger(std::string_view backendName, const Dictionary& profile,
                                            std::string_view key);
@@ -29,9 +25,6 @@ std::optional<std::int64_t> profileIntegerOrNumericText(std::string_view backend
                                                         const Dictionary& profile, std::string_view key);
 std::optional<List> profileList(std::string_view backendName, const Dictionary& profile,
                                 std::string_view key);
-/// Elements that are not text are left out, with one line for the list.
-std::optional<std::vector<std::string>> profileTextList(std::string_view backendName,
-                                                        const Dictionary& profile, std::string_view key);
 std::optional<Dictionary> profileDictionary(std::string_view backendName, const Dictionary& profile,
                                             std::string_view key);
 

@@ -28,6 +28,7 @@ TEST_F(HTTPSPolicy, EntryDecidesTheState) {
       {"device_whitelist", List{}, 2, {}},
       {"device_whitelist", "Phone", 1, {}},
       {"device_whitelist", List{7, true}, 1, {}},
+      {"device_whitelist", List{7, "Pad"}, 1, {"7 (Phone) isn't in device list (Pad)"}},
       {"device_whitelist", List{7, "Phone"}, 2, {}},
       {"filters", std::nullopt, 1, {"4 filters are required."}},
       {"filters", 7, 1, {"4 filters are required."}},
@@ -37,6 +38,8 @@ TEST_F(HTTPSPolicy, EntryDecidesTheState) {
     const Dictionary changes = value ? Dictionary{{key, *value}} : Dictionary();
     EXPECT_EQ(make(entry(changes, value ? "" : key))->state(), state) << describe(changes);
     EXPECT_EQ(lines.empty() ? lines : linesOf(log, kUpdate), lines);
+    const bool isWrong = describe(changes).find('7') != std::string::npos;
+    EXPECT_EQ(log.countContaining(4, "' has the wrong type and counts as absent: 7"), isWrong ? 1 : 0);
   }
   harness.region.reset();
   EXPECT_EQ(make(entry())->state(), BackendStateEnabled) << "an unknown region passes";
@@ -253,6 +256,43 @@ TEST_F(HTTPSPolicy, TellsEachStepOfItsDecision) {
     make(entry, stamp);
     writePreferences("");
     EXPECT_EQ(linesOf(log, kUpdate), lines);
+  }
+}
+
+TEST(PostPolicy, NamesTheFirstRuleThatHeldReportingBack) {
+  const Dictionary whole{{"client", "Camera"},
+                         {"locale_whitelist", List{"us"}},
+                         {"device_whitelist", List{"phone"}},
+                         {"filters", List{}},
+                         {"sampling_threshold", 0.5}};
+  const PostPolicy::Facts all{.userInfo = userNamed("Camera"),
+                              .requireUserInfo = true,
+                              .productFamily = "Phone",
+                              .regionCode = "US",
+                              .dnuEnabled = true,
+                              .samplingFactor = 0.3};
+  const std::tuple<Dictionary, std::int32_t, const char*> cases[] = {
+      {{}, 2, ""},
+      {{{"client", "A,B"}}, 1, "clients: \"Camera\", wanted null"},
+      {{{"locale_whitelist", List{"FR", "DE"}}},
+       1,
+       "locale_whitelist of entry 1: \"US\", wanted [\"FR\", \"DE\"]"},
+      {{{"device_whitelist", List{"Pad"}}}, 1, "device_whitelist of entry 1: \"Phone\", wanted [\"Pad\"]"},
+      {{{"filters", 7}}, 1, "filters of entry 1: null, wanted null"},
+      {{{"sampling_threshold", 0.1}}, 3, "sampling_threshold of entry 1: 0.3, wanted 0.1"}};
+  for (const auto& [changes, state, reason] : cases) {
+    MutableDictionary changed(whole);
+    changed.setAll(changes);
+    PostPolicy::Facts facts = all;
+    facts.profile = Dictionary{{"clients", List{Dictionary{{"service", "none"}}, changed.share()}}};
+    const auto decision = PostPolicy::decide(facts, {});
+    EXPECT_EQ(decision.state, state);
+    const auto* step = decision.reason();
+    EXPECT_EQ(!step ? ""
+                    : std::string(step->rule) +
+                          (step->entry ? " of entry " + std::to_string(*step->entry) : "") + ": " +
+                          describe(step->value) + ", wanted " + describe(step->expected),
+              reason);
   }
 }
 

@@ -116,11 +116,9 @@ TEST(StorebagProfile, ReadsValuesOfTheirType) {
                            {"real", 2.75},
                            {"list", List{"a", "b"}},
                            {"inner", inner},
-                           {"infinite", std::numeric_limits<double>::infinity()},
-                           {"mixed", List{"a", 1, "b", inner}}};
+                           {"infinite", std::numeric_limits<double>::infinity()}};
   CapturedLog log;
   EXPECT_EQ(profileText("b", profile, "text"), "12 or so");
-  EXPECT_EQ(profileNumber("b", profile, "real"), Value(2.75));
   EXPECT_EQ(profileInteger("b", profile, "real"), 2);
   EXPECT_EQ(profileInteger("b", profile, "infinite"), std::numeric_limits<std::int64_t>::max());
   EXPECT_EQ(profileIntegerOrNumericText("b", profile, "text"), 12);
@@ -128,11 +126,7 @@ TEST(StorebagProfile, ReadsValuesOfTheirType) {
   EXPECT_EQ(profileList("b", profile, "list"), (List{"a", "b"}));
   EXPECT_EQ(profileDictionary("b", profile, "inner"), inner);
   EXPECT_FALSE(profileText("b", profile, "absent"));
-  EXPECT_FALSE(profileTextList("b", profile, "absent"));
   EXPECT_EQ(log.lines(), Lines());
-  EXPECT_EQ(profileTextList("b", profile, "mixed"), (std::vector<std::string>{"a", "b"}));
-  EXPECT_EQ(log.lines(),
-            (Lines{{4, "b: The storebag's value for 'mixed' has the wrong type and counts as absent: 1"}}));
 }
 
 TEST(StorebagProfile, AWrongTypeCountsAsAbsentAndCostsOneLine) {
@@ -144,12 +138,10 @@ TEST(StorebagProfile, AWrongTypeCountsAsAbsentAndCostsOneLine) {
     CapturedLog log;
     const std::pair<bool, bool> readings[] = {
         {profileText("the backend", profile, "the key").has_value(), isText},
-        {profileNumber("the backend", profile, "the key").has_value(), value.isNumber()},
         {profileInteger("the backend", profile, "the key").has_value(), value.isNumber()},
         {profileIntegerOrNumericText("the backend", profile, "the key").has_value(),
          value.isNumber() || isText},
         {profileList("the backend", profile, "the key").has_value(), value.list() != nullptr},
-        {profileTextList("the backend", profile, "the key").has_value(), value.list() != nullptr},
         {profileDictionary("the backend", profile, "the key").has_value(), value.dictionary() != nullptr}};
     std::size_t absent = 0;
     for (const auto& [isThere, isOfThatType] : readings) {

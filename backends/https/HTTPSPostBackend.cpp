@@ -1,5 +1,6 @@
 #include "backends/https/HTTPSPostBackend.h"
 
+#include "backends/https/PolicyLog.h"
 #include "platform/log/SystemLog.h"
 #include "storebag/Settings.h"
 #include "storebag/StorebagProfile.h"
@@ -41,21 +42,21 @@ HTTPSPostBackend::HTTPSPostBackend(const std::string& name, const Dictionary& pr
     : VeskReportingBackend(name, profile, identity, services),
       _dnuEnabled(services.diagnosticsSubmissionConsent()),
       _uuidRespectDnu(services.persistentIdentifierForDNU(true)),
-      _uuidOverrideDnu(services.persistentIdentifierForDNU(false)),
-      _eventThreshold(kDefaultEventThreshold) {
+      _uuidOverrideDnu(services.persistentIdentifierForDNU(false)) {
   MutexLock lock(_mutex);
-  _batchEvents = identity._batchEvents;
-  _postURL = preferenceStringForKey("httpsPostURL");
-  if (_postURL) {
-    VESK_LOG_DEBUG("HTTPSPostBackend(initWithName): Using user default '%s' for postURL", _postURL->c_str());
+  _settings._batchEvents = identity._batchEvents;
+  _settings._postURL = preferenceStringForKey("httpsPostURL");
+  if (_settings._postURL) {
+    VESK_LOG_DEBUG("HTTPSPostBackend(initWithName): Using user default '%s' for postURL",
+                   _settings._postURL->c_str());
   }
-  _useDefaultPostURL = _postURL.has_value();
-  _realtimePostURL = preferenceStringForKey("httpsRealtimePostURL");
-  if (_realtimePostURL) {
+  _settings._useDefaultPostURL = _settings._postURL.has_value();
+  _settings._realtimePostURL = preferenceStringForKey("httpsRealtimePostURL");
+  if (_settings._realtimePostURL) {
     VESK_LOG_DEBUG("HTTPSPostBackend(initWithName): Using user default '%s' for realtimePostURL",
-                   _realtimePostURL->c_str());
+                   _settings._realtimePostURL->c_str());
   }
-  _useDefaultRealtimePostURL = _realtimePostURL.has_value();
+  _settings._useDefaultRealtimePostURL = _settings._realtimePostURL.has_value();
   _displayURL = profileText(name, profile, "display_url");
 }
 
@@ -67,12 +68,33 @@ HTTPSPostBackend::~HTTPSPostBackend() {
 
 std::optional<std::string> HTTPSPostBackend::postURL() const {
   MutexLock lock(_mutex);
-  return _postURL;
+  return _settings._postURL;
 }
 
 void HTTPSPostBackend::setPostURL(const std::optional<std::string>& url) {
   MutexLock lock(_mutex);
-  _postURL = url;
+  _settings._postURL = url;
+}
+
+std::int32_t HTTPSPostBackend::updateBackendState() {
+  const double draw = samplingFactor();
+  auto decision = PostPolicy::decide({.profile = _profile,
+                                      .userInfo = _userInfoDict,
+                                      .requireUserInfo = _identity._requireUserInfo,
+                                      .productFamily = _identity._productFamily->string(),
+                                      .regionCode = _services.regionCode(),
+                                      .dnuEnabled = _dnuEnabled,
+                                      .samplingFactor = draw},
+                                     _settings);
+  for (const PostPolicy::Step& step : decision.steps) {
+    logPolicyStep(step, _name, draw);
+    // Complaints about filters belong here in the log.
+    if (step.rule == "filters" && decision.filters) _filters.createFiltersFromArray(*decision.filters, _name);
+  }
+  if (decision.filters) setSamplingThreshold(decision.samplingThreshold);
+  _settings = std::move(decision.settings);
+  setHierarchy(_settings._hierarchy);
+  return decision.state;
 }
 
 // --- One message
@@ -102,7 +124,7 @@ std::optional<std::string> HTTPSPostBackend::sendMessageInTurn(const std::option
       std::int32_t expected = BackendStateOverride;  // a completion may just switch the backend off
       _state.compare_exchange_strong(expected, BackendStateEnabled);
     }
-    batchEvents = _batchEvents;
+    batchEvents = _settings._batchEvents;
     requireUserInfo = _identity._requireUserInfo;
     if (mustHold(flag)) {
       earlier = batchEvent(std::move(event));
@@ -124,9 +146,9 @@ bool HTTPSPostBackend::mustHold(std::int32_t flag) const {
   const std::int32_t currentState = state();
   const bool hold =
       !isRealtime(flag) && (currentState == BackendStatePending || currentState == BackendStateOverride ||
-                            _batchEvents || (_identity._requireUserInfo && !_userInfoDict));
+                            _settings._batchEvents || (_identity._requireUserInfo && !_userInfoDict));
   if (hold) {
-    VESK_LOG_DEBUG("HTTPSPostBackend(sendMessage): Batching %d, %d, %d", currentState, _batchEvents,
+    VESK_LOG_DEBUG("HTTPSPostBackend(sendMessage): Batching %d, %d, %d", currentState, _settings._batchEvents,
                    _identity._requireUserInfo);
   }
   return hold;
@@ -142,10 +164,10 @@ std::optional<Dictionary> HTTPSPostBackend::payloadWithStopEntries(
     return std::nullopt;
   }
   MutableDictionary extended(*payload, 4);
-  extended.set(Text::literal("Opt"), _dnuType);
+  extended.set(Text::literal("Opt"), _settings._dnuType);
   extended.set(Text::literal("SamplingThreshold"), samplingThreshold().value_or(Value(-1)));
-  extended.set(Text::literal("OverrideSampling"), _overrideSampling.value_or(Value(-1)));
-  extended.set(Text::literal("Batch"), _batchEvents ? 1 : 0);
+  extended.set(Text::literal("OverrideSampling"), _settings._overrideSampling.value_or(Value(-1)));
+  extended.set(Text::literal("Batch"), _settings._batchEvents ? 1 : 0);
   return extended.share();
 }
 
@@ -156,7 +178,7 @@ HTTPSPostBackend::PostToBuild HTTPSPostBackend::batchEvent(MutableDictionary eve
   std::int64_t method = methodValue ? methodValue->asInteger().value_or(0) : 0;
   std::int32_t count = _eventMethodCounts[method];
   PostToBuild full;
-  if (count > _eventThreshold) {
+  if (count > _settings._eventThreshold) {
     VESK_LOG_DEBUG(
         "HTTPSPostBackend(batchEvent): Flushing all batched events as we reached event threshold for method "
         "%d",
@@ -230,7 +252,7 @@ HTTPSPostBackend::PostToBuild HTTPSPostBackend::takeBatch() {
 }
 
 HTTPSPostBackend::PostToBuild HTTPSPostBackend::takeBatchBeforeSingleEvent() {
-  if (state() != BackendStateEnabled || _batchEvents || !holdsEvents()) return nullptr;
+  if (state() != BackendStateEnabled || _settings._batchEvents || !holdsEvents()) return nullptr;
   VESK_LOG_DEBUG(
       "HTTPSPostBackend(sendMessage): Backend has changed its state to 'Enabled', batching is not "
       "requested and some events have already been batched. Forcing Flush here to keep events in order.");
@@ -250,10 +272,10 @@ HTTPSPostBackend::PostToBuild HTTPSPostBackend::makePost(std::unique_ptr<EventBa
                                                          std::optional<std::uint16_t> responseCode) const {
   auto post = std::make_unique<Post>();
   post->events = std::move(events);
-  post->url = isRealtime(flag) ? _realtimePostURL : _postURL;
+  post->url = isRealtime(flag) ? _settings._realtimePostURL : _settings._postURL;
   post->clientID = clientIdentifier();
   post->headers = postHeaders(method, responseCode);
-  post->isPrintable = _dnuType == 0 && _dnuEnabled;
+  post->isPrintable = _settings._dnuType == 0 && _dnuEnabled;
   return post;
 }
 

@@ -11,6 +11,7 @@
 #include "backends/VeskReportingBackend.h"
 #include "backends/https/EventBatch.h"
 #include "backends/https/EventFilters.h"
+#include "backends/https/PostPolicy.h"
 
 namespace vesk {
 
@@ -30,10 +31,6 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   std::optional<std::string> postURL() const;
   void setPostURL(const std::optional<std::string>& url);
 
-  /// Decides the state from the profile and the user info, and with it URLs, filters, sampling and
-  /// thresholds.
-  std::int32_t updateBackendState();
-
  protected:
   std::optional<std::string> sendMessageInTurn(const std::optional<Dictionary>& payload,
                                                const timeval& timestamp, std::uint16_t method,
@@ -41,13 +38,10 @@ class HTTPSPostBackend final : public VeskReportingBackend {
                                                std::int32_t flag) override VESK_REQUIRES(_sendMutex)
       VESK_EXCLUDES(_mutex);
   std::optional<std::string> flushMessagesInTurn() override VESK_REQUIRES(_sendMutex) VESK_EXCLUDES(_mutex);
-  void updateStateLocked() override VESK_REQUIRES(_mutex);
+  void updateStateLocked() override VESK_REQUIRES(_mutex) { setState(updateBackendState()); }
   void setCorrelatedSessionIDLocked(const std::optional<Text>& sessionID) override VESK_REQUIRES(_mutex);
 
  private:
-  /// Messages of one method that a batch takes beyond the first.
-  static constexpr std::int32_t kDefaultEventThreshold = 49;
-
   using Headers = std::vector<std::pair<std::string, std::string>>;
 
   /// Events that were taken to be posted, and all that their post is made of: later changes of the backend
@@ -65,21 +59,7 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   HTTPSPostBackend(const std::string& name, const Dictionary& profile, const BackendIdentity& identity,
                    const BackendServices& services);
 
-  // Configuration.
-  std::int32_t updateBackendStateLocked() VESK_REQUIRES(_mutex);
-  std::int32_t stateForEntry(const Dictionary& entry, const std::optional<Text>& clientName)
-      VESK_REQUIRES(_mutex);
-  std::int32_t stateWithoutUserInfo(const std::vector<Dictionary>& clients) VESK_REQUIRES(_mutex);
-  std::int32_t stateForSampling(const Dictionary& entry) VESK_REQUIRES(_mutex);
-  bool consentAllows(const Dictionary& entry) VESK_REQUIRES(_mutex);
-  bool placeAndDeviceAllow(const Dictionary& entry) VESK_REQUIRES(_mutex);
-  void updateEventThreshold(const Dictionary& entry) VESK_REQUIRES(_mutex);
-  void updateExtrasOnInternal(const Dictionary& entry) VESK_REQUIRES(_mutex);
-  void updateExpedite(const Dictionary& entry) VESK_REQUIRES(_mutex);
-  bool updatePostLink(const Dictionary& entry) VESK_REQUIRES(_mutex);
-  bool matchClientNameAndServiceID(const Dictionary& entry, const std::optional<Text>& clientName,
-                                   const std::optional<Text>& serviceName) const;
-  std::optional<std::vector<Dictionary>> clientEntries() const;
+  std::int32_t updateBackendState() VESK_REQUIRES(_mutex);
 
   // Events.
   MutableDictionary createEventDictfromPayload(const std::optional<Dictionary>& payload,
@@ -121,19 +101,9 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   const std::string _uuidOverrideDnu;
 
   // Guarded by _mutex.
-  std::optional<std::string> _postURL VESK_GUARDED_BY(_mutex);
-  std::optional<std::string> _realtimePostURL VESK_GUARDED_BY(_mutex);
-  // Whether they come from the preferences.
-  bool _useDefaultPostURL VESK_GUARDED_BY(_mutex) = false;
-  bool _useDefaultRealtimePostURL VESK_GUARDED_BY(_mutex) = false;
-  bool _batchEvents VESK_GUARDED_BY(_mutex) = false;
+  PostPolicy::Settings _settings VESK_GUARDED_BY(_mutex);
   std::unique_ptr<EventBatch> _batchedEvents VESK_GUARDED_BY(_mutex);
   EventFilters _filters VESK_GUARDED_BY(_mutex);
-  // 0 consent respected; overridden: 1 without it, 2 with it.
-  std::int32_t _dnuType VESK_GUARDED_BY(_mutex) = 0;
-  std::int32_t _eventThreshold VESK_GUARDED_BY(_mutex);
-  std::int32_t _extrasOnInternal VESK_GUARDED_BY(_mutex) = 0;
-  std::optional<Value> _overrideSampling VESK_GUARDED_BY(_mutex);  // a number
   std::unordered_map<std::int64_t, std::int32_t> _eventMethodCounts VESK_GUARDED_BY(_mutex);
 };
 

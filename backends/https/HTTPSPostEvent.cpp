@@ -49,7 +49,7 @@ MutableDictionary HTTPSPostBackend::createEventDictfromPayload(const std::option
   setIfKnown(event, Text::literal("_sender"), senderCodeForClientType(_identity._compType));
   event.set(Text::literal("_clientVersion"), static_cast<unsigned>(_identity._clientVersion));
   setIfKnown(event, Text::literal("_sessionID"), _combinedSessionIDString);
-  if (_extrasOnInternal != 0 && _identity._isInternal &&
+  if (_settings._extrasOnInternal != 0 && _identity._isInternal &&
       _identity._compType == kClientTypeWithNumericSessionID) {
     event.set(Text::literal("_sessionID"), _identity._sessionID);
   }

@@ -53,8 +53,9 @@ std::string headerValue(const Text& text) {
 }  // namespace
 
 std::string HTTPSPostBackend::clientIdentifier() const {
-  if (_extrasOnInternal != 0 && _identity._isInternal && !_identity._udid.empty()) return _identity._udid;
-  return _dnuType == 0 ? _uuidRespectDnu : _uuidOverrideDnu;
+  if (_settings._extrasOnInternal != 0 && _identity._isInternal && !_identity._udid.empty())
+    return _identity._udid;
+  return _settings._dnuType == 0 ? _uuidRespectDnu : _uuidOverrideDnu;
 }
 
 std::optional<std::string> HTTPSPostBackend::buildAndPost(PostToBuild post) {

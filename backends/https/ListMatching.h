@@ -2,14 +2,14 @@
 #pragma once
 
 #include <optional>
-#include <string>
 #include <string_view>
-#include <vector>
+
+#include <VeskReporting/values/Value.h>
 
 namespace vesk {
 
-/// Absent or not, a list of texts from a storebag.
-using NameList = std::optional<std::vector<std::string>>;
+/// Absent or not, a list of texts.
+using NameList = std::optional<List>;
 
 /// True when an item equals the whole string, ignoring case. An absent or empty list gives `whitelist`, an
 /// absent string its negation.
@@ -21,6 +21,6 @@ bool matchExactStringWithList(const NameList& list, std::optional<std::string_vi
 bool matchStringWithList(const NameList& list, std::optional<std::string_view> wholeString, bool whitelist);
 
 /// The pieces of a text between commas, empty ones included.
-std::vector<std::string> componentsSeparatedByComma(std::string_view text);
+List componentsSeparatedByComma(std::string_view text);
 
 }  // namespace vesk
