@@ -1,11 +1,14 @@
 #include "backends/https/EventBatch.h"
 
+#include "platform/log/SystemLog.h"
+
 namespace vesk {
 
 namespace {
 
 // What a held event costs beyond its entries and texts: its place in the batch and the decoder's arena chunk.
 constexpr std::size_t kOverhead = 1024;
+constexpr std::size_t kMostMethods = 65'536;
 
 }  // namespace
 
@@ -17,24 +20,36 @@ void EventBatch::add(MutableDictionary event) {
   _account->add(bytes);
 }
 
+void EventBatch::add(MutableDictionary event, std::int64_t method) {
+  add(std::move(event));
+  ++_eventMethodCounts[method];
+}
+
+bool EventBatch::passesThreshold(std::int64_t method, std::int32_t threshold) {
+  std::int32_t& count = _eventMethodCounts[method];
+  if (count <= threshold) return false;
+  count = 0;
+  return true;
+}
+
 // An eighth at once, or all others would be at the limit with each of their events.
-EventBatch::Dropped EventBatch::dropOldest() {
-  Dropped dropped;
+std::size_t EventBatch::dropOldest(const std::string& backendName) {
+  std::size_t dropped = 0;
+  const HeldAccount* exceeded = nullptr;
   for (const HeldAccount* account = _account.get(); account; account = account->wider()) {
     if (account->bytes() <= account->limit()) continue;
     const std::size_t kept = account->isOfSession() ? 1 : 0;
-    const std::size_t before = dropped.count;
-    for (; account->bytes() > account->limit() / 8 * 7 && _events.size() > kept; ++dropped.count) {
+    for (; account->bytes() > account->limit() / 8 * 7 && _events.size() > kept; ++dropped) {
       dropFront(1);
+      exceeded = account;
     }
-    if (dropped.count == before) continue;
-    dropped.account = account;
-    dropped.bound = account->limit();
   }
+  if (exceeded) logDropped(*exceeded, exceeded->limit(), backendName);
+  if (_eventMethodCounts.size() > kMostMethods) _eventMethodCounts.clear();  // user info may name any number
   return dropped;
 }
 
-EventBatch::Dropped EventBatch::addUserInfo(const Dictionary& userInfo) {
+std::size_t EventBatch::addUserInfo(const Dictionary& userInfo, const std::string& backendName) {
   constexpr std::size_t kTimes = 2;
   const std::string_view marker = userInfo.begin()->key.view();
   const std::size_t growth = approximateMemory(userInfo);
@@ -44,13 +59,28 @@ EventBatch::Dropped EventBatch::addUserInfo(const Dictionary& userInfo) {
     const HeldAccount* account = _account->exceeded(growth, kTimes);
     if (account && left < _events.size()) {
       dropFront(left);
-      return {left, account, account->limit() * kTimes};
+      logDropped(*account, account->limit() * kTimes, backendName);
+      return left;
     }
     held.event.setAll(userInfo);
     held.bytes += growth;
     _account->add(growth);
   }
-  return {};
+  return 0;
+}
+
+void EventBatch::logDropped(const HeldAccount& account, std::size_t bound, const std::string& backendName) {
+  if (std::exchange(_hasLoggedDrop, true)) return;
+  if (account.isOfSession()) {
+    VESK_LOG_WARNING(
+        "HTTPSPostBackend(batchEvent): backend %s holds more than %zu bytes: dropping its oldest events",
+        backendName.c_str(), bound);
+  } else {
+    VESK_LOG_WARNING(
+        "HTTPSPostBackend(batchEvent): %s holds more than %zu bytes: dropping the oldest events of backend "
+        "%s",
+        account.holder().c_str(), bound, backendName.c_str());
+  }
 }
 
 void EventBatch::setSessionID(const std::optional<Text>& sessionID) {

@@ -1,5 +1,6 @@
 #include "backends/https/HTTPSPostBackend.h"
 
+#include "backends/https/EventRecord.h"
 #include "backends/https/PolicyLog.h"
 #include "platform/log/SystemLog.h"
 #include "storebag/Settings.h"
@@ -10,7 +11,6 @@ namespace vesk {
 namespace {
 
 constexpr std::uint16_t kSessionTypeStop = 1;
-constexpr std::size_t kMostMethods = 65'536;
 
 // The device's facts hold for all sessions alike, so one line a process is enough.
 void noteMissingFamily(const std::string& name) {
@@ -115,11 +115,7 @@ std::optional<std::string> HTTPSPostBackend::sendMessageInTurn(const std::option
   bool requireUserInfo = false;
   {
     MutexLock lock(_mutex);
-    MutableDictionary event = respCode == kSessionTypeStop
-                                  ? createEventDictfromPayload(payloadWithStopEntries(payload), timestamp,
-                                                               method, respCode, eventID)
-                                  : createEventDictfromPayload(payload, timestamp, method, respCode, eventID);
-    prepareEventForMessage(event);
+    MutableDictionary event = eventFor(payload, timestamp, method, respCode, eventID);
     if (isOverridingSampling(flag)) {
       std::int32_t expected = BackendStateOverride;  // a completion may just switch the backend off
       _state.compare_exchange_strong(expected, BackendStateEnabled);
@@ -130,7 +126,8 @@ std::optional<std::string> HTTPSPostBackend::sendMessageInTurn(const std::option
       earlier = batchEvent(std::move(event));
     } else {
       earlier = takeBatchBeforeSingleEvent();
-      own = takeSingleEvent(std::move(event), method, respCode, flag);
+      own = makePost(std::make_unique<EventBatch>(_identity._heldBytes, std::move(event)), flag, method,
+                     respCode);
     }
   }
   if (earlier) buildAndPost(std::move(earlier));
@@ -154,21 +151,23 @@ bool HTTPSPostBackend::mustHold(std::int32_t flag) const {
   return hold;
 }
 
-std::optional<Dictionary> HTTPSPostBackend::payloadWithStopEntries(
-    const std::optional<Dictionary>& payload) const {
-  VESK_LOG_DEBUG(
-      "HTTPSPostBackend(sendMessage): Adding dnu type and sampling threshold to SESSION_TYPE_STOP message "
-      "dictionary");
-  if (!payload) {
-    VESK_LOG_ERROR("HTTPSPostBackend(sendMessage): SESSION_TYPE_STOP message dictionary is nil");
-    return std::nullopt;
-  }
-  MutableDictionary extended(*payload, 4);
-  extended.set(Text::literal("Opt"), _settings._dnuType);
-  extended.set(Text::literal("SamplingThreshold"), samplingThreshold().value_or(Value(-1)));
-  extended.set(Text::literal("OverrideSampling"), _settings._overrideSampling.value_or(Value(-1)));
-  extended.set(Text::literal("Batch"), _settings._batchEvents ? 1 : 0);
-  return extended.share();
+MutableDictionary HTTPSPostBackend::eventFor(const std::optional<Dictionary>& payload,
+                                             const timeval& timestamp, std::uint16_t method,
+                                             std::uint16_t respCode, std::uint16_t eventID) const {
+  const auto whole = respCode == kSessionTypeStop
+                         ? payloadWithStopEntries(payload, _settings, samplingThreshold())
+                         : payload;
+  auto event = createEventDictfromPayload({.payload = whole,
+                                           .timestamp = timestamp,
+                                           .method = method,
+                                           .respCode = respCode,
+                                           .eventID = eventID,
+                                           .identity = _identity,
+                                           .combinedSessionID = _combinedSessionIDString,
+                                           .hasExtrasOnInternal = _settings._extrasOnInternal != 0},
+                                          _userInfoDict ? _userInfoDict->size() : 0);
+  prepareEventForMessage(event, _userInfoDict, _filters);
+  return event;
 }
 
 // --- Batches
@@ -176,19 +175,19 @@ std::optional<Dictionary> HTTPSPostBackend::payloadWithStopEntries(
 HTTPSPostBackend::PostToBuild HTTPSPostBackend::batchEvent(MutableDictionary event) {
   const Value* methodValue = event.find("_method");
   std::int64_t method = methodValue ? methodValue->asInteger().value_or(0) : 0;
-  std::int32_t count = _eventMethodCounts[method];
+  const auto batch = [this]() -> EventBatch& {
+    if (!_batchedEvents) _batchedEvents = std::make_unique<EventBatch>(_identity._heldBytes);
+    return *_batchedEvents;
+  };
   PostToBuild full;
-  if (count > _settings._eventThreshold) {
+  if (batch().passesThreshold(method, _settings._eventThreshold)) {
     VESK_LOG_DEBUG(
         "HTTPSPostBackend(batchEvent): Flushing all batched events as we reached event threshold for method "
         "%d",
         static_cast<int>(method));
     full = takeBatch();
-    count = 0;
   }
-  if (!_batchedEvents) _batchedEvents = std::make_unique<EventBatch>(_identity._heldBytes);
-  _batchedEvents->add(std::move(event));
-  _eventMethodCounts[method] = count + 1;
+  batch().add(std::move(event), method);
   return full;
 }
 
@@ -201,27 +200,13 @@ void HTTPSPostBackend::boundHeldEvents() {
   {
     MutexLock lock(_mutex);
     if (state() == BackendStateEnabled) full = takeBatch();
-    if (_batchedEvents) noteDropped(*_batchedEvents, _batchedEvents->dropOldest());
-    if (_eventMethodCounts.size() > kMostMethods)
-      _eventMethodCounts.clear();  // user info may name any number
+    if (_batchedEvents) countDropped(_batchedEvents->dropOldest(_name));
   }
   if (full) buildAndPost(std::move(full));
 }
 
-void HTTPSPostBackend::noteDropped(EventBatch& batch, const EventBatch::Dropped& dropped) const {
-  if (dropped.count == 0) return;
-  _services.counters.count(_name, DropReason::OverBound, dropped.count);
-  if (!batch.beginsToDrop()) return;
-  if (dropped.account->isOfSession()) {
-    VESK_LOG_WARNING(
-        "HTTPSPostBackend(batchEvent): backend %s holds more than %zu bytes: dropping its oldest events",
-        _name.c_str(), dropped.bound);
-  } else {
-    VESK_LOG_WARNING(
-        "HTTPSPostBackend(batchEvent): %s holds more than %zu bytes: dropping the oldest events of backend "
-        "%s",
-        dropped.account->holder().c_str(), dropped.bound, _name.c_str());
-  }
+void HTTPSPostBackend::countDropped(std::size_t events) const {
+  if (events > 0) _services.counters.count(_name, DropReason::OverBound, events);
 }
 
 std::optional<std::string> HTTPSPostBackend::flushMessagesInTurn() {
@@ -242,7 +227,6 @@ HTTPSPostBackend::PostToBuild HTTPSPostBackend::takeBatch() {
   }
   VESK_LOG_DEBUG("HTTPSPostBackend(flushMessages): called");
   PostToBuild post = makePost(std::move(_batchedEvents), 0, std::nullopt, std::nullopt);
-  _eventMethodCounts.clear();
   if (_userInfoDict) {
     MutableDictionary filtered(*_userInfoDict);
     _filters.filterEvent(filtered);
@@ -259,13 +243,6 @@ HTTPSPostBackend::PostToBuild HTTPSPostBackend::takeBatchBeforeSingleEvent() {
   return takeBatch();
 }
 
-HTTPSPostBackend::PostToBuild HTTPSPostBackend::takeSingleEvent(MutableDictionary event, std::uint16_t method,
-                                                                std::uint16_t respCode, std::int32_t flag) {
-  auto single = std::make_unique<EventBatch>(_identity._heldBytes);
-  single->add(std::move(event));
-  return makePost(std::move(single), flag, method, respCode);
-}
-
 HTTPSPostBackend::PostToBuild HTTPSPostBackend::makePost(std::unique_ptr<EventBatch> events,
                                                          std::int32_t flag,
                                                          std::optional<std::uint16_t> method,
@@ -273,10 +250,71 @@ HTTPSPostBackend::PostToBuild HTTPSPostBackend::makePost(std::unique_ptr<EventBa
   auto post = std::make_unique<Post>();
   post->events = std::move(events);
   post->url = isRealtime(flag) ? _settings._realtimePostURL : _settings._postURL;
-  post->clientID = clientIdentifier();
-  post->headers = postHeaders(method, responseCode);
+  const bool tellsDevice =
+      _settings._extrasOnInternal != 0 && _identity._isInternal && !_identity._udid.empty();
+  post->clientID = tellsDevice               ? _identity._udid
+                   : _settings._dnuType == 0 ? _uuidRespectDnu
+                                             : _uuidOverrideDnu;
+  post->headers = postHeaders(_identity, _userInfoDict, method, responseCode);
   post->isPrintable = _settings._dnuType == 0 && _dnuEnabled;
   return post;
+}
+
+// --- Posting
+
+std::optional<std::string> HTTPSPostBackend::buildAndPost(PostToBuild post) {
+  EventBatch& events = *post->events;
+  std::size_t eventCount = events.size();
+  try {
+    // Events held before the user info arrived get it now.
+    if (post->lateUserInfo) {
+      countDropped(events.addUserInfo(*post->lateUserInfo, _name));
+      eventCount = events.size();
+    }
+    auto body =
+        createMessageForPostAndLogging(events, post->clientID, _services.clock.now(), post->isPrintable);
+    post->events.reset();
+    if (body) {
+      postJSONMessage(std::move(*post), std::move(body->json), eventCount);
+      return std::move(body->printable);
+    }
+  } catch (...) {
+    // No memory for it, and the events are given up already.
+    _services.counters.count(_name, DropReason::BodyNotBuilt, eventCount);
+    throw;
+  }
+  _services.counters.count(_name, DropReason::BodyNotBuilt, eventCount);
+  return std::nullopt;
+}
+
+void HTTPSPostBackend::postJSONMessage(Post post, std::string json, std::size_t eventCount) {
+  if (!post.url) {
+    _services.counters.count(_name, DropReason::NoURL, eventCount);
+    return;
+  }
+  auto request = postRequest(std::move(*post.url), std::move(post.headers), std::move(json), _identity._user);
+  // The completion keeps the backend alive; at a session's end it may be its last holder.
+  auto self = std::static_pointer_cast<HTTPSPostBackend>(shared_from_this());
+  _services.http.start(std::move(request), [self, eventCount](const HTTPResult& result) {
+    self->postCompleted(result, eventCount);
+  });
+}
+
+void HTTPSPostBackend::postCompleted(const HTTPResult& result, std::size_t eventCount) {
+  if (result.error) {
+    VESK_LOG_ERROR("HTTPSPostBackend(postJsonMessage): post error: %s", result.error->description.c_str());
+  }
+  const long status = result.response ? result.response->status : 0;
+  if (status < 500 || status > 599) {
+    if (status >= 200 && status <= 299) return;
+    const auto reason = status == 0 ? DropReason::TransportError : DropReason::ServerRefused;
+    _services.counters.count(_name, reason, eventCount);
+    if (status != 0) _services.refusedPosts->note(_name, status, eventCount);
+    return;
+  }
+  VESK_LOG_INFO("postJSONMessage: backend %s disabled by server %ld return code", _name.c_str(), status);
+  setState(BackendStateDisabled);
+  _services.counters.count(_name, DropReason::ServerError5xx, eventCount);
 }
 
 void HTTPSPostBackend::setCorrelatedSessionIDLocked(const std::optional<Text>& sessionID) {

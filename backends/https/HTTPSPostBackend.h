@@ -4,21 +4,17 @@
 #include <memory>
 #include <optional>
 #include <string>
-#include <string_view>
-#include <unordered_map>
-#include <vector>
 
 #include "backends/VeskReportingBackend.h"
 #include "backends/https/EventBatch.h"
 #include "backends/https/EventFilters.h"
+#include "backends/https/PostBody.h"
 #include "backends/https/PostPolicy.h"
 
 namespace vesk {
 
 /// Turns each message into an event record, filters it, and posts it at once or holds it for a batch, as the
-/// client entry of its profile says. Sources: HTTPSPostBackend.cpp (messages, batches),
-/// HTTPSPostConfiguration.cpp (state and policy from the storebag), HTTPSPostEvent.cpp (event records),
-/// HTTPSPostRequest.cpp (JSON body and post).
+/// client entry of its profile says.
 class HTTPSPostBackend final : public VeskReportingBackend {
  public:
   /// Nothing when profile or product family are missing, or when the profile has no `clients`.
@@ -42,8 +38,6 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   void setCorrelatedSessionIDLocked(const std::optional<Text>& sessionID) override VESK_REQUIRES(_mutex);
 
  private:
-  using Headers = std::vector<std::pair<std::string, std::string>>;
-
   /// Events that were taken to be posted, and all that their post is made of: later changes of the backend
   /// don't concern them.
   struct Post {
@@ -51,7 +45,7 @@ class HTTPSPostBackend final : public VeskReportingBackend {
     std::optional<Dictionary> lateUserInfo;  ///< filtered, not empty; for events from before it was known
     std::optional<std::string> url;
     std::string clientID;
-    Headers headers;
+    PostHeaders headers;
     bool isPrintable = false;  ///< the local message log may get its text
   };
   using PostToBuild = std::unique_ptr<Post>;
@@ -62,36 +56,25 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   std::int32_t updateBackendState() VESK_REQUIRES(_mutex);
 
   // Events.
-  MutableDictionary createEventDictfromPayload(const std::optional<Dictionary>& payload,
-                                               const timeval& timestamp, std::uint16_t method,
-                                               std::uint16_t respCode, std::uint16_t eventID) const
+  MutableDictionary eventFor(const std::optional<Dictionary>& payload, const timeval& timestamp,
+                             std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID) const
       VESK_REQUIRES(_mutex);
-  std::optional<Dictionary> payloadWithStopEntries(const std::optional<Dictionary>& payload) const
-      VESK_REQUIRES(_mutex);
-  void prepareEventForMessage(MutableDictionary& event) const VESK_REQUIRES(_mutex);
   bool mustHold(std::int32_t flag) const VESK_REQUIRES(_mutex);
   bool holdsEvents() const VESK_REQUIRES(_mutex);
   PostToBuild batchEvent(MutableDictionary event) VESK_REQUIRES(_sendMutex, _mutex);
   void boundHeldEvents() VESK_REQUIRES(_sendMutex) VESK_EXCLUDES(_mutex);
-  void noteDropped(EventBatch& batch, const EventBatch::Dropped& dropped) const;
+  void countDropped(std::size_t events) const;
 
   // Taking events out to be posted; null: there are none, or they may not go yet.
   PostToBuild takeBatch() VESK_REQUIRES(_mutex);
   PostToBuild takeBatchBeforeSingleEvent() VESK_REQUIRES(_mutex);
-  PostToBuild takeSingleEvent(MutableDictionary event, std::uint16_t method, std::uint16_t respCode,
-                              std::int32_t flag) VESK_REQUIRES(_sendMutex, _mutex);
   PostToBuild makePost(std::unique_ptr<EventBatch> events, std::int32_t flag,
                        std::optional<std::uint16_t> method, std::optional<std::uint16_t> responseCode) const
       VESK_REQUIRES(_mutex);
 
   // Body and post: without _mutex, since a body may be large.
   std::optional<std::string> buildAndPost(PostToBuild post) VESK_REQUIRES(_sendMutex) VESK_EXCLUDES(_mutex);
-  std::optional<std::string> createMessageForPostAndLogging(
-      Post& post, std::optional<std::string>* prettyJsonString) const;
   void postJSONMessage(Post post, std::string json, std::size_t eventCount);
-  std::string clientIdentifier() const VESK_REQUIRES(_mutex);
-  Headers postHeaders(std::optional<std::uint16_t> method, std::optional<std::uint16_t> responseCode) const
-      VESK_REQUIRES(_mutex);
   void postCompleted(const HTTPResult& result, std::size_t eventCount);
 
   // Constant after construction.
@@ -104,7 +87,6 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   PostPolicy::Settings _settings VESK_GUARDED_BY(_mutex);
   std::unique_ptr<EventBatch> _batchedEvents VESK_GUARDED_BY(_mutex);
   EventFilters _filters VESK_GUARDED_BY(_mutex);
-  std::unordered_map<std::int64_t, std::int32_t> _eventMethodCounts VESK_GUARDED_BY(_mutex);
 };
 
 }  // namespace vesk
