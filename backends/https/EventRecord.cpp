@@ -7,7 +7,7 @@
 #include "backends/https/SenderCodes.h"
 #include "platform/device/DeviceInformation.h"
 #include "platform/log/SystemLog.h"
-#include "storebag/StorebagNaming.h"
+#include "storebag/Settings.h"
 #include "util/ReportingdUtil.h"
 #include "values/Conversions.h"
 
