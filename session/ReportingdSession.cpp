@@ -7,6 +7,7 @@
 #include "platform/crypto/Base64.h"
 #include "platform/crypto/UUID.h"
 #include "platform/log/SystemLog.h"
+#include "session/ReportingStates.h"
 #include "util/ReportingdUtil.h"
 
 namespace vesk {
@@ -23,20 +24,15 @@ std::uint32_t sessionIDIn(const Dictionary& sessionInfo) {
       integerForKey(sessionInfo, kVeskReportingSessionInfoSessionID).value_or(0));
 }
 
-// The batch has been posted already. If its answer were too large to send, the client would send the messages
-// again.
-std::optional<std::string> fittingAnswer(std::optional<std::string> answer) {
-  if (!answer || answer->size() <= kMaxAnswerBytes) return answer;
-  const std::string notice = "\n[cut: this answer has " + std::to_string(answer->size()) + " bytes]";
-  std::size_t end = kMaxAnswerBytes - notice.size();
-  while (end > 0 && (static_cast<unsigned char>((*answer)[end]) & 0xC0) == 0x80) --end;
-  answer->resize(end);
-  *answer += notice;
-  return answer;
-}
-
 bool requiresUserInfo(const Dictionary& sessionInfo) {
   return booleanForKey(sessionInfo, kVeskReportingSessionInfoRequireUserInfo).value_or(false);
+}
+
+// Both present as texts and the same.
+bool sameText(const std::optional<Dictionary>& a, const std::optional<Dictionary>& b, const char* key) {
+  auto first = a ? a->text(key) : std::nullopt;
+  auto second = b ? b->text(key) : std::nullopt;
+  return first && second && *first == *second;
 }
 
 }  // namespace
@@ -48,6 +44,7 @@ ReportingdSession::ReportingdSession(std::shared_ptr<ReportingdSessionDelegate> 
       _connection(std::move(connection)),
       _services(services),
       _sessionIDString(freshIdentity()),
+      _aggregator(_connection, services.backends.counters),
       _correlationKey(keyFor(std::nullopt)) {
   VESK_LOG_DEBUG("initWithSessionDelegate: ReportingdSession initWithSessionDelegate:%s",
                  _sessionDelegate->description().c_str());
@@ -58,7 +55,8 @@ ReportingdSession::ReportingdSession(std::shared_ptr<ReportingdSessionDelegate> 
 ReportingdSession::~ReportingdSession() {
   VESK_LOG_DEBUG("dealloc: ReportingdSession dealloc: %u", sessionID());
   _isEnding = true;
-  // If one step runs out of memory, the process goes on and the other steps are still tried.
+  _aggregator.end();
+  // Without memory, one step's failure must neither end the process nor keep the others from being tried.
   auto attempt = [](auto step) {
     try {
       step();
@@ -138,7 +136,7 @@ void ReportingdSession::setSessionInfo(const Dictionary& sessionInfo,
   _frameworks = frameworksToCheck;
   _userInfo = userInfo;
   _correlationKey = std::move(key);
-  _hasAggregator = hasAggregationBlock;
+  _aggregator.setOn(hasAggregationBlock);
 }
 
 void ReportingdSession::startConfigWithCompletionHandler(Reply<std::optional<BackendNames>> reply) {
@@ -204,7 +202,14 @@ void ReportingdSession::flushMessagesWithReply(Reply<std::optional<std::string>>
 void ReportingdSession::uploadFileAtPath(const std::string& fileURL, const std::string& extensionToken,
                                          Reply<bool> completionHandler) {
   VESK_LOG_DEBUG("uploadFileAtPath: Uploading file for session %u", sessionID());
-  uploadFileWithURL(fileURL, extensionToken, std::move(completionHandler));
+  completionHandler(
+      uploadFileWithURL(backends().get(), fileURL, extensionToken, _services.backends.counters));
+}
+
+void ReportingdSession::uploadLogData(const List& logData,
+                                      Reply<bool, std::optional<std::string>> completionHandler) {
+  completionHandler(vesk::uploadLogData(backends().get(), logData, _services.backends.counters),
+                    std::nullopt);
 }
 
 void ReportingdSession::sendMessageWithSessionInfo(const Dictionary& sessionInfo,
@@ -231,9 +236,180 @@ void ReportingdSession::sendMessageWithSessionInfo(const Dictionary& sessionInfo
     reply("storebag not available");
     return;
   }
-  sendSingleMessage(_services, _connection->peer().user, sessionInfo, userInfo, storebag, category, type,
-                    payload);
+  vesk::sendMessageWithSessionInfo(_services, _connection->peer().user, sessionInfo, userInfo, storebag,
+                                   category, type, payload);
   reply("finished");
+}
+
+// --- Messages
+
+std::optional<std::string> ReportingdSession::sendMessageWithCategory(
+    std::uint16_t category, std::uint16_t type, const std::optional<Dictionary>& payload) {
+  MutableDictionary parameters;
+  parameters.reserve(4);
+  parameters.append(Text::literal(kVeskReportingMessageParametersCategory), static_cast<unsigned>(category));
+  parameters.append(Text::literal(kVeskReportingMessageParametersType), static_cast<unsigned>(type));
+  if (payload) parameters.append(Text::literal(kVeskReportingMessageParametersPayload), *payload);
+  parameters.append(Text::literal(kVeskReportingMessageParametersFlag), 0);
+  return sendMessageWithDictionary(parameters.share());
+}
+
+std::optional<std::string> ReportingdSession::sendMessageWithDictionary(const Dictionary& parameters) {
+  auto set = backends();
+  if (!set) {
+    VESK_LOG_DEBUG("sendMessageWithDictionary: No backends available to send message");
+    // The session's own last message has no news for a session that never had a backend.
+    if (!_isEnding) _services.backends.counters.count("session", DropReason::NoBackend);
+    return std::nullopt;
+  }
+  const auto message = messageFrom(parameters);
+  if (!message) {
+    _services.backends.counters.count("session", DropReason::InvalidMessage);
+    return std::nullopt;
+  }
+  const timeval now = timevalFrom(_services.backends.clock.now());
+  aggregateMessage(secondsFromTimeval(now), *message);
+  return dispatchMessage(*set, *message, now);
+}
+
+void ReportingdSession::aggregateMessage(double timestamp, const MessageParameters& message) {
+  const auto info = sessionInfo();
+  // A message at the top of its family does not wait for the monitor, which is held across a storebag's
+  // fetch.
+  if (_sessionDelegate->mayHaveAncestor(*this)) {
+    // Declared outside the lock's scope: the last holder of a session destroys it, and must not do so under
+    // the lock.
+    std::shared_ptr<ReportingdSession> ancestor;
+    RecursiveMutexLock monitor(_sessionDelegate->monitor());
+    ancestor = _sessionDelegate->getAncestorWithAggregatorForSession(*this);
+    if (ancestor) {
+      ancestor->_aggregator.sendToAggregator(info, timestamp, message.category, message.type,
+                                             message.payload);
+      return;
+    }
+  }
+  if (hasAggregator()) {
+    _aggregator.sendToAggregator(info, timestamp, message.category, message.type, message.payload);
+  }
+}
+
+void ReportingdSession::internalSendMessage(const Dictionary& payload, std::uint16_t method,
+                                            std::uint16_t respCode) {
+  sendMessageWithCategory(method, respCode, payload);
+  VESK_LOG_DEBUG("internalSendMessage: Sent internal message (method:%d respCode:%d)", method, respCode);
+}
+
+std::optional<std::string> ReportingdSession::flushMessages() {
+  auto set = backends();
+  if (!set) {
+    VESK_LOG_DEBUG("flushMessages: No backends available to send message");
+    return std::nullopt;
+  }
+  return flushBackends(*set);
+}
+
+// --- Configuration
+
+void ReportingdSession::createBackendsWithStorebag(const std::optional<Dictionary>& storebag) {
+  VESK_LOG_DEBUG("createBackendsWithStorebag: Creating backends for session %u", sessionID());
+  auto created = createBackends(storebag, sessionInfo(), userInfo(), _deviceid.data(),
+                                _services.libraryVersion, _connection->peer().user, _services.backends);
+  SharedBackends next;
+  if (created) {
+    for (const auto& [name, backend] : *created) backend->setCombinedSessionIDString(_sessionIDString);
+    next = std::make_shared<const BackendSet>(std::move(*created));
+  }
+  SharedBackends previous;
+  {
+    MutexLock lock(_mutex);
+    previous = std::exchange(_backends, std::move(next));
+  }
+  // A second start: what the first one's backends hold is sent where it may be, then they end.
+  if (previous) {
+    flushBackends(*previous);
+    cleanupBackends(*previous);
+  }
+  internalSendMessage(deviceDictionary(_services.libraryVersion, _services.backends.regionCode()), 0, 0);
+}
+
+void ReportingdSession::updateSessionWithDefaultSessionInfo() {
+  // Until the states are decided its level is not: no relative may find it in its family before that.
+  RecursiveMutexLock monitor(_sessionDelegate->monitor());
+  _sessionDelegate->userInfoUpdatedForSession(*this);
+  if (auto set = backends()) updateReportingStates(*set, userInfo());
+  _sessionDelegate->updateDownstreamSessions(*this);
+}
+
+std::shared_ptr<const std::string> ReportingdSession::keyFor(const std::optional<Dictionary>& userInfo) {
+  return std::make_shared<const std::string>(correlationKeyForUserInfo(userInfo.value_or(Dictionary())));
+}
+
+void ReportingdSession::receivedUserInfo(const std::optional<Dictionary>& userInfo) {
+  auto stored = this->userInfo();
+  if (stored) {
+    if (sameText(userInfo, stored, kVeskReportingUserInfoClientName) &&
+        sameText(userInfo, stored, kVeskReportingUserInfoServiceName)) {
+      return;
+    }
+  } else if (!userInfo) {
+    return;
+  }
+  VESK_LOG_DEBUG("receivedUserInfo: Received new user info for session %u", sessionID());
+  {
+    auto key = keyFor(userInfo);
+    MutexLock lock(_mutex);
+    _userInfo = userInfo;
+    _correlationKey = std::move(key);
+  }
+  updateSessionWithDefaultSessionInfo();
+}
+
+// --- Relatives
+
+std::int32_t ReportingdSession::getSessionHierarchy() const {
+  auto set = backends();
+  auto backend = set ? findBackend(*set, kVeskReportingBackendHTTPPost) : nullptr;
+  return backend ? backend->hierarchy() : 0;
+}
+
+void ReportingdSession::updateCombinedSessionID() {
+  auto parentID = _sessionDelegate->parentSessionIDStringForSession(*this);
+  if (!parentID) return;
+  std::string combined = *parentID + "." + _sessionIDString;
+  VESK_LOG_DEBUG("updateCombinedSessionID: Updating combined session ID '%s' for session %u backends",
+                 combined.c_str(), sessionID());
+  auto set = backends();
+  if (!set) return;
+  for (const auto& [name, backend] : *set) backend->setCorrelatedSessionID(combined);
+}
+
+void ReportingdSession::syncReportingStates() {
+  RecursiveMutexLock monitor(_sessionDelegate->monitor());
+  const auto parent = _sessionDelegate->parentSessionForChild(*this);
+  const auto set = backends();
+  if (!set) return;
+  if (parent) {
+    vesk::syncReportingStates(*set, parent->backends().get());
+  } else {
+    noteMissingParent(*set, sessionID());
+  }
+}
+
+void ReportingdSession::shutdownSessionAggregation() {
+  VESK_LOG_DEBUG("shutdownSessionAggregation: Disable aggregation module for session %u", sessionID());
+  _aggregator.shutdown();
+}
+
+std::optional<BackendNames> ReportingdSession::fetchReportingStates() const {
+  const auto set = backends();
+  if (!set) return std::nullopt;
+  return vesk::fetchReportingStates(*set);
+}
+
+std::optional<Value> ReportingdSession::samplingThresholdWithBackendName(const std::string& name) const {
+  const auto set = backends();
+  const auto backend = set ? findBackend(*set, name) : nullptr;
+  return backend ? backend->samplingThreshold() : std::nullopt;
 }
 
 }  // namespace vesk

@@ -11,23 +11,18 @@
 #include <optional>
 #include <string>
 
-#include "backends/BackendServices.h"
 #include "platform/ipc/IPCConnection.h"
-#include "platform/ipc/WarningBurst.h"
 #include "platform/sync/Mutex.h"
 #include "protocol/ClientSessionInterface.h"
 #include "session/BackendSet.h"
+#include "session/Dispatch.h"
 #include "session/ReportingdSessionDelegate.h"
+#include "session/SessionAggregator.h"
+#include "session/SessionServices.h"
 
 namespace vesk {
 
-/// Shared by all sessions of the process; outlives them.
-struct SessionServices {
-  BackendServices& backends;
-  std::string libraryVersion;  ///< of the client library, "7.0" if it declares none
-};
-
-/// Configures the client's backends, passes each message to all of them, and picks the answer.
+/// Configures the client's backends, hands each message to all of them, and picks the answer.
 ///
 /// The operations of ClientSessionInterface run on the connection's thread. The agent calls the members
 /// marked "Family" from other connections' threads, usually while holding its monitor. All fields used by
@@ -66,14 +61,6 @@ class ReportingdSession final : public ClientSessionInterface,
                                   const std::optional<Dictionary>& payload,
                                   Reply<std::string> reply) override;
 
-  /// Sends one message through newly created backends, as `sendMessageWithSessionInfo` does with its
-  /// storebag.
-  static void sendSingleMessage(const SessionServices& services, uid_t user,
-                                const std::optional<Dictionary>& sessionInfo,
-                                const std::optional<Dictionary>& userInfo,
-                                const std::optional<Dictionary>& storebag, std::uint16_t category,
-                                std::uint16_t type, const std::optional<Dictionary>& payload);
-
   // --- Identity
   /// The session's number, chosen by the client; 0 until configured.
   std::uint32_t sessionID() const;
@@ -89,18 +76,13 @@ class ReportingdSession final : public ClientSessionInterface,
   // --- Family
   /// The level in the family; 0 is the top.
   std::int32_t getSessionHierarchy() const;
-  bool hasAggregator() const noexcept { return _hasAggregator.load(); }
+  bool hasAggregator() const noexcept { return _aggregator.isOn(); }
   void updateCombinedSessionID() VESK_EXCLUDES(_mutex);
   void syncReportingStates() VESK_EXCLUDES(_mutex);
   void shutdownSessionAggregation() VESK_EXCLUDES(_mutex);
   /// The names of the enabled backends; nullopt before the first start.
   std::optional<BackendNames> fetchReportingStates() const;
   std::optional<Value> samplingThresholdWithBackendName(const std::string& name) const;
-  /// Sends one message to this session's own client without blocking. A message that the client does not take
-  /// is dropped, counted, and logged once per burst, so that a client that does not read never delays the
-  /// sender.
-  void sendToAggregator(const std::optional<Dictionary>& sessionInfo, double timestamp,
-                        std::uint16_t category, std::uint16_t type, const std::optional<Dictionary>& payload);
 
  private:
   using SharedBackends = std::shared_ptr<const BackendSet>;
@@ -108,9 +90,7 @@ class ReportingdSession final : public ClientSessionInterface,
   // Configuration.
   void createBackendsWithStorebag(const std::optional<Dictionary>& storebag);
   void updateSessionWithDefaultSessionInfo() VESK_EXCLUDES(_mutex);
-  void updateReportingStates() VESK_EXCLUDES(_mutex);
   void receivedUserInfo(const std::optional<Dictionary>& userInfo) VESK_EXCLUDES(_mutex);
-  static void cleanupBackends(const BackendSet& backends);
   SharedBackends backends() const;
   std::string displayURLText() const;
 
@@ -118,21 +98,12 @@ class ReportingdSession final : public ClientSessionInterface,
   std::optional<std::string> sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                                      const std::optional<Dictionary>& payload);
   std::optional<std::string> sendMessageWithDictionary(const Dictionary& parameters);
-  std::optional<std::string> dispatchMessage(const BackendSet& backends, std::uint16_t category,
-                                             std::uint16_t type, const std::optional<Dictionary>& payload,
-                                             std::uint32_t flag);
   void internalSendMessage(const Dictionary& payload, std::uint16_t method, std::uint16_t respCode);
   std::optional<std::string> flushMessages();
-  static std::optional<std::string> flushBackends(const BackendSet& backends);
-  void uploadFileWithURL(const std::string& fileURL, const std::string& extensionToken,
-                         Reply<bool> completionHandler);
 
   // Family.
   static std::shared_ptr<const std::string> keyFor(const std::optional<Dictionary>& userInfo);
-  bool undeliveredBurstBegins();
-  void aggregateMessage(const std::optional<Dictionary>& sessionInfo, double timestamp,
-                        std::uint16_t category, std::uint16_t type, const std::optional<Dictionary>& payload)
-      VESK_EXCLUDES(_mutex);
+  void aggregateMessage(double timestamp, const MessageParameters& message) VESK_EXCLUDES(_mutex);
 
   // Constant after construction.
   const std::shared_ptr<ReportingdSessionDelegate> _sessionDelegate;
@@ -143,8 +114,8 @@ class ReportingdSession final : public ClientSessionInterface,
 
   bool _isEnding = false;  // set by the destructor; used only on its thread
 
-  // Read for every message of the session; written from other sessions of the family.
-  std::atomic<bool> _hasAggregator{false};
+  // Synchronised by itself.
+  SessionAggregator _aggregator;
 
   // Guarded by _mutex.
   mutable Mutex _mutex;
@@ -155,7 +126,6 @@ class ReportingdSession final : public ClientSessionInterface,
   List _frameworks VESK_GUARDED_BY(_mutex);  // kept for the session's lifetime; not used
   SharedBackends _backends VESK_GUARDED_BY(_mutex);
   std::optional<std::string> _storebagVersion VESK_GUARDED_BY(_mutex);
-  WarningBurst _undelivered VESK_GUARDED_BY(_mutex);  // of messages to this session's client
 };
 
 }  // namespace vesk

@@ -112,7 +112,6 @@ std::optional<std::string> HTTPSPostBackend::sendMessageInTurn(const std::option
   PostToBuild earlier;
   PostToBuild own;
   bool batchEvents = false;
-  bool requireUserInfo = false;
   {
     MutexLock lock(_mutex);
     MutableDictionary event = eventFor(payload, timestamp, method, respCode, eventID);
@@ -121,7 +120,6 @@ std::optional<std::string> HTTPSPostBackend::sendMessageInTurn(const std::option
       _state.compare_exchange_strong(expected, BackendStateEnabled);
     }
     batchEvents = _settings._batchEvents;
-    requireUserInfo = _identity._requireUserInfo;
     if (mustHold(flag)) {
       earlier = batchEvent(std::move(event));
     } else {
@@ -135,7 +133,8 @@ std::optional<std::string> HTTPSPostBackend::sendMessageInTurn(const std::option
     boundHeldEvents();
     return std::nullopt;
   }
-  VESK_LOG_DEBUG("HTTPSPostBackend(sendMessage): Sending %d, %d, %d", state(), batchEvents, requireUserInfo);
+  VESK_LOG_DEBUG("HTTPSPostBackend(sendMessage): Sending %d, %d, %d", state(), batchEvents,
+                 _identity._requireUserInfo);
   return buildAndPost(std::move(own));
 }
 

@@ -1,12 +1,14 @@
-// Dispatches a session's messages to its backends.
+#include "session/Dispatch.h"
+
 #include <VeskReporting/VeskReportingKeys.h>
 
+#include <array>
 #include <climits>
 
 #include "platform/files/FileURL.h"
 #include "platform/log/SystemLog.h"
 #include "platform/unicode/UTF8.h"
-#include "session/ReportingdSession.h"
+#include "protocol/ClientSessionInterface.h"
 #include "util/MessageLog.h"
 #include "util/ReportingdUtil.h"
 #include "util/URLQuery.h"
@@ -41,73 +43,37 @@ std::optional<std::uint32_t> unsignedForKey(const Dictionary& parameters, const 
 
 }  // namespace
 
-std::optional<std::string> ReportingdSession::sendMessageWithCategory(
-    std::uint16_t category, std::uint16_t type, const std::optional<Dictionary>& payload) {
-  MutableDictionary parameters;
-  parameters.reserve(4);
-  parameters.append(Text::literal(kVeskReportingMessageParametersCategory), static_cast<unsigned>(category));
-  parameters.append(Text::literal(kVeskReportingMessageParametersType), static_cast<unsigned>(type));
-  if (payload) parameters.append(Text::literal(kVeskReportingMessageParametersPayload), *payload);
-  parameters.append(Text::literal(kVeskReportingMessageParametersFlag), 0);
-  return sendMessageWithDictionary(parameters.share());
-}
-
-std::optional<std::string> ReportingdSession::sendMessageWithDictionary(const Dictionary& parameters) {
-  auto set = backends();
-  if (!set) {
-    VESK_LOG_DEBUG("sendMessageWithDictionary: No backends available to send message");
-    // The session's own closing message is not counted if it never had a backend.
-    if (!_isEnding) _services.backends.counters.count("session", DropReason::NoBackend);
-    return std::nullopt;
-  }
-  auto category = unsignedForKey(parameters, kVeskReportingMessageParametersCategory);
+std::optional<MessageParameters> messageFrom(const Dictionary& parameters) {
+  const auto category = unsignedForKey(parameters, kVeskReportingMessageParametersCategory);
   if (!category) {
     VESK_LOG_DEBUG("sendMessageWithDictionary: Missing mandatory parameter 'category'");
-    _services.backends.counters.count("session", DropReason::InvalidMessage);
     return std::nullopt;
   }
-  auto type = unsignedForKey(parameters, kVeskReportingMessageParametersType);
+  const auto type = unsignedForKey(parameters, kVeskReportingMessageParametersType);
   if (!type) {
     VESK_LOG_DEBUG("sendMessageWithDictionary: Missing mandatory parameter 'type'");
-    _services.backends.counters.count("session", DropReason::InvalidMessage);
     return std::nullopt;
   }
-  return dispatchMessage(*set, static_cast<std::uint16_t>(*category), static_cast<std::uint16_t>(*type),
-                         parameters.dictionary(kVeskReportingMessageParametersPayload),
-                         unsignedForKey(parameters, kVeskReportingMessageParametersFlag).value_or(0));
+  const auto flag = unsignedForKey(parameters, kVeskReportingMessageParametersFlag).value_or(0);
+  return MessageParameters{.category = static_cast<std::uint16_t>(*category),
+                           .type = static_cast<std::uint16_t>(*type),
+                           .payload = parameters.dictionary(kVeskReportingMessageParametersPayload),
+                           .flag = static_cast<std::int32_t>(flag)};
 }
 
-std::optional<std::string> ReportingdSession::dispatchMessage(const BackendSet& backends,
-                                                              std::uint16_t category, std::uint16_t type,
-                                                              const std::optional<Dictionary>& payload,
-                                                              std::uint32_t flag) {
-  timeval now = timevalFrom(_services.backends.clock.now());
-  aggregateMessage(sessionInfo(), secondsFromTimeval(now), category, type, payload);
+std::optional<std::string> dispatchMessage(const BackendSet& backends, const MessageParameters& message,
+                                           const timeval& timestamp) {
   AnswerChoice answers;
   for (const auto& [name, backend] : backends) {
-    auto answer = backend->sendMessage(payload, now, category, type, static_cast<std::int32_t>(flag));
+    auto answer =
+        backend->sendMessage(message.payload, timestamp, message.category, message.type, message.flag);
     if (answer) writeToLogFile("[%@ -> sendMessageWithDictionary] %@", name, *answer);
     answers.offer(name, answer);
   }
   return std::move(answers).chosen();
 }
 
-void ReportingdSession::internalSendMessage(const Dictionary& payload, std::uint16_t method,
-                                            std::uint16_t respCode) {
-  sendMessageWithCategory(method, respCode, payload);
-  VESK_LOG_DEBUG("internalSendMessage: Sent internal message (method:%d respCode:%d)", method, respCode);
-}
-
-std::optional<std::string> ReportingdSession::flushMessages() {
-  auto set = backends();
-  if (!set) {
-    VESK_LOG_DEBUG("flushMessages: No backends available to send message");
-    return std::nullopt;
-  }
-  return flushBackends(*set);
-}
-
-std::optional<std::string> ReportingdSession::flushBackends(const BackendSet& backends) {
+std::optional<std::string> flushBackends(const BackendSet& backends) {
   AnswerChoice answers;
   for (const auto& [name, backend] : backends) {
     auto answer = backend->flushMessages();
@@ -117,8 +83,24 @@ std::optional<std::string> ReportingdSession::flushBackends(const BackendSet& ba
   return std::move(answers).chosen();
 }
 
-void ReportingdSession::uploadFileWithURL(const std::string& fileURL, const std::string& extensionToken,
-                                          Reply<bool> completionHandler) {
+// The messages of the batch are posted by now: an answer that can't be sent would make the client send them
+// again.
+std::optional<std::string> fittingAnswer(std::optional<std::string> answer) {
+  if (!answer || answer->size() <= kMaxAnswerBytes) return answer;
+  const std::string notice = "\n[cut: this answer has " + std::to_string(answer->size()) + " bytes]";
+  std::size_t end = kMaxAnswerBytes - notice.size();
+  while (end > 0 && (static_cast<unsigned char>((*answer)[end]) & 0xC0) == 0x80) --end;
+  answer->resize(end);
+  *answer += notice;
+  return answer;
+}
+
+void cleanupBackends(const BackendSet& backends) {
+  for (const auto& [name, backend] : backends) backend->cleanup();
+}
+
+bool uploadFileWithURL(const BackendSet* backends, const std::string& fileURL,
+                       const std::string& extensionToken, Counters& counters) {
   std::string path = pathFromFileURL(fileURL);
   std::string url = fileURL;
   bool succeeded = false;
@@ -126,8 +108,8 @@ void ReportingdSession::uploadFileWithURL(const std::string& fileURL, const std:
     // A client must not fill the log with a file name.
     path = cutToWholeCharacters(path, kShownOfTooLong);
     url = cutToWholeCharacters(url, kShownOfTooLong);
-  } else if (auto set = backends()) {
-    for (const auto& [name, backend] : *set) {
+  } else if (backends) {
+    for (const auto& [name, backend] : *backends) {
       if (backend->uploadFileAtPath(path, extensionToken)) succeeded = true;
     }
   }
@@ -135,19 +117,18 @@ void ReportingdSession::uploadFileWithURL(const std::string& fileURL, const std:
     VESK_LOG_DEBUG("uploadFileWithURL: File upload successful for %s", path.c_str());
   } else {
     VESK_LOG_ERROR("uploadFileWithURL: File upload failed for %s", path.c_str());
-    _services.backends.counters.count("session", DropReason::UploadFailed);
+    counters.count("session", DropReason::UploadFailed);
   }
   writeToLogFile("[uploadFileWithURL] Upload %@ for file %@", succeeded ? "succeeded" : "failed",
                  encodedForURL(url));
-  completionHandler(succeeded);
+  return succeeded;
 }
 
-void ReportingdSession::uploadLogData(const List& logData,
-                                      Reply<bool, std::optional<std::string>> completionHandler) {
+bool uploadLogData(const BackendSet* backends, const List& logData, Counters& counters) {
   VESK_LOG_DEBUG("uploadLogData: Uploading log data array: %s", describe(logData).c_str());
   bool succeeded = false;
-  if (auto set = backends()) {
-    for (const auto& [name, backend] : *set) {
+  if (backends) {
+    for (const auto& [name, backend] : *backends) {
       if (backend->uploadLogData(logData)) succeeded = true;
     }
   }
@@ -155,16 +136,16 @@ void ReportingdSession::uploadLogData(const List& logData,
     VESK_LOG_DEBUG("uploadLogData: Log data array upload successful");
   } else {
     VESK_LOG_ERROR("uploadLogData: Log data array upload failed");
-    _services.backends.counters.count("session", DropReason::UploadFailed);
+    counters.count("session", DropReason::UploadFailed);
   }
-  completionHandler(succeeded, std::nullopt);
+  return succeeded;
 }
 
-void ReportingdSession::sendSingleMessage(const SessionServices& services, uid_t user,
-                                          const std::optional<Dictionary>& sessionInfo,
-                                          const std::optional<Dictionary>& userInfo,
-                                          const std::optional<Dictionary>& storebag, std::uint16_t category,
-                                          std::uint16_t type, const std::optional<Dictionary>& payload) {
+void sendMessageWithSessionInfo(const SessionServices& services, uid_t user,
+                                const std::optional<Dictionary>& sessionInfo,
+                                const std::optional<Dictionary>& userInfo,
+                                const std::optional<Dictionary>& storebag, std::uint16_t category,
+                                std::uint16_t type, const std::optional<Dictionary>& payload) {
   const Dictionary info = sessionInfo.value_or(Dictionary());
   VESK_LOG_DEBUG("sendMessageWithSessionInfo: Sending single message with sessionID %ld",
                  static_cast<long>(integerForKey(info, kVeskReportingSessionInfoSessionID).value_or(0)));

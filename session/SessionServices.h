@@ -1,0 +1,16 @@
+// What all sessions of the process share.
+#pragma once
+
+#include <string>
+
+#include "backends/BackendServices.h"
+
+namespace vesk {
+
+/// Outlives the sessions.
+struct SessionServices {
+  BackendServices& backends;
+  std::string libraryVersion;  ///< of the client library, "7.0" when it declares none
+};
+
+}  // namespace vesk
