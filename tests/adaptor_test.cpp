@@ -1,4 +1,4 @@
-// The adaptor backend with adaptors that are really loaded: the example's, and such as are of no use.
+// The adaptor backend with adaptors that are really loaded: the example and faulty ones.
 #include <VeskReporting/WrenAdaptor.h>
 #include <fcntl.h>
 #include <gtest/gtest.h>
@@ -85,8 +85,8 @@ TEST_F(AdaptorTest, WhatIsOfNoUseCostsALineForEachMessage) {
   const std::string failed = "WrenBackend(sendMessage): Wren adaptor Bad failed: ";
   const std::string init = "WrenBackend(initWithName): ";
   const std::string none = missing("(null)");
-  // The library, the line when it is loaded ("@": its path), the line for a message and that for one of
-  // type 1.
+  // The library, the line logged when it is loaded ("@": its path), the line for a message, and the line for
+  // a message of type 1.
   using Case = std::tuple<const char*, int, std::string, std::string, std::string>;
   const Case cases[] = {
       {nullptr, 7, "@: cannot open shared object file: No such file or directory", none, none},
@@ -101,7 +101,7 @@ TEST_F(AdaptorTest, WhatIsOfNoUseCostsALineForEachMessage) {
   std::uint64_t number = 0;
   for (auto [library, level, line, sent, sentWithType1] : cases) {
     SCOPED_TRACE(library ? library : "none");
-    // A path of its own: a library that was loaded once stays.
+    // Each case uses its own path, since a library stays loaded.
     const fs::path root = directory / std::to_string(++number);
     fs::create_directories(root);
     setRootPrefix(root.string());
@@ -144,7 +144,7 @@ TEST_F(AdaptorTest, OneThatHangsHoldsUpNothingButMessages) {
   ASSERT_EQ(::mkfifo(pipe.c_str(), 0600), 0);
   auto backend = make();
   auto sent = std::async(std::launch::async, [&] { send(*backend, Dictionary()); });
-  FileDescriptor end(::open(pipe.c_str(), O_WRONLY));  // waits until the adaptor is at work
+  FileDescriptor end(::open(pipe.c_str(), O_WRONLY));  // waits until the adaptor runs
   auto set = std::async(std::launch::async, [&] { backend->setCorrelatedSessionID("combined"); });
   EXPECT_EQ(set.wait_for(std::chrono::seconds(30)), std::future_status::ready);
   end.reset();

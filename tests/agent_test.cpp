@@ -16,7 +16,7 @@ using Lines = std::vector<std::pair<int, std::string>>;
 const Dictionary kFirst{{"wren", Dictionary{{"is", "first"}}}};
 const Dictionary kSecond{{"wren", Dictionary{{"is", "second"}}}};
 
-/// What a fetch returns.
+/// The result of a fetch.
 struct Outcome {
   std::optional<Dictionary> section{};
   std::int32_t maxAge = 0;
@@ -69,7 +69,7 @@ TEST_F(AgentStorebags, FetchesByAgeAndWaitsAfterFailures) {
       {899.9, {kFirst, 600}, Does::Wait, {}, {}},
       {900, {kFirst, 600, "1"}, Does::Fetch, kFirst, "1"},
       {1499.9, failure, Does::ServeCached, kFirst, "1"},
-      {1500, {kSecond, 600}, Does::Fetch, kSecond, {}},  // its version went away
+      {1500, {kSecond, 600}, Does::Fetch, kSecond, {}},  // its version disappeared
       {2100, {{}, 40, "3"}, Does::FetchInVain, kSecond, {}},
       {2999.9, {kFirst, 9}, Does::Wait, kSecond, {}},
       {3000, {{}, 60, "4", true}, Does::Fetch, kSecond, {}},
@@ -135,7 +135,8 @@ TEST_F(AgentStorebags, KeepsOneRecordAStorebag) {
 
 TEST_F(AgentStorebags, AsksForWhatIsNewerThanItsLastAnswer) {
   auto session = newSession();
-  // Even when that could not be verified: then there is nothing to serve until its age is over.
+  // The date is kept even if the storebag could not be verified. There is nothing to serve until its age is
+  // over.
   next.lastModified = "Mon";
   EXPECT_FALSE(agent->storebagForSession(*session));
   EXPECT_EQ(previous, std::nullopt);
@@ -149,7 +150,7 @@ TEST_F(AgentStorebags, AsksForWhatIsNewerThanItsLastAnswer) {
   harness.clock.advance(1s);
   next = {kFirst, 0, {}, false, "Tue"};
   EXPECT_EQ(agent->storebagForSession(*session), kFirst);
-  next = {};  // an answer that names no time
+  next = {};  // an answer without a date
   EXPECT_EQ(agent->storebagForSession(*session), kFirst);
   EXPECT_EQ(previous, "Tue");
   harness.clock.advance(900s);

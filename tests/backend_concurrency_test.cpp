@@ -1,4 +1,4 @@
-// What may go on at one backend while it builds a large body, and what waits for its turn.
+// Which operations of a backend may proceed while it builds a large body, and which wait.
 #include <gtest/gtest.h>
 
 #include <future>
@@ -11,7 +11,7 @@
 namespace vesk::test {
 namespace {
 
-/// Holds the first body that is built, at the reading of its time, until it is opened.
+/// Blocks the first body under construction, when it reads the time, until the gate is opened.
 class GatedClock final : public WallClock {
  public:
   WallTime now() const override {
@@ -32,7 +32,7 @@ class GatedClock final : public WallClock {
 
 class BackendConcurrency : public ::testing::Test {
  protected:
-  /// One that batches; `flag` 1 posts a message at once.
+  /// Creates a backend that batches; `flag` 1 posts a message at once.
   BackendConcurrency() {
     backend = newBackendWithName(kVeskReportingBackendHTTPPost,
                                  Dictionary{{"clients", List{Dictionary{{"post_url", harness.url()},
@@ -48,7 +48,7 @@ class BackendConcurrency : public ::testing::Test {
   void send(int number, std::int32_t flag = 0) {
     backend->sendMessage(Dictionary{{"n", number}}, timeval{}, 3, 2, flag);
   }
-  /// Runs it on another thread until it is inside the gate.
+  /// Runs the operation on another thread until it is blocked by the gate.
   template <class Operation>
   std::future<void> startHeld(Operation operation) {
     auto running = std::async(std::launch::async, operation);
@@ -70,7 +70,7 @@ class BackendConcurrency : public ::testing::Test {
 
 TEST_F(BackendConcurrency, RelativesDoNotWaitForABody) {
   for (int i = 0; i < 50; ++i) send(i);
-  auto sending = startHeld([&] { send(50); });  // one more than a batch takes
+  auto sending = startHeld([&] { send(50); });  // one more than a batch holds
   auto relatives = std::async(std::launch::async, [&] {
     EXPECT_EQ(backend->samplingThreshold()->asInteger(), 1);
     backend->setSamplingThreshold(Value(0.5));

@@ -16,7 +16,7 @@ namespace {
 
 using namespace std::chrono_literals;
 
-// ThreadSanitizer ends a process that does.
+// ThreadSanitizer ends a process that starts threads after a fork.
 #if defined(__SANITIZE_THREAD__)
 constexpr bool kMayStartThreadsAfterFork = false;
 #else
@@ -26,7 +26,7 @@ constexpr bool kMayStartThreadsAfterFork = true;
 using ClientOutage = ClientHarness;
 
 TEST_F(ClientOutage, SaysThatNoDaemonIsThere) {
-  // Its end must not take the drain time: there never was a daemon.
+  // Its destructor must not take the drain time, since there never was a daemon.
   VeskReporting session(options());
   auto connected = session.connect();
   EXPECT_EQ(connected.status, ReportingStatus::NotConnected);
@@ -162,7 +162,7 @@ TEST_F(ClientOutage, HasRoomAgainOnceTheDaemonTookWhatWaited) {
   ASSERT_TRUE(record.waitFor("message", 2));
   auto sent = session.flushMessagesAndWait();
   for (int i = 0; i < 100 && sent.status == ReportingStatus::QueueFull; ++i) {
-    ASSERT_TRUE(session.connect());  // a round through the session's thread
+    ASSERT_TRUE(session.connect());  // a round trip through the session's thread
     sent = session.flushMessagesAndWait();
   }
   EXPECT_EQ(sent.answer, "posted all");
@@ -220,7 +220,7 @@ TEST_F(ClientOutage, SaysThatTheDaemonHasTooManyConnections) {
   EXPECT_TRUE(second.fetchDisplayURL()) << "by itself, once there is room";
 }
 
-/// Runs `body` in a process of its own, which has a minute.
+/// Runs `body` in its own process, which has one minute.
 void expectToEnd(const std::function<bool()>& body) {
   if (!kMayStartThreadsAfterFork) GTEST_SKIP();
   const pid_t child = ::fork();
@@ -251,7 +251,7 @@ TEST_F(ClientOutage, AHostThatClosesAllDescriptorsNeitherHangsNorGetsAnythingInI
     }
     std::ignore = idle.sendMessage(1, 1);
     std::ignore = session->sendMessage(1, 1);
-    // Whether the thread misses its connection or what wakes it first is chance.
+    // It is chance whether the thread notices first that its connection or its wake-up descriptor is gone.
     const auto interrupted = answer.get().status;
     bool areRefused =
         (interrupted == ReportingStatus::Closed || interrupted == ReportingStatus::NotConnected) &&
@@ -279,7 +279,7 @@ TEST_F(ClientOutage, ManySessionsOfAProcessShareOneDrainTime) {
   EXPECT_EQ(budget.grant(2s, now + 2s), 2s);
   EXPECT_EQ(budget.grant(0s, now), 0s);
 
-  FileDescriptor hung(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));  // accepts nobody
+  FileDescriptor hung(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));  // never accepts
   UnixSocketAddress address(directory / "hung");
   ASSERT_EQ(::bind(hung.get(), address.get(), address.size()), 0);
   ASSERT_EQ(::listen(hung.get(), 8), 0);

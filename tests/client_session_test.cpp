@@ -152,7 +152,7 @@ TEST_F(ClientSession, RefusesWhatCannotBeSentAndGoesOn) {
 
 TEST_F(ClientSession, TheEndOfASessionSendsWhatIsQueuedAndCollectsItsAnswers) {
   constexpr std::uint16_t kMessages = 1000;
-  const Dictionary payload{{"k", std::string(2000, 'x')}};  // more in all than the socket takes at once
+  const Dictionary payload{{"k", std::string(2000, 'x')}};  // in total more than the socket takes at once
   int answers = 0;
   {
     auto endless = options();

@@ -46,7 +46,7 @@ class CollectorEndpoints : public ::testing::Test {
   EventsEndpoint _events{{_console, _stats, _faults}, _files / "events.jsonl"};
 };
 
-// What is saved of an event is seen by the tests of the roads.
+// The road tests check what is saved of an event.
 TEST_F(CollectorEndpoints, TakePostsAndSaveTheirEvents) {
   EXPECT_EQ(_events.answer(post(kGoodBody, {{"X-Vesk-Event-Map", "3 2"}})).status, 200U);
   EXPECT_EQ(_events.answer(post(gzip(kGoodBody), {{"Content-Encoding", "gzip"}})).status, 200U);

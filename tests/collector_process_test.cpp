@@ -30,7 +30,7 @@ class CollectorProcess : public ::testing::Test {
     options.command.insert(options.command.end(), further.begin(), further.end());
     return options;
   }
-  /// Waits until it listens and reads where.
+  /// Waits until it listens, and reads its addresses.
   void waitUntilReady() {
     ASSERT_TRUE(test::eventually([&] { return std::filesystem::exists(_files / "ready.json"); }));
     _facts = *parseJSON(_files.read("ready.json")).value.value().dictionary();

@@ -1,4 +1,4 @@
-// The daemon as a process: its command line, how it starts and ends, and the storebags that it fetches.
+// The daemon as a process: command line, start, stop, and the storebags that it fetches.
 #include <gtest/gtest.h>
 #include <sched.h>
 #include <sys/resource.h>
@@ -17,7 +17,7 @@ constexpr char kDaemon[] = VESK_BIN_DIRECTORY "/veskreportingd";
 const std::string kVersion = VESK_VERSION;
 constexpr char kProfile[] = "usr/share/veskreporting/sandbox/com.corvane.veskreportingd.toml";
 
-/// Lines of the log without what comes before their level.
+/// The log's lines without the text before their level.
 std::string withoutTime(const std::string& log) {
   std::string lines;
   for (std::size_t at = 0, end; at < log.size() && (end = log.find('\n', at)) != log.npos; at = end + 1) {
@@ -36,7 +36,7 @@ TEST(DaemonCommandLine, IsUnderstoodOrSaysWhyNot) {
   const auto isNot = [](const std::string& option, const std::string& value, const std::string& wanted) {
     return "veskreportingd: " + option + ": \"" + value + "\" is not " + wanted + "\n";
   };
-  // Where its options are understood, the daemon comes as far as its sandbox, whose profile is not there.
+  // With valid options, the daemon gets as far as its sandbox, whose profile is missing.
   const std::string unconfined =
       "<3> main: confine_enter() fails: " + nowhere + "/" + kProfile + ": no such file\n";
   std::vector<std::tuple<std::vector<std::string>, int, std::string, std::string>> cases = {
@@ -68,7 +68,7 @@ TEST(DaemonCommandLine, IsUnderstoodOrSaysWhyNot) {
   EXPECT_TRUE(std::filesystem::is_empty(root.path())) << "nothing has been started";
 }
 
-/// A daemon whose storebags come from a server of the test's own, which takes its posts, too.
+/// A daemon whose storebags come from the test's server, which also receives its posts.
 class DaemonProcess : public testing::Test {
  protected:
   DaemonProcess() {
@@ -81,7 +81,7 @@ class DaemonProcess : public testing::Test {
       return request.method == "GET" ? storebag : HTTPAnswer::text(200, "ok");
     });
   }
-  /// A section whose backend posts there.
+  /// A section whose backend posts to that path.
   Dictionary section(const std::string& path) const {
     return {{"httpPost", Dictionary{{"clients", List{Dictionary{{"post_url", server.url(path)}}}}}}};
   }
@@ -117,7 +117,7 @@ TEST_F(DaemonProcess, FetchesForTheEnvironmentOfItsDevice) {
 }
 
 TEST_F(DaemonProcess, AsksOnlyForWhatIsNewer) {
-  const std::string time = "Tue,  24 Nov 2026 20:00:00 GMT+1";  // sent back as it came
+  const std::string time = "Tue,  24 Nov 2026 20:00:00 GMT+1";  // sent back unchanged
   HTTPAnswer storebag;
   storebag.headers = {{"Last-Modified", time}, {"Cache-Control", "public, max-age=600"}};
   storebag.body = signedStorebag(key, Dictionary{{"refresh_cycle", 0}, {"release", section("/post")}});
@@ -153,7 +153,7 @@ TEST_F(DaemonProcess, OwnsItsSocketAndStopsOnASignal) {
   EXPECT_EQ(::prlimit(pid, RLIMIT_NOFILE, nullptr, &descriptors), 0);
   EXPECT_EQ(descriptors.rlim_cur, descriptors.rlim_max);
   ChildProcess second({.command = {kDaemon, "--root", harness.root.path().string()},
-                       .environment = {{"ASAN_OPTIONS", "detect_leaks=0"}}});  // it can't look from a sandbox
+                       .environment = {{"ASAN_OPTIONS", "detect_leaks=0"}}});  // it doesn't work in a sandbox
   EXPECT_EQ(second.wait(), 1);
   EXPECT_EQ(withoutTime(second.errors()),
             "<3> main: Another daemon answers on " + harness.socketPath() + ": Address already in use\n");
@@ -192,7 +192,7 @@ TEST_F(DaemonProcess, TellsItsManagerHowItGoesAndKeepsToItsLimits) {
   // A client type without a storebag has no backend.
   RoadClient client(harness, {{kVeskReportingSessionInfoClientType, 4}});
   EXPECT_TRUE(client.reporting.sendMessageAndWait(message(3)));
-  // Without its user info a session holds what it sends.
+  // A session that lacks its user info holds its messages.
   RoadClient holding(harness, {{kVeskReportingSessionInfoRequireUserInfo, true}});
   const auto bulk = message(3, {{"bulk", std::string(200 << 10, 'x')}});
   for (int i = 0; i < 6; ++i) EXPECT_TRUE(holding.reporting.sendMessageAndWait(bulk));

@@ -1,4 +1,4 @@
-// The dashboard backend: its profile, datagrams to the byte, log lines, log data.
+// The dashboard backend: its profile, datagrams byte by byte, log lines, log data.
 #include <gtest/gtest.h>
 
 #include "backends/BackendFactory.h"
@@ -172,9 +172,9 @@ TEST_F(Dashboard, WritesPayloadsShortestValueFirst) {
       {Dictionary{{"x", "a=b"}, {"y", "\\=\n\\\\"}}, " x=a\\=b y=\\\\\\=\\\\\\\\"},
       {Dictionary{{"x", "==\r\t a"}, {"y", "1\n2\n"}}, " y=12 x=\\=\\=\r\t a"},
       {Dictionary{{"k=1\n\\ 2", "v"}, {"", "w"}}, " k=1\n\\ 2=v =w"},
-      // Two UTF-16 units, though one character; and one unit, though two and three bytes.
+      // One character of two UTF-16 units, and characters of one unit but two or three bytes.
       {Dictionary{{"party", "🎉"}, {"arrow", "→"}, {"u", "üü"}, {"a", "abc"}}, " arrow=→ party=🎉 u=üü a=abc"},
-      // Their lengths before they are written count, and "null" has one, too.
+      // Values are ordered by their length before sanitising, including "null".
       {Dictionary{{"none", Value()}, {"e", ""}, {"x", "===="}, {"abc", "abc"}},
        " e=empty abc=abc none=null x=\\=\\=\\=\\="},
       {Dictionary{{"big", big}, {"more", big}}, " big=" + big.substr(0, 1018)},
@@ -288,7 +288,7 @@ TEST_F(Dashboard, SaysWhatItDoesInTheSystemLog) {
       {"no timer",
        with(_queues.queue->refusesWork, true, [&] { EXPECT_FALSE(make(profile(reliable))); }),
        {noTimer}},
-#if !defined(__SANITIZE_THREAD__) && !defined(__SANITIZE_ADDRESS__)  // these builds allocate before it
+#if !defined(__SANITIZE_THREAD__) && !defined(__SANITIZE_ADDRESS__)  // these builds allocate earlier
       {"no buffer",
        [&] {
          auto backend = make(profile());
@@ -353,7 +353,7 @@ TEST_F(Dashboard, UploadsLogDataAndAnnouncesWhereItWent) {
   const std::string upload = "DashboardBackend(uploadLogData): ";
   const std::string failed = upload + "Error uploading log data array (";
   const List logData{Dictionary{{"when", Date{12.5}}, {"text", "ä"}}, Bytes("\x01")};
-  // text: of the announcement; null: none
+  // text: of the message with the location; null: none
   const std::tuple<unsigned, std::string, const char*, std::string> cases[] = {
       {200, "http://d/7?a=b", " LogDataUploadLocation=http://d/7?a\\=b",
        "Log data uploaded to http://d/7?a=b"},
@@ -394,7 +394,7 @@ TEST_F(Dashboard, UploadsLogDataAndAnnouncesWhereItWent) {
   }
   EXPECT_EQ(server.count(), std::size(cases)) << "nothing is sent again";
 
-  // What can't go, and what may not go.
+  // Cases that can't be sent, and cases that must not be.
   auto refused = [&](const std::string& line) {
     EXPECT_EQ(_log.lines(), (std::vector{std::pair(3, line)}));
     _log.clear();

@@ -1,4 +1,4 @@
-// Retransmission, acknowledgement, bounds and shutdown of datagrams, tick by tick over real sockets.
+// Retransmission, acknowledgement, limits and shutdown of datagrams, tick by tick over real sockets.
 #include <gtest/gtest.h>
 
 #include <numeric>
@@ -46,7 +46,7 @@ class Delivery : public testing::Test {
     _delivery->cleanup();
     _queue->run();
   }
-  /// Lets time pass in steps and gives when, in ms from now, which event arrived.
+  /// Advances the time in steps and returns when (in ms from now) each event arrived.
   std::vector<std::pair<int, int>> arrivalsDuring(int duration, int step = 100) {
     std::vector<std::pair<int, int>> arrivals;
     for (int at = 0; at <= duration; at += step) {
@@ -72,7 +72,7 @@ class Delivery : public testing::Test {
 
 TEST_F(Delivery, SendsUntilItArrivesOrIsGivenUp) {
   constexpr int kShort = SocketFaults::kShort, kNoRoute = ENETUNREACH;
-  // sends: what becomes of the first ones
+  // sends: the outcomes of the first calls
   // lostAt: -1: never
   const std::tuple<const char*, bool, std::deque<int>, std::vector<int>, int> cases[] = {
       {"nothing fails", true, {}, {0, 1000, 2500, 5000, 9500}, 10'000},
@@ -116,7 +116,7 @@ TEST_F(Delivery, KeepsItsBeatWhileItIdles) {
   start();
   _queue->advance(milliseconds(1300));
   EXPECT_EQ(_queue->waiting(), 0u) << "no timer while nothing is pending";
-  send(1);  // the beats are at 1500 and 2000
+  send(1);  // the ticks are at 1500 and 2000
   EXPECT_EQ(arrivalsDuring(3000), (Arrivals{{0, 1}, {700, 1}, {2200, 1}}));
 }
 
@@ -138,12 +138,12 @@ TEST_F(Delivery, AnAcknowledgementTakesTheFirstDatagramWithItsEventID) {
     return bytes.substr(0, size);
   };
   const std::uint16_t ids[] = {5, 0x1234, 5, 0x127F, 0x1200};
-  // others: which are sent again
+  // others: those sent again
   const std::tuple<const char*, std::vector<std::string>, std::vector<int>> cases[] = {
       {"unknown", {carrying(9, 64)}, {0, 1, 2, 3, 4}},
       {"little-endian", {carrying(0x3412, 64)}, {0, 1, 2, 3, 4}},
       {"nothing in it", {"", "x"}, {0, 1, 2, 3, 4}},
-      // The second finds what the first left in the buffer; with it, it would be 0x1234.
+      // The buffer still contains the first datagram; together with it, the second would be 0x1234.
       {"a byte too short", {carrying(0xFF34, 1088), carrying(0x1200, 61)}, {0, 1, 2, 3, 4}},
       {"just long enough", {carrying(0x1234, 62)}, {0, 2, 3, 4}},
       {"longer than any datagram", {carrying(0x1200, 2000)}, {0, 1, 2, 3}},
@@ -171,7 +171,7 @@ TEST_F(Delivery, AnAcknowledgementTakesTheFirstDatagramWithItsEventID) {
     _queue->advance(milliseconds(30'000));
     _server.take();
   }
-  for (std::size_t size : {0u, 1u, 60u, 61u})  // of more that can be read
+  for (std::size_t size : {0u, 1u, 60u, 61u})  // of a longer buffer
     EXPECT_EQ(eventIDOfAcknowledgement(std::string_view(carrying(5, 64)).substr(0, size)), std::nullopt);
 }
 
@@ -220,7 +220,7 @@ TEST_F(Delivery, ABurstWaitsForRoomInTheSystem) {
 TEST_F(Delivery, CleanupGivesEverythingBackOnce) {
   for (const int variant : {0, 1, 2}) {
     const long before = openDescriptors();
-    _queue->refusesReadSources = variant == 2;  // reliable all the same
+    _queue->refusesReadSources = variant == 2;  // reliable nevertheless
     start(variant != 0);
     _queue->advance(milliseconds(700));
     cleanup();
@@ -243,7 +243,7 @@ TEST_F(Delivery, CleanupLetsAnAnsweringServerFinish) {
     start();
     send(1);
     cleanup();
-    _delivery.reset();  // the session has let go
+    _delivery.reset();  // the session has dropped its reference
     if (ticksFirst) _queue->advance(milliseconds(500));
     EXPECT_EQ(openDescriptors(), before + 1);
     _server.take();

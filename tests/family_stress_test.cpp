@@ -1,4 +1,4 @@
-// Two families of sessions that do everything at once, for some seconds, over the real daemon.
+// Two families of sessions that perform all operations concurrently for some seconds, with the real daemon.
 #include <gtest/gtest.h>
 
 #include <array>
@@ -15,7 +15,7 @@ using namespace std::chrono_literals;
 
 constexpr int kMembers = 20;
 constexpr auto kDuration = 5s;
-/// The watchdog: an operation that takes longer, on whatever machine and under whatever sanitizer, hangs.
+/// The watchdog: an operation that takes longer, on any machine and with any sanitizer, hangs.
 constexpr auto kPatience = 60s;
 
 /// The level of each family's ten members.
@@ -33,7 +33,7 @@ Dictionary familyName(int family) {
                     {kVeskReportingUserInfoServiceName, "Stress"}};
 }
 
-/// One client at a time, driven by a thread of its own with random numbers of its own.
+/// One client at a time, driven by its own thread and random numbers.
 class Member {
  public:
   Member(const DaemonHarness& harness, int number, unsigned seed)
@@ -136,7 +136,7 @@ TEST(FamilyStress, TwoFamiliesThatDoEverythingAtOnceNeitherHangNorBreakTheDaemon
       aggregated += member->aggregated();
     }
     EXPECT_GT(aggregated, 0u) << "nobody ever aggregated: the families did not form";
-    // One half goes, the other is there while the daemon ends.
+    // Half of the members leave first; the others are still connected when the daemon ends.
     for (int i = 0; i < kMembers; i += 2) members[static_cast<std::size_t>(i)]->leave();
   }
   EXPECT_EQ(harness.stopDaemon(), 0);

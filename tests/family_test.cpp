@@ -19,11 +19,11 @@ std::string without(std::string places, const std::string& others) {
 }
 
 TEST_F(Family, EveryWalkTakesTheFirstOfEachLevel) {
-  // levels: in the order of joining; sessions are named by their place in it
-  // aggregating: which have aggregation on when all have joined
+  // levels: in the order of joining; a session is named by its position
+  // aggregating: the sessions that aggregate once all have joined
   // identity: from the top
   // ancestor: the one that aggregates
-  // remaining: which aggregate once `asker` has refreshed those below
+  // remaining: the sessions that still aggregate after `asker` has refreshed those below it
   const std::tuple<const char*, std::string, std::string, char, std::string, std::string, std::string,
                    std::string>
       rows[] = {{"the top", "0123", "0123", '0', "", "", "", "0"},
@@ -94,7 +94,7 @@ TEST_F(Family, EveryWalkTakesTheFirstOfEachLevel) {
 }
 
 TEST_F(Family, ArrivalsRefreshThoseBelowInTheOrderOfJoining) {
-  // A session is enabled by the state that its parent has at that moment.
+  // A session's states depend on its parent's states when it joins.
   const std::pair<std::vector<int>, bool> rows[] = {
       {{0, 1, 2}, true}, {{0, 2, 1}, true}, {{1, 2, 0}, true}, {{2, 1, 0}, false}};
   for (const auto& [levels, isEnabled] : rows) {
@@ -112,7 +112,7 @@ TEST_F(Family, ArrivalsRefreshThoseBelowInTheOrderOfJoining) {
 }
 
 TEST_F(Family, AChildCopiesItsParentsStatesButAnOverride) {
-  // A backend with its sampling threshold; a dashboard has none. Without `override_sampling` a backend that
+  // A backend with its sampling threshold; a dashboard has none. Without `override_sampling`, a backend that
   // is sampled out is in state 3.
   auto storebag = [&](int level, const std::string& backends) {
     MutableDictionary section;
@@ -214,11 +214,11 @@ TEST_F(Family, NobodyTakesASessionThatStartsForItsParent) {
   std::atomic_flag isAsked;  // the sibling's thread logs as well
   SystemLog::setLevel(7);
   SystemLog::setSink([&](LogLevel, std::string_view line) {
-    // It is in its family now, and its level is not decided yet.
+    // The session is in its family now, but its level is not decided yet.
     if (line.find("Store bag override") == std::string_view::npos || isAsked.test_and_set()) return;
     refresh =
         std::async(std::launch::async, [&] { sibling->fetchStatesWithUserInfo(userInfo("MYAPP"), {}); });
-    refresh.wait_for(std::chrono::milliseconds(100));  // it goes on, or waits for this thread
+    refresh.wait_for(std::chrono::milliseconds(100));  // it finishes, or waits for this thread
   });
   starting.start();
   refresh.get();
@@ -266,7 +266,7 @@ TEST_F(Family, ClientsThatLeaveLoseNothing) {
   EXPECT_EQ(harness.dropped(DropReason::NoBackend) + harness.dropped(DropReason::NotAggregated), 0u);
 }
 
-/// True when another thread can take the agent's monitor now.
+/// Whether another thread can take the agent's monitor now.
 bool monitorIsFree(AgentHarness& harness) {
   auto taken = std::make_shared<std::promise<void>>();
   std::thread([taken, agent = harness.agent] {
@@ -285,9 +285,9 @@ TEST_F(Family, AnAncestorThatEndsWhileAChildSendsIsDestroyedByTheChildOutsideThe
   std::optional<bool> freeAtTheEnd;
   connection->onCall = [&](const IPCOutgoingCall& call) {
     if (!std::get<std::optional<Dictionary>>(call.arguments.at(0))) {
-      freeAtTheEnd = monitorIsFree(harness);  // the closing message: this is the session's destruction
+      freeAtTheEnd = monitorIsFree(harness);  // the closing message, sent by the session's destructor
     } else if (top.session) {
-      harness.agent->sessionInvalidated(top.session);  // its connection ends in the middle of the delivery
+      harness.agent->sessionInvalidated(top.session);  // its connection ends during the delivery
       top.session.reset();
     }
   };

@@ -1,4 +1,4 @@
-// Many clients, and clients that say nonsense, against the real daemon.
+// Many clients, and clients that send nonsense, against the real daemon.
 #include <gtest/gtest.h>
 
 #include <limits>
@@ -13,18 +13,18 @@ namespace {
 
 using namespace std::string_view_literals;
 
-/// Kept connections of the HTTP client, which come and go.
+/// Kept connections of the HTTP client, whose number varies.
 constexpr std::size_t kSpareDescriptors = 8;
 
-/// Whether the daemon is back to what it held before, and still serves.
+/// Checks that the daemon's resources are back to their previous level, and that it still serves clients.
 class Aftermath {
  public:
   explicit Aftermath(DaemonHarness& harness) : _harness(harness), _facts(harness.daemon().pid()) {
     {
-      RoadClient client(_harness);  // so that all that is made once is there
+      RoadClient client(_harness);  // creates everything that is created once
       EXPECT_TRUE(client.reporting.sendMessageAndWait(message(8)));
       harness.waitForEventsOfMethod(8, 1);
-      _threads = _facts.threads() - 1;  // its own goes
+      _threads = _facts.threads() - 1;  // without this client's thread
       _descriptors = _facts.descriptors();
     }
     EXPECT_TRUE(eventually([&] { return _facts.threads() <= _threads; })) << "its place is free again";
@@ -46,7 +46,7 @@ class Aftermath {
   std::size_t _descriptors = 0;
 };
 
-/// As many as get in of `count` that `user` makes.
+/// Makes `count` connections as `user` and keeps those that are accepted.
 void connect(const DaemonHarness& harness, uid_t user, int count, std::vector<RawClient>& open) {
   ASSERT_EQ(::seteuid(user), 0);
   for (int i = 0; i < count; ++i) {
@@ -69,7 +69,7 @@ TEST(HostileClients, ConnectionsInExcessAreClosedAndTheOthersGoOn) {
     connect(harness, ::geteuid(), kIsSanitized ? 63 : 1100, open);
     EXPECT_EQ(open.size(), kIsSanitized ? 63u : 1023u) << "1,024 of one user, with the first";
     EXPECT_TRUE(kIsSanitized || harness.daemon().waitForText("Refused a connection of user"));
-    // As somebody else one can come only from the superuser; the sanitizers need too much for each thread.
+    // Only the superuser can change the user, and the sanitizers need too much memory per thread.
     if (::geteuid() == 0 && !kIsSanitized) {
       open.erase(open.begin(), open.begin() + 100);
       for (uid_t user = 60'001; user <= 60'020; ++user) connect(harness, user, 250, open);
@@ -155,7 +155,7 @@ TEST(HostileClients, EveryKindOfValueInEveryNumericKeyHarmsNobody) {
       EXPECT_TRUE(session.fetchStates(Dictionary{{"clientName", value}})) << key;
       EXPECT_TRUE(session.flushMessagesAndWait()) << key;
       EXPECT_TRUE(session.fetchDisplayURL()) << key;
-      // Whether it is taken or refused, it is answered.
+      // It may be accepted or refused, but it must be answered.
       EXPECT_NE(session.sendMessageOnceAndWait(with(info, key, value), std::nullopt, 3, 2).status,
                 ReportingStatus::NotConnected)
           << key;
@@ -165,7 +165,7 @@ TEST(HostileClients, EveryKindOfValueInEveryNumericKeyHarmsNobody) {
     }
     EXPECT_TRUE(other->reporting.sendMessageAndWait(5, 2, Dictionary{{"value", value}}));
   }
-  // One event for each value, whatever became of the value itself.
+  // One event for each value, regardless of what happened to the value itself.
   harness.waitForEventsOfMethod(5, kStrangeValues.size());
   other.reset();
   aftermath.expectNothingLeft();

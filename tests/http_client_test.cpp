@@ -1,4 +1,4 @@
-// The HTTP client against a real server: what goes over the wire, TLS, limits, and its end.
+// The HTTP client against a real server: requests on the wire, TLS, limits, and shutdown.
 #include <gtest/gtest.h>
 
 #include <cstdlib>
@@ -28,7 +28,7 @@ TEST(HTTPClient, SendsWhatItIsGivenAndLittleElse) {
     return answer;
   });
   HTTPClient client;
-  auto request = postTo(server.url("/a?b=c"), std::string(5u << 20, '\0'));  // no asking first either
+  auto request = postTo(server.url("/a?b=c"), std::string(5u << 20, '\0'));  // also no "Expect: 100-continue"
   request.headers = {{"X-Vesk-Second", "2"},
                      {"X-Vesk-Empty", ""},
                      {"Accept", "application/json"},
@@ -116,7 +116,7 @@ TEST(HTTPClient, FollowsOnlyHTTPAndNoRedirect) {
     EXPECT_EQ(result.error->kind, Kind::BadURL) << url << ": " << result.error->description;
     EXPECT_FALSE(result.response);
   }
-  // No server is asked for a label that is too long.
+  // A label that is too long fails without a query.
   EXPECT_EQ(client.perform(fetchFrom("http://" + std::string(64, 'a') + "/")).error->kind, Kind::Resolve);
 }
 
@@ -124,7 +124,7 @@ TEST(HTTPClient, BadAnswersAreErrorsOfTheirKindAndOverWithTheNextRequest) {
   const struct {
     Fault fault;
     Kind kind;
-    HTTPRequest::Retry retry;  // what the server has whole is never sent again
+    HTTPRequest::Retry retry;  // a complete request is never sent again
   } cases[] = {{Fault::ResetBeforeAnswer, Kind::Interrupted, HTTPRequest::Retry::Never},
                {Fault::CloseWithoutAnswer, Kind::Interrupted, HTTPRequest::Retry::Never},
                {Fault::ResetMidAnswer, Kind::Interrupted, HTTPRequest::Retry::UntilSent},
@@ -199,7 +199,7 @@ TEST(HTTPClient, ItsEndFailsWhatIsOutstandingAtOnce) {
     again->start(fetchFrom(server.url()), note);
   });
   waitFor([&] { return server.count() == 8; });
-  // Two that wait for another attempt: nothing listens on the port of a server that is gone.
+  // Two that wait for a retry: the port of the stopped server refuses connections.
   std::string gone = [] { return RecordingServer().url(); }();
   client->start(postTo(gone), note);
   client->start(postTo(gone), note);
@@ -220,7 +220,7 @@ TEST(HTTPClient, StopsAllButPosts) {
   client.start(postTo(server.url()), [&](const HTTPResult& result) { posted = result.response.has_value(); });
   client.stopAllButPosts();
   client.start(fetchFrom(server.url()), note);
-  ASSERT_TRUE(client.waitUntilIdle(30s));  // a fetch itself has a minute
+  ASSERT_TRUE(client.waitUntilIdle(30s));  // a fetch's own timeout is a minute
   EXPECT_EQ(kinds, std::vector<Kind>(4, Kind::Stopped));
   EXPECT_TRUE(posted);
   HTTPClient unused;

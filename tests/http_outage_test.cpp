@@ -1,4 +1,4 @@
-// Posts and servers that go away: what is tried again, what is not, and what is lost.
+// Posts and servers that go away: which posts are retried, which are not, and which are lost.
 #include <gtest/gtest.h>
 
 #include <atomic>
@@ -19,7 +19,7 @@ using Fault = HTTPAnswer::Fault;
 using Kind = HTTPError::Kind;
 using Bodies = std::vector<std::string>;
 
-/// Impatient, so that tests do not wait.
+/// Short waits, to keep the tests fast.
 HTTPClient::Options quick() { return {.retryFor = 60s, .firstRetryAfter = 5ms}; }
 
 TEST(HTTPOutage, APostThatWasCutOffIsSentAgainUntilItIsAnswered) {
@@ -111,7 +111,7 @@ TEST(HTTPOutage, AnAnswerOfAnyStatusEndsAPost) {
 }
 
 TEST(HTTPOutage, AConnectionThatTakesTooLongIsTriedAgain) {
-  // Connections come to be, but nobody greets them.
+  // Connections are established, but the server sends nothing.
   boost::asio::io_context context;
   boost::asio::ip::tcp::acceptor listener(context, {boost::asio::ip::address_v4::loopback(), 0});
   auto options = quick();

@@ -1,4 +1,4 @@
-// When posts are tried again, and in what order requests go out: decided without waiting.
+// When posts are retried, and in what order requests go out, without real waits.
 #include <gtest/gtest.h>
 
 #include "platform/http/HTTPSchedule.h"
@@ -33,7 +33,7 @@ TEST(RetryPolicy, WaitsGrowAreSpreadAndEnd) {
 
 class Schedule : public testing::Test {
  protected:
-  /// A post, or a fetch when it is never sent again.
+  /// Adds a post, or a fetch if it is never retried.
   void add(const std::string& name, std::size_t size = 10, std::uint32_t owner = 0,
            HTTPRequest::Retry retry = HTTPRequest::Retry::UntilSent, const std::string& host = "https://a") {
     HTTPRequest request;
@@ -50,7 +50,7 @@ class Schedule : public testing::Test {
   void addToOtherHost(const std::string& name) {
     add(name, 1, 0, HTTPRequest::Retry::UntilSent, "https://b");
   }
-  /// Takes all that may go out now; the names in order.
+  /// Takes all requests that may go out now and returns their names in order.
   std::string takeReady() {
     std::string names;
     while (auto next = schedule.next(now)) {

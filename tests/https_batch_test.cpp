@@ -1,4 +1,4 @@
-// Whether an event is posted at once or held, and how held events leave.
+// Whether an event is posted at once or held, and how held events are posted.
 #include "tests/support/HTTPSBackendTest.h"
 #include "tests/support/TestRoot.h"
 

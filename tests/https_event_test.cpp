@@ -1,4 +1,4 @@
-// What becomes of one message: the event record, its filters, and what JSON carries of it.
+// A message's event: its record, its filters, and its JSON form.
 #include <cstdio>
 
 #include "backends/BackendFactory.h"
@@ -68,7 +68,7 @@ TEST_F(HTTPSEvent, NumbersWrap) {
   }
 }
 
-// Environment and kind of build are found out once for the life of a process.
+// Environment and kind of build are determined once per process.
 void tellEnvironment(const char* preferences, const char* facts, const char* zone) {
   testRoot().write("etc/veskreporting/preferences/com.corvane.veskreporting.toml", preferences);
   testRoot().write("etc/veskreporting/device.toml", facts);
@@ -86,7 +86,7 @@ void tellEnvironment(const char* preferences, const char* facts, const char* zon
 }
 
 TEST(HTTPSEventDeathTest, TellsEnvironmentAndTimeZone) {
-  GTEST_FLAG_SET(death_test_style, "threadsafe");  // each in a process that has not found them out yet
+  GTEST_FLAG_SET(death_test_style, "threadsafe");  // each in a process that has not determined them yet
   const char* release = "environmentType = 4\n";
   const char* internal = "ReleaseType = \"Internal\"\n";
   const auto exits = testing::ExitedWithCode(0);
@@ -136,7 +136,7 @@ TEST_F(HTTPSEvent, LastMessageTellsHowItWasSampled) {
 }
 
 TEST_F(HTTPSEvent, BodyLosesWhatJSONEventsCannotCarry) {
-  // sent: null: the entry is gone
+  // sent: null: the entry is removed
   const std::tuple<Value, boost::json::value, const char*> cases[] = {
       {Date{1.5}, 1.5, ""},
       {Date{-kInfinity}, -1.0, ""},
@@ -168,7 +168,7 @@ TEST_F(HTTPSEvent, FiltersDecideByTheFirstMatchingRecord) {
   const auto digest = [](const char* text) { return VeskReportingBackend::convertIntoSHA256(text); };
   EXPECT_EQ(digest("häß"), "75f46bf42d9409fca50bb527409a28d7eac1621c087755cd0136451e65631caf");
   const auto shield = [](const Value& method) { return Dictionary{{"key", "name"}, {"method", method}}; };
-  // expected: nothing: the key is gone
+  // expected: nullopt: the key is removed
   const std::tuple<List, const char*, std::optional<std::string>> cases[] = {
       {{filter("NAME", "sha256")}, "name", digest("Ann")},
       {{filter("name", "sha256"), filter("name", "remove")}, "name", digest("Ann")},
@@ -182,14 +182,14 @@ TEST_F(HTTPSEvent, FiltersDecideByTheFirstMatchingRecord) {
       {{filter("name", "remove", -7, -7)}, "name", {}},
       {{Dictionary{{"action", "remove"}}}, "name", "Ann"},
       {{filter("nam", "remove")}, "name", "Ann"},
-      {{filter("ken", "remove")}, "\u212Aen", {}},  // folded, they are the same
+      {{filter("ken", "remove")}, "\u212Aen", {}},  // equal after case folding
       {{filter("\u212Aey", "remove")}, "key", {}},
       {{filter("clientname", "sha256")}, "clientName", digest("Camera")},
       {{filter("n", "sha256")}, "n", digest("42")},
       {{filter("date", "sha256")}, "date", digest("1700000000.5")},
       {{filter("never", "sha256")}, "never", digest("-1")},
       {{filter("nested", "sha256")}, "nested", {}},
-      // What can't be read hides rather than uncovers.
+      // Filters that can't be read hide the value rather than reveal it.
       {{filter("name", "remove", "x")}, "name", {}},
       {{filter("name", "sha256", 3, "2 or so")}, "name", digest("Ann")},
       {{filter("name", "sha256", 1e10, nullptr)}, "name", digest("Ann")},

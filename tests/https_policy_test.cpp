@@ -1,4 +1,4 @@
-// What an HTTPS backend makes of its profile: whether it reports, for which client, where to and how.
+// How an HTTPS backend interprets its profile: whether it reports, for which client, where to and how.
 #include "backends/BackendFactory.h"
 #include "tests/support/HTTPSBackendTest.h"
 #include "tests/support/TestRoot.h"
@@ -15,7 +15,7 @@ void writePreferences(std::string_view toml) {
 using HTTPSPolicy = HTTPSBackendTest;
 
 TEST_F(HTTPSPolicy, EntryDecidesTheState) {
-  // value: nothing: the entry lacks the key
+  // value: nullopt: the entry lacks the key
   const std::tuple<const char*, std::optional<Value>, std::int32_t, Lines> cases[] = {
       {"locale_whitelist", List{"DE", "s"}, 2, {}},
       {"locale_whitelist", List{"DE", "FR"}, 1, {"7 (US) isn't in locale list (DE, FR)"}},
@@ -47,7 +47,7 @@ TEST_F(HTTPSPolicy, EntryDecidesTheState) {
 
 TEST_F(HTTPSPolicy, NamesChooseTheEntry) {
   // client, service: of the user; null: unknown
-  // names: that the entry wants
+  // names: required by the entry
   const std::tuple<Value, Value, Dictionary, bool> cases[] = {
       {"a", "b", {}, true},
       {"STRASSE", "x", {{"client", "a,straße"}}, true},
@@ -109,7 +109,7 @@ TEST_F(HTTPSPolicy, ConsentIsRespectedUnlessTheStorebagOverridesIt) {
       {false, "1", 1, 0, {"7 reporting disabled by DNU: 0."}}};
   for (const auto& [consent, override, state, option, lines] : cases) {
     harness.consent = consent;
-    // It was overridden before, for another client.
+    // Consent was overridden before, for another client.
     auto backend =
         make(List{entry({{"client", "Before"}, {"override_dnu", 1}}), entry({{"override_dnu", override}})},
              {.userInfo = userNamed("Before")});
@@ -127,7 +127,7 @@ TEST_F(HTTPSPolicy, ConsentIsRespectedUnlessTheStorebagOverridesIt) {
 
 TEST_F(HTTPSPolicy, SamplingChoosesReportingOrTheOverrideBand) {
   // sampling, override: null: absent
-  // sentSampling, sentOverride: with the message that ends the session
+  // sentSampling, sentOverride: in the message that ends the session
   const std::tuple<Value, Value, std::int32_t, boost::json::value, boost::json::value> cases[] = {
       {0.30, nullptr, 2, 0.30, -1}, {1, 0.75, 2, 1, -1},       {0.29, nullptr, 3, 0.29, -1},
       {0.1, 0.30, 3, 0.1, 0.30},    {0.1, 0.29, 1, 0.1, 0.29}, {nullptr, 0.75, 1, -1, -1},
@@ -177,7 +177,7 @@ TEST_F(HTTPSPolicy, LaterEntriesKeepWhatTheyDoNotReach) {
 
 TEST_F(HTTPSPolicy, PostsGoToTheStorebagsURLsUnlessThePreferencesNameOthers) {
   // preference, storebag, storebagRealtime: "": none
-  // ordinary, realtime: where posts go; "": nowhere
+  // ordinary, realtime: targets of the posts; "": none
   const std::tuple<std::string, std::string, std::string, std::string, std::string> cases[] = {
       {"", "/s", "/sr", "/s", "/sr"},
       {"", "/s", "", "/s", "/s"},
@@ -195,7 +195,7 @@ TEST_F(HTTPSPolicy, PostsGoToTheStorebagsURLsUnlessThePreferencesNameOthers) {
       if (!storebagRealtime.empty()) whole.set("realtime_post_url", harness.url(storebagRealtime));
       auto backend = make(whole.share(), {.requireUserInfo = requireUserInfo});
       writePreferences("");
-      backend->updateState();  // read once, preferences survive the storebag's updates
+      backend->updateState();  // preferences are read once and survive the storebag's updates
       for (const auto& [flag, target] : {std::pair(0, ordinary), {1, realtime}}) {
         send(*backend, Dictionary(), 3, flag);
         EXPECT_EQ(takeTargets(), target.empty() ? Lines{} : Lines{target + " 1"});

@@ -1,4 +1,4 @@
-// Posts on the wire, and what their answers do.
+// Posts on the wire, and the effect of their answers.
 #include "backends/https/RefusedPosts.h"
 #include "tests/support/HTTPSBackendTest.h"
 #include "tests/support/TestRoot.h"
@@ -51,7 +51,7 @@ TEST_F(HTTPSPost, SenderFollowsTheClientType) {
 }
 
 TEST_F(HTTPSPost, BodyIsCompressedOnlyWhereThatIsShorter) {
-  std::vector<Value> filters;  // which leave nothing but the payload
+  std::vector<Value> filters;  // these leave nothing but the payload
   for (const char* key :
        {"_startTS", "_sender", "_clientVersion", "_sessionID", "_eventNumber", "_method", "_status",
         "_clientTS", "eventTime", "_productFamily", "_productModel", "_osVersion", "_internal", "_reportVers",
@@ -80,7 +80,7 @@ TEST_F(HTTPSPost, AnswersDecideTheState) {
       {{200, 299}, {}},
       {{302, 404, 499, 600}, DropReason::ServerRefused},
       {{500, 503, 599}, DropReason::ServerError5xx}};
-  // The status decides, also when the rest of the answer does not arrive.
+  // The status decides, even if the rest of the answer does not arrive.
   for (auto fault : {HTTPAnswer::Fault::None, HTTPAnswer::Fault::CloseMidAnswer}) {
     for (const auto& [statuses, reason] : cases) {
       for (const unsigned status : statuses) {

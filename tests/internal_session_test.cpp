@@ -1,4 +1,5 @@
-// Sessions on an internal build, which a process finds out once: hence a test program of its own.
+// Sessions on an internal build. A process determines its kind of build once, so this is a separate test
+// program.
 #include <gtest/gtest.h>
 
 #include "tests/support/AgentHarness.h"

@@ -1,4 +1,4 @@
-// The daemon's and the client's end of the IPC layer over real sockets: calls, answers, life cycle.
+// The daemon's and the client's ends of the IPC layer over real sockets: calls, answers, life cycle.
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 
@@ -22,7 +22,7 @@ std::vector<IPCArgument> message(int number, const char* action = "", std::size_
 TEST(IPCConnection, ServesPipelinedCallsInOrder) {
   TestService service;
   TestClient client(service);
-  // Long ones take another way through the daemon than short ones.
+  // Long messages take another path through the daemon than short ones.
   for (int i = 0; i < 2000; ++i)
     client.post("sendMessageWithDictionary", message(i, "", i % 7 == 0 ? 10'000 : 0));
   EXPECT_EQ(client.call("flushMessagesWithReply"), "posted all");

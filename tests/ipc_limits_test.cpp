@@ -1,4 +1,4 @@
-// What clients that break the rules, or break, can do to the daemon and to others.
+// What broken or malicious clients can do to the daemon and to other clients.
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 
@@ -92,7 +92,7 @@ TEST(IPCLimits, ClosesConnectionsInExcessWithOneLineABurst) {
     try {
       TestClient refused(service);
       EXPECT_TRUE(refused.runToEnd() && refused.bus().wasTurnedAway());
-    } catch (const std::system_error& error) {  // that early
+    } catch (const std::system_error& error) {  // refused before the connection was complete
       EXPECT_EQ(error.code().value(), EUSERS);
     }
     EXPECT_EQ(log.countContaining(4, test.line), 1);
@@ -135,9 +135,9 @@ TEST(IPCLimits, TakesMessagesUpToTheLimit) {
   TestService service;
   RawClient client(service);
   client.authenticate();
-  // Content: dictionary and value at 8 bytes each, a key of one letter.
+  // Content: 8 bytes each for dictionary and value, and a key of one letter.
   client.send(bytesMessage(kMessage - 17));
-  // The dictionary and the list count, too.
+  // The dictionary and the list also count.
   client.send(textsMessage(99'998));
   EXPECT_TRUE(service.journal.waitFor("message", 2));
   client.send(textsMessage(99'999));
@@ -212,7 +212,7 @@ TEST(IPCLimits, StopsReadingFromAClientThatDoesNotReadItsAnswers) {
   const IPCOutgoingCall ask{wire::kSessionInterface,
                             "sendMessageWithDictionary",
                             {Dictionary{{"pad", 20'000}, {"x", std::string(20'000, 'x')}}}};
-  // Until the daemon takes no more: the client's own messages pile up in its queue.
+  // Sends until the daemon accepts no more and the client's own messages pile up in its queue.
   while (client.bus().queuedMessages() < 20 && sent < 20'000) {
     ASSERT_EQ(client.bus().send(ask, count, 60s), BusClient::SendResult::Sent);
     ++sent;
@@ -228,7 +228,7 @@ TEST(IPCLimits, TellsTheCallerWhenAClientsOutboxIsFull) {
   struct Case {
     std::size_t outbox;
     std::size_t size;
-    int most;  // calls that are taken
+    int most;  // calls that are accepted
   };
   // The sockets hold some 500 KiB, the bus one call, and the outbox 10 calls or 4 MiB.
   for (const auto& test : {Case{10, 30'000, 40}, Case{256, 900'000, 6}}) {
@@ -239,7 +239,7 @@ TEST(IPCLimits, TellsTheCallerWhenAClientsOutboxIsFull) {
     const IPCOutgoingCall call{wire::kReplyInterface, "sendMessageToClient", {std::string(test.size, 'x')}};
     std::string error;
     int taken = 0;
-    // Before it stays full it is full only until the connection's thread comes to empty it.
+    // At first the outbox is only full until the connection's thread empties it.
     for (int refused = 0; refused < 100;) {
       error.clear();
       connection->callRemoteObject(call, [&](const std::string& text) { error = text; });
@@ -276,7 +276,7 @@ void sendWithDescriptors(int socket, const std::string& bytes, std::size_t count
 }
 
 std::string upload(WireHeader header, const char* member = "uploadFileAtPath") {
-  // "file", and an array of descriptor 0.
+  // "file", and an array with descriptor 0.
   return wireMessage(member, "sah", std::string("\4\0\0\0file\0\0\0\0\4\0\0\0\0\0\0\0", 20), header);
 }
 
@@ -310,7 +310,7 @@ TEST(IPCLimits, ClosesWhoSendsDescriptorsThatNoCallTakes) {
        wireMessage("uploadFileAtPath", "sah", std::string(20'000, 'x'), {.descriptors = 1})},
       {"within a message", kFlush + kFlush.substr(0, 40), kFlush.substr(40)},
   };
-  constexpr int kTimes = 8;  // over a hundred in all
+  constexpr int kTimes = 8;  // over a hundred in total
   CapturedLog log;
   TestService service;
   TestClient other(service);
@@ -349,13 +349,13 @@ TEST(IPCLimits, GivesADescriptorToTheMessageThatItCameWith) {
   RawClient client(service);
   client.send("\0AUTH EXTERNAL\r\nDATA\r\nNEGOTIATE_UNIX_FD\r\n"s);
   for (int i = 0; i < 3; ++i) client.line();
-  // Whether or not the daemon reads them together.
+  // The daemon may read them together or separately.
   client.send("BEGIN\r\n" + kFlush);
   for (int i = 0; i < 20; ++i) {
     sendWithDescriptors(client.fd(), call, 1);
     client.send(kFlush);
   }
-  // In two pieces, of which the first is less than a header.
+  // In two pieces, the first shorter than a header.
   sendWithDescriptors(client.fd(), call.substr(0, 10), 1);
   EXPECT_TRUE(service.journal.waitFor("flush", 21));
   client.send(call.substr(10));

@@ -39,7 +39,7 @@ TEST(JSON, WritesEveryKindOfValue) {
       {"back\\slash and tab\t", R"("back\\slash and tab\t")"},
       {std::string("\x00\x1f\x7f", 3), "\"\\u0000\\u001F\x7f\""},
       {"äöü → 🎉 and more ASCII after it", "\"äöü → 🎉 and more ASCII after it\""},
-      {"\uFDD0\uFFFE\uFFFF\U0010FFFF", "\"\uFDD0\uFFFE\uFFFF\U0010FFFF\""},  // valid, though no characters
+      {"\uFDD0\uFFFE\uFFFF\U0010FFFF", "\"\uFDD0\uFFFE\uFFFF\U0010FFFF\""},  // valid, though not characters
       {Dictionary{{"a", List{1, "b", Value()}}, {"c", Dictionary{{"d", 2u}}}},
        R"({"a":[1,"b",null],"c":{"d":2}})"},
   };
@@ -52,7 +52,7 @@ TEST(JSON, RefusesWhatItCannotCarry) {
       Value(Date{-std::numeric_limits<double>::infinity()}),
       Value(Bytes("data")),
       Value("cut off \xE2\x82"),
-      Value(std::string_view("12345678é").substr(0, 9)),  // the bytes behind the end would complete it
+      Value(std::string_view("12345678é").substr(0, 9)),  // the bytes after the end would complete it
       Value(Dictionary{{"key \xFF", 1}}),
       nested(65),
   };

@@ -1,4 +1,4 @@
-// Keyed archives: round trip, Python's plistlib as a second opinion, and what is refused.
+// Keyed archives: round trips, comparison with Python's plistlib, and what is refused.
 #include <gtest/gtest.h>
 
 #include "platform/plist/KeyedArchive.h"
@@ -12,7 +12,7 @@ namespace {
 TEST(KeyedArchive, ReadsBackWhatWasArchived) {
   Value deep = List{"same", "same"};
   for (int i = 1; i < 64; ++i) deep = List{deep};
-  std::vector<Value> many;  // more than one byte can number
+  std::vector<Value> many;  // more than a one-byte index covers
   for (int i = 0; i < 300; ++i) many.emplace_back(i);
   const List shared{"same", 1};
   const List texts{"text", "ä → 🎉", "\uFDD0\uFFFE\U0010FFFF", "", "$null", "text"};
@@ -73,7 +73,7 @@ TEST(KeyedArchive, RefusesWhatIsNoArchive) {
   auto list = [](std::vector<Value> items) {
     return Value(Dictionary{{"items", List(std::move(items))}, {"$class", uid(2)}});
   };
-  // Each object holds the next `times`: small to write, endless to walk.
+  // Each object contains the next one `times` times: small to write, endless to traverse.
   const auto chain = [&](std::uint64_t length, std::size_t times) {
     std::vector<Value> objects{"$null"};
     for (std::uint64_t i = 1; i <= length; ++i)

@@ -15,7 +15,7 @@ using namespace std::chrono_literals;
 
 class RateLimit : public testing::Test {
  protected:
-  /// How many of `lines` may be written.
+  /// How many of `lines` lines may be written.
   int written(const char& site, std::uint32_t user, int lines) {
     int count = 0;
     for (int i = 0; i < lines; ++i) {

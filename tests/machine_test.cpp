@@ -1,4 +1,4 @@
-// What the daemon does when the machine under it fails: disks, descriptors, and its own sudden end.
+// The daemon on a failing machine: disks, descriptors, and its own sudden end.
 #include <gtest/gtest.h>
 #include <sched.h>
 #include <sys/mount.h>
@@ -18,7 +18,7 @@ namespace {
 
 using namespace std::chrono_literals;
 
-/// A small file system that only this process and those it starts can see, and that goes away with them.
+/// A small file system that only this process and its children see, and that disappears with them.
 class SmallDisk {
  public:
   SmallDisk(const std::filesystem::path& at, const char* size) : _at(at) {
@@ -55,7 +55,7 @@ struct DiskCase {
   const char* directory;
   void (*breakIt)(const DaemonHarness& harness, SmallDisk* disk);
   bool needsDisk;
-  const char* line;  // how the daemon tells
+  const char* line;  // the daemon's log line
 };
 
 const DiskCase kDiskCases[] = {
@@ -111,7 +111,7 @@ TEST(Machine, WithoutDescriptorsItGoesOnAndForgetsNothing) {
   harness.startDaemon();
   RoadClient client(harness);
   limit(harness.daemon(), RLIMIT_NOFILE, 3);
-  // Neither a post nor the message log nor a new client gets a descriptor.
+  // Posts, the message log and new clients all fail to get a descriptor.
   harness.stopCollector();
   for (int i = 0; i < 20; ++i) {
     auto sent = client.reporting.sendMessageAndWait(message(3, Dictionary{{"n", i}}));
@@ -126,7 +126,7 @@ TEST(Machine, WithoutDescriptorsItGoesOnAndForgetsNothing) {
   EXPECT_EQ(harness.stopDaemon(), 0);
 }
 
-// Before its signals are set up, a daemon ends as any program does; it has accepted nobody then.
+// Before its signals are set up, a daemon ends like any program; it has not accepted anyone then.
 bool endedInOrder(int signal, int status, const std::string& log) {
   if (status == 128 + signal) return signal == SIGKILL || log.find("start loop.") == std::string::npos;
   return signal == SIGTERM && status == 0;
@@ -147,7 +147,7 @@ TEST(Machine, MayEndAtAnyMomentAndItsClientsReturnByThemselves) {
   std::mt19937 random(seed);
   const auto end = std::chrono::steady_clock::now() + 20s;
   while (std::chrono::steady_clock::now() < end && !HasFailure()) {
-    std::this_thread::sleep_for(std::chrono::milliseconds(random() % 100));  // the moment
+    std::this_thread::sleep_for(std::chrono::milliseconds(random() % 100));  // a random moment
     const int signal = random() % 4 == 0 ? SIGKILL : SIGTERM;
     harness.daemon().signal(signal);
     const int status = harness.daemon().wait().value_or(-1);

@@ -7,7 +7,8 @@ namespace {
 
 using namespace std::string_literals;
 
-/// A list of the given objects, the first of which is the root; offsets and references take one byte.
+/// A property list with the given objects. `root` is the index of its root; offsets and references take one
+/// byte.
 std::string document(const std::vector<std::string>& objects, std::size_t root = 0) {
   std::string bytes = "bplist00";
   std::string offsets;
@@ -66,7 +67,7 @@ TEST(BinaryPropertyList, RefusesWhatIsWrong) {
   }
 }
 
-/// `levels` lists, each of which holds the next one twice.
+/// `levels` nested lists, each of which contains the next one twice.
 std::string doublings(std::size_t levels) {
   std::vector<std::string> objects;
   for (std::size_t i = 1; i <= levels; ++i) objects.push_back("\xA2" + std::string(2, static_cast<char>(i)));
@@ -84,7 +85,7 @@ TEST(BinaryPropertyList, CountsSharedPartsAtEveryVisit) {
 }
 
 TEST(BinaryPropertyList, MeasuresTheDepthOfSharedPartsWhereTheyStand) {
-  // A chain of lists whose end is first met near the root, then again at its bottom.
+  // A chain of lists. The shared part is met first near the root, then again at the bottom.
   const auto chain = [](std::size_t depth) {
     std::vector<std::string> objects = {"\xA2\x01\x02"};  // the root: the shared part, then the chain
     objects.push_back("\xA0");                            // the shared part is a list itself

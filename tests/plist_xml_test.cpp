@@ -45,7 +45,7 @@ TEST(XMLPropertyList, ReadsTheRarerForms) {
 TEST(XMLPropertyList, RefusesWhatIsWrong) {
   std::vector<std::string> cases = {
       "", "not XML", "<plist/>", "<string>no plist around</string>",
-      // What is declared elsewhere is never fetched, so nobody knows what this stands for.
+      // External declarations are never fetched, so the entity's value is unknown.
       "<!DOCTYPE plist SYSTEM \"file:///etc/passwd\">" + document("<string>&undefined;</string>"),
       "<!DOCTYPE plist [<!ENTITY a SYSTEM \"file:///etc/passwd\">]>" + document("<string>&a;</string>")};
   for (const char* content :

@@ -1,4 +1,4 @@
-// The power log: what the backend records, what the file keeps, and how it fares on the real daemon.
+// The power log: what the backend records, what the file keeps, and its use by the real daemon.
 #include <gtest/gtest.h>
 
 #include "backends/BackendFactory.h"

@@ -1,4 +1,5 @@
-// The whole road on real processes: client library, daemon in its sandbox, signed storebag, TLS collector.
+// The full pipeline with real processes: client library, daemon in its sandbox, signed storebag, TLS
+// collector.
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -56,7 +57,7 @@ action = "sha256"
   EXPECT_EQ(event.at("clientName"), "Camera");
   EXPECT_EQ(held.at("headers").at("X-Vesk-Client-Name"), "Camera");
   EXPECT_EQ(held.at("headers").at("X-Vesk-Sender"), "HD");
-  // The start message and the end of the session frame the client's own.
+  // The session's start and end messages frame the client's own.
   auto internal = harness.waitForEventsOfMethod(0, 2);
   EXPECT_TRUE(std::any_of(internal.begin(), internal.end(), [](const auto& post) {
     auto version = post.at("event").as_object().if_contains("StorebagVersion");
@@ -124,7 +125,7 @@ TEST_F(DashboardRoad, AMessageBecomesADatagramALineAndAnAnswer) {
     ASSERT_TRUE(uploaded) << uploaded.detail;
     EXPECT_TRUE(uploaded.answer);
   }
-  // The session's start, the message, the announcement, the end.
+  // The session's start, the message, the log data's location, the end.
   auto datagrams = _harness->waitForDatagrams([](const auto& all) { return all.size() >= 4; });
   ASSERT_EQ(datagrams.size(), 4u);
   EXPECT_EQ(datagrams[1].at("payload").as_object(), (boost::json::object{{"n", "1"}, {"text", "a=b\\c"}}));
@@ -139,7 +140,7 @@ TEST_F(DashboardRoad, AMessageBecomesADatagramALineAndAnAnswer) {
 
 TEST_F(DashboardRoad, EverythingArrivesThoughThreeInTenAreLostBothWays) {
   constexpr int kMessages = 1000;
-  constexpr int kAtOnce = 25;  // half of what the daemon keeps
+  constexpr int kAtOnce = 25;  // half of the daemon's limit
   start({"--ack-loss", "0.3", "--seed", "1"}, "5");
   RoadClient client(*_harness);
   for (int n = 0; n < kMessages; ++n) {

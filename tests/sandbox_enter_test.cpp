@@ -1,4 +1,4 @@
-// What a process may and may not do once it is inside the sandbox that is shipped for the daemon.
+// What a process may do within the sandbox that is shipped for the daemon.
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <linux/landlock.h>
@@ -32,7 +32,7 @@ namespace fs = std::filesystem;
 
 constexpr const char* kProfile = "com.corvane.veskreportingd";
 
-/// Runs `body` in a child process, for what it does to its process can't be undone. Returns its text.
+/// Runs `body` in a child process, since its effects on the process can't be undone. Returns its text.
 std::string inChild(const std::function<std::string()>& body) {
   const test::TempDirectory directory;
   std::ofstream out(directory / "text");
@@ -64,7 +64,7 @@ class SandboxTest : public testing::Test {
     return root / "usr/share/veskreporting/sandbox/com.corvane.veskreportingd.toml";
   }
 
-  /// Why the sandbox could not be entered, or else what `body` returned inside it, on a thread made later.
+  /// Returns the result of `body` inside the sandbox, on a new thread, or the reason why entering it failed.
   std::string inside(const std::function<std::string()>& body) const {
     return inChild([&] {
       setRootPrefix(root.string());
@@ -79,13 +79,13 @@ class SandboxTest : public testing::Test {
   const fs::path root = directory.path();
 };
 
-/// One thing to try; the result is that of a system call.
+/// An attempt; the result is that of a system call.
 struct Probe {
   const char* name;
   std::function<long()> call;
 };
 
-/// A line for each probe that `isWrong` finds fault with, given its error number (0: it succeeded).
+/// A line for each probe for which `isWrong` returns true, given its error number (0: it succeeded).
 std::string faults(const std::vector<Probe>& probes, bool (*isWrong)(int error)) {
   std::string text;
   for (const Probe& probe : probes) {

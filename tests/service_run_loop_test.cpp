@@ -1,4 +1,4 @@
-// The run loop with its busy marker and a service manager that is a real socket of ours.
+// The run loop with its busy marker and a service manager simulated by a real socket.
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 #include <sys/time.h>
@@ -23,7 +23,7 @@ class RunLoopTest : public testing::Test {
  protected:
   void TearDown() override { ::unsetenv("NOTIFY_SOCKET"); }
 
-  /// What the manager is told next.
+  /// The next notification to the manager.
   std::string notification() const {
     char text[256];
     ssize_t size = ::recv(_manager.get(), text, sizeof text, 0);

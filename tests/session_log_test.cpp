@@ -1,4 +1,4 @@
-// What sessions and the agent write into the system log: every line, in order, whole and with its level.
+// The system log of sessions and the agent: every line, in order, in full and with its level.
 #include <functional>
 
 #include "tests/support/CapturedLog.h"
@@ -9,8 +9,8 @@ namespace {
 
 class SessionLog : public FamilyHarness {
  protected:
-  /// The lines so far, each behind its level, without those of units that have tables of their own; what
-  /// `names` knows stands there by its name.
+  /// The lines so far, each after its level, without those of units that have their own tests. Values in
+  /// `names` are replaced by their names.
   std::string transcript() const {
     std::string text;
     for (const auto& [level, line] : log.lines()) {
@@ -43,7 +43,7 @@ TEST_F(SessionLog, OfASession) {
   session->uploadFileAtPath("file:///no%20file", "", {});
   session->uploadLogData({1, "b"}, {});
   session->setSessionInfo(sessionInfo(0), userInfo("MyApp"), {}, true);
-  session->setSessionInfo(info, userInfo("MyApp"), {}, false);  // which does not require its user info
+  session->setSessionInfo(info, userInfo("MyApp"), {}, false);  // does not require its user info
   session->setSessionInfo(Dictionary(), {}, {}, false);
   EXPECT_EQ(session.start(), std::nullopt) << "without a client type there is no storebag";
   session->setSessionInfo(info, {}, {}, true);

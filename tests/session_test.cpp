@@ -1,4 +1,4 @@
-// Sessions driven by hand: configuration, dispatch, answers, what they may hold back, and their end.
+// Sessions driven directly: configuration, dispatch, answers, limits on held messages, and their end.
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <unistd.h>
@@ -29,8 +29,8 @@ class Session : public ::testing::Test {
   static void writeFacts(const std::string& facts) {
     testRoot().write("etc/veskreporting/device.toml", facts);
   }
-  /// A section with the backends named; "+" gives one a display URL (http:// and its name), "~" has it hold
-  /// its messages for a batch. A name may come twice.
+  /// A section with the named backends. "+" adds a display URL (http:// and the name); "~" makes the backend
+  /// hold its messages for a batch. A name may occur twice.
   Dictionary storebag(const std::string& backends) const {
     MutableDictionary section;
     std::istringstream words(backends);
@@ -173,7 +173,7 @@ TEST_F(Session, StartAndEndAreTold) {
     session.session.reset();
     const auto posts = harness.posts();
     ASSERT_EQ(posts.size(), before + 2);
-    // They travel on two connections and may arrive in either order.
+    // They are sent on two connections and may arrive in either order.
     const bool inOrder = posts[before].event().at("_status") == 0;
     const auto start = posts[before + !inOrder].event(), end = posts[before + inOrder].event();
     EXPECT_EQ(start.at("AutomaticTimeSet"), isAutomatic);
@@ -217,8 +217,8 @@ TEST_F(Session, ParametersAreCheckedAndCut) {
 
 TEST_F(Session, TheAnswerIsTheHTTPPostBackendsOrTheDashboards) {
   // sent: whose answer: P of httpPost, D of the dashboard
-  // loggedBySend: from whom the message log has one; 2: httpPost2
-  // flushed: and the same of a flush
+  // loggedBySend: whose answer is in the message log; 2: httpPost2
+  // flushed, loggedByFlush: the same for a flush
   const std::tuple<const char*, std::string, std::string, std::string, std::string> rows[] = {
       {"httpPost dashboard", "P", "PD", "", ""},
       {"dashboard httpPost", "P", "PD", "", ""},
@@ -305,7 +305,7 @@ TEST_F(Session, UploadsAreOfferedToEveryBackend) {
     return section.share();
   };
   {
-    // The first one takes the descriptor, which leaves the second none.
+    // The first backend takes the descriptor, so none is left for the second.
     auto session = started(twice("uploadServer", true, true));
     const std::string path = testRoot().write("a.log", "text").string();
     FileDescriptor file(::open(path.c_str(), O_RDONLY));
@@ -436,7 +436,7 @@ TEST(HeldBudget, ASessionPaysWithItsOwnEvents) {
   BackendHarness harness;
   harness.services.heldBudget = std::make_shared<HeldBudget>(
       HeldBudget::Limits{.ofSession = 1 << 20, .ofUser = 2 << 20, .ofAll = 3 << 20});
-  // Each event takes a tenth of a MiB and a little more.
+  // Each event takes slightly more than a tenth of a MiB.
   const Dictionary payload{{"bulk", std::string(100 << 10, 'x')}};
   const std::string of = "HTTPSPostBackend(batchEvent): ";
   const std::string ofBackend = ": dropping the oldest events of backend httpPost";

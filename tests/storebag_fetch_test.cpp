@@ -32,8 +32,8 @@ std::string forClientType(const std::string& text) {
   return "fetchStorebagForEnvironmentAndClientType: " + text;
 }
 
-/// The server, its certificate and the settings are the process's: the daemon reads where the server is once.
-/// The environment is the one without a setting, "seed".
+/// The server, its certificate and the settings exist once per process, since the daemon reads the server's
+/// address only once. The environment is the default, "seed".
 class StorebagFetch : public testing::Test {
  protected:
   static void SetUpTestSuite() {
@@ -77,12 +77,12 @@ class StorebagFetch : public testing::Test {
     return fetchStorebagForEnvironmentAndClientType(http, library, clientType, maxAge, version, notModified,
                                                     &lastModified);
   }
-  /// What the HTTP client calls the failure to fetch that.
+  /// The HTTP client's description of the failure to fetch that storebag.
   std::string errorOf(const std::string& name) {
     return http.perform(storebagRequest(url(name), std::nullopt)).error->description;
   }
-  /// What the fetch logged. The line of the URL, which every fetch begins with, is left out, and so is the
-  /// number of a key, which is another each time.
+  /// The lines of a fetch, without the line with the URL, which begins every fetch, and without the identity
+  /// of a key, which varies.
   Lines lines() const {
     Lines all;
     for (auto [level, line] : log.lines()) {
@@ -232,7 +232,7 @@ TEST_F(StorebagFetch, AnUnreachableServerMeansTheBuiltInStorebagForOneNameOnly) 
   EXPECT_EQ(fetch(7), fallbackStorebag().dictionary("release"));
   EXPECT_FALSE(fetch(8));
   server().start();
-  // An answer of any kind does not mean that.
+  // An answer of any kind does not count as unreachable.
   serve(std::string(std::size_t{5} << 20, ' '));
   EXPECT_FALSE(fetch(7));
   EXPECT_EQ(lines(), (Lines{adding,
@@ -260,7 +260,7 @@ TEST_F(StorebagFetch, AsksOnlyForWhatIsNewer) {
   const std::pair<int, std::string> empty{
       3, withName("propertyListWithData error " + parsePropertyList("").error)};
   const auto good = signedStorebag(payload());
-  // wasNotModified, known, age: what the fetch tells of its answer; its age counts also without content.
+  // wasNotModified, known, age: the outputs of the fetch; an answer without content also sets the age.
   const std::tuple<unsigned, std::string, HTTPHeaderList, bool, std::string, std::int32_t, Lines> cases[] = {
       {200, "", {{"Last-Modified", first}}, false, first, 86400, {junk[1], empty, junk[3], junk[4]}},
       {304,
@@ -270,10 +270,10 @@ TEST_F(StorebagFetch, AsksOnlyForWhatIsNewer) {
        first,
        60,
        {{7, adding}, {7, unchanged}}},
-      // Without the header an empty answer is a failure.
+      // Without the header, an empty answer is a failure.
       {304, "", {}, false, first, 86400, {{7, adding}, empty, junk[3], junk[4]}},
       {200, good, {{"last-modified", second}}, false, second, 86400, {{7, adding}, {7, changed}}},
-      // With content it is no answer of that kind, whatever it says of its age.
+      // An answer with content is not "not modified", whatever its date.
       {200, "junk", {{"Last-Modified", first}}, false, first, 86400, junk}};
   for (const auto& [status, body, headers, wasNotModified, known, age, expectedLines] : cases) {
     SCOPED_TRACE(known + body);
@@ -287,7 +287,7 @@ TEST_F(StorebagFetch, AsksOnlyForWhatIsNewer) {
     EXPECT_EQ(lines(), expectedLines);
   }
 
-  // Without a slot nothing is conditional.
+  // Without `lastModified`, no request is conditional.
   serve(signedStorebag(payload()), {{"Last-Modified", first}});
   EXPECT_TRUE(fetchStorebagWithName(http, library, "zelko", maxAge, notModified, nullptr));
   EXPECT_FALSE(server().requests().back().header("If-Modified-Since"));

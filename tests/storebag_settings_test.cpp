@@ -22,7 +22,7 @@ void writePreferences(std::string_view toml) {
   testRoot().write("etc/veskreporting/preferences/com.corvane.veskreporting.toml", toml);
 }
 
-/// What `body` returns in a process of its own, with the lines it logged before that: "<level> text". Some
+/// Returns the result of `body` in a new process, with the lines that it logged: "<level> text". Some
 /// settings are fixed for the life of a process.
 std::string inNewProcess(const std::function<std::string()>& body) {
   pid_t child = ::fork();

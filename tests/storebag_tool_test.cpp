@@ -43,7 +43,7 @@ TEST(StorebagSource, IsTheSameFromItsOwnTextsInTOMLAndJSON) {
   for (const auto& file :
        {files.write("b.toml", storebagAsTOML(payload)), files.write("b.json", storebagAsJSON(payload))}) {
     auto read = readStorebagSource(file);
-    EXPECT_EQ(storebagAsTOML(read.payload), storebagAsTOML(payload)) << file;  // whatever the order of keys
+    EXPECT_EQ(storebagAsTOML(read.payload), storebagAsTOML(payload)) << file;  // ignores the keys' order
     EXPECT_TRUE(read.warnings.empty()) << file;
   }
 }

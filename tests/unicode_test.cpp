@@ -10,7 +10,7 @@ namespace {
 TEST(Unicode, LowercasesByTheFullMapping) {
   const std::pair<const char*, const char*> cases[] = {
       {"MyApp 42 I", "myapp 42 i"},
-      {"ΟΔΟΣ", "οδος"},       // a final sigma has a form of its own
+      {"ΟΔΟΣ", "οδος"},       // a final sigma has its own form
       {"İ", "i\xCC\x87"},     // becomes two characters
       {"AÄ\xFFZ", "aä\xFFz"}  // not UTF-8
   };

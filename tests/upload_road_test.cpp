@@ -1,4 +1,4 @@
-// Files on the whole road: a client that can be trusted with nothing, the daemon in its sandbox, a collector.
+// File uploads through the full pipeline: an untrustworthy client, the daemon in its sandbox, a collector.
 #include <fcntl.h>
 #include <gtest/gtest.h>
 
@@ -32,7 +32,7 @@ class UploadRoad : public testing::Test {
   std::string file(const std::string& name, const std::string& contents = "contents") const {
     return harness.root.write("var/spool/veskreporting/" + name, contents).string();
   }
-  /// An upload as the collector unpacks it.
+  /// A saved upload, decompressed.
   std::optional<std::string> saved(const std::string& name) const {
     HTTPReceived upload;
     upload.headers = {{"Content-Encoding", "gzip"}};
@@ -68,7 +68,7 @@ TEST_F(UploadRoad, AFileThatShrinksIsRefusedAndOneThatGrowsIsSentAndStays) {
     off_t size = static_cast<off_t>(step > 0 ? kMiB : 96 * kMiB);  // large: it must shrink while it is read
     FileDescriptor descriptor(::open(path.c_str(), O_RDWR | O_CLOEXEC));
     ASSERT_EQ(::ftruncate(descriptor.get(), size), 0);
-    if (step > 0) harness.setFault("upload=slow");  // it must grow before the answer is there
+    if (step > 0) harness.setFault("upload=slow");  // it must grow before the answer arrives
     std::atomic<bool> stop{false};
     std::thread changing([&] {
       while (!stop) {

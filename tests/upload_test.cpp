@@ -1,4 +1,4 @@
-// The file upload backend against a real server: what it sends, what it refuses, what it removes.
+// The file upload backend against a real server: what it sends, refuses and removes.
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sched.h>
@@ -33,7 +33,7 @@ FileDescriptor opened(const std::string& path, int flags = O_RDONLY) {
 }
 
 std::string token(FileDescriptor descriptor, uid_t user = ::getuid()) {
-  static std::uint64_t connection = 0;  // which may have few of them
+  static std::uint64_t connection = 0;  // the number of tokens per connection is limited
   return ExtensionTokens::shared().add({++connection, user}, std::move(descriptor));
 }
 
@@ -43,7 +43,7 @@ HTTPAnswer says(const char* text, unsigned status = 200) {
   return answer;
 }
 
-/// How many descriptors of this process are that file, whatever it is called by now.
+/// How many of this process's descriptors refer to that file, whatever its name.
 int openCount(const struct stat& file) {
   int count = 0;
   struct stat status {};
@@ -190,7 +190,7 @@ TEST_F(UploadTest, BelievesAPathThatItCanNotSee) {
   struct stat hidden {};
   ASSERT_EQ(::stat(path.c_str(), &hidden), 0);
   EXPECT_EQ(openCount(hidden), 0);
-  // A thread with mounts of its own, as a service with PrivateTmp= has them.
+  // A thread with its own mounts, like a service with PrivateTmp=.
   std::thread([&] {
     const std::string covered = directory.path() / "hidden";
     const std::string seen = token(opened(path));
@@ -244,7 +244,7 @@ TEST_F(UploadTest, AServerThatCanNotBeReachedCostsNothing) {
   EXPECT_TRUE(upload(path));
   EXPECT_TRUE(fs::exists(path));
   auto [level, line] = log.lines().back();
-  // It says how many milliseconds it took.
+  // The line contains the duration in milliseconds.
   for (std::string* text : {&expected, &line})
     std::erase_if(*text, [](char c) { return c >= '0' && c <= '9'; });
   EXPECT_EQ(level, 3);
@@ -287,11 +287,11 @@ TEST_F(UploadTest, AServerThatHangsHoldsUpNobodyElse) {
   EXPECT_EQ(log.count(3, kUnit + "Too many uploads are under way"), 1);
 }
 
-#if !defined(__SANITIZE_THREAD__) && !defined(__SANITIZE_ADDRESS__)  // these have memory of their own
+#if !defined(__SANITIZE_THREAD__) && !defined(__SANITIZE_ADDRESS__)  // they replace operator new
 TEST_F(UploadTest, WithoutMemoryFailsAndGoesOn) {
   const std::string path = file();
   const std::string lent = token(opened(path));
-  SystemLog::setLevel(3);  // so that no line takes memory first
+  SystemLog::setLevel(3);  // so that no line allocates first
   {
     ScarceMemory scarce;
     EXPECT_FALSE(backend->uploadFileAtPath(path, lent));
@@ -308,7 +308,7 @@ TEST_F(UploadTest, TakesItsUsersShareForTheFileAndItsCompressedForm) {
   const uid_t user = ::getuid();
   bool hasRoomMeanwhile = false;
   answer = [&] {
-    // What the compressed form takes is little, but it is one upload of this user's.
+    // The compressed form takes little memory, but it still counts as one upload of this user.
     hasRoomMeanwhile = services.uploads->enter(user + 1, 190'000) && !services.uploads->enter(user, 0);
     return says("received");
   };

@@ -47,7 +47,7 @@ TEST(Counters, HaveANameForEveryReason) {
 }
 
 TEST(SamplingDraw, FollowsTheDefaultSequence) {
-  // What drand48 gives to a program that never seeds it.
+  // The values of drand48 in a program that never seeds it.
   EXPECT_NEAR(nextSamplingDraw(), 0.0, 1e-9);
   EXPECT_NEAR(nextSamplingDraw(), 0.000985394675650, 1e-12);
   EXPECT_NEAR(nextSamplingDraw(), 0.041631001594613, 1e-12);

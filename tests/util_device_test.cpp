@@ -1,4 +1,4 @@
-// The device-information query and what is built on it.
+// The device-information query and the functions built on it.
 #include <gtest/gtest.h>
 
 #include <cmath>
@@ -30,8 +30,8 @@ TEST_F(Device, EachFactHasAKeyAndSourcesInOrder) {
   struct Fact {
     const char* key;
     std::optional<Text> (*getter)();
-    const char* system;                 // os-release, where the firmware says nothing
-    std::vector<std::string> firmware;  // in order
+    const char* system;                 // from os-release, if the firmware has no value
+    std::vector<std::string> firmware;  // in order of preference
   };
   const std::string dmi = "sys/class/dmi/id/";
   const std::string tree = "proc/device-tree/";
@@ -48,7 +48,7 @@ TEST_F(Device, EachFactHasAKeyAndSourcesInOrder) {
     testRoot().write("etc/os-release",
                      "XNAME=x\nNAME=\"Debian\" \nNAME=second\nVERSION_ID=\"12\"\nBUILD_ID='22F82'\n");
     testRoot().write(kFacts, std::string(fact.key) + "X = \"other\"\n");
-    auto expected = firmwareFact(fact.key);  // this machine's own
+    auto expected = firmwareFact(fact.key);  // this machine's own value
     if (!expected && fact.system) expected = fact.system;
     EXPECT_EQ(QNCopyAnswer(fact.key), expected);
     EXPECT_EQ(fact.getter(), expected ? std::optional<Text>(*expected) : std::nullopt);
@@ -115,7 +115,7 @@ TEST_F(Device, CopiesItsIdentifierIntoABuffer) {
   const std::string kept(50, 'x');
   const std::string identifier(40, 'a');
   const std::string facts = "UniqueDeviceID = \"" + identifier + "\"\n";
-  // The buffer to its own end and one byte more.
+  // The buffer up to its end, and one byte more.
   using Case = std::tuple<std::string, std::size_t, std::string>;
   for (const auto& [fact, size, after] :
        {Case{"", 41, kept.substr(0, 42)}, Case{facts, 41, identifier + '\0' + 'x'},
@@ -174,7 +174,7 @@ TEST_F(Device, HasNoConsentUnlessItWasGiven) {
 }
 
 TEST_F(Device, RunsAnInternalBuildOnlyWhenItSaysSoAndForGood) {
-  // What is found out first stays for the life of the process, so each answer takes a process of its own.
+  // The first result is kept for the life of the process, so each case needs its own process.
   const auto exitStatus = [](const char* facts) {
     testRoot().write(kFacts, facts);
     std::_Exit(isInternalBuild() ? 1 : 0);

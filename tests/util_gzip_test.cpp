@@ -9,7 +9,7 @@
 
 namespace {
 
-std::optional<int> beginsWith;  // what zlib answers in place of doing anything
+std::optional<int> beginsWith;  // zlib's result, returned without doing anything
 std::optional<int> deflatesWith;
 
 }  // namespace

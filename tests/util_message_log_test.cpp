@@ -46,7 +46,7 @@ class MessageLogTest : public testing::Test {
   std::string path(const std::string& name) const { return (_logs / name).string(); }
   std::string read(const std::string& name) const { return _root.read("logs/" + name); }
   void make(const std::string& name) const { _root.write("logs/" + name, "before\n"); }
-  /// Makes the file again until it is younger than `other`.
+  /// Creates the file again until it is younger than `other`.
   void makeYounger(const std::string& name, const std::string& other) const {
     do {
       fs::remove(_logs / name);
@@ -56,7 +56,7 @@ class MessageLogTest : public testing::Test {
   std::string deleted(const std::string& name, const std::string& date) const {
     return "writeToLogFile: Deleted expired veskreportingd log file " + path(name) + " (" + date + ")";
   }
-  /// The directory looks as if its last change had been that long ago.
+  /// Makes the directory's last change look `age` old.
   void setAge(seconds age) const {
     const auto when = std::chrono::system_clock::now() - age;
     const timespec time{std::chrono::system_clock::to_time_t(when), 0};
@@ -75,7 +75,7 @@ class MessageLogTest : public testing::Test {
       if (count.backend == "message-log" && count.reason == DropReason::NotRecorded) sum += count.count;
     return sum;
   }
-  /// Files take no more than 20 bytes meanwhile.
+  /// Writes a line while files are limited to 20 bytes.
   void writeWithoutRoom(MessageLog& log) const {
     ::signal(SIGXFSZ, SIG_IGN);
     rlimit before{};
@@ -199,8 +199,8 @@ TEST_F(MessageLogTest, SeesWhatHappensToItsFileBetweenTwoLines) {
   const std::string one = "before\n(2026-11-24 20:31:29 +0000) one\n";
   struct Case {
     std::function<void()> happens;
-    std::string file;   // that gets the next line
-    std::string start;  // of that file
+    std::string file;   // which receives the next line
+    std::string start;  // beginning of that file
   };
   const Case cases[] = {
       {[] {}, kFirst, one},
@@ -242,7 +242,7 @@ TEST_F(MessageLogTest, EveryLineThatIsLostIsCountedAndSaidWhy) {
   struct Case {
     std::string directory;
     std::function<void()> prepare;
-    Lines lines;  // none: the file is deleted
+    Lines lines;  // empty: the file is deleted
   };
   const Case cases[] = {
       {notHere,
@@ -316,7 +316,7 @@ TEST(LogFormat, ShowsEveryValueByItsOwnType) {
        {1.005, 0.5, 3, 2u, 1.0, 2, 1e-9},
        "1.00 0.5 3.000000 2.000000 1.000000e+00 2.000000E+00 1E-09"},
       {"100%% %@%%", x, "100% x%"},
-      // What does not fit still shows its value, and nothing reads what is not there.
+      // A placeholder of the wrong type still prints the value, and missing arguments are never read.
       {"%d %f %x", {"text", "text", "text"}, "text text text"},
       {"%d %u %x %d", {1.5, -1, -1, UINT64_MAX}, "1.5 -1 ffffffffffffffff 18446744073709551615"},
       {"%@ %@ %5d|", {"one"}, "one %@ %5d|"},

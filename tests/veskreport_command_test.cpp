@@ -1,4 +1,4 @@
-// Runs the veskreport program against a daemon's end that keeps a record, and against none.
+// Runs the veskreport program with a recording daemon, and without one.
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -32,7 +32,7 @@ class VeskreportCommand : public testing::Test {
     ChildProcess process(ChildProcess::Options{.command = std::move(arguments), .input = std::move(input)});
     return {process.wait().value_or(-1), process.output(), process.errors()};
   }
-  /// With the options of a client of the recording daemon.
+  /// Runs it with the options of a client of the recording daemon.
   Outcome runClient(std::vector<std::string> arguments, std::string input = {}) const {
     for (const char* more : {"--root", root.c_str(), "--client-type", "5", "--session-id", "7"})
       arguments.emplace_back(more);

@@ -1,4 +1,4 @@
-// D-Bus messages: what arrives, what is refused, and whether other implementations agree.
+// D-Bus messages: which are accepted, which are refused, and compatibility with other implementations.
 #include <gtest/gtest.h>
 
 #include <limits>
@@ -22,7 +22,7 @@ constexpr char kObjectPath[] = "/test";
 constexpr char kInterface[] = "test.Interface";
 constexpr std::size_t kShown = 1 << 20;
 
-// Inside a dictionary: any more, and the receiver refuses the message.
+// The deepest nesting inside a dictionary that receivers accept.
 constexpr int kDeepest = 41;
 
 Value nested(int depth) {
@@ -31,7 +31,7 @@ Value nested(int depth) {
   return value;
 }
 
-/// A value of every kind, and the extremes of some.
+/// A value of every kind, with extremes of some.
 Dictionary mixed() {
   return {{"none", Value()},
           {"no", false},
@@ -49,7 +49,7 @@ Dictionary mixed() {
           {"mixed", Dictionary{{"x", Dictionary{{"y", List{Date{1}, true}}}}}}};
 }
 
-/// Every type of argument, with and without what may be absent.
+/// Arguments of every type, with and without optional ones.
 std::vector<IPCArgument> arguments(bool full) {
   using Texts = std::vector<std::string>;
   if (!full) {
@@ -112,7 +112,7 @@ class Echo final : public IPCExportedObject, public IPCListenerDelegate {
   std::unique_ptr<IPCListener> _listener;
 };
 
-// GIO and libdbus send each type in both byte orders, and compare what comes back.
+// GIO and libdbus send each type in both byte orders and compare the answers.
 TEST(Wire, UnderstandsOtherImplementations) {
   Echo echo;
   ChildProcess peers({VESK_PYTHON, VESK_WIRE_PEERS, echo.socket()});
@@ -191,7 +191,7 @@ TEST(Wire, IsReadBySdBusAsItWasWritten) {
   }
 }
 
-// Whatever bit of a message is wrong, both readers refuse it, or read the same.
+// For every changed bit of a message, both readers refuse it or read the same.
 TEST(Wire, AgreesWithSdBusOnBrokenMessages) {
   BusServer server;
   int read = 0;
@@ -199,13 +199,13 @@ TEST(Wire, AgreesWithSdBusOnBrokenMessages) {
   int lax = 0;
   auto compare = [&](const std::string& bytes, std::size_t at) {
     const auto size = messageSize(bytes);
-    if (!size || *size != bytes.size()) return;  // another frame: both wait for more, or end the connection
+    if (!size || *size != bytes.size()) return;  // another length: both wait, or end the connection
     const std::string here = readHere(bytes);
     const std::string there = readBySdBus(server, bytes);
     ++(here == "refused" ? refused : read);
     if (here == there) return;
     ++lax;
-    // sd-bus takes bodies without a signature, excess bytes, booleans beyond one, and bytes in the padding.
+    // sd-bus accepts bodies without a signature, excess bytes, booleans above one, and nonzero padding.
     EXPECT_EQ(here, "refused") << "byte " << at << ": " << there;
   };
   const std::string ordinary =
@@ -262,7 +262,7 @@ TEST(Wire, AgreesWithSdBusOnNamesAndTypes) {
   }
 }
 
-/// A header of these fields, each a code, a type and a value, with nothing behind it.
+/// A header with these fields, each a code, a type and a value, without a body.
 std::string headerOnly(char type, const std::vector<std::tuple<char, const char*, std::string>>& list) {
   Marshalled fields(false);
   for (const auto& [code, signature, value] : list) {

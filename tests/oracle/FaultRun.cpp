@@ -59,7 +59,7 @@ void FaultRun::disturb() {
 }
 
 void FaultRun::injectOne() {
-  // Server errors (5xx) are left out: they switch a backend off, and everything after that is a counted drop.
+  // Without server errors (5xx): they disable a backend, and everything after that is a counted drop.
   const auto drawn = _random() % 35;
   if (drawn < 8) return answerBadly();
   if (drawn < 11) return stallPosts();
@@ -81,7 +81,7 @@ void FaultRun::answerBadly() {
   _harness.setFault(fault);
 }
 
-// Posts that are not answered take the daemon's connections; only the collector's end frees them soon.
+// Unanswered posts occupy the daemon's connections. Only the collector's end frees them soon.
 void FaultRun::stallPosts() {
   const std::string fault = "post=stall*" + std::to_string(upTo(8));
   say("collector: " + fault + ", then restarted");
@@ -123,7 +123,8 @@ void FaultRun::terminateDaemonInOutage() {
   _harness.stopCollector();
   pause(200, 1000);
   endDaemon(DaemonEnd::Terminated);
-  // Without it, the next daemon would get no storebag, and would not ask again for a quarter of an hour.
+  // Without a collector, the next daemon would get no storebag, and would not try again for a quarter of an
+  // hour.
   _harness.startCollector();
   startDaemon();
 }
@@ -174,7 +175,7 @@ bool FaultRun::clientEnded(std::size_t index, int status) {
 
 bool FaultRun::judge() {
   say("no more faults");
-  restartCollector();  // takes the planned faults and the stalled posts with it
+  restartCollector();  // also removes the planned faults and the stalled posts
   _page->stop = true;
   for (std::size_t i = 0; i < _clients.size(); ++i) {
     if (!clientEnded(i, 0)) throw std::runtime_error("a client does not end as it should");

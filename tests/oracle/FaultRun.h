@@ -1,4 +1,4 @@
-// What the oracle does to the processes while the clients send.
+// The oracle's faults while the clients send.
 #pragma once
 
 #include <chrono>
@@ -15,9 +15,8 @@
 
 namespace vesk::test {
 
-/// Runs daemon, collector and clients, and disturbs them by a plan that follows from the seed alone. What a
-/// process does that it should not (a crash, an exit status, an end that takes too long) throws
-/// std::runtime_error.
+/// Runs daemon, collector and clients, and disturbs them by a plan that depends only on the seed. Throws
+/// std::runtime_error if a process misbehaves (a crash, a wrong exit status, an end that takes too long).
 class FaultRun {
  public:
   struct Options {
@@ -25,12 +24,12 @@ class FaultRun {
     std::int64_t seconds = 25;
     std::size_t clients = 4;
   };
-  /// Everything runs once it is made.
+  /// Starts everything.
   explicit FaultRun(Options options);
 
   void disturb();
-  /// Ends the faults and lets everything that is held come out: the clients end, a fresh message arrives, the
-  /// daemon is terminated. True when what had been promised arrived.
+  /// Ends the faults and lets all held messages out: the clients end, a fresh message arrives, the daemon is
+  /// terminated. Returns true if everything promised has arrived.
   bool judge();
 
  private:
@@ -47,7 +46,8 @@ class FaultRun {
   void endDaemon(DaemonEnd end);
   void restartCollector();
   void startClient(std::size_t index);
-  /// Waits for it and takes its report; false when it does not end, or ended otherwise than with `status`.
+  /// Waits for the client and reads its report. Returns false if it does not end or its status is not
+  /// `status`.
   bool clientEnded(std::size_t index, int status);
   void sendFreshMessage();
 

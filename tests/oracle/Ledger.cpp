@@ -13,7 +13,8 @@ namespace {
 
 constexpr std::string_view kLossLine = "main: Lost since the start: ";
 
-// What the collector should have got, and what no backend was there for; not uploads, datagrams or records.
+// Losses of events that the collector should have received or that had no backend; not uploads, datagrams or
+// records.
 bool concernsEvents(std::string_view backend, std::string_view reason) {
   return backend == "httpPost" || reason == "no-backend" || reason == "invalid-message";
 }
@@ -50,7 +51,7 @@ void Ledger::clientReported(std::string_view output) {
 void Ledger::readEvents(const std::string& path) {
   std::ifstream file(path, std::ios::binary);
   file.seekg(_read);
-  for (std::string line; std::getline(file, line) && !file.eof();) {  // at the end: still being written
+  for (std::string line; std::getline(file, line) && !file.eof();) {  // the last line is still being written
     _read += static_cast<std::streamoff>(line.size() + 1);
     readEvent(line);
   }
@@ -60,7 +61,7 @@ void Ledger::readEvent(const std::string& line) {
   const auto parsed = boost::json::parse(line);
   const auto& event = parsed.at("event").as_object();
   const auto* id = event.if_contains(OracleMessage::kIDKey);
-  if (id == nullptr) return;  // a session's own
+  if (id == nullptr) return;  // one of a session's own messages
   const std::string change =
       id->is_int64() ? OracleMessage(id->as_int64()).changeIn(event) : OracleMessage::kIDKey;
   if (!change.empty()) return _changed.push_back(change + " in " + boost::json::serialize(event));
@@ -94,7 +95,7 @@ bool Ledger::judge() const {
     accepted += account.accepted.size();
     if (incarnation != _accounts.begin()->first) afterwards += account.accepted.size();
   }
-  // The last daemon may come so late that no client reaches it.
+  // The last daemon may start too late for any client to reach it.
   if (accepted == 0 || (_accounts.size() > 2 && afterwards == 0)) {
     std::printf("oracle: NOTHING was accepted%s\n", accepted == 0 ? "" : " after the first daemon's end");
     isGood = false;

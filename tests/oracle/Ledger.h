@@ -1,4 +1,4 @@
-// What was promised, what arrived, and what the daemons say they lost.
+// What was promised, what arrived, and the daemons' own accounts of their losses.
 #pragma once
 
 #include <cstdint>
@@ -11,35 +11,34 @@
 
 namespace vesk::test {
 
-/// How one daemon ended.
+/// How a daemon ended.
 enum class DaemonEnd : std::uint8_t {
-  Terminated,  ///< by SIGTERM: it said what it lost
-  Killed,      ///< by SIGKILL: what it held is gone, and nobody could say so
+  Terminated,  ///< by SIGTERM: it reported its losses
+  Killed,      ///< by SIGKILL: what it held is lost without a report
 };
 
-/// The oracle's books, one account for each daemon that ran ("incarnation", from 1).
+/// The oracle's books, with one account for each daemon that ran ("incarnation", from 1).
 ///
-/// *Accepted* by a daemon is a message that its client reported as confirmed (`OracleClient`).
+/// A message is *accepted* by a daemon if its client reported it as confirmed (`OracleClient`).
 ///
-/// *Covered* is a loss that the daemon counted. The counters (`util/Counters.h`) know how many events were
-/// lost, not which: of the messages that a daemon accepted, at most as many may be missing as the lines that
-/// it writes at its end
-/// ("main: Lost since the start: BACKEND REASON COUNT") add up to. They also count the sessions' own start
-/// and end messages and messages that were never confirmed, so a loss could hide behind these; the fewer
-/// drops are counted, the sharper the judgement, and with none it is exact. Losses of a killed daemon are
-/// excused, and shown.
+/// A loss is *covered* if the daemon counted it. The counters (`util/Counters.h`) tell how many events were
+/// lost, but not which: of the messages that a daemon accepted, at most the total of its final lines ("main:
+/// Lost since the start: BACKEND REASON COUNT") may be missing. The counters also include the sessions' own
+/// start and end messages and messages that were never confirmed, so these can hide a loss. The fewer drops
+/// are counted, the sharper the judgement; without drops it is exact. Losses of a killed daemon are excused,
+/// and shown.
 ///
-/// *Unchanged* is checked of every message that arrived, accepted or not.
+/// Every message that arrives, accepted or not, is checked to be *unchanged*.
 class Ledger {
  public:
   void daemonEnded(std::uint64_t incarnation, DaemonEnd end, std::string_view log);
   void clientReported(std::string_view output);
-  /// Reads what the collector's event file has more since the last time.
+  /// Reads what was added to the collector's event file since the last call.
   void readEvents(const std::string& path);
   bool hasArrived(std::int64_t id) const { return _arrived.contains(id); }
 
-  /// Prints the accounts. True when every daemon's losses are covered, nothing was changed, and messages were
-  /// accepted at all, also by those who came back after a restart.
+  /// Prints the accounts. Returns true if every daemon's losses are covered, no message was changed, and
+  /// messages were accepted, including some after a restart.
   bool judge() const;
 
  private:

@@ -46,7 +46,7 @@ void OracleClient::runSession() {
   if (!start(session)) return;
   bool goesOn = true;
   for (auto rounds = upTo(30); rounds > 0 && goesOn && !_page->stop; --rounds) {
-    // Most outages stay below the daemon's bounds then: with nothing dropped, the judgement is exact.
+    // Keeps most outages below the daemon's limits: without drops, the judgement is exact.
     std::this_thread::sleep_for(std::chrono::milliseconds(upTo(200)));
     const auto kind = _random() % 10;
     if (kind < 5) goesOn = sendOneWay(session, 0);
@@ -95,7 +95,7 @@ bool OracleClient::sendOnce(VeskReporting& session) {
   auto sent = session.sendMessageOnceAndWait(sessionInfo(first, false, false), kUser, message.category(),
                                              message.type(), message.payload(), kAnswerTime);
   if (sent && sent.answer == "finished") confirm(first, incarnation);
-  return false;  // the session is another now
+  return false;  // the session is a different one now
 }
 
 void OracleClient::confirm(std::int64_t first, std::uint64_t incarnation) {

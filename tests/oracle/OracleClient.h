@@ -11,18 +11,18 @@
 
 namespace vesk::test {
 
-/// Sends messages in sessions of all kinds until the page says stop, and reports on standard output what the
-/// daemon confirmed, one line a range: "accepted FIRST LAST INCARNATION". It may be killed at any moment;
-/// what it has written then counts.
+/// Sends messages in all kinds of sessions until the page says stop. Reports on standard output what the
+/// daemon confirmed, one line per range: "accepted FIRST LAST INCARNATION". It may be killed at any time;
+/// what it has written remains valid.
 ///
-/// Confirmed are a message whose own answer came, and one-way messages in front of a flush whose answer came,
-/// all sent and answered while one daemon lived.
+/// A message is confirmed if its own answer came, or, for a one-way message, if the answer to a later flush
+/// came, and everything was sent and answered during the life of one daemon.
 class OracleClient {
  public:
-  /// Numbers its messages from `firstID`; the same one decides what it does.
+  /// Numbers its messages from `firstID`, which also seeds its random choices.
   OracleClient(std::string socketPath, const std::string& pagePath, std::int64_t firstID);
 
-  /// The process's exit status.
+  /// Returns the process's exit status.
   int run();
 
  private:
@@ -31,7 +31,7 @@ class OracleClient {
   bool sendOneWay(VeskReporting& session, int flag);
   bool sendAnswered(VeskReporting& session);
   bool sendOnce(VeskReporting& session);
-  /// Reports the messages from `first` on when the daemon that is there now was there at `incarnation`.
+  /// Reports the messages from `first` on if the current daemon is still that of `incarnation`.
   void confirm(std::int64_t first, std::uint64_t incarnation);
   std::uint64_t upTo(std::uint64_t most) { return 1 + _random() % most; }
 

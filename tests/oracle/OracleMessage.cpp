@@ -8,7 +8,7 @@ namespace vesk::test {
 
 namespace {
 
-// Steele, Lea and Flood's mixer: neighbouring numbers get messages that have nothing in common.
+// Steele, Lea and Flood's mixer, so that consecutive numbers give unrelated messages.
 std::uint64_t mixed(std::uint64_t number) {
   number += 0x9e3779b97f4a7c15U;
   number = (number ^ (number >> 30)) * 0xbf58476d1ce4e5b9U;
@@ -16,7 +16,7 @@ std::uint64_t mixed(std::uint64_t number) {
   return number ^ (number >> 31);
 }
 
-// What a body has to escape, and what it has to leave alone.
+// Text that a body must escape, and text that it must not.
 constexpr const char* kPieces[] = {"plain ", "\"quoted\" ", "back\\slash ",     "line\nfeed ",
                                    "\x01",   "ünïcödé ",    "\xf0\x9f\x9a\x80", "</tag>"};
 
@@ -26,7 +26,7 @@ OracleMessage::OracleMessage(std::int64_t id) : _id(id), _hash(mixed(static_cast
 
 std::string OracleMessage::text() const {
   std::string text;
-  // Now and then a long one, which does not go the way of the ordinary ones.
+  // Sometimes a long message, which is processed differently from ordinary ones.
   const std::size_t pieces = _hash % 97 == 0 ? 2000 : _hash % 20;
   for (std::uint64_t i = 0; i < pieces; ++i) text += kPieces[mixed(_hash + i) % std::size(kPieces)];
   return text;

@@ -9,20 +9,20 @@
 
 namespace vesk::test {
 
-/// Everything in a message follows from its number: whoever finds one can tell whether it arrived unchanged.
+/// Everything in a message depends on its number, so anyone who finds one can tell whether it is unchanged.
 class OracleMessage {
  public:
   static constexpr char kIDKey[] = "oracleID";
 
   explicit OracleMessage(std::int64_t id);
 
-  /// As the client library takes it. `flag`: 1 realtime, else 0.
+  /// In the client library's form. `flag`: 1 realtime, otherwise 0.
   Dictionary parameters(int flag) const;
   std::uint16_t category() const { return static_cast<std::uint16_t>(2 + _hash % 7); }
   std::uint16_t type() const { return static_cast<std::uint16_t>(2 + _hash % 5); }
   Dictionary payload() const;
 
-  /// The first entry of the event that is not what it should be; empty when it is unchanged.
+  /// The name of the first entry of the event that has changed; empty if it is unchanged.
   std::string changeIn(const boost::json::object& event) const;
 
  private:

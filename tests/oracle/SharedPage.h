@@ -1,4 +1,4 @@
-// The little that the oracle and its client processes tell each other while they run.
+// Data that the oracle and its client processes share while they run.
 #pragma once
 
 #include <fcntl.h>
@@ -14,19 +14,20 @@
 
 namespace vesk::test {
 
-/// A file that all of them map. Each word is synchronised by itself.
+/// A file that all of them map. Each word is atomic.
 class SharedPage {
  public:
   struct Words {
-    /// Which daemon may be running: counted up when the one before is certainly dead, before the next is
-    /// started. So whatever began and ended under one number was done by one daemon.
+    /// The number of the daemon that may be running. Incremented after the previous daemon is certainly dead
+    /// and before the next is started, so everything that begins and ends under one number was done by one
+    /// daemon.
     std::atomic<std::uint64_t> incarnation;
-    /// Set once: the clients finish their round and end.
+    /// Set once. The clients then finish their round and end.
     std::atomic<bool> stop;
   };
   static_assert(std::atomic<std::uint64_t>::is_always_lock_free, "works between processes");
 
-  /// Made when it is missing. Throws std::runtime_error.
+  /// Creates the file if missing. Throws std::runtime_error.
   explicit SharedPage(const std::string& path) {
     FileDescriptor file(::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
     if (!file || ::ftruncate(file.get(), sizeof(Words)) != 0) throw std::runtime_error("no page " + path);

@@ -1,5 +1,5 @@
-// veskoracle: are messages lost that should not be? Runs clients, daemon and collector, disturbs them by a
-// plan, and judges (Ledger.h says how).
+// veskoracle: looks for messages that are lost but should not be. Runs clients, daemon and collector,
+// disturbs them by a plan, and judges the result (see Ledger.h).
 #include <CLI/CLI.hpp>
 #include <cstdio>
 #include <cstdlib>
