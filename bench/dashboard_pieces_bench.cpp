@@ -1,5 +1,5 @@
-// What a datagram costs inside the daemon, beside the system call alone, and what its line in the message log
-// costs. Both count the CPU time of all threads.
+// The cost of a datagram within the daemon, compared with the system call alone, and of its line in the
+// message log. Both measure the CPU time of all threads.
 #include <benchmark/benchmark.h>
 
 #include <cstdlib>
@@ -27,7 +27,7 @@ Dictionary payload() {
           {"ratio", 0.3333}};
 }
 
-/// Takes datagrams without reading them; a full buffer drops what comes.
+/// Receives datagrams without reading them; a full buffer drops further ones.
 struct Sink {
   Sink() {
     if (socket.open() != 0 || socket.bind({0x7F00'0001, 0}) != 0) std::abort();

@@ -1,7 +1,7 @@
-// Where the dashboard bench's datagrams end: acknowledges those that ask for it and counts.
+// The receiver for the dashboard bench: counts datagrams, and acknowledges those that ask for it.
 //
 // Usage: datagram_sink FIRST-FILE
-// Writes its port to FIRST-FILE and prints "datagrams N" for each line of standard input, until that ends.
+// Writes its port to FIRST-FILE and prints "datagrams N" for each line of standard input, until its end.
 #include <poll.h>
 #include <unistd.h>
 

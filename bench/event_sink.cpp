@@ -1,8 +1,8 @@
-// Where the end-to-end bench's events end: counts each message id.
+// The receiver for the end-to-end bench: counts the events with each message ID.
 //
 // Usage: event_sink FIRST-FILE [tls]
-// Writes its port (and with tls the authority's certificate beside it) to FIRST-FILE, then serves until
-// standard input ends; then prints "events E distinct D".
+// Writes its port (and, with tls, the authority's certificate beside it) to FIRST-FILE. Serves until standard
+// input ends, then prints "events E distinct D".
 #include <cstdio>
 #include <cstring>
 #include <fstream>
@@ -17,7 +17,7 @@ namespace {
 
 class IdCounter {
  public:
-  // Each event holds "msgid":N once; nothing else of the body is looked at, to leave the cores to the others.
+  // Each event contains "msgid":N once. The rest of the body is ignored, to leave the cores to the others.
   void count(const std::string& body) {
     static constexpr char kKey[] = "\"msgid\":";
     std::lock_guard lock(_mutex);

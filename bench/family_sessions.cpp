@@ -1,8 +1,8 @@
-// Holds many sessions in families, for bench/family_cost.
+// Keeps many sessions in families, for bench/family_cost.
 //
 // Usage: family_sessions SOCKET FIRST COUNT [FAMILY-SIZE]
-// Starts the sessions FIRST to FIRST + COUNT - 1, five (or at most that many) to a family in three levels,
-// prints "ready", and ends them with its standard input.
+// Starts the sessions FIRST to FIRST + COUNT - 1, five (or FAMILY-SIZE, if smaller) per family in three
+// levels, prints "ready", and ends them when its standard input ends.
 #include <VeskReporting/VeskReporting.h>
 #include <VeskReporting/VeskReportingKeys.h>
 

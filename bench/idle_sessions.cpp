@@ -1,7 +1,7 @@
-// Clients that configure and start a session each, and then have nothing to say.
+// Clients that each configure and start a session and then stay idle.
 //
 // Usage: idle_sessions SOCKET COUNT
-// Prints "ready" once all have started and stays until standard input ends.
+// Prints "ready" once all have started, and stays until standard input ends.
 #include <VeskReporting/VeskReporting.h>
 #include <VeskReporting/VeskReportingKeys.h>
 

@@ -1,4 +1,4 @@
-// What each piece of a message's road costs by itself.
+// The cost of each step in processing a message.
 #include <VeskReporting/VeskReportingKeys.h>
 #include <benchmark/benchmark.h>
 #include <sys/socket.h>
@@ -18,7 +18,7 @@
 namespace vesk {
 namespace {
 
-/// Eight mixed fields, as the end-to-end bench sends them.
+/// Eight mixed fields, as in the end-to-end bench.
 Dictionary payload() {
   return Dictionary{{"msgid", 123456},
                     {"view", "Preferences/Network"},
@@ -33,7 +33,7 @@ Dictionary payload() {
 const Dictionary kUserInfo{{kVeskReportingUserInfoClientName, "Bench"},
                            {kVeskReportingUserInfoServiceName, "EndToEnd"}};
 
-/// A backend that makes, filters and holds records as in service, with nowhere to post them.
+/// A backend that creates, filters and holds records as in service, but has nowhere to post them.
 std::shared_ptr<VeskReportingBackend> makeBackend(BackendServices& services) {
   Dictionary entry{{"locale_whitelist", List{"US"}},
                    {"sampling_threshold", 1.0},
@@ -72,7 +72,7 @@ class Services {
   QueueThread _queues;
 };
 
-/// A whole message as a client sends it.
+/// A complete message as sent by a client.
 std::string call() {
   std::string message;
   if (appendCall("/o", {"i.f", "m", {payload()}}, message) != CodecResult::Ok) std::abort();
@@ -102,7 +102,7 @@ void writeCall(benchmark::State& state) {
 }
 BENCHMARK(writeCall);
 
-/// Record, user info, filters and the place in the batch; the batch is given up every 50 events.
+/// Record, user info, filters and the place in the batch, which is discarded every 50 events.
 void recordAndFilter(benchmark::State& state) {
   Services shared;
   auto backend = makeBackend(shared.services);

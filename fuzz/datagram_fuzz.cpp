@@ -1,5 +1,5 @@
-// Datagrams of dashboards in both directions: what the collector makes of any bytes, what the daemon makes of
-// any acknowledgement, and that the collector reads whatever the daemon writes.
+// Datagrams of dashboards in both directions: the collector reads any bytes, the daemon any acknowledgement,
+// and the collector reads whatever the daemon writes.
 #include <cstdint>
 #include <cstdlib>
 
@@ -29,7 +29,7 @@ void decode(std::string_view bytes) {
   require(jsonLine(*outcome.datagram) != "null\n");
 }
 
-/// Keys and values are what stands between NULs.
+/// NULs separate keys and values.
 void encode(std::string_view bytes) {
   MutableDictionary payload;
   while (!bytes.empty()) {

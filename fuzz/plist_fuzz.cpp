@@ -1,4 +1,4 @@
-// Property lists of both encodings and keyed archives: whatever is read can be written and reads back the
+// Property lists in both encodings and keyed archives: whatever is read can be written, and reads back the
 // same.
 #include <cstdint>
 #include <cstdlib>
@@ -16,8 +16,8 @@ void require(bool condition) {
   if (!condition) std::abort();
 }
 
-/// NaN is unlike itself, and XML cuts dates to seconds: what counts is what is shown, of the first so many
-/// bytes.
+/// Compares descriptions of the values, limited to `shown` bytes, because NaN differs from itself and XML
+/// truncates dates to seconds.
 void roundTrip(const Value& value, const std::optional<std::string>& written, PropertyListFlavor flavor,
                std::size_t shown) {
   if (!written || written->size() > PropertyListLimits{}.bytes) return;

@@ -1,4 +1,4 @@
-// The fuzz targets as ordinary tests: each seed as it stands, cut after each byte, and with each byte
+// Runs the fuzz targets as ordinary tests: each seed unchanged, cut after each byte, and with each byte
 // changed. Usage: TARGET DIRECTORY
 #include <cstdint>
 #include <cstdio>
@@ -14,7 +14,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
 namespace {
 
 void run(std::string_view input) {
-  // A copy of its own, so that a read beyond the end is seen.
+  // An exact-size copy, so that sanitizers detect reads beyond the end.
   const std::vector<std::uint8_t> bytes(input.begin(), input.end());
   (void)LLVMFuzzerTestOneInput(bytes.data(), bytes.size());
 }

@@ -1,4 +1,4 @@
-// Property lists as what a storebag says of an HTTPS backend: the backend decides its state and takes
+// Property lists as a storebag's settings for an HTTPS backend: the backend decides its state and accepts
 // messages.
 #include <cstdint>
 
@@ -19,7 +19,7 @@ struct Harness : test::BackendHarness {
   }
 };
 
-/// The profile without addresses: the bytes choose what is sent, not whom it reaches.
+/// The profile without addresses, so that the input chooses what is sent, but not where.
 Value withoutAddresses(const Value& value) {
   if (const List* list = value.list()) {
     std::vector<Value> kept;

@@ -8,7 +8,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   const std::string_view text(reinterpret_cast<const char*>(data), size);
   const auto outcome = vesk::parseToml(text);
   if (outcome.document.has_value() != outcome.error.empty()) std::abort();
-  // Whatever it holds can be shown.
+  // Any document can be described.
   if (outcome.document) (void)vesk::describe(*outcome.document, 4096);
   return 0;
 }

@@ -1,4 +1,4 @@
-// Bytes as a client may send them: as the body of a call, as a whole message, as authentication.
+// Bytes from a client: as the body of a call, as a whole message, as authentication.
 #include <cstdint>
 #include <string>
 
@@ -15,7 +15,7 @@ using test::BusServer;
 
 void require(bool condition) { BusServer::require(condition); }
 
-/// Not a number is not equal to itself, so equal descriptions will do.
+/// Compares as text, since NaN differs from itself.
 std::string described(const Value& value) { return describe(value, 1 << 20); }
 
 bool readHere(const std::string& bytes, Value& value) {
@@ -26,7 +26,7 @@ bool readHere(const std::string& bytes, Value& value) {
   return reader.read(value) && reader.finish();
 }
 
-/// What is read here is what sd-bus reads, and stays the same when it is written and read again.
+/// Our reader and sd-bus must agree, and the values must survive being written and read again.
 void readBody(BusServer& server, const std::string& signature, const std::string& body) {
   const std::string call = test::wireMessage("m", signature, body);
   Value value;
@@ -38,7 +38,7 @@ void readBody(BusServer& server, const std::string& signature, const std::string
 
   std::string again;
   const auto result = appendMessage({.path = "/o", .member = "m"}, 1, {List{value}}, again);
-  // What was read is valid text within the limits; only nesting takes more room as variants.
+  // The values are valid text within the limits. Only nesting needs more room as variants.
   if (result != CodecResult::Ok) return require(result == CodecResult::LimitExceeded);
   Value same;
   require(readHere(again, same) && described(same) == described(List{value}));
@@ -49,7 +49,7 @@ void readMessage(std::string_view bytes) {
   HeaderParser parser;
   const auto* header = parser.parse(bytes);
   if (!header) return;
-  require(parser.parse(bytes) == header);  // from what was kept
+  require(parser.parse(bytes) == header);  // from the parser's cache
   MessageReader reader({header, parser.serial(), bytes.substr(parser.headerSize()), {}});
   Value value;
   while (reader.read(value)) {

@@ -10,7 +10,7 @@
 
 namespace {
 
-// What the daemon holds of it begins with the daemon's part.
+// The adaptor's structure begins with the part that the daemon uses.
 struct JSONLines {
   VeskWrenAdaptor base;
   int file;
@@ -95,7 +95,7 @@ void sendMessage(VeskWrenAdaptor* adaptor, uint16_t method, uint16_t respCode,
       "{\"method\":" + std::to_string(method) + ",\"respCode\":" + std::to_string(respCode) + ",\"dict\":";
   append(line, *dict);
   line += "}\n";
-  // One write, so that the lines of several sessions do not mix.
+  // A single write, so that lines of several sessions do not mix.
   const int file = reinterpret_cast<JSONLines*>(adaptor)->file;
   [[maybe_unused]] const ssize_t written = ::write(file, line.data(), line.size());
 }

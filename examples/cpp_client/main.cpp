@@ -1,4 +1,4 @@
-// Sends one message, whose text is the argument, and waits until the daemon has answered.
+// Sends one message with the argument as its text, and waits for the daemon's answer.
 #include <VeskReporting/VeskReporting.h>
 
 #include <chrono>
@@ -8,7 +8,7 @@ int main(int argc, char** argv) {
   using namespace vesk;
   using namespace std::chrono_literals;
   VeskReporting reporting;
-  // A service would not ask: it sends, and what it sends waits until the daemon is there.
+  // A service would not wait here: it sends, and its messages wait until the daemon is there.
   auto connected = reporting.connect(2s);
   if (!connected) {
     std::fprintf(stderr, "cpp_client: %s (%s)\n", describe(connected.status), connected.detail.c_str());
