@@ -1,10 +1,9 @@
-// One client of the end-to-end bench: sends numbered messages as fast as the daemon takes them.
+// A client of the end-to-end bench: sends numbered messages as fast as the daemon accepts them.
 //
 // Usage: load_client SOCKET CLIENT COUNT [FLAG [SESSIONS [ANSWERED]]]
-// Message ids are CLIENT * 10,000,000 and up. With many sessions each gets a batch of 50 in its turn;
-// with ANSWERED 1 each message waits for its answer. Prints
-// "ready", waits for a line, sends, prints its own CPU time per message in microseconds, and ends with its
-// standard input.
+// Message IDs start at CLIENT * 10,000,000. With several sessions, each sends 50 messages in turn. With
+// ANSWERED 1, each message waits for its answer. Prints "ready", waits for a line, sends, prints its own CPU
+// time per message in microseconds, and ends when its standard input does.
 #include <VeskReporting/VeskReporting.h>
 #include <VeskReporting/VeskReportingKeys.h>
 #include <sys/resource.h>
@@ -60,7 +59,7 @@ std::unique_ptr<vesk::VeskReporting> startSession(const char* socket, long clien
   return nullptr;
 }
 
-/// False, having said why, when the message can't be sent at all.
+/// Returns false, after reporting the reason, if the message can't be sent.
 bool send(vesk::VeskReporting& reporting, const vesk::Dictionary& message, bool isAnswered) {
   for (;;) {
     auto status = isAnswered ? reporting.sendMessageAndWait(message).status : reporting.sendMessage(message);
@@ -70,7 +69,8 @@ bool send(vesk::VeskReporting& reporting, const vesk::Dictionary& message, bool 
       std::fprintf(stderr, "load_client: %s\n", vesk::describe(status));
       return false;
     }
-    // The bench wants every message to arrive: wait, as a careful client may, for the daemon to catch up.
+    // The bench needs every message to arrive, so it waits for the daemon to catch up, as a careful client
+    // may.
     std::this_thread::sleep_for(std::chrono::milliseconds(2));
   }
 }

@@ -20,7 +20,7 @@ TIMEOUT_MS = 30_000
 
 
 class Session:
-    """One session with the daemon, for as long as its connection is open."""
+    """A session with the daemon, which lasts as long as the connection."""
 
     def __init__(self, socket):
         self._connection = Gio.DBusConnection.new_for_address_sync(
@@ -28,7 +28,7 @@ class Session:
             Gio.DBusConnectionFlags.AUTHENTICATION_CLIENT, None, None)
 
     def call(self, member, signature="()", arguments=()):
-        """Calls a member and returns the values of its answer."""
+        """Calls a method and returns the values of its answer."""
         answer = self._connection.call_sync(
             None, OBJECT, INTERFACE, member, GLib.Variant(signature, arguments), None,
             Gio.DBusCallFlags.NONE, TIMEOUT_MS, None)
@@ -38,12 +38,12 @@ class Session:
         self.call("setSessionInfo", "(a{sv}aa{sv}asb)", (session_info, [user_info], [], False))
 
     def start(self):
-        """The names of the enabled backends, or None when there is no storebag for the client type."""
+        """Returns the names of the enabled backends, or None if there is no storebag for the client type."""
         names, = self.call("startConfigWithCompletionHandler")
         return names[0] if names else None
 
     def send(self, category, message_type, payload):
-        """What the backends answered, or None. What may be absent travels as a list of at most one."""
+        """Returns the backends' answer, or None. Optional values are sent as a list of at most one element."""
         results, = self.call("sendMessageWithCategory", "(qqaa{sv})", (category, message_type, [payload]))
         return results[0] if results else None
 

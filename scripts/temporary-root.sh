@@ -2,7 +2,7 @@
 # ready, and stops them and removes everything however the script ends. Run from the project's directory.
 # shellcheck shell=bash
 
-# make_root: sets `root`, laid out as the daemon expects, without a key and without preferences.
+# make_root: creates a root laid out as the daemon expects, without key and preferences, and sets `root`.
 make_root() {
   umask 022 # the daemon refuses files that others can write to
   root=$(mktemp -d "${TMPDIR:-/tmp}/veskreporting.XXXXXX")

@@ -1,4 +1,4 @@
-"""Other D-Bus implementations as peers of a service that answers `echo` with the value that it was given.
+"""Other D-Bus implementations as clients of a service that answers `echo` with the value it received.
 
 Usage: wire_peers.py SOCKET"""
 import sys
@@ -10,7 +10,7 @@ from gi.repository import Gio, GLib
 ADDRESS = "unix:path=" + sys.argv[1]
 OBJECT, INTERFACE = "/test", "test.Interface"
 
-# Each type, a value of it, and what comes back: integers grow to 64 bits, structures become lists.
+# Each type, a value of it, and the echoed value: integers grow to 64 bits, structures become lists.
 CASES = [
     ("y", 255, 255), ("b", True, True), ("n", -2**15, -2**15), ("q", 2**16 - 1, 2**16 - 1),
     ("i", -2**31, -2**31), ("u", 2**32 - 1, 2**32 - 1), ("x", -2**63, -2**63), ("t", 2**64 - 1, 2**64 - 1),
@@ -23,7 +23,7 @@ CASES = [
 
 
 def plain(value):
-    """Without the types of dbus-python."""
+    """Converts the types of dbus-python to plain ones."""
     if isinstance(value, dict):
         return {str(key): plain(item) for key, item in value.items()}
     if isinstance(value, (list, tuple)):
