@@ -30,7 +30,7 @@ endif()
 if(VESK_SANITIZE)
   # -O1: the sanitized daemon still has to keep up with real sockets and TLS.
   if(VESK_SANITIZE MATCHES undefined)
-    add_compile_options(-fsanitize=float-cast-overflow)  # gcc's "undefined" leaves it out
+    add_compile_options(-fsanitize=float-cast-overflow)  # not part of gcc's "undefined"
     add_link_options(-fsanitize=float-cast-overflow)
   endif()
   add_compile_options(-fsanitize=${VESK_SANITIZE} -fno-sanitize-recover=all -fno-omit-frame-pointer -O1 -g1)
@@ -47,7 +47,7 @@ endif()
 
 include_directories(${PROJECT_SOURCE_DIR})
 
-# vesk_library(NAME SOURCES… [LINK …]): a static library of one directory's units.
+# vesk_library(NAME SOURCES… [LINK …]): a static library with the units of one directory.
 function(vesk_library name)
   cmake_parse_arguments(ARG "" "" "SOURCES;LINK;PRIVATE" ${ARGN})
   add_library(${name} STATIC ${ARG_SOURCES})
@@ -71,7 +71,7 @@ function(vesk_test name)
   add_executable(${name} ${ARG_SOURCES})
   target_link_libraries(${name} PRIVATE ${ARG_LINK} GTest::gtest GTest::gtest_main Threads::Threads)
   set_target_properties(${name} PROPERTIES RUNTIME_OUTPUT_DIRECTORY ${CMAKE_BINARY_DIR}/tests)
-  # Optimising the assertions takes longer than running them.
+  # Optimising the assertions would take longer than running them.
   target_compile_options(${name} PRIVATE -O0 -U_FORTIFY_SOURCE)
   add_test(NAME ${name} COMMAND ${name})
   set_tests_properties(${name} PROPERTIES TIMEOUT ${ARG_TIMEOUT} COST ${cost})
