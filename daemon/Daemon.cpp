@@ -83,8 +83,8 @@ PowerLog::Options powerLogOptions() {
   return options;
 }
 
-/// A connection with a dashboard takes five of eight descriptors; two more are for the dashboards that it
-/// replaces.
+/// Of every eight descriptors, a connection with a dashboard takes five and the dashboards that it creates
+/// anew take two. The eighth is for a dashboard that waits for acknowledgements.
 std::shared_ptr<DashboardLinger> dashboardLinger() {
   return std::make_shared<DashboardLinger>(
       static_cast<std::ptrdiff_t>(std::min(kMaximumLingering, descriptorLimit() / 8)));

@@ -112,7 +112,7 @@ class ReportingdSession final : public ClientSessionInterface,
   const std::string _sessionIDString;
   std::array<char, 41> _deviceid{};  // NUL-terminated; empty if the device has no ID
 
-  bool _isEnding = false;  // set by the destructor; used only on its thread
+  bool _isEnding = false;  // written only by the destructor's thread
 
   // Synchronised by itself.
   SessionAggregator _aggregator;

@@ -19,9 +19,9 @@ std::optional<Text> deviceName();
 std::optional<Text> deviceHardwareModel();
 std::optional<Text> deviceSerialNumber();
 
-/// Writes the device's unique identifier with a terminating NUL into `buffer`. An identifier that doesn't fit
-/// gives an empty text. Always sets the buffer's last byte to 0. If there is no identifier, the rest of the
-/// buffer is unchanged. Callers pass 41 bytes, for 40 digits.
+/// Writes the device's unique identifier with a terminating NUL into `buffer` and sets the buffer's last byte
+/// to 0. An identifier that doesn't fit gives an empty text. If there is no identifier, the buffer is
+/// unchanged. Callers pass 41 bytes, for 40 digits.
 void copyUniqueDeviceID(char* buffer, std::size_t size);
 
 /// True on an internal build. Determined on first use and fixed for the life of the process.

@@ -33,8 +33,8 @@ struct HTTPRequest {
   std::string body;
   /// From `start` to the last byte; for a post that may be retried, from the start of each attempt.
   std::chrono::milliseconds timeout{60'000};
-  /// A request that moves fewer bytes in either direction for `slowFor` is failed as timed out. 0: it may
-  /// stall until its timeout.
+  /// A request that moves fewer bytes per second, counting both directions, for `slowFor` fails as timed out.
+  /// 0: it may stall until its timeout.
   long leastBytesPerSecond = 0;
   std::chrono::seconds slowFor{120};
   Retry retry = Retry::Never;
@@ -124,9 +124,9 @@ class HTTPClient {
   /// Starts the request and blocks until it is completed. Must not be called from a completion.
   HTTPResult perform(HTTPRequest request);
 
-  /// From now on fails all requests that are not posts with `Stopped`, including new ones, so that a server
-  /// that hangs delays no one. Posts continue, and those waiting for a retry are tried immediately. Doesn't
-  /// block.
+  /// From now on fails all requests except posts with the error `Stopped`, including new ones, so that a
+  /// server that hangs delays no one. Posts continue, and those waiting for a retry are tried immediately.
+  /// Doesn't block.
   void stopAllButPosts();
 
   /// Waits up to `timeout` for all requests to end. Returns true if none is outstanding.

@@ -42,7 +42,7 @@ class HTTPSchedule {
   /// attempt; otherwise abandons it.
   void failed(Exchange exchange, HTTPError error, bool mayRetry, Instant now) noexcept;
 
-  /// Fails all waiting requests that are not posts with `Stopped`.
+  /// Fails all waiting requests except posts with the error `Stopped`.
   void stopAllButPosts() noexcept;
   /// Ends the waits of all posts that wait for a retry.
   void retryNow() noexcept;

@@ -22,7 +22,7 @@ class BusyMarker {
   /// Notes that work was done, which may have left free memory behind. Wakes the run loop unless it will look
   /// anyway.
   void touch() noexcept;
-  /// Whether `touch` was called since the last `takeTouch`.
+  /// Whether work was done since the last `takeTouch`.
   bool isTouched() const noexcept { return _touched.load(); }
   bool takeTouch() noexcept { return _touched.exchange(false); }
 

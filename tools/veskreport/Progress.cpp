@@ -39,7 +39,7 @@ void Progress::showWaiting(std::string_view what) {
   if (!isDue()) return;
   if (_first == std::chrono::steady_clock::time_point{}) _first = _next;
   const auto steps = static_cast<std::uint64_t>((_next - _first) / kInterval);
-  // The block moves forth and back.
+  // The block moves back and forth.
   const std::uint64_t way = kWidth - kBlock;
   const std::uint64_t at = steps / way % 2 == 0 ? steps % way : way - steps % way;
   draw("[" + std::string(at, ' ') + std::string(kBlock, '#') + std::string(way - at, ' ') + "] " +
