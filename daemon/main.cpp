@@ -19,8 +19,8 @@
 namespace {
 
 constexpr char kServiceName[] = "com.corvane.veskreportingd";
-constexpr std::chrono::seconds kIdleExitWhenActivated{
-    300};  // the manager starts us again on the next connection
+// The service manager starts us again on the next connection.
+constexpr std::chrono::seconds kIdleExitWhenActivated{300};
 constexpr std::chrono::seconds kPatienceOfLog{1};
 
 int run(const vesk::DaemonOptions& options) {

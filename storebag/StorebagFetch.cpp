@@ -23,8 +23,7 @@ namespace {
 constexpr std::chrono::seconds kTimeout{15};
 constexpr std::int32_t kLongestAge = 86400;  // seconds
 constexpr std::string_view kFallbackName = "palvo";
-constexpr std::string_view kStorebag =
-    "storebag";  // replaces the backend's name in lines about the storebag's own entries
+constexpr std::string_view kStorebag = "storebag";  // backend name in lines about the storebag's own entries
 
 /// The values of that header, joined if it has several lines; nullopt without the header.
 std::optional<std::string> listInHeader(const HTTPResponse& response, std::string_view name) {

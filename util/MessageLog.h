@@ -38,8 +38,7 @@ struct MessageLogFile {
 class MessageLog {
  public:
   struct Options {
-    std::int64_t maximumBytes = std::int64_t{64}
-                                << 20;  ///< size limit of the file, since clients decide how much is written
+    std::int64_t maximumBytes = std::int64_t{64} << 20;  ///< of the file; clients decide how much is written
     Counters* counters = &Counters::shared();
   };
 

@@ -46,8 +46,7 @@ class RecordingConnection final : public IPCConnection {
   std::vector<IPCOutgoingCall> calls;
   std::function<void(std::size_t)> lose;  ///< reports calls that were never sent
   bool clientIsGone = false;
-  std::function<void(const IPCOutgoingCall&)>
-      onCall;  ///< called on the sender's thread, which may hold the agent's monitor
+  std::function<void(const IPCOutgoingCall&)> onCall;  ///< by the sender, who may hold the agent's monitor
 
  private:
   IPCHandlers _handlers;

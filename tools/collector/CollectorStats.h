@@ -16,18 +16,16 @@ struct CollectorStats {
 
   std::vector<const Counter*> all;  ///< in order of declaration; constant after construction
 
-  Counter posts{*this, "posts"};    ///< accepted
-  Counter events{*this, "events"};  ///< in accepted posts
-  Counter eventsNotSaved{*this,
-                         "eventsNotSaved"};  ///< in posts left unanswered because writing the file failed
-  Counter storebagsSent{*this,
-                        "storebagsSent"};  ///< complete, including those with a requested bad signature
-  Counter storebagsUnchanged{*this, "storebagsUnchanged"};      ///< answered with 304
-  Counter datagrams{*this, "datagrams"};                        ///< accepted from dashboards
-  Counter datagramsAgain{*this, "datagramsAgain"};              ///< of these, repeated ones
-  Counter datagramsMalformed{*this, "datagramsMalformed"};      ///< rejected as malformed
-  Counter datagramsLost{*this, "datagramsLost"};                ///< dropped on request
-  Counter acknowledgements{*this, "acknowledgements"};          ///< sent
+  Counter posts{*this, "posts"};                            ///< accepted
+  Counter events{*this, "events"};                          ///< in accepted posts
+  Counter eventsNotSaved{*this, "eventsNotSaved"};          ///< in posts left unanswered; the file failed
+  Counter storebagsSent{*this, "storebagsSent"};            ///< complete, even with a requested bad signature
+  Counter storebagsUnchanged{*this, "storebagsUnchanged"};  ///< answered with 304
+  Counter datagrams{*this, "datagrams"};                    ///< accepted from dashboards
+  Counter datagramsAgain{*this, "datagramsAgain"};          ///< of these, repeated ones
+  Counter datagramsMalformed{*this, "datagramsMalformed"};  ///< rejected as malformed
+  Counter datagramsLost{*this, "datagramsLost"};            ///< dropped on request
+  Counter acknowledgements{*this, "acknowledgements"};      ///< sent
   Counter acknowledgementsLost{*this, "acknowledgementsLost"};  ///< dropped on request
   Counter logData{*this, "logData"};                            ///< uploads of log data
   Counter uploads{*this, "uploads"};                            ///< accepted files
