@@ -69,8 +69,7 @@ bool send(vesk::VeskReporting& reporting, const vesk::Dictionary& message, bool 
       std::fprintf(stderr, "load_client: %s\n", vesk::describe(status));
       return false;
     }
-    // The bench needs every message to arrive, so it waits for the daemon to catch up, as a careful client
-    // may.
+    // The bench needs every message to arrive, so it waits for the daemon to catch up.
     std::this_thread::sleep_for(std::chrono::milliseconds(2));
   }
 }

@@ -1,5 +1,4 @@
-// Property lists in both encodings and keyed archives: whatever is read can be written, and reads back the
-// same.
+// Property lists in both encodings and keyed archives: what is read can be written, and reads back the same.
 #include <cstdint>
 #include <cstdlib>
 

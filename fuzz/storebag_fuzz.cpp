@@ -1,5 +1,4 @@
-// Property lists as a storebag's settings for an HTTPS backend: the backend decides its state and accepts
-// messages.
+// Property lists as a storebag's settings for an HTTPS backend, which decides its state and takes messages.
 #include <cstdint>
 
 #include "backends/BackendFactory.h"

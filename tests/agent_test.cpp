@@ -135,8 +135,7 @@ TEST_F(AgentStorebags, KeepsOneRecordAStorebag) {
 
 TEST_F(AgentStorebags, AsksForWhatIsNewerThanItsLastAnswer) {
   auto session = newSession();
-  // The date is kept even if the storebag could not be verified. There is nothing to serve until its age is
-  // over.
+  // The date is kept even if the storebag is not verified. There is nothing to serve until its age is over.
   next.lastModified = "Mon";
   EXPECT_FALSE(agent->storebagForSession(*session));
   EXPECT_EQ(previous, std::nullopt);

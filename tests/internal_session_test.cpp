@@ -1,5 +1,4 @@
-// Sessions on an internal build. A process determines its kind of build once, so this is a separate test
-// program.
+// Sessions on an internal build. A separate program, since a process determines its kind of build once.
 #include <gtest/gtest.h>
 
 #include "tests/support/AgentHarness.h"

@@ -1,5 +1,4 @@
-// The full pipeline with real processes: client library, daemon in its sandbox, signed storebag, TLS
-// collector.
+// The full pipeline with real processes: client, daemon in its sandbox, signed storebag, TLS collector.
 #include <gtest/gtest.h>
 
 #include <algorithm>

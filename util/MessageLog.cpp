@@ -24,8 +24,7 @@ constexpr std::string_view kNameStart = "veskreportingd";
 constexpr std::string_view kNameEnd = "messageLog.diag";
 constexpr std::chrono::seconds kExpiryAge{86400};
 
-// Longer than a kernel clock tick: two changes of a directory within one tick leave the same modification
-// time.
+// Longer than a kernel clock tick: two changes within one tick leave the same modification time.
 constexpr std::chrono::milliseconds kSettled{100};
 
 using LogFile = MessageLogFile;

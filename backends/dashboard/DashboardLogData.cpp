@@ -22,8 +22,7 @@ HTTPRequest requestFor(const std::string& url, std::string body) {
   return request;
 }
 
-/// The reason why `result` has no location; null if it has one. An answer without a body counts as missing
-/// data.
+/// The reason why `result` has no location; null if it has one. An answer needs a body.
 const char* problemWith(const HTTPResult& result) {
   if (result.error) return result.error->description.c_str();
   if (!result.response || result.response->body.empty()) return "(null)";

@@ -76,8 +76,7 @@ class UploadGate {
   /// Like `enter`, for log data: in the separate slots if it is small, otherwise like a file.
   [[nodiscard]] std::optional<Pass> enterWithLogData(uid_t user, std::size_t bytes);
 
-  /// Sends the request and waits for its result, which is immediate once the client has stopped serving
-  /// uploads.
+  /// Sends the request and waits for its result, which is immediate if the client no longer serves uploads.
   static HTTPResult perform(HTTPClient& http, HTTPRequest request);
 
   /// Admits no more uploads and ends all waits, because the daemon stops.

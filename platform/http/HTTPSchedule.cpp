@@ -255,8 +255,7 @@ void HTTPSchedule::beginOutage(Host& host, const HTTPExchange& exchange, const H
   }
   host.outage = httpError(error.kind, error.description);
   if (exchange.firstAttempt + _policy.retryFor > now) return;
-  // While a host swallows connections, a few attempts occupy its slots, and the posts behind them would wait
-  // without end.
+  // A few attempts fill the slots of a host that swallows connections; posts behind them would wait for ever.
   for (auto& [owner, lane] : host.lanes) {
     while (!lane.posts.empty() && lane.posts.front()->started + _policy.retryFor <= now) {
       takePost(host, lane)->fail(httpError(error.kind, error.description));

@@ -16,8 +16,7 @@
 
 namespace vesk {
 
-/// The header lines of a request in libcurl's form. Uses two allocations, which are reused for the next
-/// request.
+/// The header lines of a request in libcurl's form. Its two allocations are reused for the next request.
 class HTTPHeaderLines {
  public:
   void clear();
@@ -33,8 +32,7 @@ class HTTPHeaderLines {
   std::vector<curl_slist> _nodes;
 };
 
-/// Used only by the client's thread. Holds at most one exchange, which owns the body's bytes while they are
-/// sent.
+/// Used only by the client's thread. Holds at most one exchange, which owns the body while it is sent.
 class HTTPTransfer {
  public:
   struct Outcome {

@@ -1,5 +1,4 @@
-// What a backend needs in a test: a real HTTP client, a real server that records posts, and a clock that the
-// test sets.
+// What a backend needs in a test: a real HTTP client, a real server that records posts, and a settable clock.
 #pragma once
 
 #include <VeskReporting/VeskReportingKeys.h>

@@ -67,8 +67,7 @@ class BusServer {
   std::unique_ptr<sd_bus, Closer> _bus;
 };
 
-/// Appends the rest of the container that `message` is in, as our values. Returns false if sd-bus finds an
-/// error.
+/// Appends the rest of the container in `message`, as our values. Returns false if sd-bus finds an error.
 inline bool readBySdBus(sd_bus_message* message, std::vector<Value>& out) {
   for (;;) {
     char type = 0;

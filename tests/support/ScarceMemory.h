@@ -8,8 +8,7 @@
 
 namespace vesk::test {
 
-/// Makes the thread's next allocation fail. Does nothing in sanitized builds, which need their own operator
-/// new.
+/// Makes the thread's next allocation fail. Does nothing in sanitized builds, which replace operator new.
 class ScarceMemory {
  public:
   ScarceMemory() { _isScarce = true; }

@@ -273,8 +273,7 @@ class StreamConnection final : public HTTPConnection,
 
   // --- Ending ---
 
-  /// Ends the stream and waits for the peer to close, so that no reset discards data that the peer has yet to
-  /// read.
+  /// Ends the stream and waits for the peer to close, so that no reset discards data it has yet to read.
   void sayGoodbye() {
     tcp().expires_after(kGoodbyeTimeout);
     if constexpr (kTLS) {

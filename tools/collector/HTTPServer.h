@@ -18,8 +18,7 @@ struct TLSIdentity {
   std::string privateKey;
 };
 
-/// Listens from construction to `stop`. Answers the requests of a connection in order and keeps connections
-/// alive.
+/// Listens from construction to `stop`. Answers the requests of a connection in order and keeps it alive.
 class HTTPServer {
  public:
   struct Options {

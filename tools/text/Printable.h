@@ -10,8 +10,7 @@ namespace vesk {
 /// nor control a terminal.
 std::string printable(std::string_view text);
 
-/// Returns `bytes` for use in JSON, which must be UTF-8: if they are not valid UTF-8, "?" replaces each byte
-/// above 127.
+/// Returns `bytes` for use in JSON: if they are not valid UTF-8, "?" replaces each byte above 127.
 std::string printableUTF8(std::string_view bytes);
 
 }  // namespace vesk

@@ -15,8 +15,7 @@
 
 namespace vesk {
 
-/// Sends many messages concurrently and reports each outcome. Reports an invalid line and continues with the
-/// next.
+/// Sends many messages concurrently and reports each outcome. Reports and skips invalid lines.
 class MessageStream {
  public:
   /// `session` must be started and outlive this object.
