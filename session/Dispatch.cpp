@@ -83,8 +83,7 @@ std::optional<std::string> flushBackends(const BackendSet& backends) {
   return std::move(answers).chosen();
 }
 
-// The messages of the batch are posted by now: an answer that can't be sent would make the client send them
-// again.
+// The batch has been posted already. If its answer were too large to send, the client would repeat it.
 std::optional<std::string> fittingAnswer(std::optional<std::string> answer) {
   if (!answer || answer->size() <= kMaxAnswerBytes) return answer;
   const std::string notice = "\n[cut: this answer has " + std::to_string(answer->size()) + " bytes]";

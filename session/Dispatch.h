@@ -1,4 +1,4 @@
-// What a session has all of its backends do.
+// Operations of a session on all of its backends.
 #pragma once
 
 #include <sys/time.h>
@@ -15,7 +15,7 @@
 
 namespace vesk {
 
-/// A message as a client's dictionary describes it.
+/// A message, parsed from a client's dictionary.
 struct MessageParameters {
   std::uint16_t category = 0;
   std::uint16_t type = 0;
@@ -23,27 +23,28 @@ struct MessageParameters {
   std::int32_t flag = 0;
 };
 
-/// Nothing, and a line, without category or type.
+/// Returns nullopt, and logs a line, if category or type is missing.
 std::optional<MessageParameters> messageFrom(const Dictionary& parameters);
 
-/// These two return the answer for the client: the HTTP-post backend's, else the dashboard's, else none.
-/// Answers of all backends go to the local message log.
+/// These two return the answer for the client: that of the HTTP-post backend, otherwise the dashboard's,
+/// otherwise none. The answers of all backends go to the local message log.
 std::optional<std::string> dispatchMessage(const BackendSet& backends, const MessageParameters& message,
                                            const timeval& timestamp);
 std::optional<std::string> flushBackends(const BackendSet& backends);
 
-/// Cuts an answer that is longer than an answer may be.
+/// Cuts an answer to the limit of its length.
 std::optional<std::string> fittingAnswer(std::optional<std::string> answer);
 
 void cleanupBackends(const BackendSet& backends);
 
-/// True when a backend took the file or the data. `backends` may be null. May block for servers' answers.
+/// Returns true if a backend accepted the file or data. `backends` may be null. May block until servers have
+/// answered.
 bool uploadFileWithURL(const BackendSet* backends, const std::string& fileURL,
                        const std::string& extensionToken, Counters& counters);
 bool uploadLogData(const BackendSet* backends, const List& logData, Counters& counters);
 
-/// Sends one message through backends that are made for it and end with it. Without session info or storebag
-/// it is lost, with a line of level 3. `user`: whose the client is.
+/// Sends one message through backends created for it alone. Without session info or storebag the message is
+/// lost, with a line of level 3. `user`: the client's user.
 void sendMessageWithSessionInfo(const SessionServices& services, uid_t user,
                                 const std::optional<Dictionary>& sessionInfo,
                                 const std::optional<Dictionary>& userInfo,

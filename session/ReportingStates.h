@@ -1,4 +1,4 @@
-// Which of a session's backends report.
+// Decides which of a session's backends report.
 #pragma once
 
 #include <cstdint>
@@ -10,14 +10,14 @@
 
 namespace vesk {
 
-/// Decides each backend's state anew.
+/// Updates each backend's state for `userInfo`.
 void updateReportingStates(const BackendSet& backends, const std::optional<Dictionary>& userInfo);
 
-/// A child's backends report where its parent's do, and take their sampling thresholds, except those that
-/// wait in the override band. `parent`: null before the parent's first start.
+/// Enables the backends that the parent has enabled, with the parent's sampling thresholds, and disables the
+/// others. Skips backends in the override band. `parent`: null before the parent's first start.
 void syncReportingStates(const BackendSet& backends, const BackendSet* parent);
 
-/// Writes a line for each backend that is a child's, for a session that has no parent.
+/// Logs a line for each backend with a hierarchy above 0, for a session without a parent.
 void noteMissingParent(const BackendSet& backends, std::uint32_t sessionID);
 
 /// The names of the enabled backends.

@@ -28,7 +28,7 @@ bool requiresUserInfo(const Dictionary& sessionInfo) {
   return booleanForKey(sessionInfo, kVeskReportingSessionInfoRequireUserInfo).value_or(false);
 }
 
-// Both present as texts and the same.
+// Whether both have the same text under `key`.
 bool sameText(const std::optional<Dictionary>& a, const std::optional<Dictionary>& b, const char* key) {
   auto first = a ? a->text(key) : std::nullopt;
   auto second = b ? b->text(key) : std::nullopt;
@@ -56,7 +56,7 @@ ReportingdSession::~ReportingdSession() {
   VESK_LOG_DEBUG("dealloc: ReportingdSession dealloc: %u", sessionID());
   _isEnding = true;
   _aggregator.end();
-  // Without memory, one step's failure must neither end the process nor keep the others from being tried.
+  // If one step runs out of memory, the process goes on and the other steps are still tried.
   auto attempt = [](auto step) {
     try {
       step();
@@ -258,7 +258,7 @@ std::optional<std::string> ReportingdSession::sendMessageWithDictionary(const Di
   auto set = backends();
   if (!set) {
     VESK_LOG_DEBUG("sendMessageWithDictionary: No backends available to send message");
-    // The session's own last message has no news for a session that never had a backend.
+    // The session's own closing message is not counted if it never had a backend.
     if (!_isEnding) _services.backends.counters.count("session", DropReason::NoBackend);
     return std::nullopt;
   }
@@ -274,11 +274,9 @@ std::optional<std::string> ReportingdSession::sendMessageWithDictionary(const Di
 
 void ReportingdSession::aggregateMessage(double timestamp, const MessageParameters& message) {
   const auto info = sessionInfo();
-  // A message at the top of its family does not wait for the monitor, which is held across a storebag's
-  // fetch.
+  // A message at the top of its family must not wait for the monitor, which is held during storebag fetches.
   if (_sessionDelegate->mayHaveAncestor(*this)) {
-    // Declared outside the lock's scope: the last holder of a session destroys it, and must not do so under
-    // the lock.
+    // Declared outside the lock's scope: if this is the session's last reference, the lock is released first.
     std::shared_ptr<ReportingdSession> ancestor;
     RecursiveMutexLock monitor(_sessionDelegate->monitor());
     ancestor = _sessionDelegate->getAncestorWithAggregatorForSession(*this);
@@ -324,7 +322,7 @@ void ReportingdSession::createBackendsWithStorebag(const std::optional<Dictionar
     MutexLock lock(_mutex);
     previous = std::exchange(_backends, std::move(next));
   }
-  // A second start: what the first one's backends hold is sent where it may be, then they end.
+  // Started a second time: the previous backends send what they hold if allowed, then end.
   if (previous) {
     flushBackends(*previous);
     cleanupBackends(*previous);
@@ -333,7 +331,8 @@ void ReportingdSession::createBackendsWithStorebag(const std::optional<Dictionar
 }
 
 void ReportingdSession::updateSessionWithDefaultSessionInfo() {
-  // Until the states are decided its level is not: no relative may find it in its family before that.
+  // The level is only final once the states are decided. No other session may find this one in its family
+  // before that.
   RecursiveMutexLock monitor(_sessionDelegate->monitor());
   _sessionDelegate->userInfoUpdatedForSession(*this);
   if (auto set = backends()) updateReportingStates(*set, userInfo());
@@ -364,7 +363,7 @@ void ReportingdSession::receivedUserInfo(const std::optional<Dictionary>& userIn
   updateSessionWithDefaultSessionInfo();
 }
 
-// --- Relatives
+// --- Family
 
 std::int32_t ReportingdSession::getSessionHierarchy() const {
   auto set = backends();

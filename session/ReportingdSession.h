@@ -22,7 +22,7 @@
 
 namespace vesk {
 
-/// Configures the client's backends, hands each message to all of them, and picks the answer.
+/// Configures the client's backends, passes each message to all of them, and picks the answer.
 ///
 /// The operations of ClientSessionInterface run on the connection's thread. The agent calls the members
 /// marked "Family" from other connections' threads, usually while holding its monitor. All fields used by

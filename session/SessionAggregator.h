@@ -1,4 +1,4 @@
-// The way of messages to a client that aggregates them.
+// Sends messages to a client that aggregates them.
 #pragma once
 
 #include <atomic>
@@ -14,7 +14,7 @@
 
 namespace vesk {
 
-/// Belongs to a session and is asked by its relatives too. Thread-safe.
+/// Belongs to a session; other sessions of its family also use it. Thread-safe.
 class SessionAggregator {
  public:
   SessionAggregator(std::shared_ptr<IPCConnection> connection, Counters& counters)
@@ -23,13 +23,13 @@ class SessionAggregator {
   /// Whether the client aggregates.
   bool isOn() const noexcept { return _hasAggregator.load(); }
   void setOn(bool isOn) noexcept { _hasAggregator.store(isOn); }
-  /// Tells the client, once, that no more messages come.
+  /// Sends the client the closing message, once.
   void shutdown() VESK_EXCLUDES(_mutex);
-  /// From now on losses aren't counted: the session ends, and a client that has gone misses nothing.
+  /// Stops counting losses: the session ends, and its client is usually gone.
   void end() noexcept { _isEnding.store(true); }
 
-  /// Hands one message to the client; never waits. One that the client doesn't take is lost and counted, with
-  /// one line a burst: a sender must not pay for a client that doesn't read.
+  /// Sends one message to the client without blocking. A message that the client does not take is dropped,
+  /// counted, and logged once per burst, so that a client that does not read never delays the sender.
   void sendToAggregator(const std::optional<Dictionary>& sessionInfo, double timestamp,
                         std::uint16_t category, std::uint16_t type, const std::optional<Dictionary>& payload)
       VESK_EXCLUDES(_mutex);

@@ -10,7 +10,7 @@ namespace vesk {
 /// Outlives the sessions.
 struct SessionServices {
   BackendServices& backends;
-  std::string libraryVersion;  ///< of the client library, "7.0" when it declares none
+  std::string libraryVersion;  ///< of the client library, "7.0" if it declares none
 };
 
 }  // namespace vesk

@@ -1,4 +1,4 @@
-// What the preferences of this device say: environment, consent, storebag server, limits.
+// Settings from this device's preferences: environment, consent, storebag server, limits.
 #pragma once
 
 #include <cstdint>

@@ -45,7 +45,7 @@ class Dashboard : public testing::Test {
             ._udid = kUdid,
             ._selfVersionMajor = 7};
   }
-  /// The one datagram that a message becomes.
+  /// The datagram of a message.
   std::string datagramOf(VeskReportingBackend& backend, const std::optional<Dictionary>& payload) {
     backend.sendMessage(payload, kWhen, 0x0708, 0x090A, 0);
     _queues.queue->run();

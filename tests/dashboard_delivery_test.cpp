@@ -295,7 +295,7 @@ TEST(UDPSocketTest, FindsAnotherWayOrReceivesNothing) {
   EXPECT_EQ(server.take(), std::vector<std::string>{"y"});
 }
 
-/// In real time, towards `server`.
+/// A reliable delivery to `server` in real time.
 std::shared_ptr<DashboardDelivery> reliableOn(QueueThread& thread, const DashboardServer& server,
                                               std::shared_ptr<DashboardLinger> linger, Counters& counters,
                                               milliseconds tick) {
@@ -335,7 +335,7 @@ TEST(DeliveryOnThreads, EndAtOnceBeyondTheirPlacesAndLeaveNothingBehindWhenStopp
   Counters counters;
   auto linger = std::make_shared<DashboardLinger>(kPlaces);
   {
-    DashboardServer server;  // that does not answer
+    DashboardServer server;  // never answers
     QueueThread thread;
     const long started = openDescriptors();
     for (int i = 0; i < 3 * kPlaces; ++i) {

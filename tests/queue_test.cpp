@@ -19,7 +19,7 @@ using std::chrono::milliseconds;
 
 class Queues : public testing::Test {
  protected:
-  /// Waits until everything submitted to the queue before has run.
+  /// Waits until everything submitted before has run.
   void drain() {
     std::promise<void> done;
     queue->submit([&done] { done.set_value(); });

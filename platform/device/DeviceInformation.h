@@ -1,4 +1,4 @@
-// What device this is.
+// Facts about the device.
 #pragma once
 
 #include <optional>

@@ -11,7 +11,7 @@ namespace vesk {
 
 namespace {
 
-/// Reads the objects from the root down, each one anew at every reference to it.
+/// Reads the objects from the root down. Reads an object again for each reference to it.
 class ArchiveReader {
  public:
   ArchiveReader(List objects, const PropertyListLimits& limits)
@@ -24,7 +24,7 @@ class ArchiveReader {
   }
 
  private:
-  /// Keeps the first error.
+  /// Keeps only the first error.
   std::nullopt_t fail(std::string error) {
     if (_error.empty()) _error = std::move(error);
     return std::nullopt;

@@ -7,9 +7,9 @@
 
 namespace vesk {
 
-/// The root of an archive, or one clause that says what is wrong. The bytes may come from anywhere: they are
-/// read under the limits, where an object counts at every reference to it, and refused as a whole when
-/// anything in them is wrong, such as a reference to no object or an unknown class.
+/// Returns the root of an archive, or an error. The bytes may be untrusted: the limits apply, counting an
+/// object once per reference, and any fault, such as a dangling reference or an unknown class, refuses the
+/// whole archive.
 PropertyListOutcome unarchiveValue(std::string_view archive, const PropertyListLimits& limits = {});
 
 }  // namespace vesk

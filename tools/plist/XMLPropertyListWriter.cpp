@@ -40,7 +40,7 @@ std::optional<std::string> textFromDate(Date date) {
   return text;
 }
 
-/// Writes one value; every operation tells whether it could.
+/// Writes one value. Every operation returns false if it can't.
 class XMLWriter {
  public:
   bool write(const Value& value, std::size_t indent) {
@@ -113,7 +113,7 @@ class XMLWriter {
   }
 
   static std::optional<std::string> escape(std::string_view text) {
-    // The two last characters of the plane are none of XML's, and no reader would take them.
+    // XML excludes the last two characters of the plane, and readers refuse them.
     if (!isValidUTF8(text) || text.find("\xEF\xBF\xBE") != std::string_view::npos ||
         text.find("\xEF\xBF\xBF") != std::string_view::npos) {
       return std::nullopt;
@@ -128,7 +128,7 @@ class XMLWriter {
       } else if (c == '>') {
         escaped += "&gt;";
       } else if (c == '\r') {
-        // Written plainly it would be read as a line feed.
+        // A plain carriage return would be read as a line feed.
         escaped += "&#13;";
       } else if (static_cast<unsigned char>(c) < 0x20 && c != '\t' && c != '\n') {
         return std::nullopt;

@@ -13,7 +13,7 @@ constexpr int kBusyMilliseconds = 5000;
 constexpr std::size_t kBatchEvents = 500;
 constexpr std::size_t kBatchBytes = std::size_t{1} << 20;
 
-// The planner would rather take the index of times and sort: hence the plus.
+// The "+" keeps the planner from using the index of times and sorting.
 constexpr char kEvents[] =
     "SELECT identifier, name, time, dictionary, id FROM events"
     " WHERE id BETWEEN ?1 AND ?2 AND +time >= ?3 ORDER BY id";
@@ -33,14 +33,14 @@ PowerLogEvent eventIn(sqlite3_stmt* row) {
   return event;
 }
 
-/// Which events are there, and the way through them. A statement keeps the state of the file that it began
-/// with, and as long as it does, the log of changes can't be begun anew: so none is open while events are
-/// handed out, which may take as long as a person takes to read them.
+/// Reads the events in batches. An open statement keeps the file's state from its start and prevents the
+/// write-ahead log from being reset, so none is open while events are passed on, which may take as long as a
+/// person reads.
 class Batches {
  public:
   Batches(sqlite3* database, double since) : _database(database), _since(since) {}
 
-  /// The first and the last event's row. A result code of SQLite.
+  /// Finds the first and last rows. Returns a result code of SQLite.
   int begin() {
     auto range = prepare(_database, "SELECT min(id), max(id) FROM events WHERE time >= ?1");
     if (!range) return sqlite3_errcode(_database);
@@ -53,7 +53,7 @@ class Batches {
     return SQLITE_OK;
   }
 
-  /// SQLITE_ROW while more may come, SQLITE_DONE with the last.
+  /// Returns SQLITE_ROW while more may follow, SQLITE_DONE with the last batch.
   int read(std::vector<PowerLogEvent>& events) {
     events.clear();
     auto row = prepare(_database, kEvents);

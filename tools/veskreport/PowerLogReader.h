@@ -1,4 +1,4 @@
-// The file of the power log, to be read.
+// Reads the power log's file.
 #pragma once
 
 #include <functional>
@@ -8,9 +8,9 @@
 
 namespace vesk {
 
-/// Hands the events of `since` and later to `take`, oldest first, until that returns false. Works while a
-/// daemon writes, and takes no note of what it adds meanwhile; `take` may be slow without being in its way.
-/// What went wrong comes back as text; empty: nothing did.
+/// Passes the events from `since` on to `take`, oldest first, until it returns false. Works while a daemon
+/// writes, and ignores events added meanwhile. A slow `take` does not block the daemon. Returns an error
+/// text, or an empty string on success.
 [[nodiscard]] std::string readPowerLog(const std::string& path, WallTime since,
                                        const std::function<bool(const PowerLogEvent& event)>& take);
 
