@@ -174,19 +174,17 @@ MutableDictionary HTTPSPostBackend::eventFor(const std::optional<Dictionary>& pa
 HTTPSPostBackend::PostToBuild HTTPSPostBackend::batchEvent(MutableDictionary event) {
   const Value* methodValue = event.find("_method");
   std::int64_t method = methodValue ? methodValue->asInteger().value_or(0) : 0;
-  const auto batch = [this]() -> EventBatch& {
-    if (!_batchedEvents) _batchedEvents = std::make_unique<EventBatch>(_identity._heldBytes);
-    return *_batchedEvents;
-  };
+  if (!_batchedEvents) _batchedEvents = std::make_unique<EventBatch>(_identity._heldBytes);
   PostToBuild full;
-  if (batch().passesThreshold(method, _settings._eventThreshold)) {
+  if (_batchedEvents->passesThreshold(method, _settings._eventThreshold)) {
     VESK_LOG_DEBUG(
         "HTTPSPostBackend(batchEvent): Flushing all batched events as we reached event threshold for method "
         "%d",
         static_cast<int>(method));
     full = takeBatch();
+    if (full) _batchedEvents = std::make_unique<EventBatch>(_identity._heldBytes);
   }
-  batch().add(std::move(event), method);
+  _batchedEvents->add(std::move(event), method);
   return full;
 }
 
@@ -275,7 +273,7 @@ std::optional<std::string> HTTPSPostBackend::buildAndPost(PostToBuild post) {
     post->events.reset();
     if (body) {
       postJSONMessage(std::move(*post), std::move(body->json), eventCount);
-      return std::move(body->printable);
+      return std::move(body->prettyJsonString);
     }
   } catch (...) {
     // No memory for it, and the events are given up already.

@@ -16,8 +16,8 @@
 namespace vesk {
 
 struct PostBody {
-  std::string json;                      ///< compact, for the server
-  std::optional<std::string> printable;  ///< the same for the local message log, when that may have it
+  std::string json;                             ///< compact, for the server
+  std::optional<std::string> prettyJsonString;  ///< for the local message log, when that may have it
 };
 
 /// Removes from the events what JSON can't carry, with a line of level 4 each, and serialises them. Nothing
