@@ -60,9 +60,9 @@ std::optional<PostBody> createMessageForPostAndLogging(EventBatch& events, const
     JSONWriter writer(style, 128 + events.size() * kExpectedEventSize);
     writer.beginObject();
     writer.key("postTime");
-    writer.number(finiteOrMinusOne(secondsFromTimeval(timevalFrom(postTime))));
+    writer.value(finiteOrMinusOne(secondsFromTimeval(timevalFrom(postTime))));
     writer.key("clientId");
-    writer.text(clientID);
+    writer.value(clientID);
     writer.key("events");
     writer.beginArray();
     for (const auto& held : events.events()) writer.value(held.event);
