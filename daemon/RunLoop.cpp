@@ -1,7 +1,6 @@
 #include "daemon/RunLoop.h"
 
 #include <poll.h>
-#include <sys/eventfd.h>
 #include <sys/signalfd.h>
 
 #include <algorithm>
@@ -23,18 +22,13 @@ sigset_t stopSignals() {
   return signals;
 }
 
-FileDescriptor checked(int descriptor, const char* what) {
-  if (descriptor < 0) throw std::system_error(errno, std::generic_category(), what);
-  return FileDescriptor(descriptor);
-}
-
 }  // namespace
 
 RunLoop::RunLoop(Options options, BusyMarker& busyMarker, ServiceManager& serviceManager)
     : _options(options), _busyMarker(busyMarker), _serviceManager(serviceManager) {
   sigset_t signals = stopSignals();
-  _signals = checked(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK), "signalfd");
-  _stopRequest = checked(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK), "eventfd");
+  _signals = FileDescriptor(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
+  if (!_signals) throw std::system_error(errno, std::generic_category(), "signalfd");
   ::pthread_sigmask(SIG_BLOCK, &signals, &_previousMask);
   ::signal(SIGPIPE, SIG_IGN);
 }
@@ -46,7 +40,7 @@ RunLoop::Outcome RunLoop::run() {
   pingWatchdog(Clock::now());
   for (;;) {
     pollfd events[] = {
-        {_signals.get(), POLLIN, 0}, {_stopRequest.get(), POLLIN, 0}, {_busyMarker.descriptor(), POLLIN, 0}};
+        {_signals.get(), POLLIN, 0}, {_stopRequest.fd(), POLLIN, 0}, {_busyMarker.descriptor(), POLLIN, 0}};
     if (::poll(events, std::size(events), pollTimeout(Clock::now())) < 0) continue;
     if (events[0].revents != 0) {
       signalfd_siginfo signal{};
@@ -63,7 +57,7 @@ RunLoop::Outcome RunLoop::run() {
   }
 }
 
-void RunLoop::stop() noexcept { ::eventfd_write(_stopRequest.get(), 1); }
+void RunLoop::stop() noexcept { _stopRequest.signal(); }
 
 void RunLoop::noteBusyMarker(Clock::time_point now) {
   _busyMarker.acknowledge();

@@ -10,6 +10,7 @@
 #include "platform/files/FileDescriptor.h"
 #include "platform/service/BusyMarker.h"
 #include "platform/service/ServiceManager.h"
+#include "platform/sync/Wakeup.h"
 
 namespace vesk {
 
@@ -61,7 +62,7 @@ class RunLoop {
   ServiceManager& _serviceManager;
 
   FileDescriptor _signals;
-  FileDescriptor _stopRequest;
+  Wakeup _stopRequest;
   sigset_t _previousMask{};
 
   // Only used by `run`.

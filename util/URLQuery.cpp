@@ -9,7 +9,6 @@ namespace vesk {
 
 namespace {
 
-constexpr std::string_view kUnreserved = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789-._~";
 constexpr std::string_view kOthersInQuery = "!$&'()*+,;=:@/?";
 constexpr std::string_view kOthersInURL = "!$&'()*+,;=:@/?#[]%";
 

@@ -94,10 +94,7 @@ std::optional<std::string> factFromSystem(std::string_view key) {
 
 bool isUsable(const std::string& fact) {
   return !fact.empty() && fact.size() <= kLongestFact && isValidUTF8(fact) &&
-         std::none_of(fact.begin(), fact.end(), [](char c) {
-           auto byte = static_cast<unsigned char>(c);
-           return byte < 0x20 || byte == 0x7f;
-         });
+         std::none_of(fact.begin(), fact.end(), isControl);
 }
 
 std::optional<std::string> countryCode(std::string_view candidate) {

@@ -7,6 +7,7 @@
 
 #include "platform/log/LogUser.h"
 #include "platform/log/SystemLog.h"
+#include "platform/text/ASCII.h"
 
 namespace vesk {
 
@@ -15,11 +16,6 @@ namespace {
 bool isTokenCharacter(char c) {
   if ((c >= '0' && c <= '9') || (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z')) return true;
   return c != '\0' && std::string_view("!#$%&'*+-.^_`|~").find(c) != std::string_view::npos;
-}
-
-bool isControl(char c) {
-  auto byte = static_cast<unsigned char>(c);
-  return byte < 0x20 || byte == 0x7f;
 }
 
 bool isSafe(const std::pair<std::string, std::string>& header) {

@@ -17,8 +17,8 @@
 #include "platform/ipc/IPCConnection.h"
 #include "platform/ipc/Outbox.h"
 #include "platform/ipc/Sasl.h"
-#include "platform/ipc/Wakeup.h"
 #include "platform/ipc/WarningBurst.h"
+#include "platform/sync/Wakeup.h"
 
 namespace vesk {
 

@@ -12,8 +12,8 @@
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/ipc/IPCConnection.h"
-#include "platform/ipc/Wakeup.h"
 #include "platform/ipc/WarningBurst.h"
+#include "platform/sync/Wakeup.h"
 
 namespace vesk {
 

@@ -15,6 +15,7 @@
 #include "platform/log/LogUser.h"
 #include "platform/log/StandardError.h"
 #include "platform/sync/Mutex.h"
+#include "platform/text/ASCII.h"
 #include "platform/time/CivilTime.h"
 
 namespace vesk {
@@ -63,10 +64,9 @@ std::string printable(std::string_view text) {
   std::string out;
   out.reserve(text.size());
   for (char c : text) {
-    auto byte = static_cast<unsigned char>(c);
-    if ((byte < 0x20 && c != '\t') || byte == 0x7f) {
+    if (isControl(c) && c != '\t') {
       char escaped[8];
-      std::snprintf(escaped, sizeof escaped, "\\x%02x", byte);
+      std::snprintf(escaped, sizeof escaped, "\\x%02x", static_cast<unsigned char>(c));
       out += escaped;
     } else {
       out += c;

@@ -4,6 +4,7 @@
 #include <vector>
 
 #include "platform/plist/PropertyListFormats.h"
+#include "platform/text/ASCII.h"
 #include "platform/unicode/Unicode.h"
 
 namespace vesk {
@@ -56,9 +57,8 @@ std::optional<std::string> textObject(std::string_view text) {
   if (text.find('\0') != std::string_view::npos) return std::nullopt;
   auto units = utf16BEFromUTF8(text);
   if (!units) return std::nullopt;
-  const bool isASCII = std::all_of(text.begin(), text.end(), [](char c) { return (c & 0x80) == 0; });
-  return isASCII ? countedObject(0x5, text.size()).append(text)
-                 : countedObject(0x6, units->size() / 2).append(*units);
+  return isASCII(text) ? countedObject(0x5, text.size()).append(text)
+                       : countedObject(0x6, units->size() / 2).append(*units);
 }
 
 /// Lists all objects first: only their number tells how wide a reference has to be.

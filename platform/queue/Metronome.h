@@ -19,7 +19,7 @@ class Metronome {
 
   /// The first beat is now.
   void start(Work handler);
-  /// To be called when it is paused. Throws std::bad_alloc, and is then still paused.
+  /// To be called when it is paused.
   void resume(Work handler);
   /// The handler is not called any more, and destroyed as soon as it does not run; it may call this itself.
   void pause() noexcept { _timer.reset(); }

@@ -3,7 +3,7 @@
 
 #include <atomic>
 
-#include "platform/files/FileDescriptor.h"
+#include "platform/sync/Wakeup.h"
 
 namespace vesk {
 
@@ -11,9 +11,6 @@ namespace vesk {
 /// loop's idle time starts. Thread-safe; no operation blocks.
 class BusyMarker {
  public:
-  /// Throws std::system_error if no descriptor is left.
-  BusyMarker();
-
   /// Each `begin` must be followed by one `end`.
   void begin() noexcept;
   void end() noexcept;
@@ -28,13 +25,11 @@ class BusyMarker {
 
   /// Readable after the process became busy or idle or did work. The run loop waits for it and then calls
   /// `acknowledge`.
-  int descriptor() const noexcept { return _changed.get(); }
-  void acknowledge() noexcept;
+  int descriptor() const noexcept { return _changed.fd(); }
+  void acknowledge() noexcept { _changed.clear(); }
 
  private:
-  void noteChange() noexcept;
-
-  const FileDescriptor _changed;
+  const Wakeup _changed;
   std::atomic<unsigned> _count{0};
   std::atomic<bool> _touched{false};
 };

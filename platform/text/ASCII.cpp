@@ -1,6 +1,8 @@
 #include "platform/text/ASCII.h"
 
 #include <algorithm>
+#include <cstdint>
+#include <cstring>
 
 namespace vesk {
 
@@ -9,6 +11,19 @@ namespace {
 char lower(char c) noexcept { return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c; }
 
 }  // namespace
+
+bool isASCII(std::string_view text) noexcept {
+  std::size_t i = 0;
+  for (; i + 8 <= text.size(); i += 8) {
+    std::uint64_t eight;
+    std::memcpy(&eight, text.data() + i, 8);
+    if (eight & 0x8080808080808080u) return false;
+  }
+  for (; i < text.size(); ++i) {
+    if (!isASCII(text[i])) return false;
+  }
+  return true;
+}
 
 std::string_view trimmed(std::string_view text) noexcept {
   constexpr std::string_view kBlank = " \t\r\n";

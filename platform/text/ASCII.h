@@ -7,6 +7,11 @@
 
 namespace vesk {
 
+inline bool isASCII(char c) noexcept { return static_cast<unsigned char>(c) < 0x80; }
+bool isASCII(std::string_view text) noexcept;
+
+inline bool isControl(char c) noexcept { return static_cast<unsigned char>(c) < 0x20 || c == 0x7f; }
+
 /// Removes spaces, tabs and line ends from both ends.
 std::string_view trimmed(std::string_view text) noexcept;
 

@@ -8,29 +8,15 @@
 
 #include <algorithm>
 #include <cstdint>
-#include <cstring>
 #include <limits>
+
+#include "platform/text/ASCII.h"
 
 namespace vesk {
 
 namespace {
 
-bool isASCII(char c) noexcept { return static_cast<unsigned char>(c) < 0x80; }
-
 char lowerASCII(char c) noexcept { return c >= 'A' && c <= 'Z' ? static_cast<char>(c | 0x20) : c; }
-
-bool isASCII(std::string_view text) noexcept {
-  std::size_t i = 0;
-  for (; i + 8 <= text.size(); i += 8) {
-    std::uint64_t eight;
-    std::memcpy(&eight, text.data() + i, 8);
-    if (eight & 0x8080808080808080u) return false;
-  }
-  for (; i < text.size(); ++i) {
-    if (!isASCII(text[i])) return false;
-  }
-  return true;
-}
 
 std::string lowerASCII(std::string_view text) {
   std::string out(text);

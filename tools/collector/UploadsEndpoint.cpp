@@ -2,6 +2,7 @@
 
 #include <exception>
 
+#include "platform/text/ASCII.h"
 #include "platform/text/PercentCode.h"
 
 namespace vesk {
@@ -15,8 +16,7 @@ constexpr std::size_t kMaximumContents = std::size_t{1} << 30;
 std::string nameIn(const HTTPReceived& received) {
   std::string name = percentDecoded(received.query("filename").value_or("")).value_or("");
   for (char& c : name) {
-    auto byte = static_cast<unsigned char>(c);
-    if (c == '/' || byte < 0x20 || byte == 0x7f) c = '_';
+    if (c == '/' || isControl(c)) c = '_';
   }
   return name.substr(0, kLongestName);
 }

@@ -2,6 +2,7 @@
 
 #include <cstdio>
 
+#include "platform/text/ASCII.h"
 #include "platform/unicode/UTF8.h"
 
 namespace vesk {
@@ -28,8 +29,7 @@ std::string printable(std::string_view text) {
     if (isUTF8 && isSecondControlSet(text.substr(i))) {
       appendCode(shown, text[i++]);
       appendCode(shown, text[i]);
-    } else if (auto byte = static_cast<unsigned char>(text[i]);
-               byte < 0x20 || byte == 0x7f || (byte > 0x7f && !isUTF8)) {
+    } else if (isControl(text[i]) || (!isASCII(text[i]) && !isUTF8)) {
       appendCode(shown, text[i]);
     } else {
       shown += text[i];
@@ -41,7 +41,7 @@ std::string printable(std::string_view text) {
 std::string printableUTF8(std::string_view bytes) {
   if (isValidUTF8(bytes)) return std::string(bytes);
   std::string shown;
-  for (char c : bytes) shown += (static_cast<unsigned char>(c) < 0x80) ? c : '?';
+  for (char c : bytes) shown += isASCII(c) ? c : '?';
   return shown;
 }
 
