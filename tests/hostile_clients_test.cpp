@@ -57,32 +57,6 @@ void connect(const DaemonHarness& harness, uid_t user, int count, std::vector<Ra
   ASSERT_EQ(::seteuid(::getuid()), 0);
 }
 
-TEST(HostileClients, ConnectionsInExcessAreClosedAndTheOthersGoOn) {
-  DaemonHarness harness;
-  std::filesystem::permissions(harness.root.path(), std::filesystem::perms{0755});
-  harness.startDaemon({"--log-level", "6"});
-  Aftermath aftermath(harness);
-  {
-    RoadClient first(harness);
-    std::vector<RawClient> open;
-    raiseDescriptorLimit();
-    connect(harness, ::geteuid(), kIsSanitized ? 63 : 1100, open);
-    EXPECT_EQ(open.size(), kIsSanitized ? 63u : 1023u) << "1,024 of one user, with the first";
-    EXPECT_TRUE(kIsSanitized || harness.daemon().waitForText("Refused a connection of user"));
-    // Only the superuser can change the user, and the sanitizers need too much memory per thread.
-    if (::geteuid() == 0 && !kIsSanitized) {
-      open.erase(open.begin(), open.begin() + 100);
-      for (uid_t user = 60'001; user <= 60'020; ++user) connect(harness, user, 250, open);
-      EXPECT_EQ(open.size(), 4079u);
-      connect(harness, ::geteuid(), 50, open);
-      EXPECT_EQ(open.size(), 4095u) << "the last sixteen are root's";
-    }
-    EXPECT_TRUE(first.reporting.sendMessageAndWait(message(3)));
-    harness.waitForEventsOfMethod(3, 1);
-  }
-  aftermath.expectNothingLeft();
-}
-
 TEST(HostileClients, AFloodOfWarningsIsCutShortWithTheNumberLeftOut) {
   for (std::size_t limit : {200, 0, 7}) {
     DaemonHarness harness;

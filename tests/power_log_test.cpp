@@ -138,22 +138,5 @@ TEST(PowerLogRoad, TheDaemonRecordsAndTheToolShows) {
   EXPECT_EQ(show({"--since", "2999-01-01"}), "");
 }
 
-TEST(PowerLogCommandTest, UnderstandsAgesAndTimes) {
-  const WallTime now = std::chrono::sys_days(std::chrono::days(20'000));
-  using namespace std::chrono_literals;
-  const std::pair<const char*, std::optional<WallTime>> cases[] = {
-      {"30s", now - 30s},
-      {"7d", now - 168h},
-      {"4294967295d", now - 24h * 100'000},
-      {"1970-01-02", WallTime(24h)},
-      {"1970-01-01T01:02:03Z", WallTime(1h + 2min + 3s)},
-      {"-3s", std::nullopt},
-      {"3w", std::nullopt},
-      {"1970-02-30", std::nullopt},
-      {"1970-01-01T01:02", std::nullopt},
-  };
-  for (const auto& [text, meant] : cases) EXPECT_EQ(timeMeantBy(text, now), meant) << text;
-}
-
 }  // namespace
 }  // namespace vesk::test

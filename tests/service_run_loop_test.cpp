@@ -71,11 +71,6 @@ TEST_F(RunLoopTest, ASecondSignalEndsASlowStop) {
       testing::KilledBySignal(SIGTERM), "");
 }
 
-TEST_F(RunLoopTest, OutlivesTheReaderOfAPipe) {
-  RunLoop loop({}, _busy, _service);
-  EXPECT_EQ(::raise(SIGPIPE), 0);
-}
-
 TEST_F(RunLoopTest, EndsWhenIdleButNotWhileBusy) {
   _busy.begin();
   _busy.begin();

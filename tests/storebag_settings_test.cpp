@@ -46,6 +46,14 @@ TEST(StorebagNaming, NamesTheStorebagOfAClientType) {
     EXPECT_EQ(storebagNameForClientType(type), std::nullopt) << type;
 }
 
+TEST(Settings, ThereIsNoConsentUnlessItWasGiven) {
+  for (const auto& [preference, consents] :
+       {std::pair{"", false}, {"= true", true}, {"= false", false}, {"= \"true\"", false}, {"= 1", false}}) {
+    writePreferences(*preference ? std::string("diagnosticsSubmission ") + preference : "");
+    EXPECT_EQ(diagnosticsSubmissionConsent(), consents) << preference;
+  }
+}
+
 TEST(StorebagNaming, TheEnvironmentIsReadOnceAndSaysWhatItIs) {
   const std::tuple<const char*, int, const char*> cases[] = {
       {"", 3, nullptr},          {"0", 0, nullptr},         {"1", 1, nullptr},   {"2", 2, nullptr},

@@ -55,12 +55,5 @@ TEST(Unicode, TellsWellFormedUTF8) {
   EXPECT_FALSE(isValidUTF8(withNUL, false));
 }
 
-TEST(Unicode, CutsBetweenCharacters) {
-  const std::string text = "aé→🎉b";
-  const std::size_t ends[] = {0, 1, 1, 3, 3, 3, 6, 6, 6, 6, 10, 11, 11};
-  for (std::size_t size = 0; size < std::size(ends); ++size)
-    EXPECT_EQ(cutToWholeCharacters(text, size), text.substr(0, ends[size])) << size;
-}
-
 }  // namespace
 }  // namespace vesk

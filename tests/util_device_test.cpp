@@ -7,7 +7,6 @@
 
 #include "platform/device/DeviceInformation.h"
 #include "platform/device/FirmwareFacts.h"
-#include "storebag/Settings.h"
 #include "tests/support/TestRoot.h"
 #include "util/ReportingdUtil.h"
 #include "util/URLQuery.h"
@@ -162,15 +161,6 @@ TEST_F(Device, KnowsItsOffsetFromGMT) {
   ::setenv("TZ", "NST3:30", 1);
   EXPECT_EQ(at(1764016400), -12600);
   ::unsetenv("TZ");
-}
-
-TEST_F(Device, HasNoConsentUnlessItWasGiven) {
-  for (const auto& [preference, consents] : std::map<const char*, bool>{
-           {"", false}, {"= true", true}, {"= false", false}, {"= \"true\"", false}, {"= 1", false}}) {
-    testRoot().write("etc/veskreporting/preferences/com.corvane.veskreporting.toml",
-                     *preference ? std::string("diagnosticsSubmission ") + preference + "\n" : "");
-    EXPECT_EQ(diagnosticsSubmissionConsent(), consents) << preference;
-  }
 }
 
 TEST_F(Device, RunsAnInternalBuildOnlyWhenItSaysSoAndForGood) {
