@@ -10,7 +10,7 @@
 namespace vesk {
 
 /// Makes the backend that a storebag lists under `name`. Returns null for an unknown name, for a Wren backend
-/// on a "Bramble" device (both with a line of level 3), and when the backend can't use `profile`.
+/// on a "Bramble" device (both logged at level 3), and if the backend can't use `profile`.
 std::shared_ptr<VeskReportingBackend> newBackendWithName(const std::string& name,
                                                          const std::optional<Dictionary>& profile,
                                                          const BackendIdentity& identity,

@@ -1,4 +1,4 @@
-// Whose messages a backend reports.
+// The origin of a backend's messages.
 #pragma once
 
 #include <sys/time.h>
@@ -16,8 +16,8 @@
 
 namespace vesk {
 
-/// The session, its client and the device, as they are when the session makes its backends: the same for all
-/// of them, and constant from then on.
+/// The session, its client and the device, as they are when the session makes its backends. The same for all
+/// of them, and constant.
 struct BackendIdentity {
   std::uint32_t _sessionID = 0;  ///< the client's number for the session
   std::int32_t _compType = 0;    ///< the client type
@@ -33,10 +33,10 @@ struct BackendIdentity {
   std::uint8_t _selfVersionMajor = 0;  ///< of the client library
   std::uint8_t _selfVersionMinor = 0;
   double _startTimeStamp = 0;         ///< seconds since 1970
-  uid_t _user = UploadGate::kNobody;  ///< who is charged for what waits to be posted or uploaded
+  uid_t _user = UploadGate::kNobody;  ///< charged for posts and uploads that wait
   HeldBytes _heldBytes = std::make_shared<HeldAccount>(HeldBudget::Limits().ofSession);
 
-  /// "7.2.9" gives 7 and 2; numbers are cut to 8 bits.
+  /// "7.2.9" gives 7 and 2; numbers are truncated to 8 bits.
   void setSelfVersion(std::string_view version);
 };
 

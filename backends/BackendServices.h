@@ -1,4 +1,4 @@
-// What the backends of a process share, handed to each at construction.
+// What the backends of a process share.
 #pragma once
 
 #include <atomic>
@@ -21,29 +21,29 @@ namespace vesk {
 
 class PowerLog;
 
-/// Built once, by the daemon (`Daemon`); everything in it outlives every backend.
+/// Built once, by the daemon (`Daemon`). Everything in it outlives every backend.
 struct BackendServices {
   HTTPClient& http;
   const WallClock& clock;
   Counters& counters;
-  /// Where datagrams are sent and acknowledgements read.
+  /// The queues on which datagrams are sent and acknowledgements received.
   TimedQueueMaker& networkQueues;
-  /// A stable identifier of this installation: for true the one that respects the user's diagnostics consent,
-  /// for false the one that is used when a storebag overrides it.
+  /// A stable identifier of this installation. For true, the one that respects the user's diagnostics
+  /// consent; for false, the one that is used if a storebag overrides it.
   std::function<std::string(bool respectsConsent)> persistentIdentifierForDNU{};
   /// Whether the user agreed to the submission of diagnostics.
   std::function<bool()> diagnosticsSubmissionConsent{};
-  /// The two-letter country code of the current locale, when it has one.
+  /// The two-letter country code of the current locale, if it has one.
   std::function<std::optional<std::string>()> regionCode{};
-  /// What keeps uploads in bounds; closed when the daemon stops.
+  /// Limits uploads; closed when the daemon stops.
   std::shared_ptr<UploadGate> uploads = std::make_shared<UploadGate>();
-  /// Where power-log backends record; without one they record nothing.
+  /// Where power-log backends record events. If null, they record none.
   std::shared_ptr<PowerLog> powerLog = nullptr;
   /// How many dashboards may outlive their sessions.
   std::shared_ptr<DashboardLinger> dashboardLinger = std::make_shared<DashboardLinger>(kMaximumLingering);
   /// How many bytes of events may be held back.
   std::shared_ptr<HeldBudget> heldBudget = std::make_shared<HeldBudget>();
-  /// What servers refused.
+  /// Logs refused posts.
   std::shared_ptr<RefusedPosts> refusedPosts = std::make_shared<RefusedPosts>();
 };
 

@@ -1,4 +1,4 @@
-// How many bytes of events are held back: by a session, by its user, by the whole process.
+// Counts the bytes of held events per session, per user and for the process.
 #pragma once
 
 #include <sys/types.h>
@@ -13,11 +13,11 @@
 
 namespace vesk {
 
-/// A sum with a limit; what is added counts in the wider accounts as well, which it keeps alive. It never
-/// refuses: who adds asks `exceeded` afterwards and gives something up. Thread-safe.
+/// A sum with a limit. Bytes added to an account also count in the wider accounts, which it keeps alive.
+/// Never refuses: the caller checks `exceeded` afterwards and drops something. Thread-safe.
 class HeldAccount {
  public:
-  /// `holder`: whose it is, for the log; empty: a session's.
+  /// `holder` names the account's owner in the log; empty for a session's account.
   explicit HeldAccount(std::size_t limit, std::string holder = {},
                        std::shared_ptr<HeldAccount> wider = nullptr);
   HeldAccount(const HeldAccount&) = delete;
@@ -32,8 +32,7 @@ class HeldAccount {
   bool isOfSession() const noexcept { return _holder.empty(); }
   const HeldAccount* wider() const noexcept { return _wider.get(); }
 
-  /// The narrowest account that would be above so many times its limit if `growth` were added; null when none
-  /// would.
+  /// The narrowest account that would exceed `times` its limit if `growth` were added, or null.
   const HeldAccount* exceeded(std::size_t growth = 0, std::size_t times = 1) const noexcept;
 
  private:
@@ -48,7 +47,7 @@ using HeldBytes = std::shared_ptr<HeldAccount>;
 /// Gives each session its account. Thread-safe.
 class HeldBudget {
  public:
-  /// Bytes.
+  /// In bytes.
   struct Limits {
     std::size_t ofSession = std::size_t{16} << 20;
     std::size_t ofUser = std::size_t{64} << 20;
@@ -58,14 +57,14 @@ class HeldBudget {
   HeldBudget() : HeldBudget(Limits{}) {}
   explicit HeldBudget(const Limits& limits);
 
-  /// A new one, for all backends of one session or single message of that user.
+  /// Makes a new account, for all backends of one session or single message of that user.
   HeldBytes accountFor(uid_t user);
 
  private:
   const Limits _limits;
   const HeldBytes _all;
   Mutex _mutex;
-  std::map<uid_t, std::weak_ptr<HeldAccount>> _users VESK_GUARDED_BY(_mutex);  ///< of those with sessions
+  std::map<uid_t, std::weak_ptr<HeldAccount>> _users VESK_GUARDED_BY(_mutex);  ///< users with sessions
 };
 
 }  // namespace vesk

@@ -1,4 +1,4 @@
-// What a session knows of its reporting backends.
+// The interface of reporting backends to their sessions.
 #pragma once
 
 #include <sys/time.h>
@@ -22,10 +22,11 @@ enum BackendState : std::int32_t {
   BackendStatePending = 0,   ///< not yet decided; messages are held back
   BackendStateDisabled = 1,  ///< reporting off; messages are dropped
   BackendStateEnabled = 2,   ///< reporting on
-  BackendStateOverride = 3,  ///< sampled out, inside the override band: held back until a message lifts it
+  BackendStateOverride =
+      3,  ///< sampled out, inside the override band: messages are held back until one lifts it
 };
 
-/// A message's flag: one of these, or both; any other makes it an ordinary message.
+/// A message's flag: one of these, or both. With any other value it is an ordinary message.
 enum MessageFlag : std::int32_t {
   MessageFlagRealtime = 1,
   MessageFlagOverrideSampling = 2,
@@ -40,17 +41,17 @@ constexpr bool isOverridingSampling(std::int32_t flag) {
 
 /// One destination of a session's messages. Its operations may be called from any thread.
 ///
-/// Those that send (sendMessage, flushMessages, cleanup) do not overlap: each holds _sendMutex from the first
-/// look at the backend until its post or datagram is on its way, however long the body takes to build. So
-/// messages leave, are logged and are answered in the order in which they were numbered, and cleanup waits
-/// for a body that is under construction. They must not be called under the agent's monitor. Subclasses
-/// override the `…InTurn` forms.
+/// The operations that send (sendMessage, flushMessages, cleanup) do not overlap: each holds _sendMutex from
+/// its first access to the backend until its post or datagram is on its way, however long the body takes to
+/// build. So messages are sent, logged and answered in the order of their numbers, and cleanup waits for a
+/// body that is being built. They must not be called under the agent's monitor. Subclasses override the
+/// `…InTurn` forms.
 ///
-/// All other operations, which relatives call under the monitor, take only _mutex. It is a leaf and held for
-/// moments: never while a body is built or compressed, while foreign code runs or while a server is waited
-/// for. Subclasses override the `…Locked` forms.
+/// All other operations, which relatives call under the monitor, take only _mutex. It is a leaf and held
+/// briefly: never while a body is built or compressed, while foreign code runs or while waiting for a server.
+/// Subclasses override the `…Locked` forms.
 ///
-/// Kept alive by its session and by posts that are under way.
+/// Kept alive by its session and by posts in progress.
 class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBackend> {
  public:
   virtual ~VeskReportingBackend() = default;
@@ -62,19 +63,19 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
 
   // --- What a session asks of every backend ---------------------------------------------------------------
 
-  /// Ends the backend's activity, when its session ends or replaces it. Does nothing the second time.
+  /// Ends the backend's activity when its session ends or replaces it. Has no effect the second time.
   void cleanup() VESK_EXCLUDES(_sendMutex, _mutex);
 
-  /// Decides the state anew.
+  /// Re-evaluates the state.
   void updateState() VESK_EXCLUDES(_mutex);
 
   /// Numbers the message with the backend's next event ID (1 after construction, 0 after 65535) and sends it.
-  /// Gives the text for the local message log, or nothing.
+  /// Returns the text for the local message log, if any.
   std::optional<std::string> sendMessage(const std::optional<Dictionary>& payload, const timeval& timestamp,
                                          std::uint16_t method, std::uint16_t respCode, std::int32_t flag)
       VESK_EXCLUDES(_sendMutex, _mutex);
 
-  /// Sends what is held back, where that is allowed; gives the text for the local message log, or nothing.
+  /// Sends what is held back, if allowed. Returns the text for the local message log, if any.
   std::optional<std::string> flushMessages() VESK_EXCLUDES(_sendMutex, _mutex);
 
   /// `extensionToken` names the descriptor that the client passed. May block for a server's answer.
@@ -129,7 +130,7 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
   const BackendIdentity _identity;
   const BackendServices& _services;
 
-  // Synchronised by themselves.
+  // Thread-safe by themselves.
   std::atomic<std::int32_t> _state{BackendStatePending};
   std::atomic<std::int32_t> _hierarchy{0};
   std::atomic<double> _samplingFactor;

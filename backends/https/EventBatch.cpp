@@ -6,7 +6,8 @@ namespace vesk {
 
 namespace {
 
-// What a held event costs beyond its entries and texts: its place in the batch and the decoder's arena chunk.
+// The memory that a held event takes beyond its entries and texts: its place in the batch and the decoder's
+// arena chunk.
 constexpr std::size_t kOverhead = 1024;
 constexpr std::size_t kMostMethods = 65'536;
 
@@ -32,7 +33,7 @@ bool EventBatch::passesThreshold(std::int64_t method, std::int32_t threshold) {
   return true;
 }
 
-// An eighth at once, or all others would be at the limit with each of their events.
+// Drops an eighth at once. Otherwise all other holders would be at the limit with each of their events.
 std::size_t EventBatch::dropOldest(const std::string& backendName) {
   std::size_t dropped = 0;
   const HeldAccount* exceeded = nullptr;

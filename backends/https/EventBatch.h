@@ -14,13 +14,13 @@
 
 namespace vesk {
 
-/// Oldest first. What its events take is part of the session's account from when they are added until they
-/// are dropped or the batch is destroyed. Not thread-safe, but for the account.
+/// Oldest first. Its events count in the session's account from when they are added until they are dropped or
+/// the batch is destroyed. Not thread-safe, except for the account.
 class EventBatch {
  public:
   struct HeldEvent {
     MutableDictionary event;
-    std::size_t bytes = 0;  ///< about what it takes of memory
+    std::size_t bytes = 0;  ///< approximate memory
   };
   using Events = std::deque<HeldEvent>;
 
@@ -33,19 +33,20 @@ class EventBatch {
   EventBatch& operator=(const EventBatch&) = delete;
 
   void add(MutableDictionary event);
-  /// The same, and counts the event among those of its method.
+  /// As above, and also counts the event for its method.
   void add(MutableDictionary event, std::int64_t method);
-  /// True when there are more events of the method than that; their count then starts again.
+  /// Returns true if the batch holds more events of the method than `threshold`, and then restarts their
+  /// count.
   bool passesThreshold(std::int64_t method, std::int32_t threshold);
 
-  /// Where an account is above its limit, drops the oldest until it is an eighth below; the newest one goes
-  /// only for the sake of others than the session. Returns how many it dropped; the first time there is a
-  /// line of level 4, here and below.
+  /// If an account is above its limit, drops the oldest events until it is an eighth below. Drops the newest
+  /// event only for the sake of an account other than the session's. Returns the number dropped. Here and
+  /// below, the first drop is logged at level 4.
   std::size_t dropOldest(const std::string& backendName);
 
-  /// Adds what is not empty to the events that came before it was known: its first key tells which have it
-  /// already. Where an account would come above twice its limit, the older ones are dropped. Returns how
-  /// many.
+  /// Adds non-empty user info to the events that were added before it was known; its first key shows which
+  /// events already have it. If an account would exceed twice its limit, drops the older events. Returns the
+  /// number dropped.
   std::size_t addUserInfo(const Dictionary& userInfo, const std::string& backendName);
 
   void setSessionID(const std::optional<Text>& sessionID);

@@ -15,8 +15,8 @@ bool isASCII(std::string_view text) {
   return std::all_of(text.begin(), text.end(), [](char c) { return static_cast<unsigned char>(c) < 0x80; });
 }
 
-// A key in ASCII is met by keys of the same length, or by longer ones that are not in ASCII themselves (the
-// Kelvin sign folds to k): everything else is settled without comparing.
+// A key in ASCII matches only keys of the same length, or longer keys that are not ASCII (the Kelvin sign
+// folds to k). This decides most cases without a comparison.
 bool matchesKey(const filterTag& filter, std::string_view key) {
   if (!filter.key) return false;
   std::size_t wanted = filter.key->size();
@@ -30,8 +30,8 @@ std::int32_t numberIn(const MutableDictionary& event, std::string_view key) {
 }
 
 // Texts are digested as they are, numbers and dates as the decimal text of the number that the body would
-// carry; of anything else there is no text to digest, and a value that was to be hidden must not leave in the
-// clear.
+// carry. Other values have no text to digest and are removed, because a value that should be hidden must not
+// leave in the clear.
 std::optional<Value> digested(const Value& value) {
   if (const Text* text = value.text()) return Value(VeskReportingBackend::convertIntoSHA256(text->view()));
   if (const Date* date = value.date()) return digested(finiteOrMinusOne(date->secondsSince1970));

@@ -17,17 +17,17 @@ struct filterTag {
   std::int32_t method = -1;  ///< event method to which it applies; negative: any
   std::int32_t status = -1;  ///< event status to which it applies; negative: any
   std::int32_t action = Leave;
-  std::optional<Text> key;  ///< compared ignoring case; none matches nothing
+  std::optional<Text> key;  ///< compared ignoring case; without a key, matches nothing
   bool keyIsASCII = false;
 };
 
-/// A table of filters, in the storebag's order. Not synchronised: it belongs to its backend.
+/// A table of filters, in the storebag's order. Not thread-safe: protected by its backend.
 class EventFilters {
  public:
   EventFilters() = default;
 
-  /// Replaces the table by one record per element; an empty array leaves the table as it is. `backendName` is
-  /// named in the log lines about filters that can't be read.
+  /// Replaces the table with one record per element; an empty array leaves the table unchanged. `backendName`
+  /// appears in the log lines about unreadable filters.
   void createFiltersFromArray(const List& filters, std::string_view backendName);
 
   /// Applies the table in place. The first record that matches a key decides about that key.

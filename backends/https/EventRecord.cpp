@@ -18,14 +18,13 @@ namespace {
 constexpr std::size_t kFixedFields = 17;
 constexpr std::int32_t kClientTypeWithNumericSessionID = 7;
 
-// Of all sessions that start within a minute the records show the same start. A clock may be wrong by
-// decades.
+// Records show the same start for all sessions that start within a minute. The clock may be wrong by decades.
 std::int32_t startOfMinute(double seconds) {
   constexpr double kLatest = std::numeric_limits<std::int32_t>::max();
   return static_cast<std::int32_t>(std::clamp(seconds, -kLatest, kLatest)) / 60 * 60;
 }
 
-// Sets a field whose source may be unknown; then it stays out of the record, also when the payload has one.
+// Sets a field. If its source is unknown, the field is left out, even if the payload has one.
 template <class T>
 void setIfKnown(MutableDictionary& event, Text key, const std::optional<T>& value) {
   if (value) {

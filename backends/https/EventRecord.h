@@ -1,4 +1,4 @@
-// The event records that messages become.
+// Makes event records from messages.
 #pragma once
 
 #include <sys/time.h>
@@ -13,7 +13,7 @@
 
 namespace vesk {
 
-/// One message and what its record says of the session; borrowed while the record is made.
+/// One message and what its record says about the session. Borrowed while the record is made.
 struct EventSource {
   const std::optional<Dictionary>& payload;
   const timeval& timestamp;
@@ -25,15 +25,15 @@ struct EventSource {
   bool hasExtrasOnInternal;
 };
 
-/// The payload with the fields that are computed here, which replace entries of the same name; there is room
-/// for `more` entries. A field whose source is unknown is left out, also where the payload has one.
+/// Returns the payload with the fields that are computed here, which replace entries of the same name, and
+/// with room for `more` entries. A field whose source is unknown is left out, even if the payload has one.
 MutableDictionary createEventDictfromPayload(const EventSource& source, std::size_t more);
 
 /// Adds the user info, then applies the filters.
 void prepareEventForMessage(MutableDictionary& event, const std::optional<Dictionary>& userInfo,
                             const EventFilters& filters);
 
-/// The payload of a session's last message, which also tells how the session was sampled.
+/// The payload of a session's last message, which also says how the session was sampled.
 std::optional<Dictionary> payloadWithStopEntries(const std::optional<Dictionary>& payload,
                                                  const PostPolicy::Settings& settings,
                                                  const std::optional<Value>& samplingThreshold);

@@ -18,7 +18,7 @@ constexpr std::size_t kShown = 64;  // bytes of a value in a log line
 constexpr std::size_t kMostRemembered = 256;
 constexpr std::int32_t kAny = -1;
 
-/// What is wrong with the filters of one list, a line each.
+/// The faults found in one list of filters, one line each.
 class Faults {
  public:
   explicit Faults(std::string_view backendName) : _backendName(backendName) {}
@@ -28,7 +28,7 @@ class Faults {
                      describe(value, kShown) + "; the filter " + std::string(consequence));
   }
 
-  /// Unless the same filters were reported before.
+  /// Logs the faults unless the same filters were reported before.
   void report(const List& filters) const {
     if (_lines.empty() || !isNew(filters)) return;
     for (const std::string& line : _lines) {
@@ -62,7 +62,7 @@ std::optional<std::int32_t> numberOf32Bits(std::string_view text) {
 
 std::optional<std::int32_t> numberOf32Bits(const Value& value) {
   if (const Text* text = value.text()) return numberOf32Bits(text->view());
-  const auto number = value.asDouble();  // holds every integer of 32 bits
+  const auto number = value.asDouble();  // holds every 32-bit integer
   using Limits = std::numeric_limits<std::int32_t>;
   if (!number || !(*number >= Limits::min() && *number <= Limits::max())) return std::nullopt;
   return static_cast<std::int32_t>(*number);
@@ -95,7 +95,7 @@ std::int32_t limitOf(filterTag& filter, const Dictionary& source, std::string_vi
   if (!value) return kAny;
   if (auto number = numberOf32Bits(*value)) return *number;
   const bool hides = filter.action != filterTag::Leave;
-  if (!hides) filter.key.reset();  // or it would shield every value from the filters behind it
+  if (!hides) filter.key.reset();  // otherwise it would shield every value from later filters
   faults.add(index, "'" + std::string(field) + "' is not an integer of 32 bits", *value,
              hides ? "applies to any" : "applies to nothing");
   return kAny;

@@ -1,4 +1,4 @@
-// Filters as a storebag writes them, made into records.
+// Compiles a storebag's filters into records.
 #pragma once
 
 #include <string_view>
@@ -9,10 +9,10 @@
 
 namespace vesk {
 
-/// One record per element, in order. A filter that hides a value never fails open: with a `method` or
-/// `status` that can't be read it applies to any, while one that only leaves values alone then applies to
-/// nothing. Each mistake costs one line of level 4 that names backend, filter (from 0) and field; further
-/// updates and sessions with the same filters don't repeat them. Thread-safe.
+/// Returns one record per element, in order. A filter that hides a value never fails open: if its `method` or
+/// `status` can't be read, it applies to any, whereas a filter that only leaves values alone then applies to
+/// nothing. Each mistake is logged in one line of level 4 that names the backend, the filter (from 0) and the
+/// field; later updates and sessions with the same filters don't repeat it. Thread-safe.
 std::vector<filterTag> compileFilters(const List& filters, std::string_view backendName);
 
 }  // namespace vesk

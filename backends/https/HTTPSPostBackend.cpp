@@ -12,7 +12,7 @@ namespace {
 
 constexpr std::uint16_t kSessionTypeStop = 1;
 
-// The device's facts hold for all sessions alike, so one line a process is enough.
+// The device's facts are the same for all sessions, so one line per process is enough.
 void noteMissingFamily(const std::string& name) {
   static std::atomic<bool> noted{false};
   if (noted.exchange(true)) return;
@@ -62,7 +62,7 @@ HTTPSPostBackend::HTTPSPostBackend(const std::string& name, const Dictionary& pr
 
 HTTPSPostBackend::~HTTPSPostBackend() {
   MutexLock lock(_mutex);
-  // Events that never found the backend enabled leave no other trace.
+  // Events that were held by a backend that was never enabled leave no other trace.
   if (holdsEvents()) _services.counters.count(_name, DropReason::NeverEnabled, _batchedEvents->size());
 }
 
@@ -88,7 +88,7 @@ std::int32_t HTTPSPostBackend::updateBackendState() {
                                      _settings);
   for (const PostPolicy::Step& step : decision.steps) {
     logPolicyStep(step, _name, draw);
-    // Complaints about filters belong here in the log.
+    // Compiled here so that complaints about filters appear at the right place in the log.
     if (step.rule == "filters" && decision.filters) _filters.createFiltersFromArray(*decision.filters, _name);
   }
   if (decision.filters) setSamplingThreshold(decision.samplingThreshold);
@@ -107,8 +107,8 @@ std::optional<std::string> HTTPSPostBackend::sendMessageInTurn(const std::option
     _services.counters.count(_name, DropReason::StateDisabled);
     return std::nullopt;
   }
-  // The event gets its place before the lock is released: what relatives change while a body is built then
-  // reaches it among the held events.
+  // The event gets its place before the lock is released, so that changes by relatives while a body is built
+  // reach it among the held events.
   PostToBuild earlier;
   PostToBuild own;
   bool batchEvents = false;
@@ -116,7 +116,7 @@ std::optional<std::string> HTTPSPostBackend::sendMessageInTurn(const std::option
     MutexLock lock(_mutex);
     MutableDictionary event = eventFor(payload, timestamp, method, respCode, eventID);
     if (isOverridingSampling(flag)) {
-      std::int32_t expected = BackendStateOverride;  // a completion may just switch the backend off
+      std::int32_t expected = BackendStateOverride;  // a completion may be switching the backend off
       _state.compare_exchange_strong(expected, BackendStateEnabled);
     }
     batchEvents = _settings._batchEvents;
@@ -190,7 +190,8 @@ HTTPSPostBackend::PostToBuild HTTPSPostBackend::batchEvent(MutableDictionary eve
 
 bool HTTPSPostBackend::holdsEvents() const { return _batchedEvents && _batchedEvents->size() > 0; }
 
-// Enabled, a full batch is simply sent. Otherwise nothing may be sent yet, and the oldest events have to go.
+// An enabled backend sends a full batch. Otherwise nothing may be sent yet, and the oldest events are
+// dropped.
 void HTTPSPostBackend::boundHeldEvents() {
   if (!_identity._heldBytes->exceeded()) return;
   PostToBuild full;
@@ -276,7 +277,7 @@ std::optional<std::string> HTTPSPostBackend::buildAndPost(PostToBuild post) {
       return std::move(body->prettyJsonString);
     }
   } catch (...) {
-    // No memory for it, and the events are given up already.
+    // Out of memory; the events are already lost.
     _services.counters.count(_name, DropReason::BodyNotBuilt, eventCount);
     throw;
   }
@@ -290,7 +291,7 @@ void HTTPSPostBackend::postJSONMessage(Post post, std::string json, std::size_t 
     return;
   }
   auto request = postRequest(std::move(*post.url), std::move(post.headers), std::move(json), _identity._user);
-  // The completion keeps the backend alive; at a session's end it may be its last holder.
+  // The completion keeps the backend alive. At a session's end it may hold the last reference.
   auto self = std::static_pointer_cast<HTTPSPostBackend>(shared_from_this());
   _services.http.start(std::move(request), [self, eventCount](const HTTPResult& result) {
     self->postCompleted(result, eventCount);

@@ -14,10 +14,10 @@
 namespace vesk {
 
 /// Turns each message into an event record, filters it, and posts it at once or holds it for a batch, as the
-/// client entry of its profile says.
+/// client entry of its profile specifies.
 class HTTPSPostBackend final : public VeskReportingBackend {
  public:
-  /// Nothing when profile or product family are missing, or when the profile has no `clients`.
+  /// Returns null if the profile or the product family is missing, or if the profile has no `clients`.
   static std::shared_ptr<HTTPSPostBackend> create(const std::string& name,
                                                   const std::optional<Dictionary>& profile,
                                                   const BackendIdentity& identity,
@@ -38,15 +38,15 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   void setCorrelatedSessionIDLocked(const std::optional<Text>& sessionID) override VESK_REQUIRES(_mutex);
 
  private:
-  /// Events that were taken to be posted, and all that their post is made of: later changes of the backend
-  /// don't concern them.
+  /// Events taken for a post, with everything that the post is made of: later changes of the backend don't
+  /// affect them.
   struct Post {
     std::unique_ptr<EventBatch> events;
-    std::optional<Dictionary> lateUserInfo;  ///< filtered, not empty; for events from before it was known
+    std::optional<Dictionary> lateUserInfo;  ///< filtered, not empty; for events held before it was known
     std::optional<std::string> url;
     std::string clientID;
     PostHeaders headers;
-    bool isPrintable = false;  ///< the local message log may get its text
+    bool isPrintable = false;  ///< the text may go to the local message log
   };
   using PostToBuild = std::unique_ptr<Post>;
 
@@ -65,21 +65,21 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   void boundHeldEvents() VESK_REQUIRES(_sendMutex) VESK_EXCLUDES(_mutex);
   void countDropped(std::size_t events) const;
 
-  // Taking events out to be posted; null: there are none, or they may not go yet.
+  // Taking events out for a post. Null if there are none or they may not be sent yet.
   PostToBuild takeBatch() VESK_REQUIRES(_mutex);
   PostToBuild takeBatchBeforeSingleEvent() VESK_REQUIRES(_mutex);
   PostToBuild makePost(std::unique_ptr<EventBatch> events, std::int32_t flag,
                        std::optional<std::uint16_t> method, std::optional<std::uint16_t> responseCode) const
       VESK_REQUIRES(_mutex);
 
-  // Body and post: without _mutex, since a body may be large.
+  // Building and posting run without _mutex, since a body may be large.
   std::optional<std::string> buildAndPost(PostToBuild post) VESK_REQUIRES(_sendMutex) VESK_EXCLUDES(_mutex);
   void postJSONMessage(Post post, std::string json, std::size_t eventCount);
   void postCompleted(const HTTPResult& result, std::size_t eventCount);
 
   // Constant after construction.
   const bool _dnuEnabled;  // the user's consent
-  // The client's identifier: where the consent is respected, and where the storebag overrides it.
+  // The client's identifiers: one respects the consent, the other is used if the storebag overrides it.
   const std::string _uuidRespectDnu;
   const std::string _uuidOverrideDnu;
 

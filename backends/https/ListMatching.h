@@ -1,4 +1,4 @@
-// How a client entry of a storebag is matched with names.
+// Matches names against the lists of a storebag's client entry.
 #pragma once
 
 #include <optional>
@@ -8,16 +8,16 @@
 
 namespace vesk {
 
-/// Absent or not, a list of texts.
+/// A list of texts, or nullopt if absent.
 using NameList = std::optional<List>;
 
-/// True when an item equals the whole string, ignoring case. An absent or empty list gives `whitelist`, an
-/// absent string its negation.
+/// Returns true if an item equals the whole string, ignoring case. Returns `whitelist` for an absent or empty
+/// list, its negation for an absent string.
 bool matchExactStringWithList(const NameList& list, std::optional<std::string_view> wholeString,
                               bool whitelist);
 
-/// True when an item occurs anywhere in the string, ignoring case; an empty item never does. Special cases as
-/// above.
+/// Returns true if an item occurs anywhere in the string, ignoring case; an empty item never matches. Special
+/// cases as above.
 bool matchStringWithList(const NameList& list, std::optional<std::string_view> wholeString, bool whitelist);
 
 /// The pieces of a text between commas, empty ones included.

@@ -1,4 +1,4 @@
-// What the log says of a policy's decisions.
+// Logs a policy's decisions.
 #pragma once
 
 #include <string>
@@ -7,7 +7,7 @@
 
 namespace vesk {
 
-/// Writes the step's line, when it has one.
+/// Logs the step, if there is a line for it.
 void logPolicyStep(const PostPolicy::Step& step, const std::string& backendName, double samplingFactor);
 
 }  // namespace vesk

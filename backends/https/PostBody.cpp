@@ -20,14 +20,14 @@ namespace {
 constexpr std::size_t kLongestKeyInLog = 200;
 constexpr std::size_t kLongestValueInLog = 100;
 
-// JSON has no number that is not finite.
+// JSON has no numbers that are not finite.
 bool fitsIntoBody(const Value& value) {
   if (const double* number = value.real()) return std::isfinite(*number);
   return value.isNumber() || value.text() != nullptr;
 }
 
-// Dates become seconds; what JSON events can't carry is removed and reported, or it would cost the whole
-// batch.
+// Converts dates to seconds. Removes and reports what JSON can't carry; otherwise the whole batch would be
+// lost.
 void sanitize(MutableDictionary& event) {
   std::erase_if(event.entries(), [](DictionaryEntry& entry) {
     if (fitsIntoBody(entry.value)) return false;
@@ -43,7 +43,7 @@ void sanitize(MutableDictionary& event) {
   });
 }
 
-// A line break in a name from a client must not become a header of its own.
+// A line break in a name from a client must not start another header.
 std::string headerValue(const Text& text) {
   std::string value = text.string();
   std::erase_if(value, [](char c) { return static_cast<unsigned char>(c) < 0x20 || c == 0x7f; });

@@ -1,4 +1,4 @@
-// What one post carries: headers and JSON.
+// The contents of one post: headers and JSON.
 #pragma once
 
 #include <cstdint>
@@ -17,21 +17,21 @@ namespace vesk {
 
 struct PostBody {
   std::string json;                             ///< compact, for the server
-  std::optional<std::string> prettyJsonString;  ///< for the local message log, when that may have it
+  std::optional<std::string> prettyJsonString;  ///< for the local message log, if allowed there
 };
 
-/// Removes from the events what JSON can't carry, with a line of level 4 each, and serialises them. Nothing
-/// when that fails.
+/// Serialises the events, after removing what JSON can't carry, with a line of level 4 each. Returns nullopt
+/// on failure.
 std::optional<PostBody> createMessageForPostAndLogging(EventBatch& events, const std::string& clientID,
                                                        WallTime postTime, bool isPrintable);
 
 using PostHeaders = std::vector<std::pair<std::string, std::string>>;
 
-/// All but those of the body. `method` and `responseCode`: of a post that has a single event.
+/// All headers except those of the body. `method` and `responseCode` are set for a post with a single event.
 PostHeaders postHeaders(const BackendIdentity& identity, const std::optional<Dictionary>& userInfo,
                         std::optional<std::uint16_t> method, std::optional<std::uint16_t> responseCode);
 
-/// The body goes compressed where that is shorter. `user` is charged for what waits to be posted.
+/// Compresses the body if that makes it shorter. Posts waiting to be sent are charged to `user`.
 HTTPRequest postRequest(std::string url, PostHeaders headers, std::string json, uid_t user);
 
 }  // namespace vesk

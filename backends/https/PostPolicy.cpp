@@ -29,7 +29,7 @@ bool isText(const Value& value) { return value.text() != nullptr; }
 bool isList(const Value& value) { return value.list() != nullptr; }
 bool isDictionary(const Value& value) { return value.dictionary() != nullptr; }
 
-/// One decision while it is made.
+/// One decision in progress.
 class Evaluation {
  public:
   Evaluation(const PostPolicy::Facts& facts, const PostPolicy::Settings& previous) : _facts(facts) {
@@ -88,7 +88,7 @@ class Evaluation {
     const Value* wanted = read(key, isText);
     NameList names;
     if (wanted) names = componentsSeparatedByComma(wanted->text()->view());
-    // What restricts, and has the wrong type, must not let everybody pass.
+    // A restriction of the wrong type must not let every client pass.
     const bool isUnreadable = !wanted && _dictionary.contains(key);
     const auto view = name ? std::optional(name->view()) : std::nullopt;
     const bool does = !isUnreadable && matches(names, view, true);
@@ -144,7 +144,7 @@ class Evaluation {
   bool deviceAllows() {
     constexpr std::string_view kKey = "device_whitelist";
     NameList devices = textList(kKey);
-    // A list that names nothing readable must not let every device pass.
+    // A list without readable names must not let every device pass.
     const Value* said = _dictionary.find(kKey);
     const bool namesNone = !devices || devices->empty();
     if (said && namesNone && !(said->list() && said->list()->empty())) devices = List{""};
@@ -252,7 +252,7 @@ class Evaluation {
   std::optional<Text> _clientName;
   std::optional<Text> _serviceName;
   PostPolicy::Decision _decision;
-  Dictionary _dictionary;  // that is read: the profile, then one client entry after the other
+  Dictionary _dictionary;  // being read: the profile, then each client entry in turn
   std::optional<std::size_t> _entry;
 };
 

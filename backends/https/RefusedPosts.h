@@ -1,4 +1,4 @@
-// Tells in the log of the events that servers refuse.
+// Logs the events that servers refuse.
 #pragma once
 
 #include <chrono>
@@ -11,14 +11,14 @@
 
 namespace vesk {
 
-/// One line a burst of each backend name, of all sessions together: a server that moved refuses every post of
-/// each of them. Thread-safe.
+/// Logs one line per burst and backend name, for all sessions together: a server that moved refuses every
+/// post of every session. Thread-safe.
 class RefusedPosts {
  public:
   using Instant = std::chrono::steady_clock::time_point;
 
-  /// A server answered `status`, and that many events are lost. The line counts them, and those of the burst
-  /// before that came after its line.
+  /// Notes that a server answered `status` and that `events` events are lost. The line counts them, and those
+  /// of the previous burst that came after its line.
   void note(const std::string& backend, long status, std::size_t events,
             Instant now = std::chrono::steady_clock::now());
 

@@ -1,4 +1,4 @@
-// Short codes under which servers know the client types.
+// The short codes by which servers know the client types.
 #pragma once
 
 #include <array>
@@ -8,7 +8,8 @@
 
 namespace vesk {
 
-/// The sender code of a client type; nothing outside 0 to 11, where header and event field are left out.
+/// The sender code of a client type. Returns nullopt outside 0 to 11; the header and the event field are then
+/// left out.
 inline std::optional<std::string_view> senderCodeForClientType(std::int32_t clientType) noexcept {
   constexpr std::array<std::string_view, 12> kCodes{"QX", "WB", "JYP", "KF", "UZ", "HD",
                                                     "EP", "YW", "BQ",  "FX", "DJ", "OZ"};
