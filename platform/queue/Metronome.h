@@ -1,4 +1,4 @@
-// A beat that costs nothing while nobody listens to it.
+// A periodic beat that costs nothing while paused.
 #pragma once
 
 #include <chrono>
@@ -8,20 +8,21 @@
 
 namespace vesk {
 
-/// Calls a handler on a queue at every beat: at the start and then once an interval. Paused, it keeps its
-/// beat but neither a timer nor the handler, so that thousands may idle; resumed, it goes on with the next
-/// beat that it would have had anyway. Used on its queue only; the constructor may run elsewhere.
+/// Calls a handler on a queue at every beat: at the start, then once per interval. While paused it keeps its
+/// rhythm but has neither a timer nor the handler, so that thousands may idle; when resumed, it continues
+/// with the next regular beat. Used only on its queue; the constructor may run elsewhere.
 class Metronome {
  public:
-  /// Paused until `start`. `interval` is more than zero; `queue` outlives it.
+  /// Paused until `start`. `interval` must be positive; `queue` must outlive this object.
   Metronome(TimedQueue& queue, std::chrono::milliseconds interval)
       : _queue(queue), _interval(interval), _origin(queue.now()) {}
 
   /// The first beat is now.
   void start(Work handler);
-  /// To be called when it is paused.
+  /// Call only while paused.
   void resume(Work handler);
-  /// The handler is not called any more, and destroyed as soon as it does not run; it may call this itself.
+  /// The handler is not called again, and is destroyed as soon as it is not running. The handler may call
+  /// this.
   void pause() noexcept { _timer.reset(); }
   bool isPaused() const noexcept { return _timer == nullptr; }
 

@@ -26,7 +26,7 @@ namespace {
 namespace asio = boost::asio;
 using Error = boost::system::error_code;
 
-/// Work with the name of its queue, done on behalf of the user that asked for it.
+/// Work with the name of its queue and the user on whose behalf it runs.
 struct Task {
   Work work;
   const char* label;
@@ -46,7 +46,7 @@ struct Task {
 
 }  // namespace
 
-/// The thread and what waits for it; all of that is destroyed with the context.
+/// The thread and its pending operations, which are destroyed with the context.
 class QueueThread::Loop {
  public:
   Loop() : _guard(context.get_executor()), _thread([this] { serve(); }) {}
@@ -72,7 +72,7 @@ class QueueThread::Loop {
   std::thread _thread;
 };
 
-/// Outlives the thread as long as a queue does. The lock is a leaf: under it, things are only put into the
+/// Outlives the thread while a queue exists. The lock is a leaf: under it, things are only put into the
 /// context.
 struct QueueThread::Shared {
   Mutex mutex;
@@ -82,8 +82,8 @@ struct QueueThread::Shared {
   std::unique_ptr<Loop> loop VESK_GUARDED_BY(mutex);
 };
 
-/// Something in the context that calls a handler when it is ready. Only operations that wait in the context
-/// hold it, so that it never outlives the context. Once it waits, only the thread touches it.
+/// An operation in the context that calls a handler when it is ready. Only operations that wait in the
+/// context hold it, so that it never outlives the context. Once it waits, only the thread accesses it.
 class QueueThread::Waiter : public std::enable_shared_from_this<Waiter> {
  public:
   explicit Waiter(std::shared_ptr<const Task> task) : _task(std::move(task)) {}
@@ -158,7 +158,7 @@ class QueueThread::Watch final : public Waiter {
   asio::posix::stream_descriptor _descriptor;
 };
 
-/// Queues are serial and keep their order because the thread is one.
+/// Queues are serial and ordered because they share a single thread.
 class QueueThread::Queue final : public TimedQueue {
  public:
   Queue(std::shared_ptr<Shared> shared, const char* label) : _shared(std::move(shared)), _label(label) {
@@ -261,7 +261,7 @@ bool QueueThread::waitUntilUnused(std::chrono::milliseconds timeout) {
 }
 
 void QueueThread::stop() {
-  std::unique_ptr<Loop> stopped;  // ends without the lock
+  std::unique_ptr<Loop> stopped;  // destroyed without the lock held
   MutexLock lock(_shared->mutex);
   _shared->isStopped = true;
   stopped.swap(_shared->loop);

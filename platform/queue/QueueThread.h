@@ -1,4 +1,4 @@
-// The queues of the machine's own clock.
+// Queues that run on the system's clock.
 #pragma once
 
 #include <chrono>
@@ -8,12 +8,12 @@
 
 namespace vesk {
 
-/// Makes queues that share one thread, started with the first queue, and counts the queues that are in use.
+/// Makes queues that share one thread, which starts with the first queue, and counts the queues in use.
 /// Thread-safe.
 class QueueThread final : public TimedQueueMaker {
  public:
   QueueThread();
-  /// As `stop`.
+  /// Calls `stop`.
   ~QueueThread() override;
   QueueThread(const QueueThread&) = delete;
   QueueThread& operator=(const QueueThread&) = delete;
@@ -21,12 +21,13 @@ class QueueThread final : public TimedQueueMaker {
   /// Throws std::system_error when the thread can't be started.
   std::shared_ptr<TimedQueue> makeQueue(const char* label) override;
 
-  /// Waits until every queue has been released, at most `timeout`; true when none was left. Not from a queue.
+  /// Waits up to `timeout` until every queue has been released. Returns true if none is left. Must not be
+  /// called on a queue.
   [[nodiscard]] bool waitUntilUnused(std::chrono::milliseconds timeout);
 
-  /// Waits for the work that is running, then ends the thread. Work that waits is destroyed without having
-  /// run, as is work that is submitted later; queues and sources may outlive the thread and do nothing any
-  /// more. May be called twice; not from a queue.
+  /// Waits for the running work, then ends the thread. Pending work, and work submitted later, is destroyed
+  /// without being run. Queues and sources may outlive the thread and then do nothing. May be called twice.
+  /// Must not be called on a queue.
   void stop();
 
  private:
