@@ -88,7 +88,7 @@ int UDPSocket::disconnect() noexcept {
 int UDPSocket::reconnect(const IPv4Endpoint& peer) noexcept {
   if (int error = disconnect()) return error;
   const int error = connect(peer);
-  // A connection that fails leaves a port behind, at which anybody's datagrams would be received.
+  // A failed connection keeps its port, at which it would receive datagrams from anyone.
   if (error != 0) static_cast<void>(disconnect());
   return error;
 }

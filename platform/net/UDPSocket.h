@@ -18,56 +18,57 @@ struct IPv4Endpoint {
   std::uint32_t address = 0;
   std::uint16_t port = 0;
 
-  /// Four decimal numbers between dots ("127.0.0.1"), 15 characters at most; nothing else is understood.
+  /// Four decimal numbers separated by dots ("127.0.0.1"), at most 15 characters. Returns nullopt for
+  /// anything else.
   static std::optional<IPv4Endpoint> parse(std::string_view dotted, std::uint16_t port);
   /// "127.0.0.1:40312"
   std::string text() const;
   friend bool operator==(const IPv4Endpoint&, const IPv4Endpoint&) = default;
 };
 
-/// One socket, which never blocks and never raises SIGPIPE. Operations that can fail give the system's error
-/// number, 0 for none. On a closed socket they fail with EBADF. Not synchronised, except that the kernel lets
-/// one thread send while another receives.
+/// One socket, which never blocks and never raises SIGPIPE. Operations that can fail return the system's
+/// error number, or 0. On a closed socket they fail with EBADF. Not thread-safe, except that one thread may
+/// send while another receives.
 class UDPSocket {
  public:
-  /// Opens nothing.
+  /// Doesn't open a socket.
   UDPSocket() noexcept = default;
   [[nodiscard]] int open();
   [[nodiscard]] int bind(const IPv4Endpoint& local) noexcept;
-  /// To the wildcard address and a port that the system picks.
+  /// Binds to the wildcard address and a port chosen by the system.
   [[nodiscard]] int bindToAnyPort() noexcept { return bind({}); }
-  /// Only this peer's datagrams are received from now on.
+  /// From now on, receives datagrams only from this peer.
   [[nodiscard]] int connect(const IPv4Endpoint& peer) noexcept;
 
-  /// Once more, from an address that the system has now: a connection keeps the one that it was made with.
-  /// After a failure nothing is received until a later one succeeds.
+  /// Connects again, from an address that the system has now: a connection keeps its original address. After
+  /// a failure, no datagrams are received until a later call succeeds.
   [[nodiscard]] int reconnect(const IPv4Endpoint& peer) noexcept;
 
   enum class Outcome : unsigned char {
     Sent,        ///< the whole datagram
-    WouldBlock,  ///< the system has no room for it at the moment
-    NoRoute,     ///< not from the address that the connection has; `reconnect` may find another
+    WouldBlock,  ///< the system has no room for it now
+    NoRoute,     ///< cannot be sent from the connection's address; `reconnect` may find another
     Failed,
   };
-  /// To the connected peer.
+  /// Sends to the connected peer.
   [[nodiscard]] Outcome send(std::string_view datagram) noexcept;
   [[nodiscard]] bool sendTo(const IPv4Endpoint& peer, std::string_view datagram) noexcept;
-  /// One datagram, cut to the buffer's size; nothing when none is there or the system reports an error, which
-  /// that clears. `sender` may be null.
+  /// Returns the size of one datagram, truncated to the buffer's size. Returns nullopt if none is available
+  /// or the system reports an error, which this clears. `sender` may be null.
   [[nodiscard]] std::optional<std::size_t> receive(std::span<char> buffer,
                                                    IPv4Endpoint* sender = nullptr) noexcept;
 
-  /// What it is bound to; nothing before that.
+  /// The address it is bound to; nullopt before that.
   std::optional<IPv4Endpoint> localEndpoint() const noexcept;
   int descriptor() const noexcept { return _descriptor ? _descriptor->get() : -1; }
-  /// For who watches it; the socket is closed with the last share. Null when it isn't open.
+  /// For a thread that watches it; the socket is closed with the last share. Null if it isn't open.
   std::shared_ptr<const FileDescriptor> sharedDescriptor() const noexcept { return _descriptor; }
   bool isOpen() const noexcept { return _descriptor != nullptr; }
   /// May be called twice.
   void close() noexcept { _descriptor.reset(); }
 
  private:
-  /// Gives up a port that the system picked, too.
+  /// Also releases a port that the system chose.
   int disconnect() noexcept;
 
   std::shared_ptr<const FileDescriptor> _descriptor;
