@@ -14,14 +14,14 @@ namespace {
 
 constexpr std::size_t kMaxDepth = 64;
 
-/// How many characters at the start of `text` are ASCII that a JSON string holds as it is.
+/// The number of leading characters of `text` that are ASCII and need no escape in a JSON string.
 std::size_t plainPrefix(std::string_view text) {
   constexpr std::uint64_t kOnes = 0x0101010101010101u;
   std::size_t at = 0;
   for (; text.size() - at >= sizeof(std::uint64_t); at += sizeof(std::uint64_t)) {
     std::uint64_t eight;
     std::memcpy(&eight, text.data() + at, sizeof eight);
-    // Each term sets a byte's high bit: for control characters, quotes, backslashes, bytes beyond ASCII.
+    // Each term sets a byte's high bit: for control characters, quotes, backslashes and non-ASCII bytes.
     const std::uint64_t special = (eight - kOnes * 0x20) | ((eight ^ (kOnes * '"')) - kOnes) |
                                   ((eight ^ (kOnes * '\\')) - kOnes) | eight;
     if ((special & (kOnes * 0x80)) != 0) break;
@@ -53,7 +53,7 @@ void JSONWriter::breakLine() {
   if (_isPretty) _text.append(1, '\n').append(4 * _depth, ' ');
 }
 
-/// What stands before a value or a key.
+/// Writes the separator before a value or a key.
 void JSONWriter::separate() {
   if (std::exchange(_isMember, false)) return;
   if (!std::exchange(_isFirst, false)) _text += ',';
@@ -113,7 +113,7 @@ void JSONWriter::real(double number) {
   char digits[32];
   const std::string_view written(digits, std::to_chars(digits, std::end(digits), number, format).ptr);
   _text.append(written);
-  // So that readers know it for a double.
+  // So that readers recognise a double.
   if (isShort && written.find('.') == written.npos) _text.append(".0");
 }
 

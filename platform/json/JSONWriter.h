@@ -1,4 +1,4 @@
-// JSON text, written straight from values.
+// Writes JSON text directly from values.
 #pragma once
 
 #include <cstddef>
@@ -12,10 +12,10 @@ namespace vesk {
 
 enum class JSONStyle {
   Compact,  ///< no white space
-  Pretty    ///< one member a line, indented by four blanks a level
+  Pretty    ///< one member per line, indented by four blanks per level
 };
 
-/// Writes one JSON value, top to bottom, into one buffer:
+/// Writes one JSON value, in document order, into one buffer:
 ///
 ///     JSONWriter writer(JSONStyle::Compact, 4096);
 ///     writer.beginObject();
@@ -24,16 +24,16 @@ enum class JSONStyle {
 ///     writer.endObject();
 ///     if (auto body = writer.finish()) …
 ///
-/// A value that JSON can't carry makes the whole document fail: `finish` returns nothing then. These are text
-/// or keys that are not UTF-8, doubles and dates that are not finite, bytes, and values nested deeper
-/// than 64. Callers that would rather report something for such a value replace it first.
+/// If a value can't be represented in JSON, `finish` returns nullopt for the whole document. This applies to
+/// text or keys that are not UTF-8, doubles and dates that are not finite, bytes, and values nested deeper
+/// than 64. Callers that prefer a substitute for such a value must replace it first.
 ///
 /// Doubles are written with as few digits as read back to the same double, so that seconds since 1970 keep
-/// their microseconds. Dates are written as their seconds since 1970, the null marker as null. The caller
-/// keeps begin and end in pairs and gives one value to each key. Not thread-safe.
+/// their microseconds. Dates are written as seconds since 1970, the null marker as null. The caller must pair
+/// begin and end and give each key one value. Not thread-safe.
 class JSONWriter {
  public:
-  /// `reserve`: bytes that the text is expected to need; more is allocated as needed.
+  /// `reserve`: expected size of the text in bytes; more is allocated as needed.
   explicit JSONWriter(JSONStyle style, std::size_t reserve = 1024);
 
   void beginObject() { open('{'); }
@@ -43,10 +43,10 @@ class JSONWriter {
   void key(std::string_view key);
 
   void value(const Value& value);
-  /// The entries as an object: for dictionaries that are still under construction.
+  /// The entries as an object, for dictionaries still under construction.
   void value(const MutableDictionary& dictionary);
 
-  /// The text when everything in it could be written. The writer is used up.
+  /// Returns the text if all of it could be written. The writer must not be used afterwards.
   std::optional<std::string> finish();
 
  private:
