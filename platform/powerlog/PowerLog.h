@@ -18,32 +18,32 @@
 
 namespace vesk {
 
-/// Records events in a file, on a thread of its own: callers wait neither for the disk nor for another
-/// process. Thread-safe; its lock is a leaf.
+/// Records events in a file, on a thread of its own, so that callers wait neither for the disk nor for other
+/// processes. Thread-safe; its lock is a leaf.
 class PowerLog {
  public:
   struct Options {
     std::string path;
     std::int64_t maximumRows = 100'000;
-    std::size_t maximumWaiting = std::size_t{4} << 20;  ///< bytes of events that wait for the disk
+    std::size_t maximumWaiting = std::size_t{4} << 20;  ///< bytes of events waiting for the disk
     std::size_t maximumEvent = std::size_t{64} << 10;   ///< bytes of one event
     const WallClock* clock = &WallClock::system();
-    /// Told how many events were lost, on any thread; must not block or throw.
+    /// Called with the number of lost events, on any thread; must not block or throw.
     std::function<void(std::uint64_t events)> onLost;
   };
 
   explicit PowerLog(Options options);
-  /// Writes what waits, as far as the disk and other processes allow.
+  /// Writes pending events, as far as the disk and other processes allow.
   ~PowerLog();
   PowerLog(const PowerLog&) = delete;
   PowerLog& operator=(const PowerLog&) = delete;
 
-  /// Records an event under its registered identifier. Bytes become base64 text, numbers that are not finite
-  /// become -1. `context` is not used. An event that can't be kept is lost and told to `onLost`.
+  /// Records an event under its registered identifier. Bytes become base64 text; numbers that are not finite
+  /// become -1. `context` is ignored. Events that can't be kept are lost and reported to `onLost`.
   void KLLogRegisteredEvent(std::uint32_t identifier, std::string_view name, const Dictionary& dictionary,
                             const std::optional<Value>& context);
 
-  /// Waits until everything recorded before is in the file or lost.
+  /// Waits until everything recorded earlier is in the file or lost.
   void flush();
 
  private:
@@ -62,7 +62,7 @@ class PowerLog {
   bool _stopping VESK_GUARDED_BY(_mutex) = false;
   std::thread _thread VESK_GUARDED_BY(_mutex);  ///< started by the first event
 
-  // The thread's.
+  // Used only by the thread.
   PowerLogFile _file;
   bool _isFailing = false;  ///< a failure was logged and isn't over yet
 };

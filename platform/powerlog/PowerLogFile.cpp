@@ -16,7 +16,7 @@ namespace {
 
 constexpr std::chrono::seconds kMaxAge = std::chrono::days(7);
 constexpr std::int64_t kMaxBytes = std::int64_t{64} << 20;  // of the database, roughly
-constexpr std::chrono::milliseconds kPatience{5000};        // with another process that writes
+constexpr std::chrono::milliseconds kPatience{5000};        // time to wait for another process that writes
 
 constexpr char kSetUp[] =
     "PRAGMA journal_mode=WAL;"
@@ -29,7 +29,7 @@ constexpr char kSetUp[] =
 
 constexpr char kInsert[] = "INSERT INTO events(identifier, name, time, dictionary) VALUES(?1, ?2, ?3, ?4)";
 
-// A quarter of a file that is too large goes at a time: its pages are used again, so this is seldom.
+// Drops a quarter of a file that is too large. The freed pages are reused, so this is rare.
 constexpr char kPrune[] =
     "DELETE FROM events WHERE time < ?1 OR id <= (SELECT max(id) - ?2 FROM events)"
     " OR id <= (SELECT (3 * (SELECT min(id) FROM events) + (SELECT max(id) FROM events)) / 4 WHERE ?3 <"
@@ -55,7 +55,7 @@ std::string PowerLogFile::append(const std::vector<PowerLogEvent>& events, WallT
     result = write(events, now);
   }
   if (result == SQLITE_OK) return {};
-  // Rolls back. The cause may be over when the file is opened the next time.
+  // Rolls back. The cause may be gone when the file is next opened.
   _database.reset();
   return sqlite3_errstr(result);
 }
@@ -80,7 +80,7 @@ int PowerLogFile::open() {
       _path.c_str(), &database, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX, nullptr);
   _database.reset(database);
   if (result != SQLITE_OK) return result;
-  // Of two processes that turn a new file to WAL at once, SQLite lets one fail without waiting.
+  // If two processes switch a new file to WAL simultaneously, SQLite fails one of them without waiting.
   FileDescriptor lock;
   if (lockFile(lock, _path + ".lock", kPatience) == EWOULDBLOCK) return SQLITE_BUSY;
   sqlite3_busy_timeout(database, static_cast<int>(kPatience.count()));

@@ -1,4 +1,4 @@
-// The file of the power log, to be written.
+// Writes the file of the power log.
 #pragma once
 
 #include <cstdint>
@@ -11,30 +11,30 @@
 
 namespace vesk {
 
-/// The log's file, as on a device.
+/// The default path of the power log.
 inline constexpr char kPowerLogPath[] = "/var/lib/veskreportingd/power-log.sqlite";
 
 struct PowerLogEvent {
-  std::uint32_t identifier = 0;  ///< which kind of event it is registered as
+  std::uint32_t identifier = 0;  ///< the kind of event that it is registered as
   std::string name;
   WallTime time{};
   std::string dictionary;  ///< JSON object
 };
 
-/// An SQLite database (WAL) with one row an event, bounded by age, rows and bytes. A file that is found
-/// damaged is moved to "….corrupt" (in place of an earlier one) and begun anew. Used by one thread; waits for
-/// the disk, and up to 5 s for another process that writes.
+/// An SQLite database (WAL) with one row per event, limited by age, rows and bytes. A damaged file is moved
+/// to "….corrupt", replacing an earlier one, and started anew. For use by one thread; waits for the disk, and
+/// up to 5 s for another process that writes.
 class PowerLogFile {
  public:
   PowerLogFile(std::string path, std::int64_t maximumRows)
       : _path(std::move(path)), _maximumRows(maximumRows) {}
 
-  /// Adds all events or none, and drops those that are beyond the limits. Returns what went wrong; empty when
-  /// nothing did.
+  /// Adds all events or none, then drops rows beyond the limits. Returns a description of the error, empty on
+  /// success.
   [[nodiscard]] std::string append(const std::vector<PowerLogEvent>& events, WallTime now);
 
  private:
-  // These return result codes of SQLite.
+  // These return SQLite result codes.
   int write(const std::vector<PowerLogEvent>& events, WallTime now);
   int open();
   int insert(const std::vector<PowerLogEvent>& events);

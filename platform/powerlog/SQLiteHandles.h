@@ -1,4 +1,4 @@
-// SQLite's handles with destructors, for those who write and read the power log.
+// Owning handles for SQLite, used to write and read the power log.
 #pragma once
 
 #include <sqlite3.h>
@@ -17,7 +17,7 @@ struct FinalizeSQLite {
 };
 using SQLiteStatement = std::unique_ptr<sqlite3_stmt, FinalizeSQLite>;
 
-/// Null when the text is no statement for this database.
+/// Returns null if the text is not a valid statement for this database.
 inline SQLiteStatement prepare(sqlite3* database, const char* text) noexcept {
   sqlite3_stmt* statement = nullptr;
   sqlite3_prepare_v2(database, text, -1, &statement, nullptr);
