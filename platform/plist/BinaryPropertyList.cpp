@@ -18,7 +18,7 @@ std::uint64_t bigEndian(std::string_view bytes) {
   return number;
 }
 
-/// What the last 32 bytes say about the rest.
+/// The contents of the last 32 bytes, which describe the rest.
 struct Trailer {
   std::size_t offsetSize = 0;
   std::size_t referenceSize = 0;
@@ -27,7 +27,7 @@ struct Trailer {
   std::size_t offsetTable = 0;
 };
 
-/// The trailer, when the table of offsets that it describes fills just the room before it.
+/// Returns the trailer if the offset table that it describes exactly fills the space before it.
 std::optional<Trailer> readTrailer(std::string_view bytes) {
   if (bytes.size() < kBinaryPropertyListMagic.size() + kTrailerSize) return std::nullopt;
   const std::string_view tail = bytes.substr(bytes.size() - kTrailerSize);
@@ -46,7 +46,7 @@ std::optional<Trailer> readTrailer(std::string_view bytes) {
   return trailer;
 }
 
-/// Reads the objects from the root down, each one anew at every reference to it.
+/// Reads the objects from the root down, and reads an object again for each reference to it.
 class BinaryReader {
  public:
   BinaryReader(std::string_view bytes, const Trailer& trailer, PropertyListFlavor flavor,
@@ -64,14 +64,14 @@ class BinaryReader {
   }
 
  private:
-  /// Where an object's payload starts, and what its marker says.
+  /// An object's payload offset and the contents of its marker.
   struct Marker {
     unsigned kind;
     std::uint64_t count;  // the marker's low half, or the length that follows it
     std::size_t payload;
   };
 
-  /// Keeps the first error.
+  /// Keeps only the first error.
   std::nullopt_t fail(std::string error) {
     if (_error.empty()) _error = std::move(error);
     return std::nullopt;
@@ -113,7 +113,7 @@ class BinaryReader {
     return entries.shareUnique();
   }
 
-  /// Whether it may stand at `depth` and all its references are there.
+  /// Returns true if the container is allowed at `depth` and all its references are present.
   bool beginContainer(const Marker& container, std::size_t referencesPerEntry, std::size_t depth) {
     const std::size_t room = (_objects.size() - std::min(container.payload, _objects.size())) /
                              (_trailer.referenceSize * referencesPerEntry);
@@ -131,7 +131,7 @@ class BinaryReader {
   }
 
   std::optional<Marker> readMarker(std::uint64_t offset) {
-    // An object before the first byte after the magic number, or in the table of offsets, is none.
+    // Objects must lie between the magic number and the offset table.
     if (offset < kBinaryPropertyListMagic.size() || offset >= _objects.size()) {
       return fail("an offset outside of the objects");
     }
@@ -185,7 +185,8 @@ class BinaryReader {
 
   static std::optional<Value> readInteger(std::optional<std::string_view> bytes) {
     if (!bytes) return std::nullopt;
-    // Up to 4 bytes are unsigned, 8 are signed, and 16 are signed but hold no more than 64 bits' worth.
+    // Integers of up to 4 bytes are unsigned, those of 8 are signed; those of 16 are signed but hold no more
+    // than 64 bits' worth.
     if (bytes->size() < 8) return Value(static_cast<std::int64_t>(bigEndian(*bytes)));
     const auto low = static_cast<std::int64_t>(bigEndian(bytes->substr(bytes->size() - 8)));
     if (bytes->size() == 8) return Value(low);

@@ -15,7 +15,7 @@ void appendBigEndian(std::string& out, std::uint64_t number, std::size_t size) {
   for (std::size_t i = size; i-- > 0;) out += static_cast<char>(number >> (8 * i) & 0xFF);
 }
 
-/// Bytes that `number` needs; of 1, 2, 4 and 8.
+/// The number of bytes that `number` needs: 1, 2, 4 or 8.
 std::size_t sizeFor(std::uint64_t number) {
   if (number <= 0xFF) return 1;
   if (number <= 0xFFFF) return 2;
@@ -26,7 +26,7 @@ std::string objectMarker(unsigned kind, unsigned low) { return {static_cast<char
 
 std::string unsignedObject(std::uint64_t number) {
   const std::size_t size = sizeFor(number);
-  // Eight bytes are signed, so the upper half of the range takes sixteen.
+  // Eight-byte integers are signed, so the upper half of the range takes sixteen bytes.
   const bool takesSixteen = number > static_cast<std::uint64_t>(INT64_MAX);
   std::string object = objectMarker(0x1, takesSixteen ? 4 : static_cast<unsigned>(std::countr_zero(size)));
   if (takesSixteen) appendBigEndian(object, 0, 8);
@@ -61,7 +61,7 @@ std::optional<std::string> textObject(std::string_view text) {
                        : countedObject(0x6, units->size() / 2).append(*units);
 }
 
-/// Lists all objects first: only their number tells how wide a reference has to be.
+/// Lists all objects first, because their number determines the size of a reference.
 class BinaryWriter {
  public:
   explicit BinaryWriter(PropertyListFlavor flavor) : _flavor(flavor) {}
@@ -92,7 +92,7 @@ class BinaryWriter {
     std::string bytes;
     std::vector<std::size_t> references = {};
   };
-  using Index = std::optional<std::size_t>;  // nothing: it can't be written
+  using Index = std::optional<std::size_t>;  // nullopt if it can't be written
 
   Index addBytes(std::string bytes) {
     _objects.push_back({std::move(bytes)});

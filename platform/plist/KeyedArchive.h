@@ -10,12 +10,12 @@
 
 namespace vesk {
 
-/// What stands under "$archiver".
+/// The value of "$archiver".
 inline constexpr std::string_view kKeyedArchiver = "VeskKeyedArchiver";
 inline constexpr std::int64_t kKeyedArchiveVersion = 100'000;
 
-/// `root` as archive. Equal texts, and lists and dictionaries that are shared, are archived once. Nothing for
-/// a text that is not UTF-8 or has a NUL, or for values nested deeper than 64.
+/// Returns `root` as an archive. Equal texts, and shared lists and dictionaries, are archived once. Returns
+/// nullopt for text that is not UTF-8 or has a NUL, or for nesting deeper than 64.
 std::optional<std::string> archiveValue(const Value& root);
 
 }  // namespace vesk

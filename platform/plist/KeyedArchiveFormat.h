@@ -1,4 +1,4 @@
-// The names in keyed archives, for their writer and their reader.
+// The names used in keyed archives, for the writer and the reader.
 #pragma once
 
 #include <string_view>
@@ -11,10 +11,10 @@ inline constexpr char kTop[] = "$top";
 inline constexpr char kObjects[] = "$objects";
 inline constexpr char kRoot[] = "root";
 
-/// The first object: what stands for none.
+/// The first object, which represents null.
 inline constexpr char kNull[] = "$null";
 
-/// An object's reference to the entry of its class, and what is in that entry.
+/// The key of an object's reference to its class entry, and the keys in that entry.
 inline constexpr char kClass[] = "$class";
 inline constexpr char kClassName[] = "$classname";
 inline constexpr char kClassChain[] = "$classes";
@@ -30,6 +30,6 @@ inline constexpr char kItems[] = "items";      // List: references; Dictionary: 
 inline constexpr char kKeys[] = "keys";        // Dictionary: references to texts, as many as items
 inline constexpr char kSeconds[] = "seconds";  // Date: seconds since 1970, a real
 inline constexpr char kBytes[] = "bytes";      // Data
-inline constexpr char kText[] = "text";        // String: a text that would be taken for the null object
+inline constexpr char kText[] = "text";        // String: a text that would be mistaken for the null object
 
 }  // namespace vesk::archive

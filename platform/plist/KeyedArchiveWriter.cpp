@@ -26,7 +26,7 @@ class ArchiveWriter {
   }
 
  private:
-  using Reference = std::optional<Value>;  // nothing: nested too deep
+  using Reference = std::optional<Value>;  // nullopt if nested too deeply
 
   static Value referenceTo(std::size_t index) {
     return Dictionary{{Text(kUIDKey), static_cast<std::uint64_t>(index)}};
@@ -55,7 +55,7 @@ class ArchiveWriter {
         return addShared(value.dictionary()->begin(), archive::kDictionaryClass, depth,
                          [&](MutableDictionary& object) { return fill(object, *value.dictionary(), depth); });
       default:
-        return append(value);  // numbers stand for themselves
+        return append(value);  // numbers need no object of their own class
     }
   }
 
@@ -73,7 +73,7 @@ class ArchiveWriter {
     return referenceTo(index);
   }
 
-  /// A container, which is told from others by where its contents are. `fillIt` archives the contents.
+  /// Adds a container, identified by the address of its contents. `fillIt` archives the contents.
   template <class Fill>
   Reference addShared(const void* contents, const char* className, std::size_t depth, Fill fillIt) {
     if (depth > kDeepest) return std::nullopt;
@@ -82,7 +82,7 @@ class ArchiveWriter {
       auto [known, isNew] = _containers.try_emplace(contents, index);
       if (!isNew) return referenceTo(known->second);
     }
-    _objects.emplace_back();  // its place; the contents come after it
+    _objects.emplace_back();  // reserves its index; its contents follow
     MutableDictionary object;
     if (!fillIt(object)) return std::nullopt;
     _objects[index] = withClass(std::move(object), className);

@@ -1,4 +1,4 @@
-// Property lists: what storebags are written in. Bytes from outside are read under hard limits.
+// Property lists, the format of storebags. Untrusted input is read under hard limits.
 #pragma once
 
 #include <cstddef>
@@ -11,36 +11,36 @@
 
 namespace vesk {
 
-/// What a document may cost at most.
+/// Limits on the cost of a document.
 struct PropertyListLimits {
   std::size_t bytes = 1 << 20;
-  std::size_t depth = 64;       ///< containers within containers; the root is the first
-  std::size_t nodes = 100'000;  ///< values and keys; what is referred to from many places counts each time
+  std::size_t depth = 64;               ///< containers within containers; the root counts as the first
+  std::size_t nodes = 100'000;          ///< values and keys; a shared object counts once per reference
   std::size_t contentBytes = 16 << 20;  ///< of texts and data, counted in the same way
 };
 
 enum class PropertyListFlavor {
   Plain,
-  /// Keyed archives refer to their objects by UIDs, which plain property lists do not have. A UID reads as a
-  /// dictionary of one entry, "CF$UID", with an unsigned integer; it is written in that form too.
+  /// Keyed archives refer to their objects by UIDs, which plain property lists do not have. A UID is read and
+  /// written as a dictionary with one entry, "CF$UID", an unsigned integer.
   KeyedArchive
 };
 
-/// The root value, or one clause that says what is wrong.
+/// The root value, or a clause that describes the error.
 struct PropertyListOutcome {
   std::optional<Value> value;
   std::string error;
 };
 
-/// Reads an XML or a binary property list, whichever `bytes` starts as. Refuses the whole document when it is
-/// not well-formed, passes a limit, or holds text that is not UTF-8 or has a NUL. Entities are neither
+/// Reads an XML or a binary property list, depending on how `bytes` starts. Refuses the whole document if it
+/// is malformed, exceeds a limit, or contains text that is not UTF-8 or has a NUL. Entities are neither
 /// declared nor fetched. Integers keep their full range: -2^63 to 2^64-1.
 PropertyListOutcome parsePropertyList(std::string_view bytes,
                                       PropertyListFlavor flavor = PropertyListFlavor::Plain,
                                       const PropertyListLimits& limits = {});
 
-/// `value` as binary property list; equal texts are written once. Nothing for a text that is not UTF-8 or has
-/// a NUL, or for values nested deeper than 64. The null marker is written as null.
+/// Returns `value` as a binary property list, with equal texts written once. Returns nullopt for text that is
+/// not UTF-8 or has a NUL, or for nesting deeper than 64. The null marker is written as null.
 std::optional<std::string> writeBinaryPropertyList(const Value& value,
                                                    PropertyListFlavor flavor = PropertyListFlavor::Plain);
 

@@ -12,14 +12,14 @@ namespace vesk {
 inline constexpr std::string_view kBinaryPropertyListMagic = "bplist00";
 inline constexpr std::string_view kUIDKey = "CF$UID";
 
-/// Seconds from the start of 1970 to that of 2001, from which the binary encoding counts.
+/// Seconds from the start of 1970 to the start of 2001, the epoch of the binary encoding.
 inline constexpr double kBinaryPropertyListEpoch = 978'307'200;
 
 PropertyListOutcome parseXMLPropertyList(std::string_view bytes, const PropertyListLimits& limits);
 PropertyListOutcome parseBinaryPropertyList(std::string_view bytes, PropertyListFlavor flavor,
                                             const PropertyListLimits& limits);
 
-/// Counts what a document costs. Each operation returns false once a limit is passed; `error` says which.
+/// Counts a document's cost. Each operation returns false once a limit is exceeded; `error` names the limit.
 class PropertyListBudget {
  public:
   explicit PropertyListBudget(const PropertyListLimits& limits) : _limits(limits) {}

@@ -9,7 +9,7 @@ namespace vesk {
 
 namespace {
 
-/// The whole of `text` as a number, digits only.
+/// Parses all of `text`, digits only, as a number.
 std::optional<std::uint64_t> digits(std::string_view text, int base) {
   std::uint64_t number = 0;
   auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number, base);
@@ -17,7 +17,7 @@ std::optional<std::uint64_t> digits(std::string_view text, int base) {
   return number;
 }
 
-/// Takes `count` digits and the character after them off `text`.
+/// Removes `count` digits and the character after them from `text`.
 std::optional<unsigned> takeField(std::string_view& text, std::size_t count, char after) {
   if (text.size() <= count || text[count] != after) return std::nullopt;
   auto number = digits(text.substr(0, count), 10);

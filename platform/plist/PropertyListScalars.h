@@ -8,8 +8,8 @@
 
 namespace vesk {
 
-/// Decimal or, after "0x", hexadecimal; white space around it is skipped. Signed when it fits, else unsigned;
-/// nothing outside -2^63 to 2^64-1.
+/// Decimal or, after "0x", hexadecimal; surrounding white space is skipped. The result is signed if it fits,
+/// otherwise unsigned. Returns nullopt outside -2^63 to 2^64-1.
 std::optional<Value> integerFromPropertyListText(std::string_view text);
 /// A decimal number, "nan" or an infinity.
 std::optional<double> realFromPropertyListText(std::string_view text);

@@ -14,7 +14,7 @@ namespace vesk {
 
 namespace {
 
-constexpr std::size_t kShown = 64;  // bytes of what is wrong
+constexpr std::size_t kShown = 64;  // bytes shown of a faulty text
 
 enum class Element { Unknown, PList, Dict, Array, Key, String, Integer, Real, True, False, Date, Data };
 
@@ -42,7 +42,7 @@ Element elementNamed(std::string_view name) {
 
 bool isContainer(Element element) { return element <= Element::Array; }
 
-/// Builds the value from Expat's events. The first problem stops the parser and stays.
+/// Builds the value from Expat's events. The first error stops the parser and is kept.
 class XMLReader {
  public:
   XMLReader(XML_Parser parser, const PropertyListLimits& limits) : _parser(parser), _budget(limits) {
@@ -61,12 +61,12 @@ class XMLReader {
   }
 
  private:
-  /// An element that is open.
+  /// An open element.
   struct Frame {
     Element element;
     std::vector<Value> values;     // of an array
     MutableDictionary entries;     // of a dictionary
-    std::optional<Text> key = {};  // of a dictionary: waits for its value
+    std::optional<Text> key = {};  // of a dictionary: the key waiting for its value
     std::string text = {};         // of anything else
   };
 
@@ -87,7 +87,7 @@ class XMLReader {
     if (element == Element::Unknown)
       return fail("unknown element <" + cutToWholeCharacters(name, kShown) + ">");
     if (!mayStart(element)) return fail("element <" + std::string(name) + "> may not stand here");
-    // The plist element itself is no container of the value.
+    // The plist element itself doesn't count as a container.
     const bool isCheap = element == Element::PList ||
                          (isContainer(element) ? _budget.addContainer(_frames.size()) : _budget.addLeaf(0));
     if (!isCheap) return fail(_budget.error());
@@ -181,7 +181,7 @@ class XMLReader {
     }
   }
 
-  // --- Expat calls these, even after a failure. No exception may pass through it.
+  // --- Called by Expat, even after a failure. Must not throw through it.
 
   template <class Handle>
   static void handle(void* self, Handle handle) noexcept {
@@ -199,7 +199,7 @@ class XMLReader {
   }
   static void onDoctype(void* self, const XML_Char*, const XML_Char*, const XML_Char*,
                         int hasInternalSubset) {
-    // Only declarations in the document itself could define entities: the one it refers to is never fetched.
+    // Only declarations in the document itself could define entities: an external DTD is never fetched.
     handle(self, [&](XMLReader& reader) {
       if (hasInternalSubset) reader.fail("declarations are not allowed");
     });
