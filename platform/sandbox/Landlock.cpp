@@ -28,7 +28,7 @@ constexpr std::uint64_t kFirstVersionRights = kFileRights | kWriteRights | LANDL
                                               LANDLOCK_ACCESS_FS_MAKE_CHAR | LANDLOCK_ACCESS_FS_MAKE_FIFO |
                                               LANDLOCK_ACCESS_FS_MAKE_BLOCK | LANDLOCK_ACCESS_FS_MAKE_SYM;
 
-// Newer than the header of some build machines.
+// Not defined in the kernel headers of some build machines.
 constexpr int kPortRule = 2;
 constexpr std::uint64_t kBindTCP = 1 << 0;
 constexpr std::uint64_t kConnectTCP = 1 << 1;
@@ -64,16 +64,16 @@ std::string failure(const std::string& what, int code) {
 
 long version() { return ::syscall(SYS_landlock_create_ruleset, nullptr, 0, LANDLOCK_CREATE_RULESET_VERSION); }
 
-/// A service manager may listen for its services' notifications on an abstract socket.
+/// A service manager may receive its services' notifications on an abstract socket.
 bool hasAbstractManager() {
   const char* socket = std::getenv("NOTIFY_SOCKET");
   return socket && *socket == '@';
 }
 
-/// Every right that the kernel can take away and that we know by name. Moving a file to another directory
-/// (version 2) is in nobody's grant. Truncation by path became a right only with version 3: the system-call
-/// group "truncation" stands in for it on every kernel. A kernel accepts a longer ruleset than it knows when
-/// the rest is zero.
+/// Covers every right known here that the kernel can restrict. Moving a file to another directory (version 2)
+/// is never granted. Truncation by path became a right only with version 3, so the system-call group
+/// "truncation" covers it on every kernel. A kernel accepts a ruleset longer than it knows if the rest is
+/// zero.
 FileDescriptor makeRuleset(long kernelVersion, bool restrictsConnections) {
   Ruleset ruleset;
   ruleset.files = kFirstVersionRights;
@@ -90,8 +90,8 @@ std::optional<std::string> addPort(int ruleset, std::uint16_t port) {
   return failure("landlock_add_rule: port " + std::to_string(port), errno);
 }
 
-/// A rule binds to the inode of today. The kernel makes up those below /proc, and makes up others once nobody
-/// uses the directory entry; so such an entry is held open for the life of the process.
+/// A rule applies to the current inode. The kernel creates inodes below /proc on demand, and creates a new
+/// one once the directory entry is unused. So the entry is held open for the life of the process.
 void keepIfMadeUp(FileDescriptor& descriptor, const std::string& path) {
   if (path.starts_with("/proc/")) [[maybe_unused]]
     int kept = descriptor.release();

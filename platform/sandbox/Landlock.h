@@ -1,4 +1,4 @@
-// Which files, ports and processes the process may use.
+// Restricts the files, ports and processes that the process may use.
 #pragma once
 
 #include <optional>
@@ -8,14 +8,14 @@
 
 namespace vesk {
 
-/// Denies the calling thread, and every thread made later, all files but the profile's paths; also
-/// connections that would trace or inspect a process outside. Descriptors that are open already keep working.
-/// Programs can't be run from anywhere. Needs no_new_privs. A kernel without Landlock is an error when the
-/// profile requires it; otherwise it costs one level-4 line.
+/// Denies the calling thread, and every thread created later, all files except the profile's paths, and any
+/// tracing or inspection of outside processes. Descriptors that are already open keep working. Programs can't
+/// be run from anywhere. Requires no_new_privs. A kernel without Landlock is an error if the profile requires
+/// it; otherwise it is logged in one line of level 4.
 ///
-/// Where the kernel knows how: no TCP port can be bound, only the profile's ports can be connected to
-/// (version 4), and neither signals nor abstract Unix sockets reach a process outside (version 6). An older
-/// kernel restricts less, which is no error. Returns what went wrong.
+/// If the kernel supports it, no TCP port can be bound and only the profile's ports can be connected to
+/// (version 4), and neither signals nor abstract Unix sockets reach an outside process (version 6). An older
+/// kernel restricts less, which is not an error. Returns a description of the error, if any.
 [[nodiscard]] std::optional<std::string> enterLandlock(const SandboxProfile& profile);
 
 }  // namespace vesk

@@ -19,7 +19,7 @@ namespace {
 
 constexpr std::size_t kMaximumProfile = std::size_t{64} << 10;
 
-/// Landlock confines the calling thread and the threads that it creates, no others.
+/// Landlock confines only the calling thread and the threads that it creates.
 bool hasOtherThreads() {
   std::error_code error;
   const std::filesystem::directory_iterator threads("/proc/self/task", error);

@@ -1,4 +1,4 @@
-// Confinement of the process.
+// Confines the process.
 #pragma once
 
 #include <optional>
@@ -7,13 +7,14 @@
 
 namespace vesk {
 
-/// Enters the sandbox that the profile describes, for good: no new privileges, files by Landlock, system
-/// calls by a seccomp filter. The profile is /usr/share/veskreporting/sandbox/<profileName>.toml under the
-/// root prefix; what it may say stands in SandboxProfile.h.
+/// Permanently enters the sandbox that the profile describes: no new privileges, files restricted by
+/// Landlock, system calls by a seccomp filter. The profile is
+/// /usr/share/veskreporting/sandbox/<profileName>.toml under the root prefix; SandboxProfile.h documents its
+/// format.
 ///
-/// Fails once the process has another thread: Landlock holds the calling thread and every thread made later.
-/// Returns why the sandbox could not be entered; the process may be half confined then, and should
-/// end.
+/// Fails if the process already has another thread, since Landlock confines only the calling thread and
+/// threads created later. Returns a description of the error, if any; the process may then be partly confined
+/// and should exit.
 [[nodiscard]] std::optional<std::string> enterSandbox(std::string_view profileName);
 
 }  // namespace vesk

@@ -29,7 +29,7 @@ constexpr PathKey kPathKeys[] = {
     {"remove-if-present", SandboxPath::Access::Remove, true},
 };
 
-/// Thrown inside this file only.
+/// Thrown only within this file.
 struct BadProfile {
   std::string error;
 };
@@ -40,7 +40,8 @@ struct BadProfile {
 
 std::string inQuotes(std::string_view text) { return "\"" + std::string(text) + "\""; }
 
-/// The path with its variable replaced and its dots resolved; empty when the variable is of no use.
+/// Returns the path with its variable expanded and its dots resolved. Returns an empty string if the variable
+/// is unset or not an absolute path.
 std::string expanded(std::string_view written) {
   std::string path(written);
   if (path.starts_with('$')) {

@@ -1,4 +1,4 @@
-// The profile of a sandbox: what a confined process may still do.
+// The profile of a sandbox: what a confined process may do.
 #pragma once
 
 #include <cstdint>
@@ -9,26 +9,27 @@
 
 namespace vesk {
 
-/// A file, or a directory with all that is in it, which the process may use.
+/// A file, or a directory with its contents, that the process may use.
 struct SandboxPath {
   enum class Access : unsigned char {
     Read,
     Write,    ///< read, write, create, rename and remove files and directories
-    Sockets,  ///< as `Write`, and Unix sockets may be bound there
-    Remove    ///< remove files, nothing else
+    Sockets,  ///< as `Write`, and bind Unix sockets there
+    Remove    ///< remove files only
   };
   std::string path;  ///< absolute, root prefix included
   Access access = Access::Read;
-  bool optional = false;  ///< nothing is granted when it is missing
+  bool optional = false;  ///< ignored if it is missing
 };
 
 struct SandboxProfile {
-  /// Whether a kernel without Landlock is an error. When it isn't, only the system-call filter holds there.
+  /// Whether a kernel without Landlock is an error. Otherwise only the system-call filter applies on such a
+  /// kernel.
   bool landlockRequired = true;
   std::vector<SandboxPath> paths;
-  /// TCP ports of servers that may be connected to; nothing: all.
+  /// TCP ports of servers that may be connected to; nullopt for all ports.
   std::optional<std::vector<std::uint16_t>> connectPorts;
-  std::vector<std::string> deniedCalls;  ///< names of groups that Seccomp.h knows
+  std::vector<std::string> deniedCalls;  ///< names of groups known to Seccomp.h
 };
 
 struct SandboxProfileOutcome {
@@ -36,27 +37,28 @@ struct SandboxProfileOutcome {
   std::string error;
 };
 
-/// Reads a profile from TOML. A key or a group of calls that is not known is an error: a slip of the pen must
-/// not open a door.
+/// Reads a profile from TOML. An unknown key or group of calls is an error: a typo must not weaken the
+/// sandbox.
 ///
 ///     landlock = "required"           # or "if-available"
-///     [machine]                       # paths of the machine, whatever the root prefix is
+///     [machine]                       # paths of the machine, independent of the root prefix
 ///     read = […]                      # must exist
 ///     read-if-present = […]
-///     write = […]                     # a directory that is missing is made (0750)
-///     sockets = […]                   # likewise (0755: clients must get at the socket)
-///     remove-if-present = […]         # files below may be removed, neither read nor written
+///     write = […]                     # a missing directory is created (0750)
+///     sockets = […]                   # likewise (0755, so that clients can reach the socket)
+///     remove-if-present = […]         # files below may be removed, but neither read nor written
 ///     [root]                          # the same keys, for paths under the root prefix
 ///     [network]
-///     connect = [53, 443]             # TCP ports to connect to; without this key, all
+///     connect = [53, 443]             # TCP ports that may be connected to; without this key, all
 ///     [calls]
 ///     deny = […]
 ///
-/// A path may begin with an environment variable ("$HOME/.config"); the entry is left out when that is
-/// unset or no absolute path. A path is taken by its text: "$SSL_CERT_FILE/.." is the directory of that file.
+/// A path may begin with an environment variable ("$HOME/.config"); the entry is left out if the variable is
+/// unset or not an absolute path. Paths are resolved textually: "$SSL_CERT_FILE/.." is the directory of that
+/// file.
 SandboxProfileOutcome parseSandboxProfile(std::string_view toml);
 
-/// Makes the directories to write to that are missing; returns why one could not be made.
+/// Creates missing directories among those to be written to. Returns a description of the error, if any.
 [[nodiscard]] std::optional<std::string> makeDirectories(const std::vector<SandboxPath>& paths);
 
 }  // namespace vesk

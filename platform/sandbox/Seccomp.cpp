@@ -21,7 +21,7 @@ namespace vesk {
 
 namespace {
 
-/// Calls of a group that are denied, all or when every condition on their arguments holds.
+/// Denied calls of a group: always, or only if all conditions on the arguments hold.
 struct Rule {
   std::string_view group;
   std::vector<const char*> calls;
@@ -29,7 +29,7 @@ struct Rule {
   int error = EPERM;
 };
 
-// The comparisons of libseccomp's macros, without their compound literals, which C++ lacks.
+// The comparisons of libseccomp's macros, which use compound literals, unavailable in C++.
 scmp_arg_cmp isEqual(unsigned argument, std::uint64_t value) {
   return {argument, SCMP_CMP_MASKED_EQ, 0xffffffff, value};
 }
@@ -39,7 +39,7 @@ scmp_arg_cmp hasBits(unsigned argument, std::uint64_t mask, std::uint64_t bits) 
 }
 scmp_arg_cmp hasBits(unsigned argument, std::uint64_t bits) { return hasBits(argument, bits, bits); }
 
-// Of the kernel's headers, one of which is C in some versions.
+// Defined here because some versions of the kernel's header are valid only in C.
 constexpr std::uint64_t kPriorityOfProcess = 1;
 constexpr std::uint64_t kAskForPersonality = 0xffffffff;
 
@@ -50,13 +50,13 @@ constexpr unsigned kCloneFlags =
     0;
 #endif
 
-// Calls stand by name, because a build machine's headers need not know every call that the library knows.
+// Calls are given by name, because a build machine's headers may lack calls that the library knows.
 std::vector<Rule> allRules() {
   const auto self = static_cast<std::uint64_t>(::getpid());
   std::vector<Rule> rules = {
       {"execute", {"execve", "execveat"}},
 
-      // Threads are made with clone. The flags of clone3 stand in memory, where a filter can't see them.
+      // Threads are created with clone. The flags of clone3 are in memory, which a filter can't inspect.
       {"processes", {"fork", "vfork"}},
       {"processes", {"clone"}, {hasBits(kCloneFlags, CLONE_THREAD, 0)}},
       {"processes", {"clone3"}, {}, ENOSYS},
@@ -104,7 +104,7 @@ std::vector<Rule> allRules() {
 
       {"modes", {"chmod", "fchmod", "fchmodat", "fchmodat2"}},
 
-      // A file that is open for reading only gets truncated all the same, with no right to write.
+      // Opening a file for reading only can still truncate it, without the right to write.
       {"truncation", {"truncate", "truncate64"}},
       {"truncation", {"open"}, {hasBits(1, O_ACCMODE | O_TRUNC, O_RDONLY | O_TRUNC)}},
       {"truncation", {"openat"}, {hasBits(2, O_ACCMODE | O_TRUNC, O_RDONLY | O_TRUNC)}},
@@ -123,13 +123,15 @@ std::vector<Rule> allRules() {
       {"sockets", {"socket"}, {isEqual(0, AF_INET6), hasBits(1, 0xf, SOCK_RAW)}},
 
       {"writable-code", {"mmap", "mmap2"}, {hasBits(2, PROT_WRITE | PROT_EXEC)}},
-      // A file could be mapped twice, to write and to execute. Libraries are mapped privately.
+      // A file could be mapped twice, once to write and once to execute. Libraries are mapped privately.
       {"writable-code", {"mmap", "mmap2"}, {hasBits(2, PROT_EXEC), hasBits(3, MAP_TYPE, MAP_SHARED)}},
       {"writable-code",
        {"mmap", "mmap2"},
        {hasBits(2, PROT_EXEC), hasBits(3, MAP_TYPE, MAP_SHARED_VALIDATE)}},
       {"writable-code", {"memfd_create", "memfd_secret"}},
-      {"writable-code", {"personality"}, {isOther(0, kAskForPersonality)}},  // READ_IMPLIES_EXEC is one
+      {"writable-code",
+       {"personality"},
+       {isOther(0, kAskForPersonality)}},  // READ_IMPLIES_EXEC is a personality flag
       {"writable-code", {"mprotect", "pkey_mprotect"}, {hasBits(2, PROT_EXEC)}},
       {"writable-code", {"shmat"}, {hasBits(2, SHM_EXEC)}},
 
@@ -139,7 +141,7 @@ std::vector<Rule> allRules() {
                         CLONE_NEWNET}) {
     rules.push_back({"namespaces", {"clone"}, {hasBits(kCloneFlags, flag)}});
   }
-  // One comparison per argument and rule: "none of these" has to be spelt out.
+  // A rule allows one comparison per argument, so every other family is denied individually.
   for (std::uint64_t family = 0; family <= AF_MAX; ++family) {
     if (family == AF_UNIX || family == AF_INET || family == AF_INET6 || family == AF_NETLINK) continue;
     rules.push_back({"sockets", {"socket"}, {isEqual(0, family)}});
