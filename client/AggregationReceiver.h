@@ -1,4 +1,4 @@
-// The client's own object on the wire.
+// The object that the client exports to the daemon.
 #pragma once
 
 #include <VeskReporting/VeskReportingTypes.h>
@@ -10,7 +10,7 @@
 
 namespace vesk {
 
-/// Hands the messages that the daemon calls it with to the client's handler, if it has one. For one thread.
+/// Passes the messages that the daemon sends to the client's handler, if there is one. Not thread-safe.
 class AggregationReceiver final : public IPCExportedObject {
  public:
   void setHandler(std::shared_ptr<const AggregationHandler> handler) noexcept {

@@ -1,4 +1,4 @@
-// Durations that a host chooses.
+// Limits durations that a host chooses.
 #pragma once
 
 #include <algorithm>
@@ -6,8 +6,8 @@
 
 namespace vesk {
 
-/// `wait`, but not less than none and not more than a day: what is longer means "for ever", and a clock's
-/// reading must be able to hold it.
+/// Limits `wait` to between zero and a day. Longer values mean "for ever", and adding them to a clock's
+/// reading must not overflow.
 constexpr std::chrono::milliseconds boundedWait(std::chrono::milliseconds wait) noexcept {
   return std::clamp<std::chrono::milliseconds>(wait, std::chrono::milliseconds(0), std::chrono::hours(24));
 }

@@ -13,7 +13,7 @@
 namespace vesk {
 
 ClientCall encoded(IPCOutgoingCall call, CallEffect effect) {
-  // Most calls fit, and grow no buffer step by step.
+  // Fits most calls, so that no buffer has to grow.
   constexpr std::size_t kUsualSize = 512;
   ClientCall result;
   std::string& message = result.call.message;

@@ -1,4 +1,4 @@
-// Makes calls out of what callers give.
+// Builds calls from the callers' arguments.
 #pragma once
 
 #include <exception>
@@ -10,13 +10,13 @@
 
 namespace vesk {
 
-/// A call that no receiver would take: too large, nested too deeply, or with text that is not UTF-8.
+/// A call that every receiver would refuse: too large, nested too deeply, or with text that is not UTF-8.
 class InvalidCall : public std::exception {};
 
 /// Throws InvalidCall or std::bad_alloc.
 ClientCall encoded(IPCOutgoingCall call, CallEffect effect);
 
-/// A one-way call of the daemon's object. Throws as `encoded`.
+/// A one-way call to the daemon's object. Throws like `encoded`.
 template <class... Arguments>
 ClientCall makeCall(CallEffect effect, const wire::Member& member, Arguments&&... arguments) {
   IPCOutgoingCall call{wire::kSessionInterface, member.name, {}};
@@ -32,13 +32,13 @@ ClientCall makeCall(const wire::Member& member, Arguments&&... arguments) {
 
 /// A file opened for the daemon.
 struct FileToUpload {
-  FileDescriptor descriptor;  ///< none: `error` says why
-  std::string url;            ///< of its absolute path
-  int error = 0;              ///< errno; EINVAL for what is no regular file
+  FileDescriptor descriptor;  ///< invalid if opening failed; see `error`
+  std::string url;            ///< the file's absolute path
+  int error = 0;              ///< errno; EINVAL if it isn't a regular file
 };
 
-/// Waits for no peer, whatever stands under that name (a pipe, a terminal); but a file system over a network
-/// or in user space may take its time. Throws std::bad_alloc.
+/// Doesn't block on a peer, whatever is at that path (a pipe, a terminal), but a network or user-space file
+/// system may take time. Throws std::bad_alloc.
 FileToUpload openToUpload(const std::string& path);
 
 }  // namespace vesk

@@ -26,7 +26,7 @@ ReportingStatus CallQueue::push(ClientCall&& call) {
     MutexLock lock(_mutex);
     if (_drainDeadline) return ReportingStatus::Closed;
     const bool isRequest = call.isConnectionRequest();
-    // One call of any size gets into an empty queue; the wire's own limit decides about it.
+    // An empty queue accepts one call of any size; the wire's own limit then applies.
     const bool isFull = _calls >= _maximumCalls || (_calls > 0 && _memory + call.memory > _maximumMemory);
     if (isFull && !isRequest) {
       countDrop(Drop::QueueFull);
@@ -50,7 +50,8 @@ ReportingStatus CallQueue::push(ClientCall&& call) {
 }
 
 void CallQueue::wake() noexcept {
-  // A full socket has woken the thread already. send() writes into no file of the host's.
+  // If the socket is full, the thread is already being woken. send(), unlike write(), can't write to a file
+  // that the host has opened under the same number.
   if (_writeEnd.isOurs()) ::send(_writeEnd.get(), "", 1, MSG_DONTWAIT | MSG_NOSIGNAL);
 }
 

@@ -1,4 +1,4 @@
-// Where calls wait for the session's thread.
+// The queue of calls for the session's thread.
 #pragma once
 
 #include <VeskReporting/VeskReportingTypes.h>
@@ -15,45 +15,47 @@
 
 namespace vesk {
 
-/// Why a call was not sent: as in ReportingDrops.
+/// Why a call was not sent; same as in ReportingDrops.
 enum class Drop { QueueFull, Invalid, Unsent };
 
-/// Bounded queue from any thread to one, with the count of what was dropped. Putting a call in takes a short
-/// lock, and costs a system call only when the receiving thread sleeps and asked to be woken for it.
+/// A bounded queue from any thread to one, which counts dropped calls. Pushing takes a short lock, and costs
+/// a system call only if the receiving thread sleeps and asked to be woken for the call.
 class CallQueue {
  public:
   using Time = ClientCall::Time;
-  /// What the receiving thread asks to be woken for.
+  /// Which calls wake the receiving thread.
   enum class WakeFor { NothingQueued, AnsweredCalls, EveryCall };
 
-  /// Throws std::system_error when no descriptor is left.
+  /// Throws std::system_error if no descriptor is left.
   explicit CallQueue(const ReportingOptions& options);
 
-  // For any thread.
+  // Thread-safe.
 
-  /// Queued, QueueFull or Closed. Connection requests need no room. Throws std::bad_alloc, and then nothing
-  /// was queued.
+  /// Returns Queued, QueueFull or Closed. Connection requests need no room. If it throws std::bad_alloc,
+  /// nothing was queued.
   ReportingStatus push(ClientCall&& call);
-  /// No call gets in any more; the receiving thread is to end by `drainDeadline`.
+  /// Refuses further calls; the receiving thread must end by `drainDeadline`.
   void close(Time drainDeadline) noexcept;
   void countDrop(Drop reason) noexcept { ++_drops[static_cast<std::size_t>(reason)]; }
-  /// Takes no lock, so that a process forked from this one may ask.
+  /// Takes no lock, so it may be called in a process forked from this one.
   ReportingDrops drops() const noexcept { return {_drops[0], _drops[1], _drops[2]}; }
 
-  // The receiving thread's side.
+  // Only for the receiving thread.
 
-  /// False once the host has closed the queue's descriptors: it can't wake its thread any more.
+  /// Returns false once the host has closed the queue's descriptors; the queue can then no longer wake its
+  /// thread.
   bool ownsItsDescriptors() const noexcept { return _readEnd.isOurs() && _writeEnd.isOurs(); }
-  /// Appends everything queued to `calls`, where it goes on to count against the bounds, and what asks for
-  /// the connection to `requests`; lowers `firstDeadline` to theirs. True when a burst of drops has begun,
-  /// which deserves a log line.
+  /// Appends queued calls to `calls`, where they still count against the limits, and connection requests to
+  /// `requests`. Lowers `firstDeadline` to their earliest deadline. Returns true if a burst of drops has
+  /// begun, which should be logged.
   bool take(ClientCalls& calls, ClientCalls& requests, Time& firstDeadline) noexcept;
-  /// Calls taken earlier have left, as the last ones or not: their room is free again, and the nodes of
-  /// those that are `emptied` are used again.
+  /// Frees the room of calls that were taken earlier. `wereLast`: no taken calls are left. The nodes of the
+  /// `emptied` calls are reused.
   void leave(std::size_t calls, std::size_t memory, bool wereLast, ClientCalls&& emptied = {}) noexcept;
-  /// Set once the queue is closed.
+  /// Set when the queue is closed.
   std::optional<Time> drainDeadline() const noexcept;
-  /// Waits for `other`, for a push of `what`, or until `wait` is over. Whether `other` is ready.
+  /// Waits until `other` is ready, a call that matches `what` is pushed, or `wait` has passed. Returns
+  /// whether `other` is ready.
   bool sleep(WakeFor what, ClientCall::Time::duration wait, pollfd other) noexcept;
 
  private:
@@ -61,20 +63,20 @@ class CallQueue {
 
   const std::size_t _maximumCalls;
   const std::size_t _maximumMemory;
-  // Sockets, which unlike an eventfd have an identity.
+  // Sockets, because unlike an eventfd they have an identity.
   GuardedDescriptor _readEnd;
   GuardedDescriptor _writeEnd;
 
   std::atomic<std::uint64_t> _drops[3] = {};
 
   mutable Mutex _mutex;
-  std::size_t _calls VESK_GUARDED_BY(_mutex) = 0;   ///< queued, or taken and not left yet
-  std::size_t _memory VESK_GUARDED_BY(_mutex) = 0;  ///< theirs
+  std::size_t _calls VESK_GUARDED_BY(_mutex) = 0;   ///< queued, or taken and not yet left
+  std::size_t _memory VESK_GUARDED_BY(_mutex) = 0;  ///< of those calls
   bool _isBurst VESK_GUARDED_BY(_mutex) = false;    ///< of drops
   ClientCalls _queued VESK_GUARDED_BY(_mutex);
   ClientCalls _requests VESK_GUARDED_BY(_mutex);
-  ClientCalls _spare VESK_GUARDED_BY(_mutex);                 ///< empty
-  Time _firstDeadline VESK_GUARDED_BY(_mutex) = Time::max();  ///< of the answers that those want
+  ClientCalls _spare VESK_GUARDED_BY(_mutex);                 ///< empty nodes for reuse
+  Time _firstDeadline VESK_GUARDED_BY(_mutex) = Time::max();  ///< earliest deadline of the queued calls
   WakeFor _wakeFor VESK_GUARDED_BY(_mutex) = WakeFor::NothingQueued;
   bool _mustTellOfBurst VESK_GUARDED_BY(_mutex) = false;
   std::optional<Time> _drainDeadline VESK_GUARDED_BY(_mutex);

@@ -18,10 +18,10 @@ namespace vesk {
 
 class BusAnswer;
 
-/// What a call leaves behind in the daemon, which has to be done again after a reconnection.
+/// State that a call leaves in the daemon and that must be restored after a reconnection.
 enum class CallEffect : std::uint8_t { None, Configures, Starts, ChangesUserInfo };
 
-/// The end of a call that wants an answer; called once, on the session's thread. `answer` is null unless
+/// Called once, on the session's thread, when a call that wants an answer ends. `answer` is null unless
 /// `status` is Done.
 using CallEnd = std::function<void(ReportingStatus status, BusAnswer* answer, std::string_view detail)>;
 
@@ -29,19 +29,19 @@ struct ClientCall {
   using Time = std::chrono::steady_clock::time_point;
 
   IPCEncodedCall call;
-  GuardedDescriptor descriptor;                           ///< the one that the arguments borrow
-  CallEnd end;                                            ///< empty: the call is one way
-  Time deadline{};                                        ///< of the answer
-  std::size_t memory = 0;                                 ///< bytes that it counts in the queue
-  std::shared_ptr<const AggregationHandler> aggregation;  ///< in force once this call was sent
+  GuardedDescriptor descriptor;                           ///< the descriptor that the arguments borrow
+  CallEnd end;                                            ///< empty for a one-way call
+  Time deadline{};                                        ///< for the answer
+  std::size_t memory = 0;                                 ///< bytes counted against the queue's limit
+  std::shared_ptr<const AggregationHandler> aggregation;  ///< takes effect when this call is sent
   CallEffect effect = CallEffect::None;
-  std::vector<IPCArgument> arguments;  ///< of a call with an effect
+  std::vector<IPCArgument> arguments;  ///< only for a call with an effect
 
-  /// Calls nothing: its end is told when the daemon is reached.
+  /// A connection request calls nothing: its end runs when the daemon is reached.
   bool isConnectionRequest() const noexcept { return call.message.empty(); }
 };
 
-/// A call keeps its place in memory while it moves from list to list.
+/// A list, so that a call keeps its address while it moves between lists.
 using ClientCalls = std::list<ClientCall>;
 
 }  // namespace vesk

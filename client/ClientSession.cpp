@@ -12,8 +12,9 @@ namespace vesk {
 
 namespace {
 
-// While it lives, threads that are started take no signals: those are the host's business. Only what a fault
-// in a callback raises stays as it is: the kernel would end the process past the host's handler.
+// While it exists, new threads start with signals blocked, since handling them is up to the host. Signals
+// raised by a fault in a callback stay unblocked; otherwise the kernel would kill the process without calling
+// the host's handler.
 class NoSignals {
  public:
   NoSignals() noexcept {

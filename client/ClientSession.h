@@ -1,4 +1,4 @@
-// How the operations of a session reach its thread, and what owns that.
+// Passes a session's operations to its thread, and owns that thread.
 #pragma once
 
 #include <VeskReporting/VeskReportingTypes.h>
@@ -20,26 +20,25 @@
 
 namespace vesk {
 
-/// The three ways of posting a call. `make` makes it, on the caller's thread and inside; whatever throws
-/// there becomes OutOfResources. For any thread of the process that made the session, and refused in every
-/// other.
+/// The three ways to post a call. `make` creates it on the caller's thread; an exception there becomes
+/// OutOfResources. Thread-safe in the process that created the session; refused in any other process.
 class ClientSession {
  public:
   using Timeout = std::chrono::milliseconds;
 
-  /// Throws std::system_error or std::bad_alloc when there is no memory, no descriptor or no thread for it.
+  /// Throws std::system_error or std::bad_alloc if memory, descriptors or threads are exhausted.
   explicit ClientSession(const ReportingOptions& options);
-  /// Waits for the thread's end; on that thread itself, only tells it to end.
+  /// Waits for the thread to end. On that thread, only tells it to end.
   ~ClientSession();
   ClientSession(const ClientSession&) = delete;
   ClientSession& operator=(const ClientSession&) = delete;
 
-  /// False in a process forked from the one that made this: only `drops` may be asked there.
+  /// Returns false in a process forked from the one that created this. Only `drops` may be called there.
   bool isOurs() const noexcept { return _process.isOurs(); }
   bool isConnected() const noexcept { return isOurs() && _worker->isConnected(); }
   ReportingDrops drops() const noexcept { return _worker->queue().drops(); }
 
-  /// One way.
+  /// Posts a one-way call.
   template <class Make>
   ReportingStatus post(const Make& make) noexcept {
     if (!isOurs()) return ReportingStatus::ForkedProcess;
@@ -53,7 +52,7 @@ class ClientSession {
     }
   }
 
-  /// With an answer for `callback`; without a callback, one way.
+  /// Posts a call whose answer goes to `callback`; one-way without a callback.
   template <class Answer, class Make>
   ReportingStatus ask(const Make& make, ReportingCallback<Answer> callback, Timeout timeout) noexcept {
     return post([&] {
@@ -64,17 +63,17 @@ class ClientSession {
     });
   }
 
-  /// Waits for the answer; a tenth of a second longer when a callback holds the session's thread.
+  /// Waits for the answer, up to a tenth of a second longer while a callback occupies the session's thread.
   template <class Answer, class Make>
   ReportingResult<Answer> wait(const Make& make, Timeout timeout) noexcept {
-    // The session's thread knows better why there is no answer in time; it is given a moment to say so.
+    // The session's thread knows best why there is no answer in time; this gives it a moment to report that.
     constexpr std::chrono::milliseconds kGrace{100};
     const auto outcome = [](ReportingStatus status) { return ReportingResult<Answer>{status, {}, {}}; };
     if (!isOurs()) return outcome(ReportingStatus::ForkedProcess);
     if (isSessionThread()) return outcome(ReportingStatus::OnSessionThread);
     try {
       const auto deadline = deadlineAfter(timeout) + kGrace;
-      // Shared by both: the caller may have gone when the answer comes.
+      // Shared with the handler: the caller may be gone when the answer arrives.
       struct Waited {
         ReportingResult<Answer> result;
         std::binary_semaphore isThere{0};
@@ -98,7 +97,7 @@ class ClientSession {
     return std::chrono::steady_clock::now() + boundedWait(timeout);
   }
 
-  /// From the bus's answer to the result that `callback` gets.
+  /// Converts the bus's answer to the result that `callback` gets.
   template <class Answer>
   static CallEnd endFor(ReportingCallback<Answer> callback) {
     return
@@ -113,7 +112,7 @@ class ClientSession {
               }
             }
           } catch (const std::exception&) {
-            // The callback is called all the same: without the words, or without the answer.
+            // Still calls the callback, but without the text or without the answer.
             result = {answer ? ReportingStatus::OutOfResources : status, {}, {}};
           }
           callback(std::move(result));

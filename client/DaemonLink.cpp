@@ -13,10 +13,11 @@ namespace vesk {
 
 namespace {
 
-// A daemon that accepts and then says nothing is as good as none.
+// A daemon that accepts but doesn't answer counts as absent.
 constexpr std::chrono::seconds kLongestKnock{10};
 
-// A connection that ends sooner is a failed attempt: a daemon that turns us away must not be asked in a loop.
+// A connection that ends sooner counts as a failed attempt, so that a daemon that rejects us is not tried in
+// a tight loop.
 constexpr std::chrono::seconds kShortestVisit{1};
 
 constexpr char kTurnedAway[] = "the daemon takes no more";
@@ -79,7 +80,7 @@ DaemonLink::Change DaemonLink::lose(Time now, const char* cause, ReportingStatus
   } catch (const std::exception&) {
     _problem.clear();
   }
-  // Out of the way first: the handlers that its end calls may ask about this link.
+  // Moved out first: handlers called while it ends may query this link.
   auto bus = std::move(_bus);
   return Change::Lost;
 }

@@ -1,4 +1,4 @@
-// How long the sessions of a process may wait at their end, together.
+// Limits how long the sessions of a process wait when they end, together.
 #pragma once
 
 #include <algorithm>
@@ -7,31 +7,30 @@
 
 namespace vesk {
 
-/// A host that destroys many sessions while the daemon hangs waits once, not once for each: what one session
-/// has waited, the others can't wait for as long again. A function of the times that it is given.
-/// Thread-safe.
+/// A host that destroys many sessions while the daemon hangs waits once, not once per session: time that one
+/// session has waited is not available to the others. Depends only on the times passed in. Thread-safe.
 class DrainBudget {
  public:
   using Clock = std::chrono::steady_clock;
   using Wait = std::chrono::milliseconds;
 
-  /// What a session may take in any case: enough for a daemon that is well.
+  /// What a session may always take: enough for a healthy daemon.
   static constexpr Wait kLeast{10};
 
-  /// The process's.
+  /// The instance for the process.
   static DrainBudget& shared() noexcept {
     static constinit DrainBudget budget;
     return budget;
   }
 
-  /// How much of `drainTime` a session may take that ends at `now`.
+  /// How much of `drainTime` a session that ends at `now` may take.
   Wait grant(Wait drainTime, Clock::time_point now) const noexcept {
     const Clock::time_point recovered{Clock::duration(_recovered.load())};
     const auto owed = std::max(std::chrono::ceil<Wait>(recovered - now), Wait(0));
     return std::max(drainTime - owed, std::min(kLeast, drainTime));
   }
 
-  /// A session has waited for `wait`, until `now`.
+  /// Records that a session waited for `wait`, until `now`.
   void spend(Clock::duration wait, Clock::time_point now) noexcept {
     const auto recovered = (now + wait).time_since_epoch().count();
     auto known = _recovered.load();
@@ -40,7 +39,7 @@ class DrainBudget {
   }
 
  private:
-  std::atomic<Clock::rep> _recovered{0};  ///< when nothing is owed any more
+  std::atomic<Clock::rep> _recovered{0};  ///< when the budget is full again
 };
 
 }  // namespace vesk

@@ -1,4 +1,4 @@
-// Tells a process from the one that it was forked from.
+// Detects that the process was forked.
 #pragma once
 
 #include <sys/mman.h>
@@ -6,9 +6,9 @@
 
 namespace vesk {
 
-/// Belongs to the process that made it. The kernel itself wipes the mark in a child (MADV_WIPEONFORK), so
-/// this needs no hook in the host process, also notices forks that bypass the C library, and costs a load
-/// from memory. Where the kernel can't, each question asks for the process ID. For any thread.
+/// Belongs to the process that created it. The kernel clears the mark in a child (MADV_WIPEONFORK), so this
+/// needs no hook in the host process, also detects forks that bypass the C library, and costs one load from
+/// memory. If the kernel can't do that, each check asks for the process ID. Thread-safe.
 class ForkGuard {
  public:
   ForkGuard() noexcept {
@@ -27,11 +27,11 @@ class ForkGuard {
   ForkGuard(const ForkGuard&) = delete;
   ForkGuard& operator=(const ForkGuard&) = delete;
 
-  /// False in a process forked from the one that made this.
+  /// Returns false in a process forked from the one that created this.
   bool isOurs() const noexcept { return _mark ? *_mark != 0 : ::getpid() == _process; }
 
  private:
-  static constexpr std::size_t kSize = 1;  // the kernel takes a whole page
+  static constexpr std::size_t kSize = 1;  // the kernel uses a whole page
 
   const pid_t _process = ::getpid();
   volatile char* _mark = nullptr;

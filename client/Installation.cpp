@@ -1,4 +1,4 @@
-// What the library says about its installation and the device.
+// Information about the installation and the device.
 #include <VeskReporting/VeskReporting.h>
 
 #include "common/PersistentIdentifiers.h"

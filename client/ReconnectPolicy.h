@@ -1,4 +1,4 @@
-// When to try to reach the daemon again.
+// Decides when to try to reach the daemon again.
 #pragma once
 
 #include <algorithm>
@@ -8,10 +8,9 @@
 
 namespace vesk {
 
-/// Waits grow from the first to the last, doubling with each failure. While one runs, a message that is
-/// queued allows one attempt ahead of time, because it may well be the daemon's return that caused it; one
-/// only, so that a busy client does not hammer on a socket that nobody serves. A function of `now` alone; for
-/// one thread.
+/// Waits double with each failure, from the first to the last. During a wait, a queued message allows one
+/// early attempt, because it may well be the daemon's return that caused it. Only one is allowed, so that a
+/// busy client does not hammer on an unserved socket. Depends only on `now`. Not thread-safe.
 class ReconnectPolicy {
  public:
   using Time = std::chrono::steady_clock::time_point;
@@ -22,14 +21,14 @@ class ReconnectPolicy {
         _last(std::max(boundedWait(last), _first)),
         _wait(_first) {}
 
-  /// When the next attempt is due; the past before the first failure.
+  /// When the next attempt is due; in the past before the first failure.
   Time due() const noexcept { return _due; }
   bool mayTryEarly() const noexcept { return _mayTryEarly; }
 
-  /// An attempt ahead of time begins.
+  /// An early attempt begins.
   void triedEarly() noexcept { _mayTryEarly = false; }
 
-  /// An attempt failed at `now`. One that was made ahead of time changes nothing about the wait that runs.
+  /// An attempt failed at `now`. An early attempt doesn't change the current wait.
   void failed(Time now) noexcept {
     if (now < _due) return;
     _due = now + _wait;

@@ -13,19 +13,19 @@ namespace vesk {
 
 namespace {
 
-// Writes in a row, so that answers and aggregated messages are received also while much is sent.
+// Limits consecutive writes, so that answers and aggregated messages are received even under heavy sending.
 constexpr int kWritesPerStep = 16;
 
-// One-way calls that are written together: enough to make the system call cheap, few enough to keep what has
-// to be sent again after a loss small.
+// One-way calls that are written together: enough to keep system calls cheap, few enough that little has to
+// be resent after a loss.
 constexpr std::size_t kCallsPerWrite = 64;
 constexpr std::size_t kBytesPerWrite = std::size_t{32} << 10;
 
-// Answers that the daemon may owe us; further calls that want one wait in the queue.
+// Maximum of outstanding answers; further calls that want one wait in the queue.
 constexpr std::size_t kMaximumAnswersOwed = 512;
 
-// After sending, the thread looks again after this time before it asks to be woken: a steady stream of
-// messages then costs its senders no system call.
+// After sending, the thread checks the queue once more after this time before it asks to be woken. A steady
+// stream of messages then costs its senders no system calls.
 constexpr std::chrono::milliseconds kNap{1};
 
 constexpr char kLost[] = "the daemon has closed the connection";
@@ -37,7 +37,7 @@ void SessionWorker::run() noexcept {
     try {
       step();
     } catch (const std::exception& error) {
-      // Out of memory, most likely: what waits goes on waiting.
+      // Most likely out of memory. Waiting calls continue to wait.
       VESK_LOG_ERROR("VeskReporting: %s", error.what());
       ::poll(nullptr, 0, 100);
     } catch (...) {
@@ -70,7 +70,7 @@ bool SessionWorker::isFinished(Time now) const noexcept {
 void SessionWorker::endEverything() noexcept {
   takeCalls();
   _isConnected.store(false, std::memory_order_relaxed);
-  // Before the link's end tells them that they have lost their connection.
+  // Before the link ends, which would report a lost connection to them instead.
   for (ClientCall& call : _owed) finish(call, ReportingStatus::Closed);
   _link.lose(Clock::now(), "the session was closed");
   while (!_waiting.empty()) {
@@ -80,15 +80,15 @@ void SessionWorker::endEverything() noexcept {
   endRequests(ReportingStatus::Closed, "");
 }
 
-// --- What comes in, and what ends without an answer
+// --- Incoming calls, and calls that end without an answer
 
 DaemonLink::Urgency SessionWorker::takeCalls() noexcept {
   const std::size_t calls = _waiting.size();
   const std::size_t requests = _requests.size();
-  // Asked first: once it is set, nothing gets in behind what is taken now.
+  // Read before taking calls: once it is set, no more calls can enter the queue.
   const bool wasClosing = _drainDeadline.has_value();
   _drainDeadline = _queue.drainDeadline();
-  // Told here and not where the call was refused: a log may have a host's sink behind it, which takes time.
+  // Logged here rather than where the call was refused, because the host's log sink may be slow.
   if (_queue.take(_waiting, _requests, _firstDeadline)) {
     VESK_LOG_WARNING("VeskReporting: too much waits for the daemon, messages are dropped");
   }
@@ -98,8 +98,8 @@ DaemonLink::Urgency SessionWorker::takeCalls() noexcept {
   return _isNapping ? DaemonLink::Urgency::Early : DaemonLink::Urgency::WhenDue;
 }
 
-// What an overdue call leaves behind in the daemon is wanted all the same: it stays, one way, and takes the
-// place of one just before it that does the same.
+// The effect of an overdue call is still wanted in the daemon, so the call stays as one-way and replaces a
+// call just before it that has the same effect.
 void SessionWorker::endOverdue(Time now) noexcept {
   if (now < _firstDeadline) return;
   _firstDeadline = Time::max();
@@ -183,7 +183,8 @@ void SessionWorker::linkHasChanged(DaemonLink::Change change) {
 
 void SessionWorker::connectionBroke(Time now) { linkHasChanged(_link.lose(now, kLost)); }
 
-// A daemon that does not know who we are must not get a message: without memory to tell it, try again later.
+// The daemon must not get a message before it knows the session. If there is no memory to introduce it, try
+// again later.
 void SessionWorker::introduceAgain() {
   bool isTold = false;
   try {
@@ -200,7 +201,7 @@ bool SessionWorker::tell(const wire::Member& member, const std::vector<IPCArgume
          BusClient::SendResult::Sent;
 }
 
-// Needs no memory: a call that was sent can't be taken back.
+// Needs no memory, because a call that was sent can't be taken back.
 void SessionWorker::remember(ClientCall& call) noexcept {
   constexpr std::size_t kUserInfoOfConfiguration = 1, kUserInfoOfStates = 0;
   if (call.effect == CallEffect::Configures) _configuration = std::move(call.arguments);
@@ -217,8 +218,8 @@ bool SessionWorker::canSend() {
   return !_waiting.front().end || _owed.size() < kMaximumAnswersOwed;
 }
 
-// One-way calls stay here until the socket has taken them: what only the bus held would be lost with the
-// connection. A call that wants an answer learns of that loss from the bus.
+// One-way calls are kept here until the socket has taken them, since those held only by the bus would be lost
+// with the connection. The bus reports such a loss to calls that want an answer.
 void SessionWorker::sendWaiting(Time now) {
   callsHaveLeft();
   for (int writes = 0; writes < kWritesPerStep && canSend(); ++writes) {
@@ -227,8 +228,8 @@ void SessionWorker::sendWaiting(Time now) {
   }
 }
 
-/// One call that wants an answer, or the one-way calls before the next of those. False when the connection
-/// has ended.
+/// Sends one call that wants an answer, or the one-way calls up to the next such call. Returns false if the
+/// connection has ended.
 bool SessionWorker::sendTogether(Time now) {
   BusClient& bus = _link.bus();
   for (auto next = _waiting.begin(); next != _waiting.end();) {
@@ -246,7 +247,7 @@ bool SessionWorker::sendTogether(Time now) {
   return bus.write() == BusClient::Progress::Connected;
 }
 
-/// Queued when the bus has taken the call, otherwise why not.
+/// Returns Queued if the bus has taken the call, otherwise the reason.
 ReportingStatus SessionWorker::handOver(Call call, Time now) {
   if (call->descriptor && !call->descriptor.isOurs()) return ReportingStatus::FileUnavailable;
   BusClient& bus = _link.bus();
@@ -285,19 +286,20 @@ void SessionWorker::answered(Call call, BusAnswer& answer) noexcept {
   one.splice(one.begin(), _owed, call);
   if (!answer.isError()) return finish(*call, ReportingStatus::Done, &answer);
   if (answer.errorName() == "org.freedesktop.DBus.Error.Disconnected") {
-    // A host that closes descriptors ends the session, whichever of them it is noticed by.
+    // A host that closes descriptors ends the session, whichever descriptor is noticed first.
     if (!_queue.ownsItsDescriptors()) return finish(*call, ReportingStatus::Closed);
     return finish(*call, ReportingStatus::NotConnected, nullptr, kLost);
   }
-  // The same name stands for a time that ran out and for a daemon that gave no answer.
+  // The same error name is used for an expired timeout and for a daemon that sent no answer.
   const bool isOverdue =
       answer.errorName() == "org.freedesktop.DBus.Error.NoReply" && Clock::now() >= call->deadline;
   finish(*call, isOverdue ? ReportingStatus::TimedOut : ReportingStatus::Refused, nullptr,
          answer.errorText());
 }
 
-// The daemon serves calls in order: its answer to this one shows that it has taken all before. A connection
-// closed sooner could fail under a daemon that still answers, and what it had not read yet would be lost.
+// The daemon serves calls in order, so its answer to this one shows that it has taken all earlier calls. If
+// the connection were closed sooner, it could break while the daemon is still answering, and unread calls
+// would be lost.
 void SessionWorker::sayFarewell(Time now) {
   const bool isTime =
       _drainDeadline && _farewell == Farewell::NotYet && _link.isReady() && _waiting.empty() && _owed.empty();

@@ -18,16 +18,16 @@
 
 namespace vesk {
 
-/// Takes calls out of the queue, keeps the link to the daemon, sends, and receives answers and aggregated
-/// messages. What is not said to be for any thread belongs to the thread that runs `run`.
+/// Takes calls from the queue, maintains the connection to the daemon, sends, and receives answers and
+/// aggregated messages. Unless marked otherwise, members are used only by the thread that runs `run`.
 class SessionWorker {
  public:
   explicit SessionWorker(const ReportingOptions& options) : _queue(options), _link(options, _receiver) {}
 
-  // For any thread.
+  // Thread-safe.
 
-  /// Once it is closed, `run` returns when everything is sent, answered and taken by the daemon, or at the
-  /// queue's drain deadline.
+  /// After it is closed, `run` returns once everything is sent, answered and accepted by the daemon, or at
+  /// the queue's drain deadline.
   CallQueue& queue() noexcept { return _queue; }
   bool isConnected() const noexcept { return _isConnected.load(std::memory_order_relaxed); }
 
@@ -73,28 +73,29 @@ class SessionWorker {
   Time nextDue(Time now);
   CallQueue::WakeFor wakeFor() const noexcept;
 
-  // Safe from any thread by themselves.
+  // Thread-safe by themselves.
   CallQueue _queue;
   std::atomic<bool> _isConnected{false};
 
-  // The thread's own. A call is in one of the three lists.
-  ClientCalls _waiting;   ///< to be sent; the first `_callsInBus` are one way and in the bus
-  ClientCalls _owed;      ///< sent, and not answered yet
-  ClientCalls _requests;  ///< for the connection
-  /// One-way calls that the bus has and the socket has not taken whole: they are sent again after a loss.
+  // Used only by the thread. Each call is in one of these three lists.
+  ClientCalls _waiting;   ///< to be sent; the first `_callsInBus` are one-way and already in the bus
+  ClientCalls _owed;      ///< sent, not yet answered
+  ClientCalls _requests;  ///< requests for a connection
+  /// One-way calls that the bus has but the socket has not fully taken: they are resent if the connection is
+  /// lost.
   std::size_t _callsInBus = 0;
-  /// No later than that of any call that waits or asks for the connection.
+  /// At or before the deadlines of all calls that wait or request a connection.
   Time _firstDeadline = Time::max();
 
   const std::shared_ptr<AggregationReceiver> _receiver = std::make_shared<AggregationReceiver>();
   DaemonLink _link;
-  // As last sent: what the daemon has to be told after a reconnection.
+  // As last sent; resent to the daemon after a reconnection.
   std::optional<std::vector<IPCArgument>> _configuration;
   bool _isStarted = false;
 
   std::optional<Time> _drainDeadline;  ///< set once the session is being closed
   Farewell _farewell = Farewell::NotYet;
-  bool _isHopeless = false;  ///< closing, and there never was a daemon
+  bool _isHopeless = false;  ///< closing, and the daemon was never reached
   bool _isNapping = false;
 };
 

@@ -20,10 +20,10 @@ namespace {
 
 using Timeout = std::chrono::milliseconds;
 
-// Descriptors are dearer than memory: with the default bound, 16 may wait.
+// Descriptors are scarcer than memory: with the default limit, 16 may wait.
 constexpr std::size_t kMemoryOfDescriptor = std::size_t{512} << 10;
 
-// The three forms of a call, which `make` makes of `arguments`. A session that could not be made refuses it.
+// The three forms of a call, which `make` builds from `arguments`. Fails if the session could not be created.
 
 template <class Session, class Make, class... Arguments>
 ReportingStatus post(const std::unique_ptr<Session>& session, const Make& make,
@@ -104,7 +104,8 @@ VeskReporting::VeskReporting(ReportingOptions options) noexcept {
 }
 
 VeskReporting::~VeskReporting() {
-  // In a forked process the thread is gone, whatever it held: all that can be done is to let go.
+  // In a forked process the thread is gone, along with any locks it held, so the implementation can only be
+  // leaked.
   if (_implementation && !_implementation->isOurs()) static_cast<void>(_implementation.release());
 }
 
