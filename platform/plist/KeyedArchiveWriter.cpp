@@ -55,7 +55,7 @@ class ArchiveWriter {
         return addShared(value.dictionary()->begin(), archive::kDictionaryClass, depth,
                          [&](MutableDictionary& object) { return fill(object, *value.dictionary(), depth); });
       default:
-        return append(value);  // numbers need no object of their own class
+        return append(value);  // numbers are archived as they are
     }
   }
 
