@@ -16,10 +16,11 @@ namespace vesk {
 
 namespace {
 
-// Messages served in one `process`, so that a daemon that sends without end leaves the owner's loop its turn.
+// Limit on messages served in one `process`, so that a daemon that sends continuously doesn't starve the
+// owner's loop.
 constexpr int kMaximumSteps = 64;
 
-// Bytes, as far as the system allows: small messages take several times their size in the kernel.
+// In bytes; the system may allow less. Small messages take several times their size in the kernel.
 constexpr int kSendBuffer = 1 << 20;
 
 void tell(BusClient::AnswerHandler& handler, BusAnswer answer) noexcept {
@@ -43,7 +44,7 @@ BusClient::BusClient(Options options)
   ::setsockopt(_socket.get(), SOL_SOCKET, SO_SNDBUF, &kSendBuffer, sizeof kSendBuffer);
   _channel.output() += SaslClient::greeting();
   _channel.queued();
-  // A daemon that has gone already is noticed by `process`.
+  // `process` notices if the daemon has already disconnected.
   [[maybe_unused]] const bool isThere = _channel.flush();
 }
 
@@ -87,7 +88,7 @@ BusClient::SendResult BusClient::send(const IPCEncodedCall& call, AnswerHandler 
   return result;
 }
 
-/// Until the daemon has let us in, calls wait behind the greeting.
+/// Until the daemon has authenticated us, calls wait behind the greeting.
 BusClient::Progress BusClient::write() {
   if (!_socket) return disconnected();
   _outbox->moveAnswersTo(_channel);
@@ -124,7 +125,7 @@ BusClient::Progress BusClient::process() {
   return write();
 }
 
-/// False when the daemon does not let us in.
+/// Returns false if the daemon refuses authentication.
 bool BusClient::authenticate() {
   const auto step = _sasl.step(_channel.bytes());
   _channel.skip(step.taken);
@@ -182,8 +183,8 @@ BusClient::Progress BusClient::disconnected() {
 
 void BusClient::end() noexcept {
   _outbox->close();
-  // A process forked from this one may hold the socket too, and would keep the session alive in the daemon;
-  // in that process itself the connection is not ours to end.
+  // A forked process may also hold the socket, which would keep the session alive in the daemon. The forked
+  // process itself must not end the connection, since it doesn't own it.
   if (!hasEnded() && isOurs()) ::shutdown(_socket.get(), SHUT_RDWR);
   _socket = {};
   OwedAnswers owed;

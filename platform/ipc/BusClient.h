@@ -1,4 +1,4 @@
-// The client's end of a connection: calls the daemon and receives its calls.
+// The client end of a connection: calls the daemon and receives its calls.
 #pragma once
 
 #include <chrono>
@@ -20,22 +20,23 @@
 
 namespace vesk {
 
-/// The answer to a call: its arguments, or an error. Lives while its handler runs.
+/// The answer to a call: its arguments, or an error. Valid while its handler runs.
 class BusAnswer {
  public:
-  /// Answered with arguments.
+  /// An answer with arguments.
   explicit BusAnswer(MessageReader& arguments) noexcept : _arguments(&arguments) {}
-  /// Answered with an error, whose texts outlive this.
+  /// An error, whose texts must outlive this object.
   BusAnswer(std::string_view errorName, std::string_view errorText) noexcept
       : _errorName(errorName), _errorText(errorText) {}
 
   bool isError() const noexcept { return _arguments == nullptr; }
-  /// D-Bus error name; "org.freedesktop.DBus.Error.NoReply" also when the time ran out and
-  /// "org.freedesktop.DBus.Error.Disconnected" when the connection ended first.
+  /// The D-Bus error name. "org.freedesktop.DBus.Error.NoReply" is also used after a timeout, and
+  /// "org.freedesktop.DBus.Error.Disconnected" if the connection ended first.
   std::string_view errorName() const noexcept { return _errorName; }
   std::string_view errorText() const noexcept { return _errorText; }
 
-  /// Reads the next argument (the types: MessageReader::read). False for an error and for a wrong type.
+  /// Reads the next argument (for the types, see MessageReader::read). Returns false for an error or a wrong
+  /// type.
   template <class T>
   bool read(T& out) {
     return _arguments && _arguments->read(out);
@@ -48,66 +49,67 @@ class BusAnswer {
 };
 
 /// Owned and used by one thread, whose poll loop waits for `fd` with `events` and `timeout` and then calls
-/// `process`. Nothing here waits. Calls made before authentication is done are queued.
+/// `process`. Never blocks. Calls made before authentication is complete are queued.
 class BusClient {
  public:
   struct Options {
-    std::string socketPath;    ///< the daemon's socket, unless `connected` is given
+    std::string socketPath;    ///< the daemon's socket, used unless `connected` is given
     FileDescriptor connected;  ///< a connected stream socket
-    std::string objectPath;    ///< of the object called, and of the one exported
+    std::string objectPath;    ///< of both the called and the exported object
   };
 
   enum class SendResult {
-    Sent,            ///< written or queued
-    Refused,         ///< the arguments are too large, too deep or no valid text: no receiver would take them
-    OutOfResources,  ///< no memory or no descriptor was left for the message; nothing was sent
-    Disconnected     ///< the connection has ended; make a new BusClient
+    Sent,     ///< written or queued
+    Refused,  ///< the arguments are too large, nested too deeply or not valid text; every receiver would
+              ///< refuse them
+    OutOfResources,  ///< out of memory or descriptors; nothing was sent
+    Disconnected     ///< the connection has ended; create a new BusClient
   };
 
   enum class Progress { Connected, Disconnected };
 
-  /// Called exactly once, from `process`; when the connection ends with the answer owed, it may be from
-  /// `write` or the destructor. May send; must not call `process` or `write`, destroy the client, or throw.
+  /// Called exactly once, from `process`; if the connection ends before the answer, possibly from `write` or
+  /// the destructor. May send. Must not call `process` or `write`, destroy the client, or throw.
   using AnswerHandler = std::function<void(BusAnswer& answer)>;
 
-  /// Connects. Throws std::system_error: ENOENT or ECONNREFUSED when no daemon is there, EAGAIN when too many
-  /// others wait to be accepted.
+  /// Connects. Throws std::system_error: ENOENT or ECONNREFUSED if there is no daemon, EAGAIN if too many
+  /// clients wait to be accepted.
   explicit BusClient(Options options);
   ~BusClient() { end(); }
   BusClient(const BusClient&) = delete;
   BusClient& operator=(const BusClient&) = delete;
 
-  /// Receives the daemon's calls, from `process`. Its `IPCIncomingCall`s may be answered.
+  /// Receives the daemon's calls, within `process`. `IPCIncomingCall`s may be answered.
   void setExportedObject(std::shared_ptr<IPCExportedObject> object) {
     _router.setExportedObject(std::move(object));
   }
 
-  /// Sends at once what the socket takes. A `handler` gets the answer, or an error after `timeout`; without
-  /// one the call is one-way. The handler is dropped unless the call was sent.
+  /// Sends immediately as much as the socket takes. `handler` gets the answer, or an error after `timeout`;
+  /// without a handler the call is one-way. The handler is destroyed unless the call was sent.
   [[nodiscard]] SendResult send(const IPCEncodedCall& call, AnswerHandler handler = nullptr,
                                 std::chrono::milliseconds timeout = {});
   [[nodiscard]] SendResult send(const IPCOutgoingCall& call, AnswerHandler handler = nullptr,
                                 std::chrono::milliseconds timeout = {});
-  /// A one-way call, put with those that `write` writes together: the cheap way to send many. Once the socket
-  /// is full they wait here; a sender that must not lose them with the connection keeps its own until
-  /// `queuedMessages` says that they have left.
+  /// Adds a one-way call to those that `write` sends together, which is the cheap way to send many. Once the
+  /// socket is full, they wait here. A sender that must not lose them with the connection keeps copies until
+  /// `queuedMessages` shows that they were sent.
   [[nodiscard]] SendResult add(const IPCEncodedCall& call) { return append(call, false); }
   [[nodiscard]] Progress write();
-  /// Bytes and messages that the socket has not taken. Nothing bounds them here: a sender holds back when
-  /// there are many.
+  /// Bytes and messages that the socket has not taken. They are not limited here; the sender must hold back
+  /// if there are many.
   std::size_t addedBytes() const noexcept { return _channel.unsentBytes(); }
   std::size_t queuedMessages() const noexcept { return _channel.unsentMessages(); }
-  /// Whether authentication is done.
+  /// Whether authentication is complete.
   bool isReady() const noexcept { return _isReady; }
-  /// Disconnected because the daemon has too many connections.
+  /// Returns true if disconnected because the daemon has too many connections.
   bool wasTurnedAway() const noexcept { return _sasl.refusal() == kTooManyConnections; }
 
   int fd() const { return isOurs() ? _socket.get() : -1; }
   short events() const;
-  /// For poll(): milliseconds, -1 for no limit.
+  /// For poll(), in milliseconds; -1 for no limit.
   int timeout() const;
-  /// Writes what is queued, reads what has come, calls handlers and the exported object. Does so much at
-  /// most; `timeout` is 0 when there is more.
+  /// Writes what is queued, reads what has arrived, calls handlers and the exported object. Does a limited
+  /// amount of work; `timeout` returns 0 if more is left.
   [[nodiscard]] Progress process();
 
  private:
@@ -117,10 +119,10 @@ class BusClient {
     AnswerHandler handler;
     Time deadline;
   };
-  using OwedAnswers = std::map<std::uint32_t, Owed>;  // by the number of the call
+  using OwedAnswers = std::map<std::uint32_t, Owed>;  // by serial number of the call
 
   SendResult append(const IPCEncodedCall& call, bool expectsReply);
-  /// A process forked from this one has the socket too, but the connection is not its own.
+  /// A process forked from this one shares the socket but does not own the connection.
   bool isOurs() const;
   bool hasEnded() const { return !_socket || !_socket.isOurs(); }
   bool authenticate();
@@ -132,7 +134,7 @@ class BusClient {
   void end() noexcept;
 
   const pid_t _process;
-  GuardedDescriptor _socket;  // none once the connection has ended
+  GuardedDescriptor _socket;  // empty after the connection has ended
   const std::shared_ptr<Outbox> _outbox = std::make_shared<Outbox>();
   CallRouter _router;
   const std::string _objectPath;

@@ -20,7 +20,8 @@ std::string nameFor(std::uint64_t serial, const IPCPeer& peer) {
          std::to_string(peer.process) + ")";
 }
 
-/// Milliseconds for poll() until `deadline`, rounded up so that it has passed when poll() returns.
+/// Returns the milliseconds until `deadline` for poll(), rounded up so that it has passed when poll()
+/// returns.
 int untilDeadline(std::chrono::steady_clock::time_point deadline) {
   auto left =
       std::chrono::ceil<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now()).count();
@@ -89,7 +90,7 @@ void BusConnection::run() noexcept {
     VESK_LOG_ERROR("ipc: %s: Closed: %s", _name.c_str(), error.what());
   }
   finish(how);
-  // After the bus; whoever still holds this connection does not hold its socket open.
+  // After the bus; other holders of this connection don't keep its socket open.
   close();
 }
 
@@ -109,7 +110,7 @@ BusConnection::End BusConnection::serve() {
   }
 }
 
-/// What this thread and others have answered and called, with one system call.
+/// Sends pending answers and calls of all threads with one system call.
 void BusConnection::sendOutgoing() {
   _outbox->moveAnswersTo(_channel);
   while (_isReady && !_peerGone && _channel.unsentBytes() < kMaximumUnsent) {
@@ -118,7 +119,7 @@ void BusConnection::sendOutgoing() {
     _channel.output() += call;
     _channel.queued();
   }
-  // What the client had sent before it went is served all the same, so its going is no end here.
+  // Calls that the client sent before it disconnected are still served, so this doesn't end the connection.
   if (!_channel.flush()) _peerGone = true;
   if (_peerGone) _channel.dropOutput();
 }
@@ -140,7 +141,7 @@ BusConnection::End BusConnection::closeFor(const char* complaint) {
   return _isReady ? End::BrokenOff : End::NotAuthenticated;
 }
 
-/// One step: reads what has come, and serves it.
+/// Performs one step: reads what has arrived and serves it.
 std::optional<BusConnection::End> BusConnection::advance() {
   if (isBackedUp()) return std::nullopt;
   if (!_hasMore) {
@@ -195,7 +196,7 @@ std::optional<BusConnection::End> BusConnection::serveMessages() {
     }
     if (_channel.unsentBytes() > kMaximumUnsent) {
       sendOutgoing();
-      // What is left is served once the client has read: until then nothing more is read from it either.
+      // The rest is served once the client has read; until then nothing more is read from it either.
       _hasMore = true;
       if (isBackedUp()) return std::nullopt;
     }
@@ -229,7 +230,7 @@ void BusConnection::flush() {
 }
 
 void BusConnection::finish(End how) noexcept {
-  // A client that has gone takes no call; one that is sent away still gets what its session says in the end.
+  // A disconnected client accepts no calls; an invalidated one still gets what its session sends at the end.
   std::size_t lost = how == End::Invalidated ? 0 : _outbox->close();
   if (how == End::BrokenOff) callHandler(_handlers.interruption);
   callHandler(_handlers.invalidation);
@@ -252,7 +253,7 @@ void BusConnection::callHandler(const std::function<void()>& handler) noexcept {
 }
 
 void BusConnection::dropHandlers() noexcept {
-  // Moved out first: what goes with them may call this connection.
+  // Moved out first, because destroying them may call this connection.
   auto interruption = std::exchange(_handlers.interruption, nullptr);
   auto invalidation = std::exchange(_handlers.invalidation, nullptr);
   auto object = _router.takeExportedObject();

@@ -1,4 +1,4 @@
-// The daemon's end of one connection. Private to platform/ipc.
+// The daemon end of one connection. Private to platform/ipc.
 #pragma once
 
 #include <atomic>
@@ -22,30 +22,30 @@
 
 namespace vesk {
 
-/// An accepted connection. `resume` gives it a thread, which holds it, serves its calls and in the end, in
-/// this order: runs the interruption handler when the connection was broken off, runs the invalidation
-/// handler, lets go of handlers and exported object (which may destroy a session here, and take seconds),
-/// sends what that has left in the outbox, closes the bus. Never resumed, it just closes the socket and runs
-/// no handler.
+/// An accepted connection. `resume` starts its thread, which holds a reference to it, serves its calls and
+/// finally, in this order: runs the interruption handler if the connection broke, runs the invalidation
+/// handler, releases the handlers and the exported object (which may destroy a session here, and take
+/// seconds), sends what that left in the outbox, and closes the bus. If never resumed, it only closes the
+/// socket and runs no handler.
 class BusConnection final : public IPCConnection, public std::enable_shared_from_this<BusConnection> {
  public:
-  /// The content of a message is limited to `maximumMessage`, with an error that names the limit; the bytes
-  /// around it, by closing the connection, to this much more.
+  /// A message's content is limited to `maximumMessage`; exceeding it gives an error that names the limit.
+  /// The rest of the message is limited to this many more bytes; exceeding that closes the connection.
   static constexpr std::size_t kMessageOverhead = 64 * 1024;
-  /// Answers and calls that wait for the client to read beyond what its socket holds. Beyond that nothing
-  /// more is served, so a client that calls without reading its answers waits itself.
+  /// Limit in bytes on answers and calls that wait for the client to read, beyond its socket's buffer. Once
+  /// it is reached no calls are served, so a client that calls without reading its answers blocks itself.
   static constexpr std::size_t kMaximumUnsent = 224 * 1024;
-  /// What a client had sent when its connection was invalidated is still served, for this long.
+  /// When a connection is invalidated, calls that the client had already sent are still served for this long.
   static constexpr std::chrono::milliseconds kDrainTime{1'000};
-  /// Bytes for the client that wait when the connection ends from this side are written for so long.
+  /// When the connection is ended from this side, pending bytes are written for up to this time.
   static constexpr std::chrono::milliseconds kFlushTime{1'000};
 
-  /// `registry` has admitted it under that number, and is told when this ends.
+  /// `registry` has admitted it under `serial`, and is notified when the connection ends.
   BusConnection(FileDescriptor socket, std::uint64_t serial, const IPCPeer& peer,
                 std::shared_ptr<ConnectionRegistry> registry);
   ~BusConnection() override { close(); }
 
-  /// For the listener: as `invalidate`, and when there is no thread closes the socket.
+  /// For the listener: like `invalidate`, and closes the socket if there is no thread.
   void end();
 
   std::string description() const override { return _name; }
@@ -60,8 +60,8 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
 
   enum class End {
     HungUp,            ///< the client closed the connection
-    BrokenOff,         ///< in mid-message, by an error, or because the client broke the rules
-    Invalidated,       ///< from this end
+    BrokenOff,         ///< in mid-message, by an error, or because the client violated the protocol
+    Invalidated,       ///< from this side
     NotAuthenticated,  ///< before a call could be received
   };
 
@@ -90,22 +90,22 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   const std::shared_ptr<Wakeup> _wakeup = std::make_shared<Wakeup>();
   const std::shared_ptr<Outbox> _outbox;
 
-  // Synchronised by themselves.
+  // Thread-safe by themselves.
   std::atomic<bool> _started{false};
   std::atomic<bool> _invalidated{false};
   std::atomic<bool> _counted{true};
 
-  // Set before `resume`, then the thread's.
+  // Set before `resume`, then used only by the thread.
   FileDescriptor _socket;
   CallRouter _router;
-  IPCHandlers _handlers;  // but for the object, which the router has
+  IPCHandlers _handlers;  // except for the object, which the router has
 
-  // The thread's.
+  // Used only by the thread.
   SaslServer _sasl;
   Channel _channel;
-  bool _isReady = false;   // the client has authenticated itself and begun
-  bool _hasMore = false;   // messages have come that are not served yet
-  bool _peerGone = false;  // nothing can be sent any more
+  bool _isReady = false;   // the client has authenticated and begun
+  bool _hasMore = false;   // messages have arrived that are not served yet
+  bool _peerGone = false;  // nothing more can be sent
   WarningBurst _brokenMessages;
 };
 

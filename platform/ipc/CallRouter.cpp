@@ -38,7 +38,7 @@ constexpr const char* kStandardInterfaces =
     "    <method name=\"Set\"><arg type=\"s\"/><arg type=\"s\"/><arg type=\"v\"/></method>\n"
     "  </interface>\n";
 
-/// The name of the next node on the way from `path` to `target`; empty when `target` is not below `path`.
+/// The name of the next node on the path from `path` to `target`; empty if `target` is not below `path`.
 std::string_view childTowards(std::string_view path, std::string_view target) {
   if (path == "/") path = "";
   if (!target.starts_with(path) || target.size() <= path.size() || target[path.size()] != '/') return {};
@@ -46,7 +46,7 @@ std::string_view childTowards(std::string_view path, std::string_view target) {
   return rest.substr(0, rest.find('/'));
 }
 
-/// 32 hexadecimal digits, or nothing where the machine has none or the sandbox hides it.
+/// Returns 32 hexadecimal digits, or an empty string if the machine has no ID or the sandbox hides it.
 std::string machineID() {
   std::string line;
   for (const char* path : {"/etc/machine-id", "/var/lib/dbus/machine-id"}) {
@@ -87,14 +87,14 @@ void CallRouter::route(Message& message) {
     serveProperties(call);
   } else if (!header.interfaceName.empty() && header.interfaceName != _object->interfaceName()) {
     call.refuse(kErrorUnknownInterface, kNoSuchInterface);
-  } else {  // D-Bus lets a caller leave the interface out
+  } else {  // D-Bus allows callers to omit the interface
     serveObject(call);
   }
   if (call.complaint()) warn(call.member(), call.complaint());
 }
 
 void CallRouter::serveObject(IPCIncomingCall& call) {
-  // The object stays alive during its call, also when the call makes the connection drop it.
+  // Keeps the object alive during its call, even if the call makes the connection drop it.
   auto object = _object;
   auto fail = [&](const char* what) {
     VESK_LOG_ERROR("ipc: %s: %.*s failed%s", _connectionName.c_str(), static_cast<int>(call.member().size()),
@@ -140,7 +140,7 @@ void CallRouter::serveIntrospectable(IPCIncomingCall& call, std::string_view pat
   call.answer({IPCArgument(std::move(xml))});
 }
 
-/// No interface here has a property.
+/// The interfaces here have no properties.
 void CallRouter::serveProperties(IPCIncomingCall& call) {
   std::string interfaceName;
   std::string property;

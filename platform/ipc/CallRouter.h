@@ -1,4 +1,4 @@
-// From an incoming call to the exported object. Private to platform/ipc.
+// Routes incoming calls to the exported object. Private to platform/ipc.
 #pragma once
 
 #include <memory>
@@ -15,17 +15,17 @@ namespace vesk {
 
 class IPCIncomingCall;
 
-/// Hands method calls to the object exported under one path, serves D-Bus's standard interfaces, and answers
-/// everything else with the errors that D-Bus has for it. Signals and stray answers are dropped. On the
-/// connection's thread.
+/// Passes method calls to the object exported under one path, serves D-Bus's standard interfaces, and answers
+/// everything else with the standard D-Bus errors. Drops signals and stray answers. Used on the connection's
+/// thread.
 class CallRouter {
  public:
-  /// `owner`: as IPCIncomingCall's. `limits`: of the arguments of one call.
+  /// `owner`: see IPCIncomingCall. `limits`: for the arguments of one call.
   CallRouter(std::string objectPath, std::string connectionName, std::shared_ptr<Outbox> outbox,
              const ExtensionOwner& owner, CodecLimits limits = {});
 
   void setExportedObject(std::shared_ptr<IPCExportedObject> object) { _object = std::move(object); }
-  /// No call reaches the object any more; the caller lets go of it.
+  /// Detaches the object; it receives no further calls. The caller releases it.
   std::shared_ptr<IPCExportedObject> takeExportedObject() { return std::exchange(_object, nullptr); }
 
   void route(Message& message);

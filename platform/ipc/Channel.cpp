@@ -12,7 +12,7 @@ namespace vesk {
 
 namespace {
 
-/// Takes every descriptor out of a received message, so that none is left open unseen.
+/// Takes ownership of every descriptor in a received message, so that none leaks.
 void takeDescriptors(msghdr& header, std::vector<FileDescriptor>& descriptors) {
   for (cmsghdr* control = CMSG_FIRSTHDR(&header); control; control = CMSG_NXTHDR(&header, control)) {
     if (control->cmsg_level != SOL_SOCKET || control->cmsg_type != SCM_RIGHTS) continue;
@@ -35,7 +35,7 @@ Channel::Input Channel::refuse(const char* complaint) noexcept {
 // --- Input
 
 Channel::Input Channel::receive() {
-  // What is left moves to the front, where the rest of it has room.
+  // Moves the remaining bytes to the front, to make room for the rest.
   if (_begin > 0) std::memmove(_piece.data(), _piece.data() + _begin, _end - _begin);
   _end -= std::exchange(_begin, 0);
   alignas(cmsghdr) char control[CMSG_SPACE(sizeof(int) * kMaximumDescriptors)];
@@ -48,7 +48,7 @@ Channel::Input Channel::receive() {
   const ssize_t size = ::recvmsg(_socket, &header, MSG_DONTWAIT | MSG_CMSG_CLOEXEC);
   if (size < 0) return errno == EAGAIN || errno == EINTR ? Input::Nothing : Input::BrokenOff;
   if (header.msg_controllen > 0) takeDescriptors(header, _descriptors);
-  // The kernel has closed those that found no room, be it in the control data or in this process's table.
+  // The kernel closed descriptors that didn't fit, either in the control data or in this process's table.
   const bool areTooMany = (header.msg_flags & MSG_CTRUNC) != 0 || _descriptors.size() > kMaximumDescriptors;
   if (areTooMany) return refuse("too many descriptors");
   if (size == 0) return _end > _begin || _largeSize > 0 ? Input::BrokenOff : Input::HungUp;
@@ -93,11 +93,11 @@ Channel::Next Channel::incomplete() {
   return Next::Refused;
 }
 
-/// A message's descriptors come along with its first byte, and it announces them all.
+/// A message's descriptors arrive with its first byte, and the message announces their number.
 Channel::Next Channel::complete(std::string_view bytes, Message& message) {
   const MessageHeader* header = _parser.parse(bytes);
   const std::size_t announced = header ? header->descriptors : 0;
-  // More of them may belong to the next message, if that has begun.
+  // Extra descriptors may belong to the next message, if that has begun.
   const bool mayBeLater = _begin < _end && header != nullptr;
   if (announced > _descriptors.size() || (announced < _descriptors.size() && !mayBeLater)) {
     refuse("descriptors that don't match their message");
@@ -123,7 +123,7 @@ void Channel::queued(FileDescriptor descriptor) {
 
 bool Channel::flush() {
   while (_written < _output.size()) {
-    // A descriptor goes with the first byte of its message, so what comes before is written on its own.
+    // A descriptor is sent with the first byte of its message, so earlier bytes are written separately.
     std::size_t end = _output.size();
     int descriptor = -1;
     if (!_attached.empty()) {

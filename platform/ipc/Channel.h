@@ -13,59 +13,59 @@
 
 namespace vesk {
 
-/// Both directions are bounded: what has come is held up to one message and one read, and the owner stops
-/// reading while what it has written is not taken. Waits for nothing; the owner polls. Large (it holds one
-/// read's worth), so it lives on its thread's stack or in an object of its own. For one thread.
+/// Both directions are bounded: at most one message and one read are held, and the owner stops reading while
+/// written data is not taken. Never blocks; the owner polls. Large (it contains a read buffer), so it lives
+/// on its thread's stack or in its own object. Not thread-safe.
 class Channel {
  public:
-  /// One read's worth.
+  /// Size of one read.
   static constexpr std::size_t kPiece = 16 * 1024;
 
   enum class Input {
-    Some,      ///< bytes have come
-    Nothing,   ///< none now
-    HungUp,    ///< the peer has closed its end, between two messages
-    BrokenOff  ///< it broke off, or broke a rule: see `complaint`
+    Some,      ///< bytes have arrived
+    Nothing,   ///< no bytes for now
+    HungUp,    ///< the peer closed its end, between two messages
+    BrokenOff  ///< the connection broke, or the peer violated the protocol: see `complaint`
   };
   enum class Next {
     Whole,       ///< `message` is the next one
-    Incomplete,  ///< more has to come first
-    Dropped,     ///< one was taken out whose header breaks the rules inside; ask again
-    Refused      ///< the peer broke a rule that ends the connection: see `complaint`
+    Incomplete,  ///< more bytes are needed
+    Dropped,     ///< a message with an invalid header was removed; call again
+    Refused      ///< the peer violated the protocol so that the connection must end: see `complaint`
   };
 
-  /// Borrows `socket` (non-blocking). `maximumMessage`: bytes of one message that is taken.
+  /// Borrows `socket` (non-blocking). `maximumMessage`: limit on the bytes of one message.
   Channel(int socket, std::size_t maximumMessage) noexcept
       : _socket(socket), _maximumMessage(maximumMessage) {}
 
   // --- Input
 
-  /// One system call. What has come before must have been taken out as far as possible.
+  /// Makes one system call. All complete messages must have been taken out before.
   Input receive();
-  /// Takes the next message out of what has come. `message` is good until the next call of this or `receive`.
+  /// Takes out the next message. `message` is valid until the next call of this or `receive`.
   Next next(Message& message);
-  /// What has come and was not taken; for what precedes messages.
+  /// Received bytes that were not taken; for the data that precedes messages.
   std::string_view bytes() const noexcept { return {_piece.data() + _begin, _end - _begin}; }
   void skip(std::size_t size) noexcept { _begin += size; }
-  /// Whether descriptors have come whose message is not complete.
+  /// Whether descriptors have arrived whose message is incomplete.
   bool hasDescriptors() const noexcept { return !_descriptors.empty(); }
   /// Bytes received so far.
   std::size_t received() const noexcept { return _received; }
-  /// What was refused, or null when the peer just went away.
+  /// The protocol violation, or null if the peer just disconnected.
   const char* complaint() const noexcept { return _complaint; }
 
   // --- Output
 
-  /// Where the next message is to be appended, followed by `queued`.
+  /// Append the next message here, then call `queued`.
   std::string& output() noexcept { return _output; }
-  /// The bytes appended since the last call are one message more; `descriptor` goes along with it.
+  /// Marks the bytes appended since the last call as one message, sent together with `descriptor`.
   void queued(FileDescriptor descriptor = {});
-  /// Writes what the socket takes. False when the peer has gone.
+  /// Writes as much as the socket takes. Returns false if the peer has disconnected.
   [[nodiscard]] bool flush();
-  /// Forgets what is not written: a peer that has gone reads nothing.
+  /// Discards unwritten output, for a peer that has disconnected.
   void dropOutput() noexcept;
   std::size_t unsentBytes() const noexcept { return _output.size() - _written; }
-  /// Messages of which the socket has not taken every byte.
+  /// The number of messages that the socket has not fully taken.
   std::size_t unsentMessages() const noexcept { return _ends.size(); }
 
  private:
@@ -84,16 +84,16 @@ class Channel {
   std::size_t _received = 0;
 
   HeaderParser _parser;
-  std::vector<FileDescriptor> _descriptors;  // came with messages that are not complete yet, in order
-  std::string _large;                        // a message longer than a piece, as far as it has come
-  std::size_t _largeSize = 0;                // of it when whole; 0 when there is none
-  std::size_t _begin = 0;                    // of what was not taken, in _piece
+  std::vector<FileDescriptor> _descriptors;  // of messages that are still incomplete, in order
+  std::string _large;                        // the received part of a message that is longer than a piece
+  std::size_t _largeSize = 0;                // full size of that message; 0 if there is none
+  std::size_t _begin = 0;                    // of the untaken bytes, in _piece
   std::size_t _end = 0;
   std::array<char, kPiece> _piece;
 
   std::string _output;
   std::size_t _written = 0;
-  std::deque<std::size_t> _ends;   // of the messages in _output
+  std::deque<std::size_t> _ends;   // ends of the messages in _output
   std::deque<Attached> _attached;  // not sent yet
 };
 

@@ -19,8 +19,8 @@ constexpr std::size_t kKeptForRoot = 16;
 #endif
 #endif
 
-// A value nested to the limit, decoded and written as JSON, takes about 100 KiB. std::thread gives no say in
-// the size, and a thousand idle connections should not reserve eight gigabytes.
+// Decoding a value nested to the limit and writing it as JSON takes about 100 KiB. std::thread doesn't let
+// the size be set, and a thousand idle connections should not reserve eight gigabytes.
 #ifdef VESK_LARGE_FRAMES
 constexpr std::size_t kStackSize = std::size_t{4} << 20;
 #else
@@ -94,7 +94,7 @@ void ConnectionRegistry::launch(std::function<void()> body) {
   try {
     startDetached([self = shared_from_this(), body = std::move(body)]() mutable {
       body();
-      body = nullptr;  // what it holds goes before the thread counts as ended
+      body = nullptr;  // destroyed before the thread counts as ended
       self->finish();
     });
   } catch (...) {

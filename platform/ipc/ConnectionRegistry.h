@@ -1,4 +1,4 @@
-// The connections of one listener: how many there are, and their threads. Private to platform/ipc.
+// Counts a listener's connections and manages their threads. Private to platform/ipc.
 #pragma once
 
 #include <sys/types.h>
@@ -19,9 +19,9 @@ namespace vesk {
 
 class BusConnection;
 
-/// Shared by the listener, its connections and their threads, of which some may outlive it. Thread-safe. A
-/// connection counts from `admit` until `release`. The last few of the maximum are kept for root, so that an
-/// operator gets in when others have used up the rest.
+/// Shared by the listener, its connections and their threads, some of which may outlive the listener.
+/// Thread-safe. A connection counts from `admit` until `release`. The last few of the maximum are reserved
+/// for root, so that an operator gets in when others have used up the rest.
 class ConnectionRegistry : public std::enable_shared_from_this<ConnectionRegistry> {
  public:
   explicit ConnectionRegistry(IPCListener::Options given) : options(std::move(given)) {}
@@ -33,14 +33,14 @@ class ConnectionRegistry : public std::enable_shared_from_this<ConnectionRegistr
   void release(std::uint64_t serial) noexcept;
   std::size_t count() const;
 
-  /// Makes an admitted connection known to `connections`.
+  /// Includes an admitted connection in `connections`.
   void add(std::uint64_t serial, std::weak_ptr<BusConnection> connection);
   std::vector<std::shared_ptr<BusConnection>> connections() const;
 
   /// Runs `body`, which must not throw, on a thread of its own. Throws std::system_error.
   void launch(std::function<void()> body);
-  /// Waits until every `body` has returned and was destroyed, at most until `deadline`. False when some still
-  /// run.
+  /// Waits until every `body` has returned and was destroyed, at most until `deadline`. Returns false if some
+  /// are still running.
   bool waitForThreads(std::chrono::steady_clock::time_point deadline);
 
  private:

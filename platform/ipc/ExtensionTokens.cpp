@@ -14,7 +14,7 @@ namespace {
 
 std::string freshToken() {
   unsigned char random[16];
-  // Asked for no more than 256 bytes, the kernel gives all of them.
+  // For up to 256 bytes, the kernel always returns all of them.
   if (::getrandom(random, sizeof random, 0) != sizeof random) {
     throw std::system_error(errno, std::generic_category(), "getrandom");
   }
@@ -53,7 +53,7 @@ ExtensionHandle ExtensionTokens::consume(std::string_view token) {
 }
 
 void ExtensionTokens::drop(std::uint64_t connection) noexcept {
-  std::list<Entry> dropped;  // closed after the lock: closing may wait for a file system
+  std::list<Entry> dropped;  // closed after unlocking, because closing may wait for a file system
   MutexLock lock(_mutex);
   for (auto entry = _entries.begin(); entry != _entries.end();) {
     const auto at = entry++;

@@ -1,4 +1,4 @@
-// Descriptors that clients sent along with a call, kept under texts that nobody can guess.
+// Descriptors that clients sent with a call, kept under unguessable tokens.
 #pragma once
 
 #include <sys/types.h>
@@ -14,39 +14,39 @@
 
 namespace vesk {
 
-/// Who sent a descriptor: a connection and the user at its other end.
+/// The sender of a descriptor: a connection and the user at its other end.
 struct ExtensionOwner {
   std::uint64_t connection = 0;
   uid_t user = static_cast<uid_t>(-1);
 };
 
-/// What a token was worth. Nothing without a descriptor.
+/// The result of consuming a token; empty without a descriptor.
 struct ExtensionHandle {
   FileDescriptor descriptor;
-  uid_t user = static_cast<uid_t>(-1);  ///< who sent it
+  uid_t user = static_cast<uid_t>(-1);  ///< the sender
 
   explicit operator bool() const noexcept { return static_cast<bool>(descriptor); }
 };
 
-/// A token is worth one use of its descriptor: the right to a file travels as the descriptor that the client
-/// opened, never as a path. Thread-safe; its lock is a leaf.
+/// A token can be used once: access to a file is granted by the descriptor that the client opened, never by a
+/// path. Thread-safe; its lock is a leaf.
 class ExtensionTokens {
  public:
-  /// Tokens that one connection can have waiting. Each is used while its call is served, so what is older was
-  /// left behind by a session that had no use for it.
+  /// Limit on one connection's pending tokens. Each is used while its call is served, so older ones were
+  /// abandoned by a session that had no use for them.
   static constexpr std::size_t kMaximumPerOwner = 4;
 
-  /// The process's.
+  /// The instance for the process.
   static ExtensionTokens& shared();
 
-  /// Keeps `descriptor` under a fresh token, until it is consumed or dropped. An owner that has too many
+  /// Keeps `descriptor` under a new token until it is consumed or dropped. An owner with too many tokens
   /// loses its oldest.
   std::string add(const ExtensionOwner& owner, FileDescriptor descriptor);
 
-  /// The token's descriptor and its sender; nothing when the token is unknown or was consumed before.
+  /// Returns the token's descriptor and its sender; empty if the token is unknown or already consumed.
   ExtensionHandle consume(std::string_view token);
 
-  /// Closes what an owner, a connection that ended, has left.
+  /// Closes the descriptors left by an owner, a connection that ended.
   void drop(std::uint64_t connection) noexcept;
 
  private:

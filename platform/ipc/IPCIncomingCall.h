@@ -17,23 +17,23 @@
 
 namespace vesk {
 
-/// Given to IPCExportedObject::handle and gone when that returns; used on the connection's thread. A call
-/// ends in one of four ways: `answer`, `takeReply`, a failed `read` (which has told the caller) or `refuse`;
-/// a call that expects an answer and is left in none of them gets an error.
+/// Passed to IPCExportedObject::handle, valid until that returns, and used only on the connection's thread. A
+/// call is settled in one of four ways: `answer`, `takeReply`, a failed `read` (which has informed the
+/// caller) or `refuse`. A call that expects an answer and isn't settled gets an error.
 class IPCIncomingCall {
  public:
-  /// `owner`: whose the descriptors are that `grant` keeps. All outlive the call.
+  /// `owner` owns the descriptors kept by `grant`. All arguments outlive the call.
   IPCIncomingCall(Message& message, const std::shared_ptr<Outbox>& outbox, const ExtensionOwner& owner,
                   const CodecLimits& limits) noexcept
       : _message(message), _outbox(outbox), _owner(owner), _limits(limits) {}
 
   std::string_view member() const noexcept { return _message.header->member; }
-  /// False for a one-way call: nothing that is answered goes anywhere.
+  /// False for a one-way call, whose answers are discarded.
   bool expectsReply() const noexcept { return _message.header->expectsReply; }
 
-  /// Reads all arguments, which must be exactly of `signature`. When they are not, tells the caller what is
-  /// wrong (or the log, for a one-way call) and returns false: the handler is done with the call. A
-  /// FileDescriptor receives the one descriptor of an `ah`, or none.
+  /// Reads all arguments, which must exactly match `signature`. Otherwise reports the error to the caller
+  /// (or, for a one-way call, the log) and returns false; the handler must then return. A FileDescriptor
+  /// receives the one descriptor of an `ah`, or none.
   template <class... Arguments>
   [[nodiscard]] bool read(const char* signature, Arguments&... arguments) {
     if (_message.header->signature != signature) return refuseArguments(CodecResult::WrongType);
@@ -45,11 +45,11 @@ class IPCIncomingCall {
   std::string grant(FileDescriptor descriptor);
 
   void answer(const std::vector<IPCArgument>& arguments = {});
-  /// Both texts are constants.
+  /// Both texts must be constants.
   void refuse(const char* errorName, const char* text);
 
-  /// The answer as a closure, which may outlive the call and the connection and be used on any thread. Empty
-  /// for a one-way call. Abandoned, it sends an error.
+  /// Returns the answer as a closure, which may outlive the call and the connection and be used on any
+  /// thread. Empty for a one-way call. If abandoned, it sends an error.
   template <class... Arguments>
   [[nodiscard]] Reply<Arguments...> takeReply() {
     if (!owe()) return {};
@@ -63,9 +63,9 @@ class IPCIncomingCall {
                                [outbox = _outbox, call = _message.serial] { abandon(*outbox, call); });
   }
 
-  /// Whether it has ended in one of the four ways.
+  /// Whether the call is settled in one of the four ways.
   bool isSettled() const noexcept { return _settled; }
-  /// What was wrong with a one-way call that was refused, for the connection's log line; else null.
+  /// The error of a one-way call that was refused, for the connection's log line; otherwise null.
   const char* complaint() const noexcept { return _complaint; }
 
  private:

@@ -18,12 +18,12 @@ namespace vesk {
 
 namespace {
 
-// For what the kernel lacks and may have again soon: accept() fails at once as long as it has not.
+// Pause after running out of a kernel resource: accept() fails immediately until it is available again.
 constexpr int kPauseMilliseconds = 100;
 
 FileDescriptor anyDescriptor() { return FileDescriptor(::eventfd(0, EFD_CLOEXEC)); }
 
-/// A listening socket that the service manager has opened.
+/// A listening socket opened by the service manager.
 FileDescriptor checkedInherited(FileDescriptor socket) {
   int domain = 0;
   int listens = 0;
@@ -66,7 +66,7 @@ bool IPCListener::stop(std::chrono::steady_clock::time_point deadline) {
   return _registry->waitForThreads(deadline);
 }
 
-/// Only the socket that this listener has made: another daemon may have taken the path over.
+/// Removes only the socket that this listener created, since another daemon may have taken over the path.
 void IPCListener::removeSocket() {
   struct stat now {};
   if (!_listening || _madePath.empty() || ::lstat(_madePath.c_str(), &now) != 0) return;
@@ -100,7 +100,7 @@ IPCListener::Accepted IPCListener::acceptOne() {
     case ENFILE:
       return refuseForWantOfDescriptors();
     case EINTR:
-    case ECONNABORTED:  // given up by its client
+    case ECONNABORTED:  // the client disconnected before it was accepted
       return Accepted::Yes;
     default:
       return Accepted::NoRoom;
@@ -129,7 +129,7 @@ void IPCListener::admit(FileDescriptor socket) {
   const std::uint64_t serial = ++lastSerial;
   const auto admission = _registry->admit(serial, peer.user);
   if (admission == ConnectionRegistry::Admission::Admitted) return introduce(std::move(socket), serial, peer);
-  // It never blocks: the socket is new, and a line fits.
+  // Doesn't block: the socket is new, so one line fits.
   const std::string line = std::string(kTooManyConnections) + "\r\n";
   ::send(socket.get(), line.data(), line.size(), MSG_NOSIGNAL | MSG_DONTWAIT);
   if (_refusals.begins()) {

@@ -22,39 +22,40 @@ class ConnectionRegistry;
 class IPCListenerDelegate {
  public:
   virtual ~IPCListenerDelegate() = default;
-  /// Called on the listener's thread for each new connection, which is not resumed yet. Returning false
-  /// closes it.
+  /// Called on the listener's thread for each new connection, before it is resumed. Returning false closes
+  /// it.
   virtual bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) = 0;
 };
 
 class IPCListener {
  public:
   struct Options {
-    std::string socketPath;    ///< made (mode 0666, its directory 0755) unless `inherited` is given
+    std::string socketPath;    ///< created (mode 0666, its directory 0755) unless `inherited` is given
     FileDescriptor inherited;  ///< a listening socket from the service manager
-    std::string objectPath;    ///< where a connection's exported object stands
-    std::size_t maximumConnections = 4096;  ///< the last sixteen (of few, an eighth) are kept for root
+    std::string objectPath;    ///< the path of a connection's exported object
+    std::size_t maximumConnections =
+        4096;  ///< the last sixteen (an eighth of a small maximum) are reserved for root
     std::size_t maximumConnectionsPerUser = 1024;
     std::size_t maximumMessage = std::size_t{1} << 20;  ///< bytes
-    std::size_t maximumOutbox = 256;                    ///< calls to one client that wait
+    std::size_t maximumOutbox = 256;                    ///< calls to one client that may wait
     std::chrono::milliseconds authenticationTimeout{5'000};
   };
 
-  /// Binds the socket. Throws std::system_error when it can't.
+  /// Binds the socket. Throws std::system_error on failure.
   explicit IPCListener(Options options);
-  /// As `stop`.
+  /// Calls `stop`.
   ~IPCListener() { stop(); }
 
   /// Not owned; outlives the listener. Set before `resume`.
   void setDelegate(IPCListenerDelegate* delegate) { _delegate = delegate; }
-  /// Begins to accept, on the listener's own thread.
+  /// Starts accepting, on the listener's own thread.
   void resume();
-  /// No further connection is accepted; those that are open get invalidated, and this waits until every
-  /// connection's thread has ended (invalidation handlers included). Safe before `resume` and twice; not from
-  /// a connection's thread.
+  /// Stops accepting connections, invalidates the open ones and waits until every connection's thread has
+  /// ended, including invalidation handlers. May be called before `resume` and repeatedly. Must not be called
+  /// on a connection's thread.
   void stop() { stop(std::chrono::steady_clock::time_point::max()); }
-  /// The same, but waits no longer than that. False when a thread still runs: then neither this nor what its
-  /// handlers use may be destroyed.
+  /// As above, but waits no longer than `patience`. Returns false if a thread still runs; then neither the
+  /// listener nor anything its handlers use may be destroyed.
   [[nodiscard]] bool stopWithin(std::chrono::milliseconds patience) {
     return stop(std::chrono::steady_clock::now() + patience);
   }
@@ -76,7 +77,7 @@ class IPCListener {
   struct stat _madeSocket {};
   FileDescriptor _listening;
   const std::shared_ptr<ConnectionRegistry> _registry;
-  FileDescriptor _reserve;  // given up to accept, and close, a connection without any to spare
+  FileDescriptor _reserve;  // closed temporarily, to accept and close a connection when descriptors run out
   Wakeup _wakeup;
   std::atomic<bool> _stopping{false};
   IPCListenerDelegate* _delegate = nullptr;

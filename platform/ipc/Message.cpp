@@ -13,8 +13,8 @@ namespace {
 
 constexpr std::size_t kMaximumName = 255;
 
-/// Elements of letters, digits, underscores and `others`; none is empty, and only where `mayStartWithDigit`
-/// does one start with a digit.
+/// Accepts non-empty elements of letters, digits, underscores and `others`. Elements may start with a digit
+/// only if `mayStartWithDigit`.
 bool areElements(std::string_view name, char separator, bool mayStartWithDigit,
                  std::string_view others = "") {
   char before = separator;
@@ -34,18 +34,18 @@ bool isMember(std::string_view name) noexcept {
   return name.size() <= kMaximumName && name.find('.') == name.npos && areElements(name, '.', false);
 }
 
-/// Of an interface or an error: two elements at least.
+/// The name of an interface or an error, with at least two elements.
 bool isInterface(std::string_view name) noexcept {
   return name.size() <= kMaximumName && name.find('.') != name.npos && areElements(name, '.', false);
 }
 
-/// As other peers name themselves; messages here need none.
+/// A name that other peers may give themselves; messages here need none.
 bool isBusName(std::string_view name) noexcept {
   if (name.starts_with(':')) name.remove_prefix(1);
   return name.size() <= kMaximumName && name.find('.') != name.npos && areElements(name, '.', true, "-");
 }
 
-/// What a call, an answer, an error or a signal can't do without.
+/// Whether a call, an answer, an error or a signal has all required fields.
 bool isComplete(const MessageHeader& header) {
   switch (header.type) {
     case MessageType::Call:
@@ -62,8 +62,8 @@ bool isComplete(const MessageHeader& header) {
 
 struct KnownField {
   std::string_view type;
-  bool (*isValid)(std::string_view) noexcept = nullptr;  // of a text
-  std::string MessageHeader::*text = nullptr;            // where it is kept
+  bool (*isValid)(std::string_view) noexcept = nullptr;  // for a text
+  std::string MessageHeader::*text = nullptr;            // where the text is stored
 };
 
 // In the order of HeaderField.
@@ -114,7 +114,7 @@ class FieldReader {
     return true;
   }
 
-  /// Fields of later versions of the format are ignored, but their values have to be well-formed.
+  /// Fields of later versions of the format are ignored, but their values must be well-formed.
   bool skip(std::string_view type) {
     MessageReader reader(_cursor, type);
     Value ignored;
@@ -161,7 +161,7 @@ const MessageHeader* HeaderParser::parse(std::string_view bytes) {
   _header.isBigEndian = bytes[0] == kBigEndian;
   _header.expectsReply = _header.type == MessageType::Call && (bytes[kFlagsAt] & kNoReplyExpected) == 0;
   const std::size_t fieldsSize = numberAt(bytes, kFieldsSizeAt);
-  // Fields are aligned as the whole message is, and they begin at a multiple of 8.
+  // Fields are aligned relative to the message, and they begin at a multiple of 8.
   const auto contents = bytes.substr(kFixedHeader, fieldsSize);
   const auto padding = fields.substr(kFixedHeader - kFieldsSizeAt + fieldsSize);
   if (padding.find_first_not_of('\0') != padding.npos) return nullptr;

@@ -9,8 +9,8 @@ namespace vesk {
 
 namespace {
 
-// Texts of a body up to this size share one copy of it. One short text keeps all of it, so it has to stay
-// small.
+// Texts of a body up to this size share one copy of it. The limit must be small, because one short text keeps
+// the whole copy alive.
 constexpr std::size_t kMaximumShared = 1024;
 
 std::shared_ptr<const char> sharedCopy(std::string_view body) {
@@ -34,7 +34,7 @@ bool MessageReader::fail(CodecResult result) noexcept {
   return false;
 }
 
-/// The next argument has to be of `type`.
+/// The next argument must be of `type`.
 bool MessageReader::take(std::string_view type) noexcept {
   if (_result != CodecResult::Ok || !_types.starts_with(type)) return fail(CodecResult::WrongType);
   _types.remove_prefix(type.size());
@@ -51,12 +51,12 @@ bool MessageReader::countNode(std::size_t content) noexcept {
   return count(kNodeContent + content);
 }
 
-/// Left by `--_containers`; a failure ends the reading, so it need not be.
+/// Callers leave with `--_containers`. After a failure they need not, since it ends the reading.
 bool MessageReader::enter() noexcept {
   return ++_containers <= kMaximumContainers || fail(CodecResult::LimitExceeded);
 }
 
-/// Valid UTF-8 without NUL; counted, but not as a node.
+/// Reads valid UTF-8 without NUL. Counts its bytes, but not as a node.
 bool MessageReader::text(std::string_view& out) {
   return found(_cursor.text(out) && isValidUTF8(out, false)) && count(out.size());
 }
@@ -172,13 +172,13 @@ bool MessageReader::basic(char type, Value& out) {
   }
 }
 
-/// An object path or a signature.
+/// Reads an object path or a signature.
 bool MessageReader::name(char type, Value& out) {
   std::string_view view;
   const bool isWellFormed = type == 'g' ? _cursor.signature(view) && isValidSignature(view)
                                         : _cursor.text(view) && isObjectPath(view);
   if (!found(isWellFormed) || !count(view.size())) return false;
-  // The empty signature, which means nothing anywhere else, is the null marker.
+  // The empty signature has no other use, so it represents the null marker.
   out = type == 'g' && view.empty() ? Value() : Value(kept(view));
   return true;
 }
@@ -186,7 +186,7 @@ bool MessageReader::name(char type, Value& out) {
 bool MessageReader::variant(Value& out) {
   std::string_view type;
   if (!enter() || !found(_cursor.signature(type))) return false;
-  // Most values are basic ones, and need no look at the rest of the grammar.
+  // Most values are basic, and skip the rest of the grammar.
   const bool isBasic = type.size() == 1 && isBasicType(type[0]);
   if (!isBasic && !found(!type.empty() && completeTypeLength(type) == type.size())) return false;
   if (!(isBasic ? basic(type[0], out) : value(type, out))) return false;
@@ -207,7 +207,7 @@ bool MessageReader::structure(std::string_view members, Value& out) {
   return true;
 }
 
-/// The members of a structure, or key and value of an entry whose key is no text.
+/// Reads the members of a structure, or the key and value of an entry whose key is not a text.
 bool MessageReader::entryAsList(std::string_view types, Value& out) {
   if (++_depth > _limits.depth) return fail(CodecResult::LimitExceeded);
   std::vector<Value> values;

@@ -1,4 +1,4 @@
-// The arguments of a message, from its bytes straight to the project's values. Private to platform/ipc.
+// Reads a message's arguments directly into the project's values. Private to platform/ipc.
 #pragma once
 
 #include <cstddef>
@@ -17,29 +17,29 @@
 
 namespace vesk {
 
-/// Reads the arguments from first to last. After the first failure every further read fails the same way.
-/// For one thread.
+/// Reads the arguments in order. After the first failure, every further read fails with the same error. Not
+/// thread-safe.
 class MessageReader {
  public:
   /// The values that are read may outlive the message.
   explicit MessageReader(const Message& message, CodecLimits limits = {});
-  /// Reads values of `types` from `cursor` on.
+  /// Reads values of `types` starting at `cursor`.
   MessageReader(const WireCursor& cursor, std::string_view types) noexcept : _cursor(cursor), _types(types) {}
 
-  /// Each reads the next argument into `out` and returns whether everything was well so far. T: an
-  /// alternative of IPCArgument, read from its type there.
+  /// Each overload reads the next argument into `out` and returns whether all reads so far succeeded. T: an
+  /// alternative of IPCArgument, read as the D-Bus type listed there.
   template <class T>
   bool read(T& out) {
     return take(argumentType<T>()) && get(out);
   }
   bool read(List& out);   ///< an array of anything
   bool read(Value& out);  ///< anything
-  /// ah, at most one: an index into the message's descriptors.
+  /// ah with at most one element: an index into the message's descriptors.
   bool readDescriptor(std::optional<std::uint32_t>& out) {
     return take(argumentType<IPCDescriptor>()) && get(out);
   }
 
-  /// Whether all arguments have been read and no byte is left.
+  /// Whether all arguments have been read and no bytes are left.
   bool finish();
 
   CodecResult result() const noexcept { return _result; }
@@ -53,7 +53,7 @@ class MessageReader {
   bool countNode(std::size_t content = 0) noexcept;
   bool enter() noexcept;
 
-  /// `elements` reads up to the end that it is given.
+  /// `elements` reads up to the given end.
   template <class Elements>
   bool array(std::size_t alignment, const Elements& elements) {
     std::uint32_t size = 0;
@@ -74,7 +74,7 @@ class MessageReader {
   bool get(std::string& out);
   bool get(std::vector<std::string>& out);
   bool get(Dictionary& out) { return dictionary("v", out); }
-  /// At most one: a number of 32 bits, a text or an array.
+  /// An array of at most one element: a 32-bit number, a text or an array.
   template <class T>
   bool get(std::optional<T>& out) {
     out.reset();
@@ -100,10 +100,9 @@ class MessageReader {
   bool entryAsList(std::string_view types, Value& out);
   bool list(std::string_view elementType, List& out);
 
-  const std::shared_ptr<const char>
-      _owner;  // of the bytes that texts point into; without one they are copied
+  const std::shared_ptr<const char> _owner;  // of the bytes that texts refer to; if null, texts are copied
   WireCursor _cursor;
-  std::string_view _types;  // of the arguments that are left
+  std::string_view _types;  // of the remaining arguments
   const CodecLimits _limits{};
   TextArena _arena;
   std::size_t _depth = 0;

@@ -11,10 +11,10 @@ namespace vesk {
 
 namespace {
 
-// Of a value's variant, in the order of Value::Kind. The empty signature is the null marker.
+// The signatures of a value's variant, in the order of Value::Kind. The empty signature is the null marker.
 constexpr const char* kValueSignatures[] = {"g", "b", "x", "t", "d", "s", "ay", "(d)", "av", "a{sv}"};
 
-/// Appends values under D-Bus's alignment, which counts from where it begins.
+/// Appends values with D-Bus's alignment, relative to its start.
 class Writer {
  public:
   explicit Writer(std::string& out, CodecLimits limits = {}) noexcept
@@ -40,7 +40,7 @@ class Writer {
     _out.append(text).push_back('\0');
   }
 
-  // Each as its type says.
+  // Each writes the D-Bus type of its argument.
   template <class Number>
   requires std::is_arithmetic_v<Number>
   void add(Number value) { number(value); }
@@ -103,7 +103,7 @@ class Writer {
     --_containers;
   }
 
-  /// An array of values whose elements open `containers` each, besides those that they open themselves.
+  /// Writes an array of values whose elements each open `containers`, not counting those of their contents.
   template <class Elements, class AddOne>
   void nested(std::size_t alignment, std::size_t containers, const Elements& elements, const AddOne& addOne) {
     if (!count(kNodeContent)) return;
@@ -168,7 +168,7 @@ std::uint32_t descriptorsAmong(const std::vector<IPCArgument>& arguments) {
   return count;
 }
 
-/// Without body size and serial.
+/// Writes the header, without body size and serial number.
 void appendHeader(const OutgoingHeader& header, std::string_view signature, std::uint32_t descriptors,
                   std::string& out) {
   Writer writer(out);
@@ -194,7 +194,7 @@ void appendSignature(const std::vector<IPCArgument>& arguments, std::string& out
   for (const auto& argument : arguments) out += kArgumentTypes[argument.index()];
 }
 
-/// Adds the body to the message whose header begins at `start`, and completes that.
+/// Adds the body to the message whose header begins at `start`, and completes the header.
 CodecResult appendBody(std::size_t start, std::uint32_t serial, const std::vector<IPCArgument>& arguments,
                        std::string& out, CodecLimits limits) {
   const std::size_t body = out.size();
@@ -210,7 +210,7 @@ CodecResult appendBody(std::size_t start, std::uint32_t serial, const std::vecto
   return CodecResult::Ok;
 }
 
-/// Takes back what `append` has added unless it succeeds, so that a partial message is never sent.
+/// Undoes what `append` has added unless it succeeds, so that a partial message is never sent.
 template <class Append>
 CodecResult wholeOrNothing(std::string& out, const Append& append) {
   const std::size_t start = out.size();

@@ -1,4 +1,4 @@
-// D-Bus messages, in bytes. Private to platform/ipc.
+// Writes D-Bus messages. Private to platform/ipc.
 #pragma once
 
 #include <cstddef>
@@ -13,7 +13,7 @@
 
 namespace vesk {
 
-/// What a message to be written says in its header; empty texts and zeros are left out.
+/// The header of a message to be written; empty texts and zeros are left out.
 struct OutgoingHeader {
   MessageType type = MessageType::Call;
   bool expectsReply = false;
@@ -24,20 +24,21 @@ struct OutgoingHeader {
   std::uint32_t replySerial = 0;
 };
 
-/// Bytes of a message that either end takes: the content is limited to 1 MiB, with an error that says so, and
-/// what is around it to 64 KiB.
+/// Maximum bytes of a message that either end accepts: the content is limited to 1 MiB, with an error that
+/// says so, and the rest to 64 KiB.
 inline constexpr std::size_t kMaximumMessageSize = (std::size_t{1} << 20) + 64 * 1024;
 
-/// Appends a message to `out`, in little-endian order. Unless it returns Ok, `out` is as before, also when it
-/// throws. `serial` is not 0. Descriptors among the arguments are counted; the caller sends them along.
+/// Appends a message to `out`, in little-endian order. Leaves `out` unchanged unless it returns Ok, also if
+/// it throws. `serial` must not be 0. Descriptors among the arguments are counted; the caller must send them
+/// with the message.
 CodecResult appendMessage(const OutgoingHeader& header, std::uint32_t serial,
                           const std::vector<IPCArgument>& arguments, std::string& out,
                           CodecLimits limits = {});
 
-/// Appends a call of an object, as `appendMessage`. Its sender sets its number.
+/// Appends a call to an object, like `appendMessage`. The sender sets its serial number.
 CodecResult appendCall(std::string_view objectPath, const IPCOutgoingCall& call, std::string& out);
 
-/// Numbers a whole message, and says whether it wants an answer.
+/// Sets the serial number of a whole message, and whether it expects an answer.
 void stamp(char* message, std::uint32_t serial, bool expectsReply) noexcept;
 
 }  // namespace vesk

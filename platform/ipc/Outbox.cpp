@@ -108,7 +108,7 @@ bool Outbox::hasCalls() const {
 }
 
 std::size_t Outbox::close() {
-  std::deque<std::string> calls;  // released after the lock
+  std::deque<std::string> calls;  // destroyed after unlocking
   std::vector<std::string> answers;
   MutexLock lock(_mutex);
   _closed = true;

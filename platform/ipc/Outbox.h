@@ -1,4 +1,4 @@
-// What one connection is to send. Private to platform/ipc.
+// Messages waiting to be sent on one connection. Private to platform/ipc.
 #pragma once
 
 #include <atomic>
@@ -18,47 +18,48 @@
 
 namespace vesk {
 
-/// Answers to the peer's calls, written by whoever gives them, and calls to the peer wait here until the
-/// connection's thread takes them. Shared by the connection and every reply closure, which may outlive it:
-/// then an answer goes nowhere. Bounded, because a peer that does not read must cost its session only so
-/// much. Thread-safe; its lock is a leaf.
+/// Holds answers to the peer's calls, added by any thread, and calls to the peer until the connection's
+/// thread takes them. Shared by the connection and every reply closure, which may outlive it; its answer is
+/// then discarded. Bounded, to limit what a peer that doesn't read can cost its session. Thread-safe; its
+/// lock is a leaf.
 class Outbox {
  public:
-  /// Calls of one peer that may be owed an answer. Calls are served one after another, so only a handler that
-  /// puts its answers off comes near this.
+  /// Limit on a peer's calls with deferred answers. Calls are served one after another, so only a handler
+  /// that defers its answers comes near this.
   static constexpr std::size_t kMaximumOwed = 256;
-  /// Bytes that all waiting calls hold together, unless there is only one.
+  /// Limit on the bytes of all waiting calls together; a single call may exceed it.
   static constexpr std::size_t kMaximumMemory = std::size_t{4} << 20;
 
-  /// `wake` makes the connection's thread take what waits; any other thread calls it.
+  /// `wake` makes the connection's thread take waiting messages; called only by other threads.
   explicit Outbox(std::size_t maximumCalls = 0, std::function<void()> wake = nullptr)
       : _maximumCalls(maximumCalls), _wake(std::move(wake)) {}
-  /// Told by the connection's thread which it is: for its own answers it need not be woken.
+  /// Called by the connection's thread, which need not be woken for its own answers.
   void setThread(std::thread::id thread) noexcept { _thread.store(thread); }
 
-  /// Answers the call with that number, while it is served. An answer that can't be written becomes an error.
+  /// Answers the call with that serial number while it is being served. An answer that can't be written
+  /// becomes an error.
   void send(std::uint32_t call, const std::vector<IPCArgument>& arguments) noexcept;
   void sendError(std::uint32_t call, const char* errorName, const char* text) noexcept;
 
-  /// Notes that a call is answered later, by one of the next two. False when too many are.
+  /// Registers a call that one of the next two functions answers later. Returns false if there are too many.
   [[nodiscard]] bool owe();
   void settle(std::uint32_t call, const std::vector<IPCArgument>& arguments) noexcept;
   void settleWithError(std::uint32_t call, const char* errorName, const char* text) noexcept;
 
-  /// Null when the call, a whole message, was taken, else why it was not.
+  /// Takes a call, a whole message. Returns null on success, otherwise the reason.
   const char* put(std::string call);
 
-  // On the connection's thread.
+  // Only for the connection's thread.
 
-  /// Puts the answers that wait into the channel's output.
+  /// Moves waiting answers into the channel's output.
   void moveAnswersTo(Channel& channel);
-  /// The next call; empty when there is none.
+  /// Returns the next call; empty if there is none.
   std::string takeCall();
   bool hasCalls() const;
   /// Whether an answer could not even be written as an error. Its caller would wait for ever, so the
-  /// connection has to end.
+  /// connection must end.
   bool isBroken() const noexcept { return _isBroken.load(); }
-  /// Forgets what waits and what will come; returns how many calls are lost, in all.
+  /// Discards everything that waits or is added later. Returns the total number of calls lost.
   std::size_t close();
 
  private:
@@ -78,7 +79,7 @@ class Outbox {
   std::size_t _owed VESK_GUARDED_BY(_mutex) = 0;
   std::vector<std::string> _answers VESK_GUARDED_BY(_mutex);
   std::deque<std::string> _calls VESK_GUARDED_BY(_mutex);
-  std::size_t _memory VESK_GUARDED_BY(_mutex) = 0;  // of the calls
+  std::size_t _memory VESK_GUARDED_BY(_mutex) = 0;  // of the waiting calls
 };
 
 }  // namespace vesk

@@ -1,4 +1,4 @@
-// The answer that the receiver of a call owes its caller.
+// The pending answer to a call.
 #pragma once
 
 #include <functional>
@@ -6,15 +6,15 @@
 
 namespace vesk {
 
-/// A reply closure: called once, on any thread, by one owner at a time. When it is destroyed without having
-/// been called, its caller gets an error reply, so that nobody waits for ever. Empty when the caller wants no
-/// answer; calling an empty one does nothing.
+/// A reply closure. Called at most once, on any thread, by one owner at a time. If it is destroyed without
+/// having been called, the caller gets an error reply, so that it doesn't wait for ever. Empty if the caller
+/// wants no answer; calling an empty one has no effect.
 template <class... Arguments>
 class Reply {
  public:
   Reply() = default;
-  /// `send` carries the answer; when it throws, for want of memory, `abandon` tells the caller that none will
-  /// come, and must not throw.
+  /// `send` sends the answer. If it throws because memory is exhausted, `abandon` tells the caller that there
+  /// will be no answer; it must not throw.
   Reply(std::function<void(const Arguments&...)> send, std::function<void()> abandon)
       : _send(std::move(send)), _abandon(std::move(abandon)) {}
   Reply(Reply&& other) noexcept

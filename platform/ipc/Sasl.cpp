@@ -14,7 +14,7 @@ namespace {
 
 constexpr std::string_view kLineEnd = "\r\n";
 
-/// Of this process's listener; a client does nothing with it.
+/// The ID of this process's listener; clients ignore it.
 const std::string& serverIdentity() {
   static const std::string identity = [] {
     std::array<unsigned char, 16> bytes{};
@@ -24,8 +24,8 @@ const std::string& serverIdentity() {
   return identity;
 }
 
-/// A claim is the decimal user number, written as hexadecimal digits of its characters; an empty one means
-/// "who I am" and is always true.
+/// A claim is the decimal user number, with its characters written as hexadecimal digits. An empty claim
+/// means the client's actual identity and is always true.
 bool isTrue(std::string_view claim, uid_t user) {
   const std::string number = std::to_string(user);
   const std::string truth = hexLower({reinterpret_cast<const unsigned char*>(number.data()), number.size()});
@@ -33,7 +33,7 @@ bool isTrue(std::string_view claim, uid_t user) {
   return claim.empty() || std::equal(claim.begin(), claim.end(), truth.begin(), truth.end(), alike);
 }
 
-/// Takes `word`, and the blank behind it, from the front of `line`.
+/// Removes `word` and the following blank from the front of `line`.
 bool takeWord(std::string_view& line, std::string_view word) {
   if (line != word && !(line.starts_with(word) && line[word.size()] == ' ')) return false;
   line.remove_prefix(std::min(line.size(), word.size() + 1));

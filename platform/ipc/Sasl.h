@@ -9,11 +9,11 @@
 
 namespace vesk {
 
-/// The server's side. A client is who the kernel says it is (mechanism EXTERNAL); a claim to be somebody
-/// else, and every other mechanism, is rejected. Needs no socket and no clock.
+/// The server side. A client's identity is the one reported by the kernel (mechanism EXTERNAL); claims to
+/// another identity and all other mechanisms are rejected. Needs no socket and no clock.
 class SaslServer {
  public:
-  // A well-behaved client needs six lines at most; one that tries every mechanism in vain a few more.
+  // A well-behaved client needs at most six lines; one that tries every mechanism in vain needs a few more.
   static constexpr std::size_t kMaximumLine = 1024;
   static constexpr std::size_t kMaximumLines = 32;
 
@@ -21,14 +21,14 @@ class SaslServer {
 
   struct Step {
     Verdict verdict = Verdict::Continue;
-    std::size_t taken = 0;  ///< bytes of the input that are dealt with
+    std::size_t taken = 0;  ///< bytes of the input that were processed
     std::string answer{};   ///< to be sent
   };
 
   /// `peer`: the user at the other end.
   explicit SaslServer(uid_t peer) : _peer(peer) {}
 
-  /// `data`: all that has come and was not taken yet. Once begun, not to be called again.
+  /// `data`: all input not yet taken. Must not be called again once begun.
   Step step(std::string_view data);
 
  private:
@@ -44,23 +44,23 @@ class SaslServer {
   std::size_t _lines = 0;
 };
 
-/// The client's side, which says everything at once and then reads the answers.
+/// The client side. Sends everything at once, then reads the answers.
 class SaslClient {
  public:
   enum class Verdict { Continue, Accepted, Refused };
 
   struct Step {
     Verdict verdict = Verdict::Continue;
-    std::size_t taken = 0;  ///< bytes of the input that are dealt with
+    std::size_t taken = 0;  ///< bytes of the input that were processed
   };
 
   /// To be sent first. Claims no user, so that it holds in any user namespace.
   static std::string_view greeting() noexcept;
 
-  /// `data`: all that has come and was not taken yet. Once accepted, not to be called again.
+  /// `data`: all input not yet taken. Must not be called again once accepted.
   Step step(std::string_view data);
 
-  /// The server's last word, for a person, when it has refused; empty when it said nothing.
+  /// The server's last line if it refused, for error messages; empty if there was none.
   const std::string& refusal() const noexcept { return _refusal; }
 
  private:

@@ -11,7 +11,7 @@
 
 namespace vesk {
 
-/// Of arguments, in the order of IPCArgument's alternatives.
+/// The D-Bus types of arguments, in the order of IPCArgument's alternatives.
 inline constexpr std::string_view kArgumentTypes[] = {"b",      "q",  "d",  "s",   "a{sv}", "av",
                                                       "aa{sv}", "as", "as", "aas", "ah"};
 static_assert(std::size(kArgumentTypes) == std::variant_size_v<IPCArgument>);
@@ -25,7 +25,7 @@ constexpr std::string_view argumentType() noexcept {
   }
 }
 
-/// Of a value without others inside.
+/// Whether values of the type contain no other values.
 constexpr bool isBasicType(char type) noexcept {
   constexpr std::string_view kBasicTypes = "ybnqiuxtdsogh";
   for (const char basic : kBasicTypes) {
@@ -34,14 +34,14 @@ constexpr bool isBasicType(char type) noexcept {
   return false;
 }
 
-/// Length of the complete type that `signature` begins with; 0 when it begins with none, or with one that is
-/// nested deeper than D-Bus allows (32 arrays, 32 structures).
+/// The length of the first complete type of `signature`. Returns 0 if there is none, or if it is nested
+/// deeper than D-Bus allows (32 arrays, 32 structures).
 std::size_t completeTypeLength(std::string_view signature) noexcept;
 
-/// Any number of complete types, at most 255 characters.
+/// Accepts any number of complete types, at most 255 characters.
 bool isValidSignature(std::string_view signature) noexcept;
 
-/// In bytes: where a value of a type that begins with `type` may stand. 1 for what is no type.
+/// The alignment in bytes of a value whose type begins with `type`; 1 for an unknown type.
 std::size_t alignmentOf(char type) noexcept;
 
 }  // namespace vesk

@@ -25,7 +25,7 @@ FileDescriptor newSocket() {
 void makeDirectory(const std::filesystem::path& directory) {
   if (directory.empty() || std::filesystem::is_directory(directory)) return;
   makeDirectory(directory.parent_path());
-  // Whatever the umask: clients of every user go through it.
+  // Independent of the umask, since clients of every user pass through it.
   if (::mkdir(directory.c_str(), 0755) == 0) {
     ::chmod(directory.c_str(), 0755);
   } else if (errno != EEXIST) {
@@ -33,7 +33,7 @@ void makeDirectory(const std::filesystem::path& directory) {
   }
 }
 
-/// Only a socket is ever removed, and only one that nobody answers on.
+/// Removes only sockets, and only if there is no server.
 void removeStaleSocket(const std::string& path) {
   struct stat status {};
   if (::lstat(path.c_str(), &status) != 0) return;
@@ -77,7 +77,7 @@ FileDescriptor listenOnUnixSocket(const std::string& path) {
   removeStaleSocket(path);
   UnixSocketAddress address(path);
   FileDescriptor socket = newSocket();
-  // Clients of every user connect to it. The sandbox denies changing the mode afterwards.
+  // Clients of every user connect to it. The sandbox denies changing the mode later.
   const mode_t mask = ::umask(0111);
   const int bound = ::bind(socket.get(), address.get(), address.size());
   const int error = errno;

@@ -1,4 +1,4 @@
-// Stream sockets in the file system. Private to platform/ipc.
+// Unix stream sockets with file-system paths. Private to platform/ipc.
 #pragma once
 
 #include <sys/socket.h>
@@ -13,11 +13,11 @@
 
 namespace vesk {
 
-/// The address of a socket. A path that does not fit into one (108 bytes) is reached through a descriptor of
-/// its directory, which this holds open.
+/// The address of a socket. A path that is too long for an address (108 bytes) is reached through a
+/// descriptor of its directory, which this holds open.
 class UnixSocketAddress {
  public:
-  /// Throws std::system_error when the path is too long and its directory can't be opened.
+  /// Throws std::system_error if the path is too long and its directory can't be opened.
   explicit UnixSocketAddress(const std::string& path);
 
   const sockaddr* get() const noexcept { return reinterpret_cast<const sockaddr*>(&_address); }
@@ -28,16 +28,16 @@ class UnixSocketAddress {
   FileDescriptor _directory;
 };
 
-/// A connected socket that does not block. Throws std::system_error: ENOENT or ECONNREFUSED when nobody
-/// serves it, EAGAIN when too many wait to be accepted.
+/// Returns a connected, non-blocking socket. Throws std::system_error: ENOENT or ECONNREFUSED if there is no
+/// server, EAGAIN if too many clients wait to be accepted.
 FileDescriptor connectUnixSocket(const std::string& path);
 
-/// A listening socket, open to every user, in a directory that is made when it is missing. Removes the socket
-/// that a dead server has left; throws std::system_error (EADDRINUSE) when a live one answers, or whatever
-/// failed.
+/// Returns a listening socket that every user may connect to; creates its directory if missing. Removes the
+/// stale socket of a dead server. Throws std::system_error: EADDRINUSE if a live server answers, otherwise
+/// the error that occurred.
 FileDescriptor listenOnUnixSocket(const std::string& path);
 
-/// Who connected, as the kernel noted it then.
+/// The peer, as the kernel recorded it at connection time.
 IPCPeer peerOfSocket(int socket);
 
 }  // namespace vesk

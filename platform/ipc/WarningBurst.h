@@ -1,4 +1,4 @@
-// One log line for a burst of alike events.
+// Limits a burst of similar events to one log line.
 #pragma once
 
 #include <chrono>
@@ -6,13 +6,13 @@
 
 namespace vesk {
 
-/// A burst ends when nothing happened for `kQuiet`, so that a peer that misbehaves without end costs one
-/// line. For one thread.
+/// A burst ends after `kQuiet` without an event, so that a peer that misbehaves continuously causes only one
+/// line. Not thread-safe.
 class WarningBurst {
  public:
   static constexpr std::chrono::seconds kQuiet{10};
 
-  /// Notes an event; true for the first of a burst.
+  /// Records an event. Returns true for the first of a burst.
   bool begins(std::chrono::steady_clock::time_point now = std::chrono::steady_clock::now()) noexcept {
     bool first = !_last || now - *_last >= kQuiet;
     _last = now;

@@ -11,8 +11,8 @@
 
 namespace vesk {
 
-/// Reads the basic forms under D-Bus's alignment, which counts from the first of `bytes`. Every function
-/// returns whether it found a whole, well-formed one; after a failure the position is of no use.
+/// Reads the basic types with D-Bus's alignment, relative to the start of `bytes`. Every function returns
+/// whether it found a complete, well-formed value; after a failure the position is unspecified.
 class WireCursor {
  public:
   WireCursor(std::string_view bytes, bool isBigEndian) noexcept : _bytes(bytes), _swaps(isBigEndian) {}
@@ -39,7 +39,7 @@ class WireCursor {
     return true;
   }
 
-  /// The bytes of a text or an object path, not looked at but for the NUL that ends them.
+  /// The bytes of a text or an object path, unchecked except for the terminating NUL.
   bool text(std::string_view& out) noexcept {
     std::uint32_t size = 0;
     return number(size) && terminated(size, out);

@@ -10,8 +10,8 @@ namespace vesk {
 
 static_assert(std::endian::native == std::endian::little, "messages are written in little-endian order");
 
-// The fixed part of a header: byte order, type, flags, version, then three numbers of 32 bits. The fields
-// follow, padded to a multiple of 8, and then the body.
+// The fixed part of a header: byte order, type, flags, version, then three 32-bit numbers. The fields follow,
+// padded to a multiple of 8, then the body.
 inline constexpr std::size_t kFlagsAt = 2;
 inline constexpr std::size_t kBodySizeAt = 4;
 inline constexpr std::size_t kSerialAt = 8;  // never 0
@@ -35,10 +35,10 @@ enum HeaderField : std::uint8_t {
   kUnixDescriptors = 9
 };
 
-/// Descriptors along with one message; no member takes more than one.
+/// Limit on descriptors sent with one message; no member takes more than one.
 inline constexpr std::size_t kMaximumDescriptors = 4;
 
-/// What a client in excess is told, in place of an answer to its authentication.
+/// Sent to a client beyond the limit, instead of an answer to its authentication.
 inline constexpr std::string_view kTooManyConnections = "ERROR too many connections";
 
 inline constexpr const char* kErrorFailed = "org.freedesktop.DBus.Error.Failed";
