@@ -22,8 +22,7 @@ enum BackendState : std::int32_t {
   BackendStatePending = 0,   ///< not yet decided; messages are held back
   BackendStateDisabled = 1,  ///< reporting off; messages are dropped
   BackendStateEnabled = 2,   ///< reporting on
-  BackendStateOverride =
-      3,  ///< sampled out, inside the override band: messages are held back until one lifts it
+  BackendStateOverride = 3,  ///< sampled out, inside the override band: held back until a message lifts it
 };
 
 /// A message's flag: one of these, or both. With any other value it is an ordinary message.

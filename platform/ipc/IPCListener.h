@@ -33,8 +33,7 @@ class IPCListener {
     std::string socketPath;    ///< created (mode 0666, its directory 0755) unless `inherited` is given
     FileDescriptor inherited;  ///< a listening socket from the service manager
     std::string objectPath;    ///< the path of a connection's exported object
-    std::size_t maximumConnections =
-        4096;  ///< the last sixteen (an eighth of a small maximum) are reserved for root
+    std::size_t maximumConnections = 4096;  ///< the last 16 (of a small limit, an eighth) are kept for root
     std::size_t maximumConnectionsPerUser = 1024;
     std::size_t maximumMessage = std::size_t{1} << 20;  ///< bytes
     std::size_t maximumOutbox = 256;                    ///< calls to one client that may wait

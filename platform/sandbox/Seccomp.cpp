@@ -129,9 +129,7 @@ std::vector<Rule> allRules() {
        {"mmap", "mmap2"},
        {hasBits(2, PROT_EXEC), hasBits(3, MAP_TYPE, MAP_SHARED_VALIDATE)}},
       {"writable-code", {"memfd_create", "memfd_secret"}},
-      {"writable-code",
-       {"personality"},
-       {isOther(0, kAskForPersonality)}},  // READ_IMPLIES_EXEC is a personality flag
+      {"writable-code", {"personality"}, {isOther(0, kAskForPersonality)}},  // includes READ_IMPLIES_EXEC
       {"writable-code", {"mprotect", "pkey_mprotect"}, {hasBits(2, PROT_EXEC)}},
       {"writable-code", {"shmat"}, {hasBits(2, SHM_EXEC)}},
 
