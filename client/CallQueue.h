@@ -42,8 +42,7 @@ class CallQueue {
 
   // Only for the receiving thread.
 
-  /// Returns false once the host has closed the queue's descriptors; the queue can then no longer wake its
-  /// thread.
+  /// Returns false once the host has closed the queue's descriptors; it can then no longer wake its thread.
   bool ownsItsDescriptors() const noexcept { return _readEnd.isOurs() && _writeEnd.isOurs(); }
   /// Appends queued calls to `calls`, where they still count against the limits, and connection requests to
   /// `requests`. Lowers `firstDeadline` to their earliest deadline. Returns true if a burst of drops has

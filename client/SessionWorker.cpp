@@ -183,8 +183,7 @@ void SessionWorker::linkHasChanged(DaemonLink::Change change) {
 
 void SessionWorker::connectionBroke(Time now) { linkHasChanged(_link.lose(now, kLost)); }
 
-// The daemon must not get a message before it knows the session. If there is no memory to introduce it, try
-// again later.
+// The daemon must not get a message before it knows the session. If memory for that runs out, reconnects.
 void SessionWorker::introduceAgain() {
   bool isTold = false;
   try {

@@ -81,8 +81,7 @@ class SessionWorker {
   ClientCalls _waiting;   ///< to be sent; the first `_callsInBus` are one-way and already in the bus
   ClientCalls _owed;      ///< sent, not yet answered
   ClientCalls _requests;  ///< requests for a connection
-  /// One-way calls that the bus has but the socket has not fully taken: they are resent if the connection is
-  /// lost.
+  /// One-way calls that the bus has but the socket has not fully taken: resent if the connection is lost.
   std::size_t _callsInBus = 0;
   /// At or before the deadlines of all calls that wait or request a connection.
   Time _firstDeadline = Time::max();

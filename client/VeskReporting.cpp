@@ -104,8 +104,7 @@ VeskReporting::VeskReporting(ReportingOptions options) noexcept {
 }
 
 VeskReporting::~VeskReporting() {
-  // In a forked process the thread is gone, along with any locks it held, so the implementation can only be
-  // leaked.
+  // In a forked process the thread is gone, along with any locks it held: the implementation must be leaked.
   if (_implementation && !_implementation->isOurs()) static_cast<void>(_implementation.release());
 }
 

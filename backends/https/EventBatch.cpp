@@ -6,8 +6,7 @@ namespace vesk {
 
 namespace {
 
-// The memory that a held event takes beyond its entries and texts: its place in the batch and the decoder's
-// arena chunk.
+// A held event's memory beyond its entries and texts: its place in the batch and the decoder's arena chunk.
 constexpr std::size_t kOverhead = 1024;
 constexpr std::size_t kMostMethods = 65'536;
 

@@ -35,8 +35,7 @@ class EventBatch {
   void add(MutableDictionary event);
   /// As above, and also counts the event for its method.
   void add(MutableDictionary event, std::int64_t method);
-  /// Returns true if the batch holds more events of the method than `threshold`, and then restarts their
-  /// count.
+  /// Returns true if the batch holds more events of the method than `threshold`, then restarts their count.
   bool passesThreshold(std::int64_t method, std::int32_t threshold);
 
   /// If an account is above its limit, drops the oldest events until it is an eighth below. Drops the newest

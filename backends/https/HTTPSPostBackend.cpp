@@ -190,8 +190,7 @@ HTTPSPostBackend::PostToBuild HTTPSPostBackend::batchEvent(MutableDictionary eve
 
 bool HTTPSPostBackend::holdsEvents() const { return _batchedEvents && _batchedEvents->size() > 0; }
 
-// An enabled backend sends a full batch. Otherwise nothing may be sent yet, and the oldest events are
-// dropped.
+// An enabled backend sends a full batch. Otherwise sending isn't allowed yet; the oldest events are dropped.
 void HTTPSPostBackend::boundHeldEvents() {
   if (!_identity._heldBytes->exceeded()) return;
   PostToBuild full;

@@ -38,8 +38,8 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   void setCorrelatedSessionIDLocked(const std::optional<Text>& sessionID) override VESK_REQUIRES(_mutex);
 
  private:
-  /// Events taken for a post, with everything that the post is made of: later changes of the backend don't
-  /// affect them.
+  /// Events taken for a post, with everything that the post needs: unaffected by later changes of the
+  /// backend.
   struct Post {
     std::unique_ptr<EventBatch> events;
     std::optional<Dictionary> lateUserInfo;  ///< filtered, not empty; for events held before it was known

@@ -26,8 +26,7 @@ bool fitsIntoBody(const Value& value) {
   return value.isNumber() || value.text() != nullptr;
 }
 
-// Converts dates to seconds. Removes and reports what JSON can't carry; otherwise the whole batch would be
-// lost.
+// Converts dates to seconds. Removes and reports what JSON can't carry, to save the rest of the batch.
 void sanitize(MutableDictionary& event) {
   std::erase_if(event.entries(), [](DictionaryEntry& entry) {
     if (fitsIntoBody(entry.value)) return false;

@@ -20,8 +20,8 @@ struct PostBody {
   std::optional<std::string> prettyJsonString;  ///< for the local message log, if allowed there
 };
 
-/// Serialises the events, after removing what JSON can't carry, with a line of level 4 each. Returns nullopt
-/// on failure.
+/// Serialises the events without what JSON can't carry, which is logged at level 4. Returns nullopt on
+/// failure.
 std::optional<PostBody> createMessageForPostAndLogging(EventBatch& events, const std::string& clientID,
                                                        WallTime postTime, bool isPrintable);
 

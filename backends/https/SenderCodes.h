@@ -8,8 +8,8 @@
 
 namespace vesk {
 
-/// The sender code of a client type. Returns nullopt outside 0 to 11; the header and the event field are then
-/// left out.
+/// The sender code of a client type. Returns nullopt outside 0 to 11; header and event field are then
+/// omitted.
 inline std::optional<std::string_view> senderCodeForClientType(std::int32_t clientType) noexcept {
   constexpr std::array<std::string_view, 12> kCodes{"QX", "WB", "JYP", "KF", "UZ", "HD",
                                                     "EP", "YW", "BQ",  "FX", "DJ", "OZ"};

@@ -16,8 +16,7 @@ namespace vesk {
 
 namespace {
 
-// Limit on messages served in one `process`, so that a daemon that sends continuously doesn't starve the
-// owner's loop.
+// Limit on messages served in one `process`, so that a busy daemon doesn't starve the owner's loop.
 constexpr int kMaximumSteps = 64;
 
 // In bytes; the system may allow less. Small messages take several times their size in the kernel.

@@ -35,8 +35,7 @@ class BusAnswer {
   std::string_view errorName() const noexcept { return _errorName; }
   std::string_view errorText() const noexcept { return _errorText; }
 
-  /// Reads the next argument (for the types, see MessageReader::read). Returns false for an error or a wrong
-  /// type.
+  /// Reads the next argument (types: see MessageReader::read). Returns false for an error or a wrong type.
   template <class T>
   bool read(T& out) {
     return _arguments && _arguments->read(out);

@@ -20,8 +20,7 @@ std::string nameFor(std::uint64_t serial, const IPCPeer& peer) {
          std::to_string(peer.process) + ")";
 }
 
-/// Returns the milliseconds until `deadline` for poll(), rounded up so that it has passed when poll()
-/// returns.
+/// Milliseconds until `deadline` for poll(), rounded up so that it has passed when poll() returns.
 int untilDeadline(std::chrono::steady_clock::time_point deadline) {
   auto left =
       std::chrono::ceil<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now()).count();

@@ -16,8 +16,7 @@ namespace vesk {
 class IPCIncomingCall;
 
 /// Passes method calls to the object exported under one path, serves D-Bus's standard interfaces, and answers
-/// everything else with the standard D-Bus errors. Drops signals and stray answers. Used on the connection's
-/// thread.
+/// other calls with the standard errors. Drops signals and stray answers. Used on the connection's thread.
 class CallRouter {
  public:
   /// `owner`: see IPCIncomingCall. `limits`: for the arguments of one call.

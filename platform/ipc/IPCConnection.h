@@ -61,9 +61,9 @@ struct IPCEncodedCall {
   IPCDescriptor descriptor{};  ///< sent with the call
 };
 
-/// The handlers of a connection. All run on the connection's thread, each at most once. They are destroyed
-/// after the invalidation handler has run, which breaks reference cycles with the connection. Each may be
-/// empty.
+/// The handlers of a connection; each may be empty. All run on the connection's thread, each at most once.
+/// They are destroyed after the invalidation handler has run, which breaks reference cycles with the
+/// connection.
 struct IPCHandlers {
   std::shared_ptr<IPCExportedObject> object{};
   std::function<void()> interruption{};

@@ -22,8 +22,7 @@ class ConnectionRegistry;
 class IPCListenerDelegate {
  public:
   virtual ~IPCListenerDelegate() = default;
-  /// Called on the listener's thread for each new connection, before it is resumed. Returning false closes
-  /// it.
+  /// Called on the listener's thread for each new connection, before it is resumed. Return false to close it.
   virtual bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) = 0;
 };
 

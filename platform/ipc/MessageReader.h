@@ -17,7 +17,7 @@
 
 namespace vesk {
 
-/// Reads the arguments in order. After the first failure, every further read fails with the same error. Not
+/// Reads the arguments in order. After a failure, all further reads fail with the same error. Not
 /// thread-safe.
 class MessageReader {
  public:

@@ -18,8 +18,7 @@ struct IPv4Endpoint {
   std::uint32_t address = 0;
   std::uint16_t port = 0;
 
-  /// Four decimal numbers separated by dots ("127.0.0.1"), at most 15 characters. Returns nullopt for
-  /// anything else.
+  /// Four decimal numbers separated by dots ("127.0.0.1"), at most 15 characters; otherwise returns nullopt.
   static std::optional<IPv4Endpoint> parse(std::string_view dotted, std::uint16_t port);
   /// "127.0.0.1:40312"
   std::string text() const;

@@ -29,8 +29,7 @@ class PowerLogFile {
   PowerLogFile(std::string path, std::int64_t maximumRows)
       : _path(std::move(path)), _maximumRows(maximumRows) {}
 
-  /// Adds all events or none, then drops rows beyond the limits. Returns a description of the error, empty on
-  /// success.
+  /// Adds all events or none, then drops rows beyond the limits. Returns an error text, empty on success.
   [[nodiscard]] std::string append(const std::vector<PowerLogEvent>& events, WallTime now);
 
  private:

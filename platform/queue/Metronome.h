@@ -21,8 +21,7 @@ class Metronome {
   void start(Work handler);
   /// Call only while paused.
   void resume(Work handler);
-  /// The handler is not called again, and is destroyed as soon as it is not running. The handler may call
-  /// this.
+  /// The handler is not called again, and is destroyed once it is not running. The handler may call this.
   void pause() noexcept { _timer.reset(); }
   bool isPaused() const noexcept { return _timer == nullptr; }
 

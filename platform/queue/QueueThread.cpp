@@ -72,7 +72,7 @@ class QueueThread::Loop {
   std::thread _thread;
 };
 
-/// Outlives the thread while a queue exists. The lock is a leaf: under it, things are only put into the
+/// Outlives the thread while a queue exists. The lock is a leaf: it only guards putting things into the
 /// context.
 struct QueueThread::Shared {
   Mutex mutex;

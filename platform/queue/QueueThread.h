@@ -8,8 +8,7 @@
 
 namespace vesk {
 
-/// Makes queues that share one thread, which starts with the first queue, and counts the queues in use.
-/// Thread-safe.
+/// Makes queues that share one thread, started with the first queue, and counts those in use. Thread-safe.
 class QueueThread final : public TimedQueueMaker {
  public:
   QueueThread();

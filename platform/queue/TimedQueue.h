@@ -35,7 +35,7 @@ class TimedQueue {
   virtual std::unique_ptr<Source> makeTimer(std::chrono::milliseconds first,
                                             std::chrono::milliseconds interval, Work handler) = 0;
   /// Calls its handler whenever the descriptor is readable, and again while data is left. Keeps its share of
-  /// the descriptor until it has stopped watching. Throws std::system_error for a descriptor that can't be
+  /// the descriptor until it has stopped watching. Throws std::system_error if the descriptor can't be
   /// watched.
   virtual std::unique_ptr<Source> makeReadSource(std::shared_ptr<const FileDescriptor> descriptor,
                                                  Work handler) = 0;
@@ -45,8 +45,7 @@ class TimedQueue {
 class TimedQueueMaker {
  public:
   virtual ~TimedQueueMaker() = default;
-  /// `label` names the queue in log lines; must be a literal. May throw if there is no thread to run the
-  /// queue.
+  /// `label`, a literal, names the queue in log lines. May throw if there is no thread to run the queue.
   virtual std::shared_ptr<TimedQueue> makeQueue(const char* label) = 0;
 };
 

@@ -72,8 +72,7 @@ bool hasAbstractManager() {
 
 /// Covers every right known here that the kernel can restrict. Moving a file to another directory (version 2)
 /// is never granted. Truncation by path became a right only with version 3, so the system-call group
-/// "truncation" covers it on every kernel. A kernel accepts a ruleset longer than it knows if the rest is
-/// zero.
+/// "truncation" covers it on every kernel. A kernel accepts an overlong ruleset if the rest is zero.
 FileDescriptor makeRuleset(long kernelVersion, bool restrictsConnections) {
   Ruleset ruleset;
   ruleset.files = kFirstVersionRights;

@@ -23,8 +23,7 @@ struct SandboxPath {
 };
 
 struct SandboxProfile {
-  /// Whether a kernel without Landlock is an error. Otherwise only the system-call filter applies on such a
-  /// kernel.
+  /// Whether a kernel without Landlock is an error. Otherwise only the system-call filter applies there.
   bool landlockRequired = true;
   std::vector<SandboxPath> paths;
   /// TCP ports of servers that may be connected to; nullopt for all ports.
@@ -37,8 +36,7 @@ struct SandboxProfileOutcome {
   std::string error;
 };
 
-/// Reads a profile from TOML. An unknown key or group of calls is an error: a typo must not weaken the
-/// sandbox.
+/// Reads a profile from TOML. Unknown keys and groups of calls are errors: a typo must not widen access.
 ///
 ///     landlock = "required"           # or "if-available"
 ///     [machine]                       # paths of the machine, independent of the root prefix
@@ -53,9 +51,8 @@ struct SandboxProfileOutcome {
 ///     [calls]
 ///     deny = […]
 ///
-/// A path may begin with an environment variable ("$HOME/.config"); the entry is left out if the variable is
-/// unset or not an absolute path. Paths are resolved textually: "$SSL_CERT_FILE/.." is the directory of that
-/// file.
+/// A path may begin with an environment variable ("$HOME/.config"); the entry is left out if that is unset or
+/// not an absolute path. Paths are resolved textually: "$SSL_CERT_FILE/.." is the directory of that file.
 SandboxProfileOutcome parseSandboxProfile(std::string_view toml);
 
 /// Creates missing directories among those to be written to. Returns a description of the error, if any.
