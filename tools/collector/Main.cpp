@@ -63,7 +63,7 @@ void define(CLI::App& app, Arguments& arguments) {
   auto& collector = arguments.collector;
   app.set_version_flag("--version", std::string("veskcollector ") + VESK_VERSION);
   app.add_option("--directory", arguments.directory,
-                 "Keep authority, keys and, unless said otherwise, storebags and events here "
+                 "Keep authority, keys and, by default, storebags and events here "
                  "(default: ~/.local/share/veskcollector)")
       ->type_name("DIR");
   app.add_option("--address", collector.address, "Listen on this numeric address")->capture_default_str();
@@ -81,14 +81,14 @@ void define(CLI::App& app, Arguments& arguments) {
   app.add_option("--storebags", collector.storebags, "Folder of NAME.toml and NAME.json")->type_name("DIR");
   app.add_option("--events", collector.events, "Append events to this file of JSON lines")->type_name("FILE");
   app.add_option("--uploads", collector.uploads, "Save uploaded files in this folder")->type_name("DIR");
-  app.add_option("--upload-answer", collector.uploadAnswer, "Answer this to every uploaded file")
+  app.add_option("--upload-answer", collector.uploadAnswer, "Answer every uploaded file with this")
       ->capture_default_str();
   app.add_option("--max-age", arguments.maximumAge, "Send storebags with this Cache-Control max-age")
       ->type_name("SECONDS");
-  app.add_flag("--lenient", arguments.lenient, "Serve storebags with values of a wrong type too");
-  app.add_flag("--json", arguments.json, "Write one JSON line an event, with its headers");
+  app.add_flag("--lenient", arguments.lenient, "Also serve storebags with values of the wrong type");
+  app.add_flag("--json", arguments.json, "Write one JSON line per event, with its headers");
   app.add_option("--fault", collector.faults,
-                 "Answer badly: " + FaultPlan::forms() +
+                 "Inject faults: " + FaultPlan::forms() +
                      ", with *N for N times only (repeatable); FAULT is " + FaultPlan::faultNames())
       ->type_name("FAULT");
   app.add_option("--ready-file", arguments.readyFile, "Write ports and paths here as JSON once listening")

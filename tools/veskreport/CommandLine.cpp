@@ -106,14 +106,14 @@ class Reader {
   CLI::App* add(CLI::App& parent, const char* name, const char* description, Command command) {
     CLI::App* sub = parent.add_subcommand(name, description);
     sub->callback([this, command] { _invocation.command = command; });
-    sub->add_flag("--json", _invocation.json, "Print one JSON object a line");
+    sub->add_flag("--json", _invocation.json, "Print one JSON object per line");
     return sub;
   }
 
   CLI::App* addClient(const char* name, const char* description, Command command) {
     CLI::App* sub = add(_app, name, description, command);
     ClientIdentity& identity = _invocation.identity;
-    sub->add_option("--root", identity.root, "Directory that stands for / (default: $VESKREPORTINGD_ROOT)");
+    sub->add_option("--root", identity.root, "Directory to use as / (default: $VESKREPORTINGD_ROOT)");
     sub->add_option("--socket", identity.socket, "The daemon's socket")->excludes("--root");
     sub->add_option("--client-type", identity.clientType, "Client type; selects the storebag")->required();
     sub->add_option("--client-version", identity.clientVersion, "Client version")->capture_default_str();
@@ -124,8 +124,8 @@ class Reader {
         ->take_all()
         ->allow_extra_args(false);
     sub->add_flag("--require-user-info", identity.requireUserInfo,
-                  "Have backends wait for user info and heed it");
-    sub->add_flag("--batch", identity.batch, "Have backends gather messages before they post them");
+                  "Make backends wait for user info and apply it");
+    sub->add_flag("--batch", identity.batch, "Make backends collect messages into batches");
     sub->add_option("--timeout", _timeout, "Seconds to wait for each answer")
         ->check(CLI::Range(0.001, kLongestTimeout) & CLI::Validator(isNumber, "", "NUMBER"))
         ->capture_default_str();
@@ -134,11 +134,11 @@ class Reader {
 
   void addSessionCommands() {
     addClient("states", "Show the names of the enabled backends", Command::States);
-    addClient("display-url", "Show where the session's messages can be looked at", Command::DisplayURL);
-    addClient("flush", "Have the backends send what they hold back", Command::Flush);
+    addClient("display-url", "Show where the session's messages can be viewed", Command::DisplayURL);
+    addClient("flush", "Make the backends send what they hold back", Command::Flush);
     addClient("aggregate", "Show the messages of this session and of those below it as they are sent",
               Command::Aggregate)
-        ->add_option("--count", _invocation.aggregateCount, "End after so many messages (default: never)")
+        ->add_option("--count", _invocation.aggregateCount, "Exit after this many messages (default: never)")
         ->check(CLI::NonNegativeNumber);
   }
 
@@ -155,15 +155,14 @@ class Reader {
         type->required();
         continue;
       }
-      sub->add_flag("--realtime", _realtime, "Post at once, past the batch");
-      sub->add_flag("--override-sampling", _overrideSampling,
-                    "Send although sampling leaves this device out");
+      sub->add_flag("--realtime", _realtime, "Post at once, without batching");
+      sub->add_flag("--override-sampling", _overrideSampling, "Send even if sampling excludes this device");
       auto* noWait =
           sub->add_flag("--no-wait", message.noWait, "Send one way, without waiting for an answer");
       sub->add_flag(
              "--stdin", message.fromStandardInput,
              "Send a message for each line of standard input: a JSON object, which is the payload when\n"
-             "category and type are given, else {\"category\":…,\"type\":…,\"payload\":{…},\"flag\":…}")
+             "category and type are given, otherwise {\"category\":…,\"type\":…,\"payload\":{…},\"flag\":…}")
           ->excludes(payload)
           ->excludes(noWait);
       category->needs(type);
@@ -196,7 +195,7 @@ class Reader {
     CLI::App* log =
         add(_app, "power-log", "Show what was recorded in the device's power log", Command::PowerLog);
     log->add_option("--root", _invocation.identity.root,
-                    "Directory that stands for / (default: $VESKREPORTINGD_ROOT)");
+                    "Directory to use as / (default: $VESKREPORTINGD_ROOT)");
     log->add_option("--since", _invocation.powerLog.since,
                     "Only from then on: an age (30s, 15m, 2h, 7d) or a UTC time (2026-11-24T18:30:00Z)")
         ->type_name("WHEN");
@@ -214,7 +213,7 @@ class Reader {
     sign->add_option("source", arguments.source, "Storebag as TOML or JSON")->required();
     sign->add_option("--key", arguments.privateKey, "Private key (PEM)")->required();
     sign->add_option("-o,--output", arguments.output, "Where to write it (default: standard output)");
-    sign->add_flag("--lenient", arguments.lenient, "Sign although values are of a wrong type");
+    sign->add_flag("--lenient", arguments.lenient, "Sign even if values have the wrong type");
     CLI::App* verify = add(*storebag, "verify", "Check a signed storebag", Command::StorebagVerify);
     verify->add_option("storebag", arguments.source, "Signed storebag")->required();
     verify->add_option("--key", arguments.publicKey, "Public key (DER; default: the installed one)");
