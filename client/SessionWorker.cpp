@@ -190,7 +190,7 @@ void SessionWorker::introduceAgain() {
     isTold = (!_configuration || tell(wire::kSetSessionInfo, *_configuration)) &&
              (!_isStarted || tell(wire::kStartConfig, {}));
   } catch (const std::exception&) {
-    // Not told.
+    // `isTold` stays false.
   }
   if (!isTold) connectionBroke(Clock::now());
 }
