@@ -14,6 +14,7 @@
 #include "platform/http/HTTPClient.h"
 #include "platform/ipc/IPCListener.h"
 #include "platform/log/SystemLog.h"
+#include "platform/outbox/PostOutbox.h"
 #include "platform/powerlog/PowerLog.h"
 #include "platform/queue/QueueThread.h"
 #include "platform/service/DescriptorLimit.h"
@@ -31,6 +32,9 @@ constexpr std::size_t kOtherDescriptors = 256;
 
 // The number of lines that one call site may log for one user in ten seconds.
 constexpr std::uint64_t kLogRateLimit = 200;
+
+constexpr char kOutboxPath[] = "/var/lib/veskreportingd/outbox.sqlite";
+constexpr std::uint64_t kMostOutboxDays = 3650;
 
 /// The wanted number of connections, or fewer if the process's descriptors don't suffice.
 std::size_t maximumConnections(std::size_t wanted) {
@@ -54,6 +58,35 @@ IPCListener::Options listenerOptions(ServiceManager& serviceManager) {
   return options;
 }
 
+void countFate(const PostOutbox::Fate& fate, RefusedPosts& refusedPosts) {
+  using Outcome = PostOutbox::Outcome;
+  DropReason reason = DropReason::DeliveredLate;
+  switch (fate.outcome) {
+    case Outcome::Delivered:
+      break;
+    case Outcome::Refused:
+      refusedPosts.note(std::string(fate.source), fate.status, fate.events);
+      reason = DropReason::RefusedLate;
+      break;
+    case Outcome::Expired:
+      reason = DropReason::Expired;
+      break;
+    case Outcome::OverQuota:
+      reason = DropReason::OverQuota;
+      break;
+    case Outcome::ConsentWithdrawn:
+      reason = DropReason::ConsentWithdrawn;
+      break;
+    case Outcome::Damaged:
+      reason = DropReason::Damaged;
+      break;
+    case Outcome::NotWritten:
+      reason = DropReason::NotWritten;
+      break;
+  }
+  Counters::shared().count(fate.source, reason, fate.events);
+}
+
 std::size_t bytesOfMiB(const char* preference, std::size_t byDefault) {
   constexpr std::uint64_t kMost = 1 << 30;
   auto wanted = preferenceNumberForKey(preference, 1);
@@ -67,8 +100,29 @@ HeldBudget::Limits heldLimits() {
   return limits;
 }
 
-HTTPClient::Options httpOptions(BusyMarker& busyMarker) {
+/// Returns null if the preference "outbox" is "off".
+std::unique_ptr<PostOutbox> makeOutbox(BusyMarker& busyMarker, RefusedPosts& refusedPosts) {
+  const std::string mode = preferenceStringForKey("outbox").value_or("outage");
+  if (mode == "off") return nullptr;
+  if (mode != "outage") VESK_LOG_WARNING("main: preference 'outbox': '%s' is neither \"outage\" nor \"off\"", mode.c_str());
+  PostOutbox::Options options;
+  options.path = pathUnderRoot(kOutboxPath);
+  options.maximumBytes = bytesOfMiB("outboxMiB", options.maximumBytes);
+  if (auto days = preferenceNumberForKey("outboxDays", 1)) {
+    options.maximumAge = std::chrono::days(std::min<std::uint64_t>(*days, kMostOutboxDays));
+  }
+  options.onWaiting = [&busyMarker](bool waiting) { waiting ? busyMarker.begin() : busyMarker.end(); };
+  options.onFate = [&refusedPosts](const PostOutbox::Fate& fate) { countFate(fate, refusedPosts); };
+  return std::make_unique<PostOutbox>(std::move(options));
+}
+
+// In this time a post is tried again from memory. Then it is put aside, and the session gets its result.
+constexpr std::chrono::seconds kPutAsideAfter{5};
+
+HTTPClient::Options httpOptions(BusyMarker& busyMarker, PostOutbox* outbox) {
   HTTPClient::Options options;
+  options.keeper = outbox;
+  if (outbox) options.retryFor = kPutAsideAfter;
   options.userAgent = "veskreportingd/" VESK_VERSION;
   options.onIdle = [&busyMarker] { busyMarker.touch(); };
   return options;
@@ -91,10 +145,9 @@ std::shared_ptr<DashboardLinger> dashboardLinger() {
 }
 
 void logLosses() {
-  for (const auto& loss : Counters::shared().snapshot()) {
-    VESK_LOG_INFO("main: Lost since the start: %s %s %llu", loss.backend.c_str(),
-                  std::string(nameOfDropReason(loss.reason)).c_str(),
-                  static_cast<unsigned long long>(loss.count));
+  for (const auto& [backend, reason, count] : Counters::shared().snapshot()) {
+    VESK_LOG_INFO("main: %s since the start: %s %s %llu", isLoss(reason) ? "Lost" : "Delayed", backend.c_str(),
+                  std::string(nameOfDropReason(reason)).c_str(), static_cast<unsigned long long>(count));
   }
 }
 
@@ -108,16 +161,34 @@ struct Daemon::Parts {
                         .networkQueues = networkQueues,
                         .persistentIdentifierForDNU =
                             [](bool respectsConsent) { return persistentIdentifierForDNU(respectsConsent); },
-                        .diagnosticsSubmissionConsent = diagnosticsSubmissionConsent,
+                        .diagnosticsSubmissionConsent = [this] { return consent(); },
                         .regionCode = regionCode,
                         .powerLog = std::make_shared<PowerLog>(powerLogOptions()),
                         .dashboardLinger = dashboardLinger()},
         sessionServices{.backends = backendServices, .libraryVersion = clientLibraryVersion()},
-        http(httpOptions(busyMarker)),
+        outbox(makeOutbox(busyMarker, *backendServices.refusedPosts)),
+        http(httpOptions(busyMarker, outbox.get())),
         agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetcher(), busyMarker)),
         listener(listenerOptions(serviceManager)) {
     backendServices.heldBudget = std::make_shared<HeldBudget>(heldLimits());
     listener.setDelegate(agent.get());
+    if (!outbox) return;
+    outbox->setConsent(diagnosticsSubmissionConsent());
+    outbox->start(http);
+  }
+
+  /// Also called for each new session, so that a withdrawal reaches the posts that wait.
+  bool consent() const {
+    const bool consent = diagnosticsSubmissionConsent();
+    if (outbox) outbox->setConsent(consent);
+    return consent;
+  }
+
+  /// Ends the client and writes what it could not deliver.
+  void stopPosting() {
+    if (outbox) outbox->stopSending();
+    http.stop();
+    if (outbox) outbox->stop();
   }
 
   StorebagFetcher storebagFetcher() {
@@ -134,6 +205,8 @@ struct Daemon::Parts {
   // Declared before the client: posts that complete while the client ends still use the services.
   BackendServices backendServices;
   SessionServices sessionServices;
+  // Null: posts that can't be delivered for a minute are lost. Declared before the client, whose posts it keeps.
+  std::unique_ptr<PostOutbox> outbox;
   HTTPClient http;
   std::shared_ptr<ReportingdAgent> agent;
   IPCListener listener;
@@ -171,7 +244,8 @@ bool Daemon::stop() {
     VESK_LOG_WARNING("main: Stopping although datagrams are still unacknowledged after %d ms.",
                      static_cast<int>(kDatagramWait.count()));
   }
-  if (haveEnded) _parts.reset();  // abandons and counts what is left
+  _parts->stopPosting();          // puts aside, or abandons and counts, what is left
+  if (haveEnded) _parts.reset();
   logLosses();
   return haveEnded;
 }

@@ -43,6 +43,22 @@ std::string_view nameOfDropReason(DropReason reason) noexcept {
       return "adaptor-failed";
     case DropReason::ServerRefused:
       return "server-refused";
+    case DropReason::Deferred:
+      return "deferred";
+    case DropReason::DeliveredLate:
+      return "delivered-late";
+    case DropReason::RefusedLate:
+      return "refused";
+    case DropReason::Expired:
+      return "expired";
+    case DropReason::OverQuota:
+      return "over-quota";
+    case DropReason::ConsentWithdrawn:
+      return "consent-withdrawn";
+    case DropReason::Damaged:
+      return "damaged";
+    case DropReason::NotWritten:
+      return "not-written";
   }
   return "unknown";
 }

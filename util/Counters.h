@@ -1,4 +1,4 @@
-// Counts the daemon's losses by backend and reason.
+// Counts what the daemon could not deliver at once, by backend and reason.
 #pragma once
 
 #include <array>
@@ -13,7 +13,7 @@
 
 namespace vesk {
 
-/// Why messages or events were lost.
+/// Why messages or events were lost or delayed.
 enum class DropReason : std::uint8_t {
   StateDisabled,   ///< the backend is disabled and dropped the message
   TransportError,  ///< the post or upload failed without an answer
@@ -30,9 +30,23 @@ enum class DropReason : std::uint8_t {
   NotRecorded,     ///< a local record could not be written
   AdaptorFailed,   ///< an adaptor was missing or did not accept the message
   ServerRefused,   ///< the server answered neither with success (2xx) nor with a server error (5xx)
-                   // kDropReasonCount depends on the last reason.
+
+  Deferred,  ///< not lost: the post could not be delivered and was put aside. One of the following ends it.
+  DeliveredLate,     ///< not lost: the server accepted it in the end
+  RefusedLate,       ///< the server answered with another status than 2xx
+  Expired,           ///< it waited for too long
+  OverQuota,         ///< it gave way to others
+  ConsentWithdrawn,  ///< the user withdrew consent
+  Damaged,           ///< its record could not be read
+  NotWritten,        ///< it was not on disk when the daemon ended
+                     // kDropReasonCount depends on the last reason.
 };
-inline constexpr std::size_t kDropReasonCount = static_cast<std::size_t>(DropReason::ServerRefused) + 1;
+inline constexpr std::size_t kDropReasonCount = static_cast<std::size_t>(DropReason::NotWritten) + 1;
+
+/// False for those that only tell of a delay.
+constexpr bool isLoss(DropReason reason) {
+  return reason != DropReason::Deferred && reason != DropReason::DeliveredLate;
+}
 
 /// A name for tools and logs, such as "state-disabled".
 std::string_view nameOfDropReason(DropReason reason) noexcept;
@@ -54,7 +68,7 @@ class Counters {
   Counters(const Counters&) = delete;
   Counters& operator=(const Counters&) = delete;
 
-  /// Adds `n` lost messages or events. After 64 different backend names, further names count as "other".
+  /// Adds `n` messages or events. After 64 different backend names, further names count as "other".
   void count(std::string_view backend, DropReason reason, std::uint64_t n = 1) noexcept;
 
   /// All counts above zero, ordered by backend name and reason.

@@ -254,6 +254,8 @@ HTTPSPostBackend::PostToBuild HTTPSPostBackend::makePost(std::unique_ptr<EventBa
                                              : _uuidOverrideDnu;
   post->headers = postHeaders(_identity, _userInfoDict, method, responseCode);
   post->isPrintable = _settings._dnuType == 0 && _dnuEnabled;
+  // A session that requires no user info reports without asking for consent.
+  post->respectsConsent = _settings._dnuType == 0 && _identity._requireUserInfo;
   return post;
 }
 
@@ -290,6 +292,9 @@ void HTTPSPostBackend::postJSONMessage(Post post, std::string json, std::size_t 
     return;
   }
   auto request = postRequest(std::move(*post.url), std::move(post.headers), std::move(json), _identity._user);
+  request.source = _name;
+  request.events = static_cast<std::uint32_t>(eventCount);
+  request.respectsConsent = post.respectsConsent;
   // The completion keeps the backend alive. At a session's end it may hold the last reference.
   auto self = std::static_pointer_cast<HTTPSPostBackend>(shared_from_this());
   _services.http.start(std::move(request), [self, eventCount](const HTTPResult& result) {
@@ -304,7 +309,9 @@ void HTTPSPostBackend::postCompleted(const HTTPResult& result, std::size_t event
   const long status = result.response ? result.response->status : 0;
   if (status < 500 || status > 599) {
     if (status >= 200 && status <= 299) return;
-    const auto reason = status == 0 ? DropReason::TransportError : DropReason::ServerRefused;
+    const auto reason = status != 0              ? DropReason::ServerRefused
+                        : result.error->deferred ? DropReason::Deferred
+                                                 : DropReason::TransportError;
     _services.counters.count(_name, reason, eventCount);
     if (status != 0) _services.refusedPosts->note(_name, status, eventCount);
     return;

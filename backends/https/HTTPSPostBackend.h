@@ -46,7 +46,8 @@ class HTTPSPostBackend final : public VeskReportingBackend {
     std::optional<std::string> url;
     std::string clientID;
     PostHeaders headers;
-    bool isPrintable = false;  ///< the text may go to the local message log
+    bool isPrintable = false;      ///< the text may go to the local message log
+    bool respectsConsent = false;  ///< it was allowed by the user's consent
   };
   using PostToBuild = std::unique_ptr<Post>;
 

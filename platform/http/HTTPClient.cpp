@@ -1,9 +1,7 @@
 #include "platform/http/HTTPClient.h"
 
-#include <algorithm>
 #include <cstdlib>
 #include <exception>
-#include <new>
 #include <semaphore>
 
 #include "platform/http/HTTPExchange.h"
@@ -32,29 +30,30 @@ std::optional<std::string_view> HTTPResponse::header(std::string_view name) cons
 HTTPClient::HTTPClient(Options options)
     : _options(std::move(options)), _authorities(authoritiesFromEnvironment()) {}
 HTTPClient::HTTPClient() : HTTPClient(Options{}) {}
-HTTPClient::~HTTPClient() = default;
+HTTPClient::~HTTPClient() = default;  // the worker stops
 
 HTTPClient::Worker* HTTPClient::worker() {
   MutexLock lock(_mutex);
   return _worker.get();
 }
 
-HTTPClient::Worker& HTTPClient::startedWorker() {
+HTTPClient::Worker* HTTPClient::startedWorker() {
   MutexLock lock(_mutex);
-  if (!_worker) _worker = std::make_unique<Worker>(_options, _authorities, _postsOnly);
-  return *_worker;
+  if (!_worker && !_stopped) _worker = std::make_unique<Worker>(_options, _authorities, _postsOnly);
+  return _worker.get();
 }
 
 void HTTPClient::start(HTTPRequest request, Completion completion) {
   removeUnsafeHeaders(request);
-  HTTPError problem;
+  HTTPError problem = stopped();
   try {
-    startedWorker().start(request, completion);
-    return;
-  } catch (const std::bad_alloc&) {
-    problem = outOfMemory();
+    Worker* started = startedWorker();
+    if (started && started->start(request, completion)) return;
   } catch (const std::exception& error) {
-    problem = httpError(HTTPError::Kind::Other, error.what());
+    problem = {HTTPError::Kind::Other, error.what()};
+  }
+  if (_options.keeper && request.retry == HTTPRequest::Retry::UntilSent) {
+    problem.deferred = _options.keeper->keep(std::move(request), std::chrono::seconds(0));
   }
   runCompletion(completion, {std::nullopt, std::move(problem)});
 }
@@ -65,21 +64,21 @@ HTTPResult HTTPClient::perform(HTTPRequest request) {
     HTTPResult result;
     std::binary_semaphore done{0};
   };
-  std::shared_ptr<Call> call;
-  Completion completion;
-  try {
-    call = std::make_shared<Call>();
-    // Nothing here can fail, so the waiting caller is always released.
-    completion = [call](HTTPResult result) noexcept {
-      call->result = std::move(result);
-      call->done.release();
-    };
-  } catch (const std::bad_alloc&) {
-    return {std::nullopt, outOfMemory()};
-  }
-  start(std::move(request), std::move(completion));
+  auto call = std::make_shared<Call>();
+  start(std::move(request), [call](HTTPResult result) {
+    call->result = std::move(result);
+    call->done.release();
+  });
   call->done.acquire();
   return std::move(call->result);
+}
+
+void HTTPClient::stop() {
+  {
+    MutexLock lock(_mutex);
+    _stopped = true;
+  }
+  if (Worker* started = worker()) started->stop();
 }
 
 void HTTPClient::stopAllButPosts() {

@@ -13,6 +13,7 @@
 #include <utility>
 #include <vector>
 
+#include "platform/http/PostKeeper.h"
 #include "platform/sync/Mutex.h"
 
 namespace vesk {
@@ -21,8 +22,8 @@ struct HTTPRequest {
   /// Whether the client tries again if the transport fails without an answer.
   enum class Retry : unsigned char {
     Never,      ///< uploads and storebag fetches
-    UntilSent,  ///< posts: with growing, jittered waits, for at most 60 s and while fewer than 8 MiB
-                ///< wait; also if the server's certificate could not be verified
+    UntilSent,  ///< posts: with growing, jittered waits, also if the server's certificate could not be
+                ///< verified; for `Options::retryFor`, then the post goes to the keeper or fails
   };
 
   std::string method = "GET";
@@ -41,6 +42,11 @@ struct HTTPRequest {
   /// The user that the post belongs to, or kNobody. Owners take turns and share the memory for waiting posts.
   std::uint32_t owner = kNobody;
 
+  // What a keeper must know about a post.
+  std::string source;            ///< the backend that made it
+  std::uint32_t events = 1;      ///< the number of events that it holds
+  bool respectsConsent = false;  ///< deleted if the user withdraws consent before it is sent
+
   static constexpr std::uint32_t kNobody = 0xffffffff;
 };
 
@@ -52,6 +58,8 @@ struct HTTPResponse {
 
   /// The value of the first header with that name, ignoring case.
   std::optional<std::string_view> header(std::string_view name) const;
+  /// Whether the status says that the server can't do its work at the moment (429, 5xx).
+  bool isBusyOrBroken() const { return status == 429 || (status >= 500 && status <= 599); }
 };
 
 /// A failure of the transport: there is no complete answer.
@@ -70,6 +78,7 @@ struct HTTPError {
   };
   Kind kind = Kind::Other;
   std::string description;
+  bool deferred = false;  ///< the client's keeper has the post and sends it later
 };
 
 /// Without an error, there is a response. With an error, there is a response without a body if the server's
@@ -94,7 +103,10 @@ class HTTPClient {
     /// is reached, the owner with the most data waiting for a host loses posts to an owner with less.
     std::size_t maximumWaiting = std::size_t{8} << 20;
     std::size_t maximumMemory = std::size_t{64} << 20;  ///< limit in bytes for all waiting posts
-    std::chrono::milliseconds retryFor{60'000};         ///< from the first attempt of a post
+    /// Takes the posts that would otherwise be lost, also when the client ends. Null: they fail.
+    PostKeeper* keeper = nullptr;
+    /// From the first attempt of a post, or from its start for one that waits behind others.
+    std::chrono::milliseconds retryFor{60'000};
     std::chrono::milliseconds firstRetryAfter{200};     ///< doubles each time, up to 10 s, with ±50 % jitter
     std::chrono::milliseconds connectTimeout{15'000};
     /// A post without TCP acknowledgements for this long is sent again on another connection: after a change
@@ -111,8 +123,7 @@ class HTTPClient {
   /// use little memory.
   explicit HTTPClient(Options options);
   HTTPClient();
-  /// Fails outstanding requests with `Stopped`, running their completions, then ends the thread. Must not be
-  /// called from a completion.
+  /// Stops.
   ~HTTPClient();
   HTTPClient(const HTTPClient&) = delete;
   HTTPClient& operator=(const HTTPClient&) = delete;
@@ -125,9 +136,14 @@ class HTTPClient {
   HTTPResult perform(HTTPRequest request);
 
   /// From now on fails all requests except posts with the error `Stopped`, including new ones, so that a
-  /// server that hangs delays no one. Posts continue, and those waiting for a retry are tried immediately.
-  /// Doesn't block.
+  /// server that hangs delays no one. Posts continue. Those that wait for a host to come back go to the keeper,
+  /// or are tried immediately if there is none. Doesn't block.
   void stopAllButPosts();
+
+  /// Fails outstanding requests with `Stopped`, running their completions, and ends the thread. Posts go to the
+  /// keeper. From now on, requests fail in the same way within `start`. May be called more than once, but not
+  /// from a completion.
+  void stop();
 
   /// Waits up to `timeout` for all requests to end. Returns true if none is outstanding.
   [[nodiscard]] bool waitUntilIdle(std::chrono::milliseconds timeout);
@@ -135,12 +151,14 @@ class HTTPClient {
  private:
   class Worker;
   Worker* worker();
-  Worker& startedWorker();
+  /// Null after `stop`, if there was no worker.
+  Worker* startedWorker();
 
   const Options _options;
   const std::optional<std::string> _authorities;
   std::atomic<bool> _postsOnly{false};
   Mutex _mutex;
+  bool _stopped VESK_GUARDED_BY(_mutex) = false;
   std::unique_ptr<Worker> _worker VESK_GUARDED_BY(_mutex);
 };
 

@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <exception>
-#include <new>
 #include <string>
 
 #include "platform/log/LogUser.h"
@@ -56,7 +55,7 @@ bool HTTPOutstanding::waitUntilNone(std::chrono::milliseconds timeout) {
 }
 
 HTTPExchange::HTTPExchange(HTTPRequest&& wanted, HTTPClient::Completion&& completion, Instant now,
-                           HTTPOutstanding& outstanding) noexcept
+                           HTTPOutstanding& outstanding)
     : request(std::move(wanted)),
       started(now),
       _cost(costOf(request)),
@@ -67,39 +66,40 @@ HTTPExchange::HTTPExchange(HTTPRequest&& wanted, HTTPClient::Completion&& comple
 }
 
 HTTPExchange::~HTTPExchange() {
-  if (_completion) fail(httpError(HTTPError::Kind::Other, "the client could not take the request"));
+  if (_completion) fail({HTTPError::Kind::Other, "the client could not take the request"});
   _outstanding.remove();
 }
 
-std::string_view HTTPExchange::host() const noexcept {
-  std::string_view url = request.url;
+std::string_view hostOfURL(std::string_view url) {
   auto scheme = url.find("://");
   if (scheme == std::string_view::npos) return url;
   return url.substr(0, url.find_first_of("/?#", scheme + 3));
 }
 
-void HTTPExchange::complete(HTTPResult result) noexcept {
+void HTTPExchange::giveUp(HTTPError error, PostKeeper* keeper, std::chrono::seconds delay) {
+  if (keeper && ticket != 0) {
+    keeper->sendLater(std::exchange(ticket, 0), delay);
+    error.deferred = true;
+  } else if (keeper && isPost()) {
+    error.deferred = keeper->keep(std::move(request), delay);
+  }
+  fail(std::move(error));
+}
+
+void HTTPExchange::complete(HTTPResult result) {
   // The captures are destroyed here, still on behalf of the user.
   LogUser onBehalfOf(_user);
   auto completion = std::exchange(_completion, nullptr);
   if (completion) runCompletion(completion, std::move(result));
 }
 
-void runCompletion(const HTTPClient::Completion& completion, HTTPResult result) noexcept {
+void runCompletion(const HTTPClient::Completion& completion, HTTPResult result) {
   try {
     completion(std::move(result));
   } catch (const std::exception& error) {
     VESK_LOG_ERROR("HTTPClient: a completion failed: %s", error.what());
   } catch (...) {
     VESK_LOG_ERROR("HTTPClient: a completion failed");
-  }
-}
-
-HTTPError httpError(HTTPError::Kind kind, std::string_view description) noexcept {
-  try {
-    return {kind, std::string(description)};
-  } catch (const std::bad_alloc&) {
-    return {kind, "out of memory"};  // short enough to need no allocation
   }
 }
 

@@ -14,6 +14,12 @@
 
 namespace vesk {
 
+/// The least wait before a post is sent again that the server may have received whole, and may be processing.
+inline constexpr std::chrono::seconds kWaitAfterWholeBody{30};
+
+/// Scheme, host and port as written in the URL.
+std::string_view hostOfURL(std::string_view url);
+
 /// Counts the exchanges. Thread-safe.
 class HTTPOutstanding {
  public:
@@ -39,28 +45,31 @@ class HTTPExchange {
 
   /// Counted by `outstanding`, which must outlive it, until the completion's captures are destroyed.
   HTTPExchange(HTTPRequest&& wanted, HTTPClient::Completion&& completion, Instant now,
-               HTTPOutstanding& outstanding) noexcept;
+               HTTPOutstanding& outstanding);
   ~HTTPExchange();
   HTTPExchange(const HTTPExchange&) = delete;
   HTTPExchange& operator=(const HTTPExchange&) = delete;
 
-  bool isPost() const noexcept { return request.retry == HTTPRequest::Retry::UntilSent; }
+  bool isPost() const { return request.retry == HTTPRequest::Retry::UntilSent; }
   /// Scheme, host and port as written in the URL.
-  std::string_view host() const noexcept;
+  std::string_view host() const { return hostOfURL(request.url); }
   /// The time limit of a request that is not retried.
-  Instant deadline() const noexcept { return started + request.timeout; }
-  std::size_t bodySize() const noexcept { return request.body.size(); }
+  Instant deadline() const { return started + request.timeout; }
+  std::size_t bodySize() const { return request.body.size(); }
   /// Approximate memory that it uses while it waits.
-  std::size_t cost() const noexcept { return _cost; }
+  std::size_t cost() const { return _cost; }
 
-  void complete(HTTPResult result) noexcept;
-  void fail(HTTPError error) noexcept { complete(HTTPResult{std::nullopt, std::move(error)}); }
+  void complete(HTTPResult result);
+  void fail(HTTPError error) { complete(HTTPResult{std::nullopt, std::move(error)}); }
+  /// Fails it. A post goes to `keeper` first, if there is one, to be sent after `delay` at the earliest.
+  void giveUp(HTTPError error, PostKeeper* keeper, std::chrono::seconds delay = std::chrono::seconds(0));
 
   HTTPRequest request;
   const Instant started;
   Instant firstAttempt{};  ///< valid if `attempts` is not 0
   unsigned attempts = 0;
-  std::unique_ptr<HTTPExchange> next;  ///< in its queue
+  bool hasCopy = false;           ///< the keeper was given a copy, which it may have refused
+  PostKeeper::Ticket ticket = 0;  ///< of the copy that the keeper holds; 0 if there is none
 
  private:
   const std::size_t _cost;
@@ -70,12 +79,9 @@ class HTTPExchange {
 };
 
 /// Runs the completion and logs its exceptions.
-void runCompletion(const HTTPClient::Completion& completion, HTTPResult result) noexcept;
+void runCompletion(const HTTPClient::Completion& completion, HTTPResult result);
 
-/// Creates an error. If memory runs out, its description becomes a short one.
-HTTPError httpError(HTTPError::Kind kind, std::string_view description) noexcept;
-inline HTTPError outOfMemory() noexcept { return httpError(HTTPError::Kind::OutOfMemory, "out of memory"); }
-inline HTTPError stopped() noexcept { return httpError(HTTPError::Kind::Stopped, "the client was stopped"); }
+inline HTTPError stopped() { return {HTTPError::Kind::Stopped, "the client was stopped"}; }
 
 /// Removes, and logs, headers that could break the request's framing.
 void removeUnsafeHeaders(HTTPRequest& request);

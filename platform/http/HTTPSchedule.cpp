@@ -1,7 +1,6 @@
 #include "platform/http/HTTPSchedule.h"
 
 #include <algorithm>
-#include <new>
 #include <utility>
 
 #include "platform/log/SystemLog.h"
@@ -11,70 +10,60 @@ namespace vesk {
 namespace {
 constexpr std::chrono::seconds kLongestWait{10};
 constexpr char kTooMany[] = "too many posts wait to be sent";
-
-/// Whether other posts to the same host would fail in the same way.
-bool isOfTheHost(const HTTPError& error) {
-  using Kind = HTTPError::Kind;
-  return error.kind != Kind::BadURL && error.kind != Kind::OutOfMemory;
-}
 }  // namespace
 
 HTTPSchedule::HTTPSchedule(const HTTPClient::Options& options)
     : _policy{options.retryFor, options.firstRetryAfter, kLongestWait},
+      _keeper(options.keeper),
       _maximumWaiting(options.maximumWaiting),
       _maximumMemory(options.maximumMemory),
       _maximumActive(std::max<std::size_t>(options.maximumConnectionsPerHost, 1)),
       _maximumActivePosts(std::max<std::size_t>(_maximumActive - 1, 1)),
       _random(std::random_device{}()) {}
 
-void HTTPSchedule::add(Exchange exchange) noexcept {
-  Host* host = hostFor(*exchange);
-  if (!host) {
-    exchange->fail(outOfMemory());
-    return;
-  }
+void HTTPSchedule::add(Exchange exchange) {
+  auto [entry, isNew] = _hosts.try_emplace(std::string(exchange->host()));
+  Host& host = entry->second;
+  if (isNew) host.lastAnswer = exchange->started;
   if (!exchange->isPost()) {
-    host->requests.pushBack(std::move(exchange));
+    host.requests.push_back(std::move(exchange));
     return;
   }
-  Lane& lane = laneOf(*host, *exchange);
+  Lane& lane = host.lanes[exchange->request.owner];
   // If no other attempt will show whether the host is back, this post does not wait.
-  const bool mustWait = host->outage && host->activePosts + host->queuedPosts > 0;
-  if (mustWait && !makeRoom(waitingBodies, *host, lane, exchange->bodySize(), _maximumWaiting)) {
-    exchange->fail(httpError(host->outage->kind, host->outage->description));
-  } else if (!makeRoom(memory, *host, lane, exchange->cost(), _maximumMemory)) {
-    exchange->fail(httpError(HTTPError::Kind::Other, kTooMany));
+  const bool mustWait = host.outage && host.activePosts + host.queuedPosts > 0;
+  if (mustWait && !makeRoom(waitingBodies, host, lane, exchange->bodySize(), _maximumWaiting)) {
+    giveUp(std::move(exchange), *host.outage);
+  } else if (!makeRoom(memory, host, lane, exchange->cost(), _maximumMemory)) {
+    giveUp(std::move(exchange), {HTTPError::Kind::Other, kTooMany});
   } else {
     lane.bodies += exchange->bodySize();
     lane.cost += exchange->cost();
-    lane.posts.pushBack(std::move(exchange));
-    ++host->queuedPosts;
+    lane.posts.push_back(std::move(exchange));
+    ++host.queuedPosts;
   }
 }
 
-void HTTPSchedule::advance(Instant now) noexcept {
+void HTTPSchedule::advance(Instant now) {
   while (!_retries.empty() && _retries.begin()->first <= now) {
     Host& host = hostOf(*_retries.begin()->second);
     queueFirst(host, std::move(_retries.extract(_retries.begin()).mapped()));
   }
   for (auto& [name, host] : _hosts) {
-    HTTPQueue inTime;
-    while (auto request = host.requests.pop()) {
-      if (request->deadline() > now) {
-        inTime.pushBack(std::move(request));
-      } else {
-        request->fail(httpError(HTTPError::Kind::Timeout, "timed out before a connection was free"));
-      }
-    }
-    host.requests.swap(inTime);
+    std::erase_if(host.requests, [now](Exchange& request) {
+      if (request->deadline() > now) return false;
+      request->fail({HTTPError::Kind::Timeout, "timed out before a connection was free"});
+      return true;
+    });
+    if (_keeper) giveUpLate(host, now);
   }
   std::erase_if(_hosts, isUnused);
 }
 
-HTTPSchedule::Exchange HTTPSchedule::next(Instant now) noexcept {
+HTTPSchedule::Exchange HTTPSchedule::next(Instant now) {
   for (auto& [name, host] : _hosts) {
     if (host.active >= _maximumActive) continue;
-    Exchange exchange = host.requests.pop();
+    Exchange exchange = takeFirst(host.requests);
     if (!exchange && host.activePosts < _maximumActivePosts && (exchange = takePost(host))) {
       ++host.activePosts;
     }
@@ -86,9 +75,10 @@ HTTPSchedule::Exchange HTTPSchedule::next(Instant now) noexcept {
   return nullptr;
 }
 
-void HTTPSchedule::answered(const HTTPExchange& exchange) noexcept {
+void HTTPSchedule::answered(const HTTPExchange& exchange, Instant now) {
   Host& host = hostOf(exchange);
   release(host, exchange);
+  host.lastAnswer = now;
   if (!host.outage) return;
   VESK_LOG_INFO("HTTPClient: %.*s answers again", static_cast<int>(exchange.host().size()),
                 exchange.host().data());
@@ -96,84 +86,96 @@ void HTTPSchedule::answered(const HTTPExchange& exchange) noexcept {
   bringBack(host);
 }
 
-void HTTPSchedule::failed(Exchange exchange, HTTPError error, bool mayRetry, Instant now) noexcept {
+void HTTPSchedule::failed(Exchange exchange, Failure failure, Instant now) {
   Host& host = hostOf(*exchange);
   release(host, *exchange);
-  if (exchange->isPost() && isOfTheHost(error)) beginOutage(host, *exchange, error, now);
-  if (mayRetry && exchange->isPost() && keepForRetry(host, exchange, now)) return;
-  exchange->fail(std::move(error));
-}
-
-void HTTPSchedule::stopAllButPosts() noexcept {
-  for (auto& [name, host] : _hosts) {
-    while (auto request = host.requests.pop()) request->fail(stopped());
+  if (exchange->isPost() && failure.error.kind != HTTPError::Kind::BadURL) {
+    noteOutage(host, *exchange, failure.error);
+    // A few attempts fill the slots of a host that swallows connections; posts behind them would wait for ever.
+    if (exchange->firstAttempt + _policy.retryFor <= now) giveUpLate(host, now);
+  }
+  if (failure.mayRetry && exchange->isPost() && keepForRetry(host, exchange, failure.wasSentWhole, now)) return;
+  if (failure.mayKeep) {
+    exchange->giveUp(std::move(failure.error), _keeper,
+                     failure.wasSentWhole ? kWaitAfterWholeBody : std::chrono::seconds(0));
+  } else {
+    if (exchange->ticket != 0) _keeper->discard(exchange->ticket);
+    exchange->fail(std::move(failure.error));
   }
 }
 
-void HTTPSchedule::retryNow() noexcept {
-  for (auto& [name, host] : _hosts) bringBack(host);
+void HTTPSchedule::stopAllButPosts() {
+  for (auto& [name, host] : _hosts) {
+    while (auto request = takeFirst(host.requests)) request->fail(stopped());
+  }
+  if (std::exchange(_ending, true)) return;
+  for (auto& [name, host] : _hosts) {
+    bringBack(host);
+    if (!_keeper || !host.outage) continue;
+    while (auto post = takePost(host)) giveUp(std::move(post), *host.outage);
+  }
 }
 
-void HTTPSchedule::stopAll() noexcept {
+void HTTPSchedule::stopAll() {
   stopAllButPosts();
   for (auto& [name, host] : _hosts) {
-    while (auto post = takePost(host)) post->fail(stopped());
+    bringBack(host);
+    while (auto post = takePost(host)) giveUp(std::move(post), stopped());
   }
-  for (auto& [time, post] : _retries) post->fail(stopped());
   _hosts.clear();
-  _retries.clear();
 }
 
-std::optional<HTTPSchedule::Instant> HTTPSchedule::nextAdvance() const noexcept {
+std::optional<HTTPSchedule::Instant> HTTPSchedule::nextAdvance() const {
   std::optional<Instant> next;
-  auto consider = [&next](Instant time) {
-    if (!next || time < *next) next = time;
+  auto consider = [&next](std::optional<Instant> time) {
+    if (time && (!next || *time < *next)) next = time;
   };
   if (!_retries.empty()) consider(_retries.begin()->first);
   for (const auto& [name, host] : _hosts) {
-    const HTTPExchange* request = host.requests.front();
-    for (; request; request = request->next.get()) consider(request->deadline());
+    for (const auto& request : host.requests) consider(request->deadline());
+    if (!_keeper) continue;
+    for (const auto& [owner, lane] : host.lanes) {
+      if (!lane.posts.empty()) consider(endOfWait(host, *lane.posts.front()));
+    }
   }
   return next;
 }
 
-std::size_t HTTPSchedule::memory(const Host&, const Lane& lane) noexcept { return lane.cost; }
+std::size_t HTTPSchedule::memory(const Host&, const Lane& lane) { return lane.cost; }
 
-std::size_t HTTPSchedule::waitingBodies(const Host& host, const Lane& lane) noexcept {
+std::size_t HTTPSchedule::waitingBodies(const Host& host, const Lane& lane) {
   return host.outage ? lane.bodies : 0;
 }
 
-bool HTTPSchedule::isUnused(const Hosts::value_type& entry) noexcept {
+bool HTTPSchedule::isUnused(const Hosts::value_type& entry) {
   const Host& host = entry.second;
   return host.active == 0 && host.requests.empty() &&
          std::all_of(host.lanes.begin(), host.lanes.end(),
                      [](const auto& lane) { return lane.second.cost == 0; });
 }
 
-HTTPSchedule::Host* HTTPSchedule::hostFor(const HTTPExchange& exchange) noexcept try {
-  auto found = _hosts.find(exchange.host());
-  if (found == _hosts.end()) found = _hosts.try_emplace(std::string(exchange.host())).first;
-  if (exchange.isPost()) found->second.lanes.try_emplace(exchange.request.owner);
-  return &found->second;
-} catch (const std::bad_alloc&) {
-  return nullptr;
+HTTPSchedule::Exchange HTTPSchedule::takeFirst(Queue& queue) {
+  if (queue.empty()) return nullptr;
+  Exchange first = std::move(queue.front());
+  queue.pop_front();
+  return first;
 }
 
-HTTPSchedule::Host& HTTPSchedule::hostOf(const HTTPExchange& exchange) noexcept {
+HTTPSchedule::Host& HTTPSchedule::hostOf(const HTTPExchange& exchange) {
   return _hosts.find(exchange.host())->second;
 }
 
-HTTPSchedule::Lane& HTTPSchedule::laneOf(Host& host, const HTTPExchange& exchange) noexcept {
-  return host.lanes.find(exchange.request.owner)->second;
+HTTPSchedule::Lane& HTTPSchedule::laneOf(Host& host, const HTTPExchange& exchange) {
+  return host.lanes[exchange.request.owner];
 }
 
-void HTTPSchedule::queueFirst(Host& host, Exchange post) noexcept {
+void HTTPSchedule::queueFirst(Host& host, Exchange post) {
   Lane& lane = laneOf(host, *post);
-  lane.posts.pushFront(std::move(post));
+  lane.posts.push_front(std::move(post));
   ++host.queuedPosts;
 }
 
-HTTPSchedule::Exchange HTTPSchedule::takePost(Host& host) noexcept {
+HTTPSchedule::Exchange HTTPSchedule::takePost(Host& host) {
   auto lane = host.lanes.upper_bound(host.lastServed);
   for (std::size_t i = 0; i < host.lanes.size(); ++i, ++lane) {
     if (lane == host.lanes.end()) lane = host.lanes.begin();
@@ -184,8 +186,8 @@ HTTPSchedule::Exchange HTTPSchedule::takePost(Host& host) noexcept {
   return nullptr;
 }
 
-HTTPSchedule::Exchange HTTPSchedule::takePost(Host& host, Lane& lane) noexcept {
-  Exchange post = lane.posts.pop();
+HTTPSchedule::Exchange HTTPSchedule::takePost(Host& host, Lane& lane) {
+  Exchange post = takeFirst(lane.posts);
   if (!post) return nullptr;
   --host.queuedPosts;
   lane.bodies -= post->bodySize();
@@ -194,8 +196,8 @@ HTTPSchedule::Exchange HTTPSchedule::takePost(Host& host, Lane& lane) noexcept {
 }
 
 // Waits are spread to spare servers with many devices. One device's posts resume immediately, oldest first.
-void HTTPSchedule::bringBack(Host& host) noexcept {
-  Retries back;
+void HTTPSchedule::bringBack(Host& host) {
+  std::multimap<Instant, Exchange> back;
   for (auto each = _retries.begin(); each != _retries.end();) {
     auto retry = each++;
     if (&hostOf(*retry->second) != &host) continue;
@@ -207,7 +209,7 @@ void HTTPSchedule::bringBack(Host& host) noexcept {
 }
 
 bool HTTPSchedule::makeRoom(Measure measure, const Host& host, const Lane& lane, std::size_t size,
-                            std::size_t bound) noexcept {
+                            std::size_t bound) {
   for (;;) {
     std::size_t all = 0;
     std::size_t most = 0;
@@ -225,45 +227,55 @@ bool HTTPSchedule::makeRoom(Measure measure, const Host& host, const Lane& lane,
     }
     if (all + size <= bound) return true;
     if (!fullest || measure(host, lane) + size > most) return false;
-    dropOne(*hostOfFullest, *fullest);
+    giveUpOne(*hostOfFullest, *fullest);
   }
 }
 
-void HTTPSchedule::dropOne(Host& host, Lane& lane) noexcept {
-  Exchange dropped = takePost(host, lane);
-  for (auto each = _retries.begin(); !dropped; ++each) {
+void HTTPSchedule::giveUpOne(Host& host, Lane& lane) {
+  Exchange post = takePost(host, lane);
+  for (auto each = _retries.begin(); !post; ++each) {
     if (&laneOf(hostOf(*each->second), *each->second) != &lane) continue;
-    dropped = std::move(_retries.extract(each).mapped());
-    lane.bodies -= dropped->bodySize();
-    lane.cost -= dropped->cost();
+    post = std::move(_retries.extract(each).mapped());
+    lane.bodies -= post->bodySize();
+    lane.cost -= post->cost();
     break;
   }
-  dropped->fail(host.outage ? httpError(host.outage->kind, host.outage->description)
-                            : httpError(HTTPError::Kind::Other, kTooMany));
+  giveUp(std::move(post), host.outage ? *host.outage : HTTPError{HTTPError::Kind::Other, kTooMany});
 }
 
-void HTTPSchedule::release(Host& host, const HTTPExchange& exchange) noexcept {
-  --host.active;
-  if (exchange.isPost()) --host.activePosts;
+// A host that was not heard of for so long, although all its connections are in use, counts as one in an outage.
+std::optional<HTTPSchedule::Instant> HTTPSchedule::endOfWait(const Host& host, const HTTPExchange& post) const {
+  if (!host.outage && host.activePosts < _maximumActivePosts) return std::nullopt;
+  return (host.outage ? post.started : std::max(post.started, host.lastAnswer)) + _policy.retryFor;
 }
 
-void HTTPSchedule::beginOutage(Host& host, const HTTPExchange& exchange, const HTTPError& error,
-                               Instant now) noexcept {
-  if (!host.outage) {
-    VESK_LOG_INFO("HTTPClient: no answer from %.*s: %s", static_cast<int>(exchange.host().size()),
-                  exchange.host().data(), error.description.c_str());
-  }
-  host.outage = httpError(error.kind, error.description);
-  if (exchange.firstAttempt + _policy.retryFor > now) return;
-  // A few attempts fill the slots of a host that swallows connections; posts behind them would wait for ever.
+void HTTPSchedule::giveUpLate(Host& host, Instant now) {
   for (auto& [owner, lane] : host.lanes) {
-    while (!lane.posts.empty() && lane.posts.front()->started + _policy.retryFor <= now) {
-      takePost(host, lane)->fail(httpError(error.kind, error.description));
+    while (!lane.posts.empty()) {
+      const auto end = endOfWait(host, *lane.posts.front());
+      if (!end || *end > now) break;
+      giveUp(takePost(host, lane),
+             host.outage ? *host.outage : HTTPError{HTTPError::Kind::Timeout, "the server does not answer"});
     }
   }
 }
 
-bool HTTPSchedule::keepForRetry(Host& host, Exchange& exchange, Instant now) noexcept try {
+void HTTPSchedule::release(Host& host, const HTTPExchange& exchange) {
+  --host.active;
+  if (exchange.isPost()) --host.activePosts;
+}
+
+void HTTPSchedule::noteOutage(Host& host, const HTTPExchange& exchange, const HTTPError& error) {
+  if (!host.outage) {
+    VESK_LOG_INFO("HTTPClient: no answer from %.*s: %s", static_cast<int>(exchange.host().size()),
+                  exchange.host().data(), error.description.c_str());
+  }
+  host.outage = error;
+}
+
+bool HTTPSchedule::keepForRetry(Host& host, Exchange& exchange, bool wasSentWhole, Instant now) {
+  // What the keeper has, or can have, need not wait here.
+  if (_keeper && (_ending || exchange->ticket != 0 || wasSentWhole)) return false;
   const double random = std::uniform_real_distribution<double>()(_random);
   auto wait = _policy.waitAfter(exchange->attempts, exchange->firstAttempt, now, random);
   Lane& lane = laneOf(host, *exchange);
@@ -271,13 +283,10 @@ bool HTTPSchedule::keepForRetry(Host& host, Exchange& exchange, Instant now) noe
       !makeRoom(memory, host, lane, exchange->cost(), _maximumMemory)) {
     return false;
   }
-  Exchange& kept = _retries.emplace(now + *wait, nullptr)->second;
   lane.bodies += exchange->bodySize();
   lane.cost += exchange->cost();
-  kept = std::move(exchange);
+  _retries.emplace(now + *wait, std::move(exchange));
   return true;
-} catch (const std::bad_alloc&) {
-  return false;
 }
 
 }  // namespace vesk

@@ -3,111 +3,126 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <deque>
 #include <map>
+#include <memory>
 #include <optional>
 #include <random>
 #include <string>
 #include <string_view>
 
 #include "platform/http/HTTPExchange.h"
-#include "platform/http/HTTPQueue.h"
 #include "platform/http/RetryPolicy.h"
 
 namespace vesk {
 
-/// Owns every exchange that is not being transferred. Completes an exchange with an error as soon as it is
-/// abandoned. Used only by the client's thread; doesn't read a clock. Abandons an exchange if it runs out of
-/// memory for it.
+/// Owns every exchange that is not being transferred. Gives an exchange up, to the keeper if it is a post, as
+/// soon as it may not wait any longer. Used only by the client's thread; doesn't read a clock.
 class HTTPSchedule {
  public:
   using Instant = HTTPExchange::Instant;
-  using Exchange = HTTPQueue::Exchange;
+  using Exchange = std::unique_ptr<HTTPExchange>;
+
+  /// The outcome of an attempt that was not answered.
+  struct Failure {
+    HTTPError error;
+    bool mayRetry = false;      ///< another attempt may succeed
+    bool mayKeep = false;       ///< another attempt may succeed, perhaps much later
+    bool wasSentWhole = false;  ///< the server may be processing it
+  };
 
   explicit HTTPSchedule(const HTTPClient::Options& options);
 
-  /// Queues a new exchange, or abandons it at once if too much is waiting already.
-  void add(Exchange exchange) noexcept;
+  /// Queues a new exchange, or gives it up at once if too much is waiting already.
+  void add(Exchange exchange);
 
-  /// Resumes the posts whose wait is over, abandons queued requests whose time is up, and forgets hosts
+  /// Resumes the posts whose wait is over, gives up queued requests whose time is up, and forgets hosts
   /// without requests.
-  void advance(Instant now) noexcept;
+  void advance(Instant now);
 
   /// The next exchange for which a connection is free, or null. It counts against its host's limit until
   /// `answered` or `failed` is called with it.
-  Exchange next(Instant now) noexcept;
+  Exchange next(Instant now);
 
-  void answered(const HTTPExchange& exchange) noexcept;
+  void answered(const HTTPExchange& exchange, Instant now);
+  /// Keeps the exchange if it may be retried and the retry policy allows another attempt; otherwise gives it
+  /// up.
+  void failed(Exchange exchange, Failure failure, Instant now);
 
-  /// The transport failed. Keeps the exchange if `mayRetry` is set and the retry policy allows another
-  /// attempt; otherwise abandons it.
-  void failed(Exchange exchange, HTTPError error, bool mayRetry, Instant now) noexcept;
-
-  /// Fails all waiting requests except posts with the error `Stopped`.
-  void stopAllButPosts() noexcept;
-  /// Ends the waits of all posts that wait for a retry.
-  void retryNow() noexcept;
-  /// Fails everything that waits with `Stopped`.
-  void stopAll() noexcept;
+  /// Fails all waiting requests except posts with the error `Stopped`. Posts that wait for a host to come back
+  /// go to the keeper; without one, they are tried immediately. From now on a post is retried only if there is
+  /// no keeper.
+  void stopAllButPosts();
+  /// Gives up everything that waits with `Stopped`.
+  void stopAll();
 
   /// The time at which `advance` is due; nullopt if only external events can change anything.
-  std::optional<Instant> nextAdvance() const noexcept;
+  std::optional<Instant> nextAdvance() const;
 
  private:
-  /// An owner's posts to a host. Kept as long as the host, so that a post can always return to it.
+  using Queue = std::deque<Exchange>;
+  /// An owner's posts to a host.
   struct Lane {
-    HTTPQueue posts;
+    Queue posts;
     std::size_t bodies = 0;  ///< bytes of the posts in `posts` and `_retries`
     std::size_t cost = 0;    ///< approximate memory of the same posts
   };
   /// During an outage, the host's posts wait in `_retries`.
   struct Host {
-    HTTPQueue requests;
+    Queue requests;
     std::map<std::uint32_t, Lane> lanes;  ///< by owner
     std::uint32_t lastServed = 0;         ///< owner
     std::size_t queuedPosts = 0;
     std::size_t active = 0;
     std::size_t activePosts = 0;
     std::optional<HTTPError> outage;  ///< the last attempt's error, until an answer arrives
+    Instant lastAnswer;               ///< or when the host got its first request
   };
   using Hosts = std::map<std::string, Host, std::less<>>;
   using Retries = std::multimap<Instant, Exchange>;
-  using Measure = std::size_t (*)(const Host&, const Lane&) noexcept;
+  using Measure = std::size_t (*)(const Host&, const Lane&);
 
-  static std::size_t memory(const Host& host, const Lane& lane) noexcept;
+  static std::size_t memory(const Host& host, const Lane& lane);
   /// Bytes of bodies that wait for the host to come back.
-  static std::size_t waitingBodies(const Host& host, const Lane& lane) noexcept;
-  static bool isUnused(const Hosts::value_type& entry) noexcept;
+  static std::size_t waitingBodies(const Host& host, const Lane& lane);
+  static bool isUnused(const Hosts::value_type& entry);
+  static Exchange takeFirst(Queue& queue);
 
-  /// Also creates the lane for a post. Returns null if out of memory.
-  Host* hostFor(const HTTPExchange& exchange) noexcept;
   /// For an exchange that the schedule has accepted.
-  Host& hostOf(const HTTPExchange& exchange) noexcept;
-  static Lane& laneOf(Host& host, const HTTPExchange& exchange) noexcept;
+  Host& hostOf(const HTTPExchange& exchange);
+  static Lane& laneOf(Host& host, const HTTPExchange& exchange);
 
   /// The post must already be counted in its lane.
-  static void queueFirst(Host& host, Exchange post) noexcept;
+  static void queueFirst(Host& host, Exchange post);
   /// Returns null if no post is queued.
-  static Exchange takePost(Host& host) noexcept;
-  static Exchange takePost(Host& host, Lane& lane) noexcept;
-  void bringBack(Host& host) noexcept;
+  static Exchange takePost(Host& host);
+  static Exchange takePost(Host& host, Lane& lane);
+  void bringBack(Host& host);
 
-  /// Whether `size` more bytes fit within `bound`, after dropping posts from fuller lanes if necessary.
-  bool makeRoom(Measure measure, const Host& host, const Lane& lane, std::size_t size,
-                std::size_t bound) noexcept;
-  void dropOne(Host& host, Lane& lane) noexcept;
+  /// Whether `size` more bytes fit within `bound`, after giving up posts from fuller lanes if necessary.
+  bool makeRoom(Measure measure, const Host& host, const Lane& lane, std::size_t size, std::size_t bound);
+  void giveUpOne(Host& host, Lane& lane);
+  void giveUp(Exchange exchange, HTTPError error) { exchange->giveUp(std::move(error), _keeper); }
 
-  void release(Host& host, const HTTPExchange& exchange) noexcept;
-  void beginOutage(Host& host, const HTTPExchange& exchange, const HTTPError& error, Instant now) noexcept;
+  /// The time at which a queued post has waited too long for a host that doesn't answer; nullopt if it may wait.
+  std::optional<Instant> endOfWait(const Host& host, const HTTPExchange& post) const;
+  /// Gives up the queued posts that waited too long for the host.
+  void giveUpLate(Host& host, Instant now);
+
+  void release(Host& host, const HTTPExchange& exchange);
+  static void noteOutage(Host& host, const HTTPExchange& exchange, const HTTPError& error);
   /// Returns true if it took `exchange` for a retry.
-  bool keepForRetry(Host& host, Exchange& exchange, Instant now) noexcept;
+  bool keepForRetry(Host& host, Exchange& exchange, bool wasSentWhole, Instant now);
 
   const RetryPolicy _policy;
+  PostKeeper* const _keeper;
   const std::size_t _maximumWaiting;
   const std::size_t _maximumMemory;
   const std::size_t _maximumActive;
   const std::size_t _maximumActivePosts;
   std::minstd_rand _random;
 
+  bool _ending = false;
   Hosts _hosts;
   Retries _retries;
 };

@@ -6,7 +6,6 @@
 
 #include <algorithm>
 #include <chrono>
-#include <cstdio>
 #include <new>
 
 #include "platform/text/ASCII.h"
@@ -19,9 +18,11 @@ using Kind = HTTPError::Kind;
 
 constexpr std::size_t kMaximumHeaders = std::size_t{256} << 10;  // bytes of an answer's header lines
 
+[[noreturn]] void outOfMemory() { throw std::bad_alloc(); }
+
 template <class Value>
 void set(CURL* easy, CURLoption option, Value value) {
-  if (curl_easy_setopt(easy, option, value) == CURLE_OUT_OF_MEMORY) throw std::bad_alloc();
+  if (curl_easy_setopt(easy, option, value) == CURLE_OUT_OF_MEMORY) outOfMemory();
 }
 
 bool startsWithScheme(std::string_view url, std::string_view scheme) {
@@ -124,7 +125,7 @@ HTTPTransfer::HTTPTransfer(const HTTPClient::Options& options, const std::option
       _connectTimeout(static_cast<long>(options.connectTimeout.count())),
       _acknowledgedWithin(options.acknowledgedWithin),
       _easy(curl_easy_init()) {
-  if (!_easy) throw std::bad_alloc();
+  if (!_easy) outOfMemory();
   CURL* easy = _easy.get();
   set(easy, CURLOPT_NOSIGNAL, 1L);
   set(easy, CURLOPT_PROTOCOLS_STR, "http,https");
@@ -153,11 +154,11 @@ std::optional<HTTPError> HTTPTransfer::prepare(std::unique_ptr<HTTPExchange>& ex
                                                HTTPExchange::Instant now) {
   const HTTPRequest& request = exchange->request;
   if (!startsWithScheme(request.url, "http://") && !startsWithScheme(request.url, "https://")) {
-    return httpError(Kind::BadURL, "not an http or https URL");
+    return HTTPError{Kind::BadURL, "not an http or https URL"};
   }
   _response = {};
   _headerBytes = 0;
-  _answered = _tooLarge = _outOfMemory = false;
+  _answered = _tooLarge = false;
   _errorText[0] = '\0';
 
   set(handle(), CURLOPT_URL, request.url.c_str());
@@ -214,14 +215,15 @@ void HTTPTransfer::setTimes(const HTTPExchange& exchange, HTTPExchange::Instant 
   set(handle(), CURLOPT_CONNECTTIMEOUT_MS, std::clamp<long>(_connectTimeout, 1, limit));
 }
 
-HTTPTransfer::Outcome HTTPTransfer::finish(CURLcode code) noexcept {
+HTTPTransfer::Outcome HTTPTransfer::finish(CURLcode code) {
   Outcome outcome;
-  outcome.answered = _answered;
-  if (code == CURLE_OK) {
-    outcome.answered = true;
-  } else {
+  outcome.answered = _answered || code == CURLE_OK;
+  if (!outcome.answered) {
+    outcome.failure = failureFrom(code);
+    return outcome;
+  }
+  if (code != CURLE_OK) {
     outcome.result.error = errorFrom(code);
-    outcome.mayRetry = !_answered && passes(code, handle());
     _response.body.clear();
   }
   curl_easy_getinfo(handle(), CURLINFO_RESPONSE_CODE, &_response.status);
@@ -230,26 +232,29 @@ HTTPTransfer::Outcome HTTPTransfer::finish(CURLcode code) noexcept {
   return outcome;
 }
 
-HTTPError HTTPTransfer::errorFrom(CURLcode code) const noexcept {
-  if (_outOfMemory) return outOfMemory();
-  if (_tooLarge) {
-    char text[64];
-    std::snprintf(text, sizeof text, "the answer is longer than %zu bytes", _maximumBody);
-    return httpError(Kind::TooLarge, text);
-  }
-  return httpError(kindOf(code), _errorText[0] ? _errorText : curl_easy_strerror(code));
+HTTPSchedule::Failure HTTPTransfer::failureFrom(CURLcode code) const {
+  HTTPSchedule::Failure failure{.error = errorFrom(code), .mayRetry = passes(code, handle())};
+  const Kind kind = failure.error.kind;
+  failure.mayKeep = kind != Kind::BadURL && kind != Kind::OutOfMemory && kind != Kind::TooLarge;
+  curl_off_t sent = 0;
+  curl_easy_getinfo(handle(), CURLINFO_SIZE_UPLOAD_T, &sent);
+  failure.wasSentWhole = !_exchange->request.body.empty() &&
+                         static_cast<std::size_t>(sent) >= _exchange->request.body.size();
+  return failure;
 }
 
-// An exception thrown through libcurl would leave all of its transfers inside a callback for ever.
+HTTPError HTTPTransfer::errorFrom(CURLcode code) const {
+  if (_tooLarge) {
+    return {Kind::TooLarge, "the answer is longer than " + std::to_string(_maximumBody) + " bytes"};
+  }
+  return {kindOf(code), _errorText[0] ? _errorText : curl_easy_strerror(code)};
+}
+
+// An exception must not pass through libcurl, which is written in C.
 template <HTTPTransfer::Add add>
 std::size_t HTTPTransfer::receive(char* bytes, std::size_t size, std::size_t count, void* transfer) noexcept {
   auto* self = static_cast<HTTPTransfer*>(transfer);
-  try {
-    return (self->*add)({bytes, size * count}) ? size * count : 0;
-  } catch (const std::bad_alloc&) {
-    self->_outOfMemory = true;
-    return 0;
-  }
+  return (self->*add)({bytes, size * count}) ? size * count : 0;
 }
 
 // Only for posts, which are sent again. Other requests should use their whole timeout.

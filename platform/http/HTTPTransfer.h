@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "platform/http/HTTPExchange.h"
+#include "platform/http/HTTPSchedule.h"
 
 namespace vesk {
 
@@ -36,24 +37,25 @@ class HTTPHeaderLines {
 class HTTPTransfer {
  public:
   struct Outcome {
-    HTTPResult result;
-    bool answered = false;  ///< part of an answer arrived
-    bool mayRetry = false;  ///< no part of an answer arrived, and another attempt may succeed
+    bool answered = false;          ///< part of an answer arrived
+    HTTPResult result;              ///< valid if `answered`
+    HTTPSchedule::Failure failure;  ///< valid otherwise
   };
 
-  /// `authorities`: the file of certificate authorities; nullopt for the system's. Throws std::bad_alloc.
+  /// `authorities`: the file of certificate authorities; nullopt for the system's.
   HTTPTransfer(const HTTPClient::Options& options, const std::optional<std::string>& authorities);
 
   CURL* handle() const noexcept { return _easy.get(); }
   bool isBusy() const noexcept { return _exchange != nullptr; }
+  HTTPExchange* exchange() const noexcept { return _exchange.get(); }
   bool isPost() const noexcept { return _exchange && _exchange->isPost(); }
 
   /// Prepares the handle for `exchange` and takes ownership of it. Returns an error, and leaves the exchange
-  /// with the caller, if it can't be sent. Throws std::bad_alloc.
+  /// with the caller, if it can't be sent.
   std::optional<HTTPError> prepare(std::unique_ptr<HTTPExchange>& exchange, HTTPExchange::Instant now);
 
   /// The outcome, once libcurl has finished with the handle.
-  Outcome finish(CURLcode code) noexcept;
+  Outcome finish(CURLcode code);
 
   std::unique_ptr<HTTPExchange> release() noexcept { return std::move(_exchange); }
 
@@ -71,7 +73,8 @@ class HTTPTransfer {
   void setMethod(const HTTPRequest& request);
   void setHeaders(const HTTPRequest& request);
   void setTimes(const HTTPExchange& exchange, HTTPExchange::Instant now);
-  HTTPError errorFrom(CURLcode code) const noexcept;
+  HTTPSchedule::Failure failureFrom(CURLcode code) const;
+  HTTPError errorFrom(CURLcode code) const;
 
   const std::size_t _maximumBody;
   const long _connectTimeout;  ///< milliseconds
@@ -85,7 +88,6 @@ class HTTPTransfer {
   std::size_t _headerBytes = 0;
   bool _answered = false;
   bool _tooLarge = false;
-  bool _outOfMemory = false;
 };
 
 }  // namespace vesk

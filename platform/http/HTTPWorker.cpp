@@ -6,7 +6,6 @@
 #include <algorithm>
 #include <chrono>
 #include <limits>
-#include <new>
 #include <stdexcept>
 #include <utility>
 
@@ -52,10 +51,12 @@ HTTPClient::Worker::Worker(Options options, std::optional<std::string> authoriti
       _schedule(_options),
       _thread([this] { run(); }) {}
 
-HTTPClient::Worker::~Worker() {
+HTTPClient::Worker::~Worker() { stop(); }
+
+void HTTPClient::Worker::stop() {
   {
     MutexLock lock(_mutex);
-    _stopping = true;
+    if (std::exchange(_stopping, true)) return;
   }
   wake();
   _thread.join();
@@ -63,17 +64,18 @@ HTTPClient::Worker::~Worker() {
 
 void HTTPClient::Worker::wake() noexcept { curl_multi_wakeup(_multi.get()); }
 
-void HTTPClient::Worker::start(HTTPRequest& request, Completion& completion) {
-  auto exchange = std::make_unique<HTTPExchange>(std::move(request), std::move(completion),
-                                                 std::chrono::steady_clock::now(), _outstanding);
+bool HTTPClient::Worker::start(HTTPRequest& request, Completion& completion) {
   bool mustWake;
   {
     MutexLock lock(_mutex);
+    if (_stopping) return false;
     // If the inbox is not empty, the thread has already been woken.
     mustWake = _inbox.empty();
-    _inbox.pushBack(std::move(exchange));
+    _inbox.push_back(std::make_unique<HTTPExchange>(std::move(request), std::move(completion),
+                                                    std::chrono::steady_clock::now(), _outstanding));
   }
   if (mustWake) wake();
+  return true;
 }
 
 void HTTPClient::Worker::run() noexcept {
@@ -81,13 +83,15 @@ void HTTPClient::Worker::run() noexcept {
   pthread_setname_np(pthread_self(), "http");
   while (turn()) {
   }
-  stop();
+  giveUpAll();
 }
 
-bool HTTPClient::Worker::turn() noexcept {
+bool HTTPClient::Worker::turn() {
   if (!takeInbox()) return false;
   if (_postsOnly) stopAllButPosts();
-  _schedule.advance(std::chrono::steady_clock::now());
+  const auto now = std::chrono::steady_clock::now();
+  _schedule.advance(now);
+  if (_options.keeper) keepCopies(now);
   startReady();
   int running = 0;
   curl_multi_perform(_multi.get(), &running);
@@ -97,52 +101,42 @@ bool HTTPClient::Worker::turn() noexcept {
   return true;
 }
 
-bool HTTPClient::Worker::takeInbox() noexcept {
-  HTTPQueue arrived;
+bool HTTPClient::Worker::takeInbox() {
+  std::vector<Exchange> arrived;
   {
     MutexLock lock(_mutex);
     if (_stopping) return false;
     arrived.swap(_inbox);
   }
-  while (auto exchange = arrived.pop()) _schedule.add(std::move(exchange));
+  for (auto& exchange : arrived) _schedule.add(std::move(exchange));
   return true;
 }
 
-void HTTPClient::Worker::stopAllButPosts() noexcept {
+void HTTPClient::Worker::stopAllButPosts() {
   for (auto& transfer : _transfers) {
     if (!transfer->isBusy() || transfer->isPost()) continue;
-    auto exchange = interrupt(*transfer);
-    _schedule.failed(std::move(exchange), stopped(), false, std::chrono::steady_clock::now());
+    _schedule.failed(interrupt(*transfer), {.error = stopped()}, std::chrono::steady_clock::now());
   }
   _schedule.stopAllButPosts();
-  if (!std::exchange(_hasStoppedOthers, true)) _schedule.retryNow();
 }
 
-void HTTPClient::Worker::startReady() noexcept {
+void HTTPClient::Worker::startReady() {
   while (auto exchange = _schedule.next(std::chrono::steady_clock::now())) begin(std::move(exchange));
 }
 
-void HTTPClient::Worker::begin(Exchange exchange) noexcept {
-  std::optional<HTTPError> error;
-  HTTPTransfer* transfer = nullptr;
-  try {
-    transfer = &idleTransfer();
-    error = transfer->prepare(exchange, std::chrono::steady_clock::now());
-  } catch (const std::bad_alloc&) {
-    error = outOfMemory();
-  }
-  if (!error && curl_multi_add_handle(_multi.get(), transfer->handle()) != CURLM_OK) {
-    error = httpError(HTTPError::Kind::Other, "libcurl did not take the request");
+void HTTPClient::Worker::begin(Exchange exchange) {
+  HTTPTransfer& transfer = idleTransfer();
+  auto error = transfer.prepare(exchange, std::chrono::steady_clock::now());
+  if (!error && curl_multi_add_handle(_multi.get(), transfer.handle()) != CURLM_OK) {
+    error = HTTPError{HTTPError::Kind::Other, "libcurl did not take the request"};
   }
   if (!error) return;
-  if (transfer) {
-    if (!exchange) exchange = transfer->release();
-    _idle.push_back(transfer);
-  }
-  _schedule.failed(std::move(exchange), std::move(*error), false, std::chrono::steady_clock::now());
+  if (!exchange) exchange = transfer.release();
+  _idle.push_back(&transfer);
+  _schedule.failed(std::move(exchange), {.error = std::move(*error)}, std::chrono::steady_clock::now());
 }
 
-bool HTTPClient::Worker::collectFinished() noexcept {
+bool HTTPClient::Worker::collectFinished() {
   bool any = false;
   int left = 0;
   while (CURLMsg* message = curl_multi_info_read(_multi.get(), &left)) {
@@ -157,21 +151,30 @@ bool HTTPClient::Worker::collectFinished() noexcept {
   return any;
 }
 
-void HTTPClient::Worker::conclude(HTTPTransfer& transfer, CURLcode code) noexcept {
+void HTTPClient::Worker::conclude(HTTPTransfer& transfer, CURLcode code) {
   auto outcome = transfer.finish(code);
   auto exchange = transfer.release();
   _idle.push_back(&transfer);
-  if (outcome.answered) {
-    _schedule.answered(*exchange);
-    exchange->complete(std::move(outcome.result));
-  } else {
-    _schedule.failed(std::move(exchange), std::move(*outcome.result.error), outcome.mayRetry,
-                     std::chrono::steady_clock::now());
+  const auto now = std::chrono::steady_clock::now();
+  if (!outcome.answered) {
+    _schedule.failed(std::move(exchange), std::move(outcome.failure), now);
+    return;
   }
+  _schedule.answered(*exchange, now);
+  if (_options.keeper) {
+    if (exchange->ticket != 0) _options.keeper->discard(exchange->ticket);
+    const auto& response = outcome.result.response;
+    if (response && !response->isBusyOrBroken()) _options.keeper->hostAnswered(exchange->host());
+  }
+  exchange->complete(std::move(outcome.result));
 }
 
-void HTTPClient::Worker::sleep() noexcept {
+void HTTPClient::Worker::sleep() {
   auto next = _schedule.nextAdvance();
+  for (const auto& transfer : _transfers) {
+    const auto due = copyDue(*transfer);
+    if (due && (!next || *due < *next)) next = due;
+  }
   int timeout = next ? millisecondsUntil(*next) : std::numeric_limits<int>::max();
   CURLMcode code = curl_multi_poll(_multi.get(), nullptr, 0, timeout, nullptr);
   if (code != CURLM_OK) {
@@ -180,38 +183,49 @@ void HTTPClient::Worker::sleep() noexcept {
   }
 }
 
+void HTTPClient::Worker::keepCopies(HTTPSchedule::Instant now) {
+  for (auto& transfer : _transfers) {
+    const auto due = copyDue(*transfer);
+    if (!due || *due > now) continue;
+    HTTPExchange& post = *transfer->exchange();
+    post.hasCopy = true;
+    post.ticket = _options.keeper->keepCopy(post.request);
+  }
+}
+
+std::optional<HTTPSchedule::Instant> HTTPClient::Worker::copyDue(const HTTPTransfer& transfer) const {
+  const HTTPExchange* exchange = transfer.exchange();
+  if (!_options.keeper || !exchange || !exchange->isPost() || exchange->hasCopy) return std::nullopt;
+  return exchange->firstAttempt + _options.retryFor;
+}
+
 HTTPTransfer& HTTPClient::Worker::idleTransfer() {
   if (_idle.empty()) {
-    _idle.reserve(_transfers.size() + 1);
     _transfers.push_back(std::make_unique<HTTPTransfer>(_options, _authorities));
-    _idle.push_back(_transfers.back().get());
+    return *_transfers.back();
   }
   HTTPTransfer* transfer = _idle.back();
   _idle.pop_back();
   return *transfer;
 }
 
-HTTPClient::Worker::Exchange HTTPClient::Worker::interrupt(HTTPTransfer& transfer) noexcept {
+HTTPClient::Worker::Exchange HTTPClient::Worker::interrupt(HTTPTransfer& transfer) {
   curl_multi_remove_handle(_multi.get(), transfer.handle());
   _idle.push_back(&transfer);
   return transfer.release();
 }
 
-void HTTPClient::Worker::stop() noexcept {
+void HTTPClient::Worker::giveUpAll() {
   for (auto& transfer : _transfers) {
-    if (transfer->isBusy()) interrupt(*transfer)->fail(stopped());
+    if (transfer->isBusy()) interrupt(*transfer)->giveUp(stopped(), _options.keeper, kWaitAfterWholeBody);
   }
   _schedule.stopAll();
-  for (bool more = true; more;) {
-    // A completion may have started further requests.
-    HTTPQueue arrived;
-    {
-      MutexLock lock(_mutex);
-      arrived.swap(_inbox);
-    }
-    more = !arrived.empty();
-    while (auto exchange = arrived.pop()) exchange->fail(stopped());
+  std::vector<Exchange> arrived;
+  {
+    MutexLock lock(_mutex);
+    arrived.swap(_inbox);
   }
+  for (auto& exchange : arrived) exchange->giveUp(stopped(), _options.keeper);
   _transfers.clear();
 }
 

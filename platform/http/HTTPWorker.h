@@ -11,7 +11,6 @@
 #include <vector>
 
 #include "platform/http/HTTPClient.h"
-#include "platform/http/HTTPQueue.h"
 #include "platform/http/HTTPSchedule.h"
 #include "platform/http/HTTPTransfer.h"
 #include "platform/sync/Mutex.h"
@@ -19,8 +18,7 @@
 namespace vesk {
 
 /// Accepts requests from any thread through an inbox and performs them on its own thread, which sleeps
-/// without a timeout while idle. Running out of memory ends only the exchange concerned; no exception leaves
-/// the thread.
+/// without a timeout while idle. No exception leaves the thread.
 class HTTPClient::Worker {
  public:
   /// `postsOnly` must outlive the worker; call `wake` after setting it.
@@ -29,33 +27,39 @@ class HTTPClient::Worker {
   Worker(const Worker&) = delete;
   Worker& operator=(const Worker&) = delete;
 
-  /// Takes ownership of both, unless it throws std::bad_alloc.
-  void start(HTTPRequest& request, Completion& completion);
+  /// Takes ownership of both. Returns false, and leaves both with the caller, after `stop`.
+  [[nodiscard]] bool start(HTTPRequest& request, Completion& completion);
+  /// Gives up all requests and ends the thread. May be called more than once.
+  void stop();
   void wake() noexcept;
   bool waitUntilIdle(std::chrono::milliseconds timeout) { return _outstanding.waitUntilNone(timeout); }
 
  private:
-  using Exchange = HTTPQueue::Exchange;
+  using Exchange = HTTPSchedule::Exchange;
   struct FreeMulti {
     void operator()(CURLM* multi) const noexcept { curl_multi_cleanup(multi); }
   };
 
   void run() noexcept;
   /// One iteration. Returns false when it is time to stop.
-  bool turn() noexcept;
-  void stop() noexcept;
+  bool turn();
+  void giveUpAll();
 
-  bool takeInbox() noexcept;
-  void stopAllButPosts() noexcept;
-  void startReady() noexcept;
-  void begin(Exchange exchange) noexcept;
+  bool takeInbox();
+  void stopAllButPosts();
+  void startReady();
+  void begin(Exchange exchange);
   /// Returns true if any transfer ended.
-  bool collectFinished() noexcept;
-  void conclude(HTTPTransfer& transfer, CURLcode code) noexcept;
-  void sleep() noexcept;
+  bool collectFinished();
+  void conclude(HTTPTransfer& transfer, CURLcode code);
+  void sleep();
   HTTPTransfer& idleTransfer();
   /// Removes a busy transfer from libcurl and returns its exchange.
-  Exchange interrupt(HTTPTransfer& transfer) noexcept;
+  Exchange interrupt(HTTPTransfer& transfer);
+  /// Gives the keeper copies of posts whose attempt takes long, so that they would survive the process's end.
+  void keepCopies(HTTPSchedule::Instant now);
+  /// The time at which the keeper gets a copy of the post in `transfer`; nullopt if it gets none.
+  std::optional<HTTPSchedule::Instant> copyDue(const HTTPTransfer& transfer) const;
 
   // Constant after construction.
   const Options _options;
@@ -69,10 +73,10 @@ class HTTPClient::Worker {
   HTTPSchedule _schedule;
   std::vector<std::unique_ptr<HTTPTransfer>> _transfers;
   bool _hasStoppedOthers = false;
-  std::vector<HTTPTransfer*> _idle;  ///< those of `_transfers` without an exchange; has capacity for all
+  std::vector<HTTPTransfer*> _idle;  ///< those of `_transfers` without an exchange
 
   Mutex _mutex;
-  HTTPQueue _inbox VESK_GUARDED_BY(_mutex);
+  std::vector<Exchange> _inbox VESK_GUARDED_BY(_mutex);
   bool _stopping VESK_GUARDED_BY(_mutex) = false;
 
   std::thread _thread;

@@ -6,7 +6,7 @@
 #include <utility>
 #include <vector>
 
-#include "platform/powerlog/SQLiteHandles.h"
+#include "platform/sqlite/SQLiteHandles.h"
 #include "platform/time/Clock.h"
 
 namespace vesk {

@@ -3,7 +3,7 @@
 #include <cmath>
 #include <vector>
 
-#include "platform/powerlog/SQLiteHandles.h"
+#include "platform/sqlite/SQLiteHandles.h"
 
 namespace vesk {
 

@@ -1,4 +1,4 @@
-// Owning handles for SQLite, used to write and read the power log.
+// Owning handles for SQLite.
 #pragma once
 
 #include <sqlite3.h>

@@ -1,0 +1,375 @@
+#include "platform/outbox/PostOutbox.h"
+
+#include <poll.h>
+#include <pthread.h>
+#include <signal.h>
+
+#include <algorithm>
+#include <limits>
+#include <utility>
+
+#include "platform/http/HTTPExchange.h"
+#include "platform/log/SystemLog.h"
+#include "platform/outbox/RetryAfter.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::size_t kConnectionsPerHost = 2;
+constexpr std::size_t kMostChangesAtOnce = 256;
+constexpr std::chrono::seconds kReadAgainAfter{5};  // for posts that may not be sent yet
+constexpr std::chrono::hours kExpiryInterval{1};
+
+PostOutbox::Outcome outcomeOf(long status) {
+  return status >= 200 && status <= 299 ? PostOutbox::Outcome::Delivered : PostOutbox::Outcome::Refused;
+}
+
+OutboxStore::Losses removeRespectingConsent(std::vector<WaitingPost>& posts) {
+  OutboxStore::Losses removed;
+  std::erase_if(posts, [&removed](const WaitingPost& post) {
+    if (!post.request.respectsConsent) return false;
+    removed.push_back({post.request.source, post.request.events});
+    return true;
+  });
+  return removed;
+}
+
+}  // namespace
+
+PostOutbox::PostOutbox(Options options)
+    : _options(std::move(options)),
+      _storage(_options.path, {_options.maximumBytes, _options.maximumBytesInMemory}),
+      _random(std::random_device{}()) {
+  _lastID = _storage.lastID();
+  const auto now = std::chrono::steady_clock::now();
+  for (const auto& host : _storage.hosts()) _hosts[host].backoff.resume(now, random());
+  _isWaiting = !_storage.isEmpty();
+}
+
+PostOutbox::~PostOutbox() {
+  stopSending();
+  stop();
+}
+
+void PostOutbox::start(HTTPClient& client) {
+  {
+    MutexLock lock(_clientMutex);
+    _client = &client;
+  }
+  if (!_isWaiting) return;
+  _options.onWaiting(true);
+  MutexLock lock(_mutex);
+  _thread = std::thread([this] { run(); });
+}
+
+void PostOutbox::stopSending() {
+  MutexLock lock(_clientMutex);
+  _client = nullptr;
+}
+
+void PostOutbox::stop() {
+  std::thread thread;
+  {
+    MutexLock lock(_mutex);
+    if (std::exchange(_isStopped, true)) return;
+    thread = std::move(_thread);
+  }
+  _wakeup.signal();
+  if (thread.joinable()) thread.join();
+}
+
+void PostOutbox::setConsent(bool consent) {
+  Losses deleted;
+  {
+    MutexLock lock(_mutex);
+    if (_isClosedToConsent == !consent) return;
+    _isClosedToConsent = !consent;
+    if (consent || !_isWaiting) return;
+    deleted = removeRespectingConsent(_inbox.changes.added);
+    _inbox.consentWithdrawn = true;
+  }
+  report(Outcome::ConsentWithdrawn, deleted);
+  _wakeup.signal();
+}
+
+bool PostOutbox::keep(HTTPRequest post, std::chrono::seconds delay) {
+  return put(std::move(post), delay, false) != 0;
+}
+
+PostOutbox::Ticket PostOutbox::keepCopy(const HTTPRequest& post) { return put(post, std::chrono::seconds(0), true); }
+
+void PostOutbox::sendLater(Ticket ticket, std::chrono::seconds delay) {
+  const auto id = static_cast<std::int64_t>(ticket);
+  {
+    MutexLock lock(_mutex);
+    _beingSent.erase(id);
+    if (delay > delay.zero()) _inbox.changes.postponed.emplace_back(id, after(delay));
+  }
+  _wakeup.signal();
+}
+
+void PostOutbox::discard(Ticket ticket) {
+  const auto id = static_cast<std::int64_t>(ticket);
+  {
+    MutexLock lock(_mutex);
+    _beingSent.erase(id);
+    _inbox.changes.removed.push_back(id);
+  }
+  _wakeup.signal();
+}
+
+void PostOutbox::hostAnswered(std::string_view host) {
+  if (!_isWaiting) return;
+  {
+    MutexLock lock(_mutex);
+    if (_inbox.hosts.find(host) != _inbox.hosts.end()) return;
+    _inbox.hosts.emplace(host);
+  }
+  _wakeup.signal();
+}
+
+PostOutbox::Ticket PostOutbox::put(HTTPRequest post, std::chrono::seconds delay, bool isBeingSent) {
+  std::int64_t id = 0;
+  {
+    MutexLock lock(_mutex);
+    if (_isStopped) return 0;
+    id = ++_lastID;
+    if (post.respectsConsent && _isClosedToConsent) {
+      // A copy is not lost yet: its attempt goes on.
+      if (isBeingSent) return 0;
+      _options.onFate({Outcome::ConsentWithdrawn, post.source, post.events});
+      return static_cast<Ticket>(id);
+    }
+    if (isBeingSent) _beingSent.insert(id);
+    _inbox.changes.added.push_back({id, std::move(post), _options.clock->now(), after(delay)});
+    _isWaiting = true;
+    if (!_thread.joinable()) _thread = std::thread([this] { run(); });
+  }
+  _wakeup.signal();
+  return static_cast<Ticket>(id);
+}
+
+// --- The outbox's thread
+
+void PostOutbox::run() {
+  sigset_t all;
+  sigfillset(&all);
+  pthread_sigmask(SIG_SETMASK, &all, nullptr);
+  pthread_setname_np(pthread_self(), "outbox");
+  bool wasWaiting = !_storage.isEmpty();
+  for (bool stopping = false; !stopping;) {
+    waitForWork();
+    Inbox inbox;
+    {
+      MutexLock lock(_mutex);
+      std::swap(inbox, _inbox);
+      stopping = _isStopped;
+    }
+    take(std::move(inbox));
+    if (stopping || (_writeBy && *_writeBy <= std::chrono::steady_clock::now())) write();
+    if (stopping) break;
+    expire();
+    sendReady();
+    const bool isWaiting = !_storage.isEmpty() || _changes.size() > 0;
+    if (isWaiting != wasWaiting) _options.onWaiting(isWaiting);
+    if (wasWaiting && !isWaiting) {
+      MutexLock lock(_mutex);
+      _isWaiting = _inbox.changes.size() > 0;
+    }
+    wasWaiting = isWaiting;
+  }
+  report(Outcome::NotWritten, _storage.waitingInMemory());
+}
+
+void PostOutbox::waitForWork() {
+  int timeout = -1;
+  if (const auto next = nextEvent()) {
+    const auto left = std::chrono::ceil<std::chrono::milliseconds>(*next - std::chrono::steady_clock::now());
+    timeout = static_cast<int>(std::clamp<long long>(left.count(), 0, std::numeric_limits<int>::max()));
+  }
+  pollfd woken{_wakeup.fd(), POLLIN, 0};
+  ::poll(&woken, 1, timeout);
+  _wakeup.clear();
+}
+
+std::optional<PostOutbox::Instant> PostOutbox::nextEvent() const {
+  std::optional<Instant> next = _writeBy;
+  const auto consider = [&next](Instant time) {
+    if (!next || time < *next) next = time;
+  };
+  if (!_storage.isEmpty()) consider(_nextExpiry);
+  for (const auto& [name, host] : _hosts) {
+    // Otherwise the answers wake the thread.
+    if (host.sending == 0) consider(std::max(host.backoff.next(), host.ready.empty() ? host.readAgain : Instant{}));
+  }
+  return next;
+}
+
+void PostOutbox::take(Inbox inbox) {
+  const auto now = std::chrono::steady_clock::now();
+  if (inbox.consentWithdrawn) deletePostsThatRespectConsent();
+  for (const auto& answer : inbox.answers) take(answer);
+  for (auto& post : inbox.changes.added) {
+    Host& host = _hosts[std::string(hostOfURL(post.request.url))];
+    host.backoff.begin(now, random());
+    host.readAgain = {};
+    _changes.added.push_back(std::move(post));
+  }
+  auto& changes = inbox.changes;
+  _changes.postponed.insert(_changes.postponed.end(), changes.postponed.begin(), changes.postponed.end());
+  _changes.removed.insert(_changes.removed.end(), changes.removed.begin(), changes.removed.end());
+  for (const auto& name : inbox.hosts) {
+    auto host = _hosts.find(name);
+    if (host != _hosts.end()) host->second.backoff.hostAnswered(now);
+  }
+  if (_changes.size() == 0) return;
+  if (!_writeBy) _writeBy = now + _options.writeWithin;
+  if (_changes.size() >= kMostChangesAtOnce) _writeBy = now;
+}
+
+void PostOutbox::take(const Answer& answer) {
+  const auto now = std::chrono::steady_clock::now();
+  Host& host = _hosts[answer.host];
+  --host.sending;
+  if (!answer.result.response) {
+    const auto kind = answer.result.error->kind;
+    // The server may be processing the post.
+    if (kind == HTTPError::Kind::Interrupted || kind == HTTPError::Kind::Timeout) {
+      _changes.postponed.emplace_back(answer.id, after(kWaitAfterWholeBody));
+    }
+    _taken.erase(answer.id);
+    readAgainFromTheOldest(host);
+    host.backoff.failed(now, random());
+    return;
+  }
+  const long status = answer.result.response->status;
+  if (answer.result.response->isBusyOrBroken()) {
+    host.backoff.held(now, retryAfter(*answer.result.response, _options.clock->now()), random());
+  } else {
+    host.backoff.succeeded();
+  }
+  _changes.removed.push_back(answer.id);
+  _options.onFate({outcomeOf(status), answer.post.source, answer.post.events, status});
+}
+
+void PostOutbox::write() {
+  _writeBy.reset();
+  OutboxStorage::Lost lost;
+  // A post that was answered before its copy was written.
+  std::erase_if(_changes.added, [this](const WaitingPost& post) {
+    return std::find(_changes.removed.begin(), _changes.removed.end(), post.id) != _changes.removed.end();
+  });
+  const auto removed = _changes.removed;
+  const std::size_t added = _changes.added.size();
+  _storage.write(_changes, std::chrono::steady_clock::now(), lost);
+  if (_changes.removed.empty()) {
+    for (std::int64_t id : removed) _taken.erase(id);
+  } else {
+    _writeBy = std::chrono::steady_clock::now() + std::chrono::seconds(60);  // the file can't be written now
+  }
+  if (added > 0) VESK_LOG_DEBUG("Outbox: %zu posts are put aside", added);
+  if (_storage.isEmpty()) _storage.shrinkIfEmpty(lost);
+  report(lost);
+}
+
+void PostOutbox::expire() {
+  const auto now = std::chrono::steady_clock::now();
+  if (now < _nextExpiry) return;
+  _nextExpiry = now + kExpiryInterval;
+  OutboxStorage::Lost lost;
+  const WallTime time = _options.clock->now();
+  report(Outcome::Expired, _storage.removeKeptBefore(time - _options.maximumAge, time, lost));
+  report(lost);
+}
+
+void PostOutbox::deletePostsThatRespectConsent() {
+  Losses deleted = removeRespectingConsent(_changes.added);
+  for (auto& [name, host] : _hosts) readAgainFromTheOldest(host);
+  OutboxStorage::Lost lost;
+  for (auto& each : _storage.removeRespectingConsent(lost)) deleted.push_back(std::move(each));
+  report(Outcome::ConsentWithdrawn, deleted);
+  report(lost);
+}
+
+void PostOutbox::readAgainFromTheOldest(Host& host) {
+  for (const auto& post : host.ready) _taken.erase(post.id);
+  host.ready.clear();
+  host.lastRead = 0;
+}
+
+// --- Sending
+
+void PostOutbox::sendReady() {
+  for (auto each = _hosts.begin(); each != _hosts.end();) {
+    auto& [name, host] = *each;
+    sendReady(name, host);
+    const bool isDone = host.sending == 0 && host.ready.empty() && _changes.added.empty() && !_storage.has(name);
+    each = isDone ? _hosts.erase(each) : std::next(each);
+  }
+}
+
+void PostOutbox::sendReady(const std::string& name, Host& host) {
+  if (host.backoff.next() > std::chrono::steady_clock::now()) return;
+  // One post finds out whether the host is back.
+  const std::size_t most = host.backoff.isUp() ? kConnectionsPerHost : 1;
+  while (host.sending < most) {
+    if (host.ready.empty()) readMore(name, host);
+    if (host.ready.empty()) return;
+    send(name, host);
+  }
+}
+
+void PostOutbox::readMore(const std::string& name, Host& host) {
+  const auto now = std::chrono::steady_clock::now();
+  if (now < host.readAgain) return;
+  OutboxStorage::Lost lost;
+  auto posts = _storage.read(name, host.lastRead, _options.clock->now(), lost);
+  report(lost);
+  if (posts.empty()) {
+    host.readAgain = now + kReadAgainAfter;
+    host.lastRead = 0;
+    return;
+  }
+  host.lastRead = posts.back().id;
+  MutexLock lock(_mutex);
+  for (auto& post : posts) {
+    if (_beingSent.contains(post.id) || !_taken.insert(post.id).second) continue;
+    host.ready.push_back(std::move(post));
+  }
+}
+
+void PostOutbox::send(const std::string& name, Host& host) {
+  WaitingPost post = std::move(host.ready.front());
+  host.ready.pop_front();
+  post.request.retry = HTTPRequest::Retry::Never;
+  auto answer = std::make_shared<Answer>(Answer{post.id, name, {post.request.source, post.request.events}, {}});
+  auto completion = [this, answer](HTTPResult result) {
+    answer->result = std::move(result);
+    {
+      MutexLock lock(_mutex);
+      _inbox.answers.push_back(std::move(*answer));
+    }
+    _wakeup.signal();
+  };
+  ++host.sending;
+  MutexLock lock(_clientMutex);
+  if (_client) {
+    _client->start(std::move(post.request), std::move(completion));
+  } else {
+    completion({std::nullopt, HTTPError{HTTPError::Kind::Stopped, "sending was stopped"}});
+  }
+}
+
+// --- Reports
+
+void PostOutbox::report(Outcome outcome, const Losses& lost) const {
+  for (const auto& each : lost) _options.onFate({outcome, each.source, each.events});
+}
+
+void PostOutbox::report(const OutboxStorage::Lost& lost) const {
+  report(Outcome::OverQuota, lost.overQuota);
+  report(Outcome::Damaged, lost.damaged);
+}
+
+}  // namespace vesk
