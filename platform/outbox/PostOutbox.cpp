@@ -157,9 +157,10 @@ void PostOutbox::run() {
   sigfillset(&all);
   pthread_sigmask(SIG_SETMASK, &all, nullptr);
   pthread_setname_np(pthread_self(), "outbox");
+  NetworkMonitor network;
   bool wasWaiting = !_storage.isEmpty();
   for (bool stopping = false; !stopping;) {
-    waitForWork();
+    waitForWork(network);
     Inbox inbox;
     {
       MutexLock lock(_mutex);
@@ -182,15 +183,17 @@ void PostOutbox::run() {
   report(Outcome::NotWritten, _storage.waitingInMemory());
 }
 
-void PostOutbox::waitForWork() {
+void PostOutbox::waitForWork(NetworkMonitor& network) {
   int timeout = -1;
   if (const auto next = nextEvent()) {
     const auto left = std::chrono::ceil<std::chrono::milliseconds>(*next - std::chrono::steady_clock::now());
     timeout = static_cast<int>(std::clamp<long long>(left.count(), 0, std::numeric_limits<int>::max()));
   }
-  pollfd woken{_wakeup.fd(), POLLIN, 0};
-  ::poll(&woken, 1, timeout);
+  pollfd sources[] = {{_wakeup.fd(), POLLIN, 0}, {network.fd(), POLLIN, 0}};
+  ::poll(sources, std::size(sources), timeout);
   _wakeup.clear();
+  if ((sources[1].revents & POLLIN) == 0 || !network.takeChange()) return;
+  for (auto& [name, host] : _hosts) host.backoff.networkChanged(std::chrono::steady_clock::now(), random());
 }
 
 std::optional<PostOutbox::Instant> PostOutbox::nextEvent() const {

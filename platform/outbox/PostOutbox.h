@@ -18,6 +18,7 @@
 
 #include "platform/http/HTTPClient.h"
 #include "platform/http/PostKeeper.h"
+#include "platform/net/NetworkMonitor.h"
 #include "platform/outbox/HostBackoff.h"
 #include "platform/outbox/OutboxStorage.h"
 #include "platform/sync/Mutex.h"
@@ -120,7 +121,7 @@ class PostOutbox final : public PostKeeper {
 
   // Called on the outbox's thread only.
   void run();
-  void waitForWork();
+  void waitForWork(NetworkMonitor& network);
   std::optional<Instant> nextEvent() const;
   void take(Inbox inbox);
   void take(const Answer& answer);
