@@ -33,6 +33,9 @@ TEST(RetryPolicy, WaitsGrowAreSpreadAndEnd) {
 
 class Schedule : public testing::Test {
  protected:
+  explicit Schedule(const HTTPClient::Options& options = {.maximumWaiting = 100, .maximumConnectionsPerHost = 3})
+      : schedule(options) {}
+
   /// Adds a post, or a fetch if it is never retried.
   void add(const std::string& name, std::size_t size = 10, std::uint32_t owner = 0,
            HTTPRequest::Retry retry = HTTPRequest::Retry::UntilSent, const std::string& host = "https://a") {
@@ -61,18 +64,21 @@ class Schedule : public testing::Test {
   }
   std::string givenUp() { return std::exchange(givenUpNames, ""); }
   void failFirst() {
-    schedule.failed(std::move(active.front()), {HTTPError::Kind::Connect, "down"}, true, now);
+    fail({.error = {HTTPError::Kind::Connect, "down"}, .mayRetry = true, .mayKeep = true});
+  }
+  void fail(HTTPSchedule::Failure failure) {
+    schedule.failed(std::move(active.front()), std::move(failure), now);
     active.erase(active.begin());
   }
   void answerFirst() {
-    schedule.answered(*active.front());
+    schedule.answered(*active.front(), now);
     active.front()->complete({HTTPResponse(), std::nullopt});
     active.erase(active.begin());
   }
 
   std::string givenUpNames;
   HTTPOutstanding outstanding;
-  HTTPSchedule schedule{{.maximumWaiting = 100, .maximumConnectionsPerHost = 3}};
+  HTTPSchedule schedule;
   Instant now{Instant{} + 1h};
   std::vector<HTTPSchedule::Exchange> active;
 };
@@ -133,7 +139,7 @@ TEST_F(Schedule, AnAnswerEndsTheWaitOfAllAndTheOldestGoFirst) {
   answerFirst();
   EXPECT_EQ(takeReady(), "12") << "at once";
   failFirst();
-  schedule.retryNow();
+  schedule.stopAllButPosts();
   answerFirst();
   EXPECT_EQ(takeReady(), "13") << "it waits for nothing when the daemon stops";
   EXPECT_EQ(givenUp(), "");
@@ -166,6 +172,92 @@ TEST_F(Schedule, OwnersTakeTurnsAndShareWhatMayWait) {
   EXPECT_EQ(givenUp(), "234") << "who has most waiting gives way";
   add("c", 70, 8);
   EXPECT_EQ(givenUp(), "c") << "nobody comes to more than that one has";
+}
+
+/// Notes what it is given.
+class NotingKeeper final : public PostKeeper {
+ public:
+  bool keep(HTTPRequest post, std::chrono::seconds delay) override {
+    kept += post.url.substr(post.url.rfind('/') + 1) + (delay > 0s ? "(" + std::to_string(delay.count()) + ")" : "");
+    return true;
+  }
+  Ticket keepCopy(const HTTPRequest&) override { return 1; }
+  void sendLater(Ticket ticket, std::chrono::seconds delay) override {
+    kept += "#" + std::to_string(ticket) + "(" + std::to_string(delay.count()) + ")";
+  }
+  void discard(Ticket ticket) override { kept += "-#" + std::to_string(ticket); }
+  void hostAnswered(std::string_view) override {}
+
+  std::string kept;
+};
+
+class KeptPosts : public Schedule {
+ protected:
+  KeptPosts() : Schedule({.maximumWaiting = 100, .keeper = &keeper, .retryFor = 5s, .maximumConnectionsPerHost = 3}) {}
+  std::string kept() { return std::exchange(keeper.kept, ""); }
+  NotingKeeper keeper;
+};
+
+TEST_F(KeptPosts, GoToTheKeeperAfterFiveSeconds) {
+  add("1");
+  EXPECT_EQ(takeReady(), "1");
+  failFirst();
+  EXPECT_EQ(kept(), "");
+  now += 5s;
+  schedule.advance(now);
+  EXPECT_EQ(kept(), "1");
+  EXPECT_EQ(givenUp(), "1");
+}
+
+TEST_F(KeptPosts, BehindAHostThatDoesNotAnswerGoToTheKeeper) {
+  for (const char* name : {"1", "2", "3", "4"}) add(name);
+  EXPECT_EQ(takeReady(), "12");
+  now += 3s;
+  answerFirst();
+  EXPECT_EQ(takeReady(), "3");
+  EXPECT_EQ(schedule.nextAdvance(), now + 5s) << "since the last answer";
+  now += 5s;
+  schedule.advance(now);
+  EXPECT_EQ(kept(), "4") << "not those whose attempt goes on";
+}
+
+TEST_F(KeptPosts, ThatTheServerMayHaveReceivedGoToTheKeeperAtOnceAndWait) {
+  add("1");
+  add("2");
+  EXPECT_EQ(takeReady(), "12");
+  fail({.error = {HTTPError::Kind::Interrupted, "cut off"}, .mayRetry = true, .mayKeep = true, .wasSentWhole = true});
+  EXPECT_EQ(kept(), "1(30)");
+  active.front()->ticket = 7;
+  fail({.error = {HTTPError::Kind::Interrupted, "cut off"}, .mayRetry = true, .mayKeep = true, .wasSentWhole = true});
+  EXPECT_EQ(kept(), "#7(30)") << "it has a copy";
+  add("3");
+  EXPECT_EQ(takeReady(), "3");
+  active.front()->ticket = 8;
+  fail({.error = {HTTPError::Kind::BadURL, "no URL"}});
+  EXPECT_EQ(kept(), "-#8") << "no other attempt could succeed";
+}
+
+TEST_F(KeptPosts, OfAnOutageGoToTheKeeperWhenTheDaemonEnds) {
+  for (const char* name : {"1", "2", "3"}) add(name);
+  addToOtherHost("4");
+  EXPECT_EQ(takeReady(), "124");
+  failFirst();
+  schedule.stopAllButPosts();
+  EXPECT_EQ(kept(), "13") << "the other host may still answer";
+  failFirst();
+  EXPECT_EQ(kept(), "2") << "it is not tried again";
+}
+
+TEST_F(KeptPosts, BeyondTheBoundGoToTheKeeper) {
+  add("1", 60);
+  add("2", 60);
+  EXPECT_EQ(takeReady(), "12");
+  failFirst();
+  failFirst();
+  add("3", 80);
+  EXPECT_EQ(kept(), "2") << "it did not fit beside the first";
+  add("4", 50);
+  EXPECT_EQ(kept(), "4") << "the third is about to find out whether the host is back";
 }
 
 TEST_F(Schedule, AFetchThatFindsNoConnectionInTimeIsGivenUp) {

@@ -236,7 +236,9 @@ TEST_F(Outbox, WithdrawnConsentDeletesWhatRespectsItWithoutATrace) {
 
 TEST_F(Outbox, TheOldestOfTheFullestUserGiveWay) {
   const std::string kilobytes(1000, 'x');
-  begin({.maximumBytes = 4 * OutboxStore::sizeOf(post("a" + kilobytes))});
+  PostOutbox::Options options;
+  options.maximumBytes = 4 * OutboxStore::sizeOf(post("a" + kilobytes));
+  begin(options);
   server.stop();
   for (const char* name : {"a", "b", "c", "d"}) EXPECT_TRUE(isPutAside(post(name + kilobytes, 1)));
   EXPECT_TRUE(isPutAside(post("e" + kilobytes, 2)));
@@ -319,7 +321,9 @@ TEST_F(Outbox, ASecondProcessIsRefusedTheFile) {
   server.stop();
   EXPECT_TRUE(isPutAside(post("1")));
   while (bytesOfFiles().empty()) std::this_thread::yield();
-  PostOutbox second({.path = file()});
+  PostOutbox::Options options;
+  options.path = file();
+  PostOutbox second(options);
   EXPECT_TRUE(second.keep(post("2"), 0s));
   while (log.countContaining(3, "another process uses the file") == 0) std::this_thread::yield();
 }

@@ -47,7 +47,7 @@ constexpr char kSelect[] =
     " FROM posts WHERE host = ?1 AND id > ?2 AND (not_before <= ?3 OR not_before > ?3 + 60000000)"
     " ORDER BY id LIMIT ?4";
 
-void bind(sqlite3_stmt* statement, int index, std::string_view text) {
+void bindText(sqlite3_stmt* statement, int index, std::string_view text) {
   sqlite3_bind_text64(statement, index, text.data(), text.size(), SQLITE_STATIC, SQLITE_UTF8);
 }
 
@@ -116,8 +116,8 @@ void createPrivately(const std::string& path) {
 
 }  // namespace
 
-OutboxStoreError::OutboxStoreError(int sqliteCode)
-    : std::runtime_error(sqlite3_errstr(sqliteCode)), _code(sqliteCode & 0xff) {}
+OutboxStoreError::OutboxStoreError(int sqliteCode, const char* text)
+    : std::runtime_error(text), _code(sqliteCode & 0xff) {}
 bool OutboxStoreError::isDamage() const { return _code == SQLITE_CORRUPT || _code == SQLITE_NOTADB; }
 bool OutboxStoreError::isFull() const { return _code == SQLITE_FULL; }
 bool OutboxStoreError::isInUse() const { return _code == SQLITE_BUSY || _code == SQLITE_LOCKED; }
@@ -152,17 +152,17 @@ void OutboxStore::add(const WaitingPost& post) {
   const auto size = static_cast<std::int64_t>(sizeOf(request));
   auto row = statement(kInsert);
   sqlite3_bind_int64(row.get(), 1, post.id);
-  bind(row.get(), 2, host);
+  bindText(row.get(), 2, host);
   sqlite3_bind_int64(row.get(), 3, request.owner);
-  bind(row.get(), 4, request.source);
+  bindText(row.get(), 4, request.source);
   sqlite3_bind_int64(row.get(), 5, request.events);
   sqlite3_bind_int(row.get(), 6, request.respectsConsent ? 1 : 0);
   sqlite3_bind_int64(row.get(), 7, microseconds(post.kept));
   sqlite3_bind_int64(row.get(), 8, microseconds(post.notBefore));
   sqlite3_bind_int64(row.get(), 9, size);
   sqlite3_bind_int64(row.get(), 10, checksum(request.url, headers, request.body));
-  bind(row.get(), 11, request.url);
-  bind(row.get(), 12, headers);
+  bindText(row.get(), 11, request.url);
+  bindText(row.get(), 12, headers);
   sqlite3_bind_blob64(row.get(), 13, request.body.data(), request.body.size(), SQLITE_STATIC);
   step(row.get());
   _bytes += sizeOf(request);
@@ -220,7 +220,7 @@ std::vector<WaitingPost> OutboxStore::posts(std::string_view host, std::int64_t 
   std::size_t total = 0;
   {
     auto row = statement(kSelect);
-    bind(row.get(), 1, host);
+    bindText(row.get(), 1, host);
     sqlite3_bind_int64(row.get(), 2, id);
     sqlite3_bind_int64(row.get(), 3, microseconds(now));
     sqlite3_bind_int64(row.get(), 4, static_cast<std::int64_t>(count));
@@ -309,6 +309,6 @@ void OutboxStore::check(int result) {
   if (result != SQLITE_OK) fail();
 }
 
-void OutboxStore::fail() { throw OutboxStoreError(sqlite3_errcode(_database.get())); }
+void OutboxStore::fail() { throw OutboxStoreError(sqlite3_errcode(_database.get()), sqlite3_errmsg(_database.get())); }
 
 }  // namespace vesk

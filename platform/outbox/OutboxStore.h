@@ -25,7 +25,7 @@ struct WaitingPost {
 /// Why the store could not do something. Everything that it was asked for is undone.
 class OutboxStoreError : public std::runtime_error {
  public:
-  explicit OutboxStoreError(int sqliteCode);
+  OutboxStoreError(int sqliteCode, const char* text);
   /// The file is damaged, as opposed to full or not accessible.
   bool isDamage() const;
   bool isFull() const;
