@@ -14,18 +14,23 @@ class OutboxRoad : public testing::Test {
  protected:
   /// Sends events, each answered by the daemon, while the collector is away.
   void sendInAnOutage(int first, int count) {
-    harness.waitForEventsOfMethod(0, ++sessions);  // the session's start has arrived
     harness.stopCollector();
     for (int n = first; n < first + count; ++n) {
-      const auto sent = client->reporting.sendMessageAndWait(message(3, Dictionary{{"n", n}}));
+      const auto sent = client->reporting.sendMessageAndWait(message(3, Dictionary{{"n", n}}, 1));
       ASSERT_TRUE(sent) << sent.detail;
     }
+  }
+  /// Starts the daemon and a session, whose first message has arrived when this returns.
+  void start(const Dictionary& sessionInfo = {}, const std::optional<Dictionary>& userInfo = std::nullopt) {
+    harness.startDaemon();
+    client.emplace(harness, sessionInfo, userInfo);
+    ASSERT_TRUE(client->reporting.sendMessageAndWait(message(9, {}, 1)));
+    harness.waitForEventsOfMethod(9, ++sessions);
   }
   void restart() {
     client.reset();
     harness.startCollector();
-    harness.startDaemon();
-    client.emplace(harness);
+    start();
   }
   std::size_t putAside() {
     static const std::regex line("Outbox: ([0-9]+) posts are put aside");
@@ -50,8 +55,7 @@ class OutboxRoad : public testing::Test {
 };
 
 TEST_F(OutboxRoad, ConfirmedEventsSurviveAKillAndAStop) {
-  harness.startDaemon();
-  client.emplace(harness);
+  start();
   sendInAnOutage(0, 10);
   ASSERT_TRUE(eventually([&] { return putAside() >= 10; })) << harness.daemon().errors();
   harness.daemon().signal(SIGKILL);
@@ -71,11 +75,16 @@ TEST_F(OutboxRoad, WithdrawnConsentDeletesWhatWaits) {
 version = "1"
 [[release.httpPost.clients]]
 client = "Camera"
+locale_whitelist = ["US"]
+sampling_threshold = 1.0
+expedite = 0
 post_url = "@EVENTS@"
+[[release.httpPost.clients.filters]]
+key = "secret"
+action = "remove"
 )");
   const Dictionary user{{kVeskReportingUserInfoClientName, "Camera"}};
-  harness.startDaemon();
-  client.emplace(harness, Dictionary{{kVeskReportingSessionInfoRequireUserInfo, true}}, user);
+  start(Dictionary{{kVeskReportingSessionInfoRequireUserInfo, true}}, user);
   sendInAnOutage(0, 3);
   EXPECT_EQ(harness.stopDaemon(), 0);
   client.reset();
