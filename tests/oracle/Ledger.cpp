@@ -1,8 +1,10 @@
 #include "tests/oracle/Ledger.h"
 
+#include <algorithm>
 #include <boost/json.hpp>
 #include <cinttypes>
 #include <cstdio>
+#include <iterator>
 #include <sstream>
 
 #include "tests/oracle/OracleMessage.h"
@@ -68,21 +70,30 @@ void Ledger::readEvent(const std::string& line) {
   if (!_arrived.insert(id->as_int64()).second) ++_again;
 }
 
+std::vector<std::int64_t> Ledger::missing(const Account& account) const {
+  std::vector<std::int64_t> missing;
+  std::copy_if(account.accepted.begin(), account.accepted.end(), std::back_inserter(missing),
+               [this](std::int64_t id) { return !_arrived.contains(id); });
+  return missing;
+}
+
+bool Ledger::isCovered() const {
+  return std::all_of(_accounts.begin(), _accounts.end(), [this](const auto& entry) {
+    const Account& account = entry.second;
+    return account.end == DaemonEnd::Killed || missing(account).size() <= account.counted;
+  });
+}
+
 bool Ledger::judge(std::uint64_t incarnation, const Account& account) const {
-  std::uint64_t missing = 0;
-  std::int64_t firstMissing = 0;
-  for (std::int64_t id : account.accepted) {
-    if (_arrived.contains(id)) continue;
-    if (missing++ == 0 || id < firstMissing) firstMissing = id;
-  }
+  const auto missing = this->missing(account);
   const bool isKilled = account.end == DaemonEnd::Killed;
-  std::printf("oracle: daemon %" PRIu64 ": %s, accepted %zu, missing %" PRIu64 ", counted %" PRIu64 "%s%s\n",
-              incarnation, isKilled ? "killed" : "terminated", account.accepted.size(), missing,
+  std::printf("oracle: daemon %" PRIu64 ": %s, accepted %zu, missing %zu, counted %" PRIu64 "%s%s\n",
+              incarnation, isKilled ? "killed" : "terminated", account.accepted.size(), missing.size(),
               account.counted, account.reasons.empty() ? "" : ": ", account.reasons.c_str());
-  if (isKilled || missing <= account.counted) return true;
+  if (isKilled || missing.size() <= account.counted) return true;
   std::printf("oracle: LOST: daemon %" PRIu64 " accepted message %" PRId64
               ", which neither arrived nor was counted\n",
-              incarnation, firstMissing);
+              incarnation, *std::min_element(missing.begin(), missing.end()));
   return false;
 }
 

@@ -37,6 +37,9 @@ class Ledger {
   void readEvents(const std::string& path);
   bool hasArrived(std::int64_t id) const { return _arrived.contains(id); }
 
+  /// Whether every terminated daemon's losses are covered by what has arrived so far.
+  bool isCovered() const;
+
   /// Prints the accounts. Returns true if every daemon's losses are covered, no message was changed, and
   /// messages were accepted, including some after a restart.
   bool judge() const;
@@ -49,6 +52,7 @@ class Ledger {
     std::vector<std::int64_t> accepted;
   };
   void readEvent(const std::string& line);
+  std::vector<std::int64_t> missing(const Account& account) const;
   bool judge(std::uint64_t incarnation, const Account& account) const;
 
   std::map<std::uint64_t, Account> _accounts;
