@@ -51,36 +51,34 @@ std::string PersistentIdentifiers::identifier(bool respectsConsent) {
 
 PersistentIdentifiers::Pair PersistentIdentifiers::load() const {
   // Usually the file is complete or absent, and reading it needs no lock.
-  if (SmallFile file = readSmallFile(_path, kMaximumFile); file.bytes) {
-    if (auto known = parse(*file.bytes)) return *known;
+  if (const auto file = readSmallFile(_path, kMaximumFile)) {
+    if (auto known = parse(*file)) return *known;
   }
   std::error_code ignored;
   std::filesystem::create_directories(std::filesystem::path(_path).parent_path(), ignored);
-  FileDescriptor lock;
-  int cause = lockFile(lock, _path + ".lock", kPatience);
+  const auto lock = lockFile(_path + ".lock", kPatience);
   if (lock) {
     if (auto known = readFile()) return *known;
   }
   Pair pair{uuidText(makeUUID()), uuidText(makeUUID())};
-  if (lock) cause = store(pair);
-  if (cause != 0) {
+  if (const auto stored = lock ? store(pair) : lock.error(); !stored) {
     VESK_LOG_WARNING("VeskReporting: cannot keep identifiers in %s: %s; they last as long as this process",
-                     _path.c_str(), std::strerror(cause));
+                     _path.c_str(), stored.error().text.c_str());
   }
   return pair;
 }
 
 // Reads the identifiers, and moves a file without usable ones out of the way.
 std::optional<PersistentIdentifiers::Pair> PersistentIdentifiers::readFile() const {
-  SmallFile file = readSmallFile(_path, kMaximumFile);
-  if (file.missing) return std::nullopt;
-  if (file.bytes) {
-    if (auto pair = parse(*file.bytes)) return pair;
+  const auto file = readSmallFile(_path, kMaximumFile);
+  if (!file && file.error().kind == Error::Kind::Missing) return std::nullopt;
+  if (file) {
+    if (auto pair = parse(*file)) return pair;
     VESK_LOG_WARNING("VeskReporting: %s holds no identifiers; kept as %s.bad, new ones are made",
                      _path.c_str(), _path.c_str());
   } else {
     VESK_LOG_WARNING("VeskReporting: cannot read %s: %s; kept as %s.bad, new identifiers are made",
-                     _path.c_str(), file.error.c_str(), _path.c_str());
+                     _path.c_str(), file.error().text.c_str(), _path.c_str());
   }
   if (std::rename(_path.c_str(), (_path + ".bad").c_str()) != 0) {
     VESK_LOG_WARNING("VeskReporting: cannot rename %s: %s", _path.c_str(), std::strerror(errno));
@@ -88,7 +86,7 @@ std::optional<PersistentIdentifiers::Pair> PersistentIdentifiers::readFile() con
   return std::nullopt;
 }
 
-int PersistentIdentifiers::store(const Pair& pair) const {
+Result<void> PersistentIdentifiers::store(const Pair& pair) const {
   std::string text = "# Identifiers of this device, one for each consent mode. Made once; delete to renew.\n";
   text += std::string(kRespecting) + " = \"" + pair.respecting + "\"\n";
   text += std::string(kOverriding) + " = \"" + pair.overriding + "\"\n";
@@ -96,13 +94,13 @@ int PersistentIdentifiers::store(const Pair& pair) const {
   // Only the lock's holder uses this name. A leftover of a crashed process is overwritten.
   std::string temporary = _path + ".new";
   ::unlink(temporary.c_str());
-  FileDescriptor file = makePrivateFile(temporary);
-  if (!file) return errno;
-  int cause = writeAll(file.get(), text);
-  if (cause == 0 && (::fsync(file.get()) != 0 || std::rename(temporary.c_str(), _path.c_str()) != 0))
-    cause = errno;
-  if (cause != 0) ::unlink(temporary.c_str());
-  return cause;
+  const auto file = makePrivateFile(temporary);
+  if (!file) return file.error();
+  auto stored = writeAll(file->get(), text);
+  if (stored && (::fsync(file->get()) != 0 || std::rename(temporary.c_str(), _path.c_str()) != 0))
+    stored = systemError(errno);
+  if (!stored) ::unlink(temporary.c_str());
+  return stored;
 }
 
 // Parses what `store` writes: comments, blank lines and `key = "identifier"`.

@@ -4,6 +4,7 @@
 #include <optional>
 #include <string>
 
+#include "platform/result/Result.h"
 #include "platform/sync/Mutex.h"
 
 namespace vesk {
@@ -30,8 +31,7 @@ class PersistentIdentifiers {
 
   Pair load() const;
   std::optional<Pair> readFile() const;
-  /// Returns 0, or the errno of the failed step.
-  int store(const Pair& pair) const;
+  Result<void> store(const Pair& pair) const;
   static std::optional<Pair> parse(const std::string& text);
 
   const std::string _path;

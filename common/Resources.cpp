@@ -19,11 +19,12 @@ constexpr std::size_t kMaximumPublicKey = std::size_t{64} << 10;
 /// Reads one of the library's installed files.
 std::optional<std::string> readResource(const char* name, std::size_t limit) {
   std::string path = pathUnderRoot("/usr/share/veskreporting/") + name;
-  SmallFile file = readTrustedFile(path, limit);
-  if (!file.bytes && !file.missing && !file.reported) {
-    VESK_LOG_WARNING("VeskReporting: cannot read %s: %s", path.c_str(), file.error.c_str());
-  }
-  return std::move(file.bytes);
+  auto bytes = readTrustedFile(path, limit);
+  if (bytes) return *std::move(bytes);
+  const Error& error = bytes.error();
+  if (error.kind != Error::Kind::Missing && error.kind != Error::Kind::Untrusted)
+    VESK_LOG_WARNING("VeskReporting: cannot read %s: %s", path.c_str(), error.text.c_str());
+  return std::nullopt;
 }
 
 // The version is put into a URL unescaped, so it must be a single printable word.

@@ -29,8 +29,8 @@ int run(const vesk::DaemonOptions& options) {
   vesk::VeskReportingLogging::startLogging("veskreportingd", "Daemon");
   vesk::SystemLog::setPatience(kPatienceOfLog);
   if (options.sandbox) {
-    if (auto error = vesk::enterSandbox(kServiceName)) {
-      VESK_LOG_ERROR("main: confine_enter() fails: %s\n", error->c_str());
+    if (auto entered = vesk::enterSandbox(kServiceName); !entered) {
+      VESK_LOG_ERROR("main: confine_enter() fails: %s\n", entered.error().text.c_str());
       return -1;
     }
   }

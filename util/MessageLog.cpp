@@ -145,7 +145,7 @@ Appended append(int file, std::string_view line, std::int64_t maximumBytes) {
   struct stat status {};
   if (::fstat(file, &status) != 0 || !S_ISREG(status.st_mode)) return Appended::No;
   if (status.st_size + static_cast<std::int64_t>(line.size()) > maximumBytes) return Appended::Full;
-  return writeAll(file, line) == 0 ? Appended::Yes : Appended::No;
+  return writeAll(file, line) ? Appended::Yes : Appended::No;
 }
 
 std::chrono::nanoseconds sinceEpoch(const timespec& time) {

@@ -53,10 +53,10 @@ std::string unquoted(std::string_view word) {
 }
 
 std::optional<std::string> osReleaseValue(std::string_view name) {
-  SmallFile file = readSmallFile(pathUnderRoot("/etc/os-release"), kLargestFile);
-  if (!file.bytes) file = readSmallFile(pathUnderRoot("/usr/lib/os-release"), kLargestFile);
-  if (!file.bytes) return std::nullopt;
-  std::string_view rest = *file.bytes;
+  auto file = readSmallFile(pathUnderRoot("/etc/os-release"), kLargestFile);
+  if (!file) file = readSmallFile(pathUnderRoot("/usr/lib/os-release"), kLargestFile);
+  if (!file) return std::nullopt;
+  std::string_view rest = *file;
   while (!rest.empty()) {
     std::string_view line = rest.substr(0, rest.find('\n'));
     rest.remove_prefix(std::min(rest.size(), line.size() + 1));
@@ -69,9 +69,9 @@ std::optional<std::string> osReleaseValue(std::string_view name) {
 }
 
 std::optional<std::string> deviceIdentifier() {
-  SmallFile file = readSmallFile(pathUnderRoot("/etc/machine-id"), 128);
-  if (!file.bytes) return std::nullopt;
-  std::string_view machineID = std::string_view(*file.bytes).substr(0, file.bytes->find('\n'));
+  const auto file = readSmallFile(pathUnderRoot("/etc/machine-id"), 128);
+  if (!file) return std::nullopt;
+  const std::string_view machineID = std::string_view(*file).substr(0, file->find('\n'));
   const bool isMachineID =
       machineID.size() == 32 && std::all_of(machineID.begin(), machineID.end(), [](char c) {
         return std::isxdigit(static_cast<unsigned char>(c)) != 0;

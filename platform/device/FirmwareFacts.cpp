@@ -46,9 +46,9 @@ std::string firstText(std::string_view bytes) {
 std::optional<std::string> firmwareFact(std::string_view key, const std::string& root) {
   for (const Source& source : kSources) {
     if (source.key != key) continue;
-    SmallFile file = readSmallFile(root + source.path, 4096);
-    if (!file.bytes) continue;
-    std::string fact = firstText(*file.bytes);
+    const auto file = readSmallFile(root + source.path, 4096);
+    if (!file) continue;
+    std::string fact = firstText(*file);
     if (!fact.empty() && std::find(kFillers.begin(), kFillers.end(), fact) == kFillers.end()) return fact;
   }
   return std::nullopt;

@@ -16,19 +16,19 @@ constexpr std::chrono::milliseconds kBetweenAttempts{10};
 
 }  // namespace
 
-int lockFile(FileDescriptor& lock, const std::string& path, std::chrono::milliseconds patience) {
-  lock.reset();
-  FileDescriptor file = makePrivateFile(path);
-  if (!file && errno == EEXIST) file = FileDescriptor(::open(path.c_str(), O_RDWR | O_CLOEXEC | O_NOFOLLOW));
-  if (!file) return errno;
+Result<FileDescriptor> lockFile(const std::string& path, std::chrono::milliseconds patience) {
+  auto file = makePrivateFile(path);
+  if (!file && file.error().kind == Error::Kind::Exists)
+    file = FileDescriptor(::open(path.c_str(), O_RDWR | O_CLOEXEC | O_NOFOLLOW));
+  if (!file) return file;
+  if (!*file) return systemError(errno);
   const auto deadline = std::chrono::steady_clock::now() + patience;
-  while (::flock(file.get(), LOCK_EX | LOCK_NB) != 0) {
+  while (::flock(file->get(), LOCK_EX | LOCK_NB) != 0) {
     const int cause = errno;
-    if (cause != EWOULDBLOCK || std::chrono::steady_clock::now() >= deadline) return cause;
+    if (cause != EWOULDBLOCK || std::chrono::steady_clock::now() >= deadline) return systemError(cause);
     std::this_thread::sleep_for(kBetweenAttempts);
   }
-  lock = std::move(file);
-  return 0;
+  return file;
 }
 
 }  // namespace vesk

@@ -5,13 +5,13 @@
 #include <string>
 
 #include "platform/files/FileDescriptor.h"
+#include "platform/result/Result.h"
 
 namespace vesk {
 
-/// Opens the file at `path`, creating it like `makePrivateFile` if missing, and locks it until `lock` is
-/// closed. The lock excludes other processes and other descriptors of this one. Waits up to `patience` for
-/// another holder. Returns 0 or the error number, EWOULDBLOCK if the lock is still held; `lock` is empty
-/// then.
-[[nodiscard]] int lockFile(FileDescriptor& lock, const std::string& path, std::chrono::milliseconds patience);
+/// Opens the file at `path`, creating it like `makePrivateFile` if missing, and locks it until the returned
+/// descriptor is closed. The lock excludes other processes and other descriptors of this one. Waits up to
+/// `patience` for another holder; the error's kind is Busy if the lock is still held then.
+Result<FileDescriptor> lockFile(const std::string& path, std::chrono::milliseconds patience);
 
 }  // namespace vesk

@@ -4,12 +4,13 @@
 #include <string>
 
 #include "platform/files/FileDescriptor.h"
+#include "platform/result/Result.h"
 
 namespace vesk {
 
-/// Creates a file at `path` with mode 0600, opened for reading and writing. Fails with EEXIST if something
-/// exists there. If root creates it, it belongs to the directory's owner, since that user needs it later.
-/// Returns an empty descriptor, with errno set, on failure.
-[[nodiscard]] FileDescriptor makePrivateFile(const std::string& path);
+/// Creates a file at `path` with mode 0600, opened for reading and writing. The error's kind is Exists if
+/// something is there. If root creates it, it belongs to the directory's owner, since that user needs it
+/// later.
+Result<FileDescriptor> makePrivateFile(const std::string& path);
 
 }  // namespace vesk

@@ -5,6 +5,7 @@
 
 #include <cstdio>
 #include <set>
+#include <utility>
 
 #include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
@@ -14,15 +15,16 @@ namespace vesk {
 
 namespace {
 
-/// The reason why the file is not trusted; "" if it is trusted.
-std::string distrust(const struct stat& status, TrustedOwner owner) {
+Error untrusted(std::string reason) { return {Error::Kind::Untrusted, std::move(reason)}; }
+
+Result<void> checkTrust(const struct stat& status, TrustedOwner owner) {
   const bool mayBeOwn = owner == TrustedOwner::OwnUser || !rootPrefix().empty();
   if (status.st_uid != 0 && !(mayBeOwn && status.st_uid == ::geteuid()))
-    return "it belongs to user " + std::to_string(status.st_uid);
+    return untrusted("it belongs to user " + std::to_string(status.st_uid));
   if ((status.st_mode & (S_IWGRP | S_IWOTH)) == 0) return {};
   char mode[8];
   std::snprintf(mode, sizeof mode, "%04o", static_cast<unsigned>(status.st_mode & 07777));
-  return std::string("others than its owner can write to it (mode ") + mode + ")";
+  return untrusted(std::string("others than its owner can write to it (mode ") + mode + ")");
 }
 
 void reportOnce(const std::string& path, const std::string& reason) {
@@ -37,14 +39,11 @@ void reportOnce(const std::string& path, const std::string& reason) {
 
 }  // namespace
 
-SmallFile readTrustedFile(const std::string& path, std::size_t limit, TrustedOwner owner) {
-  std::string reason;
-  SmallFile file =
-      readSmallFile(path, limit, [&](const struct stat& status) { return reason = distrust(status, owner); });
-  if (reason.empty()) return file;
-  file.reported = true;
-  reportOnce(path, reason);
-  return file;
+Result<std::string> readTrustedFile(const std::string& path, std::size_t limit, TrustedOwner owner) {
+  auto bytes =
+      readSmallFile(path, limit, [&](const struct stat& status) { return checkTrust(status, owner); });
+  if (!bytes && bytes.error().kind == Error::Kind::Untrusted) reportOnce(path, bytes.error().text);
+  return bytes;
 }
 
 }  // namespace vesk

@@ -14,10 +14,10 @@ enum class TrustedOwner : unsigned char {
   OwnUser,  ///< the process's own user
 };
 
-/// Like `readSmallFile`, but refuses a file with another owner or that is writable by its group or others.
-/// Logs each refusal once in the life of the process, in a level-4 line with path and reason, and marks the
-/// outcome as `reported`.
-SmallFile readTrustedFile(const std::string& path, std::size_t limit,
-                          TrustedOwner owner = TrustedOwner::Root);
+/// Like `readSmallFile`, but refuses a file with another owner or that is writable by its group or others:
+/// the error's kind is Untrusted. Logs each refusal once in the life of the process, in a level-4 line with
+/// path and reason; a caller need not log it again.
+Result<std::string> readTrustedFile(const std::string& path, std::size_t limit,
+                                    TrustedOwner owner = TrustedOwner::Root);
 
 }  // namespace vesk

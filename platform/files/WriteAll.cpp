@@ -6,15 +6,15 @@
 
 namespace vesk {
 
-int writeAll(int descriptor, std::string_view bytes) noexcept {
+Result<void> writeAll(int descriptor, std::string_view bytes) {
   while (!bytes.empty()) {
     const ssize_t count = ::write(descriptor, bytes.data(), bytes.size());
     if (count < 0 && errno == EINTR) continue;
-    if (count < 0) return errno;
-    if (count == 0) return EIO;  // no progress and no error: retrying might never end
+    if (count < 0) return systemError(errno);
+    if (count == 0) return systemError(EIO);  // no progress and no error: retrying might never end
     bytes.remove_prefix(static_cast<std::size_t>(count));
   }
-  return 0;
+  return {};
 }
 
 }  // namespace vesk

@@ -3,10 +3,11 @@
 
 #include <string_view>
 
+#include "platform/result/Result.h"
+
 namespace vesk {
 
-/// Writes all of `bytes`, in several pieces if necessary. Returns 0 or the error number; part of the bytes
-/// may have been written then.
-[[nodiscard]] int writeAll(int descriptor, std::string_view bytes) noexcept;
+/// Writes all of `bytes`, in several pieces if necessary. Part of them may have been written if it fails.
+Result<void> writeAll(int descriptor, std::string_view bytes);
 
 }  // namespace vesk

@@ -99,14 +99,15 @@ void PowerLog::run() {
 }
 
 void PowerLog::write(const std::vector<PowerLogEvent>& events) {
-  const std::string error = _file.append(events, _options.clock->now());
-  if (!error.empty()) {
+  const auto appended = _file.append(events, _options.clock->now());
+  if (!appended) {
     lost(events.size());
     if (!_isFailing) {
-      VESK_LOG_ERROR("PowerLog: %s: %s; events are lost", _options.path.c_str(), error.c_str());
+      VESK_LOG_ERROR("PowerLog: %s: %s; events are lost", _options.path.c_str(),
+                     appended.error().text.c_str());
     }
   }
-  _isFailing = !error.empty();
+  _isFailing = !appended;
 }
 
 }  // namespace vesk

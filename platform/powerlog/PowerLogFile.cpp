@@ -2,7 +2,6 @@
 
 #include <unistd.h>
 
-#include <cerrno>
 #include <cstdio>
 #include <filesystem>
 #include <system_error>
@@ -48,7 +47,7 @@ int bindText(sqlite3_stmt* statement, int index, const std::string& text) {
 
 }  // namespace
 
-std::string PowerLogFile::append(const std::vector<PowerLogEvent>& events, WallTime now) {
+Result<void> PowerLogFile::append(const std::vector<PowerLogEvent>& events, WallTime now) {
   int result = write(events, now);
   if (result == SQLITE_CORRUPT || result == SQLITE_NOTADB) {
     moveAside(result);
@@ -57,7 +56,7 @@ std::string PowerLogFile::append(const std::vector<PowerLogEvent>& events, WallT
   if (result == SQLITE_OK) return {};
   // Rolls back. The cause may be gone when the file is next opened.
   _database.reset();
-  return sqlite3_errstr(result);
+  return Error{Error::Kind::Failed, sqlite3_errstr(result)};
 }
 
 int PowerLogFile::write(const std::vector<PowerLogEvent>& events, WallTime now) {
@@ -81,8 +80,8 @@ int PowerLogFile::open() {
   _database.reset(database);
   if (result != SQLITE_OK) return result;
   // If two processes switch a new file to WAL simultaneously, SQLite fails one of them without waiting.
-  FileDescriptor lock;
-  if (lockFile(lock, _path + ".lock", kPatience) == EWOULDBLOCK) return SQLITE_BUSY;
+  const auto lock = lockFile(_path + ".lock", kPatience);
+  if (!lock && lock.error().kind == Error::Kind::Busy) return SQLITE_BUSY;
   sqlite3_busy_timeout(database, static_cast<int>(kPatience.count()));
   return execute(database, kSetUp);
 }

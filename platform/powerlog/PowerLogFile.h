@@ -6,6 +6,7 @@
 #include <utility>
 #include <vector>
 
+#include "platform/result/Result.h"
 #include "platform/sqlite/SQLiteHandles.h"
 #include "platform/time/Clock.h"
 
@@ -29,8 +30,8 @@ class PowerLogFile {
   PowerLogFile(std::string path, std::int64_t maximumRows)
       : _path(std::move(path)), _maximumRows(maximumRows) {}
 
-  /// Adds all events or none, then drops rows beyond the limits. Returns an error text, empty on success.
-  [[nodiscard]] std::string append(const std::vector<PowerLogEvent>& events, WallTime now);
+  /// Adds all events or none, then drops rows beyond the limits.
+  Result<void> append(const std::vector<PowerLogEvent>& events, WallTime now);
 
  private:
   // These return SQLite result codes.

@@ -118,31 +118,27 @@ bool hasKeyOfManyParts(std::string_view text) {
 
 }  // namespace
 
-TomlOutcome parseToml(std::string_view text) {
-  if (text.size() > kLargestDocument) return {std::nullopt, "larger than 1 MiB"};
-  if (hasKeyOfManyParts(text)) return {std::nullopt, "a key with more than 7 parts"};
+Result<Dictionary> parseToml(std::string_view text) {
+  if (text.size() > kLargestDocument) return malformed("larger than 1 MiB");
+  if (hasKeyOfManyParts(text)) return malformed("a key with more than 7 parts");
   toml::parse_result result = toml::parse(text);
-  if (result) return {dictionaryFromTable(result.table()), {}};
+  if (result) return dictionaryFromTable(result.table());
   const toml::parse_error& error = result.error();
   std::ostringstream words;
   words << "line " << error.source().begin.line << ", column " << error.source().begin.column << ": "
         << error.description();
-  return {std::nullopt, words.str()};
+  return malformed(words.str());
 }
 
 Dictionary readTomlFile(const std::string& path, TrustedOwner owner) {
-  SmallFile file = readTrustedFile(path, kLargestDocument, owner);
-  if (!file.bytes) {
-    if (!file.missing && !file.reported)
-      VESK_LOG_WARNING("%s is ignored: %s", path.c_str(), file.error.c_str());
-    return {};
-  }
-  TomlOutcome outcome = parseToml(*file.bytes);
-  if (!outcome.document) {
-    VESK_LOG_WARNING("%s is ignored: %s", path.c_str(), outcome.error.c_str());
-    return {};
-  }
-  return *std::move(outcome.document);
+  const auto bytes = readTrustedFile(path, kLargestDocument, owner);
+  auto document = bytes ? parseToml(*bytes) : bytes.error();
+  if (document) return *std::move(document);
+  // An untrusted file has been reported where it was refused.
+  const Error& error = document.error();
+  if (error.kind != Error::Kind::Missing && error.kind != Error::Kind::Untrusted)
+    VESK_LOG_WARNING("%s is ignored: %s", path.c_str(), error.text.c_str());
+  return {};
 }
 
 }  // namespace vesk

@@ -9,7 +9,6 @@
 #include <cerrno>
 #include <cstdint>
 #include <cstdlib>
-#include <system_error>
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/log/SystemLog.h"
@@ -58,10 +57,6 @@ std::uint64_t rights(SandboxPath::Access access) {
   return 0;
 }
 
-std::string failure(const std::string& what, int code) {
-  return what + ": " + std::generic_category().message(code);
-}
-
 long version() { return ::syscall(SYS_landlock_create_ruleset, nullptr, 0, LANDLOCK_CREATE_RULESET_VERSION); }
 
 /// A service manager may receive its services' notifications on an abstract socket.
@@ -83,10 +78,10 @@ FileDescriptor makeRuleset(long kernelVersion, bool restrictsConnections) {
       static_cast<int>(::syscall(SYS_landlock_create_ruleset, &ruleset, sizeof ruleset, 0)));
 }
 
-std::optional<std::string> addPort(int ruleset, std::uint16_t port) {
+Result<void> addPort(int ruleset, std::uint16_t port) {
   const PortRule rule{kConnectTCP, port};
-  if (::syscall(SYS_landlock_add_rule, ruleset, kPortRule, &rule, 0) == 0) return std::nullopt;
-  return failure("landlock_add_rule: port " + std::to_string(port), errno);
+  if (::syscall(SYS_landlock_add_rule, ruleset, kPortRule, &rule, 0) == 0) return {};
+  return systemError(errno, "landlock_add_rule: port " + std::to_string(port));
 }
 
 /// A rule applies to the current inode. The kernel creates inodes below /proc on demand, and creates a new
@@ -96,50 +91,50 @@ void keepIfMadeUp(FileDescriptor& descriptor, const std::string& path) {
     int kept = descriptor.release();
 }
 
-std::optional<std::string> addRule(int ruleset, const SandboxPath& path) {
+Result<void> addRule(int ruleset, const SandboxPath& path) {
   FileDescriptor target(::open(path.path.c_str(), O_PATH | O_CLOEXEC));
   if (!target) {
     bool nothingToGrant = errno == ENOENT || errno == ENOTDIR || errno == EACCES;
-    if (path.optional && nothingToGrant) return std::nullopt;
-    return failure(path.path, errno);
+    if (path.optional && nothingToGrant) return {};
+    return systemError(errno, path.path);
   }
   struct stat status {};
-  if (::fstat(target.get(), &status) != 0) return failure(path.path, errno);
+  if (::fstat(target.get(), &status) != 0) return systemError(errno, path.path);
   landlock_path_beneath_attr rule{};
   rule.allowed_access = rights(path.access);
   if (!S_ISDIR(status.st_mode)) rule.allowed_access &= kFileRights;
   rule.parent_fd = target.get();
   if (::syscall(SYS_landlock_add_rule, ruleset, LANDLOCK_RULE_PATH_BENEATH, &rule, 0) != 0) {
-    return failure("landlock_add_rule: " + path.path, errno);
+    return systemError(errno, "landlock_add_rule: " + path.path);
   }
   keepIfMadeUp(target, path.path);
-  return std::nullopt;
+  return {};
 }
 
 }  // namespace
 
-std::optional<std::string> enterLandlock(const SandboxProfile& profile) {
+Result<void> enterLandlock(const SandboxProfile& profile) {
   const long kernelVersion = version();
   if (kernelVersion < 1) {
-    std::string error = failure("this kernel offers no Landlock", errno);
+    Error error = systemError(errno, "this kernel offers no Landlock");
     if (profile.landlockRequired) return error;
-    VESK_LOG_WARNING("restrictFiles: %s; files are not restricted", error.c_str());
-    return std::nullopt;
+    VESK_LOG_WARNING("restrictFiles: %s; files are not restricted", error.text.c_str());
+    return {};
   }
   FileDescriptor ruleset = makeRuleset(kernelVersion, profile.connectPorts.has_value());
-  if (!ruleset) return failure("landlock_create_ruleset", errno);
+  if (!ruleset) return systemError(errno, "landlock_create_ruleset");
   for (const SandboxPath& path : profile.paths) {
-    if (auto error = addRule(ruleset.get(), path)) return error;
+    if (auto added = addRule(ruleset.get(), path); !added) return added;
   }
   if (kernelVersion >= 4 && profile.connectPorts) {
     for (std::uint16_t port : *profile.connectPorts) {
-      if (auto error = addPort(ruleset.get(), port)) return error;
+      if (auto added = addPort(ruleset.get(), port); !added) return added;
     }
   }
   if (::syscall(SYS_landlock_restrict_self, ruleset.get(), 0) != 0) {
-    return failure("landlock_restrict_self", errno);
+    return systemError(errno, "landlock_restrict_self");
   }
-  return std::nullopt;
+  return {};
 }
 
 }  // namespace vesk

@@ -1,9 +1,7 @@
 // Restricts the files, ports and processes that the process may use.
 #pragma once
 
-#include <optional>
-#include <string>
-
+#include "platform/result/Result.h"
 #include "platform/sandbox/SandboxProfile.h"
 
 namespace vesk {
@@ -15,7 +13,7 @@ namespace vesk {
 ///
 /// If the kernel supports it, no TCP port can be bound and only the profile's ports can be connected to
 /// (version 4), and neither signals nor abstract Unix sockets reach an outside process (version 6). An older
-/// kernel restricts less, which is not an error. Returns a description of the error, if any.
-[[nodiscard]] std::optional<std::string> enterLandlock(const SandboxProfile& profile);
+/// kernel restricts less, which is not an error.
+Result<void> enterLandlock(const SandboxProfile& profile);
 
 }  // namespace vesk

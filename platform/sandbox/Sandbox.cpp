@@ -26,26 +26,27 @@ bool hasOtherThreads() {
   return error || std::distance(begin(threads), end(threads)) != 1;
 }
 
-std::optional<std::string> enter(const SandboxProfile& profile) {
-  if (hasOtherThreads()) return "threads of the process can't be confined any more";
-  if (auto error = makeDirectories(profile.paths)) return error;
-  if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) {
-    return "no_new_privs: " + std::generic_category().message(errno);
-  }
-  if (auto error = enterLandlock(profile)) return error;
+Result<void> enter(const SandboxProfile& profile) {
+  if (hasOtherThreads())
+    return Error{Error::Kind::Failed, "threads of the process can't be confined any more"};
+  if (auto made = makeDirectories(profile.paths); !made) return made;
+  if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) return systemError(errno, "no_new_privs");
+  if (auto entered = enterLandlock(profile); !entered) return entered;
   return denyCalls(profile.deniedCalls);
 }
 
 }  // namespace
 
-std::optional<std::string> enterSandbox(std::string_view profileName) {
-  if (!isPlainFileName(profileName)) return "\"" + std::string(profileName) + "\" is no name of a profile";
+Result<void> enterSandbox(std::string_view profileName) {
+  if (!isPlainFileName(profileName))
+    return malformed("\"" + std::string(profileName) + "\" is no name of a profile");
   std::string path = pathUnderRoot("/usr/share/veskreporting/sandbox/" + std::string(profileName) + ".toml");
-  SmallFile file = readTrustedFile(path, kMaximumProfile);
-  if (!file.bytes) return path + ": " + (file.missing ? "no such file" : file.error);
-  SandboxProfileOutcome outcome = parseSandboxProfile(*file.bytes);
-  if (!outcome.profile) return path + ": " + outcome.error;
-  return enter(*outcome.profile);
+  const auto file = readTrustedFile(path, kMaximumProfile);
+  const auto profile = file ? parseSandboxProfile(*file) : file.error();
+  if (profile) return enter(*profile);
+  Error error = profile.error();
+  error.text = path + ": " + (error.kind == Error::Kind::Missing ? "no such file" : error.text);
+  return error;
 }
 
 }  // namespace vesk

@@ -1,9 +1,9 @@
 // Confines the process.
 #pragma once
 
-#include <optional>
-#include <string>
 #include <string_view>
+
+#include "platform/result/Result.h"
 
 namespace vesk {
 
@@ -13,8 +13,7 @@ namespace vesk {
 /// format.
 ///
 /// Fails if the process already has another thread, since Landlock confines only the calling thread and
-/// threads created later. Returns a description of the error, if any; the process may then be partly confined
-/// and should exit.
-[[nodiscard]] std::optional<std::string> enterSandbox(std::string_view profileName);
+/// threads created later. After a failure the process may be partly confined and should exit.
+Result<void> enterSandbox(std::string_view profileName);
 
 }  // namespace vesk

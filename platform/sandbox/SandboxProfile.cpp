@@ -29,13 +29,9 @@ constexpr PathKey kPathKeys[] = {
     {"remove-if-present", SandboxPath::Access::Remove, true},
 };
 
-/// Thrown only within this file.
-struct BadProfile {
-  std::string error;
-};
-
+/// What it throws is caught in this file.
 [[noreturn]] void fail(const std::string& where, const std::string& what) {
-  throw BadProfile{where + ": " + what};
+  throw malformed(where + ": " + what);
 }
 
 std::string inQuotes(std::string_view text) { return "\"" + std::string(text) + "\""; }
@@ -129,17 +125,17 @@ SandboxProfile profileFrom(const Dictionary& document) {
 
 }  // namespace
 
-SandboxProfileOutcome parseSandboxProfile(std::string_view toml) {
-  TomlOutcome outcome = parseToml(toml);
-  if (!outcome.document) return {std::nullopt, std::move(outcome.error)};
+Result<SandboxProfile> parseSandboxProfile(std::string_view toml) {
+  const auto document = parseToml(toml);
+  if (!document) return document.error();
   try {
-    return {profileFrom(*outcome.document), {}};
-  } catch (BadProfile& bad) {
-    return {std::nullopt, std::move(bad.error)};
+    return profileFrom(*document);
+  } catch (const Error& error) {
+    return error;
   }
 }
 
-std::optional<std::string> makeDirectories(const std::vector<SandboxPath>& paths) {
+Result<void> makeDirectories(const std::vector<SandboxPath>& paths) {
   for (const SandboxPath& path : paths) {
     if (path.access == SandboxPath::Access::Read || path.optional) continue;
     std::error_code error;
@@ -147,9 +143,9 @@ std::optional<std::string> makeDirectories(const std::vector<SandboxPath>& paths
     fs::create_directories(path.path, error);
     auto mode = path.access == SandboxPath::Access::Sockets ? fs::perms{0755} : fs::perms{0750};
     if (!error) fs::permissions(path.path, mode, error);
-    if (error) return path.path + ": " + error.message();
+    if (error) return systemError(error.value(), path.path);
   }
-  return std::nullopt;
+  return {};
 }
 
 }  // namespace vesk

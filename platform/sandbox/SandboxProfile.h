@@ -7,6 +7,8 @@
 #include <string_view>
 #include <vector>
 
+#include "platform/result/Result.h"
+
 namespace vesk {
 
 /// A file, or a directory with its contents, that the process may use.
@@ -31,11 +33,6 @@ struct SandboxProfile {
   std::vector<std::string> deniedCalls;  ///< names of groups known to Seccomp.h
 };
 
-struct SandboxProfileOutcome {
-  std::optional<SandboxProfile> profile;
-  std::string error;
-};
-
 /// Reads a profile from TOML. Unknown keys and groups of calls are errors: a typo must not widen access.
 ///
 ///     landlock = "required"           # or "if-available"
@@ -53,9 +50,9 @@ struct SandboxProfileOutcome {
 ///
 /// A path may begin with an environment variable ("$HOME/.config"); the entry is left out if that is unset or
 /// not an absolute path. Paths are resolved textually: "$SSL_CERT_FILE/.." is the directory of that file.
-SandboxProfileOutcome parseSandboxProfile(std::string_view toml);
+Result<SandboxProfile> parseSandboxProfile(std::string_view toml);
 
-/// Creates missing directories among those to be written to. Returns a description of the error, if any.
-[[nodiscard]] std::optional<std::string> makeDirectories(const std::vector<SandboxPath>& paths);
+/// Creates missing directories among those to be written to.
+Result<void> makeDirectories(const std::vector<SandboxPath>& paths);
 
 }  // namespace vesk

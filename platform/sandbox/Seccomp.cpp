@@ -15,7 +15,6 @@
 #include <cerrno>
 #include <cstdint>
 #include <memory>
-#include <system_error>
 
 namespace vesk {
 
@@ -181,10 +180,10 @@ bool isCallGroup(std::string_view name) {
   return std::ranges::find(rules, name, &Rule::group) != rules.end();
 }
 
-std::optional<std::string> denyCalls(const std::vector<std::string>& groups) {
+Result<void> denyCalls(const std::vector<std::string>& groups) {
   const int result = groups.empty() ? 0 : load(groups);
-  if (result == 0) return std::nullopt;
-  return "the system-call filter can't be loaded: " + std::generic_category().message(-result);
+  if (result == 0) return {};
+  return systemError(-result, "the system-call filter can't be loaded");
 }
 
 }  // namespace vesk

@@ -1,10 +1,11 @@
 // Restricts the system calls that the process may make.
 #pragma once
 
-#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
+
+#include "platform/result/Result.h"
 
 namespace vesk {
 
@@ -13,9 +14,8 @@ namespace vesk {
 /// process. Requires no_new_privs.
 ///
 /// The filter denies what a daemon doesn't need and allows the rest. An allow list would have to name every
-/// call that future versions of the libraries may make. `groups` must be known groups. Returns a description
-/// of the error, if any.
-[[nodiscard]] std::optional<std::string> denyCalls(const std::vector<std::string>& groups);
+/// call that future versions of the libraries may make. `groups` must be known groups.
+Result<void> denyCalls(const std::vector<std::string>& groups);
 
 /// Whether there is a group with that name. The groups: "execute" (run a program), "processes" (create one),
 /// "other-processes" (signal, limit or schedule another one), "trace" (inspect another one), "namespaces",

@@ -2,7 +2,6 @@
 
 #include <unistd.h>
 
-#include <cstring>
 #include <string>
 
 #include "platform/files/WriteAll.h"
@@ -12,8 +11,7 @@ namespace vesk {
 
 namespace {
 
-/// Returns 0 or the error number.
-int writeLine(int descriptor, std::string_view line) {
+Result<void> writeLine(int descriptor, std::string_view line) {
   return writeAll(descriptor, std::string(line) + "\n");
 }
 
@@ -27,7 +25,7 @@ void Console::event(std::string_view lines) {
 void Console::note(std::string_view line) {
   MutexLock lock(_mutex);
   if (_style == Style::JSON) {
-    writeLine(STDERR_FILENO, printable(line));
+    static_cast<void>(writeLine(STDERR_FILENO, printable(line)));
   } else {
     writeOutput(printable(line));
   }
@@ -35,15 +33,16 @@ void Console::note(std::string_view line) {
 
 void Console::problem(std::string_view line) {
   MutexLock lock(_mutex);
-  writeLine(STDERR_FILENO, printable(line));
+  static_cast<void>(writeLine(STDERR_FILENO, printable(line)));
 }
 
 void Console::writeOutput(std::string_view line) {
   if (_outputClosed) return;
-  int error = writeLine(STDOUT_FILENO, line);
-  if (error == 0) return;
+  const auto written = writeLine(STDOUT_FILENO, line);
+  if (written) return;
   _outputClosed = true;
-  writeLine(STDERR_FILENO, std::string("standard output is gone, going on without: ") + std::strerror(error));
+  static_cast<void>(
+      writeLine(STDERR_FILENO, "standard output is gone, going on without: " + written.error().text));
 }
 
 }  // namespace vesk

@@ -38,7 +38,7 @@ class Replacement {
 
   void fill(std::string_view contents, mode_t mode) {
     if (::fchmod(_file.get(), mode) != 0) fail(_path, errno);
-    if (int error = writeAll(_file.get(), contents)) fail(_path, error);
+    if (auto written = writeAll(_file.get(), contents); !written) fail(_path, written.error().number);
     if (::fsync(_file.get()) != 0) fail(_path, errno);
   }
 
@@ -56,9 +56,9 @@ class Replacement {
 }  // namespace
 
 std::string readWholeFile(const std::filesystem::path& path, std::size_t limit) {
-  SmallFile file = readSmallFile(path.string(), limit);
-  if (!file.bytes) throw std::runtime_error("can't read " + path.string() + ": " + file.error);
-  return *std::move(file.bytes);
+  auto bytes = readSmallFile(path.string(), limit);
+  if (!bytes) throw std::runtime_error("can't read " + path.string() + ": " + bytes.error().text);
+  return *std::move(bytes);
 }
 
 void writeWholeFile(const std::filesystem::path& path, std::string_view contents, mode_t mode) {

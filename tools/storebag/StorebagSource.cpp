@@ -22,9 +22,9 @@ Dictionary fromJSON(const std::string& text) {
 }
 
 Dictionary fromTOML(const std::string& text) {
-  TomlOutcome outcome = parseToml(text);
-  if (!outcome.document) throw std::runtime_error(outcome.error);
-  return *outcome.document;
+  auto document = parseToml(text);
+  if (!document) throw std::runtime_error(document.error().text);
+  return *std::move(document);
 }
 
 Dictionary parse(const std::filesystem::path& file) {

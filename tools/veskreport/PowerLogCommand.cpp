@@ -101,11 +101,11 @@ int runPowerLog(const Invocation& invocation, const Output& output) {
     return output.failed(path + ": " + (unknown ? unknown.message() : "nothing has been recorded"));
   }
   int status = kExitDone;
-  std::string error = readPowerLog(path, since, [&](const PowerLogEvent& event) {
+  const auto read = readPowerLog(path, since, [&](const PowerLogEvent& event) {
     status = show(event, output);
     return status == kExitDone;
   });
-  return error.empty() ? status : output.failed(path + ": " + error);
+  return read ? status : output.failed(path + ": " + read.error().text);
 }
 
 }  // namespace vesk

@@ -82,12 +82,13 @@ class Batches {
 
 }  // namespace
 
-std::string readPowerLog(const std::string& path, WallTime since,
-                         const std::function<bool(const PowerLogEvent& event)>& take) {
+Result<void> readPowerLog(const std::string& path, WallTime since,
+                          const std::function<bool(const PowerLogEvent& event)>& take) {
   sqlite3* opened = nullptr;
+  const auto failure = [&opened] { return Error{Error::Kind::Failed, sqlite3_errmsg(opened)}; };
   int result = sqlite3_open_v2(path.c_str(), &opened, SQLITE_OPEN_READONLY | SQLITE_OPEN_NOMUTEX, nullptr);
   SQLiteDatabase database(opened);
-  if (result != SQLITE_OK) return sqlite3_errmsg(opened);
+  if (result != SQLITE_OK) return failure();
   sqlite3_busy_timeout(opened, kBusyMilliseconds);
   Batches batches(opened, std::chrono::duration<double>(since.time_since_epoch()).count());
   std::vector<PowerLogEvent> events;
@@ -99,7 +100,8 @@ std::string readPowerLog(const std::string& path, WallTime since,
       if (!take(event)) return {};
     }
   }
-  return result == SQLITE_DONE ? std::string() : sqlite3_errmsg(opened);
+  if (result != SQLITE_DONE) return failure();
+  return {};
 }
 
 }  // namespace vesk

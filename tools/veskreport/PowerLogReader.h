@@ -9,9 +9,8 @@
 namespace vesk {
 
 /// Passes the events from `since` on to `take`, oldest first, until it returns false. Works while a daemon
-/// writes, and ignores events added meanwhile. A slow `take` does not block the daemon. Returns an error
-/// text, or an empty string on success.
-[[nodiscard]] std::string readPowerLog(const std::string& path, WallTime since,
-                                       const std::function<bool(const PowerLogEvent& event)>& take);
+/// writes, and ignores events added meanwhile. A slow `take` does not block the daemon.
+Result<void> readPowerLog(const std::string& path, WallTime since,
+                          const std::function<bool(const PowerLogEvent& event)>& take);
 
 }  // namespace vesk
