@@ -21,15 +21,15 @@ void roundTrip(const Value& value, const std::optional<std::string>& written, Pr
                std::size_t shown) {
   if (!written || written->size() > PropertyListLimits{}.bytes) return;
   const auto again = parsePropertyList(*written, flavor);
-  require(again.value.has_value());
-  require(describe(*again.value, shown).substr(0, shown) == describe(value, shown).substr(0, shown));
+  require(static_cast<bool>(again));
+  require(describe(*again, shown).substr(0, shown) == describe(value, shown).substr(0, shown));
 }
 
 void readArchive(std::string_view bytes) {
-  const auto outcome = unarchiveValue(bytes);
-  require(outcome.value.has_value() == outcome.error.empty());
-  if (!outcome.value) return;
-  const auto archive = archiveValue(*outcome.value);
+  const auto value = unarchiveValue(bytes);
+  require(value || !value.error().text.empty());
+  if (!value) return;
+  const auto archive = archiveValue(*value);
   require(archive && archiveText(*archive) == archiveText(bytes));
 }
 
@@ -38,13 +38,13 @@ void readArchive(std::string_view bytes) {
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   const std::string_view bytes(reinterpret_cast<const char*>(data), size);
   for (auto flavor : {PropertyListFlavor::Plain, PropertyListFlavor::KeyedArchive}) {
-    const auto outcome = parsePropertyList(bytes, flavor);
-    require(outcome.value.has_value() == outcome.error.empty());
-    if (!outcome.value) continue;
-    const auto binary = writeBinaryPropertyList(*outcome.value, flavor);
+    const auto value = parsePropertyList(bytes, flavor);
+    require(value || !value.error().text.empty());
+    if (!value) continue;
+    const auto binary = writeBinaryPropertyList(*value, flavor);
     require(binary.has_value());
-    roundTrip(*outcome.value, binary, flavor, std::size_t{1} << 20);
-    roundTrip(*outcome.value, writeXMLPropertyList(*outcome.value), PropertyListFlavor::Plain, 1);
+    roundTrip(*value, binary, flavor, std::size_t{1} << 20);
+    roundTrip(*value, writeXMLPropertyList(*value), PropertyListFlavor::Plain, 1);
   }
   readArchive(bytes);
   return 0;

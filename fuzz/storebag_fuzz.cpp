@@ -39,9 +39,9 @@ Value withoutAddresses(const Value& value) {
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   static Harness harness;
-  const auto outcome = parsePropertyList({reinterpret_cast<const char*>(data), size});
-  if (!outcome.value) return 0;
-  const Value profile = withoutAddresses(*outcome.value);
+  const auto root = parsePropertyList({reinterpret_cast<const char*>(data), size});
+  if (!root) return 0;
+  const Value profile = withoutAddresses(*root);
   if (!profile.dictionary()) return 0;
   for (bool knowsUser : {false, true}) {
     auto backend = newBackendWithName(

@@ -51,12 +51,12 @@ bool hasNotChanged(const HTTPResponse& response, std::optional<std::string>* las
 
 /// The signed document around a storebag; empty if `body` is not such a document.
 Dictionary documentIn(const std::string& body) {
-  auto outcome = parsePropertyList(body);
-  if (!outcome.value) {
-    VESK_LOG_ERROR("fetchStorebagWithName: propertyListWithData error %s", outcome.error.c_str());
+  const auto root = parsePropertyList(body);
+  if (!root) {
+    VESK_LOG_ERROR("fetchStorebagWithName: propertyListWithData error %s", root.error().text.c_str());
     return {};
   }
-  const Dictionary* document = outcome.value->dictionary();
+  const Dictionary* document = root->dictionary();
   return document ? *document : Dictionary();
 }
 
@@ -80,9 +80,9 @@ std::optional<Dictionary> verifiedPayload(const Dictionary& document, const Libr
     VESK_LOG_ERROR("fetchStorebagWithName: Signature can not be verified, %p", publicKey->identity());
     return std::nullopt;
   }
-  auto payload = parsePropertyList(*bag);
-  if (!payload.value || !payload.value->dictionary()) return std::nullopt;
-  return *payload.value->dictionary();
+  const auto payload = parsePropertyList(*bag);
+  if (!payload || !payload->dictionary()) return std::nullopt;
+  return *payload->dictionary();
 }
 
 }  // namespace

@@ -33,7 +33,7 @@ class CollectorProcess : public ::testing::Test {
   /// Waits until it listens, and reads its addresses.
   void waitUntilReady() {
     ASSERT_TRUE(test::eventually([&] { return std::filesystem::exists(_files / "ready.json"); }));
-    _facts = *parseJSON(_files.read("ready.json")).value.value().dictionary();
+    _facts = *parseJSON(_files.read("ready.json"))->dictionary();
   }
   std::string fact(const char* key) const {
     auto text = _facts.text(key);
@@ -52,8 +52,8 @@ TEST_F(CollectorProcess, WritesOneJSONLineAnEventAndNothingElseOnItsOutput) {
   collector.signal(SIGINT);
   EXPECT_EQ(collector.wait(), 0);
   auto line = parseJSON(collector.output());
-  ASSERT_TRUE(line.value) << line.error;
-  EXPECT_EQ(line.value->dictionary()->dictionary("headers")->text("X-Vesk-Sender"), "HD");
+  ASSERT_TRUE(line) << line.error().text;
+  EXPECT_EQ(line->dictionary()->dictionary("headers")->text("X-Vesk-Sender"), "HD");
 }
 
 TEST_F(CollectorProcess, TellsUsageFromFailure) {

@@ -390,7 +390,7 @@ TEST_F(Dashboard, UploadsLogDataAndAnnouncesWhereItWent) {
     EXPECT_EQ(request.method, "POST");
     EXPECT_EQ(request.target, "/log?x");
     EXPECT_EQ(request.header("Content-Type"), "application/octet-stream");
-    EXPECT_EQ(unarchiveValue(request.body).value, Value(logData));
+    EXPECT_EQ(*unarchiveValue(request.body), Value(logData));
   }
   EXPECT_EQ(server.count(), std::size(cases)) << "nothing is sent again";
 

@@ -154,12 +154,14 @@ TEST_F(StorebagFetch, EveryFailureSaysWhatItIs) {
   const std::pair<int, std::string> unsigned_{3, withName("Signature is missing")};
   const std::pair<int, std::string> invalid{3, withName("Signature can not be verified, 0x")};
   const std::pair<int, std::string> unreadable{
-      3, withName("propertyListWithData error " + parsePropertyList("junk").error)};
+      3, withName("propertyListWithData error " + parsePropertyList("junk").error().text)};
   const std::tuple<const char*, std::string, Lines> cases[] = {
       {"no property list", "junk", {unreadable, unsigned_, unfetched}},
       {"no content",
        "",
-       {{3, withName("propertyListWithData error " + parsePropertyList("").error)}, unsigned_, unfetched}},
+       {{3, withName("propertyListWithData error " + parsePropertyList("").error().text)},
+        unsigned_,
+        unfetched}},
       {"a list", *writeXMLPropertyList(List{1}), {unsigned_, unfetched}},
       {"no signature", changed("signature", std::nullopt), {unsigned_, unfetched}},
       {"a number as signature", changed("signature", 1), {unsigned_, unfetched}},
@@ -254,11 +256,11 @@ TEST_F(StorebagFetch, AsksOnlyForWhatIsNewer) {
   const std::string changed = withName("New 'Last-Modified: " + second + "' received");
   const Lines junk{{7, withName("Adding 'Last-Modified: " + second + "' to the header")},
                    {7, withName("New 'Last-Modified: " + first + "' received")},
-                   {3, withName("propertyListWithData error " + parsePropertyList("junk").error)},
+                   {3, withName("propertyListWithData error " + parsePropertyList("junk").error().text)},
                    {3, withName("Signature is missing")},
                    {3, forClientType("Could not fetch storebag for client type 5")}};
   const std::pair<int, std::string> empty{
-      3, withName("propertyListWithData error " + parsePropertyList("").error)};
+      3, withName("propertyListWithData error " + parsePropertyList("").error().text)};
   const auto good = signedStorebag(payload());
   // wasNotModified, known, age: the outputs of the fetch; an answer without content also sets the age.
   const std::tuple<unsigned, std::string, HTTPHeaderList, bool, std::string, std::int32_t, Lines> cases[] = {

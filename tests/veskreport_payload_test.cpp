@@ -21,8 +21,8 @@ TEST(PayloadParser, PairsBecomeValuesOfTheTypeThatIsWritten) {
                              Dictionary{{"b", List{1, "a", true, Value()}}, {"a", -2}}}}) {
     SCOPED_TRACE(c.argument);
     auto parsed = parsePairs({c.argument});
-    ASSERT_TRUE(parsed.value) << parsed.error;
-    EXPECT_EQ(*parsed.value, (Dictionary{{c.key, c.value}}));
+    ASSERT_TRUE(parsed) << parsed.error().text;
+    EXPECT_EQ(*parsed, (Dictionary{{c.key, c.value}}));
   }
 }
 
@@ -39,8 +39,8 @@ TEST(PayloadParser, SaysWhatIsWrong) {
            Case{{R"(k:="\u0000")"}, R"("k:="\u0000"": a text holds a NUL)"},
        }) {
     auto parsed = parsePairs(c.arguments);
-    EXPECT_FALSE(parsed.value);
-    EXPECT_EQ(parsed.error, c.error);
+    ASSERT_FALSE(parsed);
+    EXPECT_EQ(parsed.error().text, c.error);
   }
 }
 

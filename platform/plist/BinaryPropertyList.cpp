@@ -57,11 +57,7 @@ class BinaryReader {
         _flavor(flavor),
         _budget(limits) {}
 
-  PropertyListOutcome read() {
-    auto root = readObject(_trailer.rootObject, 1);
-    if (!root) return {std::nullopt, _error};
-    return {std::move(root), {}};
-  }
+  Result<Value> read() { return readObject(_trailer.rootObject, 1); }
 
  private:
   /// An object's payload offset and the contents of its marker.
@@ -71,58 +67,48 @@ class BinaryReader {
     std::size_t payload;
   };
 
-  /// Keeps only the first error.
-  std::nullopt_t fail(std::string error) {
-    if (_error.empty()) _error = std::move(error);
-    return std::nullopt;
-  }
-
-  std::optional<Value> readObject(std::uint64_t index, std::size_t depth) {
-    if (index >= _trailer.objectCount) return fail("reference to no object");
+  Result<Value> readObject(std::uint64_t index, std::size_t depth) {
+    if (index >= _trailer.objectCount) return malformed("reference to no object");
     auto marker = readMarker(bigEndian(_offsets.substr(index * _trailer.offsetSize, _trailer.offsetSize)));
-    if (!marker) return std::nullopt;
+    if (!marker) return marker.error();
     if (marker->kind == 0xA) return readList(*marker, depth);
     if (marker->kind == 0xD) return readDictionary(*marker, depth);
     auto value = leafAt(*marker);
-    if (!value) return fail("an object that can't be read");
-    if (!_budget.addLeaf(*value)) return fail(_budget.error());
-    return value;
+    if (!value) return malformed("an object that can't be read");
+    if (auto added = _budget.addLeaf(*value); !added) return added.error();
+    return *std::move(value);
   }
 
-  std::optional<Value> readList(const Marker& list, std::size_t depth) {
-    if (!beginContainer(list, 1, depth)) return std::nullopt;
+  Result<Value> readList(const Marker& list, std::size_t depth) {
+    if (auto begun = beginContainer(list, 1, depth); !begun) return begun.error();
     std::vector<Value> values;
     for (std::size_t i = 0; i < list.count; ++i) {
       auto item = readObject(referenceAt(list, i), depth + 1);
-      if (!item) return std::nullopt;
+      if (!item) return item;
       values.push_back(*std::move(item));
     }
     return List(std::move(values));
   }
 
-  std::optional<Value> readDictionary(const Marker& dictionary, std::size_t depth) {
-    if (!beginContainer(dictionary, 2, depth)) return std::nullopt;
+  Result<Value> readDictionary(const Marker& dictionary, std::size_t depth) {
+    if (auto begun = beginContainer(dictionary, 2, depth); !begun) return begun.error();
     MutableDictionary entries;
     for (std::size_t i = 0; i < dictionary.count; ++i) {
       auto key = readObject(referenceAt(dictionary, i), depth + 1);
-      if (key && !key->text()) return fail("a key that is no text");
-      auto item = key ? readObject(referenceAt(dictionary, dictionary.count + i), depth + 1) : std::nullopt;
-      if (!item) return std::nullopt;
+      if (key && !key->text()) return malformed("a key that is no text");
+      auto item = key ? readObject(referenceAt(dictionary, dictionary.count + i), depth + 1) : key;
+      if (!item) return item;
       entries.append(*key->text(), *std::move(item));
     }
     return entries.shareUnique();
   }
 
-  /// Returns true if the container is allowed at `depth` and all its references are present.
-  bool beginContainer(const Marker& container, std::size_t referencesPerEntry, std::size_t depth) {
+  /// Succeeds if the container is allowed at `depth` and all its references are present.
+  Result<void> beginContainer(const Marker& container, std::size_t referencesPerEntry, std::size_t depth) {
     const std::size_t room = (_objects.size() - std::min(container.payload, _objects.size())) /
                              (_trailer.referenceSize * referencesPerEntry);
-    if (container.count > room) {
-      fail("a container that reaches over the end");
-    } else if (!_budget.addContainer(depth)) {
-      fail(_budget.error());
-    }
-    return _error.empty();
+    if (container.count > room) return malformed("a container that reaches over the end");
+    return _budget.addContainer(depth);
   }
 
   std::uint64_t referenceAt(const Marker& container, std::size_t place) const {
@@ -130,10 +116,10 @@ class BinaryReader {
         _objects.substr(container.payload + place * _trailer.referenceSize, _trailer.referenceSize));
   }
 
-  std::optional<Marker> readMarker(std::uint64_t offset) {
+  Result<Marker> readMarker(std::uint64_t offset) {
     // Objects must lie between the magic number and the offset table.
     if (offset < kBinaryPropertyListMagic.size() || offset >= _objects.size()) {
-      return fail("an offset outside of the objects");
+      return malformed("an offset outside of the objects");
     }
     const unsigned byte = static_cast<unsigned char>(_objects[offset]);
     Marker marker{byte >> 4, byte & 0xF, offset + 1};
@@ -143,7 +129,7 @@ class BinaryReader {
     auto sizeMarker = bytesAt(marker.payload, 1);
     const unsigned exponent = sizeMarker ? static_cast<unsigned char>((*sizeMarker)[0]) ^ 0x10u : 4;
     auto length = exponent <= 3 ? bytesAt(marker.payload + 1, std::size_t{1} << exponent) : std::nullopt;
-    if (!length) return fail("a length that can't be read");
+    if (!length) return malformed("a length that can't be read");
     marker.count = bigEndian(*length);
     marker.payload += 1 + length->size();
     return marker;
@@ -231,15 +217,14 @@ class BinaryReader {
   const Trailer _trailer;
   const PropertyListFlavor _flavor;
   PropertyListBudget _budget;
-  std::string _error;
 };
 
 }  // namespace
 
-PropertyListOutcome parseBinaryPropertyList(std::string_view bytes, PropertyListFlavor flavor,
-                                            const PropertyListLimits& limits) {
+Result<Value> parseBinaryPropertyList(std::string_view bytes, PropertyListFlavor flavor,
+                                      const PropertyListLimits& limits) {
   auto trailer = readTrailer(bytes);
-  if (!trailer) return {std::nullopt, "no valid trailer"};
+  if (!trailer) return malformed("no valid trailer");
   return BinaryReader(bytes, *trailer, flavor, limits).read();
 }
 

@@ -8,6 +8,7 @@
 #include <string_view>
 
 #include <VeskReporting/values/Value.h>
+#include "platform/result/Result.h"
 
 namespace vesk {
 
@@ -26,18 +27,11 @@ enum class PropertyListFlavor {
   KeyedArchive
 };
 
-/// The root value, or a clause that describes the error.
-struct PropertyListOutcome {
-  std::optional<Value> value;
-  std::string error;
-};
-
-/// Reads an XML or a binary property list, depending on how `bytes` starts. Refuses the whole document if it
-/// is malformed, exceeds a limit, or contains text that is not UTF-8 or has a NUL. Entities are neither
-/// declared nor fetched. Integers keep their full range: -2^63 to 2^64-1.
-PropertyListOutcome parsePropertyList(std::string_view bytes,
-                                      PropertyListFlavor flavor = PropertyListFlavor::Plain,
-                                      const PropertyListLimits& limits = {});
+/// Reads an XML or a binary property list, depending on how `bytes` starts, and returns its root. Refuses the
+/// whole document if it is malformed, exceeds a limit, or contains text that is not UTF-8 or has a NUL.
+/// Entities are neither declared nor fetched. Integers keep their full range: -2^63 to 2^64-1.
+Result<Value> parsePropertyList(std::string_view bytes, PropertyListFlavor flavor = PropertyListFlavor::Plain,
+                                const PropertyListLimits& limits = {});
 
 /// Returns `value` as a binary property list, with equal texts written once. Returns nullopt for text that is
 /// not UTF-8 or has a NUL, or for nesting deeper than 64. The null marker is written as null.

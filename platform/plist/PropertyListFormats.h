@@ -3,7 +3,6 @@
 
 #include <string>
 #include <string_view>
-#include <utility>
 
 #include "platform/plist/PropertyList.h"
 
@@ -15,43 +14,35 @@ inline constexpr std::string_view kUIDKey = "CF$UID";
 /// Seconds from the start of 1970 to the start of 2001, the epoch of the binary encoding.
 inline constexpr double kBinaryPropertyListEpoch = 978'307'200;
 
-PropertyListOutcome parseXMLPropertyList(std::string_view bytes, const PropertyListLimits& limits);
-PropertyListOutcome parseBinaryPropertyList(std::string_view bytes, PropertyListFlavor flavor,
-                                            const PropertyListLimits& limits);
+Result<Value> parseXMLPropertyList(std::string_view bytes, const PropertyListLimits& limits);
+Result<Value> parseBinaryPropertyList(std::string_view bytes, PropertyListFlavor flavor,
+                                      const PropertyListLimits& limits);
 
-/// Counts a document's cost. Each operation returns false once a limit is exceeded; `error` names the limit.
+/// Counts a document's cost. Each operation fails once a limit is exceeded; the error names the limit.
 class PropertyListBudget {
  public:
   explicit PropertyListBudget(const PropertyListLimits& limits) : _limits(limits) {}
 
-  bool addContainer(std::size_t depth) {
-    if (depth > _limits.depth) return refuse("nested deeper than " + std::to_string(_limits.depth));
+  Result<void> addContainer(std::size_t depth) {
+    if (depth > _limits.depth) return malformed("nested deeper than " + std::to_string(_limits.depth));
     return addLeaf(0);
   }
-  bool addLeaf(std::size_t contentBytes) {
-    if (++_nodes > _limits.nodes) return refuse("more than " + std::to_string(_limits.nodes) + " values");
+  Result<void> addLeaf(std::size_t contentBytes) {
+    if (++_nodes > _limits.nodes) return malformed("more than " + std::to_string(_limits.nodes) + " values");
     _contentBytes += contentBytes;
-    if (_contentBytes <= _limits.contentBytes) return true;
-    return refuse("more than " + std::to_string(_limits.contentBytes) + " bytes of content");
+    if (_contentBytes <= _limits.contentBytes) return {};
+    return malformed("more than " + std::to_string(_limits.contentBytes) + " bytes of content");
   }
-  bool addLeaf(const Value& value) {
+  Result<void> addLeaf(const Value& value) {
     const Text* text = value.text();
     const Bytes* bytes = value.bytes();
     return addLeaf(text ? text->size() : bytes ? bytes->size() : 0);
   }
 
-  const std::string& error() const { return _error; }
-
  private:
-  bool refuse(std::string error) {
-    _error = std::move(error);
-    return false;
-  }
-
   const PropertyListLimits& _limits;
   std::size_t _nodes = 0;
   std::size_t _contentBytes = 0;
-  std::string _error;
 };
 
 }  // namespace vesk

@@ -53,11 +53,11 @@ class XMLReader {
     XML_SetSkippedEntityHandler(parser, onSkippedEntity);
   }
 
-  PropertyListOutcome read(std::string_view bytes) {
+  Result<Value> read(std::string_view bytes) {
     const XML_Status status = XML_Parse(_parser, bytes.data(), static_cast<int>(bytes.size()), XML_TRUE);
-    if (status != XML_STATUS_OK || !_error.empty()) return {std::nullopt, errorWithPlace()};
-    if (!_root) return {std::nullopt, "no value"};
-    return {std::move(_root), {}};
+    if (status != XML_STATUS_OK || !_error.empty()) return malformed(errorWithPlace());
+    if (!_root) return malformed("no value");
+    return *std::move(_root);
   }
 
  private:
@@ -88,9 +88,10 @@ class XMLReader {
       return fail("unknown element <" + cutToWholeCharacters(name, kShown) + ">");
     if (!mayStart(element)) return fail("element <" + std::string(name) + "> may not stand here");
     // The plist element itself doesn't count as a container.
-    const bool isCheap = element == Element::PList ||
-                         (isContainer(element) ? _budget.addContainer(_frames.size()) : _budget.addLeaf(0));
-    if (!isCheap) return fail(_budget.error());
+    if (element != Element::PList) {
+      const auto added = isContainer(element) ? _budget.addContainer(_frames.size()) : _budget.addLeaf(0);
+      if (!added) return fail(added.error().text);
+    }
     _frames.push_back({element, {}, {}});
   }
 
@@ -221,9 +222,9 @@ struct ParserDeleter {
 
 }  // namespace
 
-PropertyListOutcome parseXMLPropertyList(std::string_view bytes, const PropertyListLimits& limits) {
+Result<Value> parseXMLPropertyList(std::string_view bytes, const PropertyListLimits& limits) {
   std::unique_ptr<XML_ParserStruct, ParserDeleter> parser(XML_ParserCreate(nullptr));
-  if (!parser) return {std::nullopt, "out of memory"};
+  if (!parser) return Error{Error::Kind::Failed, "out of memory"};
   return XMLReader(parser.get(), limits).read(bytes);
 }
 

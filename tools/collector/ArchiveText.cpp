@@ -73,10 +73,10 @@ PropertyListLimits archiveLimits() {
 }
 
 std::string archiveText(std::string_view archive) {
-  auto outcome = unarchiveValue(archive, archiveLimits());
-  if (!outcome.value) throw std::runtime_error(outcome.error);
+  auto value = unarchiveValue(archive, archiveLimits());
+  if (!value) throw std::runtime_error(value.error().text);
   Printer printer;
-  printer.add(*outcome.value, 0);
+  printer.add(*value, 0);
   return std::move(printer.text);
 }
 

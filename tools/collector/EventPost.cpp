@@ -70,9 +70,9 @@ void checkEvent(const Value& value, std::size_t index) {
 }
 
 EventPost readBody(const std::string& json) {
-  JSONOutcome outcome = parseJSON(json);
-  if (!outcome.value) throw Refusal("the body is no JSON: " + outcome.error);
-  const Dictionary* body = outcome.value->dictionary();
+  const auto value = parseJSON(json);
+  if (!value) throw Refusal("the body is no JSON: " + value.error().text);
+  const Dictionary* body = value->dictionary();
   if (body == nullptr) throw Refusal("the body must be a JSON object");
   for (const auto& [key, value] : *body)
     if (key != "postTime" && key != "clientId" && key != "events")

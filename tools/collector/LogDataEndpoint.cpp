@@ -12,7 +12,7 @@ HTTPAnswer LogDataEndpoint::serve(const HTTPReceived& received, const CollectorF
   if (received.header("Content-Type") != "application/octet-stream")
     return _refuse(received, 400, "the header Content-Type must be application/octet-stream");
   auto archive = unarchiveValue(received.body, archiveLimits());
-  if (!archive.value) return _refuse(received, 400, archive.error);
+  if (!archive) return _refuse(received, 400, archive.error().text);
   try {
     const auto file = _files.save(received.body, ".archive");
     ++_stats.logData;

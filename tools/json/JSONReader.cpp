@@ -56,15 +56,15 @@ std::string located(std::string_view text, std::size_t offset, const std::string
 
 }  // namespace
 
-JSONOutcome parseJSON(std::string_view text, std::size_t depth) {
+Result<Value> parseJSON(std::string_view text, std::size_t depth) {
   json::parse_options options;
   options.max_depth = depth;
   json::stream_parser parser({}, options);
   boost::system::error_code error;
   std::size_t read = parser.write(text.data(), text.size(), error);
   if (!error) parser.finish(error);
-  if (error) return {std::nullopt, located(text, read, error.message())};
-  return {valueFrom(parser.release()), {}};
+  if (error) return malformed(located(text, read, error.message()));
+  return valueFrom(parser.release());
 }
 
 }  // namespace vesk

@@ -10,6 +10,6 @@ namespace vesk {
 /// Returns the root of an archive, or an error. The bytes may be untrusted: the limits apply, counting an
 /// object once per reference, and any fault, such as a dangling reference or an unknown class, refuses the
 /// whole archive.
-PropertyListOutcome unarchiveValue(std::string_view archive, const PropertyListLimits& limits = {});
+Result<Value> unarchiveValue(std::string_view archive, const PropertyListLimits& limits = {});
 
 }  // namespace vesk

@@ -26,8 +26,8 @@ std::string makeDocument(const std::string& bag, const std::string& signature) {
 }
 
 std::optional<Dictionary> dictionaryIn(std::string_view bytes) {
-  auto outcome = parsePropertyList(bytes);
-  const Dictionary* dictionary = outcome.value ? outcome.value->dictionary() : nullptr;
+  const auto root = parsePropertyList(bytes);
+  const Dictionary* dictionary = root ? root->dictionary() : nullptr;
   return dictionary != nullptr ? std::optional(*dictionary) : std::nullopt;
 }
 

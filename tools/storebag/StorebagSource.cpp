@@ -14,9 +14,9 @@ namespace {
 constexpr std::size_t kMaximumSize = std::size_t{1} << 20;  // the daemon's limit for a storebag
 
 Dictionary fromJSON(const std::string& text) {
-  JSONOutcome outcome = parseJSON(text);
-  if (!outcome.value) throw std::runtime_error(outcome.error);
-  const Dictionary* dictionary = outcome.value->dictionary();
+  const auto value = parseJSON(text);
+  if (!value) throw std::runtime_error(value.error().text);
+  const Dictionary* dictionary = value->dictionary();
   if (dictionary == nullptr) throw std::runtime_error("the storebag must be an object");
   return *dictionary;
 }

@@ -36,14 +36,14 @@ DaemonSession::DaemonSession(const ClientIdentity& identity, const Output& outpu
 
 int DaemonSession::makeUserInfo() {
   auto further = parsePairs(_identity.userInfo);
-  if (!further.value) {
-    _output.failed("user info " + further.error);
+  if (!further) {
+    _output.failed("user info " + further.error().text);
     return kExitUsage;
   }
   MutableDictionary userInfo;
   if (!_identity.clientName.empty()) userInfo.set(kVeskReportingUserInfoClientName, _identity.clientName);
   if (!_identity.serviceName.empty()) userInfo.set(kVeskReportingUserInfoServiceName, _identity.serviceName);
-  userInfo.setAll(*further.value);
+  userInfo.setAll(*further);
   if (!userInfo.empty()) _userInfo = userInfo.share();
   return kExitDone;
 }

@@ -24,12 +24,10 @@ MessageStream::MessageStream(DaemonSession& session, const MessageArguments& arg
 
 int MessageStream::run() {
   while (auto line = _lines.next()) {
-    std::string error;
-    Dictionary parameters = parametersOf(*line, error);
-    if (error.empty()) {
-      send(_lines.number(), std::move(parameters));
+    if (auto parameters = parametersOf(*line)) {
+      send(_lines.number(), *std::move(parameters));
     } else {
-      failed(_lines.number(), error);
+      failed(_lines.number(), parameters.error().text);
     }
     _progress.show(_lines.number(), _lines.bytes());
   }
@@ -39,26 +37,23 @@ int MessageStream::run() {
 }
 
 // If the command line gives category and type, the line is a payload, otherwise a whole message.
-Dictionary MessageStream::parametersOf(const std::string& line, std::string& error) const {
+Result<Dictionary> MessageStream::parametersOf(const std::string& line) const {
   auto parsed = parsePayloadObject(line);
-  if (!parsed.value) {
-    error = std::move(parsed.error);
-    return {};
-  }
+  if (!parsed) return parsed;
   MutableDictionary parameters;
   if (_arguments.category) {
     parameters.append(kVeskReportingMessageParametersCategory, int{*_arguments.category});
     parameters.append(kVeskReportingMessageParametersType, int{*_arguments.type});
-    parameters.append(kVeskReportingMessageParametersPayload, *parsed.value);
+    parameters.append(kVeskReportingMessageParametersPayload, *parsed);
   } else {
-    for (const char* key : {kVeskReportingMessageParametersCategory, kVeskReportingMessageParametersType}) {
-      auto number = integerForKey(*parsed.value, key);
+    const Value* payload = parsed->find(kVeskReportingMessageParametersPayload);
+    if (payload && !payload->dictionary()) return malformed("\"payload\" is no object");
+    for (const char* key : {kVeskReportingMessageParametersType, kVeskReportingMessageParametersCategory}) {
+      auto number = integerForKey(*parsed, key);
       if (!number || *number < 0 || *number > 65535)
-        error = "\"" + std::string(key) + "\" is no number from 0 to 65535";
+        return malformed("\"" + std::string(key) + "\" is no number from 0 to 65535");
     }
-    const Value* payload = parsed.value->find(kVeskReportingMessageParametersPayload);
-    if (payload && !payload->dictionary()) error = "\"payload\" is no object";
-    parameters.setAll(*parsed.value);
+    parameters.setAll(*parsed);
   }
   if (!parameters.contains(kVeskReportingMessageParametersFlag)) {
     parameters.append(kVeskReportingMessageParametersFlag, _arguments.flag);

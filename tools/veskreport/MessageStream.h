@@ -7,6 +7,7 @@
 #include <mutex>
 #include <string>
 
+#include "platform/result/Result.h"
 #include "tools/veskreport/DaemonSession.h"
 #include "tools/veskreport/Invocation.h"
 #include "tools/veskreport/Lines.h"
@@ -26,7 +27,7 @@ class MessageStream {
   int run();
 
  private:
-  Dictionary parametersOf(const std::string& line, std::string& error) const;
+  Result<Dictionary> parametersOf(const std::string& line) const;
   void send(std::uint64_t line, Dictionary parameters);
   void ended(std::uint64_t line, const ReportingResult<MessageAnswer>& result);
   void failed(std::uint64_t line, const std::string& cause);

@@ -56,7 +56,7 @@ int show(const PowerLogEvent& event, const Output& output) {
                             {"utc", isoTime(event.time)},
                             {"identifier", event.identifier},
                             {"name", event.name},
-                            {"dictionary", dictionary.value.value_or(Value())}});
+                            {"dictionary", dictionary ? *dictionary : Value()}});
 }
 
 }  // namespace

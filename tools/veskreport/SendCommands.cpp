@@ -21,11 +21,11 @@ Dictionary parametersOf(const MessageArguments& message, const std::optional<Dic
 int payloadOf(const MessageArguments& message, const Output& output, std::optional<Dictionary>& payload) {
   if (message.payload.empty()) return kExitDone;
   auto pairs = parsePairs(message.payload);
-  if (!pairs.value) {
-    output.failed(pairs.error);
+  if (!pairs) {
+    output.failed(pairs.error().text);
     return kExitUsage;
   }
-  payload = std::move(pairs.value);
+  payload = *std::move(pairs);
   return kExitDone;
 }
 

@@ -25,11 +25,11 @@ std::optional<List> logDataOf(const UploadArguments& arguments, const Output& ou
   LineReader lines(STDIN_FILENO);
   while (auto line = lines.next()) {
     auto parsed = parsePayloadValue(*line);
-    if (!parsed.value) {
-      output.failed("line " + std::to_string(lines.number()) + ": " + parsed.error);
+    if (!parsed) {
+      output.failed("line " + std::to_string(lines.number()) + ": " + parsed.error().text);
       return std::nullopt;
     }
-    entries.push_back(std::move(*parsed.value));
+    entries.push_back(*std::move(parsed));
   }
   if (!lines.error().empty()) {
     output.failed("standard input: " + lines.error());
