@@ -30,7 +30,7 @@ Dictionary payload() {
 /// Receives datagrams without reading them; a full buffer drops further ones.
 struct Sink {
   Sink() {
-    if (socket.open() != 0 || socket.bind({0x7F00'0001, 0}) != 0) std::abort();
+    if (!socket.open() || !socket.bind({0x7F00'0001, 0})) std::abort();
   }
   UDPSocket socket;
 };
@@ -80,7 +80,7 @@ BENCHMARK(writeTheText);
 void sendOnly(benchmark::State& state) {
   Sink sink;
   UDPSocket socket;
-  if (socket.open() != 0 || socket.connect(*sink.socket.localEndpoint()) != 0) std::abort();
+  if (!socket.open() || !socket.connect(*sink.socket.localEndpoint())) std::abort();
   const std::string datagram(200, 'x');
   for (auto _ : state) benchmark::DoNotOptimize(socket.send(datagram));
 }

@@ -16,7 +16,7 @@ int main(int argc, char** argv) {
   if (argc < 2) return 2;
   const std::string file = argv[1];
   vesk::UDPSocket socket;
-  if (socket.open() != 0 || socket.bind({0x7F00'0001, 0}) != 0) return 1;
+  if (!socket.open() || !socket.bind({0x7F00'0001, 0})) return 1;
   std::ofstream(file + ".new") << socket.localEndpoint()->port << "\n";
   std::rename((file + ".new").c_str(), file.c_str());
   unsigned long count = 0;

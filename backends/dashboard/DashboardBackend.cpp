@@ -98,8 +98,8 @@ std::shared_ptr<DashboardBackend> DashboardBackend::createConnected(
   auto settings = profile ? settingsFrom(name, *profile) : std::nullopt;
   if (profile && !settings) return nullptr;
   UDPSocket socket;
-  if (int error = socket.open()) {
-    VESK_LOG_ERROR("DashboardBackend(initWithName): socket() failed (%d)", error);
+  if (const auto opened = socket.open(); !opened) {
+    VESK_LOG_ERROR("DashboardBackend(initWithName): socket() failed (%d)", opened.error().number);
     return nullptr;
   }
   auto queue = networkQueue(services);

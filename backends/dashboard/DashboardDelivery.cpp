@@ -38,8 +38,8 @@ DashboardDelivery::~DashboardDelivery() {
 // --- Construction
 
 void DashboardDelivery::useReliableUDP() {
-  if (int error = _socket.bindToAnyPort()) {
-    VESK_LOG_ERROR("DashboardBackend(useReliableUDP): can't bind socket, %d", error);
+  if (const auto bound = _socket.bindToAnyPort(); !bound) {
+    VESK_LOG_ERROR("DashboardBackend(useReliableUDP): can't bind socket, %d", bound.error().number);
     return;
   }
   _reliableUDP = true;
@@ -47,7 +47,7 @@ void DashboardDelivery::useReliableUDP() {
 
 bool DashboardDelivery::connect(const IPv4Endpoint& server) {
   _server = server;
-  if (_socket.connect(server) != 0) return false;
+  if (!_socket.connect(server)) return false;
   if (_reliableUDP) watchForAnswers();
   return true;
 }
@@ -186,7 +186,7 @@ bool DashboardDelivery::tryToSendMsg(const char* bytes, std::uint16_t length, st
 UDPSocket::Outcome DashboardDelivery::transmit(std::string_view datagram) {
   const auto outcome = _socket.send(datagram);
   if (outcome != UDPSocket::Outcome::NoRoute || std::exchange(_hasReconnected, true)) return outcome;
-  return _socket.reconnect(_server) == 0 ? _socket.send(datagram) : outcome;
+  return _socket.reconnect(_server) ? _socket.send(datagram) : outcome;
 }
 
 void DashboardDelivery::append(UDPPacketToSend packet) {

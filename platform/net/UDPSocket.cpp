@@ -26,7 +26,7 @@ IPv4Endpoint endpointOf(const sockaddr_in& address) {
   return {ntohl(address.sin_addr.s_addr), ntohs(address.sin_port)};
 }
 
-int errorOf(int result) { return result == 0 ? 0 : errno; }
+Result<void> resultOf(int status) { return status == 0 ? Result<void>() : systemError(errno); }
 
 bool isWhole(ssize_t count, std::string_view datagram) {
   return count >= 0 && static_cast<std::size_t>(count) == datagram.size();
@@ -62,35 +62,35 @@ std::string IPv4Endpoint::text() const {
   return dotted + std::to_string(port);
 }
 
-int UDPSocket::open() {
+Result<void> UDPSocket::open() {
   FileDescriptor descriptor(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
-  if (!descriptor) return errno;
+  if (!descriptor) return systemError(errno);
   _descriptor = std::make_shared<const FileDescriptor>(std::move(descriptor));
-  return 0;
+  return {};
 }
 
-int UDPSocket::bind(const IPv4Endpoint& local) noexcept {
+Result<void> UDPSocket::bind(const IPv4Endpoint& local) {
   const sockaddr_in address = addressOf(local);
-  return errorOf(::bind(descriptor(), reinterpret_cast<const sockaddr*>(&address), sizeof address));
+  return resultOf(::bind(descriptor(), reinterpret_cast<const sockaddr*>(&address), sizeof address));
 }
 
-int UDPSocket::connect(const IPv4Endpoint& peer) noexcept {
+Result<void> UDPSocket::connect(const IPv4Endpoint& peer) {
   const sockaddr_in address = addressOf(peer);
-  return errorOf(::connect(descriptor(), reinterpret_cast<const sockaddr*>(&address), sizeof address));
+  return resultOf(::connect(descriptor(), reinterpret_cast<const sockaddr*>(&address), sizeof address));
 }
 
-int UDPSocket::disconnect() noexcept {
+Result<void> UDPSocket::disconnect() {
   sockaddr nobody{};
   nobody.sa_family = AF_UNSPEC;
-  return errorOf(::connect(descriptor(), &nobody, sizeof nobody));
+  return resultOf(::connect(descriptor(), &nobody, sizeof nobody));
 }
 
-int UDPSocket::reconnect(const IPv4Endpoint& peer) noexcept {
-  if (int error = disconnect()) return error;
-  const int error = connect(peer);
+Result<void> UDPSocket::reconnect(const IPv4Endpoint& peer) {
+  if (auto disconnected = disconnect(); !disconnected) return disconnected;
+  auto connected = connect(peer);
   // A failed connection keeps its port, at which it would receive datagrams from anyone.
-  if (error != 0) static_cast<void>(disconnect());
-  return error;
+  if (!connected) static_cast<void>(disconnect());
+  return connected;
 }
 
 UDPSocket::Outcome UDPSocket::send(std::string_view datagram) noexcept {

@@ -10,6 +10,7 @@
 #include <string_view>
 
 #include "platform/files/FileDescriptor.h"
+#include "platform/result/Result.h"
 
 namespace vesk {
 
@@ -25,23 +26,22 @@ struct IPv4Endpoint {
   friend bool operator==(const IPv4Endpoint&, const IPv4Endpoint&) = default;
 };
 
-/// One socket, which never blocks and never raises SIGPIPE. Operations that can fail return the system's
-/// error number, or 0. On a closed socket they fail with EBADF. Not thread-safe, except that one thread may
-/// send while another receives.
+/// One socket, which never blocks and never raises SIGPIPE. Errors have the system's number; on a closed
+/// socket it is EBADF. Not thread-safe, except that one thread may send while another receives.
 class UDPSocket {
  public:
   /// Doesn't open a socket.
   UDPSocket() noexcept = default;
-  [[nodiscard]] int open();
-  [[nodiscard]] int bind(const IPv4Endpoint& local) noexcept;
+  Result<void> open();
+  Result<void> bind(const IPv4Endpoint& local);
   /// Binds to the wildcard address and a port chosen by the system.
-  [[nodiscard]] int bindToAnyPort() noexcept { return bind({}); }
+  Result<void> bindToAnyPort() { return bind({}); }
   /// From now on, receives datagrams only from this peer.
-  [[nodiscard]] int connect(const IPv4Endpoint& peer) noexcept;
+  Result<void> connect(const IPv4Endpoint& peer);
 
   /// Connects again, from an address that the system has now: a connection keeps its original address. After
   /// a failure, no datagrams are received until a later call succeeds.
-  [[nodiscard]] int reconnect(const IPv4Endpoint& peer) noexcept;
+  Result<void> reconnect(const IPv4Endpoint& peer);
 
   enum class Outcome : unsigned char {
     Sent,        ///< the whole datagram
@@ -68,7 +68,7 @@ class UDPSocket {
 
  private:
   /// Also releases a port that the system chose.
-  int disconnect() noexcept;
+  Result<void> disconnect();
 
   std::shared_ptr<const FileDescriptor> _descriptor;
 };

@@ -16,8 +16,8 @@ constexpr std::uint32_t kLoopback = 0x7F000001;
 class DashboardServer {
  public:
   explicit DashboardServer(std::uint32_t address = kLoopback) {
-    EXPECT_EQ(_socket.open(), 0);
-    EXPECT_EQ(_socket.bind({address, 0}), 0);
+    EXPECT_TRUE(_socket.open());
+    EXPECT_TRUE(_socket.bind({address, 0}));
     _endpoint = _socket.localEndpoint().value();
   }
 

@@ -28,12 +28,12 @@ DashboardReceiver::DashboardReceiver(Parts parts, const std::string& address, st
     : _parts(parts), _loss(loss), _file(std::move(file)) {
   auto endpoint = IPv4Endpoint::parse(address, port);
   if (!endpoint) cannotListen(address, port, "datagrams come over IPv4");
-  int error = _socket.open();
-  if (error == 0) error = _socket.bind(*endpoint);
-  if (error == EADDRINUSE)
+  auto bound = _socket.open();
+  if (bound) bound = _socket.bind(*endpoint);
+  if (!bound && bound.error().number == EADDRINUSE)
     throw std::runtime_error("can't listen on " + address + ": UDP port " + std::to_string(port) +
                              " is in use");
-  if (error != 0) cannotListen(address, port, std::strerror(error));
+  if (!bound) cannotListen(address, port, bound.error().text);
   _port = _socket.localEndpoint().value().port;
   _stop = FileDescriptor(::eventfd(0, EFD_CLOEXEC));
   if (!_stop) cannotListen(address, port, std::strerror(errno));
