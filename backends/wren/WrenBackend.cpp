@@ -29,25 +29,16 @@ void writeLine(int level, const char* line) {
   VESK_LOG(static_cast<LogLevel>(level), "WrenAdaptor: %s", line ? line : "");
 }
 
-/// Returns a short text if memory runs out.
-std::string textOf(const char* problem) noexcept {
-  try {
-    return problem;
-  } catch (const std::bad_alloc&) {
-    return "out of memory";  // short enough to need no allocation
-  }
-}
-
-/// Runs an adaptor's code and catches all its exceptions. Returns the error text, or nullopt on success.
+/// Runs an adaptor's code and catches all its exceptions.
 template <class Call>
-std::optional<std::string> guarded(const Call& call) noexcept {
+Result<void> guarded(const Call& call) {
   try {
     call();
-    return std::nullopt;
+    return {};
   } catch (const std::exception& error) {
-    return textOf(error.what());
+    return Error{Error::Kind::Failed, error.what()};
   } catch (...) {
-    return textOf("an exception of its own");
+    return Error{Error::Kind::Failed, "an exception of its own"};
   }
 }
 
@@ -79,10 +70,10 @@ WrenBackend::WrenBackend(const std::string& name, const std::optional<Dictionary
   makeAdaptor();
 }
 
-void WrenBackend::makeAdaptor() noexcept {
-  auto problem = guarded([this] {
-    if (!_clientBundle.isLoaded() && !_clientBundle.load()) {
-      VESK_LOG_DEBUG("WrenBackend(initWithName): %s", _clientBundle.error().c_str());
+void WrenBackend::makeAdaptor() {
+  const auto made = guarded([this] {
+    if (const auto loaded = _clientBundle.load(); !loaded) {
+      VESK_LOG_DEBUG("WrenBackend(initWithName): %s", loaded.error().text.c_str());
       return;
     }
     _wrenAdaptorClass =
@@ -92,16 +83,17 @@ void WrenBackend::makeAdaptor() noexcept {
                      VESK_WREN_ADAPTOR_FACTORY);
       return;
     }
-    VeskWrenAdaptor* made = _wrenAdaptorClass(&_host);
-    if (made && made->version != VESK_WREN_ADAPTOR_VERSION) {
+    VeskWrenAdaptor* adaptor = _wrenAdaptorClass(&_host);
+    if (adaptor && adaptor->version != VESK_WREN_ADAPTOR_VERSION) {
       VESK_LOG_DEBUG("WrenBackend(initWithName): %s is made for version %u", _clientBundle.path().c_str(),
-                     made->version);
+                     adaptor->version);
       return;  // it is not known how to release such an adaptor
     }
-    _wrenAdaptor.reset(made);
+    _wrenAdaptor.reset(adaptor);
   });
-  if (problem) {
-    VESK_LOG_ERROR("WrenBackend(initWithName): Wren adaptor could not be made: %s", problem->c_str());
+  if (!made) {
+    VESK_LOG_ERROR("WrenBackend(initWithName): Wren adaptor could not be made: %s",
+                   made.error().text.c_str());
   }
 }
 
@@ -116,17 +108,16 @@ std::optional<std::string> WrenBackend::sendMessageInTurn(const std::optional<Di
     _services.counters.count(_name, DropReason::AdaptorFailed);
     return std::nullopt;
   }
-  if (auto problem = forwardTo(forward, method, respCode, payload)) {
+  if (const auto forwarded = forwardTo(forward, method, respCode, payload); !forwarded) {
     VESK_LOG_ERROR("WrenBackend(sendMessage): Wren adaptor %s failed: %s", adaptorDescription(),
-                   problem->c_str());
+                   forwarded.error().text.c_str());
     _services.counters.count(_name, DropReason::AdaptorFailed);
   }
   return std::nullopt;
 }
 
-std::optional<std::string> WrenBackend::forwardTo(VeskWrenSendMessage forward, std::uint16_t method,
-                                                  std::uint16_t respCode,
-                                                  const std::optional<Dictionary>& payload) noexcept {
+Result<void> WrenBackend::forwardTo(VeskWrenSendMessage forward, std::uint16_t method, std::uint16_t respCode,
+                                    const std::optional<Dictionary>& payload) {
   return guarded([&] {
     const Dictionary dictionary = payload.value_or(Dictionary());
     WrenPayload view(dictionary);
@@ -150,8 +141,8 @@ const char* WrenBackend::adaptorDescription() const noexcept {
 
 void WrenBackend::ReleaseAdaptor::operator()(VeskWrenAdaptor* adaptor) const noexcept {
   if (!adaptor->release) return;
-  if (auto problem = guarded([adaptor] { adaptor->release(adaptor); })) {
-    VESK_LOG_ERROR("WrenBackend(dealloc): Wren adaptor failed: %s", problem->c_str());
+  if (const auto released = guarded([adaptor] { adaptor->release(adaptor); }); !released) {
+    VESK_LOG_ERROR("WrenBackend(dealloc): Wren adaptor failed: %s", released.error().text.c_str());
   }
 }
 

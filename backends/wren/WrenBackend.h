@@ -37,12 +37,9 @@ class WrenBackend final : public VeskReportingBackend {
                                                std::uint16_t respCode, std::uint16_t eventID,
                                                std::int32_t flag) override VESK_REQUIRES(_sendMutex)
       VESK_EXCLUDES(_mutex);
-  void makeAdaptor() noexcept;
-  /// Returns the error text, or nullopt on success.
-  std::optional<std::string> forwardTo(VeskWrenSendMessage forward, std::uint16_t method,
-                                       std::uint16_t respCode,
-                                       const std::optional<Dictionary>& payload) noexcept
-      VESK_REQUIRES(_sendMutex);
+  void makeAdaptor();
+  Result<void> forwardTo(VeskWrenSendMessage forward, std::uint16_t method, std::uint16_t respCode,
+                         const std::optional<Dictionary>& payload) VESK_REQUIRES(_sendMutex);
   VeskWrenSendMessage forwardingOperation() const noexcept;
   const char* adaptorDescription() const noexcept;
 

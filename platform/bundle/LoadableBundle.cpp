@@ -9,13 +9,11 @@ namespace vesk {
 LoadableBundle::LoadableBundle(std::string path)
     : _path(std::move(path)), _handle(::dlopen(_path.c_str(), RTLD_NOW | RTLD_LOCAL | RTLD_NOLOAD)) {}
 
-bool LoadableBundle::load() {
-  if (_handle) return true;
-  _handle = ::dlopen(_path.c_str(), RTLD_NOW | RTLD_LOCAL | RTLD_NODELETE);
-  if (_handle) return true;
+Result<void> LoadableBundle::load() {
+  if (!_handle) _handle = ::dlopen(_path.c_str(), RTLD_NOW | RTLD_LOCAL | RTLD_NODELETE);
+  if (_handle) return {};
   const char* cause = ::dlerror();
-  _error = cause ? cause : "can't be loaded";
-  return false;
+  return Error{Error::Kind::Failed, cause ? cause : "can't be loaded"};
 }
 
 void* LoadableBundle::symbolNamed(const char* name) const noexcept {

@@ -3,6 +3,8 @@
 
 #include <string>
 
+#include "platform/result/Result.h"
+
 namespace vesk {
 
 /// A loaded library stays for the life of the process, since it may have started threads. As thread-safe as
@@ -12,21 +14,17 @@ class LoadableBundle {
   /// `path`: of the library, used as it is.
   explicit LoadableBundle(std::string path);
 
-  /// Whether this process has already loaded the library.
-  bool isLoaded() const noexcept { return _handle != nullptr; }
-  /// Loads the library, which runs its initialisers. Returns false, with `error` set, if the file is missing
-  /// or not a library.
-  bool load();
+  /// Loads the library, which runs its initialisers, unless this process has already loaded it. Fails if the
+  /// file is missing or not a library.
+  Result<void> load();
   /// The address of the exported symbol `name`, or null.
   void* symbolNamed(const char* name) const noexcept;
 
   const std::string& path() const noexcept { return _path; }
-  const std::string& error() const noexcept { return _error; }
 
  private:
   const std::string _path;
   void* _handle = nullptr;
-  std::string _error;
 };
 
 }  // namespace vesk
