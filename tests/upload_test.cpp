@@ -17,7 +17,6 @@
 #include "platform/queue/QueueThread.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/RecordingServer.h"
-#include "tests/support/ScarceMemory.h"
 #include "tests/support/TempDirectory.h"
 
 namespace vesk::test {
@@ -286,20 +285,6 @@ TEST_F(UploadTest, AServerThatHangsHoldsUpNobodyElse) {
   EXPECT_FALSE(upload(path)) << "nothing more is let in";
   EXPECT_EQ(log.count(3, kUnit + "Too many uploads are under way"), 1);
 }
-
-#if !defined(__SANITIZE_THREAD__) && !defined(__SANITIZE_ADDRESS__)  // they replace operator new
-TEST_F(UploadTest, WithoutMemoryFailsAndGoesOn) {
-  const std::string path = file();
-  const std::string lent = token(opened(path));
-  SystemLog::setLevel(3);  // so that no line allocates first
-  {
-    ScarceMemory scarce;
-    EXPECT_FALSE(backend->uploadFileAtPath(path, lent));
-  }
-  EXPECT_EQ(log.lines(), (std::vector<Line>{{3, kUnit + "Not enough memory for the input file"}}));
-  EXPECT_TRUE(upload(path));
-}
-#endif
 
 TEST_F(UploadTest, TakesItsUsersShareForTheFileAndItsCompressedForm) {
   using std::chrono::milliseconds;

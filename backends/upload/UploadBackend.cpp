@@ -1,14 +1,12 @@
 #include "backends/upload/UploadBackend.h"
 
 #include <cinttypes>
-#include <new>
 
 #include "backends/upload/UploadGate.h"
 #include "platform/ipc/ExtensionTokens.h"
 #include "platform/log/SystemLog.h"
 #include "platform/unicode/UTF8.h"
 #include "storebag/StorebagProfile.h"
-#include "util/Gzip.h"
 #include "util/URLQuery.h"
 
 namespace vesk {
@@ -33,6 +31,17 @@ std::string withoutTrailingSlashes(const std::string& path) {
 }
 
 std::string lastComponentOf(const std::string& path) { return path.substr(path.rfind('/') + 1); }
+
+const char* wordsFor(const Error& readError) {
+  switch (readError.kind) {
+    case Error::Kind::TimedOut:
+      return "Input file was not read in time";
+    case Error::Kind::Malformed:
+      return "Input file has shrunk while it was uploaded";
+    default:
+      return "Input file is empty";
+  }
+}
 
 }  // namespace
 
@@ -68,13 +77,8 @@ void UploadBackend::setUploadURL(const std::optional<std::string>& url) {
 
 bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string& extensionToken) {
   VESK_LOG_DEBUG("UploadBackend(uploadFileAtPath): Uploading file %s", path.c_str());
-  try {
-    auto url = uploadURL();
-    return url && upload(withoutTrailingSlashes(path), extensionToken, *url);
-  } catch (const std::bad_alloc&) {
-    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Not enough memory for the input file");
-    return false;
-  }
+  auto url = uploadURL();
+  return url && upload(withoutTrailingSlashes(path), extensionToken, *url);
 }
 
 bool UploadBackend::upload(const std::string& path, const std::string& extensionToken,
@@ -100,10 +104,7 @@ bool UploadBackend::upload(const std::string& path, const std::string& extension
     VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Too many uploads are under way");
     return false;
   }
-  auto contents = contentsOf(file);
-  if (!contents) return false;
-  auto compressed = compressToBuffer(true, *contents);
-  contents.reset();
+  auto compressed = compressedContentsOf(file);
   if (!compressed) return false;
 
   auto request = requestFor(path, uploadURL);
@@ -123,25 +124,14 @@ bool UploadBackend::upload(const std::string& path, const std::string& extension
   return true;
 }
 
-std::optional<std::string> UploadBackend::contentsOf(const LentFile& file) const {
-  std::string contents;
+std::optional<CompressedBytes> UploadBackend::compressedContentsOf(const LentFile& file) const {
   // A file system may be slow on purpose, and others wait for the memory that this file occupies.
   const auto deadline = std::chrono::steady_clock::now() + timeoutFor(file.size(), kLeastRead);
-  LentFile::Reading reading = file.read(
-      contents, [&] { return _services.uploads->isOpen() && std::chrono::steady_clock::now() < deadline; });
-  if (reading == LentFile::Reading::GivenUp) {
-    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Input file was not read in time");
-    return std::nullopt;
-  }
-  if (reading == LentFile::Reading::Shrank) {
-    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Input file has shrunk while it was uploaded");
-    return std::nullopt;
-  }
-  if (reading == LentFile::Reading::Unreadable) {
-    VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): Input file is empty");
-    return std::nullopt;
-  }
-  return contents;
+  const auto contents =
+      file.read([&] { return _services.uploads->isOpen() && std::chrono::steady_clock::now() < deadline; });
+  if (contents) return compressToBuffer(true, *contents);
+  VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): %s", wordsFor(contents.error()));
+  return std::nullopt;
 }
 
 std::optional<HTTPRequest> UploadBackend::requestFor(const std::string& path,

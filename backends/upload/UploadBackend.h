@@ -7,6 +7,7 @@
 
 #include "backends/VeskReportingBackend.h"
 #include "platform/files/LentFile.h"
+#include "util/Gzip.h"
 
 namespace vesk {
 
@@ -36,8 +37,8 @@ class UploadBackend final : public VeskReportingBackend {
                 const BackendServices& services);
 
   bool upload(const std::string& path, const std::string& extensionToken, const std::string& uploadURL);
-  /// The file's contents; nullopt, with a line in the log, if the file is refused.
-  std::optional<std::string> contentsOf(const LentFile& file) const;
+  /// Returns nullopt, with a line in the log, if the file is refused.
+  std::optional<CompressedBytes> compressedContentsOf(const LentFile& file) const;
   /// The request without its body; nullopt if the profile's URL is unusable.
   std::optional<HTTPRequest> requestFor(const std::string& path, const std::string& uploadURL) const;
   /// Whether the server has accepted the file.

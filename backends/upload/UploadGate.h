@@ -68,7 +68,7 @@ class UploadGate {
   static constexpr uid_t kNobody = static_cast<uid_t>(-1);
 
   /// Waits for room for a user's upload that needs `bytes` of memory. Returns nullopt if there was none in
-  /// time or the gate is closed. Throws std::bad_alloc.
+  /// time or the gate is closed.
   [[nodiscard]] std::optional<Pass> enter(uid_t user, std::size_t bytes);
 
   /// Log data below this size in bytes counts as small.

@@ -37,19 +37,19 @@ bool LentFile::wasOpenedAt(const std::string& path) const {
   return opened == std::filesystem::path(path).lexically_normal();
 }
 
-LentFile::Reading LentFile::read(std::string& bytes, const std::function<bool()>& goOn) const {
-  bytes.resize(size());
+Result<std::string> LentFile::read(const std::function<bool()>& goOn) const {
+  std::string bytes(size(), '\0');
   std::size_t done = 0;
   while (done < bytes.size()) {
-    if (!goOn()) return Reading::GivenUp;
+    if (!goOn()) return Error{Error::Kind::TimedOut, "not read in time"};
     const std::size_t piece = std::min(bytes.size() - done, kPiece);
     ssize_t count = ::pread(_descriptor.get(), bytes.data() + done, piece, static_cast<off_t>(done));
     if (count < 0 && errno == EINTR) continue;
-    if (count < 0) return Reading::Unreadable;
-    if (count == 0) return Reading::Shrank;
+    if (count < 0) return systemError(errno);
+    if (count == 0) return malformed("shorter than before");
     done += static_cast<std::size_t>(count);
   }
-  return Reading::Whole;
+  return bytes;
 }
 
 bool LentFile::removeFrom(const std::string& path, uid_t user) const {

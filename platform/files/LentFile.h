@@ -9,6 +9,7 @@
 #include <string>
 
 #include "platform/files/FileDescriptor.h"
+#include "platform/result/Result.h"
 
 namespace vesk {
 
@@ -26,16 +27,11 @@ class LentFile {
   /// Size in bytes.
   std::uint64_t size() const noexcept { return static_cast<std::uint64_t>(_status.st_size); }
 
-  enum class Reading : unsigned char {
-    Whole,
-    Unreadable,  ///< the client itself could not read it, or the device failed
-    Shrank,      ///< it is shorter than before
-    GivenUp      ///< `goOn` returned false
-  };
-  /// Reads the first `size()` bytes, even if the file has grown. `bytes` is only valid if the result is
-  /// Whole. Keeps the client's file position. Calls `goOn` before each piece, since the file's device may be
-  /// arbitrarily slow. Throws std::bad_alloc.
-  [[nodiscard]] Reading read(std::string& bytes, const std::function<bool()>& goOn) const;
+  /// Returns the first `size()` bytes, even if the file has grown. Keeps the client's file position. Calls
+  /// `goOn` before each piece, since the file's device may be arbitrarily slow. The error's kind is TimedOut
+  /// if `goOn` returned false, Malformed if the file is shorter than before, and Failed if the client itself
+  /// could not read it or the device failed.
+  Result<std::string> read(const std::function<bool()>& goOn) const;
 
   /// Removes the file from `path` if that still names this unchanged file and its owner is `user` or this
   /// process's user. Returns false if the file was not removed. The check and the removal are not atomic, but
