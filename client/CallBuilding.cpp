@@ -26,22 +26,15 @@ ClientCall encoded(IPCOutgoingCall call, CallEffect effect) {
   return result;
 }
 
-FileToUpload openToUpload(const std::string& path) {
+Result<FileToUpload> openToUpload(const std::string& path) {
   FileToUpload file;
   file.descriptor = FileDescriptor(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
   struct stat status {};
-  if (!file.descriptor || ::fstat(file.descriptor.get(), &status) != 0) {
-    file.error = errno;
-  } else if (!S_ISREG(status.st_mode)) {
-    file.error = S_ISDIR(status.st_mode) ? EISDIR : EINVAL;
-  }
+  if (!file.descriptor || ::fstat(file.descriptor.get(), &status) != 0) return systemError(errno);
+  if (!S_ISREG(status.st_mode)) return systemError(S_ISDIR(status.st_mode) ? EISDIR : EINVAL);
   std::error_code code;
   auto absolute = std::filesystem::absolute(path, code);
-  if (file.error == 0 && code) file.error = code.value();
-  if (file.error != 0) {
-    file.descriptor.reset();
-    return file;
-  }
+  if (code) return systemError(code.value());
   file.url = "file://" + percentEncoded(absolute.lexically_normal().string(), "/");
   return file;
 }

@@ -6,6 +6,7 @@
 #include <utility>
 
 #include "client/ClientCall.h"
+#include "platform/result/Result.h"
 #include "protocol/WireNames.h"
 
 namespace vesk {
@@ -13,7 +14,7 @@ namespace vesk {
 /// A call that every receiver would refuse: too large, nested too deeply, or with text that is not UTF-8.
 class InvalidCall : public std::exception {};
 
-/// Throws InvalidCall or std::bad_alloc.
+/// Throws InvalidCall, or what the allocator throws.
 ClientCall encoded(IPCOutgoingCall call, CallEffect effect);
 
 /// A one-way call to the daemon's object. Throws like `encoded`.
@@ -32,13 +33,12 @@ ClientCall makeCall(const wire::Member& member, Arguments&&... arguments) {
 
 /// A file opened for the daemon.
 struct FileToUpload {
-  FileDescriptor descriptor;  ///< invalid if opening failed; see `error`
-  std::string url;            ///< the file's absolute path
-  int error = 0;              ///< errno; EINVAL if it isn't a regular file
+  FileDescriptor descriptor;
+  std::string url;  ///< the file's absolute path
 };
 
 /// Doesn't block on a peer, whatever is at that path (a pipe, a terminal), but a network or user-space file
-/// system may take time. Throws std::bad_alloc.
-FileToUpload openToUpload(const std::string& path);
+/// system may take time. The error has the system's number: EINVAL if the file isn't a regular one.
+Result<FileToUpload> openToUpload(const std::string& path);
 
 }  // namespace vesk

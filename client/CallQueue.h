@@ -31,8 +31,8 @@ class CallQueue {
 
   // Thread-safe.
 
-  /// Returns Queued, QueueFull or Closed. Connection requests need no room. If it throws std::bad_alloc,
-  /// nothing was queued.
+  /// Returns Queued, QueueFull or Closed. Connection requests need no room. If it throws, nothing
+  /// was queued.
   ReportingStatus push(ClientCall&& call);
   /// Refuses further calls; the receiving thread must end by `drainDeadline`.
   void close(Time drainDeadline) noexcept;

@@ -26,7 +26,7 @@ class ClientSession {
  public:
   using Timeout = std::chrono::milliseconds;
 
-  /// Throws std::system_error or std::bad_alloc if memory, descriptors or threads are exhausted.
+  /// Throws if memory, descriptors or threads are exhausted.
   explicit ClientSession(const ReportingOptions& options);
   /// Waits for the thread to end. On that thread, only tells it to end.
   ~ClientSession();

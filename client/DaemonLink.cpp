@@ -20,6 +20,8 @@ constexpr std::chrono::seconds kLongestKnock{10};
 // a tight loop.
 constexpr std::chrono::seconds kShortestVisit{1};
 
+constexpr std::size_t kLongestCause = 64;  // bytes shown of why there is no connection
+
 constexpr char kTurnedAway[] = "the daemon takes no more";
 
 }  // namespace
@@ -28,7 +30,9 @@ DaemonLink::DaemonLink(const ReportingOptions& options, std::shared_ptr<IPCExpor
     : _socketPath(options.socketPath.empty() ? pathUnderRoot(wire::kSocketPath) : options.socketPath),
       _receiver(std::move(receiver)),
       _policy(options.firstReconnectWait, options.lastReconnectWait),
-      _problem(_socketPath + ": not connected") {}
+      _problem(_socketPath + ": not connected") {
+  _problem.reserve(_socketPath.size() + 2 + kLongestCause);
+}
 
 DaemonLink::Change DaemonLink::reach(Time now, Urgency urgency) {
   if (_bus) return Change::None;
@@ -75,11 +79,9 @@ DaemonLink::Change DaemonLink::lose(Time now, const char* cause, ReportingStatus
     _policy.failed(now);
   }
   _isReady = false;
-  try {
-    _problem = _socketPath + ": " + cause;
-  } catch (const std::exception&) {
-    _problem.clear();
-  }
+  // Has room for every cause, so that losing a connection needs no memory.
+  _problem.resize(_socketPath.size() + 2);
+  _problem.append(cause, ::strnlen(cause, kLongestCause));
   // Moved out first: handlers called while it ends may query this link.
   auto bus = std::move(_bus);
   return Change::Lost;

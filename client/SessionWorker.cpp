@@ -37,8 +37,10 @@ void SessionWorker::run() noexcept {
     try {
       step();
     } catch (const std::exception& error) {
-      // Most likely out of memory. Waiting calls continue to wait.
+      // Most likely out of memory. Waiting calls continue to wait, and the next connection introduces the
+      // session anew, since the daemon must not get a message before it knows the session.
       VESK_LOG_ERROR("VeskReporting: %s", error.what());
+      if (_link.isReady()) connectionBroke(Clock::now());
       ::poll(nullptr, 0, 100);
     } catch (...) {
       VESK_LOG_ERROR("VeskReporting: an unknown exception");
@@ -183,15 +185,9 @@ void SessionWorker::linkHasChanged(DaemonLink::Change change) {
 
 void SessionWorker::connectionBroke(Time now) { linkHasChanged(_link.lose(now, kLost)); }
 
-// The daemon must not get a message before it knows the session. If memory for that runs out, reconnects.
 void SessionWorker::introduceAgain() {
-  bool isTold = false;
-  try {
-    isTold = (!_configuration || tell(wire::kSetSessionInfo, *_configuration)) &&
-             (!_isStarted || tell(wire::kStartConfig, {}));
-  } catch (const std::exception&) {
-    // `isTold` stays false.
-  }
+  const bool isTold = (!_configuration || tell(wire::kSetSessionInfo, *_configuration)) &&
+                      (!_isStarted || tell(wire::kStartConfig, {}));
   if (!isTold) connectionBroke(Clock::now());
 }
 

@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <cstring>
 #include <exception>
 
 #include "client/CallBuilding.h"
@@ -88,8 +87,8 @@ ClientCall fileUpload(FileToUpload& file) {
   return call;
 }
 
-ReportingStatus statusOf(const FileToUpload& file) noexcept {
-  bool isScarce = file.error == EMFILE || file.error == ENFILE || file.error == ENOMEM;
+ReportingStatus statusOf(const Error& error) noexcept {
+  bool isScarce = error.number == EMFILE || error.number == ENFILE || error.number == ENOMEM;
   return isScarce ? ReportingStatus::OutOfResources : ReportingStatus::FileUnavailable;
 }
 
@@ -198,9 +197,9 @@ ReportingResult<MessageAnswer> VeskReporting::flushMessagesAndWait(Timeout timeo
 
 ReportingResult<bool> VeskReporting::uploadFile(const std::string& path, Timeout timeout) noexcept {
   try {
-    FileToUpload file = openToUpload(path);
-    if (!file.descriptor) return {statusOf(file), false, std::strerror(file.error)};
-    return wait<bool>(_implementation, timeout, fileUpload, file);
+    auto file = openToUpload(path);
+    if (!file) return {statusOf(file.error()), false, file.error().text};
+    return wait<bool>(_implementation, timeout, fileUpload, *file);
   } catch (const std::exception&) {
     return {ReportingStatus::OutOfResources, false, {}};
   }
@@ -209,8 +208,8 @@ ReportingResult<bool> VeskReporting::uploadFile(const std::string& path, Timeout
 ReportingStatus VeskReporting::uploadFile(const std::string& path, ReportingCallback<bool> callback,
                                           Timeout timeout) noexcept {
   try {
-    FileToUpload file = openToUpload(path);
-    return file.descriptor ? ask(_implementation, callback, timeout, fileUpload, file) : statusOf(file);
+    auto file = openToUpload(path);
+    return file ? ask(_implementation, callback, timeout, fileUpload, *file) : statusOf(file.error());
   } catch (const std::exception&) {
     return ReportingStatus::OutOfResources;
   }
