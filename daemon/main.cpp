@@ -62,6 +62,7 @@ int main(int argc, char** argv) {
   if (const int* status = std::get_if<int>(&parsed)) return *status;
   const auto& options = std::get<vesk::DaemonOptions>(parsed);
   vesk::setUpAllocator();
+  vesk::endWhenOutOfMemory();
   vesk::raiseDescriptorLimit();
   if (options.root) vesk::setRootPrefix(*options.root);
   vesk::SystemLog::setLevel(options.logLevel);

@@ -126,6 +126,17 @@ TEST(Machine, WithoutDescriptorsItGoesOnAndForgetsNothing) {
   EXPECT_EQ(harness.stopDaemon(), 0);
 }
 
+TEST(Machine, WithoutMemoryItSaysSoAndEnds) {
+  if (kIsSanitized) GTEST_SKIP() << "the sanitizer has an allocator of its own";
+  DaemonHarness harness;
+  harness.startDaemon();
+  RoadClient client(harness);
+  limit(harness.daemon(), RLIMIT_DATA, 1);  // 0 would be no limit
+  EXPECT_FALSE(client.reporting.sendMessageAndWait(message(3, {{"text", std::string(900'000, 'x')}})));
+  EXPECT_EQ(harness.daemon().wait(), EXIT_FAILURE);
+  EXPECT_NE(harness.daemon().errors().find("<3>main: Out of memory, ending\n"), std::string::npos);
+}
+
 // Before its signals are set up, a daemon ends like any program; it has not accepted anyone then.
 bool endedInOrder(int signal, int status, const std::string& log) {
   if (status == 128 + signal) return signal == SIGKILL || log.find("start loop.") == std::string::npos;

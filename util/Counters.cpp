@@ -82,11 +82,7 @@ Counters::Row* Counters::rowFor(std::string_view backend) {
 }
 
 void Counters::count(std::string_view backend, DropReason reason, std::uint64_t n) noexcept {
-  try {
-    (*rowFor(backend))[static_cast<std::size_t>(reason)].fetch_add(n, std::memory_order_relaxed);
-  } catch (...) {
-    // Out of memory for a new name: this loss is not counted.
-  }
+  (*rowFor(backend))[static_cast<std::size_t>(reason)].fetch_add(n, std::memory_order_relaxed);
 }
 
 std::vector<Counters::Count> Counters::snapshot() const {

@@ -5,7 +5,6 @@
 #include <algorithm>
 #include <limits>
 #include <memory>
-#include <new>
 #include <vector>
 
 #include "platform/log/SystemLog.h"
@@ -126,8 +125,10 @@ int deflateWhole(z_stream& stream, std::string_view data, CompressedBytes& out) 
   stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(data.data()));
   stream.avail_in = static_cast<uInt>(data.size());
   const std::size_t bound = deflateBound(&stream, static_cast<uLong>(data.size()));
-  // Not zeroed, so that pages which the stream does not reach use no memory.
-  out.bytes.reset(new char[bound]);
+  // Like zlib's own memory, and unlike `new`, this may be refused without ending the daemon. Not zeroed, so
+  // that pages which the stream does not reach use no memory.
+  out.bytes.reset(static_cast<char*>(std::malloc(bound)));
+  if (!out.bytes) return Z_MEM_ERROR;
   int result = Z_OK;
   while (result == Z_OK) {
     stream.next_out = reinterpret_cast<Bytef*>(out.bytes.get()) + stream.total_out;
@@ -140,17 +141,7 @@ int deflateWhole(z_stream& stream, std::string_view data, CompressedBytes& out) 
 
 }  // namespace
 
-namespace {
-
-void tellFailure(int result, const char* message) {
-  VESK_LOG_ERROR(
-      "compressDataWithZlibOrGzip: zlib error while attempting compression: \"%s\" Message: \"%s\"",
-      textForDeflate(result), message);
-}
-
-}  // namespace
-
-std::optional<CompressedBytes> compressToBuffer(bool useGzip, std::string_view data) try {
+std::optional<CompressedBytes> compressToBuffer(bool useGzip, std::string_view data) {
   if (data.empty()) {
     VESK_LOG_ERROR("compressDataWithZlibOrGzip: Cannot compress empty ByteBlob");
     return std::nullopt;
@@ -164,27 +155,21 @@ std::optional<CompressedBytes> compressToBuffer(bool useGzip, std::string_view d
   CompressedBytes out;
   const int result = deflateWhole(deflater->stream(), data, out);
   if (result != Z_STREAM_END) {
-    tellFailure(result, messageOf(deflater->stream()));
+    VESK_LOG_ERROR(
+        "compressDataWithZlibOrGzip: zlib error while attempting compression: \"%s\" Message: \"%s\"",
+        textForDeflate(result), messageOf(deflater->stream()));
     return std::nullopt;
   }
   poolFor(useGzip).giveBack(std::move(deflater));
   VESK_LOG_DEBUG("compressDataWithZlibOrGzip: Compressed file from %u to %u",
                  static_cast<unsigned>(data.size()), static_cast<unsigned>(out.size));
   return out;
-} catch (const std::bad_alloc&) {
-  tellFailure(Z_MEM_ERROR, "(null)");
-  return std::nullopt;
 }
 
 std::optional<std::string> compressDataWithZlibOrGzip(bool useGzip, std::string_view data) {
-  auto compressed = compressToBuffer(useGzip, data);
+  const auto compressed = compressToBuffer(useGzip, data);
   if (!compressed) return std::nullopt;
-  try {
-    return std::string(compressed->bytes.get(), compressed->size);
-  } catch (const std::bad_alloc&) {
-    tellFailure(Z_MEM_ERROR, "(null)");
-    return std::nullopt;
-  }
+  return std::string(compressed->bytes.get(), compressed->size);
 }
 
 std::optional<std::string> gzipDeflate(std::string_view data) {

@@ -2,6 +2,7 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdlib>
 #include <memory>
 #include <optional>
 #include <string>
@@ -11,7 +12,10 @@ namespace vesk {
 
 /// Bytes in a larger buffer whose unused part was never touched.
 struct CompressedBytes {
-  std::unique_ptr<char[]> bytes;
+  struct Free {
+    void operator()(char* memory) const noexcept { std::free(memory); }
+  };
+  std::unique_ptr<char[], Free> bytes;
   std::size_t size = 0;
 };
 

@@ -134,14 +134,8 @@ DashboardBackend::DashboardBackend(const std::string& name, const std::optional<
   _displayURL = profileText(name, _profile, "display_url");
 }
 
-// For a backend whose session never cleaned it up. If memory runs out, the delivery is not informed and ends
-// once nothing is pending.
-DashboardBackend::~DashboardBackend() {
-  try {
-    _delivery->cleanup();
-  } catch (const std::exception&) {
-  }
-}
+// For a backend whose session never cleaned it up.
+DashboardBackend::~DashboardBackend() { _delivery->cleanup(); }
 
 DashboardHeader DashboardBackend::headerFor(const timeval& timestamp, std::uint16_t method,
                                             std::uint16_t respCode, std::uint16_t eventID) const {

@@ -29,8 +29,8 @@ struct Error {
   int number = 0;    ///< the system's error number; 0 if the system reported none
 };
 
-/// The error for a number of errno, with the system's text for it. `subject`, if any, comes first: "path:
-/// text".
+/// The error for a number of errno, with the system's text for it; `subject`, if there is one, comes before
+/// the text and a colon.
 inline Error systemError(int number, std::string subject = {}) {
   auto kind = Error::Kind::Failed;
   if (number == ENOENT || number == ENOTDIR) kind = Error::Kind::Missing;

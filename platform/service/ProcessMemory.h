@@ -8,6 +8,11 @@ namespace vesk {
 /// threads don't each keep free memory. Call before anything else.
 void setUpAllocator() noexcept;
 
+/// From now on, an allocation with `new` that fails ends the process with status 1, after one line of level 3
+/// on standard error. The process's memory is bounded, so it is the system that has run out: its service
+/// manager starts it again. Nothing is unwound.
+void endWhenOutOfMemory() noexcept;
+
 /// Releases pages of programs and libraries that were only used during start-up, mostly for relocation. A
 /// page that is needed again is in the page cache. Call once the process has started. Thread-safe.
 void releaseStartUpPages() noexcept;

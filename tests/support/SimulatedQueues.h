@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <system_error>
+#include <utility>
 
 #include "platform/queue/TimedQueue.h"
 
@@ -16,7 +17,7 @@ class SimulatedQueue final : public TimedQueue, public std::enable_shared_from_t
   Clock::time_point now() const override { return _now; }
   void submit(Work work) override { submitAfter(std::chrono::milliseconds::zero(), std::move(work)); }
   void submitAfter(std::chrono::milliseconds delay, Work work) override {
-    if (refusesWork) throw std::bad_alloc();
+    if (std::exchange(refusesWork, false)) throw std::system_error(EAGAIN, std::generic_category());
     if (_isStopped) return;
     _entries.push_back(
         std::make_shared<Entry>(Entry{_now + delay, {}, std::make_shared<const Work>(std::move(work))}));
@@ -75,7 +76,7 @@ class SimulatedQueue final : public TimedQueue, public std::enable_shared_from_t
   }
 
   bool refusesReadSources = false;
-  bool refusesWork = false;
+  bool refusesWork = false;  ///< once
 
  private:
   struct Entry {
