@@ -1,12 +1,14 @@
 // The receiver for the end-to-end bench: counts the events with each message ID.
 //
 // Usage: event_sink FIRST-FILE [tls]
-// Writes its port (and, with tls, the authority's certificate beside it) to FIRST-FILE. Serves until standard
-// input ends, then prints "events E distinct D".
+// Writes its URL (and, with tls, the authority's certificate beside it) to FIRST-FILE. Serves until standard
+// input ends. Prints "events E distinct D late L" for each line of input, where L is the number of distinct
+// events of clients other than the first. A line "away" closes the port first, and "back" opens it again.
 #include <cstdio>
 #include <cstring>
 #include <fstream>
 #include <iostream>
+#include <memory>
 #include <mutex>
 #include <unordered_set>
 
@@ -25,17 +27,20 @@ class IdCounter {
       at += sizeof kKey - 1;
       if (*at == '"') ++at;
       ++_events;
-      _distinct.insert(std::strtol(at, nullptr, 10));
+      const long id = std::strtol(at, nullptr, 10);
+      if (_distinct.insert(id).second && id >= kIdsPerClient) ++_ofOthers;
     }
   }
   void print() {
     std::lock_guard lock(_mutex);
-    std::printf("events %zu distinct %zu\n", _events, _distinct.size());
+    std::printf("events %zu distinct %zu late %zu\n", _events, _distinct.size(), _ofOthers);
   }
 
  private:
   std::mutex _mutex;
+  static constexpr long kIdsPerClient = 10'000'000;
   std::size_t _events = 0;
+  std::size_t _ofOthers = 0;
   std::unordered_set<long> _distinct;
 };
 
@@ -51,13 +56,20 @@ int main(int argc, char** argv) {
     std::ofstream(file + ".ca") << authority.certificate();
   }
   IdCounter ids;
-  vesk::HTTPServer server(options, [&](const vesk::HTTPReceived& request) {
-    if (auto decoded = request.decodedBody(); decoded.body) ids.count(*decoded.body);
-    return vesk::HTTPAnswer::text(200, "ok");
-  });
-  std::ofstream(file + ".new") << server.baseURL() << "\n";
+  std::unique_ptr<vesk::HTTPServer> server;
+  const auto open = [&] {
+    server = std::make_unique<vesk::HTTPServer>(options, [&](const vesk::HTTPReceived& request) {
+      if (auto decoded = request.decodedBody(); decoded.body) ids.count(*decoded.body);
+      return vesk::HTTPAnswer::text(200, "ok");
+    });
+    options.port = server->port();
+  };
+  open();
+  std::ofstream(file + ".new") << server->baseURL() << "\n";
   std::rename((file + ".new").c_str(), file.c_str());
   for (std::string line; std::getline(std::cin, line);) {
+    if (line == "away") server.reset();
+    if (line == "back") open();
     ids.print();
     std::fflush(stdout);
   }

@@ -1,7 +1,9 @@
 #include "common/Resources.h"
 
 #include <algorithm>
+#include <filesystem>
 #include <string_view>
+#include <system_error>
 
 #include "platform/files/RootPrefix.h"
 #include "platform/files/TrustedFile.h"
@@ -14,11 +16,13 @@ namespace {
 
 constexpr std::size_t kMaximumVersionFile = 4096;
 constexpr std::size_t kMaximumVersion = 64;
+constexpr char kResources[] = "/usr/share/veskreporting/";
+constexpr std::size_t kMaximumPublicKeys = 16;
 constexpr std::size_t kMaximumPublicKey = std::size_t{64} << 10;
 
 /// Reads one of the library's installed files.
-std::optional<std::string> readResource(const char* name, std::size_t limit) {
-  std::string path = pathUnderRoot("/usr/share/veskreporting/") + name;
+std::optional<std::string> readResource(const std::string& name, std::size_t limit) {
+  std::string path = pathUnderRoot(kResources) + name;
   auto bytes = readTrustedFile(path, limit);
   if (bytes) return *std::move(bytes);
   const Error& error = bytes.error();
@@ -53,6 +57,22 @@ std::string clientLibraryVersion() noexcept {
   } catch (...) {
     return kDefaultVersion;
   }
+}
+
+std::vector<std::string> publicKeysDER() {
+  std::vector<std::string> names{"publicKey.der"};
+  std::error_code none;
+  for (const auto& file :
+       std::filesystem::directory_iterator(pathUnderRoot(kResources) + "publicKeys", none)) {
+    if (file.path().extension() == ".der") names.push_back("publicKeys/" + file.path().filename().string());
+  }
+  std::sort(names.begin() + 1, names.end());
+  if (names.size() > kMaximumPublicKeys) names.resize(kMaximumPublicKeys);
+  std::vector<std::string> keys;
+  for (const auto& name : names) {
+    if (auto key = readResource(name, kMaximumPublicKey)) keys.push_back(*std::move(key));
+  }
+  return keys;
 }
 
 std::optional<std::string> publicKeyDER() noexcept {

@@ -3,6 +3,7 @@
 
 #include <optional>
 #include <string>
+#include <vector>
 
 namespace vesk {
 
@@ -12,5 +13,9 @@ std::string clientLibraryVersion() noexcept;
 /// The RSA public key that storebags are verified with, from the file "publicKey.der"; nullopt if the file is
 /// missing, empty, unreadable or not trusted.
 std::optional<std::string> publicKeyDER() noexcept;
+
+/// That key, and those of the files "publicKeys/*.der" by their names, at most 16 in all: while keys are
+/// being replaced, storebags may be signed with either.
+std::vector<std::string> publicKeysDER();
 
 }  // namespace vesk

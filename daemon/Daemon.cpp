@@ -2,8 +2,11 @@
 
 #include <VeskReporting/VeskReportingKeys.h>
 
+#include <time.h>
+
 #include <algorithm>
 #include <chrono>
+#include <random>
 #include <utility>
 
 #include "common/PersistentIdentifiers.h"
@@ -33,6 +36,7 @@ constexpr std::size_t kOtherDescriptors = 256;
 // The number of lines that one call site may log for one user in ten seconds.
 constexpr std::uint64_t kLogRateLimit = 200;
 
+constexpr char kKeptStorebags[] = "/var/lib/veskreportingd/storebags";
 constexpr char kOutboxPath[] = "/var/lib/veskreportingd/outbox.sqlite";
 constexpr std::uint64_t kMostOutboxDays = 3650;
 
@@ -100,11 +104,31 @@ HeldBudget::Limits heldLimits() {
   return limits;
 }
 
+/// Returns null unless the preference "keepStorebags" is set.
+std::unique_ptr<const KeptStorebags> makeKeptStorebags() {
+  if (!preferenceFlagForKey("keepStorebags")) return nullptr;
+  return std::make_unique<KeptStorebags>(pathUnderRoot(kKeptStorebags), publicKeysDER);
+}
+
+/// Called with the agent's monitor held.
+double uniformlyRandom() {
+  static std::minstd_rand generator{std::random_device{}()};
+  return std::uniform_real_distribution<double>()(generator);
+}
+
+/// Since the device's start, including the time that it was suspended.
+std::chrono::seconds uptime() {
+  timespec now{};
+  ::clock_gettime(CLOCK_BOOTTIME, &now);
+  return std::chrono::seconds(now.tv_sec);
+}
+
 /// Returns null if the preference "outbox" is "off".
 std::unique_ptr<PostOutbox> makeOutbox(BusyMarker& busyMarker, RefusedPosts& refusedPosts) {
   const std::string mode = preferenceStringForKey("outbox").value_or("outage");
   if (mode == "off") return nullptr;
-  if (mode != "outage") VESK_LOG_WARNING("main: preference 'outbox': '%s' is neither \"outage\" nor \"off\"", mode.c_str());
+  if (mode != "outage")
+    VESK_LOG_WARNING("main: preference 'outbox': '%s' is neither \"outage\" nor \"off\"", mode.c_str());
   PostOutbox::Options options;
   options.path = pathUnderRoot(kOutboxPath);
   options.maximumBytes = bytesOfMiB("outboxMiB", options.maximumBytes);
@@ -146,8 +170,9 @@ std::shared_ptr<DashboardLinger> dashboardLinger() {
 
 void logLosses() {
   for (const auto& [backend, reason, count] : Counters::shared().snapshot()) {
-    VESK_LOG_INFO("main: %s since the start: %s %s %llu", isLoss(reason) ? "Lost" : "Delayed", backend.c_str(),
-                  std::string(nameOfDropReason(reason)).c_str(), static_cast<unsigned long long>(count));
+    VESK_LOG_INFO("main: %s since the start: %s %s %llu", isLoss(reason) ? "Lost" : "Delayed",
+                  backend.c_str(), std::string(nameOfDropReason(reason)).c_str(),
+                  static_cast<unsigned long long>(count));
   }
 }
 
@@ -166,9 +191,11 @@ struct Daemon::Parts {
                         .powerLog = std::make_shared<PowerLog>(powerLogOptions()),
                         .dashboardLinger = dashboardLinger()},
         sessionServices{.backends = backendServices, .libraryVersion = clientLibraryVersion()},
+        keptStorebags(makeKeptStorebags()),
         outbox(makeOutbox(busyMarker, *backendServices.refusedPosts)),
         http(httpOptions(busyMarker, outbox.get())),
-        agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetcher(), busyMarker)),
+        agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetcher(), busyMarker,
+                                                keptStorebagSource())),
         listener(listenerOptions(serviceManager)) {
     backendServices.heldBudget = std::make_shared<HeldBudget>(heldLimits());
     listener.setDelegate(agent.get());
@@ -192,12 +219,21 @@ struct Daemon::Parts {
   }
 
   StorebagFetcher storebagFetcher() {
-    return [this, library = LibraryFacts{sessionServices.libraryVersion, publicKeyDER}](
+    return [this, library = LibraryFacts{sessionServices.libraryVersion, publicKeysDER}](
                std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version,
                bool& notModified, std::optional<std::string>& lastModified) {
       return fetchStorebagForEnvironmentAndClientType(http, library, clientType, maxAge, version, notModified,
-                                                      &lastModified);
+                                                      &lastModified, keptStorebags.get());
     };
+  }
+
+  std::optional<KeptStorebagSource> keptStorebagSource() const {
+    if (!keptStorebags) return std::nullopt;
+    return KeptStorebagSource{
+        .load =
+            [this](std::int32_t clientType) { return keptStorebagForClientType(*keptStorebags, clientType); },
+        .random = uniformlyRandom,
+        .uptime = uptime};
   }
 
   // Sending a datagram doesn't block, so one thread serves all backends.
@@ -205,7 +241,9 @@ struct Daemon::Parts {
   // Declared before the client: posts that complete while the client ends still use the services.
   BackendServices backendServices;
   SessionServices sessionServices;
-  // Null: posts that can't be delivered for a minute are lost. Declared before the client, whose posts it keeps.
+  std::unique_ptr<const KeptStorebags> keptStorebags;  // null: storebags are kept in memory only
+  // Null: posts that can't be delivered for a minute are lost. Declared before the client, whose posts it
+  // keeps.
   std::unique_ptr<PostOutbox> outbox;
   HTTPClient http;
   std::shared_ptr<ReportingdAgent> agent;
@@ -244,7 +282,7 @@ bool Daemon::stop() {
     VESK_LOG_WARNING("main: Stopping although datagrams are still unacknowledged after %d ms.",
                      static_cast<int>(kDatagramWait.count()));
   }
-  _parts->stopPosting();          // puts aside, or abandons and counts, what is left
+  _parts->stopPosting();  // puts aside, or abandons and counts, what is left
   if (haveEnded) _parts.reset();
   logLosses();
   return haveEnded;

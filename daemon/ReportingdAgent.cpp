@@ -22,10 +22,10 @@ std::int32_t clientTypeOf(const ReportingdSession& session) {
 }  // namespace
 
 ReportingdAgent::ReportingdAgent(const SessionServices& services, StorebagFetcher fetchStorebag,
-                                 BusyMarker& busyMarker)
+                                 BusyMarker& busyMarker, std::optional<KeptStorebagSource> keptStorebags)
     : _services(services),
       _busyMarker(busyMarker),
-      _cachedStorebags(std::move(fetchStorebag), services.backends.clock) {}
+      _cachedStorebags(std::move(fetchStorebag), std::move(keptStorebags), services.backends.clock) {}
 
 std::string ReportingdAgent::description() const {
   char text[48];

@@ -29,7 +29,8 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
                               public std::enable_shared_from_this<ReportingdAgent> {
  public:
   /// `services` and `busyMarker` must outlive the agent.
-  ReportingdAgent(const SessionServices& services, StorebagFetcher fetchStorebag, BusyMarker& busyMarker);
+  ReportingdAgent(const SessionServices& services, StorebagFetcher fetchStorebag, BusyMarker& busyMarker,
+                  std::optional<KeptStorebagSource> keptStorebags = std::nullopt);
 
   // --- IPCListenerDelegate
   bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) override;

@@ -9,6 +9,9 @@ std::optional<Dictionary> StorebagCache::storebagForClientType(std::int32_t clie
   auto name = storebagNameForClientType(clientType);
   if (!name) return std::nullopt;
   auto record = _records.find(std::string(*name));
+  if (record == _records.end()) {
+    if (auto kept = keptRecord(clientType)) record = _records.emplace(*name, *std::move(kept)).first;
+  }
   if (record == _records.end() || !isFresh(record->second, clientType)) {
     fetchAndCacheStorebag(clientType);
     record = _records.find(std::string(*name));
@@ -55,7 +58,29 @@ void StorebagCache::fetchAndCacheStorebag(std::int32_t clientType) {
   record.storebagFetchTime = _clock.now();
   record.storebagFetchState = successful ? FetchState::Successful : FetchState::Failure;
   record.storebagMaxAge = maxAge;
+  if (_kept && maxAge > 0) {
+    record.storebagMaxAge -=
+        static_cast<std::int32_t>(maxAge * KeptStorebagSource::kShortening * _kept->random());
+  }
   if (lastModified) record.storebagLastModified = std::move(lastModified);
+}
+
+std::optional<StorebagCache::Record> StorebagCache::keptRecord(std::int32_t clientType) const {
+  auto kept = _kept ? _kept->load(clientType) : std::nullopt;
+  if (!kept) return std::nullopt;
+  Record record;
+  record.storebagData = std::move(kept->section);
+  record.storebagVersion = std::move(kept->version);
+  record.storebagLastModified = std::move(kept->lastModified);
+  const auto due =
+      std::chrono::duration_cast<std::chrono::seconds>(KeptStorebagSource::kSpread * _kept->random());
+  const auto wait = due - _kept->uptime();
+  if (wait > wait.zero()) {
+    record.storebagFetchTime = _clock.now();
+    record.storebagFetchState = FetchState::Successful;
+    record.storebagMaxAge = static_cast<std::int32_t>(wait.count());
+  }
+  return record;
 }
 
 std::optional<std::string> StorebagCache::versionForClientType(std::int32_t clientType) const {

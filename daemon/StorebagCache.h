@@ -19,6 +19,22 @@ using StorebagFetcher = std::function<std::optional<Dictionary>(
     std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
     std::optional<std::string>& lastModified)>;
 
+/// Storebags that were kept on disk, and how fetches are spread over time where they serve meanwhile.
+struct KeptStorebagSource {
+  /// The kept section of a client type, if there is one.
+  std::function<std::optional<KeptSection>(std::int32_t clientType)> load;
+  /// Uniformly from [0, 1).
+  std::function<double()> random;
+  /// Since the device's start.
+  std::function<std::chrono::seconds()> uptime;
+
+  /// After a start of the device, the first fetch of a kept storebag is made within this time, so that many
+  /// devices do not fetch at once after a power cut.
+  static constexpr std::chrono::seconds kSpread{15 * 60};
+  /// A storebag's age is shortened by up to this share, so that they do not fetch at once each day.
+  static constexpr double kShortening = 0.1;
+};
+
 /// Keeps one record per storebag name, in memory, for the life of the daemon. Not thread-safe: the agent
 /// calls it with its monitor held, also during a fetch, so that two sessions never fetch the same storebag at
 /// once.
@@ -27,7 +43,8 @@ class StorebagCache {
   /// The wait after a failed attempt.
   static constexpr std::chrono::seconds kMinimumWaitAfterFailure{900};
 
-  StorebagCache(StorebagFetcher fetch, const WallClock& clock) : _fetch(std::move(fetch)), _clock(clock) {}
+  StorebagCache(StorebagFetcher fetch, std::optional<KeptStorebagSource> kept, const WallClock& clock)
+      : _fetch(std::move(fetch)), _kept(std::move(kept)), _clock(clock) {}
 
   /// Returns the cached section if it is fresh or must not be fetched yet; otherwise fetches it, and returns
   /// the last good section if that fails. Returns nullopt for a client type without a storebag.
@@ -51,8 +68,11 @@ class StorebagCache {
   /// Whether the record may be served without a fetch. Logs the reason.
   bool isFresh(const Record& record, std::int32_t clientType) const;
   void fetchAndCacheStorebag(std::int32_t clientType);
+  /// A new record from the kept storebag, fresh until its first fetch is due; nullopt if there is none.
+  std::optional<Record> keptRecord(std::int32_t clientType) const;
 
   const StorebagFetcher _fetch;
+  const std::optional<KeptStorebagSource> _kept;
   const WallClock& _clock;
   std::map<std::string, Record> _records;
 };

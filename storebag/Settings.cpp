@@ -21,10 +21,7 @@ std::atomic<std::int32_t> processEnvironmentType{0};
 
 }  // namespace
 
-bool diagnosticsSubmissionConsent() {
-  auto value = PreferencesSuite(kSuite).valueForKey("diagnosticsSubmission");
-  return value && value->boolean() && *value->boolean();
-}
+bool diagnosticsSubmissionConsent() { return preferenceFlagForKey("diagnosticsSubmission"); }
 
 std::int32_t environmentTypeForPreference(const std::optional<Value>& preference) {
   if (!preference) return kDefaultEnvironment;
@@ -50,6 +47,11 @@ std::optional<std::string> preferenceStringForKey(std::string_view key) {
   auto value = PreferencesSuite(kSuite).valueForKey(key);
   if (!value) return std::nullopt;
   return stringForm(*value);
+}
+
+bool preferenceFlagForKey(std::string_view key) {
+  auto value = PreferencesSuite(kSuite).valueForKey(key);
+  return value && value->boolean() && *value->boolean();
 }
 
 std::optional<std::uint64_t> preferenceNumberForKey(std::string_view key, std::uint64_t least) {

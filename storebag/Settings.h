@@ -31,6 +31,9 @@ std::int32_t currentEnvironmentType();
 /// A setting of the daemon's preferences suite as text (a number as decimal text), read anew by each call.
 std::optional<std::string> preferenceStringForKey(std::string_view key);
 
+/// A boolean setting; false if it is absent or of another type.
+bool preferenceFlagForKey(std::string_view key);
+
 /// A setting that must be an integer of at least `least`. Logs an unusable one and treats it as absent.
 std::optional<std::uint64_t> preferenceNumberForKey(std::string_view key, std::uint64_t least);
 

@@ -4,8 +4,6 @@
 #include <chrono>
 #include <limits>
 
-#include "platform/crypto/Base64.h"
-#include "platform/crypto/RSAPublicKey.h"
 #include "platform/log/SystemLog.h"
 #include "platform/plist/PropertyList.h"
 #include "platform/text/ASCII.h"
@@ -13,7 +11,6 @@
 #include "storebag/StorebagFallback.h"
 #include "storebag/StorebagNaming.h"
 #include "storebag/StorebagProfile.h"
-#include "storebag/StorebagSignature.h"
 #include "values/Conversions.h"
 
 namespace vesk {
@@ -61,28 +58,22 @@ Dictionary documentIn(const std::string& body) {
 }
 
 std::optional<Dictionary> verifiedPayload(const Dictionary& document, const LibraryFacts& library) {
-  auto signatureText = document.text("signature");
-  if (!signatureText) {
-    VESK_LOG_ERROR("fetchStorebagWithName: Signature is missing");
-    return std::nullopt;
+  using Verdict = Verification::Verdict;
+  auto verification =
+      verifySignedDocument(document, library.publicKeys ? library.publicKeys() : PublicKeys());
+  switch (verification.verdict) {
+    case Verdict::Good:
+      return std::move(verification.payload);
+    case Verdict::SignatureMissing:
+      VESK_LOG_ERROR("fetchStorebagWithName: Signature is missing");
+      break;
+    case Verdict::SignatureWrong:
+      VESK_LOG_ERROR("fetchStorebagWithName: Signature can not be verified, %p", verification.keyIdentity);
+      break;
+    case Verdict::Unusable:
+      break;
   }
-  auto der = library.publicKey ? library.publicKey() : std::nullopt;
-  auto publicKey = der ? RSAPublicKey::fromDER(*der) : std::nullopt;
-  if (!publicKey) return std::nullopt;
-
-  auto signature = base64Decode(signatureText->view());
-  if (!signature) return std::nullopt;
-  auto bagText = document.text("bag");
-  auto bag = bagText ? base64Decode(bagText->view()) : std::nullopt;
-  if (!bag) return std::nullopt;
-
-  if (!verifyStorebagSignature(*publicKey, *bag, *signature)) {
-    VESK_LOG_ERROR("fetchStorebagWithName: Signature can not be verified, %p", publicKey->identity());
-    return std::nullopt;
-  }
-  const auto payload = parsePropertyList(*bag);
-  if (!payload || !payload->dictionary()) return std::nullopt;
-  return *payload->dictionary();
+  return std::nullopt;
 }
 
 }  // namespace
@@ -116,7 +107,8 @@ std::int32_t maxAgeFromCacheControl(std::optional<std::string_view> cacheControl
 
 std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryFacts& library,
                                                 std::string_view name, std::int32_t& maxAge,
-                                                bool& notModified, std::optional<std::string>* lastModified) {
+                                                bool& notModified, std::optional<std::string>* lastModified,
+                                                const KeptStorebags* kept) {
   std::string url = storebagServerBaseURL();
   ((url += '/') += name) += "?version=";
   url += library.version;
@@ -134,6 +126,8 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryF
         url.c_str(), result.error->description.c_str());
     // While the daemon ends, no client should start with less than the server would give it.
     if (name != kFallbackName || result.error->kind == HTTPError::Kind::Stopped) return std::nullopt;
+    // The caller has the kept storebag already.
+    if (kept && kept->load(name)) return std::nullopt;
     VESK_LOG_INFO("fetchStorebagWithName: Loading default storebag '%s'", std::string(name).c_str());
     return fallbackStorebag();
   }
@@ -142,7 +136,9 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryF
     notModified = true;
     return std::nullopt;
   }
-  return verifiedPayload(documentIn(result.response->body), library);
+  auto payload = verifiedPayload(documentIn(result.response->body), library);
+  if (payload && kept) kept->keep(name, result.response->body, lastModified ? *lastModified : std::nullopt);
+  return payload;
 }
 
 std::optional<Dictionary> storebagSectionForEnvironment(const Dictionary& payload,
@@ -166,7 +162,8 @@ std::optional<Dictionary> storebagSectionForEnvironment(const Dictionary& payloa
 
 std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
     HTTPClient& http, const LibraryFacts& library, std::int32_t clientType, std::int32_t& maxAge,
-    std::optional<std::string>& version, bool& notModified, std::optional<std::string>* lastModified) {
+    std::optional<std::string>& version, bool& notModified, std::optional<std::string>* lastModified,
+    const KeptStorebags* kept) {
   auto name = storebagNameForClientType(clientType);
   if (!name) {
     VESK_LOG_ERROR(
@@ -174,7 +171,7 @@ std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
         clientType);
     return std::nullopt;
   }
-  auto payload = fetchStorebagWithName(http, library, *name, maxAge, notModified, lastModified);
+  auto payload = fetchStorebagWithName(http, library, *name, maxAge, notModified, lastModified, kept);
   if (!payload) {
     if (notModified) return std::nullopt;
     VESK_LOG_ERROR("fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type %d",
@@ -190,6 +187,16 @@ std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
     VESK_LOG_INFO("fetchStorebagForEnvironmentAndClientType: Store bag override MaxAge=%d", maxAge);
   }
   return section;
+}
+
+std::optional<KeptSection> keptStorebagForClientType(const KeptStorebags& kept, std::int32_t clientType) {
+  const auto name = storebagNameForClientType(clientType);
+  auto storebag = name ? kept.load(*name) : std::nullopt;
+  if (!storebag) return std::nullopt;
+  auto section = storebagSectionForEnvironment(storebag->payload, currentEnvironmentType(), clientType);
+  if (!section) return std::nullopt;
+  return KeptSection{*std::move(section), profileText(kStorebag, storebag->payload, "version"),
+                     std::move(storebag->lastModified)};
 }
 
 }  // namespace vesk

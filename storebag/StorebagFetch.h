@@ -9,14 +9,16 @@
 
 #include <VeskReporting/values/Value.h>
 #include "platform/http/HTTPClient.h"
+#include "storebag/KeptStorebags.h"
+#include "storebag/SignedDocument.h"
 
 namespace vesk {
 
 /// What a fetch uses from the client library's installation.
 struct LibraryFacts {
   std::string version;
-  /// Returns the DER bytes of the RSA key that storebags are signed with, or nullopt. Called for each fetch.
-  std::function<std::optional<std::string>()> publicKey;
+  /// The keys that storebags may be signed with. Called for each fetch.
+  std::function<PublicKeys()> publicKeys;
 };
 
 /// The maximum age in seconds that a "Cache-Control" header gives a storebag; 86400 if the header is absent
@@ -37,9 +39,13 @@ HTTPRequest storebagRequest(std::string url, const std::optional<std::string>& l
 ///
 /// Returns nullopt, and logs the reason, if there is no usable storebag. If the server can't be reached, the
 /// built-in storebag replaces "palvo".
+///
+/// `kept`, if there is one, gets each verified document. While it has one of that name, the built-in storebag
+/// is not used.
 std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryFacts& library,
                                                 std::string_view name, std::int32_t& maxAge,
-                                                bool& notModified, std::optional<std::string>* lastModified);
+                                                bool& notModified, std::optional<std::string>* lastModified,
+                                                const KeptStorebags* kept = nullptr);
 
 /// The section of a storebag's payload for an environment type. The section "release" replaces a missing
 /// section "seed". Returns nullopt, with a line of level 3, if there is no section; the line shows "(none)"
@@ -52,6 +58,18 @@ std::optional<Dictionary> storebagSectionForEnvironment(const Dictionary& payloa
 /// `maxAge` is the storebag's own value if it has one. `version` is set if a section is returned.
 std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
     HTTPClient& http, const LibraryFacts& library, std::int32_t clientType, std::int32_t& maxAge,
-    std::optional<std::string>& version, bool& notModified, std::optional<std::string>* lastModified);
+    std::optional<std::string>& version, bool& notModified, std::optional<std::string>* lastModified,
+    const KeptStorebags* kept = nullptr);
+
+/// What a kept storebag gives a client type before the first fetch.
+struct KeptSection {
+  Dictionary section;
+  std::optional<std::string> version;
+  std::optional<std::string> lastModified;
+};
+
+/// Returns nullopt if no storebag is kept for the client type, or if it has no section for this device's
+/// environment.
+std::optional<KeptSection> keptStorebagForClientType(const KeptStorebags& kept, std::int32_t clientType);
 
 }  // namespace vesk

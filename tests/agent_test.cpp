@@ -158,6 +158,44 @@ TEST_F(AgentStorebags, AsksForWhatIsNewerThanItsLastAnswer) {
   EXPECT_EQ(fetched.size(), 5u);
 }
 
+TEST_F(AgentStorebags, AKeptStorebagSeedsTheRecordAndSpreadsTheFetches) {
+  double random = 0.5;
+  std::chrono::seconds uptime = 100s;
+  agent = std::make_shared<ReportingdAgent>(
+      sessionServices, [this](auto&&... arguments) { return fetch(arguments...); }, busyMarker,
+      KeptStorebagSource{.load =
+                             [](std::int32_t) {
+                               return KeptSection{kFirst, "kept", "Mon"};
+                             },
+                         .random = [&random] { return random; },
+                         .uptime = [&uptime] { return uptime; }});
+  auto session = newSession();
+  EXPECT_EQ(agent->storebagForSession(*session), kFirst);
+  EXPECT_EQ(agent->storebagVersionForSession(*session), "kept");
+  harness.clock.advance(349s);
+  EXPECT_EQ(agent->storebagForSession(*session), kFirst);
+  EXPECT_EQ(fetched.size(), 0u) << "half of 15 minutes after the device's start are not over";
+  harness.clock.advance(1s);
+  EXPECT_EQ(agent->storebagForSession(*session), kFirst);
+  EXPECT_EQ(previous, "Mon");
+  EXPECT_EQ(fetched.size(), 1u);
+  EXPECT_EQ(agent->storebagForSession(*session), kFirst);
+  EXPECT_EQ(fetched.size(), 1u) << "a failure waits for 900 seconds";
+  harness.clock.advance(900s);
+  next = {kSecond, 1000, "2"};
+  EXPECT_EQ(agent->storebagForSession(*session), kSecond);
+  harness.clock.advance(949s);
+  EXPECT_EQ(agent->storebagForSession(*session), kSecond);
+  EXPECT_EQ(fetched.size(), 2u);
+  harness.clock.advance(1s);
+  EXPECT_EQ(agent->storebagForSession(*session), kSecond);
+  EXPECT_EQ(fetched.size(), 3u) << "the age is shortened by half of a tenth";
+
+  uptime = 451s;
+  EXPECT_EQ(agent->storebagForSession(*newSession(5)), kSecond);
+  EXPECT_EQ(fetched.size(), 4u) << "its time is over";
+}
+
 TEST_F(AgentStorebags, HoldsItsMonitorDuringAFetchAndNoLonger) {
   auto session = newSession();
   auto other = newSession(5);

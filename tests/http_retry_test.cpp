@@ -33,7 +33,8 @@ TEST(RetryPolicy, WaitsGrowAreSpreadAndEnd) {
 
 class Schedule : public testing::Test {
  protected:
-  explicit Schedule(const HTTPClient::Options& options = {.maximumWaiting = 100, .maximumConnectionsPerHost = 3})
+  explicit Schedule(const HTTPClient::Options& options = {.maximumWaiting = 100,
+                                                          .maximumConnectionsPerHost = 3})
       : schedule(options) {}
 
   /// Adds a post, or a fetch if it is never retried.
@@ -63,9 +64,7 @@ class Schedule : public testing::Test {
     return names;
   }
   std::string givenUp() { return std::exchange(givenUpNames, ""); }
-  void failFirst() {
-    fail({.error = {HTTPError::Kind::Connect, "down"}, .mayRetry = true, .mayKeep = true});
-  }
+  void failFirst() { fail({.error = {HTTPError::Kind::Connect, "down"}, .mayRetry = true, .mayKeep = true}); }
   void fail(HTTPSchedule::Failure failure) {
     schedule.failed(std::move(active.front()), std::move(failure), now);
     active.erase(active.begin());
@@ -178,7 +177,8 @@ TEST_F(Schedule, OwnersTakeTurnsAndShareWhatMayWait) {
 class NotingKeeper final : public PostKeeper {
  public:
   bool keep(HTTPRequest post, std::chrono::seconds delay) override {
-    kept += post.url.substr(post.url.rfind('/') + 1) + (delay > 0s ? "(" + std::to_string(delay.count()) + ")" : "");
+    kept += post.url.substr(post.url.rfind('/') + 1) +
+            (delay > 0s ? "(" + std::to_string(delay.count()) + ")" : "");
     return true;
   }
   Ticket keepCopy(const HTTPRequest&) override { return 1; }
@@ -193,7 +193,9 @@ class NotingKeeper final : public PostKeeper {
 
 class KeptPosts : public Schedule {
  protected:
-  KeptPosts() : Schedule({.maximumWaiting = 100, .keeper = &keeper, .retryFor = 5s, .maximumConnectionsPerHost = 3}) {}
+  KeptPosts()
+      : Schedule({.maximumWaiting = 100, .keeper = &keeper, .retryFor = 5s, .maximumConnectionsPerHost = 3}) {
+  }
   std::string kept() { return std::exchange(keeper.kept, ""); }
   NotingKeeper keeper;
 };
@@ -225,10 +227,16 @@ TEST_F(KeptPosts, ThatTheServerMayHaveReceivedGoToTheKeeperAtOnceAndWait) {
   add("1");
   add("2");
   EXPECT_EQ(takeReady(), "12");
-  fail({.error = {HTTPError::Kind::Interrupted, "cut off"}, .mayRetry = true, .mayKeep = true, .wasSentWhole = true});
+  fail({.error = {HTTPError::Kind::Interrupted, "cut off"},
+        .mayRetry = true,
+        .mayKeep = true,
+        .wasSentWhole = true});
   EXPECT_EQ(kept(), "1(30)");
   active.front()->ticket = 7;
-  fail({.error = {HTTPError::Kind::Interrupted, "cut off"}, .mayRetry = true, .mayKeep = true, .wasSentWhole = true});
+  fail({.error = {HTTPError::Kind::Interrupted, "cut off"},
+        .mayRetry = true,
+        .mayKeep = true,
+        .wasSentWhole = true});
   EXPECT_EQ(kept(), "#7(30)") << "it has a copy";
   add("3");
   EXPECT_EQ(takeReady(), "3");

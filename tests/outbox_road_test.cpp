@@ -44,7 +44,8 @@ class OutboxRoad : public testing::Test {
   /// Waits for the events 0 to `count` - 1, each of which must have arrived once.
   void expectAllOnce(int count) {
     std::map<std::int64_t, int> arrivals;
-    for (const auto& each : harness.waitForEventsOfMethod(3, count)) ++arrivals[each.at("event").at("n").as_int64()];
+    for (const auto& each : harness.waitForEventsOfMethod(3, count))
+      ++arrivals[each.at("event").at("n").as_int64()];
     EXPECT_EQ(arrivals.size(), static_cast<std::size_t>(count));
     for (const auto& [n, times] : arrivals) EXPECT_EQ(times, 1) << n;
   }
@@ -65,9 +66,25 @@ TEST_F(OutboxRoad, ConfirmedEventsSurviveAKillAndAStop) {
 
   sendInAnOutage(10, 10);
   EXPECT_EQ(harness.stopDaemon(), 0);
-  EXPECT_NE(harness.daemon().errors().find("main: Delayed since the start: httpPost deferred 1"), std::string::npos);
+  EXPECT_NE(harness.daemon().errors().find("main: Delayed since the start: httpPost deferred 1"),
+            std::string::npos);
   restart();
   expectAllOnce(20);
+}
+
+TEST_F(OutboxRoad, ADeviceThatStartsWithoutANetworkReports) {
+  harness.setPreference("keepStorebags", "true");
+  start();
+  EXPECT_EQ(harness.stopDaemon(), 0);
+  client.reset();
+  harness.stopCollector();
+  harness.startDaemon();
+  client.emplace(harness);
+  ASSERT_TRUE(client->enabled) << harness.daemon().errors();
+  ASSERT_TRUE(client->reporting.sendMessageAndWait(message(3, Dictionary{{"n", 0}}, 1)));
+  EXPECT_EQ(harness.stopDaemon(), 0);
+  restart();
+  expectAllOnce(1);
 }
 
 TEST_F(OutboxRoad, WithdrawnConsentDeletesWhatWaits) {
@@ -92,7 +109,8 @@ action = "remove"
   harness.startCollector();
   harness.startDaemon();
   EXPECT_EQ(harness.stopDaemon(), 0);
-  EXPECT_NE(harness.daemon().errors().find("main: Lost since the start: httpPost consent-withdrawn"), std::string::npos)
+  EXPECT_NE(harness.daemon().errors().find("main: Lost since the start: httpPost consent-withdrawn"),
+            std::string::npos)
       << harness.daemon().errors();
 }
 

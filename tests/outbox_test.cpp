@@ -25,7 +25,8 @@ TEST(HostBackoff, WaitsGrowToAQuarterOfAnHourAndAreSpread) {
     HostBackoff backoff;
     backoff.begin(now, random);
     for (auto wait : {30s, 90s, 270s, 810s, 900s, 900s}) {
-      EXPECT_EQ(backoff.next(), now + std::chrono::duration_cast<HostBackoff::Duration>(wait * (0.5 + random)));
+      EXPECT_EQ(backoff.next(),
+                now + std::chrono::duration_cast<HostBackoff::Duration>(wait * (0.5 + random)));
       EXPECT_FALSE(backoff.isUp());
       backoff.begin(now, 0.3);  // further posts do not delay the attempt
       backoff.failed(now, random);
@@ -103,7 +104,8 @@ class Outbox : public testing::Test {
       changed.notify_all();
     };
     outbox = std::make_unique<PostOutbox>(options);
-    client = std::make_unique<HTTPClient>(HTTPClient::Options{.keeper = outbox.get(), .retryFor = 20ms, .firstRetryAfter = 5ms});
+    client = std::make_unique<HTTPClient>(
+        HTTPClient::Options{.keeper = outbox.get(), .retryFor = 20ms, .firstRetryAfter = 5ms});
     outbox->start(*client);
   }
   void end() {
@@ -138,7 +140,9 @@ class Outbox : public testing::Test {
     std::unique_lock lock(mutex);
     changed.wait(lock, [&] { return !waiting; });
   }
-  std::string file(const std::string& suffix = "") { return (directory / "state/outbox.sqlite").string() + suffix; }
+  std::string file(const std::string& suffix = "") {
+    return (directory / "state/outbox.sqlite").string() + suffix;
+  }
   std::string bytesOfFiles() {
     std::string all;
     for (const char* suffix : {"", "-wal"}) {

@@ -50,6 +50,7 @@ class StorebagFetch : public testing::Test {
     delete _key;
   }
 
+  static std::string ownKey() { return _key->publicKeyInfo(); }
   static std::string base() { return _server->url("/bags/sorrel"); }
   static std::string url(const std::string& name) { return base() + "/" + name + "?version=7.3"; }
   static RecordingServer& server() { return *_server; }
@@ -75,7 +76,7 @@ class StorebagFetch : public testing::Test {
     notModified = false;
     log.clear();
     return fetchStorebagForEnvironmentAndClientType(http, library, clientType, maxAge, version, notModified,
-                                                    &lastModified);
+                                                    &lastModified, kept.get());
   }
   /// The HTTP client's description of the failure to fetch that storebag.
   std::string errorOf(const std::string& name) {
@@ -97,7 +98,8 @@ class StorebagFetch : public testing::Test {
 
   CapturedLog log;
   HTTPClient http;
-  LibraryFacts library{"7.3", [] { return std::optional(_key->publicKeyInfo()); }};
+  LibraryFacts library{"7.3", [] { return PublicKeys{_key->publicKeyInfo()}; }};
+  std::unique_ptr<KeptStorebags> kept;  // none unless a test keeps storebags
   std::int32_t maxAge = -1;
   std::optional<std::string> version;
   bool notModified = false;
@@ -190,10 +192,53 @@ TEST_F(StorebagFetch, EveryFailureSaysWhatItIs) {
 
 TEST_F(StorebagFetch, WithoutAUsableKeyNothingIsTrusted) {
   serve(signedStorebag(payload()));
-  for (auto key : {std::optional<std::string>(), std::optional<std::string>("rubbish")}) {
-    library.publicKey = [key] { return key; };
+  for (const auto& keys : {PublicKeys(), PublicKeys{"rubbish"}}) {
+    library.publicKeys = [keys] { return keys; };
     EXPECT_FALSE(fetch());
     EXPECT_EQ(lines(), (Lines{{3, forClientType("Could not fetch storebag for client type 5")}}));
+  }
+}
+
+TEST_F(StorebagFetch, AnyOfTheKeysVerifies) {
+  serve(signedStorebag(payload()));
+  library.publicKeys = [] { return PublicKeys{"rubbish", TestSigningKey().publicKeyInfo(), ownKey()}; };
+  EXPECT_EQ(fetch(), kSeed);
+  library.publicKeys = [] {
+    return PublicKeys{TestSigningKey().publicKeyInfo(), TestSigningKey().publicKeyInfo()};
+  };
+  EXPECT_FALSE(fetch());
+  EXPECT_EQ(log.countContaining(3, "Signature can not be verified"), 1) << "one line, after all keys";
+}
+
+TEST_F(StorebagFetch, AKeptStorebagServesUntilItIsTamperedWith) {
+  const auto directory = testRoot() / "kept";
+  kept = std::make_unique<KeptStorebags>(directory.string(), library.publicKeys);
+  EXPECT_FALSE(keptStorebagForClientType(*kept, 7));
+  serve(signedStorebag(payload()), {{"Last-Modified", "Mon"}});
+  EXPECT_EQ(fetch(7), kSeed);
+  serve("rubbish", {{"Last-Modified", "Tue"}});
+  EXPECT_FALSE(fetch(7)) << "only a good one is kept";
+  const auto section = keptStorebagForClientType(*kept, 7);
+  ASSERT_TRUE(section);
+  EXPECT_EQ(section->section, kSeed);
+  EXPECT_EQ(section->version, "2.5");
+  EXPECT_EQ(section->lastModified, "Mon");
+  EXPECT_FALSE(keptStorebagForClientType(*kept, 5)) << "of another name";
+  server().stop();
+  EXPECT_FALSE(fetch(7)) << "the built-in storebag does not replace it";
+  server().start();
+
+  const auto file = directory / "palvo.storebag";
+  std::string bytes = testRoot().read("kept/palvo.storebag");
+  const auto bag = bytes.find("<key>bag</key>");
+  ASSERT_NE(bag, std::string::npos);
+  bytes[bag + 60] = bytes[bag + 60] == 'A' ? 'B' : 'A';
+  for (const std::string& bad : {bytes, bytes.substr(0, 300), std::string("Mon"), std::string()}) {
+    std::ofstream(file, std::ios::binary) << bad;
+    log.clear();
+    EXPECT_FALSE(keptStorebagForClientType(*kept, 7));
+    EXPECT_EQ(log.countContaining(3, "palvo.storebag is removed"), 1) << bad.size();
+    EXPECT_FALSE(std::filesystem::exists(file));
   }
 }
 

@@ -37,11 +37,11 @@ TEST(Counters, PutNamesBeyondTheBoundTogether) {
 
 TEST(Counters, HaveANameForEveryReason) {
   const std::string_view names[] = {
-      "state-disabled", "transport-error", "no-url",       "server-error-5xx", "over-bound",
-      "body-not-built", "invalid-message", "no-backend",   "upload-failed",    "never-enabled",
-      "unacknowledged", "not-aggregated",  "not-recorded", "adaptor-failed",   "server-refused",
-      "deferred",       "delivered-late",  "refused",      "expired",          "over-quota",
-      "consent-withdrawn", "damaged",      "not-written",
+      "state-disabled",    "transport-error", "no-url",       "server-error-5xx", "over-bound",
+      "body-not-built",    "invalid-message", "no-backend",   "upload-failed",    "never-enabled",
+      "unacknowledged",    "not-aggregated",  "not-recorded", "adaptor-failed",   "server-refused",
+      "deferred",          "delivered-late",  "refused",      "expired",          "over-quota",
+      "consent-withdrawn", "damaged",         "not-written",
   };
   ASSERT_EQ(std::size(names), kDropReasonCount);
   for (std::size_t i = 0; i <= kDropReasonCount; ++i)

@@ -107,7 +107,7 @@ class HTTPClient {
     PostKeeper* keeper = nullptr;
     /// From the first attempt of a post, or from its start for one that waits behind others.
     std::chrono::milliseconds retryFor{60'000};
-    std::chrono::milliseconds firstRetryAfter{200};     ///< doubles each time, up to 10 s, with ±50 % jitter
+    std::chrono::milliseconds firstRetryAfter{200};  ///< doubles each time, up to 10 s, with ±50 % jitter
     std::chrono::milliseconds connectTimeout{15'000};
     /// A post without TCP acknowledgements for this long is sent again on another connection: after a change
     /// of network, kept connections are dead but report no error.
@@ -136,13 +136,13 @@ class HTTPClient {
   HTTPResult perform(HTTPRequest request);
 
   /// From now on fails all requests except posts with the error `Stopped`, including new ones, so that a
-  /// server that hangs delays no one. Posts continue. Those that wait for a host to come back go to the keeper,
-  /// or are tried immediately if there is none. Doesn't block.
+  /// server that hangs delays no one. Posts continue. Those that wait for a host to come back go to the
+  /// keeper, or are tried immediately if there is none. Doesn't block.
   void stopAllButPosts();
 
-  /// Fails outstanding requests with `Stopped`, running their completions, and ends the thread. Posts go to the
-  /// keeper. From now on, requests fail in the same way within `start`. May be called more than once, but not
-  /// from a completion.
+  /// Fails outstanding requests with `Stopped`, running their completions, and ends the thread. Posts go to
+  /// the keeper. From now on, requests fail in the same way within `start`. May be called more than once, but
+  /// not from a completion.
   void stop();
 
   /// Waits up to `timeout` for all requests to end. Returns true if none is outstanding.

@@ -91,10 +91,12 @@ void HTTPSchedule::failed(Exchange exchange, Failure failure, Instant now) {
   release(host, *exchange);
   if (exchange->isPost() && failure.error.kind != HTTPError::Kind::BadURL) {
     noteOutage(host, *exchange, failure.error);
-    // A few attempts fill the slots of a host that swallows connections; posts behind them would wait for ever.
+    // A few attempts fill the slots of a host that swallows connections; posts behind them would wait for
+    // ever.
     if (exchange->firstAttempt + _policy.retryFor <= now) giveUpLate(host, now);
   }
-  if (failure.mayRetry && exchange->isPost() && keepForRetry(host, exchange, failure.wasSentWhole, now)) return;
+  if (failure.mayRetry && exchange->isPost() && keepForRetry(host, exchange, failure.wasSentWhole, now))
+    return;
   if (failure.mayKeep) {
     exchange->giveUp(std::move(failure.error), _keeper,
                      failure.wasSentWhole ? kWaitAfterWholeBody : std::chrono::seconds(0));
@@ -243,8 +245,10 @@ void HTTPSchedule::giveUpOne(Host& host, Lane& lane) {
   giveUp(std::move(post), host.outage ? *host.outage : HTTPError{HTTPError::Kind::Other, kTooMany});
 }
 
-// A host that was not heard of for so long, although all its connections are in use, counts as one in an outage.
-std::optional<HTTPSchedule::Instant> HTTPSchedule::endOfWait(const Host& host, const HTTPExchange& post) const {
+// A host that was not heard of for so long, although all its connections are in use, counts as one in an
+// outage.
+std::optional<HTTPSchedule::Instant> HTTPSchedule::endOfWait(const Host& host,
+                                                             const HTTPExchange& post) const {
   if (!host.outage && host.activePosts < _maximumActivePosts) return std::nullopt;
   return (host.outage ? post.started : std::max(post.started, host.lastAnswer)) + _policy.retryFor;
 }

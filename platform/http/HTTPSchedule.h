@@ -49,9 +49,9 @@ class HTTPSchedule {
   /// up.
   void failed(Exchange exchange, Failure failure, Instant now);
 
-  /// Fails all waiting requests except posts with the error `Stopped`. Posts that wait for a host to come back
-  /// go to the keeper; without one, they are tried immediately. From now on a post is retried only if there is
-  /// no keeper.
+  /// Fails all waiting requests except posts with the error `Stopped`. Posts that wait for a host to come
+  /// back go to the keeper; without one, they are tried immediately. From now on a post is retried only if
+  /// there is no keeper.
   void stopAllButPosts();
   /// Gives up everything that waits with `Stopped`.
   void stopAll();
@@ -104,7 +104,8 @@ class HTTPSchedule {
   void giveUpOne(Host& host, Lane& lane);
   void giveUp(Exchange exchange, HTTPError error) { exchange->giveUp(std::move(error), _keeper); }
 
-  /// The time at which a queued post has waited too long for a host that doesn't answer; nullopt if it may wait.
+  /// The time at which a queued post has waited too long for a host that doesn't answer; nullopt if it may
+  /// wait.
   std::optional<Instant> endOfWait(const Host& host, const HTTPExchange& post) const;
   /// Gives up the queued posts that waited too long for the host.
   void giveUpLate(Host& host, Instant now);

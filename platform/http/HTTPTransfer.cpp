@@ -238,8 +238,8 @@ HTTPSchedule::Failure HTTPTransfer::failureFrom(CURLcode code) const {
   failure.mayKeep = kind != Kind::BadURL && kind != Kind::OutOfMemory && kind != Kind::TooLarge;
   curl_off_t sent = 0;
   curl_easy_getinfo(handle(), CURLINFO_SIZE_UPLOAD_T, &sent);
-  failure.wasSentWhole = !_exchange->request.body.empty() &&
-                         static_cast<std::size_t>(sent) >= _exchange->request.body.size();
+  failure.wasSentWhole =
+      !_exchange->request.body.empty() && static_cast<std::size_t>(sent) >= _exchange->request.body.size();
   return failure;
 }
 

@@ -30,7 +30,8 @@ bool NetworkMonitor::takeChange() noexcept {
     }
     if (size <= 0) return changed;
     auto left = static_cast<unsigned>(size);
-    for (auto* event = reinterpret_cast<nlmsghdr*>(events); NLMSG_OK(event, left); event = NLMSG_NEXT(event, left)) {
+    for (auto* event = reinterpret_cast<nlmsghdr*>(events); NLMSG_OK(event, left);
+         event = NLMSG_NEXT(event, left)) {
       changed = changed || event->nlmsg_type == RTM_NEWROUTE;
     }
   }

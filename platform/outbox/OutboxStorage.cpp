@@ -68,7 +68,8 @@ bool OutboxStorage::writeToFile(const Changes& changes, Instant now, Lost& lost)
   return false;
 }
 
-void OutboxStorage::apply(const Changes& changes, OutboxStore& store, std::uint64_t limit, Losses& overQuota) {
+void OutboxStorage::apply(const Changes& changes, OutboxStore& store, std::uint64_t limit,
+                          Losses& overQuota) {
   for (const WaitingPost& post : changes.added) add(post, store, limit, overQuota);
   for (const auto& [id, notBefore] : changes.postponed) store.postpone(id, notBefore);
   for (std::int64_t id : changes.removed) store.remove(id);
@@ -98,7 +99,8 @@ std::vector<WaitingPost> OutboxStorage::postsInMemory() const {
   if (!_memory) return posts;
   for (const auto& [host, count] : _memory->countByHost()) {
     Losses damaged;
-    for (auto& post : _memory->posts(host, 0, count, kAll, kAnyTime, damaged)) posts.push_back(std::move(post));
+    for (auto& post : _memory->posts(host, 0, count, kAll, kAnyTime, damaged))
+      posts.push_back(std::move(post));
   }
   return posts;
 }
@@ -109,7 +111,8 @@ OutboxStorage::Losses OutboxStorage::waitingInMemory() const {
   return lost;
 }
 
-std::vector<WaitingPost> OutboxStorage::read(std::string_view host, std::int64_t id, WallTime now, Lost& lost) {
+std::vector<WaitingPost> OutboxStorage::read(std::string_view host, std::int64_t id, WallTime now,
+                                             Lost& lost) {
   std::vector<WaitingPost> posts;
   onEach(lost, [&](OutboxStore& store) {
     if (posts.empty()) posts = store.posts(host, id, kPostsAtOnce, kBytesAtOnce, now, lost.damaged);
@@ -156,7 +159,9 @@ bool OutboxStorage::isEmpty() const {
 }
 
 bool OutboxStorage::has(std::string_view host) const {
-  const auto contains = [&](const auto& store) { return store && store->countByHost().find(host) != store->countByHost().end(); };
+  const auto contains = [&](const auto& store) {
+    return store && store->countByHost().find(host) != store->countByHost().end();
+  };
   return contains(_file) || contains(_memory);
 }
 
@@ -169,9 +174,7 @@ std::set<std::string> OutboxStorage::hosts() const {
   return hosts;
 }
 
-void OutboxStorage::open() {
-  _file = std::make_unique<OutboxStore>(_path);
-}
+void OutboxStorage::open() { _file = std::make_unique<OutboxStore>(_path); }
 
 void OutboxStorage::handle(const OutboxStoreError& error, Lost& lost) {
   if (error.isDamage()) {

@@ -14,9 +14,9 @@
 
 namespace vesk {
 
-/// Never fails: a full disk or a file that another process uses leaves the posts in memory, and they move to the
-/// file when it can be used again. A damaged file is moved to "….damaged", replacing an earlier one, and started
-/// anew. Each problem is logged once. For use by one thread at a time; waits for the disk.
+/// Never fails: a full disk or a file that another process uses leaves the posts in memory, and they move to
+/// the file when it can be used again. A damaged file is moved to "….damaged", replacing an earlier one, and
+/// started anew. Each problem is logged once. For use by one thread at a time; waits for the disk.
 class OutboxStorage {
  public:
   using Instant = std::chrono::steady_clock::time_point;

@@ -30,7 +30,8 @@ constexpr char kSetUp[] =
     "PRAGMA journal_size_limit=1048576;"
     "BEGIN IMMEDIATE;"
     "CREATE TABLE IF NOT EXISTS posts(id INTEGER PRIMARY KEY, host TEXT NOT NULL, owner INTEGER NOT NULL,"
-    " source TEXT NOT NULL, events INTEGER NOT NULL, respects_consent INTEGER NOT NULL, kept INTEGER NOT NULL,"
+    " source TEXT NOT NULL, events INTEGER NOT NULL, respects_consent INTEGER NOT NULL, kept INTEGER NOT "
+    "NULL,"
     " not_before INTEGER NOT NULL, size INTEGER NOT NULL, checksum INTEGER NOT NULL, url TEXT NOT NULL,"
     " headers TEXT NOT NULL, body BLOB NOT NULL);"
     "CREATE INDEX IF NOT EXISTS posts_host ON posts(host, id);"
@@ -93,7 +94,8 @@ std::int64_t checksum(std::string_view url, std::string_view headers, std::strin
 std::optional<WaitingPost> postAt(sqlite3_stmt* row) {
   const auto url = textAt(row, 8), headers = textAt(row, 9), body = textAt(row, 10);
   if (sqlite3_column_int64(row, 7) != checksum(url, headers, body)) return std::nullopt;
-  WaitingPost post{.id = sqlite3_column_int64(row, 0), .request = {}, .kept = timeAt(row, 5), .notBefore = timeAt(row, 6)};
+  WaitingPost post{
+      .id = sqlite3_column_int64(row, 0), .request = {}, .kept = timeAt(row, 5), .notBefore = timeAt(row, 6)};
   post.request.method = "POST";
   post.request.url = url;
   post.request.headers = headersFrom(headers);
@@ -276,7 +278,8 @@ void OutboxStore::readTotals() {
   _bytes = _events = 0;
   _bytesByOwner.clear();
   _countByHost.clear();
-  auto row = statement("SELECT host, owner, count(*), sum(size), max(id), sum(events) FROM posts GROUP BY host, owner");
+  auto row = statement(
+      "SELECT host, owner, count(*), sum(size), max(id), sum(events) FROM posts GROUP BY host, owner");
   while (step(row.get())) {
     const auto size = static_cast<std::uint64_t>(sqlite3_column_int64(row.get(), 3));
     _countByHost[std::string(textAt(row.get(), 0))] +=
@@ -309,6 +312,8 @@ void OutboxStore::check(int result) {
   if (result != SQLITE_OK) fail();
 }
 
-void OutboxStore::fail() { throw OutboxStoreError(sqlite3_errcode(_database.get()), sqlite3_errmsg(_database.get())); }
+void OutboxStore::fail() {
+  throw OutboxStoreError(sqlite3_errcode(_database.get()), sqlite3_errmsg(_database.get()));
+}
 
 }  // namespace vesk

@@ -36,8 +36,8 @@ class OutboxStoreError : public std::runtime_error {
   int _code;
 };
 
-/// An SQLite database (WAL), locked for one process, with one row per post and bodies as they are sent. What is
-/// removed is overwritten. For use by one thread at a time; waits for the disk. Every operation may throw
+/// An SQLite database (WAL), locked for one process, with one row per post and bodies as they are sent. What
+/// is removed is overwritten. For use by one thread at a time; waits for the disk. Every operation may throw
 /// OutboxStoreError; afterwards only the destructor may be called if it was damage.
 class OutboxStore {
  public:
@@ -59,8 +59,8 @@ class OutboxStore {
   void add(const WaitingPost& post);
   void remove(std::int64_t id);
   void postpone(std::int64_t id, WallTime notBefore);
-  /// Removes the oldest post of the owner with most bytes, where `owner` counts with `bytes` more. Returns false
-  /// if that owner has none.
+  /// Removes the oldest post of the owner with most bytes, where `owner` counts with `bytes` more. Returns
+  /// false if that owner has none.
   bool removeOneOfTheFullest(std::uint32_t owner, std::uint64_t bytes, Losses& lost);
   Losses removeKeptBefore(WallTime time);
   /// Removes the posts that respect consent, without leaving their bytes in the file or its log.

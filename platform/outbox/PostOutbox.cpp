@@ -97,7 +97,9 @@ bool PostOutbox::keep(HTTPRequest post, std::chrono::seconds delay) {
   return put(std::move(post), delay, false) != 0;
 }
 
-PostOutbox::Ticket PostOutbox::keepCopy(const HTTPRequest& post) { return put(post, std::chrono::seconds(0), true); }
+PostOutbox::Ticket PostOutbox::keepCopy(const HTTPRequest& post) {
+  return put(post, std::chrono::seconds(0), true);
+}
 
 void PostOutbox::sendLater(Ticket ticket, std::chrono::seconds delay) {
   const auto id = static_cast<std::int64_t>(ticket);
@@ -204,7 +206,8 @@ std::optional<PostOutbox::Instant> PostOutbox::nextEvent() const {
   if (!_storage.isEmpty()) consider(_nextExpiry);
   for (const auto& [name, host] : _hosts) {
     // Otherwise the answers wake the thread.
-    if (host.sending == 0) consider(std::max(host.backoff.next(), host.ready.empty() ? host.readAgain : Instant{}));
+    if (host.sending == 0)
+      consider(std::max(host.backoff.next(), host.ready.empty() ? host.readAgain : Instant{}));
   }
   return next;
 }
@@ -307,7 +310,8 @@ void PostOutbox::sendReady() {
   for (auto each = _hosts.begin(); each != _hosts.end();) {
     auto& [name, host] = *each;
     sendReady(name, host);
-    const bool isDone = host.sending == 0 && host.ready.empty() && _changes.added.empty() && !_storage.has(name);
+    const bool isDone =
+        host.sending == 0 && host.ready.empty() && _changes.added.empty() && !_storage.has(name);
     each = isDone ? _hosts.erase(each) : std::next(each);
   }
 }
@@ -346,7 +350,8 @@ void PostOutbox::send(const std::string& name, Host& host) {
   WaitingPost post = std::move(host.ready.front());
   host.ready.pop_front();
   post.request.retry = HTTPRequest::Retry::Never;
-  auto answer = std::make_shared<Answer>(Answer{post.id, name, {post.request.source, post.request.events}, {}});
+  auto answer =
+      std::make_shared<Answer>(Answer{post.id, name, {post.request.source, post.request.events}, {}});
   auto completion = [this, answer](HTTPResult result) {
     answer->result = std::move(result);
     {

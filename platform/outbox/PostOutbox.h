@@ -27,9 +27,9 @@
 
 namespace vesk {
 
-/// The HTTP client's keeper. Its own thread writes the posts to a file, which is created with the first one, and
-/// sends them through the client: oldest first, over at most two connections a host. While the file can't be
-/// used, posts are kept in memory.
+/// The HTTP client's keeper. Its own thread writes the posts to a file, which is created with the first one,
+/// and sends them through the client: oldest first, over at most two connections a host. While the file can't
+/// be used, posts are kept in memory.
 ///
 /// The client is made with the outbox, then given to it with `start`. At the end: `stopSending`, the client's
 /// `stop`, `stop`. Thread-safe.
@@ -75,8 +75,8 @@ class PostOutbox final : public PostKeeper {
   void start(HTTPClient& client);
   /// Hands no further posts to the client. May be called more than once.
   void stopSending();
-  /// Writes what was kept, closes the file and ends the thread. From now on nothing is kept. May be called more
-  /// than once.
+  /// Writes what was kept, closes the file and ends the thread. From now on nothing is kept. May be called
+  /// more than once.
   void stop();
 
   /// While there is no consent, posts that respect it are not kept, and those that wait are deleted. Doesn't

@@ -9,7 +9,8 @@
 
 namespace vesk {
 
-/// The wait that the server asks for, from `now`; nullopt without a valid header. A date that is over gives 0.
+/// The wait that the server asks for, from `now`; nullopt without a valid header. A date that is over gives
+/// 0.
 std::optional<std::chrono::seconds> retryAfter(const HTTPResponse& response, WallTime now);
 
 }  // namespace vesk

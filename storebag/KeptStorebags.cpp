@@ -1,0 +1,78 @@
+#include "storebag/KeptStorebags.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <utility>
+
+#include "platform/files/PrivateFile.h"
+#include "platform/files/TrustedFile.h"
+#include "platform/files/WriteAll.h"
+#include "platform/log/SystemLog.h"
+#include "platform/plist/PropertyList.h"
+#include "platform/text/PercentCode.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr std::size_t kMaximumFile = std::size_t{5} << 20;  // an answer of 4 MiB with its first line
+
+}  // namespace
+
+void KeptStorebags::keep(std::string_view name, std::string_view document,
+                         const std::optional<std::string>& lastModified) const {
+  std::string bytes = lastModified.value_or("");
+  (bytes += '\n') += document;
+  const std::string path = pathFor(name);
+  if (const auto written = write(path, bytes); !written) {
+    VESK_LOG_WARNING("KeptStorebags: cannot write %s: %s", path.c_str(), written.error().text.c_str());
+  }
+}
+
+std::optional<KeptStorebags::Kept> KeptStorebags::load(std::string_view name) const {
+  const std::string path = pathFor(name);
+  const auto file = readTrustedFile(path, kMaximumFile, TrustedOwner::OwnUser);
+  if (!file && file.error().kind == Error::Kind::Missing) return std::nullopt;
+  auto kept = file ? parse(*file) : file.error();
+  if (kept) return *std::move(kept);
+  VESK_LOG_ERROR("KeptStorebags: %s is removed: %s", path.c_str(), kept.error().text.c_str());
+  ::unlink(path.c_str());
+  return std::nullopt;
+}
+
+std::string KeptStorebags::pathFor(std::string_view name) const {
+  return _directory + "/" + percentEncoded(name, "") + ".storebag";
+}
+
+// The first line is the server's date, which may be empty.
+Result<KeptStorebags::Kept> KeptStorebags::parse(std::string_view file) const {
+  const auto end = file.find('\n');
+  if (end == std::string_view::npos) return malformed("it is incomplete");
+  const auto document = parsePropertyList(file.substr(end + 1));
+  if (!document) return document.error();
+  if (!document->dictionary()) return malformed("it is no signed document");
+  auto verification = verifySignedDocument(*document->dictionary(), _publicKeys());
+  if (verification.verdict != Verification::Verdict::Good)
+    return malformed("its signature can not be verified");
+  Kept kept{.payload = std::move(verification.payload), .lastModified = std::nullopt};
+  if (end > 0) kept.lastModified = std::string(file.substr(0, end));
+  return kept;
+}
+
+Result<void> KeptStorebags::write(const std::string& path, const std::string& bytes) const {
+  ::mkdir(_directory.c_str(), 0700);
+  const std::string temporary = path + ".new";
+  ::unlink(temporary.c_str());
+  const auto file = makePrivateFile(temporary);
+  if (!file) return file.error();
+  auto written = writeAll(file->get(), bytes);
+  if (written && (::fsync(file->get()) != 0 || std::rename(temporary.c_str(), path.c_str()) != 0))
+    written = systemError(errno);
+  if (!written) ::unlink(temporary.c_str());
+  return written;
+}
+
+}  // namespace vesk
