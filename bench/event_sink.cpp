@@ -2,8 +2,9 @@
 //
 // Usage: event_sink FIRST-FILE [tls]
 // Writes its URL (and, with tls, the authority's certificate beside it) to FIRST-FILE. Serves until standard
-// input ends. Prints "events E distinct D late L" for each line of input, where L is the number of distinct
-// events of clients other than the first. A line "away" closes the port first, and "back" opens it again.
+// input ends. Prints "events E distinct D last L" for each line of input, where L is the number of distinct
+// events of the client with the highest number so far. A line "away" closes the port first, and "back" opens
+// it again.
 #include <cstdio>
 #include <cstring>
 #include <fstream>
@@ -28,19 +29,23 @@ class IdCounter {
       if (*at == '"') ++at;
       ++_events;
       const long id = std::strtol(at, nullptr, 10);
-      if (_distinct.insert(id).second && id >= kIdsPerClient) ++_ofOthers;
+      if (!_distinct.insert(id).second || id / kIdsPerClient < _last) continue;
+      if (id / kIdsPerClient > _last) _ofLast = 0;
+      _last = id / kIdsPerClient;
+      ++_ofLast;
     }
   }
   void print() {
     std::lock_guard lock(_mutex);
-    std::printf("events %zu distinct %zu late %zu\n", _events, _distinct.size(), _ofOthers);
+    std::printf("events %zu distinct %zu last %zu\n", _events, _distinct.size(), _ofLast);
   }
 
  private:
   std::mutex _mutex;
   static constexpr long kIdsPerClient = 10'000'000;
   std::size_t _events = 0;
-  std::size_t _ofOthers = 0;
+  long _last = 0;
+  std::size_t _ofLast = 0;
   std::unordered_set<long> _distinct;
 };
 

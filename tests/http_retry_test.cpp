@@ -39,18 +39,23 @@ class Schedule : public testing::Test {
 
   /// Adds a post, or a fetch if it is never retried.
   void add(const std::string& name, std::size_t size = 10, std::uint32_t owner = 0,
-           HTTPRequest::Retry retry = HTTPRequest::Retry::UntilSent, const std::string& host = "https://a") {
+           HTTPRequest::Retry retry = HTTPRequest::Retry::UntilSent, const std::string& host = "https://a",
+           bool isBackground = false) {
     HTTPRequest request;
     request.url = host + "/" + name;
     request.body = std::string(size, 'x');
     request.retry = retry;
     request.owner = owner;
+    request.isBackground = isBackground;
     const auto noteFailure = [this, name](const HTTPResult& result) {
       if (result.error) givenUpNames += name;
     };
     schedule.add(std::make_unique<HTTPExchange>(std::move(request), noteFailure, now, outstanding));
   }
   void addFetch(const std::string& name) { add(name, 0, 0, HTTPRequest::Retry::Never); }
+  void addInBackground(const std::string& name) {
+    add(name, 0, 0, HTTPRequest::Retry::Never, "https://a", true);
+  }
   void addToOtherHost(const std::string& name) {
     add(name, 1, 0, HTTPRequest::Retry::UntilSent, "https://b");
   }
@@ -266,6 +271,27 @@ TEST_F(KeptPosts, BeyondTheBoundGoToTheKeeper) {
   EXPECT_EQ(kept(), "2") << "it did not fit beside the first";
   add("4", 50);
   EXPECT_EQ(kept(), "4") << "the third is about to find out whether the host is back";
+}
+
+class BackgroundRequests : public Schedule {
+ protected:
+  BackgroundRequests() : Schedule({.maximumConnectionsPerHost = 8}) {}
+};
+
+TEST_F(BackgroundRequests, GiveWayAndUseTwoConnections) {
+  for (const char* name : {"1", "2", "3"}) addInBackground(name);
+  add("p");
+  EXPECT_EQ(takeReady(), "p12");
+  addFetch("f");
+  EXPECT_EQ(takeReady(), "f");
+  answerFirst();
+  EXPECT_EQ(takeReady(), "") << "the third waits for the first two";
+  answerFirst();
+  EXPECT_EQ(takeReady(), "3");
+  addInBackground("4");
+  addInBackground("5");
+  schedule.stopAllButPosts();
+  EXPECT_EQ(givenUp(), "45");
 }
 
 TEST_F(Schedule, AFetchThatFindsNoConnectionInTimeIsGivenUp) {

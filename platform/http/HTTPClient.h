@@ -41,6 +41,8 @@ struct HTTPRequest {
   Retry retry = Retry::Never;
   /// The user that the post belongs to, or kNobody. Owners take turns and share the memory for waiting posts.
   std::uint32_t owner = kNobody;
+  /// Sent over at most two connections to the host, and only when no other request to it waits.
+  bool isBackground = false;
 
   // What a keeper must know about a post.
   std::string source;            ///< the backend that made it

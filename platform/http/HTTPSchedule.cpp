@@ -9,6 +9,7 @@ namespace vesk {
 
 namespace {
 constexpr std::chrono::seconds kLongestWait{10};
+constexpr std::size_t kBackgroundConnections = 2;
 constexpr char kTooMany[] = "too many posts wait to be sent";
 }  // namespace
 
@@ -26,7 +27,8 @@ void HTTPSchedule::add(Exchange exchange) {
   Host& host = entry->second;
   if (isNew) host.lastAnswer = exchange->started;
   if (!exchange->isPost()) {
-    host.requests.push_back(std::move(exchange));
+    auto& queue = exchange->request.isBackground ? host.background : host.requests;
+    queue.push_back(std::move(exchange));
     return;
   }
   Lane& lane = host.lanes[exchange->request.owner];
@@ -50,11 +52,13 @@ void HTTPSchedule::advance(Instant now) {
     queueFirst(host, std::move(_retries.extract(_retries.begin()).mapped()));
   }
   for (auto& [name, host] : _hosts) {
-    std::erase_if(host.requests, [now](Exchange& request) {
-      if (request->deadline() > now) return false;
-      request->fail({HTTPError::Kind::Timeout, "timed out before a connection was free"});
-      return true;
-    });
+    for (Queue* queue : {&host.requests, &host.background}) {
+      std::erase_if(*queue, [now](Exchange& request) {
+        if (request->deadline() > now) return false;
+        request->fail({HTTPError::Kind::Timeout, "timed out before a connection was free"});
+        return true;
+      });
+    }
     if (_keeper) giveUpLate(host, now);
   }
   std::erase_if(_hosts, isUnused);
@@ -66,6 +70,10 @@ HTTPSchedule::Exchange HTTPSchedule::next(Instant now) {
     Exchange exchange = takeFirst(host.requests);
     if (!exchange && host.activePosts < _maximumActivePosts && (exchange = takePost(host))) {
       ++host.activePosts;
+    }
+    if (!exchange && host.activeBackground < kBackgroundConnections &&
+        (exchange = takeFirst(host.background))) {
+      ++host.activeBackground;
     }
     if (!exchange) continue;
     ++host.active;
@@ -109,6 +117,7 @@ void HTTPSchedule::failed(Exchange exchange, Failure failure, Instant now) {
 void HTTPSchedule::stopAllButPosts() {
   for (auto& [name, host] : _hosts) {
     while (auto request = takeFirst(host.requests)) request->fail(stopped());
+    while (auto request = takeFirst(host.background)) request->fail(stopped());
   }
   if (std::exchange(_ending, true)) return;
   for (auto& [name, host] : _hosts) {
@@ -135,6 +144,7 @@ std::optional<HTTPSchedule::Instant> HTTPSchedule::nextAdvance() const {
   if (!_retries.empty()) consider(_retries.begin()->first);
   for (const auto& [name, host] : _hosts) {
     for (const auto& request : host.requests) consider(request->deadline());
+    for (const auto& request : host.background) consider(request->deadline());
     if (!_keeper) continue;
     for (const auto& [owner, lane] : host.lanes) {
       if (!lane.posts.empty()) consider(endOfWait(host, *lane.posts.front()));
@@ -151,7 +161,7 @@ std::size_t HTTPSchedule::waitingBodies(const Host& host, const Lane& lane) {
 
 bool HTTPSchedule::isUnused(const Hosts::value_type& entry) {
   const Host& host = entry.second;
-  return host.active == 0 && host.requests.empty() &&
+  return host.active == 0 && host.requests.empty() && host.background.empty() &&
          std::all_of(host.lanes.begin(), host.lanes.end(),
                      [](const auto& lane) { return lane.second.cost == 0; });
 }
@@ -267,6 +277,7 @@ void HTTPSchedule::giveUpLate(Host& host, Instant now) {
 void HTTPSchedule::release(Host& host, const HTTPExchange& exchange) {
   --host.active;
   if (exchange.isPost()) --host.activePosts;
+  if (exchange.request.isBackground) --host.activeBackground;
 }
 
 void HTTPSchedule::noteOutage(Host& host, const HTTPExchange& exchange, const HTTPError& error) {

@@ -70,11 +70,13 @@ class HTTPSchedule {
   /// During an outage, the host's posts wait in `_retries`.
   struct Host {
     Queue requests;
+    Queue background;
     std::map<std::uint32_t, Lane> lanes;  ///< by owner
     std::uint32_t lastServed = 0;         ///< owner
     std::size_t queuedPosts = 0;
     std::size_t active = 0;
     std::size_t activePosts = 0;
+    std::size_t activeBackground = 0;
     std::optional<HTTPError> outage;  ///< the last attempt's error, until an answer arrives
     Instant lastAnswer;               ///< or when the host got its first request
   };

@@ -16,7 +16,9 @@ namespace vesk {
 
 namespace {
 
-constexpr std::size_t kConnectionsPerHost = 2;
+// One for each connection, and one more, so that no connection waits for the next post. Few, since those that
+// were handed over are sent even if the server refuses one because it is busy.
+constexpr std::size_t kHandedOver = 3;
 constexpr std::size_t kMostChangesAtOnce = 256;
 constexpr std::chrono::seconds kReadAgainAfter{5};  // for posts that may not be sent yet
 constexpr std::chrono::hours kExpiryInterval{1};
@@ -319,7 +321,7 @@ void PostOutbox::sendReady() {
 void PostOutbox::sendReady(const std::string& name, Host& host) {
   if (host.backoff.next() > std::chrono::steady_clock::now()) return;
   // One post finds out whether the host is back.
-  const std::size_t most = host.backoff.isUp() ? kConnectionsPerHost : 1;
+  const std::size_t most = host.backoff.isUp() ? kHandedOver : 1;
   while (host.sending < most) {
     if (host.ready.empty()) readMore(name, host);
     if (host.ready.empty()) return;
@@ -350,6 +352,7 @@ void PostOutbox::send(const std::string& name, Host& host) {
   WaitingPost post = std::move(host.ready.front());
   host.ready.pop_front();
   post.request.retry = HTTPRequest::Retry::Never;
+  post.request.isBackground = true;
   auto answer =
       std::make_shared<Answer>(Answer{post.id, name, {post.request.source, post.request.events}, {}});
   auto completion = [this, answer](HTTPResult result) {
