@@ -6,7 +6,7 @@
 #include "backends/dashboard/DashboardDatagram.h"
 #include "backends/dashboard/DashboardText.h"
 #include "platform/unicode/UTF8.h"
-#include "tools/collector/ReceivedDatagram.h"
+#include "tools/collector/DashboardReceiver.h"
 
 namespace {
 

@@ -4,7 +4,7 @@
 
 #include "platform/plist/KeyedArchive.h"
 #include "platform/plist/PropertyList.h"
-#include "tools/collector/ArchiveText.h"
+#include "tools/plist/KeyedArchiveReader.h"
 #include "tools/plist/XMLPropertyListWriter.h"
 
 namespace {

@@ -1,13 +1,14 @@
 #include <gtest/gtest.h>
 #include <utime.h>
 
+#include <algorithm>
+
 #include "tests/support/TempDirectory.h"
-#include "tools/collector/ControlEndpoint.h"
 #include "tools/collector/EventsEndpoint.h"
+#include "tools/collector/FileEndpoints.h"
 #include "tools/collector/StorebagEndpoint.h"
-#include "tools/collector/UploadsEndpoint.h"
 #include "tools/json/JSONReader.h"
-#include "tools/storebag/StorebagDocument.h"
+#include "tools/storebag/StorebagSigning.h"
 #include "util/Gzip.h"
 
 namespace vesk {
@@ -19,7 +20,7 @@ std::string gzip(const std::string& text) { return gzipDeflate(text).value(); }
 
 HTTPReceived request(std::string method, std::string target, HTTPHeaderList headers = {},
                      std::string body = {}) {
-  return {std::move(method), std::move(target), std::move(headers), std::move(body), "127.0.0.1:1", 1};
+  return {std::move(method), std::move(target), std::move(headers), std::move(body), "127.0.0.1:1"};
 }
 
 constexpr char kGoodBody[] =
@@ -54,6 +55,43 @@ TEST_F(CollectorEndpoints, TakePostsAndSaveTheirEvents) {
   std::istringstream lines(_files.read("events.jsonl"));
   for (std::string line; std::getline(lines, line);) EXPECT_TRUE(parseJSON(line)) << line;
   EXPECT_EQ(_stats.events, 3U);
+}
+
+TEST_F(CollectorEndpoints, LeaveOutRepeatedEvents) {
+  const auto body = [](const std::string& event) {
+    return R"({"postTime":1,"clientId":"c","events":[{)" + event + "}]}";
+  };
+  const std::string whole = R"("_sessionID":"7","_eventNumber":1,"_method":3,"_status":2,"_clientTS":9.5)";
+  const HTTPReceived first = post(body(whole));
+  HTTPReceived elsewhere = first;
+  elsewhere.target = "/events";
+  HTTPReceived other = post(body(whole + "},{" + whole + R"(},{"user":"b")"));
+  EventsEndpoint full({_console, _stats, _faults}, _files / "full" / "events.jsonl");
+  EXPECT_EQ(full.answer(first).fault, HTTPAnswer::Fault::CloseWithoutAnswer);
+  _files.write("full/events.jsonl", "");
+  const struct {
+    const char* name;
+    EventsEndpoint& endpoint;
+    HTTPReceived received;
+    unsigned events, repeated;
+  } cases[] = {
+      {"new", _events, first, 1, 0},
+      {"sent again", _events, post(body(whole), {{"X-Vesk-Event-Map", "3 2"}}), 0, 1},
+      {"other URL", _events, elsewhere, 1, 0},
+      {"in part", _events, other, 1, 2},
+      {"other number", _events, post(body(std::string(whole).replace(whole.find("1,"), 1, "2"))), 1, 0},
+      {"a key is missing", _events, post(body(whole.substr(0, whole.rfind(',')))), 1, 0},
+      {"and again", _events, post(body(whole.substr(0, whole.rfind(',')))), 1, 0},
+      {"not saved before", full, first, 1, 0},
+  };
+  std::uint64_t events = 0, repeated = 0;
+  for (const auto& test : cases) {
+    EXPECT_EQ(test.endpoint.answer(test.received).status, 200U) << test.name;
+    EXPECT_EQ(_stats.events, events += test.events) << test.name;
+    EXPECT_EQ(_stats.eventsRepeated, repeated += test.repeated) << test.name;
+  }
+  const std::string saved = _files.read("events.jsonl");
+  EXPECT_EQ(static_cast<std::uint64_t>(std::count(saved.begin(), saved.end(), '\n')), events - 1);
 }
 
 TEST_F(CollectorEndpoints, TakeFilesUnderNamesThatLeadNowhere) {
@@ -141,7 +179,7 @@ TEST_F(CollectorEndpoints, GiveFaultsInTheirOrderAndAsOftenAsAsked) {
 }
 
 TEST_F(CollectorEndpoints, AreSteeredAndCountedOverTheControlPath) {
-  ControlEndpoint control(_console, _stats, _faults);
+  ControlEndpoint control({_console, _stats, _faults});
   EXPECT_EQ(control.answer(request("POST", "/_control/fault", {}, "post=500*1\r\n\nstorebag=stall\n")).body,
             "[\"post=500*1\",\"storebag=stall\"]\n");
   EXPECT_EQ(control.answer(request("POST", "/_control/fault", {}, "nonsense")).status, 400U);
@@ -160,8 +198,8 @@ class StorebagServing : public CollectorEndpoints {
     if (!since.empty()) headers.emplace_back("If-Modified-Since", since);
     return _endpoint.answer(request("GET", path, headers));
   }
-  StorebagVerdict verdictOn(const HTTPAnswer& answer) const {
-    return inspectStorebag(answer.body, _key.publicKeyDER()).verdict;
+  std::string problemOf(const HTTPAnswer& answer) const {
+    return inspectStorebag(answer.body, _key.publicKeyDER()).problem;
   }
   void writeVersion(const std::string& version, std::time_t modified) {
     auto file = _files.write("zelko.toml", "version = '" + version + "'\n[release.wren]\nactive = true\n");
@@ -170,15 +208,15 @@ class StorebagServing : public CollectorEndpoints {
   }
 
   const SigningKey _key = SigningKey::generate();
-  StorebagFolder _folder{_files.path(), StorebagChecks::Strict};
-  StorebagEndpoint _endpoint{{_console, _stats, _faults}, _folder, _key, std::chrono::seconds(60)};
+  StorebagEndpoint _endpoint{
+      {_console, _stats, _faults}, _files.path(), StorebagChecks::Strict, _key, std::chrono::seconds(60)};
 };
 
 TEST_F(StorebagServing, SignsOnTheFlyAndAnswersConditionally) {
   writeVersion("1", 1'795'552'289);
   HTTPAnswer answer = get("/bags/sorrel/zelko?version=7.0");
   EXPECT_EQ(answer.status, 200U);
-  EXPECT_EQ(verdictOn(answer), StorebagVerdict::Valid);
+  EXPECT_EQ(problemOf(answer), "");
   EXPECT_EQ(findHeader(answer.headers, "Last-Modified"), "Tue, 24 Nov 2026 20:31:29 GMT");
   EXPECT_EQ(findHeader(answer.headers, "Cache-Control"), "max-age=60");
 
@@ -198,7 +236,7 @@ TEST_F(StorebagServing, RefusesNamesItDoesNotHaveAndSourcesWithMistakes) {
   HTTPAnswer bad = get("/bags/bad");
   EXPECT_EQ(bad.status, 500U);
   EXPECT_NE(bad.body.find("bad.json: version: must be a text"), std::string::npos);
-  EXPECT_EQ(verdictOn(get("/bags/good")), StorebagVerdict::Valid);
+  EXPECT_EQ(problemOf(get("/bags/good")), "");
   EXPECT_EQ(_endpoint.answer(request("POST", "/bags/good")).status, 405U);
 }
 

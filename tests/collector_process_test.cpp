@@ -51,6 +51,8 @@ TEST_F(CollectorProcess, WritesOneJSONLineAnEventAndNothingElseOnItsOutput) {
   EXPECT_TRUE(collector.waitForText("\"user\":\"mail\""));
   collector.signal(SIGINT);
   EXPECT_EQ(collector.wait(), 0);
+  EXPECT_NE(collector.errors().find("events taken: 1, posts: 1, repeated events left out: 0"),
+            std::string::npos);
   auto line = parseJSON(collector.output());
   ASSERT_TRUE(line) << line.error().text;
   EXPECT_EQ(line->dictionary()->dictionary("headers")->text("X-Vesk-Sender"), "HD");

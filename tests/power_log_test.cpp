@@ -7,7 +7,6 @@
 #include "tests/support/CapturedLog.h"
 #include "tests/support/DaemonHarness.h"
 #include "tests/support/TempDirectory.h"
-#include "tools/veskreport/PowerLogCommand.h"
 #include "tools/veskreport/PowerLogReader.h"
 
 namespace vesk::test {

@@ -232,8 +232,11 @@ void PostOutbox::take(Inbox inbox) {
     if (host != _hosts.end()) host->second.backoff.hostAnswered(now);
   }
   if (_changes.size() == 0) return;
-  if (!_writeBy) _writeBy = now + _options.writeWithin;
-  if (_changes.size() >= kMostChangesAtOnce) _writeBy = now;
+  // What was removed waits until the file can be written again; what is new does not.
+  const bool waitsForFile = _writeBy && *_writeBy > now + _options.writeWithin;
+  if (waitsForFile && _changes.added.empty()) return;
+  const Instant due = _changes.size() >= kMostChangesAtOnce ? now : now + _options.writeWithin;
+  if (!_writeBy || due < *_writeBy) _writeBy = due;
 }
 
 void PostOutbox::take(const Answer& answer) {

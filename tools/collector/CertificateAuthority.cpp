@@ -1,7 +1,6 @@
 #include "tools/collector/CertificateAuthority.h"
 
 #include <arpa/inet.h>
-#include <openssl/rand.h>
 
 #include <stdexcept>
 
@@ -20,11 +19,9 @@ constexpr long kAuthorityDays = 3650;
 Key makeKey() { return checked(Key(EVP_EC_gen("P-256")), "make an EC key"); }
 
 void setSerial(X509* certificate) {
-  unsigned char bytes[16];
-  require(RAND_bytes(bytes, sizeof bytes) == 1, "draw a serial number");
-  bytes[0] &= 0x7f;  // serial numbers are positive
-  Number number(BN_bin2bn(bytes, sizeof bytes, nullptr));
-  require(BN_to_ASN1_INTEGER(number.get(), X509_get_serialNumber(certificate)) != nullptr,
+  Number number(BN_new());
+  require(number && BN_rand(number.get(), 127, BN_RAND_TOP_ANY, BN_RAND_BOTTOM_ANY) == 1 &&
+              BN_to_ASN1_INTEGER(number.get(), X509_get_serialNumber(certificate)) != nullptr,
           "set a serial number");
 }
 

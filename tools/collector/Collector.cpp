@@ -2,13 +2,6 @@
 
 #include <stdexcept>
 
-#include "tools/collector/CertificateAuthority.h"
-#include "tools/collector/ControlEndpoint.h"
-#include "tools/collector/EventsEndpoint.h"
-#include "tools/collector/LogDataEndpoint.h"
-#include "tools/collector/StorebagEndpoint.h"
-#include "tools/collector/UploadsEndpoint.h"
-
 namespace vesk {
 
 namespace {
@@ -38,90 +31,61 @@ CollectorOptions completed(CollectorOptions options) {
 
 }  // namespace
 
-struct Collector::Parts {
-  Parts(CollectorOptions given, Console& theConsole)
-      : options(completed(std::move(given))),
-        console(theConsole),
-        authority(CertificateAuthority::openOrCreate(options.directory)),
-        key(SigningKey::openOrCreate(options.directory)),
-        folder(options.storebags, options.checks),
-        events({console, stats, faults}, options.events),
-        uploads({console, stats, faults}, options.uploads, options.uploadAnswer),
-        storebags({console, stats, faults}, folder, key, options.maximumAge),
-        logData({console, stats, faults}, options.directory / "logdata"),
-        control(console, stats, faults),
-        securePaths(Refusals(console, stats)),
-        plainPaths(Refusals(console, stats)) {
-    for (const auto& fault : options.faults)
-      if (auto problem = faults.add(fault)) throw std::runtime_error(*problem);
-    // Further HTTP endpoints are created above and get their paths here.
-    for (EndpointTable* paths : {&securePaths, &plainPaths}) {
-      paths->add(kEventsPath, events);
-      paths->add(kLogDataPath, logData);
-      paths->add(kUploadsPath, uploads);
-      paths->add(kGeneralStorebagsPath, storebags);
-      paths->add(kPartnersStorebagsPath, storebags);
-    }
-    plainPaths.add(kControlPath, control);
-    secure = serve(securePaths, options.httpsPort, authority.issueServerIdentity(options.names));
-    plain = serve(plainPaths, options.httpPort, std::nullopt);
-    // Dashboards only support IPv4.
-    if (IPv4Endpoint::parse(options.address, 0)) {
-      datagrams = std::make_unique<DashboardReceiver>(DashboardReceiver::Parts{console, stats},
-                                                      options.address, options.udpPort, options.datagramLoss,
-                                                      options.directory / "datagrams.jsonl");
-    }
-  }
-
-  std::unique_ptr<HTTPServer> serve(const EndpointTable& paths, std::uint16_t port,
-                                    std::optional<TLSIdentity> identity) {
-    HTTPServer::Options server;
-    server.address = options.address;
-    server.port = port;
-    server.tls = std::move(identity);
-    server.maximumBody = UploadsEndpoint::kMaximumBody;
-    server.onRefused = [this](const std::string& line) {
-      ++stats.notHTTP;
-      console.problem("refused " + line);
-    };
-    return std::make_unique<HTTPServer>(
-        server, [&paths](const HTTPReceived& received) { return paths.answer(received); });
-  }
-
-  const CollectorOptions options;
-  Console& console;
-  CollectorStats stats;
-  FaultPlan faults;
-  const CertificateAuthority authority;
-  const SigningKey key;
-  StorebagFolder folder;
-  EventsEndpoint events;
-  UploadsEndpoint uploads;
-  StorebagEndpoint storebags;
-  LogDataEndpoint logData;
-  ControlEndpoint control;
-  EndpointTable securePaths;
-  EndpointTable plainPaths;
-
-  // Last, since their threads use all of the above.
-  std::unique_ptr<HTTPServer> secure;
-  std::unique_ptr<HTTPServer> plain;
-  std::unique_ptr<DashboardReceiver> datagrams;
-};
-
 Collector::Collector(CollectorOptions options, Console& console)
-    : _parts(std::make_unique<Parts>(std::move(options), console)) {}
+    : _options(completed(std::move(options))),
+      _services{console, _stats, _faults},
+      _authority(CertificateAuthority::openOrCreate(_options.directory)),
+      _key(SigningKey::openOrCreate(_options.directory)),
+      _events(_services, _options.events),
+      _uploads(_services, _options.uploads, _options.uploadAnswer),
+      _storebags(_services, _options.storebags, _options.checks, _key, _options.maximumAge),
+      _logData(_services, _options.directory / "logdata"),
+      _control(_services),
+      _securePaths(_services),
+      _plainPaths(_services) {
+  for (const auto& fault : _options.faults)
+    if (auto problem = _faults.add(fault)) throw std::runtime_error(*problem);
+  // Further HTTP endpoints are created above and get their paths here.
+  for (EndpointTable* paths : {&_securePaths, &_plainPaths}) {
+    paths->add(kEventsPath, _events);
+    paths->add(kLogDataPath, _logData);
+    paths->add(kUploadsPath, _uploads);
+    paths->add(kGeneralStorebagsPath, _storebags);
+    paths->add(kPartnersStorebagsPath, _storebags);
+  }
+  _plainPaths.add(kControlPath, _control);
+  _secure = serve(_securePaths, _options.httpsPort, _authority.issueServerIdentity(_options.names));
+  _plain = serve(_plainPaths, _options.httpPort, std::nullopt);
+  // Dashboards only support IPv4.
+  if (IPv4Endpoint::parse(_options.address, 0))
+    _datagrams =
+        std::make_unique<DashboardReceiver>(_services, _options.address, _options.udpPort,
+                                            _options.datagramLoss, _options.directory / "datagrams.jsonl");
+}
 
-Collector::~Collector() = default;
+std::unique_ptr<HTTPServer> Collector::serve(EndpointTable& paths, std::uint16_t port,
+                                             std::optional<TLSIdentity> identity) {
+  HTTPServer::Options server;
+  server.address = _options.address;
+  server.port = port;
+  server.tls = std::move(identity);
+  server.maximumBody = UploadsEndpoint::kMaximumBody;
+  server.onRefused = [this](const std::string& line) {
+    ++_stats.notHTTP;
+    _services.console.problem("refused " + line);
+  };
+  return std::make_unique<HTTPServer>(
+      server, [&paths](const HTTPReceived& received) { return paths.answer(received); });
+}
 
 Dictionary Collector::facts() const {
-  const auto& directory = _parts->options.directory;
-  std::string https = _parts->secure->baseURL();
-  std::string http = _parts->plain->baseURL();
+  const auto& directory = _options.directory;
+  std::string https = _secure->baseURL();
+  std::string http = _plain->baseURL();
   return Dictionary{
-      {"httpsPort", static_cast<int>(_parts->secure->port())},
-      {"httpPort", static_cast<int>(_parts->plain->port())},
-      {"udpPort", static_cast<int>(_parts->datagrams ? _parts->datagrams->port() : 0)},
+      {"httpsPort", static_cast<int>(_secure->port())},
+      {"httpPort", static_cast<int>(_plain->port())},
+      {"udpPort", static_cast<int>(_datagrams ? _datagrams->port() : 0)},
       {"eventsURL", https + kEventsPath},
       {"logDataURL", https + kLogDataPath},
       {"uploadsURL", https + kUploadsPath},
@@ -130,29 +94,34 @@ Dictionary Collector::facts() const {
       {"authorityFile", CertificateAuthority::certificateFile(directory).string()},
       {"publicKeyFile", SigningKey::publicKeyFile(directory).string()},
       {"signingKeyFile", SigningKey::privateKeyFile(directory).string()},
-      {"storebags", _parts->options.storebags.string()},
-      {"events", _parts->options.events.string()},
+      {"storebags", _options.storebags.string()},
+      {"events", _options.events.string()},
       {"datagrams", (directory / "datagrams.jsonl").string()},
-      {"uploads", _parts->options.uploads.string()},
+      {"uploads", _options.uploads.string()},
   };
 }
 
 std::string Collector::introduction() const {
   Dictionary all = facts();
   auto fact = [&](const char* key) { return all.text(key)->string(); };
-  std::string http = _parts->plain->baseURL();
+  std::string http = _plain->baseURL();
   return "veskcollector takes events at " + fact("eventsURL") + " and " + http + kEventsPath +
          "\n  and saves them to " + fact("events") + "\nIt takes files at " + fact("uploadsURL") +
          " and saves them in " + fact("uploads") + "\nIt serves storebags at " + fact("storebagURL") +
          " and " + http + kStorebagBase + "\n  from NAME.toml and NAME.json in " + fact("storebags") +
-         (_parts->datagrams ? "\nIt takes dashboards' datagrams on UDP port " +
-                                  std::to_string(_parts->datagrams->port()) + "\n  and saves them to " +
-                                  fact("datagrams") + "; their log data goes to " + fact("logDataURL")
-                            : std::string()) +
+         (_datagrams ? "\nIt takes dashboards' datagrams on UDP port " + std::to_string(_datagrams->port()) +
+                           "\n  and saves them to " + fact("datagrams") + "; their log data goes to " +
+                           fact("logDataURL")
+                     : std::string()) +
          "\nClients trust it with    SSL_CERT_FILE=" + fact("authorityFile") +
          "\nStorebags are verified with publicKey.der from " + fact("publicKeyFile") +
          "\nThe daemon finds it with the preference    veskreporting_storebag_url = \"" +
          fact("storebagURL") + "\"\nFaults are set and counters read at " + fact("controlURL");
+}
+
+std::string Collector::summary() const {
+  return "events taken: " + std::to_string(_stats.events) + ", posts: " + std::to_string(_stats.posts) +
+         ", repeated events left out: " + std::to_string(_stats.eventsRepeated);
 }
 
 }  // namespace vesk

@@ -10,9 +10,11 @@
 #include <vector>
 
 #include <VeskReporting/values/Value.h>
-#include "tools/collector/Console.h"
+#include "tools/collector/CertificateAuthority.h"
 #include "tools/collector/DashboardReceiver.h"
-#include "tools/storebag/StorebagSource.h"
+#include "tools/collector/EventsEndpoint.h"
+#include "tools/collector/FileEndpoints.h"
+#include "tools/collector/StorebagEndpoint.h"
 
 namespace vesk {
 
@@ -40,7 +42,6 @@ class Collector {
   /// Creates missing directories, the certificate authority and the signing key. Throws std::runtime_error
   /// with a readable message.
   Collector(CollectorOptions options, Console& console);
-  ~Collector();
   Collector(const Collector&) = delete;
   Collector& operator=(const Collector&) = delete;
 
@@ -48,10 +49,31 @@ class Collector {
   Dictionary facts() const;
   /// The same as readable lines, with instructions for setting up the daemon.
   std::string introduction() const;
+  /// A line on what it has taken so far.
+  std::string summary() const;
 
  private:
-  struct Parts;
-  std::unique_ptr<Parts> _parts;
+  std::unique_ptr<HTTPServer> serve(EndpointTable& paths, std::uint16_t port,
+                                    std::optional<TLSIdentity> identity);
+
+  const CollectorOptions _options;
+  CollectorStats _stats;
+  FaultPlan _faults;
+  const CollectorServices _services;
+  const CertificateAuthority _authority;
+  const SigningKey _key;
+  EventsEndpoint _events;
+  UploadsEndpoint _uploads;
+  StorebagEndpoint _storebags;
+  LogDataEndpoint _logData;
+  ControlEndpoint _control;
+  EndpointTable _securePaths;
+  EndpointTable _plainPaths;
+
+  // Last, since their threads use all of the above.
+  std::unique_ptr<HTTPServer> _secure;
+  std::unique_ptr<HTTPServer> _plain;
+  std::unique_ptr<DashboardReceiver> _datagrams;
 };
 
 }  // namespace vesk

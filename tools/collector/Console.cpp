@@ -23,12 +23,9 @@ void Console::event(std::string_view lines) {
 }
 
 void Console::note(std::string_view line) {
+  if (_style == Style::JSON) return problem(line);
   MutexLock lock(_mutex);
-  if (_style == Style::JSON) {
-    static_cast<void>(writeLine(STDERR_FILENO, printable(line)));
-  } else {
-    writeOutput(printable(line));
-  }
+  writeOutput(printable(line));
 }
 
 void Console::problem(std::string_view line) {

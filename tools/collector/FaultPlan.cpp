@@ -6,7 +6,6 @@ namespace vesk {
 
 namespace {
 
-using Kind = CollectorFault::Kind;
 using Fault = HTTPAnswer::Fault;
 
 constexpr std::size_t kMaximumPlanned = 1000;
@@ -16,15 +15,15 @@ struct NamedFault {
   CollectorFault fault;
 };
 constexpr std::array kFaults{
-    NamedFault{"stall", {Kind::Transport, 0, Fault::Stall}},
-    NamedFault{"reset", {Kind::Transport, 0, Fault::ResetBeforeAnswer}},
-    NamedFault{"close", {Kind::Transport, 0, Fault::CloseWithoutAnswer}},
-    NamedFault{"garbage", {Kind::Transport, 0, Fault::Garbage}},
-    NamedFault{"cut", {Kind::Transport, 0, Fault::ResetMidAnswer}},
-    NamedFault{"slow", {Kind::Transport, 0, Fault::SlowBody}},
-    NamedFault{"huge", {Kind::Transport, 0, Fault::HugeBody}},
-    NamedFault{"empty-body", {Kind::EmptyBody, 0, Fault::None}},
-    NamedFault{"bad-signature", {Kind::BadSignature, 0, Fault::None}},
+    NamedFault{"stall", {.transport = Fault::Stall}},
+    NamedFault{"reset", {.transport = Fault::ResetBeforeAnswer}},
+    NamedFault{"close", {.transport = Fault::CloseWithoutAnswer}},
+    NamedFault{"garbage", {.transport = Fault::Garbage}},
+    NamedFault{"cut", {.transport = Fault::ResetMidAnswer, .isOnlyInTheAnswer = true}},
+    NamedFault{"slow", {.transport = Fault::SlowBody, .isOnlyInTheAnswer = true}},
+    NamedFault{"huge", {.transport = Fault::HugeBody, .isOnlyInTheAnswer = true}},
+    NamedFault{"empty-body", {.emptyBody = true, .isOnlyInTheAnswer = true}},
+    NamedFault{"bad-signature", {.badSignature = true, .isOnlyInTheAnswer = true}},
 };
 
 std::optional<unsigned> numberIn(std::string_view text) {
@@ -40,42 +39,23 @@ std::optional<CollectorFault> faultNamed(std::string_view name) {
   if (name.starts_with("answer=")) name.remove_prefix(std::string_view("answer=").size());
   auto status = numberIn(name);
   if (!status || *status < 200 || *status > 599) return std::nullopt;
-  return CollectorFault{Kind::Answer, *status, Fault::None};
-}
-
-std::optional<FaultTarget> targetNamed(std::string_view name) {
-  for (std::size_t i = 0; i < kFaultTargetNames.size(); ++i)
-    if (kFaultTargetNames[i] == name) return static_cast<FaultTarget>(i);
-  return std::nullopt;
+  return CollectorFault{.status = *status, .isOnlyInTheAnswer = *status < 300};
 }
 
 }  // namespace
 
-bool CollectorFault::isOnlyInTheAnswer() const {
-  switch (kind) {
-    case Kind::Answer:
-      return status < 300;
-    case Kind::EmptyBody:
-    case Kind::BadSignature:
-      return true;
-    case Kind::Transport:
-      return transport == Fault::ResetMidAnswer || transport == Fault::SlowBody ||
-             transport == Fault::HugeBody;
-  }
-  return false;
-}
-
 void CollectorFault::applyTo(HTTPAnswer& answer) const {
-  if (kind == Kind::Answer) answer = HTTPAnswer::text(status, "answered on demand");
-  if (kind == Kind::EmptyBody) answer.body.clear();
-  if (kind == Kind::Transport) answer.fault = transport;
+  if (status != 0) answer = HTTPAnswer::text(status, "answered on demand");
+  if (emptyBody) answer.body.clear();
+  if (transport != Fault::None) answer.fault = transport;
 }
 
 std::optional<std::string> FaultPlan::add(std::string_view text) {
+  MutexLock lock(_mutex);
   auto equals = text.find('=');
-  auto target = targetNamed(text.substr(0, equals));
-  if (!target || equals == std::string_view::npos)
-    return "a fault is written as " + forms() + ", not '" + std::string(text) + "'";
+  Target* target = find(text.substr(0, equals));
+  if (target == nullptr || equals == std::string_view::npos)
+    return "a fault is written as " + std::string(kForms) + ", not '" + std::string(text) + "'";
   std::string_view name = text.substr(equals + 1);
   std::optional<unsigned> times;
   if (auto star = name.rfind('*'); star != std::string_view::npos) {
@@ -87,11 +67,10 @@ std::optional<std::string> FaultPlan::add(std::string_view text) {
   auto fault = faultNamed(name);
   if (!fault && name != "none")
     return "unknown fault '" + std::string(name) + "': it must be " + faultNames();
-  if (fault && fault->kind == Kind::BadSignature && *target != FaultTarget::Storebag)
+  if (fault && fault->badSignature && target->first != "storebag")
     return "only a storebag can have a bad signature";
 
-  MutexLock lock(_mutex);
-  auto& planned = _planned[static_cast<std::size_t>(*target)];
+  auto& planned = target->second;
   if (!fault) {
     planned.clear();
     return std::nullopt;
@@ -104,13 +83,20 @@ std::optional<std::string> FaultPlan::add(std::string_view text) {
 
 void FaultPlan::clear() {
   MutexLock lock(_mutex);
-  for (auto& planned : _planned) planned.clear();
+  for (auto& [name, planned] : _targets) planned.clear();
 }
 
-std::optional<CollectorFault> FaultPlan::take(FaultTarget target) {
+FaultPlan::Target* FaultPlan::find(std::string_view name) {
+  for (auto& target : _targets)
+    if (target.first == name) return &target;
+  return nullptr;
+}
+
+std::optional<CollectorFault> FaultPlan::take(std::string_view target) {
   MutexLock lock(_mutex);
-  auto& planned = _planned[static_cast<std::size_t>(target)];
-  if (planned.empty()) return std::nullopt;
+  auto* found = find(target);
+  if (found == nullptr || found->second.empty()) return std::nullopt;
+  auto& planned = found->second;
   CollectorFault fault = planned.front().fault;
   if (planned.front().times && --*planned.front().times == 0) planned.pop_front();
   return fault;
@@ -119,23 +105,11 @@ std::optional<CollectorFault> FaultPlan::take(FaultTarget target) {
 std::vector<std::string> FaultPlan::describe() const {
   std::vector<std::string> lines;
   MutexLock lock(_mutex);
-  for (std::size_t target = 0; target < kFaultTargetNames.size(); ++target) {
-    for (const auto& planned : _planned[target]) {
-      std::string line = std::string(kFaultTargetNames[target]) + "=" + planned.name;
-      if (planned.times) line += "*" + std::to_string(*planned.times);
-      lines.push_back(std::move(line));
-    }
-  }
+  for (const auto& [target, faults] : _targets)
+    for (const auto& planned : faults)
+      lines.push_back(std::string(target) + "=" + planned.name +
+                      (planned.times ? "*" + std::to_string(*planned.times) : ""));
   return lines;
-}
-
-std::string FaultPlan::forms() {
-  std::string forms;
-  for (std::size_t i = 0; i < kFaultTargetNames.size(); ++i) {
-    if (i > 0) forms += i + 1 < kFaultTargetNames.size() ? ", " : " or ";
-    forms.append(kFaultTargetNames[i]).append("=FAULT");
-  }
-  return forms;
 }
 
 std::string FaultPlan::faultNames() {

@@ -2,80 +2,40 @@
 
 #include <zlib.h>
 
-#include <algorithm>
 #include <array>
+#include <boost/beast/http/status.hpp>
+#include <memory>
 
 #include "platform/text/ASCII.h"
 
 namespace vesk {
 
+namespace beast = boost::beast;
+
 namespace {
 
-std::string_view reasonOf(unsigned status) {
-  struct Reason {
-    unsigned status;
-    std::string_view text;
-  };
-  static constexpr std::array kReasons{
-      Reason{200, "OK"},
-      Reason{201, "Created"},
-      Reason{202, "Accepted"},
-      Reason{204, "No Content"},
-      Reason{304, "Not Modified"},
-      Reason{400, "Bad Request"},
-      Reason{401, "Unauthorized"},
-      Reason{403, "Forbidden"},
-      Reason{404, "Not Found"},
-      Reason{405, "Method Not Allowed"},
-      Reason{413, "Content Too Large"},
-      Reason{431, "Request Header Fields Too Large"},
-      Reason{500, "Internal Server Error"},
-      Reason{502, "Bad Gateway"},
-      Reason{503, "Service Unavailable"},
-      Reason{504, "Gateway Timeout"},
-  };
-  const auto* found = std::find_if(kReasons.begin(), kReasons.end(),
-                                   [&](const Reason& reason) { return reason.status == status; });
-  return found == kReasons.end() ? "Status" : found->text;
+/// Unpacks a single gzip member, which must span all of `compressed`.
+HTTPReceived::Decoded gunzipped(std::string_view compressed, std::size_t limit) {
+  constexpr int kGzipOnly = 16 + MAX_WBITS;
+  z_stream stream{};
+  if (::inflateInit2(&stream, kGzipOnly) != Z_OK) return {std::nullopt, "the gzip decoder can't be started"};
+  const std::unique_ptr<z_stream, decltype(&::inflateEnd)> ending(&stream, &::inflateEnd);
+  stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(compressed.data()));  // zlib only reads it
+  stream.avail_in = static_cast<uInt>(compressed.size());
+  std::string out;
+  std::array<char, 65536> piece;
+  for (int result = Z_OK; result != Z_STREAM_END;) {
+    stream.next_out = reinterpret_cast<Bytef*>(piece.data());
+    stream.avail_out = piece.size();
+    result = ::inflate(&stream, Z_NO_FLUSH);
+    out.append(piece.data(), piece.size() - stream.avail_out);
+    if (out.size() > limit)
+      return {std::nullopt, "the body unpacks to more than " + std::to_string(limit) + " bytes"};
+    if (result != Z_OK && result != Z_STREAM_END) return {std::nullopt, "the body is no whole gzip stream"};
+  }
+  if (stream.avail_in != 0) return {std::nullopt, "bytes follow the gzip stream of the body"};
+  return {std::move(out), {}};
 }
-
-/// Inflates a single gzip member, which must span all of `compressed`.
-class Inflater {
- public:
-  Inflater() {
-    constexpr int kGzipOnly = 16 + MAX_WBITS;
-    _ready = ::inflateInit2(&_stream, kGzipOnly) == Z_OK;
-  }
-  ~Inflater() {
-    if (_ready) ::inflateEnd(&_stream);
-  }
-  Inflater(const Inflater&) = delete;
-  Inflater& operator=(const Inflater&) = delete;
-
-  HTTPReceived::Decoded run(std::string_view compressed, std::size_t limit) {
-    if (!_ready) return {std::nullopt, "the gzip decoder can't be started"};
-    _stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(compressed.data()));  // zlib only reads it
-    _stream.avail_in = static_cast<uInt>(compressed.size());
-    std::string out;
-    std::array<char, 65536> piece;
-    while (true) {
-      _stream.next_out = reinterpret_cast<Bytef*>(piece.data());
-      _stream.avail_out = piece.size();
-      int result = ::inflate(&_stream, Z_NO_FLUSH);
-      out.append(piece.data(), piece.size() - _stream.avail_out);
-      if (out.size() > limit)
-        return {std::nullopt, "the body unpacks to more than " + std::to_string(limit) + " bytes"};
-      if (result == Z_STREAM_END) break;
-      if (result != Z_OK) return {std::nullopt, "the body is no whole gzip stream"};
-    }
-    if (_stream.avail_in != 0) return {std::nullopt, "bytes follow the gzip stream of the body"};
-    return {std::move(out), {}};
-  }
-
- private:
-  z_stream _stream{};
-  bool _ready = false;
-};
 
 }  // namespace
 
@@ -110,14 +70,12 @@ HTTPReceived::Decoded HTTPReceived::decodedBody(std::size_t limit) const {
   }
   if (!equalsIgnoringASCIICase(*encoding, "gzip"))
     return {std::nullopt, "Content-Encoding is neither gzip nor absent: " + std::string(*encoding)};
-  return Inflater().run(body, limit);
+  return gunzipped(body, limit);
 }
 
 HTTPAnswer HTTPAnswer::text(unsigned status, std::string_view line) {
-  HTTPAnswer answer;
+  HTTPAnswer answer = of("text/plain; charset=utf-8", std::string(line) + "\n");
   answer.status = status;
-  answer.headers = {{"Content-Type", "text/plain; charset=utf-8"}};
-  answer.body = std::string(line) + "\n";
   return answer;
 }
 
@@ -125,7 +83,7 @@ bool mayHaveBody(unsigned status) { return status >= 200 && status != 204 && sta
 
 std::string answerHead(const HTTPAnswer& answer, std::uint64_t length, bool keepAlive) {
   std::string head = "HTTP/1.1 " + std::to_string(answer.status) + " ";
-  head.append(reasonOf(answer.status)).append("\r\n");
+  head.append(beast::http::obsolete_reason(static_cast<beast::http::status>(answer.status))).append("\r\n");
   for (const auto& [name, value] : answer.headers)
     head.append(name).append(": ").append(value).append("\r\n");
   if (mayHaveBody(answer.status))

@@ -20,11 +20,10 @@ std::optional<std::string_view> findHeader(const HTTPHeaderList& headers, std::s
 /// A complete request.
 struct HTTPReceived {
   std::string method;
-  std::string target;          ///< as sent: path and query
-  HTTPHeaderList headers;      ///< in the original order and spelling
-  std::string body;            ///< as sent, possibly compressed
-  std::string peer;            ///< "127.0.0.1:40312"
-  std::size_t connection = 0;  ///< the connection's number, starting at 1
+  std::string target;      ///< as sent: path and query
+  HTTPHeaderList headers;  ///< in the original order and spelling
+  std::string body;        ///< as sent, possibly compressed
+  std::string peer;        ///< "127.0.0.1:40312"
 
   std::optional<std::string_view> header(std::string_view name) const { return findHeader(headers, name); }
   /// The target without its query.
@@ -45,7 +44,6 @@ struct HTTPAnswer {
   enum class Fault : unsigned char {
     None,
     Stall,               ///< never answers; the connection stays open until the peer or `stop` ends it
-    Hold,                ///< answers when `HTTPServer::releaseHeld` is called
     ResetBeforeAnswer,   ///< TCP reset instead of an answer
     ResetMidAnswer,      ///< TCP reset after the head and half of the body
     CloseWithoutAnswer,  ///< ends the stream instead of answering
@@ -53,7 +51,7 @@ struct HTTPAnswer {
     CloseMidAnswer,      ///< ends the stream after the head and half of the body
     SlowBody,            ///< the head at once, then the body in ten pieces with `pause` before each
     Garbage,             ///< bytes that are not HTTP, then the end of the stream
-    HugeBody,            ///< `hugeBody` bytes instead of the body
+    HugeBody,            ///< a gigabyte instead of the body
   };
 
   unsigned status = 200;
@@ -63,10 +61,13 @@ struct HTTPAnswer {
   std::string body;
   Fault fault = Fault::None;
   std::chrono::milliseconds pause{50};
-  std::uint64_t hugeBody = std::uint64_t{1} << 30;
 
   /// A plain-text answer with one line.
   static HTTPAnswer text(unsigned status, std::string_view line);
+  /// A good answer with that body.
+  static HTTPAnswer of(std::string type, std::string body) {
+    return {.headers = {{"Content-Type", std::move(type)}}, .body = std::move(body)};
+  }
 };
 
 /// The head of an answer (status line, headers, empty line) for a body of `length` bytes.

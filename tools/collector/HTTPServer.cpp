@@ -35,10 +35,10 @@ std::unique_ptr<asio::ssl::context> makeContext(const TLSIdentity& identity) {
 
 class HTTPServer::Core : public HTTPConnection::Owner {
  public:
-  Core(Options options, Handler handler)
-      : _options(std::move(options)),
+  Core(Options given, Handler handler)
+      : options(std::move(given)),
         _handler(std::move(handler)),
-        _tls(_options.tls ? makeContext(*_options.tls) : nullptr),
+        _tls(options.tls ? makeContext(*options.tls) : nullptr),
         _acceptor(_context),
         _again(_context) {
     listen();
@@ -54,16 +54,10 @@ class HTTPServer::Core : public HTTPConnection::Owner {
     _thread.join();
   }
 
-  void releaseHeld() {
-    asio::post(_context, [this] {
-      for (const auto& connection : std::unordered_set(_connections)) connection->release();
-    });
-  }
-
-  const Options& options() const { return _options; }
-  std::uint16_t port() const { return _port; }
-  std::size_t accepted() const { return _accepted; }
-  std::size_t open() const { return _open; }
+  const Options options;
+  std::uint16_t port = 0;  // constant after construction
+  std::atomic<std::size_t> accepted = 0;
+  std::atomic<std::size_t> open = 0;
 
   HTTPAnswer answerTo(const HTTPReceived& received) noexcept override {
     try {
@@ -73,17 +67,13 @@ class HTTPServer::Core : public HTTPConnection::Owner {
     }
   }
 
-  void connectionRefused(const std::string& line) noexcept override {
-    try {
-      if (_options.onRefused) _options.onRefused(line);
-    } catch (const std::exception&) {
-      // There is nowhere to report this.
-    }
+  void connectionRefused(const std::string& line) override {
+    if (options.onRefused) options.onRefused(line);
   }
 
   void connectionEnded(const std::shared_ptr<HTTPConnection>& connection) noexcept override {
     _connections.erase(connection);
-    _open = _connections.size();
+    open = _connections.size();
   }
 
  private:
@@ -100,19 +90,19 @@ class HTTPServer::Core : public HTTPConnection::Owner {
 
   void listen() {
     try {
-      tcp::endpoint endpoint(asio::ip::make_address(_options.address), _options.port);
+      tcp::endpoint endpoint(asio::ip::make_address(options.address), options.port);
       _acceptor.open(endpoint.protocol());
       _acceptor.set_option(tcp::acceptor::reuse_address(true));
       _acceptor.bind(endpoint);
       _acceptor.listen();
-      _port = _acceptor.local_endpoint().port();
+      port = _acceptor.local_endpoint().port();
     } catch (const boost::system::system_error& error) {
       // what() would contain the name of one of the library's source files.
-      const std::string port = "port " + std::to_string(_options.port);
-      throw std::runtime_error("can't listen on " + _options.address +
+      const std::string wanted = "port " + std::to_string(options.port);
+      throw std::runtime_error("can't listen on " + options.address +
                                (error.code() == asio::error::address_in_use
-                                    ? ": " + port + " is in use"
-                                    : " " + port + ": " + error.code().message()));
+                                    ? ": " + wanted + " is in use"
+                                    : " " + wanted + ": " + error.code().message()));
     }
   }
 
@@ -135,16 +125,16 @@ class HTTPServer::Core : public HTTPConnection::Owner {
   }
 
   void begin(tcp::socket socket) {
-    ++_accepted;
-    if (_connections.size() >= _options.maximumConnections)
+    ++accepted;
+    if (_connections.size() >= options.maximumConnections)
       return connectionRefused("a connection over the limit of " +
-                               std::to_string(_options.maximumConnections));
+                               std::to_string(options.maximumConnections));
     ErrorCode ignored;
     socket.set_option(tcp::no_delay(true), ignored);
-    auto connection =
-        HTTPConnection::make(std::move(socket), {_accepted, _options.maximumBody, _tls.get()}, *this);
+    auto connection = std::make_shared<HTTPConnection>(
+        std::move(socket), HTTPConnection::Setting{options.maximumBody, _tls.get()}, *this);
     _connections.insert(connection);
-    _open = _connections.size();
+    open = _connections.size();
     connection->start();
   }
 
@@ -155,13 +145,8 @@ class HTTPServer::Core : public HTTPConnection::Owner {
     for (const auto& connection : std::unordered_set(_connections)) connection->close();
   }
 
-  const Options _options;
   const Handler _handler;
   const std::unique_ptr<asio::ssl::context> _tls;
-  std::uint16_t _port = 0;
-
-  std::atomic<std::size_t> _accepted = 0;
-  std::atomic<std::size_t> _open = 0;
 
   // Only used on `_thread` once it runs.
   asio::io_context _context{1};
@@ -177,19 +162,17 @@ HTTPServer::HTTPServer(Options options, Handler handler)
 
 HTTPServer::~HTTPServer() = default;
 
-std::uint16_t HTTPServer::port() const { return _core->port(); }
+std::uint16_t HTTPServer::port() const { return _core->port; }
 
 std::string HTTPServer::baseURL() const {
-  bool tls = _core->options().tls.has_value();
+  bool tls = _core->options.tls.has_value();
   return (tls ? "https://localhost:" : "http://127.0.0.1:") + std::to_string(port());
 }
 
-void HTTPServer::releaseHeld() { _core->releaseHeld(); }
-
 void HTTPServer::stop() { _core->stop(); }
 
-std::size_t HTTPServer::connectionsAccepted() const { return _core->accepted(); }
+std::size_t HTTPServer::connectionsAccepted() const { return _core->accepted; }
 
-std::size_t HTTPServer::connectionsOpen() const { return _core->open(); }
+std::size_t HTTPServer::connectionsOpen() const { return _core->open; }
 
 }  // namespace vesk

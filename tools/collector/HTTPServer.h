@@ -32,7 +32,7 @@ class HTTPServer {
     std::function<void(const std::string& line)> onRefused{};
   };
 
-  /// Called on the server's thread, one request at a time. Must not block (use `Fault::Hold` instead).
+  /// Called on the server's thread, one request at a time. Must not block.
   /// Exceptions become a 500.
   using Handler = std::function<HTTPAnswer(const HTTPReceived&)>;
 
@@ -48,8 +48,6 @@ class HTTPServer {
   /// Without a trailing slash: "https://localhost:4711", or "http://127.0.0.1:4711" for plain HTTP.
   std::string baseURL() const;
 
-  /// Sends all answers that are currently held. Thread-safe.
-  void releaseHeld();
   /// Closes all connections, including stalled ones, and ends the thread. The handler is not called after
   /// this returns. May be called twice, but not from the handler.
   void stop();

@@ -8,10 +8,10 @@
 #include <iostream>
 
 #include "platform/json/JSONWriter.h"
-#include "tools/collector/ArchiveText.h"
 #include "tools/collector/Collector.h"
 #include "tools/collector/FaultPlan.h"
 #include "tools/files/WholeFile.h"
+#include "tools/plist/KeyedArchiveReader.h"
 
 namespace vesk {
 
@@ -22,13 +22,8 @@ constexpr int kUsage = 2;
 
 struct Arguments {
   CollectorOptions collector;
-  std::string directory;
   std::string readyFile;
-  std::optional<unsigned> maximumAge;
   bool json = false;
-  bool lenient = false;
-  double loss = 0;
-  std::uint32_t lossSeed = 1;
   std::string archive;  // archive to show
 };
 
@@ -50,8 +45,7 @@ sigset_t blockEndingSignals() {
   return ending;
 }
 
-std::filesystem::path directoryFrom(const Arguments& arguments) {
-  if (!arguments.directory.empty()) return arguments.directory;
+std::filesystem::path defaultDirectory() {
   if (const char* data = std::getenv("XDG_DATA_HOME"); data != nullptr && *data == '/')
     return std::filesystem::path(data) / "veskcollector";
   if (const char* home = std::getenv("HOME"); home != nullptr && *home == '/')
@@ -62,7 +56,7 @@ std::filesystem::path directoryFrom(const Arguments& arguments) {
 void define(CLI::App& app, Arguments& arguments) {
   auto& collector = arguments.collector;
   app.set_version_flag("--version", std::string("veskcollector ") + VESK_VERSION);
-  app.add_option("--directory", arguments.directory,
+  app.add_option("--directory", collector.directory,
                  "Keep authority, keys and, by default, storebags and events here "
                  "(default: ~/.local/share/veskcollector)")
       ->type_name("DIR");
@@ -73,23 +67,29 @@ void define(CLI::App& app, Arguments& arguments) {
   app.add_option("--http-port", collector.httpPort, "0 takes any free port")->capture_default_str();
   app.add_option("--udp-port", collector.udpPort, "For dashboards' datagrams; 0 takes any free port")
       ->capture_default_str();
-  app.add_option("--ack-loss", arguments.loss,
+  app.add_option("--ack-loss", collector.datagramLoss.probability,
                  "Lose each datagram, and each acknowledgement, with this probability")
       ->check(CLI::Range(0.0, 1.0))
       ->type_name("P");
-  app.add_option("--seed", arguments.lossSeed, "Decides which of them are lost")->capture_default_str();
+  app.add_option("--seed", collector.datagramLoss.seed, "Decides which of them are lost")
+      ->capture_default_str();
   app.add_option("--storebags", collector.storebags, "Folder of NAME.toml and NAME.json")->type_name("DIR");
   app.add_option("--events", collector.events, "Append events to this file of JSON lines")->type_name("FILE");
   app.add_option("--uploads", collector.uploads, "Save uploaded files in this folder")->type_name("DIR");
   app.add_option("--upload-answer", collector.uploadAnswer, "Answer every uploaded file with this")
       ->capture_default_str();
-  app.add_option("--max-age", arguments.maximumAge, "Send storebags with this Cache-Control max-age")
+  const auto setMaximumAge = [&](unsigned seconds) { collector.maximumAge = std::chrono::seconds(seconds); };
+  app.add_option_function<unsigned>("--max-age", setMaximumAge,
+                                    "Send storebags with this Cache-Control max-age")
       ->type_name("SECONDS");
-  app.add_flag("--lenient", arguments.lenient, "Also serve storebags with values of the wrong type");
+  app.add_flag_callback(
+      "--lenient", [&] { collector.checks = StorebagChecks::Lenient; },
+      "Also serve storebags with values of the wrong type");
   app.add_flag("--json", arguments.json, "Write one JSON line per event, with its headers");
   app.add_option("--fault", collector.faults,
-                 "Inject faults: " + FaultPlan::forms() +
+                 "Inject faults: " + std::string(FaultPlan::kForms) +
                      ", with *N for N times only (repeatable); FAULT is " + FaultPlan::faultNames())
+      ->check([](const std::string& fault) { return FaultPlan().add(fault).value_or(""); })
       ->type_name("FAULT");
   app.add_option("--ready-file", arguments.readyFile, "Write ports and paths here as JSON once listening")
       ->type_name("FILE");
@@ -113,6 +113,7 @@ void run(Arguments& arguments) {
   if (!arguments.readyFile.empty()) writeWholeFile(arguments.readyFile, ready(collector), 0644);
   int signal = 0;
   ::sigwait(&ending, &signal);
+  console.note(collector.summary());
 }
 
 int main(int count, char** texts) {
@@ -122,9 +123,6 @@ int main(int count, char** texts) {
   define(app, arguments);
   try {
     app.parse(count, texts);
-    FaultPlan check;
-    for (const auto& fault : arguments.collector.faults)
-      if (auto problem = check.add(fault)) throw CLI::ValidationError("--fault", *problem);
   } catch (const CLI::ParseError& error) {
     return app.exit(error) == 0 ? 0 : kUsage;
   }
@@ -133,10 +131,7 @@ int main(int count, char** texts) {
       std::cout << archiveText(readWholeFile(arguments.archive, archiveLimits().bytes)) << std::flush;
       return std::cout ? 0 : kFailed;
     }
-    arguments.collector.directory = directoryFrom(arguments);
-    if (arguments.maximumAge) arguments.collector.maximumAge = std::chrono::seconds(*arguments.maximumAge);
-    arguments.collector.datagramLoss = DatagramLoss(arguments.loss, arguments.lossSeed);
-    if (arguments.lenient) arguments.collector.checks = StorebagChecks::Lenient;
+    if (arguments.collector.directory.empty()) arguments.collector.directory = defaultDirectory();
     run(arguments);
     return 0;
   } catch (const std::exception& error) {

@@ -1,76 +1,87 @@
 #include "tools/collector/StorebagEndpoint.h"
 
-#include <stdexcept>
+#include <algorithm>
 
-#include "tools/collector/HTTPDate.h"
-#include "tools/storebag/StorebagDocument.h"
+#include "tools/storebag/StorebagSigning.h"
 
 namespace vesk {
 
 namespace {
 
-std::string describeRequest(const HTTPReceived& received) {
-  return received.method + " " + received.target.substr(0, 200) + " from " + received.peer;
+// Names of days and months are English because the program never sets a locale.
+constexpr char kHTTPDate[] = "%a, %d %b %Y %H:%M:%S GMT";
+
+std::string httpDate(std::time_t time) {
+  std::tm calendar{};
+  ::gmtime_r(&time, &calendar);
+  char text[64];
+  return std::string(text, std::strftime(text, sizeof text, kHTTPDate, &calendar));
 }
 
 bool isUnchangedSince(const HTTPReceived& received, std::time_t lastModified) {
-  auto since = received.header("If-Modified-Since");
-  auto time = since ? timeFromHTTPDate(*since) : std::nullopt;
-  return time && lastModified <= *time;
+  const std::string since(received.header("If-Modified-Since").value_or(""));
+  std::tm calendar{};
+  const char* end = ::strptime(since.c_str(), kHTTPDate, &calendar);
+  return end != nullptr && *end == '\0' && lastModified <= ::timegm(&calendar);
+}
+
+bool isPlainName(std::string_view name) {
+  auto isPlain = [](char c) {
+    return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '-' || c == '_';
+  };
+  return !name.empty() && name.size() <= 100 && std::all_of(name.begin(), name.end(), isPlain);
+}
+
+bool isSameVersion(const struct stat& a, const struct stat& b) {
+  return a.st_size == b.st_size && a.st_ino == b.st_ino && a.st_mtim.tv_sec == b.st_mtim.tv_sec &&
+         a.st_mtim.tv_nsec == b.st_mtim.tv_nsec;
 }
 
 }  // namespace
 
-StorebagEndpoint::StorebagEndpoint(const CollectorServices& services, StorebagFolder& folder,
-                                   const SigningKey& key, std::optional<std::chrono::seconds> maximumAge)
-    : FaultyEndpoint(services, FaultTarget::Storebag), _folder(folder), _key(key), _maximumAge(maximumAge) {}
-
 HTTPAnswer StorebagEndpoint::serve(const HTTPReceived& received, const CollectorFault* fault) {
-  const bool signWell = fault == nullptr || fault->kind != CollectorFault::Kind::BadSignature;
-  if (received.method != "GET") return _refuse.wrongMethod(received, "GET");
+  requireMethod(received, "GET");
+  const bool signWell = fault == nullptr || !fault->badSignature;
   std::string_view path = received.path();
   std::string name(path.substr(path.rfind('/') + 1));
-  auto found = _folder.find(name);
-  if (!found)
-    return _refuse(received, 404,
-                   "no " + name + ".toml or " + name + ".json in " + _folder.directory().string());
+  const auto found = find(name);
+  if (!found) throw Refusal{404, "no " + name + ".toml or " + name + ".json in " + _directory.string()};
+  HTTPAnswer answer;
+  answer.headers = {{"Last-Modified", httpDate(found->lastModified)}};
+  if (_maximumAge)
+    answer.headers.emplace_back("Cache-Control", "max-age=" + std::to_string(_maximumAge->count()));
   if (signWell && isUnchangedSince(received, found->lastModified)) {
     ++_stats.storebagsUnchanged;
     _console.note(describeRequest(received) + ": unchanged");
-    HTTPAnswer answer;
     answer.status = 304;
-    answer.headers = headersFor(found->lastModified);
     return answer;
   }
-  return send(received, *found, signWell);
-}
-
-HTTPAnswer StorebagEndpoint::send(const HTTPReceived& received, const StorebagFolder::Found& found,
-                                  bool signWell) {
-  HTTPAnswer answer;
-  answer.headers = headersFor(found.lastModified);
   answer.headers.emplace_back("Content-Type", "application/xml");
-  Dictionary payload;
-  try {
-    StorebagSource source = _folder.read(found);
-    if (found.isNew)
-      for (const auto& warning : source.warnings) _console.problem("warning: " + warning);
-    payload = source.payload;
-    answer.body = signWell ? signStorebag(payload, _key) : signStorebagBadly(payload, _key);
-  } catch (const std::runtime_error& error) {
-    return _refuse(received, 500, error.what());
-  }
+  const StorebagSource source = readStorebagSource(found->file, _checks);
+  if (found->isNew)
+    for (const auto& warning : source.warnings) _console.problem("warning: " + warning);
+  answer.body = signWell ? signStorebag(source.payload, _key) : signStorebagBadly(source.payload, _key);
   ++_stats.storebagsSent;
-  auto version = payload.text("version");
+  auto version = source.payload.text("version");
   _console.note(describeRequest(received) + ": " + std::to_string(answer.body.size()) + " bytes, version " +
                 (version ? version->string() : "none"));
   return answer;
 }
 
-HTTPHeaderList StorebagEndpoint::headersFor(std::time_t lastModified) const {
-  HTTPHeaderList headers{{"Last-Modified", httpDate(lastModified)}};
-  if (_maximumAge) headers.emplace_back("Cache-Control", "max-age=" + std::to_string(_maximumAge->count()));
-  return headers;
+std::optional<StorebagEndpoint::Found> StorebagEndpoint::find(std::string_view name) {
+  if (!isPlainName(name)) return std::nullopt;
+  struct stat status {};
+  std::filesystem::path file = _directory / (std::string(name) + ".toml");
+  if (::stat(file.c_str(), &status) != 0) file.replace_extension(".json");
+  if (::stat(file.c_str(), &status) != 0) return std::nullopt;
+
+  MutexLock lock(_mutex);
+  auto [entry, isFirst] = _versions.try_emplace(file);
+  Version& version = entry->second;
+  const bool isNew = isFirst || !isSameVersion(version.status, status);
+  const std::time_t modified = status.st_mtim.tv_sec;
+  if (isNew) version = {status, isFirst ? modified : std::max(version.lastModified + 1, modified)};
+  return Found{file, version.lastModified, isNew};
 }
 
 }  // namespace vesk

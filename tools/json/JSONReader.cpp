@@ -9,43 +9,27 @@ namespace {
 
 namespace json = boost::json;
 
-Value valueFrom(const json::value& read);
-
-Dictionary dictionaryFrom(const json::object& read) {
-  MutableDictionary entries;
-  entries.reserve(read.size());
-  for (const auto& [key, value] : read) entries.append(Text(std::string_view(key)), valueFrom(value));
-  return entries.share();
-}
-
-List listFrom(const json::array& read) {
-  std::vector<Value> values;
-  values.reserve(read.size());
-  for (const auto& value : read) values.push_back(valueFrom(value));
-  return List(std::move(values));
-}
-
-Value valueFrom(const json::value& read) {
-  switch (read.kind()) {
-    case json::kind::null:
-      return {};
-    case json::kind::bool_:
-      return read.get_bool();
-    case json::kind::int64:
-      return read.get_int64();
-    case json::kind::uint64:
-      return read.get_uint64();
-    case json::kind::double_:
-      return read.get_double();
-    case json::kind::string:
-      return std::string_view(read.get_string());
-    case json::kind::array:
-      return listFrom(read.get_array());
-    case json::kind::object:
-      return dictionaryFrom(read.get_object());
+struct Conversion {
+  Value operator()(std::nullptr_t) const { return {}; }
+  Value operator()(const json::string& text) const { return std::string_view(text); }
+  Value operator()(const json::array& array) const {
+    std::vector<Value> values;
+    values.reserve(array.size());
+    for (const auto& value : array) values.push_back(json::visit(*this, value));
+    return List(std::move(values));
   }
-  return {};
-}
+  Value operator()(const json::object& object) const {
+    MutableDictionary entries;
+    entries.reserve(object.size());
+    for (const auto& [key, value] : object)
+      entries.append(Text(std::string_view(key)), json::visit(*this, value));
+    return entries.share();
+  }
+  template <class Number>
+  Value operator()(Number number) const {
+    return number;
+  }
+};
 
 std::string located(std::string_view text, std::size_t offset, const std::string& words) {
   std::string_view before = text.substr(0, offset);
@@ -64,7 +48,7 @@ Result<Value> parseJSON(std::string_view text, std::size_t depth) {
   std::size_t read = parser.write(text.data(), text.size(), error);
   if (!error) parser.finish(error);
   if (error) return malformed(located(text, read, error.message()));
-  return valueFrom(parser.release());
+  return json::visit(Conversion(), parser.release());
 }
 
 }  // namespace vesk

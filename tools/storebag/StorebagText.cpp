@@ -1,5 +1,3 @@
-#include "tools/storebag/StorebagText.h"
-
 #include <cmath>
 #include <ctime>
 #include <sstream>
@@ -8,6 +6,7 @@
 #include "platform/crypto/Base64.h"
 #include "platform/json/JSONWriter.h"
 #include "platform/preferences/TomlLibrary.h"
+#include "tools/storebag/StorebagSource.h"
 
 namespace vesk {
 
@@ -42,42 +41,33 @@ toml::date_time dateTimeFrom(const Date& date) {
                          toml::time(calendar.tm_hour, calendar.tm_min, calendar.tm_sec), toml::time_offset());
 }
 
-/// Where to put a value: under a key of a table, or at the end of an array.
-struct Place {
-  toml::table* table = nullptr;
-  std::string_view key{};
-  toml::array* array = nullptr;
+toml::table tableFrom(const Dictionary& dictionary);
+toml::array arrayFrom(const List& list);
 
-  template <class T>
-  void put(T&& form) const {
-    table != nullptr ? void(table->insert(key, std::forward<T>(form)))
-                     : array->push_back(std::forward<T>(form));
-  }
-};
-
-void putTOML(const Value& value, const Place& place);
+/// Passes the value's TOML form to `put`. There is none for null.
+template <class Put>
+void convert(const Value& value, const Put& put) {
+  if (const bool* boolean = value.boolean()) return put(*boolean);
+  if (const double* real = value.real()) return put(*real);
+  if (const Text* text = value.text()) return put(text->string());
+  if (const Bytes* bytes = value.bytes()) return put(base64Encode(bytes->view()));
+  if (const Date* date = value.date()) return put(dateTimeFrom(*date));
+  if (const Dictionary* dictionary = value.dictionary()) return put(tableFrom(*dictionary));
+  if (const List* list = value.list()) return put(arrayFrom(*list));
+  if (auto number = value.asInteger()) put(*number);
+}
 
 toml::table tableFrom(const Dictionary& dictionary) {
   toml::table table;
-  for (const auto& [key, value] : dictionary) putTOML(value, {&table, key.view()});
+  for (const auto& entry : dictionary)
+    convert(entry.value, [&](auto form) { table.insert(entry.key.view(), std::move(form)); });
   return table;
 }
 
 toml::array arrayFrom(const List& list) {
   toml::array array;
-  for (const Value& item : list) putTOML(item, {.array = &array});
+  for (const Value& item : list) convert(item, [&](auto form) { array.push_back(std::move(form)); });
   return array;
-}
-
-void putTOML(const Value& value, const Place& place) {
-  if (const bool* boolean = value.boolean()) return place.put(*boolean);
-  if (const double* real = value.real()) return place.put(*real);
-  if (const Text* text = value.text()) return place.put(text->string());
-  if (const Bytes* bytes = value.bytes()) return place.put(base64Encode(bytes->view()));
-  if (const Date* date = value.date()) return place.put(dateTimeFrom(*date));
-  if (const Dictionary* dictionary = value.dictionary()) return place.put(tableFrom(*dictionary));
-  if (const List* list = value.list()) return place.put(arrayFrom(*list));
-  if (auto number = value.asInteger()) place.put(*number);
 }
 
 }  // namespace

@@ -1,7 +1,5 @@
 #include "tools/text/Printable.h"
 
-#include <cstdio>
-
 #include "platform/text/ASCII.h"
 #include "platform/unicode/UTF8.h"
 
@@ -9,10 +7,9 @@ namespace vesk {
 
 namespace {
 
-void appendCode(std::string& shown, char c) {
-  char code[8];
-  std::snprintf(code, sizeof code, "\\x%02x", static_cast<unsigned char>(c));
-  shown += code;
+std::string code(char c) {
+  const auto byte = static_cast<unsigned char>(c);
+  return "\\x" + hexLower({&byte, 1});
 }
 
 /// U+0080 to U+009F, which terminals interpret as control characters like the first 32.
@@ -27,10 +24,10 @@ std::string printable(std::string_view text) {
   std::string shown;
   for (std::size_t i = 0; i < text.size(); ++i) {
     if (isUTF8 && isSecondControlSet(text.substr(i))) {
-      appendCode(shown, text[i++]);
-      appendCode(shown, text[i]);
+      shown += code(text[i]) + code(text[i + 1]);
+      ++i;
     } else if (isControl(text[i]) || (!isASCII(text[i]) && !isUTF8)) {
-      appendCode(shown, text[i]);
+      shown += code(text[i]);
     } else {
       shown += text[i];
     }

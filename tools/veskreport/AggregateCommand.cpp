@@ -1,19 +1,12 @@
-#include "tools/veskreport/AggregateCommand.h"
-
-#include <poll.h>
 #include <signal.h>
-#include <sys/eventfd.h>
-#include <sys/signalfd.h>
 
 #include <atomic>
 #include <cmath>
 #include <cstdio>
-#include <ctime>
-#include <system_error>
 
-#include "platform/files/FileDescriptor.h"
 #include "platform/json/JSONWriter.h"
 #include "tools/text/Printable.h"
+#include "tools/veskreport/CommandLine.h"
 #include "tools/veskreport/DaemonSession.h"
 
 namespace vesk {
@@ -23,18 +16,14 @@ namespace {
 // "2026-11-24T23:58:25.042Z", or seconds for a time outside the calendar's range.
 std::string timeText(double seconds) {
   constexpr double kYear10000 = 253'402'300'800;
-  char text[64];
   if (!(seconds >= 0 && seconds < kYear10000)) {
+    char text[32];
     std::snprintf(text, sizeof text, "%g", seconds);
     return text;
   }
-  auto milliseconds = static_cast<long long>(std::floor(seconds * 1000));
-  std::time_t whole = milliseconds / 1000;
-  std::tm parts{};
-  ::gmtime_r(&whole, &parts);
-  std::size_t length = std::strftime(text, sizeof text, "%Y-%m-%dT%H:%M:%S", &parts);
-  std::snprintf(text + length, sizeof text - length, ".%03dZ", static_cast<int>(milliseconds % 1000));
-  return text;
+  const auto milliseconds = static_cast<long long>(std::floor(seconds * 1000));
+  std::string text = isoTime(WallTime(std::chrono::milliseconds(milliseconds)));
+  return text.insert(text.size() - 1, fractionText(static_cast<int>(milliseconds % 1000)));
 }
 
 // A JSON value, or a description if JSON can't represent it (for example bytes).
@@ -49,13 +38,10 @@ std::string words(const std::optional<Dictionary>& dictionary) {
   return printable(toJSON(*dictionary, JSONStyle::Compact).value_or(describe(*dictionary)));
 }
 
-/// Prints on the session's thread and tells the main thread when it may stop waiting.
+/// Prints on the session's thread and wakes the main thread when it may stop waiting.
 class Receiver {
  public:
-  Receiver(const Output& output, std::uint64_t enough)
-      : _output(output), _enough(enough), _end(::eventfd(0, EFD_CLOEXEC)) {
-    if (!_end) throw std::system_error(errno, std::generic_category(), "eventfd");
-  }
+  Receiver(const Output& output, std::uint64_t enough) : _output(output), _enough(enough) { block(SIGUSR1); }
 
   void take(const AggregatedMessage& message) {
     if (_ended) return;
@@ -71,17 +57,11 @@ class Receiver {
 
   /// Until this is called, an interrupt ends the process.
   void waitForTheEnd() {
-    sigset_t interrupts;
-    sigemptyset(&interrupts);
-    sigaddset(&interrupts, SIGINT);
-    sigaddset(&interrupts, SIGTERM);
-    ::pthread_sigmask(SIG_BLOCK, &interrupts, nullptr);
-    FileDescriptor signals(::signalfd(-1, &interrupts, SFD_CLOEXEC));
-    if (!signals) throw std::system_error(errno, std::generic_category(), "signalfd");
+    block(SIGINT);
+    const sigset_t& awaited = block(SIGTERM);
     if (!_output.isJSON()) _output.note("waiting for messages");
-    pollfd ends[] = {{signals.get(), POLLIN, 0}, {_end.get(), POLLIN, 0}};
-    while (::poll(ends, 2, -1) < 0 && errno == EINTR) {
-    }
+    int signal = 0;
+    ::sigwait(&awaited, &signal);
     _ended = true;
   }
 
@@ -89,6 +69,12 @@ class Receiver {
   std::uint64_t received() const { return _received; }
 
  private:
+  /// Blocks another signal on this thread. Returns all those blocked so far.
+  const sigset_t& block(int signal) {
+    ::sigaddset(&_blocked, signal);
+    ::pthread_sigmask(SIG_BLOCK, &_blocked, nullptr);
+    return _blocked;
+  }
   void print(const AggregatedMessage& message) const {
     _output.done(timeText(message.timestamp) + " category " + std::to_string(message.category) + " type " +
                      std::to_string(message.type) + " payload " + words(message.payload) + " session " +
@@ -101,12 +87,13 @@ class Receiver {
   }
   void end() {
     _ended = true;
-    ::eventfd_write(_end.get(), 1);
+    ::pthread_kill(_main, SIGUSR1);
   }
 
   const Output& _output;
   const std::uint64_t _enough;
-  const FileDescriptor _end;
+  const pthread_t _main = ::pthread_self();
+  sigset_t _blocked{};
   std::atomic<bool> _ended{false};
   std::atomic<bool> _closed{false};
   std::atomic<std::uint64_t> _received{0};
@@ -116,17 +103,14 @@ class Receiver {
 
 int runAggregate(const Invocation& invocation, const Output& output) {
   Receiver receiver(output, invocation.aggregateCount);
-  DaemonSession session(invocation.identity, output);
-  if (int status = session.start([&](const AggregatedMessage& message) { receiver.take(message); }))
-    return status;
+  DaemonSession session(invocation, output);
+  session.start([&](const AggregatedMessage& message) { receiver.take(message); });
   receiver.waitForTheEnd();
   if (std::ferror(stdout)) return kExitFailed;
-  if (receiver.wasClosed() && !output.isJSON()) {
-    output.note("the aggregation was closed: the daemon ends, or a session above this one aggregates");
-  }
-  if (output.isJSON()) {
+  if (output.isJSON())
     return output.done("", {{"received", receiver.received()}, {"closed", receiver.wasClosed()}});
-  }
+  if (receiver.wasClosed())
+    output.note("the aggregation was closed: the daemon ends, or a session above this one aggregates");
   return kExitDone;
 }
 

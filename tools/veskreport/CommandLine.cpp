@@ -9,7 +9,6 @@
 #include <utility>
 
 #include "tools/text/Printable.h"
-#include "tools/veskreport/Output.h"
 
 namespace vesk {
 
@@ -73,6 +72,8 @@ void checkCommand(const CLI::App& app, const std::string& argument) {
   throw CLI::ParseError(message, CLI::ExitCodes::ExtrasError);
 }
 
+using Command = int(const Invocation&, const Output&);
+
 class Reader {
  public:
   Reader() : _app("Talks to veskreportingd as a client, and makes storebags.", "veskreport") {
@@ -87,7 +88,7 @@ class Reader {
     unmarkValues(_app);
   }
 
-  CommandLine read(int argc, char** argv) {
+  Invocation read(int argc, char** argv) {
     std::vector<std::string> backwards(std::reverse_iterator(argv + argc), std::reverse_iterator(argv + 1));
     for (std::string& argument : backwards) mark(argument);
     try {
@@ -95,37 +96,36 @@ class Reader {
       if (argc > 2 && argv[1] == kStorebag) checkCommand(*_app.get_subcommand(argv[1]), argv[2]);
       _app.parse(backwards);
     } catch (const CLI::ParseError& error) {
-      return {std::nullopt, _app.exit(error) == 0 ? kExitDone : kExitUsage};
+      throw Exit{_app.exit(error) == 0 ? kExitDone : kExitUsage};
     }
-    _invocation.identity.timeout = std::chrono::milliseconds(static_cast<long>(_timeout * 1000));
-    _invocation.message.flag = (_realtime ? 1U : 0U) | (_overrideSampling ? 2U : 0U);
-    return {std::move(_invocation), kExitDone};
+    _invocation.timeout = std::chrono::milliseconds(static_cast<long>(_timeout * 1000));
+    _invocation.flag = (_realtime ? 1U : 0U) | (_overrideSampling ? 2U : 0U);
+    return std::move(_invocation);
   }
 
  private:
-  CLI::App* add(CLI::App& parent, const char* name, const char* description, Command command) {
+  CLI::App* add(CLI::App& parent, const char* name, const char* description, Command* command) {
     CLI::App* sub = parent.add_subcommand(name, description);
     sub->callback([this, command] { _invocation.command = command; });
     sub->add_flag("--json", _invocation.json, "Print one JSON object per line");
     return sub;
   }
 
-  CLI::App* addClient(const char* name, const char* description, Command command) {
+  CLI::App* addClient(const char* name, const char* description, Command* command) {
     CLI::App* sub = add(_app, name, description, command);
-    ClientIdentity& identity = _invocation.identity;
-    sub->add_option("--root", identity.root, "Directory to use as / (default: $VESKREPORTINGD_ROOT)");
-    sub->add_option("--socket", identity.socket, "The daemon's socket")->excludes("--root");
-    sub->add_option("--client-type", identity.clientType, "Client type; selects the storebag")->required();
-    sub->add_option("--client-version", identity.clientVersion, "Client version")->capture_default_str();
-    sub->add_option("--session-id", identity.sessionID, "Session ID (default: a random one)");
-    sub->add_option("--client-name", identity.clientName, "Client name of the user info");
-    sub->add_option("--service-name", identity.serviceName, "Service name of the user info");
-    sub->add_option("--user-info", identity.userInfo, "Further user info, key=text or key:=json")
+    sub->add_option("--root", _invocation.root, "Directory to use as / (default: $VESKREPORTINGD_ROOT)");
+    sub->add_option("--socket", _invocation.socket, "The daemon's socket")->excludes("--root");
+    sub->add_option("--client-type", _invocation.clientType, "Client type; selects the storebag")->required();
+    sub->add_option("--client-version", _invocation.clientVersion, "Client version")->capture_default_str();
+    sub->add_option("--session-id", _invocation.sessionID, "Session ID (default: a random one)");
+    sub->add_option("--client-name", _invocation.clientName, "Client name of the user info");
+    sub->add_option("--service-name", _invocation.serviceName, "Service name of the user info");
+    sub->add_option("--user-info", _invocation.userInfo, "Further user info, key=text or key:=json")
         ->take_all()
         ->allow_extra_args(false);
-    sub->add_flag("--require-user-info", identity.requireUserInfo,
+    sub->add_flag("--require-user-info", _invocation.requireUserInfo,
                   "Make backends wait for user info and apply it");
-    sub->add_flag("--batch", identity.batch, "Make backends collect messages into batches");
+    sub->add_flag("--batch", _invocation.batch, "Make backends collect messages into batches");
     sub->add_option("--timeout", _timeout, "Seconds to wait for each answer")
         ->check(CLI::Range(0.001, kLongestTimeout) & CLI::Validator(isNumber, "", "NUMBER"))
         ->capture_default_str();
@@ -133,23 +133,22 @@ class Reader {
   }
 
   void addSessionCommands() {
-    addClient("states", "Show the names of the enabled backends", Command::States);
-    addClient("display-url", "Show where the session's messages can be viewed", Command::DisplayURL);
-    addClient("flush", "Make the backends send what they hold back", Command::Flush);
+    addClient("states", "Show the names of the enabled backends", runStates);
+    addClient("display-url", "Show where the session's messages can be viewed", runDisplayURL);
+    addClient("flush", "Make the backends send what they hold back", runFlush);
     addClient("aggregate", "Show the messages of this session and of those below it as they are sent",
-              Command::Aggregate)
+              runAggregate)
         ->add_option("--count", _invocation.aggregateCount, "Exit after this many messages (default: never)")
         ->check(CLI::NonNegativeNumber);
   }
 
   void addMessageCommands() {
-    MessageArguments& message = _invocation.message;
     for (bool isOnce : {false, true}) {
-      CLI::App* sub = isOnce ? addClient("send-once", "Send one message without a session", Command::SendOnce)
-                             : addClient("send", "Send messages in a session", Command::Send);
-      auto* category = sub->add_option("-c,--category", message.category, "Category, 0 to 65535");
-      auto* type = sub->add_option("-t,--type", message.type, "Type, 0 to 65535");
-      auto* payload = sub->add_option("payload", message.payload, "key=text and key:=json");
+      CLI::App* sub = isOnce ? addClient("send-once", "Send one message without a session", runSendOnce)
+                             : addClient("send", "Send messages in a session", runSend);
+      auto* category = sub->add_option("-c,--category", _invocation.category, "Category, 0 to 65535");
+      auto* type = sub->add_option("-t,--type", _invocation.type, "Type, 0 to 65535");
+      auto* payload = sub->add_option("payload", _invocation.payload, "key=text and key:=json");
       if (isOnce) {
         category->required();
         type->required();
@@ -158,9 +157,9 @@ class Reader {
       sub->add_flag("--realtime", _realtime, "Post at once, without batching");
       sub->add_flag("--override-sampling", _overrideSampling, "Send even if sampling excludes this device");
       auto* noWait =
-          sub->add_flag("--no-wait", message.noWait, "Send one way, without waiting for an answer");
+          sub->add_flag("--no-wait", _invocation.noWait, "Send one way, without waiting for an answer");
       sub->add_flag(
-             "--stdin", message.fromStandardInput,
+             "--stdin", _invocation.fromStandardInput,
              "Send a message for each line of standard input: a JSON object, which is the payload when\n"
              "category and type are given, otherwise {\"category\":…,\"type\":…,\"payload\":{…},\"flag\":…}")
           ->excludes(payload)
@@ -168,57 +167,51 @@ class Reader {
       category->needs(type);
       type->needs(category);
       sub->callback([this] {
-        _invocation.command = Command::Send;
-        if (!_invocation.message.category && !_invocation.message.fromStandardInput) {
+        _invocation.command = runSend;
+        if (!_invocation.category && !_invocation.fromStandardInput)
           throw CLI::ValidationError("send", "--category and --type are required");
-        }
       });
     }
   }
 
   void addUploadCommands() {
-    UploadArguments& upload = _invocation.upload;
-    CLI::App* file = addClient("upload-file", "Upload a file", Command::UploadFile);
-    file->add_option("path", upload.path, "The file")->required();
-    CLI::Option* timeout = file->get_option("--timeout")->default_str("600");
-    file->callback([this, timeout] {
-      _invocation.command = Command::UploadFile;
-      if (timeout->empty()) _timeout = kUploadTimeout;
-    });
-    CLI::App* log = addClient("upload-log", "Upload log data", Command::UploadLog);
-    auto* texts = log->add_option("text", upload.logData, "Entries of the log data");
-    log->add_flag("--stdin", upload.fromStandardInput, "Take a JSON value from each line of standard input")
+    CLI::App* file = addClient("upload-file", "Upload a file", runUploadFile);
+    file->add_option("path", _invocation.upload, "The file")->required();
+    file->get_option("--timeout")->default_str("600");
+    file->preparse_callback([this](std::size_t) { _timeout = kUploadTimeout; });
+    CLI::App* log = addClient("upload-log", "Upload log data", runUploadLog);
+    auto* texts = log->add_option("text", _invocation.logData, "Entries of the log data");
+    log->add_flag("--stdin", _invocation.fromStandardInput,
+                  "Take a JSON value from each line of standard input")
         ->excludes(texts);
   }
 
   void addPowerLogCommand() {
-    CLI::App* log =
-        add(_app, "power-log", "Show what was recorded in the device's power log", Command::PowerLog);
-    log->add_option("--root", _invocation.identity.root,
-                    "Directory to use as / (default: $VESKREPORTINGD_ROOT)");
-    log->add_option("--since", _invocation.powerLog.since,
+    CLI::App* log = add(_app, "power-log", "Show what was recorded in the device's power log", runPowerLog);
+    log->add_option("--root", _invocation.root, "Directory to use as / (default: $VESKREPORTINGD_ROOT)");
+    log->add_option("--since", _invocation.since,
                     "Only from then on: an age (30s, 15m, 2h, 7d) or a UTC time (2026-11-24T18:30:00Z)")
         ->type_name("WHEN");
   }
 
   void addStorebagCommands() {
-    StorebagArguments& arguments = _invocation.storebag;
     CLI::App* storebag = _app.add_subcommand(std::string(kStorebag), "Make and examine storebags");
     storebag->require_subcommand(1);
-    CLI::App* keygen = add(*storebag, "keygen", "Make a key pair", Command::StorebagKeygen);
+    CLI::App* keygen = add(*storebag, "keygen", "Make a key pair", runStorebagKeygen);
     keygen
-        ->add_option("directory", arguments.directory, "Where to put storebag-signing.key and publicKey.der")
+        ->add_option("directory", _invocation.directory,
+                     "Where to put storebag-signing.key and publicKey.der")
         ->capture_default_str();
-    CLI::App* sign = add(*storebag, "sign", "Sign a readable storebag", Command::StorebagSign);
-    sign->add_option("source", arguments.source, "Storebag as TOML or JSON")->required();
-    sign->add_option("--key", arguments.privateKey, "Private key (PEM)")->required();
-    sign->add_option("-o,--output", arguments.output, "Where to write it (default: standard output)");
-    sign->add_flag("--lenient", arguments.lenient, "Sign even if values have the wrong type");
-    CLI::App* verify = add(*storebag, "verify", "Check a signed storebag", Command::StorebagVerify);
-    verify->add_option("storebag", arguments.source, "Signed storebag")->required();
-    verify->add_option("--key", arguments.publicKey, "Public key (DER; default: the installed one)");
-    CLI::App* show = add(*storebag, "show", "Show what a signed storebag holds", Command::StorebagShow);
-    show->add_option("storebag", arguments.source, "Signed storebag")->required();
+    CLI::App* sign = add(*storebag, "sign", "Sign a readable storebag", runStorebagSign);
+    sign->add_option("source", _invocation.source, "Storebag as TOML or JSON")->required();
+    sign->add_option("--key", _invocation.key, "Private key (PEM)")->required();
+    sign->add_option("-o,--output", _invocation.output, "Where to write it (default: standard output)");
+    sign->add_flag("--lenient", _invocation.lenient, "Sign even if values have the wrong type");
+    CLI::App* verify = add(*storebag, "verify", "Check a signed storebag", runStorebagVerify);
+    verify->add_option("storebag", _invocation.source, "Signed storebag")->required();
+    verify->add_option("--key", _invocation.key, "Public key (DER; default: the installed one)");
+    CLI::App* show = add(*storebag, "show", "Show what a signed storebag holds", runStorebagShow);
+    show->add_option("storebag", _invocation.source, "Signed storebag")->required();
   }
 
   CLI::App _app;
@@ -230,6 +223,6 @@ class Reader {
 
 }  // namespace
 
-CommandLine parseCommandLine(int argc, char** argv) { return Reader().read(argc, argv); }
+Invocation parseCommandLine(int argc, char** argv) { return Reader().read(argc, argv); }
 
 }  // namespace vesk

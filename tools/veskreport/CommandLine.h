@@ -1,17 +1,76 @@
-// Reads the command line.
+// The command line, and the commands that it names.
 #pragma once
 
+#include <chrono>
+#include <cstdint>
 #include <optional>
+#include <string>
+#include <vector>
 
-#include "tools/veskreport/Invocation.h"
+#include "tools/veskreport/Output.h"
 
 namespace vesk {
 
-struct CommandLine {
-  std::optional<Invocation> invocation;  ///< absent if the tool should just exit
-  int exitStatus = 0;                    ///< used then; help, version or error have been printed
+/// The parsed command line.
+struct Invocation {
+  int (*command)(const Invocation& invocation, const Output& output) = nullptr;
+  bool json = false;
+  std::string root;
+
+  // How the tool identifies itself to the daemon.
+  std::string socket;
+  std::int32_t clientType = 0;
+  std::uint16_t clientVersion = 1;
+  std::uint32_t sessionID = 0;
+  std::string clientName;
+  std::string serviceName;
+  std::vector<std::string> userInfo;  ///< other key=text and key:=json pairs
+  bool requireUserInfo = false;
+  bool batch = false;
+  std::chrono::milliseconds timeout{30'000};
+
+  std::optional<std::uint16_t> category;
+  std::optional<std::uint16_t> type;
+  std::uint32_t flag = 0;
+  std::vector<std::string> payload;  ///< key=text and key:=json pairs
+  bool noWait = false;
+  bool fromStandardInput = false;  ///< messages or log data, one a line
+
+  std::uint64_t aggregateCount = 0;  ///< messages to wait for; 0: unlimited
+  std::string upload;                ///< path of the file
+  std::vector<std::string> logData;  ///< one text each
+  std::string since;                 ///< a time, or an age such as "90m"; empty: from the beginning
+
+  // Storebags.
+  std::string directory = ".";  ///< of a new key pair
+  std::string key;              ///< private or public, depending on the command
+  std::string source;           ///< source or signed document, depending on the command
+  std::string output;
+  bool lenient = false;
 };
 
-CommandLine parseCommandLine(int argc, char** argv);
+/// Throws `Exit` if the tool should just exit; help, version or error have been printed then.
+Invocation parseCommandLine(int argc, char** argv);
+
+// These return the exit status. They throw `Exit` after a failure that they have reported; the text of any
+// other exception is meant for the user.
+
+int runStates(const Invocation& invocation, const Output& output);
+int runDisplayURL(const Invocation& invocation, const Output& output);
+int runFlush(const Invocation& invocation, const Output& output);
+int runSend(const Invocation& invocation, const Output& output);
+int runSendOnce(const Invocation& invocation, const Output& output);
+int runUploadFile(const Invocation& invocation, const Output& output);
+int runUploadLog(const Invocation& invocation, const Output& output);
+/// Shows the messages of a family of sessions, until the daemon closes the aggregation, the requested number
+/// has arrived, or SIGINT or SIGTERM arrives. Blocks these two signals for the process.
+int runAggregate(const Invocation& invocation, const Output& output);
+
+int runPowerLog(const Invocation& invocation, const Output& output);
+
+int runStorebagKeygen(const Invocation& invocation, const Output& output);
+int runStorebagSign(const Invocation& invocation, const Output& output);
+int runStorebagVerify(const Invocation& invocation, const Output& output);
+int runStorebagShow(const Invocation& invocation, const Output& output);
 
 }  // namespace vesk

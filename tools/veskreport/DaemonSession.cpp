@@ -17,68 +17,58 @@ std::uint32_t randomSessionID() {
   return anyButNone(device);
 }
 
-Dictionary sessionInfoOf(const ClientIdentity& identity) {
-  return {
-      {kVeskReportingSessionInfoSessionID, identity.sessionID != 0 ? identity.sessionID : randomSessionID()},
-      {kVeskReportingSessionInfoClientType, identity.clientType},
-      {kVeskReportingSessionInfoClientVersion, int{identity.clientVersion}},
-      {kVeskReportingSessionInfoRequireUserInfo, identity.requireUserInfo},
-      {kVeskReportingSessionInfoBatchEvent, identity.batch}};
+Dictionary sessionInfoOf(const Invocation& invocation) {
+  return {{kVeskReportingSessionInfoSessionID,
+           invocation.sessionID != 0 ? invocation.sessionID : randomSessionID()},
+          {kVeskReportingSessionInfoClientType, invocation.clientType},
+          {kVeskReportingSessionInfoClientVersion, int{invocation.clientVersion}},
+          {kVeskReportingSessionInfoRequireUserInfo, invocation.requireUserInfo},
+          {kVeskReportingSessionInfoBatchEvent, invocation.batch}};
 }
 
 }  // namespace
 
-DaemonSession::DaemonSession(const ClientIdentity& identity, const Output& output)
-    : _identity(identity),
-      _output(output),
-      _socketPath(identity.socket.empty() ? pathUnderRoot(wire::kSocketPath) : identity.socket),
-      _sessionInfo(sessionInfoOf(identity)) {}
-
-int DaemonSession::makeUserInfo() {
-  auto further = parsePairs(_identity.userInfo);
-  if (!further) {
-    _output.failed("user info " + further.error().text);
-    return kExitUsage;
-  }
+DaemonSession::DaemonSession(const Invocation& invocation, const Output& output)
+    : _invocation(invocation), _output(output), _sessionInfo(sessionInfoOf(_invocation)) {
+  auto further = parsePairs(_invocation.userInfo);
+  if (!further) _output.fail("user info " + further.error().text, kExitUsage);
   MutableDictionary userInfo;
-  if (!_identity.clientName.empty()) userInfo.set(kVeskReportingUserInfoClientName, _identity.clientName);
-  if (!_identity.serviceName.empty()) userInfo.set(kVeskReportingUserInfoServiceName, _identity.serviceName);
+  if (!_invocation.clientName.empty()) userInfo.set(kVeskReportingUserInfoClientName, _invocation.clientName);
+  if (!_invocation.serviceName.empty())
+    userInfo.set(kVeskReportingUserInfoServiceName, _invocation.serviceName);
   userInfo.setAll(*further);
   if (!userInfo.empty()) _userInfo = userInfo.share();
-  return kExitDone;
-}
-
-int DaemonSession::connect() {
-  if (int status = makeUserInfo()) return status;
+  const std::string path = _invocation.socket.empty() ? pathUnderRoot(wire::kSocketPath) : _invocation.socket;
   ReportingOptions options;
-  options.socketPath = _socketPath;
-  options.drainTime = _identity.timeout;
+  options.socketPath = path;
+  options.drainTime = _invocation.timeout;
   _reporting.emplace(options);
-  auto connected = _reporting->connect(_identity.timeout);
-  if (connected) return kExitDone;
-  if (connected.status != ReportingStatus::NotConnected) return failed(connected);
-  std::string cause = connected.detail;
-  if (cause.starts_with(_socketPath + ": ")) cause.erase(0, _socketPath.size() + 2);
-  return _output.failed("no daemon at " + _socketPath + ": is veskreportingd running? (" + cause + ")");
-}
-
-int DaemonSession::start(AggregationHandler aggregation) {
-  if (int status = connect()) return status;
-  auto configured = _reporting->setSessionInfo(_sessionInfo, _userInfo, {}, std::move(aggregation));
-  if (configured != ReportingStatus::Queued) return failed(configured, "");
-  auto started = _reporting->startConfig(_identity.timeout);
-  if (!started) return failed(started);
-  if (!started.answer) {
-    return _output.failed("the daemon has no storebag for client type " +
-                          std::to_string(_identity.clientType) + " (its log says why)");
+  auto connected = _reporting->connect(_invocation.timeout);
+  if (connected.status == ReportingStatus::NotConnected) {
+    std::string cause = connected.detail;
+    if (cause.starts_with(path + ": ")) cause.erase(0, path.size() + 2);
+    _output.fail("no daemon at " + path + ": is veskreportingd running? (" + cause + ")");
   }
-  _backends = std::move(*started.answer);
-  return kExitDone;
+  answerOf(connected);
 }
 
-int DaemonSession::failed(ReportingStatus status, const std::string& detail) const {
+BackendNames DaemonSession::start(AggregationHandler aggregation) {
+  auto configured = _reporting->setSessionInfo(_sessionInfo, _userInfo, {}, std::move(aggregation));
+  if (configured != ReportingStatus::Queued) fail(configured);
+  auto backends = answerOf(_reporting->startConfig(_invocation.timeout));
+  if (!backends)
+    _output.fail("the daemon has no storebag for client type " + std::to_string(_invocation.clientType) +
+                 " (its log says why)");
+  return *std::move(backends);
+}
+
+void DaemonSession::fail(ReportingStatus status, const std::string& detail) const {
+  _output.fail(causeOf(status, detail));
+}
+
+std::string causeOf(ReportingStatus status, const std::string& detail) {
   std::string cause = describe(status);
-  return _output.failed(detail.empty() ? cause : cause + ": " + detail);
+  return detail.empty() ? cause : cause + ": " + detail;
 }
 
 }  // namespace vesk

@@ -6,45 +6,41 @@
 #include <optional>
 #include <string>
 
-#include "tools/veskreport/Invocation.h"
+#include "tools/veskreport/CommandLine.h"
 #include "tools/veskreport/Output.h"
 
 namespace vesk {
 
-/// A session with the identity from the command line.
+/// A session with the identity from the command line. Every failure is reported and ends the command.
 class DaemonSession {
  public:
-  DaemonSession(const ClientIdentity& identity, const Output& output);
+  /// Connects to the daemon.
+  DaemonSession(const Invocation& invocation, const Output& output);
 
-  /// These return kExitDone, or the exit status of a failure that they have reported.
-  [[nodiscard]] int connect();
-  /// Connects, configures and starts the session, as an aggregating client if there is a handler. The handler
-  /// must outlive this object.
-  [[nodiscard]] int start(AggregationHandler aggregation = nullptr);
+  /// Configures and starts the session, as an aggregating client if there is a handler, which must outlive
+  /// this object. Returns the enabled backends.
+  BackendNames start(AggregationHandler aggregation = nullptr);
 
-  VeskReporting& reporting() { return *_reporting; }
+  VeskReporting* operator->() { return &*_reporting; }
   const Dictionary& sessionInfo() const { return _sessionInfo; }
   const std::optional<Dictionary>& userInfo() const { return _userInfo; }
-  /// The enabled backends; empty before `start`.
-  const BackendNames& backends() const { return _backends; }
 
-  /// Reports a failed call.
   template <class Answer>
-  int failed(const ReportingResult<Answer>& result) const {
-    return failed(result.status, result.detail);
+  Answer answerOf(ReportingResult<Answer> result) const {
+    if (!result) fail(result.status, result.detail);
+    return std::move(result.answer);
   }
-  int failed(ReportingStatus status, const std::string& detail) const;
+  [[noreturn]] void fail(ReportingStatus status, const std::string& detail = {}) const;
 
  private:
-  int makeUserInfo();
-
-  const ClientIdentity& _identity;
+  const Invocation& _invocation;
   const Output& _output;
-  std::string _socketPath;
   std::optional<VeskReporting> _reporting;
   Dictionary _sessionInfo;
   std::optional<Dictionary> _userInfo;
-  BackendNames _backends;
 };
+
+/// Why a call failed, in words.
+std::string causeOf(ReportingStatus status, const std::string& detail);
 
 }  // namespace vesk

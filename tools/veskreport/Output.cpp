@@ -1,5 +1,6 @@
 #include "tools/veskreport/Output.h"
 
+#include <algorithm>
 #include <cstdio>
 
 #include "platform/json/JSONWriter.h"
@@ -30,12 +31,9 @@ int Output::done(std::string_view line, const Dictionary& fields) const {
 
 int Output::done(const std::vector<std::string>& lines, const Dictionary& fields) const {
   if (std::ferror(stdout)) return kExitFailed;  // already reported
-  bool isWritten = true;
-  if (_json) {
-    isWritten = object("done", {}, fields);
-  } else {
-    for (const std::string& line : lines) isWritten = isWritten && printLine(stdout, line);
-  }
+  const bool isWritten =
+      _json ? object("done", {}, fields)
+            : std::ranges::all_of(lines, [](const auto& line) { return printLine(stdout, line); });
   return isWritten ? kExitDone : failed("cannot write to standard output");
 }
 

@@ -1,10 +1,15 @@
-// The key that storebags are signed with.
+// Signed storebags, as a server sends them, and the key that signs them.
 #pragma once
 
 #include <filesystem>
 #include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
+
+#include <VeskReporting/values/Value.h>
+
+struct evp_pkey_st;
 
 namespace vesk {
 
@@ -14,7 +19,6 @@ class SigningKey {
  public:
   /// Creates a key of 2048 bits.
   static SigningKey generate();
-  static SigningKey fromPEM(const std::string& pem);
   /// Reads the PEM file at `path`.
   static SigningKey fromFile(const std::filesystem::path& path);
   /// Opens the key in `directory`, or creates it there if neither of its files exists.
@@ -39,9 +43,28 @@ class SigningKey {
   std::string sign(std::string_view bytes) const;
 
  private:
-  struct Handle;
-  explicit SigningKey(std::shared_ptr<const Handle> handle) : _handle(std::move(handle)) {}
-  std::shared_ptr<const Handle> _handle;
+  explicit SigningKey(std::shared_ptr<evp_pkey_st> key) : _key(std::move(key)) {}
+  std::shared_ptr<evp_pkey_st> _key;
 };
+
+/// Returns an XML property list with the entries "bag" (the payload as a base64-encoded XML property list)
+/// and "signature". Throws std::runtime_error if the payload holds a value that a property list can't
+/// represent.
+std::string signStorebag(const Dictionary& payload, const SigningKey& key);
+
+/// Like `signStorebag`, but with an invalid signature, for testing how a daemon handles it.
+std::string signStorebagBadly(const Dictionary& payload, const SigningKey& key);
+
+struct StorebagInspection {
+  std::string problem;  ///< why the document is not valid; empty if it is
+  /// The bag's contents, whether or not the signature is valid.
+  std::optional<Dictionary> payload;
+
+  bool isValid() const { return problem.empty(); }
+};
+
+/// Verifies and decodes a document with the daemon's own parser and verification. Doesn't throw for any
+/// `document` or key.
+StorebagInspection inspectStorebag(std::string_view document, std::string_view publicKeyDER);
 
 }  // namespace vesk
