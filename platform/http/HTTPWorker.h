@@ -72,7 +72,6 @@ class HTTPClient::Worker {
   // Only used by the client's thread.
   HTTPSchedule _schedule;
   std::vector<std::unique_ptr<HTTPTransfer>> _transfers;
-  bool _hasStoppedOthers = false;
   std::vector<HTTPTransfer*> _idle;  ///< those of `_transfers` without an exchange
 
   Mutex _mutex;
