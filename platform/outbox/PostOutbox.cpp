@@ -260,6 +260,10 @@ void PostOutbox::take(const Answer& answer) {
   } else {
     host.backoff.succeeded();
   }
+  if (outcomeOf(status) == Outcome::Refused) {
+    VESK_LOG_INFO("Outbox: %s refused %llu events that had waited (status %ld)", answer.host.c_str(),
+                  static_cast<unsigned long long>(answer.post.events), status);
+  }
   _changes.removed.push_back(answer.id);
   _options.onFate({outcomeOf(status), answer.post.source, answer.post.events, status});
 }

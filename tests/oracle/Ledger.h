@@ -25,7 +25,8 @@ enum class DaemonEnd : std::uint8_t {
 /// lost, but not which: of the messages that a daemon accepted, at most the total of its final lines ("main:
 /// Lost since the start: BACKEND REASON COUNT") may be missing. The counters also include the sessions' own
 /// start and end messages and messages that were never confirmed, so these can hide a loss. The fewer drops
-/// are counted, the sharper the judgement; without drops it is exact. Losses of a killed daemon are excused,
+/// are counted, the sharper the judgement; without drops it is exact. A post that waits on disk may be lost
+/// under a later daemon, so those losses cover the messages of any. Losses of a killed daemon are excused,
 /// and shown.
 ///
 /// Every message that arrives, accepted or not, is checked to be *unchanged*.
@@ -37,7 +38,7 @@ class Ledger {
   void readEvents(const std::string& path);
   bool hasArrived(std::int64_t id) const { return _arrived.contains(id); }
 
-  /// Whether every terminated daemon's losses are covered by what has arrived so far.
+  /// Whether the terminated daemons' losses are covered by what has arrived so far.
   bool isCovered() const;
 
   /// Prints the accounts. Returns true if every daemon's losses are covered, no message was changed, and
@@ -48,12 +49,15 @@ class Ledger {
   struct Account {
     DaemonEnd end = DaemonEnd::Killed;
     std::uint64_t counted = 0;
+    std::uint64_t countedLate = 0;  ///< of posts that had waited on disk
     std::string reasons;
     std::vector<std::int64_t> accepted;
   };
   void readEvent(const std::string& line);
   std::vector<std::int64_t> missing(const Account& account) const;
-  bool judge(std::uint64_t incarnation, const Account& account) const;
+  /// The number of its messages that neither arrived nor were counted; 0 for a killed daemon.
+  std::size_t uncovered(const Account& account) const;
+  void print(std::uint64_t incarnation, const Account& account) const;
 
   std::map<std::uint64_t, Account> _accounts;
   std::unordered_set<std::int64_t> _arrived;
