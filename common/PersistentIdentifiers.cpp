@@ -1,7 +1,5 @@
 #include "common/PersistentIdentifiers.h"
 
-#include <unistd.h>
-
 #include <algorithm>
 #include <cctype>
 #include <cerrno>
@@ -13,12 +11,10 @@
 #include <system_error>
 
 #include "platform/crypto/UUID.h"
-#include "platform/files/FileDescriptor.h"
 #include "platform/files/FileLock.h"
 #include "platform/files/PrivateFile.h"
 #include "platform/files/RootPrefix.h"
 #include "platform/files/SmallFile.h"
-#include "platform/files/WriteAll.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
@@ -90,17 +86,7 @@ Result<void> PersistentIdentifiers::store(const Pair& pair) const {
   std::string text = "# Identifiers of this device, one for each consent mode. Made once; delete to renew.\n";
   text += std::string(kRespecting) + " = \"" + pair.respecting + "\"\n";
   text += std::string(kOverriding) + " = \"" + pair.overriding + "\"\n";
-
-  // Only the lock's holder uses this name. A leftover of a crashed process is overwritten.
-  std::string temporary = _path + ".new";
-  ::unlink(temporary.c_str());
-  const auto file = makePrivateFile(temporary);
-  if (!file) return file.error();
-  auto stored = writeAll(file->get(), text);
-  if (stored && (::fsync(file->get()) != 0 || std::rename(temporary.c_str(), _path.c_str()) != 0))
-    stored = systemError(errno);
-  if (!stored) ::unlink(temporary.c_str());
-  return stored;
+  return replacePrivateFile(_path, text);
 }
 
 // Parses what `store` writes: comments, blank lines and `key = "identifier"`.

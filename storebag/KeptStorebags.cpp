@@ -3,13 +3,10 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <cerrno>
-#include <cstdio>
 #include <utility>
 
 #include "platform/files/PrivateFile.h"
 #include "platform/files/TrustedFile.h"
-#include "platform/files/WriteAll.h"
 #include "platform/log/SystemLog.h"
 #include "platform/plist/PropertyList.h"
 #include "platform/text/PercentCode.h"
@@ -27,7 +24,8 @@ void KeptStorebags::keep(std::string_view name, std::string_view document,
   std::string bytes = lastModified.value_or("");
   (bytes += '\n') += document;
   const std::string path = pathFor(name);
-  if (const auto written = write(path, bytes); !written) {
+  ::mkdir(_directory.c_str(), 0700);
+  if (const auto written = replacePrivateFile(path, bytes); !written) {
     VESK_LOG_WARNING("KeptStorebags: cannot write %s: %s", path.c_str(), written.error().text.c_str());
   }
 }
@@ -60,19 +58,6 @@ Result<KeptStorebags::Kept> KeptStorebags::parse(std::string_view file) const {
   Kept kept{.payload = std::move(verification.payload), .lastModified = std::nullopt};
   if (end > 0) kept.lastModified = std::string(file.substr(0, end));
   return kept;
-}
-
-Result<void> KeptStorebags::write(const std::string& path, const std::string& bytes) const {
-  ::mkdir(_directory.c_str(), 0700);
-  const std::string temporary = path + ".new";
-  ::unlink(temporary.c_str());
-  const auto file = makePrivateFile(temporary);
-  if (!file) return file.error();
-  auto written = writeAll(file->get(), bytes);
-  if (written && (::fsync(file->get()) != 0 || std::rename(temporary.c_str(), path.c_str()) != 0))
-    written = systemError(errno);
-  if (!written) ::unlink(temporary.c_str());
-  return written;
 }
 
 }  // namespace vesk

@@ -38,7 +38,6 @@ class KeptStorebags {
  private:
   std::string pathFor(std::string_view name) const;
   Result<Kept> parse(std::string_view file) const;
-  Result<void> write(const std::string& path, const std::string& bytes) const;
 
   const std::string _directory;
   const std::function<PublicKeys()> _publicKeys;

@@ -5,7 +5,10 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdio>
 #include <filesystem>
+
+#include "platform/files/WriteAll.h"
 
 namespace vesk {
 
@@ -19,6 +22,19 @@ Result<FileDescriptor> makePrivateFile(const std::string& path) {
     static_cast<void>(::fchown(file.get(), directory.st_uid, directory.st_gid) == 0);
   }
   return file;
+}
+
+Result<void> replacePrivateFile(const std::string& path, std::string_view bytes) {
+  // A leftover of a crashed process is overwritten.
+  const std::string temporary = path + ".new";
+  ::unlink(temporary.c_str());
+  const auto file = makePrivateFile(temporary);
+  if (!file) return file.error();
+  auto stored = writeAll(file->get(), bytes);
+  if (stored && (::fsync(file->get()) != 0 || std::rename(temporary.c_str(), path.c_str()) != 0))
+    stored = systemError(errno);
+  if (!stored) ::unlink(temporary.c_str());
+  return stored;
 }
 
 }  // namespace vesk
