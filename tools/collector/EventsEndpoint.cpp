@@ -79,9 +79,9 @@ void checkEvent(const Value& value, std::size_t index) {
 }
 
 EventPost readBody(const std::string& json) {
-  const auto value = parseJSON(json);
-  if (!value) refuse("the body is no JSON: " + value.error().text);
-  const Dictionary* body = value->dictionary();
+  const auto parsed = parseJSON(json);
+  if (!parsed) refuse("the body is no JSON: " + parsed.error().text);
+  const Dictionary* body = parsed->dictionary();
   if (body == nullptr) refuse("the body must be a JSON object");
   for (const auto& [key, value] : *body)
     if (key != "postTime" && key != "clientId" && key != "events")
