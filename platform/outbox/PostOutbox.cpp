@@ -283,7 +283,10 @@ void PostOutbox::write() {
   } else {
     _writeBy = std::chrono::steady_clock::now() + std::chrono::seconds(60);  // the file can't be written now
   }
-  if (added > 0) VESK_LOG_DEBUG("Outbox: %zu posts are put aside", added);
+  if (added > 0) {
+    VESK_LOG_DEBUG("Outbox: %zu posts are put aside", added);
+    for (auto& [name, host] : _hosts) host.readAgain = {};
+  }
   if (_storage.isEmpty()) _storage.shrinkIfEmpty(lost);
   report(lost);
 }
