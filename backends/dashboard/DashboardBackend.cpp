@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <exception>
-#include <new>
 #include <utility>
 
 #include "backends/dashboard/DashboardText.h"
@@ -160,7 +159,7 @@ std::optional<std::string> DashboardBackend::sendMessageInTurn(const std::option
                                                                const timeval& timestamp, std::uint16_t method,
                                                                std::uint16_t respCode, std::uint16_t eventID,
                                                                std::int32_t) {
-  std::unique_ptr<DashboardDelivery::Buffer> buffer(new (std::nothrow) DashboardDelivery::Buffer);
+  auto buffer = std::make_unique_for_overwrite<DashboardDelivery::Buffer>();
   if (!buffer) {
     VESK_LOG_ERROR("DashboardBackend(sendMessage): can't malloc.");
     return std::nullopt;

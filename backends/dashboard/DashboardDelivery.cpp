@@ -5,7 +5,6 @@
 #include <exception>
 #include <future>
 #include <iterator>
-#include <new>
 #include <system_error>
 #include <utility>
 
@@ -171,13 +170,9 @@ bool DashboardDelivery::tryToSendMsg(const char* bytes, std::uint16_t length, st
   if (outcome == UDPSocket::Outcome::WouldBlock) return false;
   const bool isSent = outcome == UDPSocket::Outcome::Sent;
   if (isSent && !_reliableUDP) return true;
-  try {
-    UDPPacketToSend packet(datagram, eventNumber);
-    if (isSent) packet.setState(UDPPacketToSend::Sent);
-    append(std::move(packet));
-  } catch (const std::bad_alloc&) {
-    countLost(DropReason::OverBound);
-  }
+  UDPPacketToSend packet(datagram, eventNumber);
+  if (isSent) packet.setState(UDPPacketToSend::Sent);
+  append(std::move(packet));
   return true;
 }
 

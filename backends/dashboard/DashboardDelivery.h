@@ -5,6 +5,7 @@
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
+#include <cstdlib>
 #include <memory>
 #include <optional>
 #include <string>
@@ -32,7 +33,11 @@ namespace vesk {
 /// their backends is limited: each takes a slot from `cleanup` to its teardown.
 class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery> {
  public:
-  using Buffer = std::array<char, kDashboardBufferSize>;
+  /// From malloc, and null if that fails: a lack of memory then costs one message, not the daemon.
+  struct Buffer : std::array<char, kDashboardBufferSize> {
+    static void* operator new(std::size_t size) noexcept { return std::malloc(size); }
+    static void operator delete(void* buffer) noexcept { std::free(buffer); }
+  };
 
   static constexpr std::chrono::milliseconds kDefaultTick{500};
   static constexpr std::chrono::milliseconds kLastResort{9'500};
@@ -62,7 +67,7 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   /// Constant once constructed.
   bool isReliable() const noexcept { return _reliableUDP; }
   /// Sends the first `length` bytes. Never waits for the network. Datagrams that the system can't take yet
-  /// are queued up to a limit; beyond it, or if memory runs out, they are dropped and counted.
+  /// are queued up to a limit; beyond it they are dropped and counted.
   void send(std::unique_ptr<Buffer> buffer, std::uint16_t length, std::uint16_t eventNumber);
   /// Requests the shutdown. It happens once nothing is pending, at the latest 9.5 s after the next tick. If
   /// no slot is free, it happens at once, counts pending datagrams as unacknowledged, and this call waits for

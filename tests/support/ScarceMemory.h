@@ -1,14 +1,13 @@
-// Simulates out-of-memory on one thread. Replaces operator new, so include it in only one source file of a
+// Simulates out-of-memory on one thread. Replaces malloc, so include it in only one source file of a
 // test program.
 #pragma once
 
-#include <cstdlib>
-#include <new>
+#include <cstddef>
 #include <utility>
 
 namespace vesk::test {
 
-/// Makes the thread's next allocation fail. Does nothing in sanitized builds, which replace operator new.
+/// Makes the thread's next allocation fail. Does nothing in sanitized builds, which replace malloc.
 class ScarceMemory {
  public:
   ScarceMemory() { _isScarce = true; }
@@ -25,11 +24,8 @@ class ScarceMemory {
 }  // namespace vesk::test
 
 #if !defined(__SANITIZE_THREAD__) && !defined(__SANITIZE_ADDRESS__)
-void* operator new(std::size_t size) {
-  void* memory = vesk::test::ScarceMemory::runsOut() ? nullptr : std::malloc(size > 0 ? size : 1);
-  if (!memory) throw std::bad_alloc();
-  return memory;
+extern "C" void* __libc_malloc(std::size_t size);
+extern "C" void* malloc(std::size_t size) noexcept {
+  return vesk::test::ScarceMemory::runsOut() ? nullptr : __libc_malloc(size);
 }
-void operator delete(void* memory) noexcept { std::free(memory); }
-void operator delete(void* memory, std::size_t) noexcept { std::free(memory); }
 #endif
