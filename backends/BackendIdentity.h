@@ -13,8 +13,15 @@
 #include <VeskReporting/values/Value.h>
 #include "backends/HeldBytes.h"
 #include "backends/upload/UploadGate.h"
+#include "platform/http/PostBudget.h"
 
 namespace vesk {
+
+/// The client process of a session.
+struct BackendClient {
+  uid_t user = UploadGate::kNobody;      ///< charged for posts and uploads that wait
+  std::shared_ptr<PostAccount> posts{};  ///< of its connection. Null: its posts are not limited.
+};
 
 /// The session, its client and the device, as they are when the session makes its backends. The same for all
 /// of them, and constant.
@@ -33,7 +40,7 @@ struct BackendIdentity {
   std::uint8_t _selfVersionMajor = 0;  ///< of the client library
   std::uint8_t _selfVersionMinor = 0;
   double _startTimeStamp = 0;         ///< seconds since 1970
-  uid_t _user = UploadGate::kNobody;  ///< charged for posts and uploads that wait
+  BackendClient _client{};
   HeldBytes _heldBytes = std::make_shared<HeldAccount>(HeldBudget::Limits().ofSession);
 
   /// "7.2.9" gives 7 and 2; numbers are truncated to 8 bits.

@@ -43,6 +43,8 @@ struct BackendServices {
   std::shared_ptr<DashboardLinger> dashboardLinger = std::make_shared<DashboardLinger>(kMaximumLingering);
   /// How many bytes of events may be held back.
   std::shared_ptr<HeldBudget> heldBudget = std::make_shared<HeldBudget>();
+  /// How many bytes of posts may wait for servers that answer.
+  std::shared_ptr<PostBudget> postBudget = std::make_shared<PostBudget>();
   /// Logs refused posts.
   std::shared_ptr<RefusedPosts> refusedPosts = std::make_shared<RefusedPosts>();
 };

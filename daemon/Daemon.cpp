@@ -123,18 +123,32 @@ std::chrono::seconds uptime() {
   return std::chrono::seconds(now.tv_sec);
 }
 
-/// Returns null if the preference "outbox" is "off".
-std::unique_ptr<PostOutbox> makeOutbox(BusyMarker& busyMarker, RefusedPosts& refusedPosts) {
+enum class OutboxMode { Off, Outage, Always };
+
+OutboxMode outboxMode() {
   const std::string mode = preferenceStringForKey("outbox").value_or("outage");
-  if (mode == "off") return nullptr;
-  if (mode != "outage")
-    VESK_LOG_WARNING("main: preference 'outbox': '%s' is neither \"outage\" nor \"off\"", mode.c_str());
+  if (mode == "off") return OutboxMode::Off;
+  if (mode == "always") return OutboxMode::Always;
+  if (mode != "outage") {
+    VESK_LOG_WARNING("main: preference 'outbox': '%s' is none of \"always\", \"outage\" and \"off\"",
+                     mode.c_str());
+  }
+  return OutboxMode::Outage;
+}
+
+// In the mode "always" callers wait for this long, so that many of them share a transaction.
+constexpr std::chrono::milliseconds kGroupCommit{50};
+
+/// Returns null in the mode "off".
+std::unique_ptr<PostOutbox> makeOutbox(OutboxMode mode, BusyMarker& busyMarker, RefusedPosts& refusedPosts) {
+  if (mode == OutboxMode::Off) return nullptr;
   PostOutbox::Options options;
   options.path = pathUnderRoot(kOutboxPath);
   options.maximumBytes = bytesOfMiB("outboxMiB", options.maximumBytes);
   if (auto days = preferenceNumberForKey("outboxDays", 1)) {
     options.maximumAge = std::chrono::days(std::min<std::uint64_t>(*days, kMostOutboxDays));
   }
+  if (mode == OutboxMode::Always) options.writeWithin = kGroupCommit;
   options.onWaiting = [&busyMarker](bool waiting) { waiting ? busyMarker.begin() : busyMarker.end(); };
   options.onFate = [&refusedPosts](const PostOutbox::Fate& fate) { countFate(fate, refusedPosts); };
   return std::make_unique<PostOutbox>(std::move(options));
@@ -143,9 +157,10 @@ std::unique_ptr<PostOutbox> makeOutbox(BusyMarker& busyMarker, RefusedPosts& ref
 // In this time a post is tried again from memory. Then it is put aside, and the session gets its result.
 constexpr std::chrono::seconds kPutAsideAfter{5};
 
-HTTPClient::Options httpOptions(BusyMarker& busyMarker, PostOutbox* outbox) {
+HTTPClient::Options httpOptions(OutboxMode mode, BusyMarker& busyMarker, PostOutbox* outbox) {
   HTTPClient::Options options;
   options.keeper = outbox;
+  options.keepsFirst = mode == OutboxMode::Always;
   if (outbox) options.retryFor = kPutAsideAfter;
   options.userAgent = "veskreportingd/" VESK_VERSION;
   options.onIdle = [&busyMarker] { busyMarker.touch(); };
@@ -192,12 +207,14 @@ struct Daemon::Parts {
                         .dashboardLinger = dashboardLinger()},
         sessionServices{.backends = backendServices, .libraryVersion = clientLibraryVersion()},
         keptStorebags(makeKeptStorebags()),
-        outbox(makeOutbox(busyMarker, *backendServices.refusedPosts)),
-        http(httpOptions(busyMarker, outbox.get())),
+        mode(outboxMode()),
+        outbox(makeOutbox(mode, busyMarker, *backendServices.refusedPosts)),
+        http(httpOptions(mode, busyMarker, outbox.get())),
         agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetcher(), busyMarker,
                                                 keptStorebagSource())),
         listener(listenerOptions(serviceManager)) {
     backendServices.heldBudget = std::make_shared<HeldBudget>(heldLimits());
+    backendServices.postBudget = std::make_shared<PostBudget>(PostBudget::Limits{}, outbox.get());
     listener.setDelegate(agent.get());
     if (!outbox) return;
     outbox->setConsent(diagnosticsSubmissionConsent());
@@ -242,6 +259,7 @@ struct Daemon::Parts {
   BackendServices backendServices;
   SessionServices sessionServices;
   std::unique_ptr<const KeptStorebags> keptStorebags;  // null: storebags are kept in memory only
+  const OutboxMode mode;
   // Null: posts that can't be delivered for a minute are lost. Declared before the client, whose posts it
   // keeps.
   std::unique_ptr<PostOutbox> outbox;

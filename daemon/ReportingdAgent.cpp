@@ -41,6 +41,7 @@ bool ReportingdAgent::shouldAcceptNewConnection(const std::shared_ptr<IPCConnect
   auto session = std::make_shared<ReportingdSession>(shared_from_this(), connection, _services);
   IPCHandlers handlers{
       .object = std::make_shared<ClientSessionStub>(session),
+      .beforeSending = [session] { session->waitForPosts(); },
       .interruption =
           [session] {
             VESK_LOG_DEBUG("listener: Orvo connection to %s was interrupted", session->description().c_str());

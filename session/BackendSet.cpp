@@ -13,7 +13,7 @@ namespace vesk {
 namespace {
 
 BackendIdentity identityFrom(const Dictionary& sessionInfo, std::string_view deviceID,
-                             const std::string& libraryVersion, uid_t user, const BackendServices& services) {
+                             const std::string& libraryVersion, const BackendClient& client, const BackendServices& services) {
   const auto number = [&](std::string_view key) { return integerForKey(sessionInfo, key).value_or(0); };
   const auto flag = [&](std::string_view key) { return booleanForKey(sessionInfo, key).value_or(false); };
   BackendIdentity identity{
@@ -29,8 +29,8 @@ BackendIdentity identityFrom(const Dictionary& sessionInfo, std::string_view dev
       ._requireUserInfo = flag(kVeskReportingSessionInfoRequireUserInfo),
       ._batchEvents = flag(kVeskReportingSessionInfoBatchEvent),
       ._startTimeStamp = secondsFromTimeval(timevalFrom(services.clock.now())),
-      ._user = user,
-      ._heldBytes = services.heldBudget->accountFor(user)};
+      ._client = client,
+      ._heldBytes = services.heldBudget->accountFor(client.user)};
   identity.setSelfVersion(libraryVersion);
   return identity;
 }
@@ -47,7 +47,7 @@ std::optional<Dictionary> profileFrom(const DictionaryEntry& entry) {
 std::optional<BackendSet> createBackends(const std::optional<Dictionary>& storebag,
                                          const std::optional<Dictionary>& sessionInfo,
                                          const std::optional<Dictionary>& userInfo, std::string_view deviceID,
-                                         const std::string& libraryVersion, uid_t user,
+                                         const std::string& libraryVersion, const BackendClient& client,
                                          const BackendServices& services) {
   if (!storebag) {
     VESK_LOG_ERROR("createBackends: Attempted to create backends with nil storebag");
@@ -57,7 +57,7 @@ std::optional<BackendSet> createBackends(const std::optional<Dictionary>& storeb
     VESK_LOG_ERROR("createBackends: Attempted to create backends with nil session info");
     return std::nullopt;
   }
-  const BackendIdentity identity = identityFrom(*sessionInfo, deviceID, libraryVersion, user, services);
+  const BackendIdentity identity = identityFrom(*sessionInfo, deviceID, libraryVersion, client, services);
   BackendSet backends;
   for (const DictionaryEntry& entry : *storebag) {
     std::string name = entry.key.string();

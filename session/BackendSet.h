@@ -20,11 +20,11 @@ using BackendSet = std::vector<std::pair<std::string, std::shared_ptr<VeskReport
 /// Creates a backend for each entry of the storebag's section that the factory knows, and gives it the
 /// session's and the device's identity. Returns nullopt, with a line of level 3, if the storebag or the
 /// session info is missing. `deviceID`: at most 40 characters, copied. `libraryVersion`: of the client
-/// library. `user`: the client's user. Thread-safe.
+/// library. Thread-safe.
 std::optional<BackendSet> createBackends(const std::optional<Dictionary>& storebag,
                                          const std::optional<Dictionary>& sessionInfo,
                                          const std::optional<Dictionary>& userInfo, std::string_view deviceID,
-                                         const std::string& libraryVersion, uid_t user,
+                                         const std::string& libraryVersion, const BackendClient& client,
                                          const BackendServices& services);
 
 /// The backend with that name, or null.

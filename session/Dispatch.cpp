@@ -140,7 +140,7 @@ bool uploadLogData(const BackendSet* backends, const List& logData, Counters& co
   return succeeded;
 }
 
-void sendMessageWithSessionInfo(const SessionServices& services, uid_t user,
+void sendMessageWithSessionInfo(const SessionServices& services, const BackendClient& client,
                                 const std::optional<Dictionary>& sessionInfo,
                                 const std::optional<Dictionary>& userInfo,
                                 const std::optional<Dictionary>& storebag, std::uint16_t category,
@@ -156,7 +156,7 @@ void sendMessageWithSessionInfo(const SessionServices& services, uid_t user,
   std::array<char, 41> deviceID{};
   copyUniqueDeviceID(deviceID.data(), deviceID.size());
   auto backends = createBackends(storebag, sessionInfo, userInfo, deviceID.data(), services.libraryVersion,
-                                 user, services.backends);
+                                 client, services.backends);
   if (!backends) {
     VESK_LOG_ERROR("sendMessageWithSessionInfo: No backends available to send single message");
     services.backends.counters.count("session", DropReason::NoBackend);

@@ -44,8 +44,8 @@ bool uploadFileWithURL(const BackendSet* backends, const std::string& fileURL,
 bool uploadLogData(const BackendSet* backends, const List& logData, Counters& counters);
 
 /// Sends one message through backends created for it alone. Without session info or storebag the message is
-/// lost, with a line of level 3. `user`: the client's user.
-void sendMessageWithSessionInfo(const SessionServices& services, uid_t user,
+/// lost, with a line of level 3.
+void sendMessageWithSessionInfo(const SessionServices& services, const BackendClient& client,
                                 const std::optional<Dictionary>& sessionInfo,
                                 const std::optional<Dictionary>& userInfo,
                                 const std::optional<Dictionary>& storebag, std::uint16_t category,

@@ -28,6 +28,12 @@ bool requiresUserInfo(const Dictionary& sessionInfo) {
   return booleanForKey(sessionInfo, kVeskReportingSessionInfoRequireUserInfo).value_or(false);
 }
 
+// The account keeps the connection until the last of its posts is done.
+BackendClient clientOf(const std::shared_ptr<IPCConnection>& connection, PostBudget& budget) {
+  const uid_t user = connection->peer().user;
+  return {user, budget.accountFor(user, [connection](bool isPaused) { connection->setPaused(isPaused); })};
+}
+
 // Whether both have the same text under `key`.
 bool sameText(const std::optional<Dictionary>& a, const std::optional<Dictionary>& b, const char* key) {
   auto first = a ? a->text(key) : std::nullopt;
@@ -44,6 +50,7 @@ ReportingdSession::ReportingdSession(std::shared_ptr<ReportingdSessionDelegate> 
       _connection(std::move(connection)),
       _services(services),
       _sessionIDString(freshIdentity()),
+      _client(clientOf(_connection, *services.backends.postBudget)),
       _aggregator(_connection, services.backends.counters),
       _correlationKey(keyFor(std::nullopt)) {
   VESK_LOG_DEBUG("initWithSessionDelegate: ReportingdSession initWithSessionDelegate:%s",
@@ -236,7 +243,7 @@ void ReportingdSession::sendMessageWithSessionInfo(const Dictionary& sessionInfo
     reply("storebag not available");
     return;
   }
-  vesk::sendMessageWithSessionInfo(_services, _connection->peer().user, sessionInfo, userInfo, storebag,
+  vesk::sendMessageWithSessionInfo(_services, _client, sessionInfo, userInfo, storebag,
                                    category, type, payload);
   reply("finished");
 }
@@ -311,7 +318,7 @@ std::optional<std::string> ReportingdSession::flushMessages() {
 void ReportingdSession::createBackendsWithStorebag(const std::optional<Dictionary>& storebag) {
   VESK_LOG_DEBUG("createBackendsWithStorebag: Creating backends for session %u", sessionID());
   auto created = createBackends(storebag, sessionInfo(), userInfo(), _deviceid.data(),
-                                _services.libraryVersion, _connection->peer().user, _services.backends);
+                                _services.libraryVersion, _client, _services.backends);
   SharedBackends next;
   if (created) {
     for (const auto& [name, backend] : *created) backend->setCombinedSessionIDString(_sessionIDString);

@@ -61,6 +61,10 @@ class ReportingdSession final : public ClientSessionInterface,
                                   const std::optional<Dictionary>& payload,
                                   Reply<std::string> reply) override;
 
+  /// Waits until the posts made from the calls so far are on disk, if they are written before they are sent.
+  /// Called on the connection's thread.
+  void waitForPosts() { _client.posts->waitUntilWritten(); }
+
   // --- Identity
   /// The session's number, chosen by the client; 0 until configured.
   std::uint32_t sessionID() const;
@@ -110,6 +114,7 @@ class ReportingdSession final : public ClientSessionInterface,
   const std::shared_ptr<IPCConnection> _connection;
   const SessionServices& _services;
   const std::string _sessionIDString;
+  const BackendClient _client;
   std::array<char, 41> _deviceid{};  // NUL-terminated; empty if the device has no ID
 
   bool _isEnding = false;  // written only by the destructor's thread

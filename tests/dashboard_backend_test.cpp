@@ -410,14 +410,14 @@ TEST_F(Dashboard, UploadsLogDataAndAnnouncesWhereItWent) {
       .uploads = 1, .uploadsOfUser = 1, .smallUploads = 2, .smallUploadsOfUser = 1, .patience = {}});
   for (const bool isSmall : {false, true}) {
     auto client = identity();
-    client._user = 7;
+    client._client.user = 7;
     auto limited = make(profile(Dictionary{{"post_url", server.url("/log")}}), client);
     auto another = isSmall ? _services.uploads->enterWithLogData(7, 0) : _services.uploads->enter(7, 0);
     EXPECT_TRUE(limited->uploadLogData(isSmall ? large : List{1})) << "each kind has places of its own";
     _log.clear();
     EXPECT_FALSE(limited->uploadLogData(isSmall ? List{1} : large));
     refused(failed + "too many uploads are under way)");
-    client._user = 8;
+    client._client.user = 8;
     limited = make(profile(Dictionary{{"post_url", server.url("/log")}}), client);
     EXPECT_EQ(limited->uploadLogData(isSmall ? List{1} : large), isSmall) << "another user's place";
     another.reset();

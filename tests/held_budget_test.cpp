@@ -31,7 +31,7 @@ TEST(HeldBudget, ASessionPaysWithItsOwnEvents) {
     CapturedLog log;
     const std::uint64_t before = harness.dropped(DropReason::OverBound);
     sessions.push_back(createBackends(Dictionary{{"httpPost", Dictionary{{"clients", List{}}}}}, Dictionary(),
-                                      std::nullopt, "", "7.0", user, harness.services)
+                                      std::nullopt, "", "7.0", {user}, harness.services)
                            .value());
     for (int i = 0; i < events; ++i) sessions.back().at(0).second->sendMessage(payload, timeval{}, 3, 2, 0);
     EXPECT_EQ(harness.dropped(DropReason::OverBound) - before, dropped);

@@ -47,6 +47,7 @@ class Schedule : public testing::Test {
     request.retry = retry;
     request.owner = owner;
     request.isBackground = isBackground;
+    request.account = account;
     const auto noteFailure = [this, name](const HTTPResult& result) {
       if (result.error) givenUpNames += name;
     };
@@ -84,6 +85,7 @@ class Schedule : public testing::Test {
   HTTPOutstanding outstanding;
   HTTPSchedule schedule;
   Instant now{Instant{} + 1h};
+  std::shared_ptr<PostAccount> account;  ///< charged for what is added
   std::vector<HTTPSchedule::Exchange> active;
 };
 
@@ -178,6 +180,75 @@ TEST_F(Schedule, OwnersTakeTurnsAndShareWhatMayWait) {
   EXPECT_EQ(givenUp(), "c") << "nobody comes to more than that one has";
 }
 
+/// The posts of `a`, `b` and the other user's `c` take about 2 KB each.
+class Senders : public Schedule {
+ protected:
+  void addFrom(const std::shared_ptr<PostAccount>& sender, int posts) {
+    account = sender;
+    for (int i = 0; i < posts; ++i) add("1", 1000);
+    account = nullptr;
+  }
+  void answerAll() {
+    while (!takeReady().empty()) {
+      while (!active.empty()) answerFirst();
+    }
+  }
+  /// Who had to pause (-) and may continue (+) since the last call.
+  std::string changes() { return std::exchange(noted, ""); }
+
+  std::string noted;
+  std::shared_ptr<PostBudget> budget = std::make_shared<PostBudget>(PostBudget::Limits{10'000, 15'000});
+  PostBudget::SetPaused note(const char* name) {
+    return [this, name](bool isPaused) { noted += (isPaused ? "-" : "+") + std::string(name); };
+  }
+  std::shared_ptr<PostAccount> a = budget->accountFor(7, note("a"));
+  std::shared_ptr<PostAccount> b = budget->accountFor(7, note("b"));
+  std::shared_ptr<PostAccount> c = budget->accountFor(8, note("c"));
+};
+
+TEST_F(Senders, PauseWhileTooMuchWaitsForAServerThatAnswers) {
+  addFrom(a, 4);
+  EXPECT_EQ(changes(), "");
+  addFrom(a, 1);
+  EXPECT_EQ(changes(), "-a");
+  EXPECT_EQ(takeReady(), "11");
+  answerFirst();
+  EXPECT_EQ(changes(), "") << "not at each answer";
+  answerFirst();
+  answerAll();
+  EXPECT_EQ(changes(), "+a");
+  addFrom(a, 4);
+  addFrom(b, 4);
+  EXPECT_EQ(changes(), "-a-b") << "all of the user's share a limit";
+  addFrom(c, 4);
+  EXPECT_EQ(changes(), "") << "another user has their own";
+  answerAll();
+  EXPECT_EQ(changes(), "+a+b");
+}
+
+TEST_F(Senders, DoNotWaitForAnOutage) {
+  addFrom(a, 5);
+  EXPECT_EQ(changes(), "-a");
+  EXPECT_EQ(takeReady(), "11");
+  failFirst();
+  EXPECT_EQ(changes(), "+a");
+  addFrom(a, 9);
+  EXPECT_EQ(changes(), "");
+  answerFirst();
+  addFrom(a, 5);
+  EXPECT_EQ(changes(), "-a") << "the server answers again";
+}
+
+TEST_F(Senders, DoNotWaitForASilentServer) {
+  addFrom(a, 5);
+  EXPECT_EQ(takeReady(), "11");
+  schedule.advance(now + 9999ms);
+  EXPECT_EQ(changes(), "-a");
+  EXPECT_EQ(schedule.nextAdvance(), now + 10s);
+  schedule.advance(now + 10s);
+  EXPECT_EQ(changes(), "+a");
+}
+
 /// Notes what it is given.
 class NotingKeeper final : public PostKeeper {
  public:
@@ -191,6 +262,8 @@ class NotingKeeper final : public PostKeeper {
     kept += "#" + std::to_string(ticket) + "(" + std::to_string(delay.count()) + ")";
   }
   void discard(Ticket ticket) override { kept += "-#" + std::to_string(ticket); }
+  Ticket writtenUpTo() const override { return 0; }
+  void waitUntilWritten(Ticket) override {}
   void hostAnswered(std::string_view) override {}
 
   std::string kept;

@@ -59,10 +59,10 @@ TEST_F(SessionLog, OfASession) {
   session.states(userInfo("MyApp"));
   session->sendMessageWithSessionInfo(info, userInfo("MyApp"), 1, 2, {}, {});
   session->sendMessageWithSessionInfo({}, {}, 1, 2, {}, {});
-  createBackends({}, info, {}, "", "7.0", 0, harness.services);
-  createBackends(info, {}, {}, "", "7.0", 0, harness.services);
-  sendMessageWithSessionInfo(harness.sessionServices, 0, {}, {}, info, 1, 2, {});
-  sendMessageWithSessionInfo(harness.sessionServices, 0, Dictionary(), {}, {}, 1, 2, {});
+  createBackends({}, info, {}, "", "7.0", {}, harness.services);
+  createBackends(info, {}, {}, "", "7.0", {}, harness.services);
+  sendMessageWithSessionInfo(harness.sessionServices, {}, {}, {}, info, 1, 2, {});
+  sendMessageWithSessionInfo(harness.sessionServices, {}, Dictionary(), {}, {}, 1, 2, {});
   session.connection->onCall = [](const IPCOutgoingCall&) { throw std::runtime_error("no memory"); };
   harness.agent->sessionInvalidated(std::exchange(session.session, nullptr));
   EXPECT_EQ(transcript(), R"(7 initWithSessionDelegate: ReportingdSession initWithSessionDelegate:AGENT

@@ -41,7 +41,7 @@ bool DashboardBackend::uploadLogData(const List& logData) {
     VESK_LOG_ERROR("DashboardBackend(uploadLogData): Failed to serialize log data array for upload");
     return false;
   }
-  const auto pass = _services.uploads->enterWithLogData(_identity._user, archive->size());
+  const auto pass = _services.uploads->enterWithLogData(_identity._client.user, archive->size());
   if (!pass) {
     VESK_LOG_ERROR("DashboardBackend(uploadLogData): Error uploading log data array (%s)",
                    "too many uploads are under way");

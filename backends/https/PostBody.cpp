@@ -94,12 +94,13 @@ PostHeaders postHeaders(const BackendIdentity& identity, const std::optional<Dic
   return headers;
 }
 
-HTTPRequest postRequest(std::string url, PostHeaders headers, std::string json, uid_t user) {
+HTTPRequest postRequest(std::string url, PostHeaders headers, std::string json, const BackendClient& client) {
   HTTPRequest request;
   request.method = "POST";
   request.url = std::move(url);
   request.retry = HTTPRequest::Retry::UntilSent;
-  request.owner = user;
+  request.owner = client.user;
+  request.account = client.posts;
   request.headers = std::move(headers);
   auto compressed = gzipDeflate(json);
   const bool sendCompressed = compressed && compressed->size() < json.size();

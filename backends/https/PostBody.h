@@ -32,6 +32,6 @@ PostHeaders postHeaders(const BackendIdentity& identity, const std::optional<Dic
                         std::optional<std::uint16_t> method, std::optional<std::uint16_t> responseCode);
 
 /// Compresses the body if that makes it shorter. Posts waiting to be sent are charged to `user`.
-HTTPRequest postRequest(std::string url, PostHeaders headers, std::string json, uid_t user);
+HTTPRequest postRequest(std::string url, PostHeaders headers, std::string json, const BackendClient& client);
 
 }  // namespace vesk

@@ -46,16 +46,28 @@ HTTPClient::Worker* HTTPClient::startedWorker() {
 void HTTPClient::start(HTTPRequest request, Completion completion) {
   removeUnsafeHeaders(request);
   HTTPError problem = stopped();
+  PostKeeper::Ticket ticket = 0;
+  if (_options.keepsFirst && _options.keeper && request.retry == HTTPRequest::Retry::UntilSent) {
+    ticket = _options.keeper->keepCopy(request);
+    if (request.account) request.account->noteKept(ticket);
+  }
   try {
     Worker* started = startedWorker();
-    if (started && started->start(request, completion)) return;
+    if (started && started->start(request, completion, ticket)) return;
   } catch (const std::exception& error) {
     problem = {HTTPError::Kind::Other, error.what()};
   }
-  if (_options.keeper && request.retry == HTTPRequest::Retry::UntilSent) {
+  if (ticket != 0) {
+    _options.keeper->sendLater(ticket, std::chrono::seconds(0));
+    problem.deferred = true;
+  } else if (_options.keeper && request.retry == HTTPRequest::Retry::UntilSent) {
     problem.deferred = _options.keeper->keep(std::move(request), std::chrono::seconds(0));
   }
   runCompletion(completion, {std::nullopt, std::move(problem)});
+}
+
+void HTTPClient::keptPostsWereWritten() {
+  if (Worker* started = worker()) started->wake();
 }
 
 HTTPResult HTTPClient::perform(HTTPRequest request) {

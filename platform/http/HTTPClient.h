@@ -13,6 +13,7 @@
 #include <utility>
 #include <vector>
 
+#include "platform/http/PostBudget.h"
 #include "platform/http/PostKeeper.h"
 #include "platform/sync/Mutex.h"
 
@@ -41,6 +42,8 @@ struct HTTPRequest {
   Retry retry = Retry::Never;
   /// The user that the post belongs to, or kNobody. Owners take turns and share the memory for waiting posts.
   std::uint32_t owner = kNobody;
+  /// The sender's account, charged for a post that waits for a server that answers. Null: nothing is charged.
+  std::shared_ptr<PostAccount> account{};
   /// Sent over at most two connections to the host, and only when no other request to it waits.
   bool isBackground = false;
 
@@ -107,6 +110,8 @@ class HTTPClient {
     std::size_t maximumMemory = std::size_t{64} << 20;  ///< limit in bytes for all waiting posts
     /// Takes the posts that would otherwise be lost, also when the client ends. Null: they fail.
     PostKeeper* keeper = nullptr;
+    /// Sends a post only after the keeper has written a copy of it.
+    bool keepsFirst = false;
     /// From the first attempt of a post, or from its start for one that waits behind others.
     std::chrono::milliseconds retryFor{60'000};
     std::chrono::milliseconds firstRetryAfter{200};  ///< doubles each time, up to 10 s, with ±50 % jitter
@@ -133,6 +138,9 @@ class HTTPClient {
   /// Doesn't block. An owner's posts to one host are sent in the order of the calls as far as connections
   /// allow. If the thread can't be started or memory runs out, the completion runs within this call.
   void start(HTTPRequest request, Completion completion);
+
+  /// For the keeper: copies of posts were written, so these posts may be sent. Doesn't block.
+  void keptPostsWereWritten();
 
   /// Starts the request and blocks until it is completed. Must not be called from a completion.
   HTTPResult perform(HTTPRequest request);

@@ -55,18 +55,23 @@ bool HTTPOutstanding::waitUntilNone(std::chrono::milliseconds timeout) {
 }
 
 HTTPExchange::HTTPExchange(HTTPRequest&& wanted, HTTPClient::Completion&& completion, Instant now,
-                           HTTPOutstanding& outstanding)
+                           HTTPOutstanding& outstanding, PostKeeper::Ticket copy)
     : request(std::move(wanted)),
       started(now),
+      hasCopy(copy != 0),
+      ticket(copy),
       _cost(costOf(request)),
       _user(LogUser::current()),
+      _isCharged(isPost() && request.account),
       _completion(std::move(completion)),
       _outstanding(outstanding) {
   _outstanding.add();
+  if (_isCharged) request.account->add(_cost);
 }
 
 HTTPExchange::~HTTPExchange() {
   if (_completion) fail({HTTPError::Kind::Other, "the client could not take the request"});
+  discharge();
   _outstanding.remove();
 }
 
@@ -76,11 +81,16 @@ std::string_view hostOfURL(std::string_view url) {
   return url.substr(0, url.find_first_of("/?#", scheme + 3));
 }
 
+void HTTPExchange::discharge() {
+  if (std::exchange(_isCharged, false)) request.account->remove(_cost);
+}
+
 void HTTPExchange::giveUp(HTTPError error, PostKeeper* keeper, std::chrono::seconds delay) {
   if (keeper && ticket != 0) {
     keeper->sendLater(std::exchange(ticket, 0), delay);
     error.deferred = true;
   } else if (keeper && isPost()) {
+    discharge();
     error.deferred = keeper->keep(std::move(request), delay);
   }
   fail(std::move(error));

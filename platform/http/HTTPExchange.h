@@ -44,8 +44,9 @@ class HTTPExchange {
   using Instant = std::chrono::steady_clock::time_point;
 
   /// Counted by `outstanding`, which must outlive it, until the completion's captures are destroyed.
+  /// `copy`: the keeper's ticket of a copy that must be written before the post is sent, or 0.
   HTTPExchange(HTTPRequest&& wanted, HTTPClient::Completion&& completion, Instant now,
-               HTTPOutstanding& outstanding);
+               HTTPOutstanding& outstanding, PostKeeper::Ticket copy = 0);
   ~HTTPExchange();
   HTTPExchange(const HTTPExchange&) = delete;
   HTTPExchange& operator=(const HTTPExchange&) = delete;
@@ -59,6 +60,9 @@ class HTTPExchange {
   /// Approximate memory that it uses while it waits.
   std::size_t cost() const { return _cost; }
 
+  /// Takes the post off its sender's account, since it waits for a server that does not answer.
+  void discharge();
+
   void complete(HTTPResult result);
   void fail(HTTPError error) { complete(HTTPResult{std::nullopt, std::move(error)}); }
   /// Fails it. A post goes to `keeper` first, if there is one, to be sent after `delay` at the earliest.
@@ -68,12 +72,13 @@ class HTTPExchange {
   const Instant started;
   Instant firstAttempt{};  ///< valid if `attempts` is not 0
   unsigned attempts = 0;
-  bool hasCopy = false;           ///< the keeper was given a copy, which it may have refused
-  PostKeeper::Ticket ticket = 0;  ///< of the copy that the keeper holds; 0 if there is none
+  bool hasCopy;                   ///< the keeper was given a copy, which it may have refused
+  PostKeeper::Ticket ticket;      ///< of the copy that the keeper holds; 0 if there is none
 
  private:
   const std::size_t _cost;
   const std::uint32_t _user;  // the user it was made for
+  bool _isCharged;
   HTTPClient::Completion _completion;
   HTTPOutstanding& _outstanding;
 };

@@ -9,6 +9,8 @@ namespace vesk {
 
 namespace {
 constexpr std::chrono::seconds kLongestWait{10};
+// A host that did not answer for this long is silent. Senders don't wait for it.
+constexpr std::chrono::seconds kSilentAfter{10};
 constexpr std::size_t kBackgroundConnections = 2;
 constexpr char kTooMany[] = "too many posts wait to be sent";
 }  // namespace
@@ -39,6 +41,7 @@ void HTTPSchedule::add(Exchange exchange) {
   } else if (!makeRoom(memory, host, lane, exchange->cost(), _maximumMemory)) {
     giveUp(std::move(exchange), {HTTPError::Kind::Other, kTooMany});
   } else {
+    if (host.isSilent) exchange->discharge();
     lane.bodies += exchange->bodySize();
     lane.cost += exchange->cost();
     lane.posts.push_back(std::move(exchange));
@@ -59,6 +62,7 @@ void HTTPSchedule::advance(Instant now) {
         return true;
       });
     }
+    dischargeIfSilent(host, now);
     if (_keeper) giveUpLate(host, now);
   }
   std::erase_if(_hosts, isUnused);
@@ -87,6 +91,7 @@ void HTTPSchedule::answered(const HTTPExchange& exchange, Instant now) {
   Host& host = hostOf(exchange);
   release(host, exchange);
   host.lastAnswer = now;
+  host.isSilent = false;
   if (!host.outage) return;
   VESK_LOG_INFO("HTTPClient: %.*s answers again", static_cast<int>(exchange.host().size()),
                 exchange.host().data());
@@ -99,6 +104,8 @@ void HTTPSchedule::failed(Exchange exchange, Failure failure, Instant now) {
   release(host, *exchange);
   if (exchange->isPost() && failure.error.kind != HTTPError::Kind::BadURL) {
     noteOutage(host, *exchange, failure.error);
+    exchange->discharge();
+    dischargeIfSilent(host, now);
     // A few attempts fill the slots of a host that swallows connections; posts behind them would wait for
     // ever.
     if (exchange->firstAttempt + _policy.retryFor <= now) giveUpLate(host, now);
@@ -145,6 +152,7 @@ std::optional<HTTPSchedule::Instant> HTTPSchedule::nextAdvance() const {
   for (const auto& [name, host] : _hosts) {
     for (const auto& request : host.requests) consider(request->deadline());
     for (const auto& request : host.background) consider(request->deadline());
+    if (host.queuedPosts > 0 && !host.isSilent) consider(host.lastAnswer + kSilentAfter);
     if (!_keeper) continue;
     for (const auto& [owner, lane] : host.lanes) {
       if (!lane.posts.empty()) consider(endOfWait(host, *lane.posts.front()));
@@ -261,6 +269,14 @@ std::optional<HTTPSchedule::Instant> HTTPSchedule::endOfWait(const Host& host,
                                                              const HTTPExchange& post) const {
   if (!host.outage && host.activePosts < _maximumActivePosts) return std::nullopt;
   return (host.outage ? post.started : std::max(post.started, host.lastAnswer)) + _policy.retryFor;
+}
+
+void HTTPSchedule::dischargeIfSilent(Host& host, Instant now) {
+  if (host.isSilent || (!host.outage && host.lastAnswer + kSilentAfter > now)) return;
+  host.isSilent = true;
+  for (auto& [owner, lane] : host.lanes) {
+    for (auto& post : lane.posts) post->discharge();
+  }
 }
 
 void HTTPSchedule::giveUpLate(Host& host, Instant now) {

@@ -79,6 +79,7 @@ class HTTPSchedule {
     std::size_t activeBackground = 0;
     std::optional<HTTPError> outage;  ///< the last attempt's error, until an answer arrives
     Instant lastAnswer;               ///< or when the host got its first request
+    bool isSilent = false;            ///< its posts are not charged to their senders
   };
   using Hosts = std::map<std::string, Host, std::less<>>;
   using Retries = std::multimap<Instant, Exchange>;
@@ -109,6 +110,8 @@ class HTTPSchedule {
   /// The time at which a queued post has waited too long for a host that doesn't answer; nullopt if it may
   /// wait.
   std::optional<Instant> endOfWait(const Host& host, const HTTPExchange& post) const;
+  /// Takes the host's waiting posts off their senders' accounts if it does not answer.
+  static void dischargeIfSilent(Host& host, Instant now);
   /// Gives up the queued posts that waited too long for the host.
   void giveUpLate(Host& host, Instant now);
 

@@ -64,7 +64,8 @@ void HTTPClient::Worker::stop() {
 
 void HTTPClient::Worker::wake() noexcept { curl_multi_wakeup(_multi.get()); }
 
-bool HTTPClient::Worker::start(HTTPRequest& request, Completion& completion) {
+bool HTTPClient::Worker::start(HTTPRequest& request, Completion& completion,
+                               PostKeeper::Ticket copy) {
   bool mustWake;
   {
     MutexLock lock(_mutex);
@@ -72,7 +73,7 @@ bool HTTPClient::Worker::start(HTTPRequest& request, Completion& completion) {
     // If the inbox is not empty, the thread has already been woken.
     mustWake = _inbox.empty();
     _inbox.push_back(std::make_unique<HTTPExchange>(std::move(request), std::move(completion),
-                                                    std::chrono::steady_clock::now(), _outstanding));
+                                                    std::chrono::steady_clock::now(), _outstanding, copy));
   }
   if (mustWake) wake();
   return true;
@@ -108,8 +109,22 @@ bool HTTPClient::Worker::takeInbox() {
     if (_stopping) return false;
     arrived.swap(_inbox);
   }
-  for (auto& exchange : arrived) _schedule.add(std::move(exchange));
+  for (auto& exchange : arrived) {
+    if (exchange->ticket != 0) {
+      _unwritten.push_back(std::move(exchange));
+    } else {
+      _schedule.add(std::move(exchange));
+    }
+  }
+  if (!_unwritten.empty()) takeWritten();
   return true;
+}
+
+void HTTPClient::Worker::takeWritten() {
+  const auto written = _options.keeper->writtenUpTo();
+  for (; !_unwritten.empty() && _unwritten.front()->ticket <= written; _unwritten.pop_front()) {
+    _schedule.add(std::move(_unwritten.front()));
+  }
 }
 
 void HTTPClient::Worker::stopAllButPosts() {
@@ -188,6 +203,7 @@ void HTTPClient::Worker::keepCopies(HTTPSchedule::Instant now) {
     const auto due = copyDue(*transfer);
     if (!due || *due > now) continue;
     HTTPExchange& post = *transfer->exchange();
+    post.discharge();
     post.hasCopy = true;
     post.ticket = _options.keeper->keepCopy(post.request);
   }
@@ -220,6 +236,8 @@ void HTTPClient::Worker::giveUpAll() {
     if (transfer->isBusy()) interrupt(*transfer)->giveUp(stopped(), _options.keeper, kWaitAfterWholeBody);
   }
   _schedule.stopAll();
+  for (auto& exchange : _unwritten) exchange->giveUp(stopped(), _options.keeper);
+  _unwritten.clear();
   std::vector<Exchange> arrived;
   {
     MutexLock lock(_mutex);

@@ -4,6 +4,7 @@
 #include <curl/curl.h>
 
 #include <atomic>
+#include <deque>
 #include <memory>
 #include <optional>
 #include <string>
@@ -27,8 +28,9 @@ class HTTPClient::Worker {
   Worker(const Worker&) = delete;
   Worker& operator=(const Worker&) = delete;
 
-  /// Takes ownership of both. Returns false, and leaves both with the caller, after `stop`.
-  [[nodiscard]] bool start(HTTPRequest& request, Completion& completion);
+  /// Takes ownership of both. Returns false, and leaves both with the caller, after `stop`. `copy`: of a post
+  /// that is sent once the keeper has written this copy of it, or 0.
+  [[nodiscard]] bool start(HTTPRequest& request, Completion& completion, PostKeeper::Ticket copy);
   /// Gives up all requests and ends the thread. May be called more than once.
   void stop();
   void wake() noexcept;
@@ -46,6 +48,7 @@ class HTTPClient::Worker {
   void giveUpAll();
 
   bool takeInbox();
+  void takeWritten();
   void stopAllButPosts();
   void startReady();
   void begin(Exchange exchange);
@@ -70,6 +73,7 @@ class HTTPClient::Worker {
   HTTPOutstanding _outstanding;  // declared before everything that holds exchanges
 
   // Only used by the client's thread.
+  std::deque<Exchange> _unwritten;  ///< posts whose copies the keeper has not written yet
   HTTPSchedule _schedule;
   std::vector<std::unique_ptr<HTTPTransfer>> _transfers;
   std::vector<HTTPTransfer*> _idle;  ///< those of `_transfers` without an exchange

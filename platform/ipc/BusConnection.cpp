@@ -56,6 +56,11 @@ void BusConnection::resume(IPCHandlers handlers) {
   }
 }
 
+void BusConnection::setPaused(bool isPaused) {
+  _paused.store(isPaused);
+  if (!isPaused) _wakeup->signal();
+}
+
 void BusConnection::invalidate() {
   _invalidated.store(true);
   _wakeup->signal();
@@ -118,14 +123,16 @@ void BusConnection::sendOutgoing() {
     _channel.output() += call;
     _channel.queued();
   }
+  if (_handlers.beforeSending && isBackedUp()) callHandler(_handlers.beforeSending);
   // Calls that the client sent before it disconnected are still served, so this doesn't end the connection.
   if (!_channel.flush()) _peerGone = true;
   if (_peerGone) _channel.dropOutput();
 }
 
 void BusConnection::wait(Time deadline) {
-  if (_hasMore && !isBackedUp()) return;
-  pollfd polls[] = {{_socket.get(), static_cast<short>(!isBackedUp() ? POLLIN : POLLOUT), 0},
+  if (_hasMore && !mustWait()) return;
+  const short wanted = isBackedUp() ? POLLOUT : mustWait() ? 0 : POLLIN;
+  pollfd polls[] = {{_socket.get(), wanted, 0},
                     {_wakeup->fd(), POLLIN, 0}};
   if (::poll(polls, 2, _isReady ? -1 : untilDeadline(deadline)) <= 0) return;
   if (polls[0].revents & (POLLHUP | POLLERR)) {
@@ -142,7 +149,7 @@ BusConnection::End BusConnection::closeFor(const char* complaint) {
 
 /// Performs one step: reads what has arrived and serves it.
 std::optional<BusConnection::End> BusConnection::advance() {
-  if (isBackedUp()) return std::nullopt;
+  if (mustWait()) return std::nullopt;
   if (!_hasMore) {
     switch (_channel.receive()) {
       case Channel::Input::Nothing:
@@ -193,11 +200,12 @@ std::optional<BusConnection::End> BusConnection::serveMessages() {
         if (message.hasDescriptors()) return closeFor("descriptors that no call takes");
         break;
     }
-    if (_channel.unsentBytes() > kMaximumUnsent) {
-      sendOutgoing();
-      // The rest is served once the client has read; until then nothing more is read from it either.
+    const bool mustSend = _channel.unsentBytes() > kMaximumUnsent;
+    if (mustSend) sendOutgoing();
+    // The rest is served later, and until then nothing more is read.
+    if ((mustSend && isBackedUp()) || _paused.load()) {
       _hasMore = true;
-      if (isBackedUp()) return std::nullopt;
+      return std::nullopt;
     }
   }
 }
@@ -255,6 +263,7 @@ void BusConnection::dropHandlers() noexcept {
   // Moved out first, because destroying them may call this connection.
   auto interruption = std::exchange(_handlers.interruption, nullptr);
   auto invalidation = std::exchange(_handlers.invalidation, nullptr);
+  auto beforeSending = std::exchange(_handlers.beforeSending, nullptr);
   auto object = _router.takeExportedObject();
 }
 

@@ -51,6 +51,7 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   std::string description() const override { return _name; }
   IPCPeer peer() const override { return _peer; }
   void resume(IPCHandlers handlers) override;
+  void setPaused(bool isPaused) override;
   void invalidate() override;
   void callRemoteObject(IPCOutgoingCall call,
                         const std::function<void(const std::string& error)>& errorHandler) override;
@@ -76,6 +77,10 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   End drain();
   void flush();
   bool isBackedUp() const noexcept { return _channel.unsentBytes() > 0; }
+  /// Whether no calls may be served now.
+  bool mustWait() const noexcept {
+    return isBackedUp() || (_paused.load() && !_peerGone && !_invalidated.load());
+  }
 
   void finish(End how) noexcept;
   void callHandler(const std::function<void()>& handler) noexcept;
@@ -92,6 +97,7 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
 
   // Thread-safe by themselves.
   std::atomic<bool> _started{false};
+  std::atomic<bool> _paused{false};
   std::atomic<bool> _invalidated{false};
   std::atomic<bool> _counted{true};
 

@@ -61,11 +61,14 @@ struct IPCEncodedCall {
   IPCDescriptor descriptor{};  ///< sent with the call
 };
 
-/// The handlers of a connection; each may be empty. All run on the connection's thread, each at most once.
+/// The handlers of a connection; each may be empty. All run on the connection's thread, and each but
+/// `beforeSending` at most once.
 /// They are destroyed after the invalidation handler has run, which breaks reference cycles with the
 /// connection.
 struct IPCHandlers {
   std::shared_ptr<IPCExportedObject> object{};
+  /// Runs before answers and calls are sent, while there are any. May wait for what they confirm.
+  std::function<void()> beforeSending{};
   std::function<void()> interruption{};
   std::function<void()> invalidation{};
   /// Called with the number of calls that `callRemoteObject` accepted but that were never sent, if any, after
@@ -84,6 +87,10 @@ class IPCConnection {
 
   /// Starts serving calls, on the connection's own thread.
   virtual void resume(IPCHandlers handlers) = 0;
+
+  /// While paused, no further calls are read from the client, which then has to wait or keep them in a queue.
+  /// Answers and calls are still sent, and a hang-up is still noticed. Thread-safe; doesn't block.
+  virtual void setPaused(bool isPaused) = 0;
 
   /// Asks the connection to end. Thread-safe; may be called repeatedly. The invalidation handler runs on the
   /// connection's thread soon after.

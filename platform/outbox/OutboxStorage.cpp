@@ -154,8 +154,13 @@ void OutboxStorage::onEach(Lost& lost, Action action) {
   if (_memory) action(*_memory);
 }
 
-bool OutboxStorage::isEmpty() const {
-  return (!_file || _file->countByHost().empty()) && (!_memory || _memory->countByHost().empty());
+std::uint64_t OutboxStorage::count() const {
+  std::uint64_t count = 0;
+  for (const auto* store : {_file.get(), _memory.get()}) {
+    if (!store) continue;
+    for (const auto& [host, posts] : store->countByHost()) count += posts;
+  }
+  return count;
 }
 
 bool OutboxStorage::has(std::string_view host) const {

@@ -57,7 +57,8 @@ class OutboxStorage {
   /// The posts that end with the process.
   Losses waitingInMemory() const;
 
-  bool isEmpty() const;
+  bool isEmpty() const { return count() == 0; }
+  std::uint64_t count() const;
   bool has(std::string_view host) const;
   std::set<std::string> hosts() const;
   std::int64_t lastID() const { return _file ? _file->lastID() : 0; }

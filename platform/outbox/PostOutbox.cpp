@@ -123,6 +123,12 @@ void PostOutbox::discard(Ticket ticket) {
   _wakeup.signal();
 }
 
+void PostOutbox::waitUntilWritten(Ticket ticket) {
+  if (ticket <= _writtenUpTo) return;
+  MutexLock lock(_mutex);
+  while (ticket > _writtenUpTo) _written.wait(_mutex);
+}
+
 void PostOutbox::hostAnswered(std::string_view host) {
   if (!_isWaiting) return;
   {
@@ -166,13 +172,16 @@ void PostOutbox::run() {
   for (bool stopping = false; !stopping;) {
     waitForWork(network);
     Inbox inbox;
+    Ticket taken = 0;
     {
       MutexLock lock(_mutex);
       std::swap(inbox, _inbox);
+      taken = static_cast<Ticket>(_lastID);
       stopping = _isStopped;
     }
     take(std::move(inbox));
     if (stopping || (_writeBy && *_writeBy <= std::chrono::steady_clock::now())) write();
+    if (_changes.added.empty()) tellWritten(taken);
     if (stopping) break;
     expire();
     sendReady();
@@ -185,6 +194,17 @@ void PostOutbox::run() {
     wasWaiting = isWaiting;
   }
   report(Outcome::NotWritten, _storage.waitingInMemory());
+}
+
+void PostOutbox::tellWritten(Ticket upTo) {
+  if (upTo == _writtenUpTo) return;
+  {
+    MutexLock lock(_mutex);
+    _writtenUpTo = upTo;
+  }
+  _written.notify_all();
+  MutexLock lock(_clientMutex);
+  if (_client) _client->keptPostsWereWritten();
 }
 
 void PostOutbox::waitForWork(NetworkMonitor& network) {
@@ -208,7 +228,7 @@ std::optional<PostOutbox::Instant> PostOutbox::nextEvent() const {
   if (!_storage.isEmpty()) consider(_nextExpiry);
   for (const auto& [name, host] : _hosts) {
     // Otherwise the answers wake the thread.
-    if (host.sending == 0)
+    if (_mustSend && host.sending == 0)
       consider(std::max(host.backoff.next(), host.ready.empty() ? host.readAgain : Instant{}));
   }
   return next;
@@ -272,8 +292,9 @@ void PostOutbox::write() {
   _writeBy.reset();
   OutboxStorage::Lost lost;
   // A post that was answered before its copy was written.
+  std::sort(_changes.removed.begin(), _changes.removed.end());
   std::erase_if(_changes.added, [this](const WaitingPost& post) {
-    return std::find(_changes.removed.begin(), _changes.removed.end(), post.id) != _changes.removed.end();
+    return std::binary_search(_changes.removed.begin(), _changes.removed.end(), post.id);
   });
   const auto removed = _changes.removed;
   const std::size_t added = _changes.added.size();
@@ -318,10 +339,17 @@ void PostOutbox::readAgainFromTheOldest(Host& host) {
 
 // --- Sending
 
+// False if all that is kept are copies of posts that the client sends itself.
+bool PostOutbox::hasPostsToSend() {
+  MutexLock lock(_mutex);
+  return _storage.count() + _changes.added.size() > _beingSent.size() + _changes.removed.size();
+}
+
 void PostOutbox::sendReady() {
+  _mustSend = hasPostsToSend();
   for (auto each = _hosts.begin(); each != _hosts.end();) {
     auto& [name, host] = *each;
-    sendReady(name, host);
+    if (_mustSend) sendReady(name, host);
     const bool isDone =
         host.sending == 0 && host.ready.empty() && _changes.added.empty() && !_storage.has(name);
     each = isDone ? _hosts.erase(each) : std::next(each);

@@ -3,6 +3,7 @@
 
 #include <atomic>
 #include <chrono>
+#include <condition_variable>
 #include <cstddef>
 #include <cstdint>
 #include <deque>
@@ -87,6 +88,8 @@ class PostOutbox final : public PostKeeper {
   Ticket keepCopy(const HTTPRequest& post) override;
   void sendLater(Ticket ticket, std::chrono::seconds delay) override;
   void discard(Ticket ticket) override;
+  Ticket writtenUpTo() const override { return _writtenUpTo; }
+  void waitUntilWritten(Ticket ticket) override;
   void hostAnswered(std::string_view host) override;
 
  private:
@@ -123,11 +126,13 @@ class PostOutbox final : public PostKeeper {
   void run();
   void waitForWork(NetworkMonitor& network);
   std::optional<Instant> nextEvent() const;
+  void tellWritten(Ticket upTo);
   void take(Inbox inbox);
   void take(const Answer& answer);
   void write();
   void expire();
   void deletePostsThatRespectConsent();
+  bool hasPostsToSend();
   void sendReady();
   void sendReady(const std::string& name, Host& host);
   void readMore(const std::string& name, Host& host);
@@ -153,6 +158,8 @@ class PostOutbox final : public PostKeeper {
   std::thread _thread VESK_GUARDED_BY(_mutex);  ///< started when the first post is kept
 
   std::atomic<bool> _isWaiting{false};  ///< a post is kept
+  std::atomic<Ticket> _writtenUpTo{0};
+  std::condition_variable_any _written;  ///< `_writtenUpTo` grew; used with _mutex
 
   // Used by the outbox's thread only, and before it is started.
   OutboxStorage _storage;
@@ -160,6 +167,7 @@ class PostOutbox final : public PostKeeper {
   std::optional<Instant> _writeBy;  ///< if there are changes
   std::set<std::int64_t> _taken;    ///< read from the storage, not removed from it yet
   std::map<std::string, Host, std::less<>> _hosts;
+  bool _mustSend = true;  ///< not all that is kept are copies of posts that the client sends
   Instant _nextExpiry{};
   std::minstd_rand _random;
 };

@@ -17,6 +17,7 @@ class RecordingConnection final : public IPCConnection {
     lose = std::exchange(handlers.loss, nullptr);
     _handlers = std::move(handlers);
   }
+  void setPaused(bool) override {}
   void invalidate() override {
     if (auto handler = std::exchange(_handlers.invalidation, nullptr)) handler();
     _handlers = {};
