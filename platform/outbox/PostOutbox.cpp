@@ -114,11 +114,9 @@ void PostOutbox::sendLater(Ticket ticket, std::chrono::seconds delay) {
 }
 
 void PostOutbox::discard(Ticket ticket) {
-  const auto id = static_cast<std::int64_t>(ticket);
   {
     MutexLock lock(_mutex);
-    _beingSent.erase(id);
-    _inbox.changes.removed.push_back(id);
+    _inbox.changes.removed.push_back(static_cast<std::int64_t>(ticket));
   }
   _wakeup.signal();
 }
@@ -300,7 +298,11 @@ void PostOutbox::write() {
   const std::size_t added = _changes.added.size();
   _storage.write(_changes, std::chrono::steady_clock::now(), lost);
   if (_changes.removed.empty()) {
-    for (std::int64_t id : removed) _taken.erase(id);
+    MutexLock lock(_mutex);
+    for (std::int64_t id : removed) {
+      _taken.erase(id);
+      _beingSent.erase(id);
+    }
   } else {
     _writeBy = std::chrono::steady_clock::now() + std::chrono::seconds(60);  // the file can't be written now
   }
@@ -342,7 +344,7 @@ void PostOutbox::readAgainFromTheOldest(Host& host) {
 // False if all that is kept are copies of posts that the client sends itself.
 bool PostOutbox::hasPostsToSend() {
   MutexLock lock(_mutex);
-  return _storage.count() + _changes.added.size() > _beingSent.size() + _changes.removed.size();
+  return _storage.count() + _changes.added.size() > _beingSent.size();
 }
 
 void PostOutbox::sendReady() {
