@@ -39,7 +39,7 @@ struct BackendIdentity {
   bool _batchEvents = false;
   std::uint8_t _selfVersionMajor = 0;  ///< of the client library
   std::uint8_t _selfVersionMinor = 0;
-  double _startTimeStamp = 0;         ///< seconds since 1970
+  double _startTimeStamp = 0;  ///< seconds since 1970
   BackendClient _client{};
   HeldBytes _heldBytes = std::make_shared<HeldAccount>(HeldBudget::Limits().ofSession);
 

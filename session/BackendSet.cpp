@@ -13,7 +13,8 @@ namespace vesk {
 namespace {
 
 BackendIdentity identityFrom(const Dictionary& sessionInfo, std::string_view deviceID,
-                             const std::string& libraryVersion, const BackendClient& client, const BackendServices& services) {
+                             const std::string& libraryVersion, const BackendClient& client,
+                             const BackendServices& services) {
   const auto number = [&](std::string_view key) { return integerForKey(sessionInfo, key).value_or(0); };
   const auto flag = [&](std::string_view key) { return booleanForKey(sessionInfo, key).value_or(false); };
   BackendIdentity identity{

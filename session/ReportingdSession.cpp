@@ -243,8 +243,8 @@ void ReportingdSession::sendMessageWithSessionInfo(const Dictionary& sessionInfo
     reply("storebag not available");
     return;
   }
-  vesk::sendMessageWithSessionInfo(_services, _client, sessionInfo, userInfo, storebag,
-                                   category, type, payload);
+  vesk::sendMessageWithSessionInfo(_services, _client, sessionInfo, userInfo, storebag, category, type,
+                                   payload);
   reply("finished");
 }
 

@@ -88,7 +88,7 @@ class Outbox : public testing::Test {
   ~Outbox() override { end(); }
 
   /// Starts an outbox and a client. Ends earlier ones as a daemon does.
-  void begin(PostOutbox::Options options = {}) {
+  void begin(PostOutbox::Options options = {}, bool keepsFirst = false) {
     end();
     options.path = (directory / "state/outbox.sqlite").string();
     options.clock = &clock;
@@ -104,8 +104,8 @@ class Outbox : public testing::Test {
       changed.notify_all();
     };
     outbox = std::make_unique<PostOutbox>(options);
-    client = std::make_unique<HTTPClient>(
-        HTTPClient::Options{.keeper = outbox.get(), .retryFor = 20ms, .firstRetryAfter = 5ms});
+    client = std::make_unique<HTTPClient>(HTTPClient::Options{
+        .keeper = outbox.get(), .keepsFirst = keepsFirst, .retryFor = 20ms, .firstRetryAfter = 5ms});
     outbox->start(*client);
   }
   void end() {
@@ -195,6 +195,37 @@ TEST_F(Outbox, KeepsPostsOverARestart) {
   answerFresh();
   waitFor(Outcome::Delivered, 2);
   EXPECT_EQ(server.bodies(), (Bodies{"hangs", "fresh", "early", "hangs"}));
+}
+
+TEST_F(Outbox, WritesPostsBeforeTheyAreSentIfItAlwaysKeepsThem) {
+  std::atomic<int> unwritten = 0;
+  server.answerWith([&](const HTTPReceived& request, std::size_t) {
+    if (bytesOfFiles().find(request.body) == std::string::npos) ++unwritten;
+    return HTTPAnswer::text(200, "");
+  });
+  begin({}, true);
+  auto account = std::make_shared<PostBudget>(PostBudget::Limits{}, outbox.get())->accountFor(1, [](bool) {});
+  Bodies sent;
+  for (int i = 0; i < 300; ++i) {
+    auto request = post(sent.emplace_back("body " + std::to_string(i)));
+    request.account = account;
+    client->start(std::move(request), [](const HTTPResult& result) { EXPECT_TRUE(result.response); });
+    if (i % 100 > 0) continue;
+    account->waitUntilWritten();
+    EXPECT_NE(bytesOfFiles().find(sent.back()), std::string::npos) << "before its call is answered";
+  }
+  waitUntilEmpty();
+  EXPECT_EQ(unwritten, 0);
+  auto received = server.bodies();
+  std::sort(sent.begin(), sent.end());
+  std::sort(received.begin(), received.end());
+  EXPECT_EQ(received, sent) << "each once";
+
+  server.stop();
+  EXPECT_TRUE(isPutAside(post("later")));
+  server.start();
+  answerFresh();
+  waitFor(Outcome::Delivered, 1);
 }
 
 TEST_F(Outbox, AServerErrorHoldsTheRestAndAnotherRefusalDoesNot) {

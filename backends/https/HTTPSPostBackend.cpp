@@ -291,7 +291,8 @@ void HTTPSPostBackend::postJSONMessage(Post post, std::string json, std::size_t 
     _services.counters.count(_name, DropReason::NoURL, eventCount);
     return;
   }
-  auto request = postRequest(std::move(*post.url), std::move(post.headers), std::move(json), _identity._client);
+  auto request =
+      postRequest(std::move(*post.url), std::move(post.headers), std::move(json), _identity._client);
   request.source = _name;
   request.events = static_cast<std::uint32_t>(eventCount);
   request.respectsConsent = post.respectsConsent;

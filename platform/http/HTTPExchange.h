@@ -72,8 +72,8 @@ class HTTPExchange {
   const Instant started;
   Instant firstAttempt{};  ///< valid if `attempts` is not 0
   unsigned attempts = 0;
-  bool hasCopy;                   ///< the keeper was given a copy, which it may have refused
-  PostKeeper::Ticket ticket;      ///< of the copy that the keeper holds; 0 if there is none
+  bool hasCopy;               ///< the keeper was given a copy, which it may have refused
+  PostKeeper::Ticket ticket;  ///< of the copy that the keeper holds; 0 if there is none
 
  private:
   const std::size_t _cost;

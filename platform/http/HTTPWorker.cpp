@@ -64,8 +64,7 @@ void HTTPClient::Worker::stop() {
 
 void HTTPClient::Worker::wake() noexcept { curl_multi_wakeup(_multi.get()); }
 
-bool HTTPClient::Worker::start(HTTPRequest& request, Completion& completion,
-                               PostKeeper::Ticket copy) {
+bool HTTPClient::Worker::start(HTTPRequest& request, Completion& completion, PostKeeper::Ticket copy) {
   bool mustWake;
   {
     MutexLock lock(_mutex);

@@ -21,8 +21,8 @@ class PostKeeper {
   /// Takes the post over, to send it `delay` from now at the earliest. Returns false if it is not kept.
   [[nodiscard]] virtual bool keep(HTTPRequest post, std::chrono::seconds delay) = 0;
 
-  /// Keeps a copy of a post that is going to be sent, or whose attempt goes on. The keeper doesn't send it in this process until
-  /// `sendLater`. Each ticket is ended by one call of `sendLater` or `discard`.
+  /// Keeps a copy of a post that is going to be sent, or whose attempt goes on. The keeper doesn't send it in
+  /// this process until `sendLater`. Each ticket is ended by one call of `sendLater` or `discard`.
   [[nodiscard]] virtual Ticket keepCopy(const HTTPRequest& post) = 0;
   /// The attempt failed: the keeper sends the post, `delay` from now at the earliest.
   virtual void sendLater(Ticket ticket, std::chrono::seconds delay) = 0;

@@ -151,7 +151,8 @@ class PostOutbox final : public PostKeeper {
 
   Mutex _mutex;
   Inbox _inbox VESK_GUARDED_BY(_mutex);
-  std::set<std::int64_t> _beingSent VESK_GUARDED_BY(_mutex);  ///< copies of posts that the client sends, until removed
+  std::set<std::int64_t> _beingSent
+      VESK_GUARDED_BY(_mutex);  ///< copies of posts that the client sends, until removed
   std::int64_t _lastID VESK_GUARDED_BY(_mutex) = 0;
   bool _isClosedToConsent VESK_GUARDED_BY(_mutex) = false;
   bool _isStopped VESK_GUARDED_BY(_mutex) = false;
