@@ -4,6 +4,7 @@
 #include <condition_variable>
 #include <fstream>
 #include <mutex>
+#include <sstream>
 
 #include "platform/outbox/PostOutbox.h"
 #include "platform/outbox/RetryAfter.h"
@@ -146,8 +147,9 @@ class Outbox : public testing::Test {
   std::string bytesOfFiles() {
     std::string all;
     for (const char* suffix : {"", "-wal"}) {
-      std::ifstream stream(file(suffix), std::ios::binary);
-      all.append(std::istreambuf_iterator<char>(stream), {});
+      std::ostringstream bytes;
+      bytes << std::ifstream(file(suffix), std::ios::binary).rdbuf();
+      all += bytes.str();
     }
     return all;
   }
@@ -206,11 +208,11 @@ TEST_F(Outbox, WritesPostsBeforeTheyAreSentIfItAlwaysKeepsThem) {
   begin({}, true);
   auto account = std::make_shared<PostBudget>(PostBudget::Limits{}, outbox.get())->accountFor(1, [](bool) {});
   Bodies sent;
-  for (int i = 0; i < 300; ++i) {
+  for (int i = 0; i < 100; ++i) {
     auto request = post(sent.emplace_back("body " + std::to_string(i)));
     request.account = account;
-    client->start(std::move(request), [](const HTTPResult& result) { EXPECT_TRUE(result.response); });
-    if (i % 100 > 0) continue;
+    client->start(std::move(request), [](const HTTPResult& result) { EXPECT_TRUE(result.response) << result.error->description; });
+    if (i % 30 > 0) continue;
     account->waitUntilWritten();
     EXPECT_NE(bytesOfFiles().find(sent.back()), std::string::npos) << "before its call is answered";
   }
@@ -220,12 +222,6 @@ TEST_F(Outbox, WritesPostsBeforeTheyAreSentIfItAlwaysKeepsThem) {
   std::sort(sent.begin(), sent.end());
   std::sort(received.begin(), received.end());
   EXPECT_EQ(received, sent) << "each once";
-
-  server.stop();
-  EXPECT_TRUE(isPutAside(post("later")));
-  server.start();
-  answerFresh();
-  waitFor(Outcome::Delivered, 1);
 }
 
 TEST_F(Outbox, AServerErrorHoldsTheRestAndAnotherRefusalDoesNot) {
