@@ -211,7 +211,9 @@ TEST_F(Outbox, WritesPostsBeforeTheyAreSentIfItAlwaysKeepsThem) {
   for (int i = 0; i < 100; ++i) {
     auto request = post(sent.emplace_back("body " + std::to_string(i)));
     request.account = account;
-    client->start(std::move(request), [](const HTTPResult& result) { EXPECT_TRUE(result.response) << result.error->description; });
+    client->start(std::move(request), [](const HTTPResult& result) {
+      EXPECT_TRUE(result.response) << result.error->description;
+    });
     if (i % 30 > 0) continue;
     account->waitUntilWritten();
     EXPECT_NE(bytesOfFiles().find(sent.back()), std::string::npos) << "before its call is answered";
@@ -328,6 +330,36 @@ TEST_F(Outbox, ADamagedRecordCostsOnlyItselfAndADamagedFileIsMovedAside) {
   server.start();
   answerFresh();
   waitFor(Outcome::Delivered, 3);
+}
+
+TEST_F(Outbox, ADamagedPageCostsOnlyThePostsOnIt) {
+  constexpr std::size_t kPage = 4096, kPosts = 40;
+  begin();
+  server.stop();
+  for (std::size_t i = 0; i < kPosts; ++i) {
+    EXPECT_TRUE(isPutAside(post(std::to_string(i) + std::string(700, 'x'))));
+  }
+  end();
+  const std::string whole = bytesOfFiles();
+  ASSERT_GT(whole.size(), 10 * kPage);
+  server.start();
+  std::size_t lostWhole = 0;
+  for (std::size_t page = 1; page < whole.size() / kPage; ++page) {
+    SCOPED_TRACE(page);
+    std::string bytes = whole;
+    bytes.replace(page * kPage, kPage, kPage, '\xAA');
+    std::ofstream(file(), std::ios::binary) << bytes;
+    fates.clear();
+    const std::size_t before = server.count();
+    begin();
+    answerFresh();
+    waitUntilEmpty();
+    const std::size_t late = server.count() - before - 1;
+    if (late == 0) ++lostWhole;
+    EXPECT_TRUE(late == 0 || (late >= kPosts - kPage / 700 && late <= kPosts)) << late;
+    end();
+  }
+  EXPECT_EQ(lostWhole, 1u) << "with the root of the table";
 }
 
 TEST_F(Outbox, GoesOnFromMemoryWhileTheFileCanNotBeUsed) {

@@ -183,8 +183,9 @@ void OutboxStorage::open() { _file = std::make_unique<OutboxStore>(_path); }
 
 void OutboxStorage::handle(const OutboxStoreError& error, Lost& lost) {
   if (error.isDamage()) {
-    if (_file) lost.damaged.push_back({"outbox", _file->events()});
-    moveAside(error.what());
+    const std::uint64_t before = _file ? _file->events() : 0;
+    const std::uint64_t saved = replaceDamaged(error.what());
+    if (before > saved) lost.damaged.push_back({"outbox", before - saved});
     return;
   }
   if (_file) _file->rollBack();
@@ -195,12 +196,31 @@ void OutboxStorage::handle(const OutboxStoreError& error, Lost& lost) {
                  error.isInUse() ? "another process uses the file" : error.what(), _path.c_str());
 }
 
-void OutboxStorage::moveAside(const char* problem) {
+std::uint64_t OutboxStorage::replaceDamaged(const char* problem) {
   _file.reset();
   const std::string aside = _path + ".damaged";
-  ::unlink((_path + "-wal").c_str());
-  if (std::rename(_path.c_str(), aside.c_str()) != 0) ::unlink(_path.c_str());
-  VESK_LOG_ERROR("Outbox: %s is damaged (%s); it is kept as %s", _path.c_str(), problem, aside.c_str());
+  for (const char* suffix : {"", "-wal"}) {
+    const std::string from = _path + suffix, to = aside + suffix;
+    ::unlink(to.c_str());
+    if (std::rename(from.c_str(), to.c_str()) != 0) ::unlink(from.c_str());
+  }
+  std::uint64_t posts = 0;
+  try {
+    open();
+    _file->begin();
+    OutboxStore::salvage(aside, [&](const WaitingPost& post) {
+      _file->add(post);
+      ++posts;
+    });
+    _file->commit();
+  } catch (const OutboxStoreError&) {
+    // The new file shows the same problem at its next use.
+    posts = 0;
+    if (_file) _file->rollBack();
+  }
+  VESK_LOG_ERROR("Outbox: %s is damaged (%s); %llu posts could be read, and the file is kept as %s",
+                 _path.c_str(), problem, static_cast<unsigned long long>(posts), aside.c_str());
+  return _file ? _file->events() : 0;
 }
 
 }  // namespace vesk

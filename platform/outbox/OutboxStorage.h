@@ -15,8 +15,9 @@
 namespace vesk {
 
 /// Never fails: a full disk or a file that another process uses leaves the posts in memory, and they move to
-/// the file when it can be used again. A damaged file is moved to "….damaged", replacing an earlier one, and
-/// started anew. Each problem is logged once. For use by one thread at a time; waits for the disk.
+/// the file when it can be used again. A damaged file is moved to "….damaged", replacing an earlier one; the
+/// posts that can still be read move to a new file. Each problem is logged once. For use by one thread at a
+/// time; waits for the disk.
 class OutboxStorage {
  public:
   using Instant = std::chrono::steady_clock::time_point;
@@ -74,7 +75,8 @@ class OutboxStorage {
   void onEach(Lost& lost, Action action);
   void open();
   void handle(const OutboxStoreError& error, Lost& lost);
-  void moveAside(const char* problem);
+  /// Returns the number of events that could be read.
+  std::uint64_t replaceDamaged(const char* problem);
 
   const std::string _path;
   const Limits _limits;

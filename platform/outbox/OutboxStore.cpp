@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <filesystem>
 #include <optional>
+#include <set>
 #include <system_error>
 
 #include "platform/files/FileDescriptor.h"
@@ -43,8 +44,10 @@ constexpr char kInsert[] =
     " url, headers, body) VALUES(?1, ?2, ?3, ?4, ?5, ?6, ?7, ?8, ?9, ?10, ?11, ?12, ?13)";
 
 // A post that must wait for longer than any wait lasts was dated while the clock was wrong.
+#define VESK_POST_COLUMNS \
+  "id, owner, source, events, respects_consent, kept, not_before, checksum, url, headers, body"
 constexpr char kSelect[] =
-    "SELECT id, owner, source, events, respects_consent, kept, not_before, checksum, url, headers, body"
+    "SELECT " VESK_POST_COLUMNS
     " FROM posts WHERE host = ?1 AND id > ?2 AND (not_before <= ?3 OR not_before > ?3 + 60000000)"
     " ORDER BY id LIMIT ?4";
 
@@ -107,6 +110,26 @@ std::optional<WaitingPost> postAt(sqlite3_stmt* row) {
   return post;
 }
 
+/// The posts' numbers, from the table and its indexes, each read from both ends up to the first damaged page.
+std::set<std::int64_t> findIDs(sqlite3* database) {
+  std::set<std::int64_t> ids;
+  for (const char* scan :
+       {"NOT INDEXED ORDER BY id", "NOT INDEXED ORDER BY id DESC", "INDEXED BY posts_host ORDER BY host, id",
+        "INDEXED BY posts_host ORDER BY host DESC, id DESC", "INDEXED BY posts_owner ORDER BY owner, id",
+        "INDEXED BY posts_owner ORDER BY owner DESC, id DESC"}) {
+    auto row = prepare(database, (std::string("SELECT id FROM posts ") + scan).c_str());
+    while (row && sqlite3_step(row.get()) == SQLITE_ROW) ids.insert(sqlite3_column_int64(row.get(), 0));
+  }
+  return ids;
+}
+
+SQLiteDatabase open(const std::string& path, int& result) {
+  sqlite3* database = nullptr;
+  result = sqlite3_open_v2(path.c_str(), &database,
+                           SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX, nullptr);
+  return SQLiteDatabase(database);
+}
+
 void createPrivately(const std::string& path) {
   std::error_code ignored;
   const auto directory = std::filesystem::path(path).parent_path();
@@ -126,14 +149,25 @@ bool OutboxStoreError::isInUse() const { return _code == SQLITE_BUSY || _code ==
 
 OutboxStore::OutboxStore(const std::string& path) {
   if (!path.empty()) createPrivately(path);
-  sqlite3* database = nullptr;
-  const int result =
-      sqlite3_open_v2(path.empty() ? ":memory:" : path.c_str(), &database,
-                      SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX, nullptr);
-  _database.reset(database);
+  int result = SQLITE_OK;
+  _database = open(path.empty() ? ":memory:" : path, result);
   check(result);
   execute(kSetUp);
   readTotals();
+}
+
+void OutboxStore::salvage(const std::string& path, const std::function<void(const WaitingPost&)>& take) {
+  int result = SQLITE_OK;
+  const auto database = open(path, result);
+  if (result != SQLITE_OK) return;
+  sqlite3_exec(database.get(), "PRAGMA locking_mode=EXCLUSIVE", nullptr, nullptr, nullptr);
+  for (std::int64_t id : findIDs(database.get())) {
+    auto row = prepare(database.get(), "SELECT " VESK_POST_COLUMNS " FROM posts NOT INDEXED WHERE id = ?1");
+    if (!row) return;
+    sqlite3_bind_int64(row.get(), 1, id);
+    if (sqlite3_step(row.get()) != SQLITE_ROW) continue;
+    if (const auto post = postAt(row.get())) take(*post);
+  }
 }
 
 void OutboxStore::begin() { execute("BEGIN IMMEDIATE"); }

@@ -3,6 +3,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <stdexcept>
 #include <string>
@@ -50,6 +51,9 @@ class OutboxStore {
 
   /// Opens or creates the file with mode 0600, and its directory with mode 0700. Empty: in memory only.
   explicit OutboxStore(const std::string& path);
+
+  /// Calls `take` with each post of a damaged file that can still be read, oldest first. Ignores errors.
+  static void salvage(const std::string& path, const std::function<void(const WaitingPost&)>& take);
 
   // All changes between `begin` and `commit` are made or none. An exception undoes them.
   void begin();
