@@ -33,8 +33,13 @@ action = "remove"
 }  // namespace
 
 FaultRun::FaultRun(Options options)
-    : _options(options), _random(options.seed), _page((_harness.root / "page").string()) {
+    : _options(options),
+      _random(options.seed),
+      _page((_harness.root / "page").string()),
+      _ledger(options.always ? Ledger::Kills::LoseNothing : Ledger::Kills::MayLose) {
   _harness.writeStorebag("zelko", kStorebag);
+  _harness.setPreference("keepStorebags", "true");
+  if (_options.always) _harness.setPreference("outbox", "\"always\"");
   startDaemon();
   for (std::size_t i = 0; i < _options.clients; ++i) startClient(i);
 }
@@ -53,7 +58,7 @@ void FaultRun::pause(std::uint64_t least, std::uint64_t most) {
 
 void FaultRun::disturb() {
   while (std::chrono::steady_clock::now() - _begun < std::chrono::seconds(_options.seconds)) {
-    pause(100, 1200);
+    pause(_options.always ? 10 : 100, _options.always ? 400 : 1200);
     injectOne();
   }
 }
@@ -61,6 +66,7 @@ void FaultRun::disturb() {
 void FaultRun::injectOne() {
   // Without server errors (5xx): they disable a backend, and everything after that is a counted drop.
   const auto drawn = _random() % 35;
+  if (_options.always && drawn % 2 == 0) return replaceDaemon(DaemonEnd::Killed);
   if (drawn < 8) return answerBadly();
   if (drawn < 11) return stallPosts();
   if (drawn < 15) return collectorAway();
@@ -69,14 +75,17 @@ void FaultRun::injectOne() {
   if (drawn < 26) return killClient();
   if (drawn < 31) return replaceDaemon(DaemonEnd::Terminated);
   if (drawn < 34) return replaceDaemon(DaemonEnd::Killed);
-  terminateDaemonInOutage();
+  reboot(_options.always ? DaemonEnd::Killed : DaemonEnd::Terminated);
 }
 
+// A killed daemon reports no refusals, so where kills must lose nothing there are none.
 void FaultRun::answerBadly() {
-  static constexpr const char* kAnswers[] = {"reset", "close", "garbage", "cut",
-                                             "slow",  "404",   "302",     "empty-body"};
+  static constexpr const char* kAnswers[] = {"reset", "close",      "garbage", "cut",
+                                             "slow",  "empty-body", "404",     "302"};
+  constexpr std::size_t kRefusals = 2;
+  const auto answers = std::size(kAnswers) - (_options.always ? kRefusals : 0);
   const std::string fault =
-      "post=" + std::string(kAnswers[_random() % std::size(kAnswers)]) + "*" + std::to_string(upTo(4));
+      "post=" + std::string(kAnswers[_random() % answers]) + "*" + std::to_string(upTo(4));
   say("collector: " + fault);
   _harness.setFault(fault);
 }
@@ -118,15 +127,14 @@ void FaultRun::replaceDaemon(DaemonEnd end) {
   startDaemon();
 }
 
-void FaultRun::terminateDaemonInOutage() {
-  say("daemon terminated while the collector is away");
+void FaultRun::reboot(DaemonEnd end) {
+  say("no network, and the daemon replaced");
   _harness.stopCollector();
   pause(200, 1000);
-  endDaemon(DaemonEnd::Terminated);
-  // Without a collector, the next daemon would get no storebag, and would not try again for a quarter of an
-  // hour.
-  _harness.startCollector();
+  endDaemon(end);
   startDaemon();
+  pause(200, 2000);
+  _harness.startCollector();
 }
 
 // --- Processes

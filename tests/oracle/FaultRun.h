@@ -23,6 +23,7 @@ class FaultRun {
     std::uint64_t seed = 1;
     std::int64_t seconds = 25;
     std::size_t clients = 4;
+    bool always = false;  ///< the daemons write each post before they send it; most faults are kills
   };
   /// Starts everything.
   explicit FaultRun(Options options);
@@ -40,7 +41,8 @@ class FaultRun {
   void freeze(const char* what, const ChildProcess& process);
   void killClient();
   void replaceDaemon(DaemonEnd end);
-  void terminateDaemonInOutage();
+  /// Starts another daemon while the collector is away.
+  void reboot(DaemonEnd end);
 
   void startDaemon();
   void endDaemon(DaemonEnd end);

@@ -91,7 +91,7 @@ std::vector<std::int64_t> Ledger::missing(const Account& account) const {
 }
 
 std::size_t Ledger::uncovered(const Account& account) const {
-  if (account.end == DaemonEnd::Killed) return 0;
+  if (account.end == DaemonEnd::Killed && _kills == Kills::MayLose) return 0;
   const std::size_t lost = missing(account).size();
   return lost > account.counted ? lost - account.counted : 0;
 }

@@ -27,11 +27,14 @@ enum class DaemonEnd : std::uint8_t {
 /// start and end messages and messages that were never confirmed, so these can hide a loss. The fewer drops
 /// are counted, the sharper the judgement; without drops it is exact. A post that waits on disk may be lost
 /// under a later daemon, so those losses cover the messages of any. Losses of a killed daemon are excused,
-/// and shown.
+/// and shown, unless it writes all posts before it sends them.
 ///
 /// Every message that arrives, accepted or not, is checked to be *unchanged*.
 class Ledger {
  public:
+  enum class Kills : std::uint8_t { MayLose, LoseNothing };
+  explicit Ledger(Kills kills) : _kills(kills) {}
+
   void daemonEnded(std::uint64_t incarnation, DaemonEnd end, std::string_view log);
   void clientReported(std::string_view output);
   /// Reads what was added to the collector's event file since the last call.
@@ -59,6 +62,7 @@ class Ledger {
   std::size_t uncovered(const Account& account) const;
   void print(std::uint64_t incarnation, const Account& account) const;
 
+  const Kills _kills;
   std::map<std::uint64_t, Account> _accounts;
   std::unordered_set<std::int64_t> _arrived;
   std::vector<std::string> _changed;

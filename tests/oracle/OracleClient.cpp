@@ -82,7 +82,8 @@ bool OracleClient::sendAnswered(VeskReporting& session) {
   for (auto count = upTo(20); count > 0; --count) {
     const auto incarnation = _page->incarnation.load();
     const auto first = _nextID++;
-    if (!session.sendMessageAndWait(OracleMessage(first).parameters(0), kAnswerTime)) return false;
+    // Realtime, since a message that is held in a batch is not confirmed by its answer.
+    if (!session.sendMessageAndWait(OracleMessage(first).parameters(1), kAnswerTime)) return false;
     confirm(first, incarnation);
   }
   return true;

@@ -20,6 +20,7 @@ int main(int argc, char** argv) {
                  "what the faults and the clients follow from; else another each time");
   app.add_option("--seconds", options.seconds, "how long there are faults")->capture_default_str();
   app.add_option("--clients", options.clients, "client processes at a time")->check(CLI::PositiveNumber);
+  app.add_flag("--always", options.always, "the daemons write each post before they send it");
   CLI11_PARSE(app, argc, argv);
   const auto seed = static_cast<unsigned long long>(options.seed);
   std::printf("oracle: --seed %llu\n", seed);
