@@ -48,6 +48,30 @@ TEST(IPCConnection, CallsTheClientInOrderFromAnyThread) {
   EXPECT_EQ(client.received[99], R"(sendMessageToClient {"i": 99} 0.5 99 9 none)");
 }
 
+TEST(IPCConnection, ReadsNoCallsWhilePausedButSendsAndNoticesAHangUp) {
+  TestService service;
+  std::promise<void> ended;
+  service.onInvalidation = [&] { ended.set_value(); };
+  {
+    TestClient client(service);
+    ASSERT_EQ(client.call("flushMessagesWithReply"), "posted all");
+    const auto connection = service.connection();
+    connection->setPaused(true);
+    client.post("sendMessageWithDictionary", message(1));
+    ClientSessionReplyProxy proxy(connection, [](const std::string& error) { ADD_FAILURE() << error; });
+    proxy.sendMessageToClient(Dictionary(), 0.5, 1, 9, std::nullopt);
+    EXPECT_TRUE(client.runUntil([&] { return client.received.size() == 1; }));
+    EXPECT_EQ(service.journal.lines().size(), 2u) << "the message was not read";
+    connection->setPaused(false);
+    EXPECT_EQ(client.call("flushMessagesWithReply"), "posted all");
+    EXPECT_EQ(service.journal.lines().size(), 4u);
+    connection->setPaused(true);
+    client.post("sendMessageWithDictionary", message(2));
+  }
+  ended.get_future().wait();
+  EXPECT_EQ(service.journal.lines().at(4), "message 2") << "it had been sent";
+}
+
 TEST(IPCConnection, AnswersWhatCannotBeServedWithAnError) {
   CapturedLog log;
   TestService service;

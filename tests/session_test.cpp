@@ -108,6 +108,16 @@ TEST_F(Session, WhatAClientCallsItsFileFillsNoLog) {
   EXPECT_EQ(harness.dropped(DropReason::UploadFailed), 3u);
 }
 
+TEST_F(Session, PausesItsConnectionWhileTooMuchOfItWaitsForAServerThatAnswers) {
+  harness.services.postBudget = std::make_shared<PostBudget>(PostBudget::Limits{20'000, 30'000});
+  auto session = started(storebag("httpPost"));
+  EXPECT_FALSE(session.connection->isPaused);
+  for (int i = 0; i < 1000 && !session.connection->isPaused; ++i) session.send(message(4, 5));
+  EXPECT_TRUE(session.connection->isPaused);
+  harness.posts();
+  EXPECT_FALSE(session.connection->isPaused);
+}
+
 TEST_F(Session, BackendsAreStampedWithTheDeviceAndTheClient) {
   writeFacts(
       "DeviceName = \"Phone\"\nProductType = \"Phone7,2\"\nProductVersion = \"12.4\"\nBuildVersion = "

@@ -17,7 +17,7 @@ class RecordingConnection final : public IPCConnection {
     lose = std::exchange(handlers.loss, nullptr);
     _handlers = std::move(handlers);
   }
-  void setPaused(bool) override {}
+  void setPaused(bool paused) override { isPaused = paused; }
   void invalidate() override {
     if (auto handler = std::exchange(_handlers.invalidation, nullptr)) handler();
     _handlers = {};
@@ -47,6 +47,7 @@ class RecordingConnection final : public IPCConnection {
   std::vector<IPCOutgoingCall> calls;
   std::function<void(std::size_t)> lose;  ///< reports calls that were never sent
   bool clientIsGone = false;
+  std::atomic<bool> isPaused = false;
   std::function<void(const IPCOutgoingCall&)> onCall;  ///< by the sender, who may hold the agent's monitor
 
  private:
