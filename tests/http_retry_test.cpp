@@ -289,6 +289,26 @@ TEST_F(KeptPosts, GoToTheKeeperAfterFiveSeconds) {
   EXPECT_EQ(givenUp(), "1");
 }
 
+TEST_F(KeptPosts, OfALongOutageGoToTheKeeperAtOnceBehindOneThatTries) {
+  add("1");
+  EXPECT_EQ(takeReady(), "1");
+  now += 4s;
+  failFirst();
+  add("2");
+  EXPECT_EQ(takeReady(), "2") << "the outage may be short";
+  now += 1s;
+  add("3");
+  EXPECT_EQ(kept(), "3") << "the second still tries";
+  failFirst();
+  now += 5s;
+  schedule.advance(now);
+  EXPECT_EQ(kept().size(), 2u);
+  add("4");
+  EXPECT_EQ(takeReady(), "4") << "one always tries";
+  add("5");
+  EXPECT_EQ(kept(), "5");
+}
+
 TEST_F(KeptPosts, BehindAHostThatDoesNotAnswerGoToTheKeeper) {
   for (const char* name : {"1", "2", "3", "4"}) add(name);
   EXPECT_EQ(takeReady(), "12");

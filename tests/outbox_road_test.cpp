@@ -2,6 +2,7 @@
 #include <gtest/gtest.h>
 
 #include <csignal>
+#include <filesystem>
 #include <map>
 #include <regex>
 
@@ -70,6 +71,17 @@ TEST_F(OutboxRoad, ConfirmedEventsSurviveAKillAndAStop) {
             std::string::npos);
   restart();
   expectAllOnce(20);
+}
+
+TEST_F(OutboxRoad, WithoutAnOutboxWhatCanNotBeDeliveredIsLostAndCounted) {
+  harness.setPreference("outbox", "\"off\"");
+  start();
+  sendInAnOutage(0, 2);
+  EXPECT_EQ(harness.stopDaemon(), 0);
+  EXPECT_NE(harness.daemon().errors().find("main: Lost since the start: httpPost transport-error 3\n"),
+            std::string::npos)
+      << "with the session's last message: " << harness.daemon().errors();
+  EXPECT_FALSE(std::filesystem::exists(harness.root / "var/lib/veskreportingd/outbox.sqlite"));
 }
 
 TEST_F(OutboxRoad, ADeviceThatStartsWithoutANetworkReports) {

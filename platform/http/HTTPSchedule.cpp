@@ -36,7 +36,8 @@ void HTTPSchedule::add(Exchange exchange) {
   Lane& lane = host.lanes[exchange->request.owner];
   // If no other attempt will show whether the host is back, this post does not wait.
   const bool mustWait = host.outage && host.activePosts + host.queuedPosts > 0;
-  if (mustWait && !makeRoom(waitingBodies, host, lane, exchange->bodySize(), _maximumWaiting)) {
+  if (isBehindAProbe(host, *exchange) ||
+      (mustWait && !makeRoom(waitingBodies, host, lane, exchange->bodySize(), _maximumWaiting))) {
     giveUp(std::move(exchange), *host.outage);
   } else if (!makeRoom(memory, host, lane, exchange->cost(), _maximumMemory)) {
     giveUp(std::move(exchange), {HTTPError::Kind::Other, kTooMany});
@@ -288,6 +289,12 @@ void HTTPSchedule::giveUpLate(Host& host, Instant now) {
              host.outage ? *host.outage : HTTPError{HTTPError::Kind::Timeout, "the server does not answer"});
     }
   }
+}
+
+bool HTTPSchedule::isBehindAProbe(const Host& host, const HTTPExchange& post) const {
+  if (!_keeper || !host.outage || host.lastAnswer + _policy.retryFor > post.started) return false;
+  return host.activePosts > 0 || std::any_of(host.lanes.begin(), host.lanes.end(),
+                                             [](const auto& lane) { return lane.second.cost > 0; });
 }
 
 void HTTPSchedule::release(Host& host, const HTTPExchange& exchange) {

@@ -112,6 +112,9 @@ class HTTPSchedule {
   std::optional<Instant> endOfWait(const Host& host, const HTTPExchange& post) const;
   /// Takes the host's waiting posts off their senders' accounts if it does not answer.
   static void dischargeIfSilent(Host& host, Instant now);
+  /// Whether the keeper should have the new post at once: the outage has lasted for the time that posts are
+  /// tried again, and others find out when it ends.
+  bool isBehindAProbe(const Host& host, const HTTPExchange& post) const;
   /// Gives up the queued posts that waited too long for the host.
   void giveUpLate(Host& host, Instant now);
 
