@@ -36,8 +36,7 @@ void HTTPSchedule::add(Exchange exchange) {
   Lane& lane = host.lanes[exchange->request.owner];
   // If no other attempt will show whether the host is back, this post does not wait.
   const bool mustWait = host.outage && host.activePosts + host.queuedPosts > 0;
-  if (isBehindAProbe(host, *exchange) ||
-      (mustWait && !makeRoom(waitingBodies, host, lane, exchange->bodySize(), _maximumWaiting))) {
+  if (mustWait && !makeRoom(waitingBodies, host, lane, exchange->bodySize(), _maximumWaiting)) {
     giveUp(std::move(exchange), *host.outage);
   } else if (!makeRoom(memory, host, lane, exchange->cost(), _maximumMemory)) {
     giveUp(std::move(exchange), {HTTPError::Kind::Other, kTooMany});
@@ -170,7 +169,7 @@ std::size_t HTTPSchedule::waitingBodies(const Host& host, const Lane& lane) {
 
 bool HTTPSchedule::isUnused(const Hosts::value_type& entry) {
   const Host& host = entry.second;
-  return host.active == 0 && host.requests.empty() && host.background.empty() &&
+  return !host.outage && host.active == 0 && host.requests.empty() && host.background.empty() &&
          std::all_of(host.lanes.begin(), host.lanes.end(),
                      [](const auto& lane) { return lane.second.cost == 0; });
 }
@@ -291,10 +290,8 @@ void HTTPSchedule::giveUpLate(Host& host, Instant now) {
   }
 }
 
-bool HTTPSchedule::isBehindAProbe(const Host& host, const HTTPExchange& post) const {
-  if (!_keeper || !host.outage || host.lastAnswer + _policy.retryFor > post.started) return false;
-  return host.activePosts > 0 || std::any_of(host.lanes.begin(), host.lanes.end(),
-                                             [](const auto& lane) { return lane.second.cost > 0; });
+bool HTTPSchedule::isLongOutage(const Host& host, Instant now) const {
+  return _keeper && host.outage && host.lastAnswer + _policy.retryFor <= now;
 }
 
 void HTTPSchedule::release(Host& host, const HTTPExchange& exchange) {
@@ -314,6 +311,11 @@ void HTTPSchedule::noteOutage(Host& host, const HTTPExchange& exchange, const HT
 bool HTTPSchedule::keepForRetry(Host& host, Exchange& exchange, bool wasSentWhole, Instant now) {
   // What the keeper has, or can have, need not wait here.
   if (_keeper && (_ending || exchange->ticket != 0 || wasSentWhole)) return false;
+  // In a long outage one post goes on trying. Others are tried once, since the host may be back.
+  if (isLongOutage(host, now) && std::any_of(host.lanes.begin(), host.lanes.end(),
+                                             [](const auto& lane) { return lane.second.cost > 0; })) {
+    return false;
+  }
   const double random = std::uniform_real_distribution<double>()(_random);
   auto wait = _policy.waitAfter(exchange->attempts, exchange->firstAttempt, now, random);
   Lane& lane = laneOf(host, *exchange);

@@ -37,7 +37,7 @@ class HTTPSchedule {
   void add(Exchange exchange);
 
   /// Resumes the posts whose wait is over, gives up queued requests whose time is up, and forgets hosts
-  /// without requests.
+  /// without requests that are not in an outage. Few hosts exist, since signed storebags name them.
   void advance(Instant now);
 
   /// The next exchange for which a connection is free, or null. It counts against its host's limit until
@@ -112,9 +112,8 @@ class HTTPSchedule {
   std::optional<Instant> endOfWait(const Host& host, const HTTPExchange& post) const;
   /// Takes the host's waiting posts off their senders' accounts if it does not answer.
   static void dischargeIfSilent(Host& host, Instant now);
-  /// Whether the keeper should have the new post at once: the outage has lasted for the time that posts are
-  /// tried again, and others find out when it ends.
-  bool isBehindAProbe(const Host& host, const HTTPExchange& post) const;
+  /// Whether there is a keeper, and the host has not answered for as long as posts are tried again.
+  bool isLongOutage(const Host& host, Instant now) const;
   /// Gives up the queued posts that waited too long for the host.
   void giveUpLate(Host& host, Instant now);
 
