@@ -47,6 +47,9 @@ class OutboxStorage {
   /// Makes the changes. The oldest posts of the fullest owners give way to new ones.
   void write(Changes& changes, Instant now, Lost& lost);
 
+  /// Lets the next `write` try the file even if it failed a moment ago.
+  void tryFileAgain() { _tryFileAgain = {}; }
+
   /// Up to 64 posts for `host` after `id`, oldest first, that may be sent at `now`.
   std::vector<WaitingPost> read(std::string_view host, std::int64_t id, WallTime now, Lost& lost);
 

@@ -178,6 +178,7 @@ void PostOutbox::run() {
       stopping = _isStopped;
     }
     take(std::move(inbox));
+    if (stopping) _storage.tryFileAgain();
     if (stopping || (_writeBy && *_writeBy <= std::chrono::steady_clock::now())) write();
     if (_changes.added.empty()) tellWritten(taken);
     if (stopping) break;
