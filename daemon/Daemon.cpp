@@ -105,9 +105,9 @@ HeldBudget::Limits heldLimits() {
 }
 
 /// Returns null unless the preference "keepStorebags" is set.
-std::unique_ptr<const KeptStorebags> makeKeptStorebags() {
+std::unique_ptr<const KeptStorebags> makeKeptStorebags(StorebagAcceptance& acceptance) {
   if (!preferenceFlagForKey("keepStorebags")) return nullptr;
-  return std::make_unique<KeptStorebags>(pathUnderRoot(kKeptStorebags), publicKeysDER);
+  return std::make_unique<KeptStorebags>(pathUnderRoot(kKeptStorebags), publicKeysDER, &acceptance);
 }
 
 /// Called with the agent's monitor held.
@@ -206,12 +206,13 @@ struct Daemon::Parts {
                         .powerLog = std::make_shared<PowerLog>(powerLogOptions()),
                         .dashboardLinger = dashboardLinger()},
         sessionServices{.backends = backendServices, .libraryVersion = clientLibraryVersion()},
-        keptStorebags(makeKeptStorebags()),
+        keptStorebags(makeKeptStorebags(acceptance)),
         mode(outboxMode()),
         outbox(makeOutbox(mode, busyMarker, *backendServices.refusedPosts)),
         http(httpOptions(mode, busyMarker, outbox.get())),
-        agent(std::make_shared<ReportingdAgent>(sessionServices, storebagFetcher(), busyMarker,
-                                                keptStorebagSource())),
+        agent(std::make_shared<ReportingdAgent>(
+            sessionServices, storebagFetcher(), busyMarker, keptStorebagSource(),
+            [this](std::string_view name) { return acceptance.hasExpired(name); })),
         listener(listenerOptions(serviceManager)) {
     backendServices.heldBudget = std::make_shared<HeldBudget>(heldLimits());
     backendServices.postBudget = std::make_shared<PostBudget>(PostBudget::Limits{}, outbox.get());
@@ -236,7 +237,7 @@ struct Daemon::Parts {
   }
 
   StorebagFetcher storebagFetcher() {
-    return [this, library = LibraryFacts{sessionServices.libraryVersion, publicKeysDER}](
+    return [this, library = LibraryFacts{sessionServices.libraryVersion, publicKeysDER, &acceptance}](
                std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version,
                bool& notModified, std::optional<std::string>& lastModified) {
       return fetchStorebagForEnvironmentAndClientType(http, library, clientType, maxAge, version, notModified,
@@ -258,6 +259,7 @@ struct Daemon::Parts {
   // Declared before the client: posts that complete while the client ends still use the services.
   BackendServices backendServices;
   SessionServices sessionServices;
+  StorebagAcceptance acceptance{WallClock::system(), kernelClockIsSet};
   std::unique_ptr<const KeptStorebags> keptStorebags;  // null: storebags are kept in memory only
   const OutboxMode mode;
   // Null: posts that can't be delivered for a minute are lost. Declared before the client, whose posts it

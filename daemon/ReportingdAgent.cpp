@@ -22,10 +22,12 @@ std::int32_t clientTypeOf(const ReportingdSession& session) {
 }  // namespace
 
 ReportingdAgent::ReportingdAgent(const SessionServices& services, StorebagFetcher fetchStorebag,
-                                 BusyMarker& busyMarker, std::optional<KeptStorebagSource> keptStorebags)
+                                 BusyMarker& busyMarker, std::optional<KeptStorebagSource> keptStorebags,
+                                 StorebagExpiry hasExpired)
     : _services(services),
       _busyMarker(busyMarker),
-      _cachedStorebags(std::move(fetchStorebag), std::move(keptStorebags), services.backends.clock) {}
+      _cachedStorebags(std::move(fetchStorebag), std::move(keptStorebags), services.backends.clock,
+                       std::move(hasExpired)) {}
 
 std::string ReportingdAgent::description() const {
   char text[48];

@@ -30,7 +30,8 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
  public:
   /// `services` and `busyMarker` must outlive the agent.
   ReportingdAgent(const SessionServices& services, StorebagFetcher fetchStorebag, BusyMarker& busyMarker,
-                  std::optional<KeptStorebagSource> keptStorebags = std::nullopt);
+                  std::optional<KeptStorebagSource> keptStorebags = std::nullopt,
+                  StorebagExpiry hasExpired = {});
 
   // --- IPCListenerDelegate
   bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) override;

@@ -16,6 +16,7 @@ std::optional<Dictionary> StorebagCache::storebagForClientType(std::int32_t clie
     fetchAndCacheStorebag(clientType);
     record = _records.find(std::string(*name));
   }
+  if (_hasExpired && _hasExpired(*name)) return std::nullopt;
   return record->second.storebagData;
 }
 

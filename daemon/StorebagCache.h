@@ -7,6 +7,7 @@
 #include <map>
 #include <optional>
 #include <string>
+#include <string_view>
 
 #include <VeskReporting/values/Value.h>
 #include "platform/time/Clock.h"
@@ -18,6 +19,9 @@ namespace vesk {
 using StorebagFetcher = std::function<std::optional<Dictionary>(
     std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
     std::optional<std::string>& lastModified)>;
+
+/// Whether the storebag of that name that is in force has expired.
+using StorebagExpiry = std::function<bool(std::string_view name)>;
 
 /// Storebags that were kept on disk, and how fetches are spread over time where they serve meanwhile.
 struct KeptStorebagSource {
@@ -43,11 +47,13 @@ class StorebagCache {
   /// The wait after a failed attempt.
   static constexpr std::chrono::seconds kMinimumWaitAfterFailure{900};
 
-  StorebagCache(StorebagFetcher fetch, std::optional<KeptStorebagSource> kept, const WallClock& clock)
-      : _fetch(std::move(fetch)), _kept(std::move(kept)), _clock(clock) {}
+  StorebagCache(StorebagFetcher fetch, std::optional<KeptStorebagSource> kept, const WallClock& clock,
+                StorebagExpiry hasExpired = {})
+      : _fetch(std::move(fetch)), _kept(std::move(kept)), _clock(clock), _hasExpired(std::move(hasExpired)) {}
 
   /// Returns the cached section if it is fresh or must not be fetched yet; otherwise fetches it, and returns
-  /// the last good section if that fails. Returns nullopt for a client type without a storebag.
+  /// the last good section if that fails. Returns nullopt for a client type without a storebag, and for a
+  /// storebag that has expired.
   std::optional<Dictionary> storebagForClientType(std::int32_t clientType);
 
   /// The version of the last good section; never fetches.
@@ -74,6 +80,7 @@ class StorebagCache {
   const StorebagFetcher _fetch;
   const std::optional<KeptStorebagSource> _kept;
   const WallClock& _clock;
+  const StorebagExpiry _hasExpired;
   std::map<std::string, Record> _records;
 };
 

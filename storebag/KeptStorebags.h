@@ -10,6 +10,7 @@
 #include "platform/result/Result.h"
 #include "platform/time/Clock.h"
 #include "storebag/SignedDocument.h"
+#include "storebag/StorebagAcceptance.h"
 
 namespace vesk {
 
@@ -23,24 +24,26 @@ class KeptStorebags {
     std::optional<std::string> lastModified;  ///< the server's date, for a conditional request
   };
 
-  /// `publicKeys` is called for each verification.
-  KeptStorebags(std::string directory, std::function<PublicKeys()> publicKeys)
-      : _directory(std::move(directory)), _publicKeys(std::move(publicKeys)) {}
+  /// `publicKeys` is called for each verification. `acceptance` checks the optional signed keys, unless null.
+  KeptStorebags(std::string directory, std::function<PublicKeys()> publicKeys,
+                StorebagAcceptance* acceptance = nullptr)
+      : _directory(std::move(directory)), _publicKeys(std::move(publicKeys)), _acceptance(acceptance) {}
 
   /// Replaces the kept document of that name. Logs a failure.
   void keep(std::string_view name, std::string_view document,
             const std::optional<std::string>& lastModified) const;
 
-  /// The kept storebag of that name. A file that doesn't hold one that verifies is removed, with one line of
-  /// level 3.
+  /// The kept storebag of that name. A file that doesn't hold one that verifies and is accepted is removed,
+  /// with one line of level 3.
   std::optional<Kept> load(std::string_view name) const;
 
  private:
   std::string pathFor(std::string_view name) const;
-  Result<Kept> parse(std::string_view file) const;
+  Result<Kept> parse(std::string_view name, std::string_view file) const;
 
   const std::string _directory;
   const std::function<PublicKeys()> _publicKeys;
+  StorebagAcceptance* const _acceptance;
 };
 
 }  // namespace vesk

@@ -57,12 +57,20 @@ Dictionary documentIn(const std::string& body) {
   return document ? *document : Dictionary();
 }
 
-std::optional<Dictionary> verifiedPayload(const Dictionary& document, const LibraryFacts& library) {
+std::optional<Dictionary> verifiedPayload(const Dictionary& document, const LibraryFacts& library,
+                                          std::string_view name) {
   using Verdict = Verification::Verdict;
   auto verification =
       verifySignedDocument(document, library.publicKeys ? library.publicKeys() : PublicKeys());
   switch (verification.verdict) {
     case Verdict::Good:
+      if (const auto accepted =
+              library.acceptance ? library.acceptance->accept(name, verification.payload) : Result<void>();
+          !accepted) {
+        VESK_LOG_ERROR("fetchStorebagWithName: Storebag '%s' is refused: %s", std::string(name).c_str(),
+                       accepted.error().text.c_str());
+        break;
+      }
       return std::move(verification.payload);
     case Verdict::SignatureMissing:
       VESK_LOG_ERROR("fetchStorebagWithName: Signature is missing");
@@ -118,7 +126,7 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryF
   if (result.error && result.error->kind == HTTPError::Kind::TooLarge) {
     // The server answered, but not with a storebag.
     VESK_LOG_ERROR("fetchStorebagWithName: propertyListWithData error %s", result.error->description.c_str());
-    return verifiedPayload({}, library);
+    return verifiedPayload({}, library, name);
   }
   if (result.error) {
     VESK_LOG_INFO(
@@ -136,7 +144,7 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryF
     notModified = true;
     return std::nullopt;
   }
-  auto payload = verifiedPayload(documentIn(result.response->body), library);
+  auto payload = verifiedPayload(documentIn(result.response->body), library, name);
   if (payload && kept) kept->keep(name, result.response->body, lastModified ? *lastModified : std::nullopt);
   return payload;
 }

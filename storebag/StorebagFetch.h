@@ -11,6 +11,7 @@
 #include "platform/http/HTTPClient.h"
 #include "storebag/KeptStorebags.h"
 #include "storebag/SignedDocument.h"
+#include "storebag/StorebagAcceptance.h"
 
 namespace vesk {
 
@@ -19,6 +20,8 @@ struct LibraryFacts {
   std::string version;
   /// The keys that storebags may be signed with. Called for each fetch.
   std::function<PublicKeys()> publicKeys;
+  /// Checks the optional signed keys. Null: they are not checked.
+  StorebagAcceptance* acceptance = nullptr;
 };
 
 /// The maximum age in seconds that a "Cache-Control" header gives a storebag; 86400 if the header is absent

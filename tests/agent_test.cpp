@@ -58,8 +58,20 @@ class AgentStorebags : public testing::Test {
   std::vector<std::int32_t> fetched;    // client types
   std::optional<std::string> previous;  // the last fetch's "Last-Modified"
   std::shared_ptr<ReportingdAgent> agent = std::make_shared<ReportingdAgent>(
-      sessionServices, [this](auto&&... arguments) { return fetch(arguments...); }, busyMarker);
+      sessionServices, [this](auto&&... arguments) { return fetch(arguments...); }, busyMarker, std::nullopt,
+      [this](std::string_view name) { return name == expired; });
+  std::string expired;  ///< the name of a storebag
 };
+
+TEST_F(AgentStorebags, AnExpiredStorebagServesNobody) {
+  auto session = newSession();
+  next = {kFirst, 600};
+  EXPECT_EQ(agent->storebagForSession(*session), kFirst);
+  expired = "palvo";
+  EXPECT_EQ(agent->storebagForSession(*session), std::nullopt);
+  expired = "zelko";
+  EXPECT_EQ(agent->storebagForSession(*session), kFirst);
+}
 
 TEST_F(AgentStorebags, FetchesByAgeAndWaitsAfterFailures) {
   enum class Does { Fetch, FetchInVain, ServeCached, Wait };

@@ -12,6 +12,7 @@
 #include "platform/outbox/RetryAfter.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/HTTPRequests.h"
+#include "tests/support/HandClock.h"
 #include "tests/support/RecordingServer.h"
 #include "tests/support/TempDirectory.h"
 
@@ -79,12 +80,6 @@ TEST(RetryAfter, ReadsSecondsAndDates) {
   }
   EXPECT_EQ(retryAfter({503, {}, ""}, now), std::nullopt);
 }
-
-class SettableClock final : public WallClock {
- public:
-  WallTime now() const override { return WallTime(std::chrono::seconds(seconds.load())); }
-  std::atomic<std::int64_t> seconds{1'800'000'000};
-};
 
 class Outbox : public testing::Test {
  protected:
@@ -158,7 +153,7 @@ class Outbox : public testing::Test {
 
   CapturedLog log;
   TempDirectory directory;
-  SettableClock clock;
+  HandClock clock;
   RecordingServer server;
   std::mutex mutex;
   std::condition_variable changed;
@@ -196,7 +191,7 @@ TEST_F(Outbox, KeepsPostsOverARestart) {
   while (server.count() < 1) std::this_thread::yield();
   end();
   server.answerWith(HTTPAnswer::text(200, "ok"));
-  clock.seconds += 31;  // the server may have been busy with the post that was interrupted
+  clock.advance(31s);  // the server may have been busy with the post that was interrupted
   begin();
   EXPECT_TRUE(waiting);
   answerFresh();
@@ -297,11 +292,11 @@ TEST_F(Outbox, PostsExpireUnlessTheirDateIsOfAClockThatWasNotSet) {
   server.stop();
   EXPECT_TRUE(isPutAside(post("old")));
   end();
-  clock.seconds = 1000;
+  clock.set(1000);
   begin();
   EXPECT_TRUE(isPutAside(post("undated")));
   end();
-  clock.seconds = 1'800'000'000 + 8 * 24 * 3600;
+  clock.set(1'700'000'000 + 8 * 24 * 3600);
   begin();
   waitFor(Outcome::Expired, 1);
   server.start();

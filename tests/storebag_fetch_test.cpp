@@ -8,6 +8,7 @@
 #include "storebag/StorebagFallback.h"
 #include "storebag/StorebagFetch.h"
 #include "tests/support/CapturedLog.h"
+#include "tests/support/HandClock.h"
 #include "tests/support/RecordingServer.h"
 #include "tests/support/SignedStorebag.h"
 #include "tests/support/TestRoot.h"
@@ -208,6 +209,61 @@ TEST_F(StorebagFetch, AnyOfTheKeysVerifies) {
   };
   EXPECT_FALSE(fetch());
   EXPECT_EQ(log.countContaining(3, "Signature can not be verified"), 1) << "one line, after all keys";
+}
+
+TEST_F(StorebagFetch, SignedKeysProtectAgainstAnotherAnOldAndAnExpiredStorebag) {
+  HandClock clock;
+  bool isClockSet = true;
+  StorebagAcceptance acceptance(clock, [&] { return isClockSet; });
+  library.acceptance = &acceptance;
+  const auto seconds = [&](double fromNow) { return Date{1'700'000'000 + fromNow}; };
+  const struct {
+    Dictionary keys;
+    const char* refusal;
+  } cases[] = {
+      {{{"serial", 4}}, nullptr},
+      {{{"name", "zelko"}, {"serial", 5}, {"expires", seconds(60)}}, nullptr},
+      {{{"name", "zelko"}, {"serial", 5}}, nullptr},
+      {{{"name", "palvo"}, {"serial", 9}}, "it is the storebag 'palvo'"},
+      {{{"name", 3}, {"serial", 9}}, "its name is no text"},
+      {{{"serial", 4}}, "its serial is 4, after 5"},
+      {{}, "it has no serial, after 5"},
+      {{{"serial", -1}}, "its serial is no integer from 0"},
+      {{{"serial", "6"}}, "its serial is no integer from 0"},
+      {{{"serial", 6}, {"expires", seconds(-1)}}, "it has expired"},
+      {{{"serial", 6}, {"expires", "2027-01-01"}}, "its key 'expires' is no date"},
+  };
+  for (const auto& test : cases) {
+    SCOPED_TRACE(test.refusal ? test.refusal : "accepted");
+    serve(signedStorebag(payload(test.keys)));
+    EXPECT_EQ(fetch().has_value(), test.refusal == nullptr);
+    EXPECT_EQ(log.count(3, withName(std::string("Storebag 'zelko' is refused: ") +
+                                    (test.refusal ? test.refusal : ""))),
+              test.refusal ? 1 : 0);
+  }
+  EXPECT_FALSE(acceptance.hasExpired("zelko"));
+  isClockSet = false;
+  serve(signedStorebag(payload({{"serial", 7}, {"expires", seconds(-1)}})));
+  EXPECT_TRUE(fetch()) << "nobody knows the time";
+  EXPECT_FALSE(acceptance.hasExpired("zelko"));
+  isClockSet = true;
+  log.clear();
+  EXPECT_TRUE(acceptance.hasExpired("zelko"));
+  EXPECT_TRUE(acceptance.hasExpired("zelko"));
+  EXPECT_EQ(log.countContaining(3, "'zelko' has expired"), 1);
+
+  kept =
+      std::make_unique<KeptStorebags>((testRoot() / "kept-serial").string(), library.publicKeys, &acceptance);
+  std::filesystem::create_directory(testRoot() / "kept-serial");
+  serve(signedStorebag(payload({{"serial", 8}})));
+  EXPECT_TRUE(fetch());
+  StorebagAcceptance restarted(clock, [] { return true; });
+  library.acceptance = &restarted;
+  kept =
+      std::make_unique<KeptStorebags>((testRoot() / "kept-serial").string(), library.publicKeys, &restarted);
+  EXPECT_TRUE(keptStorebagForClientType(*kept, 5));
+  serve(signedStorebag(payload({{"serial", 7}})));
+  EXPECT_FALSE(fetch()) << "the kept one's serial survives a restart";
 }
 
 TEST_F(StorebagFetch, AKeptStorebagServesUntilItIsTamperedWith) {

@@ -249,11 +249,21 @@ TEST_F(VeskreportCommand, MakesAndExaminesStorebags) {
   std::string keys = root + "/keys", bag = root + "/zelko.storebag";
   EXPECT_EQ(run({"storebag", "keygen", keys}).status, 0);
   EXPECT_EQ(run({"storebag", "keygen", keys}).status, 1) << "must not replace a key";
-  EXPECT_EQ(
-      run({"storebag", "sign", source.string(), "--key", keys + "/storebag-signing.key", "-o", bag}).errors,
-      "");
-  EXPECT_EQ(run({"storebag", "verify", bag, "--key", keys + "/publicKey.der"}).output,
-            bag + ": valid, version 1.2\n");
+  const auto sign = [&](std::vector<std::string> more) {
+    more.insert(more.begin(),
+                {"storebag", "sign", source, "--key", keys + "/storebag-signing.key", "-o", bag});
+    return run(more).status;
+  };
+  const auto verified = [&] {
+    return run({"storebag", "verify", bag, "--key", keys + "/publicKey.der"}).output;
+  };
+  EXPECT_EQ(sign({}), 0);
+  EXPECT_EQ(verified(), bag + ": valid, version 1.2\n");
+  EXPECT_EQ(sign({"--name", "zelko", "--serial", "7", "--expires", "2027-01-31"}), 0);
+  EXPECT_EQ(verified(),
+            bag + ": valid, version 1.2, expires = 2027-01-31T00:00:00Z, name = 'zelko', serial = 7\n");
+  EXPECT_EQ(sign({"--expires", "tomorrow"}), 1);
+  EXPECT_EQ(sign({"--serial", "-1"}), 2);
   EXPECT_NE(run({"storebag", "show", bag}).output.find("active = true"), std::string::npos);
 
   auto other = root + "/other";

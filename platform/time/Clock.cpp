@@ -1,5 +1,7 @@
 #include "platform/time/Clock.h"
 
+#include <sys/timex.h>
+
 namespace vesk {
 
 namespace {
@@ -16,6 +18,12 @@ class SystemWallClock final : public WallClock {
 const WallClock& WallClock::system() {
   static const SystemWallClock clock;
   return clock;
+}
+
+bool kernelClockIsSet() {
+  timex state{};
+  const int result = ::adjtimex(&state);
+  return result >= 0 && result != TIME_ERROR && (state.status & STA_UNSYNC) == 0;
 }
 
 }  // namespace vesk

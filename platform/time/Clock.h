@@ -19,6 +19,9 @@ class WallClock {
   static const WallClock& system();
 };
 
+/// Whether the kernel considers the wall clock synchronised, for example by NTP.
+bool kernelClockIsSet();
+
 /// Converts a wall time to POSIX form.
 inline timeval timevalFrom(WallTime time) {
   auto seconds = std::chrono::floor<std::chrono::seconds>(time);

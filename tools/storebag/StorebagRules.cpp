@@ -31,6 +31,7 @@ constexpr Shape kText{"a text", isText};
 constexpr Shape kNumber{"a number", [](const Value& value) { return value.isNumber(); }};
 constexpr Shape kNumberOrText{"a number or a text",
                               [](const Value& value) { return value.isNumber() || isText(value); }};
+constexpr Shape kDate{"a date", [](const Value& value) { return value.date() != nullptr; }};
 constexpr Shape kBoolean{"true or false", [](const Value& value) { return value.boolean() != nullptr; }};
 constexpr Shape kTexts{"a list of texts", isListOf<isText>};
 constexpr Shape kTables{"a list of tables", isListOf<isDictionary>};
@@ -106,6 +107,9 @@ constexpr std::array kBackends{
 constexpr std::array kTop{
     KeyRule{"version", kText, "the storebag has no version"},
     KeyRule{"refresh_cycle", kNumber},
+    KeyRule{"name", kText},
+    KeyRule{"serial", kNumber},
+    KeyRule{"expires", kDate},
 };
 
 const KeyRule* ruleFor(std::span<const KeyRule> rules, std::string_view key) {

@@ -5,6 +5,7 @@
 #include <cmath>
 #include <cstdlib>
 #include <iterator>
+#include <limits>
 #include <numeric>
 #include <utility>
 
@@ -207,6 +208,12 @@ class Reader {
     sign->add_option("--key", _invocation.key, "Private key (PEM)")->required();
     sign->add_option("-o,--output", _invocation.output, "Where to write it (default: standard output)");
     sign->add_flag("--lenient", _invocation.lenient, "Sign even if values have the wrong type");
+    sign->add_option("--name", _invocation.storebagName,
+                     "The only name under which daemons accept it, such as zelko");
+    sign->add_option("--serial", _invocation.serial, "Daemons that accepted a higher one refuse it")
+        ->check(CLI::Range(std::int64_t{0}, std::numeric_limits<std::int64_t>::max()));
+    sign->add_option("--expires", _invocation.expires,
+                     "When it ends, as 2027-01-31 or 2027-01-31T12:00:00 (UTC)");
     CLI::App* verify = add(*storebag, "verify", "Check a signed storebag", runStorebagVerify);
     verify->add_option("storebag", _invocation.source, "Signed storebag")->required();
     verify->add_option("--key", _invocation.key, "Public key (DER; default: the installed one)");

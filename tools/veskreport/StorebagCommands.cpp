@@ -1,8 +1,10 @@
 #include <VeskReporting/VeskReporting.h>
 
+#include <sstream>
 #include <stdexcept>
 #include <string>
 
+#include "platform/preferences/TomlFile.h"
 #include "tools/files/WholeFile.h"
 #include "tools/storebag/StorebagSigning.h"
 #include "tools/storebag/StorebagSource.h"
@@ -23,6 +25,31 @@ std::string publicKeyOf(const Invocation& invocation) {
   return *installed;
 }
 
+/// Midnight of UTC if only a day is given.
+Value dateMeantBy(const std::string& text) {
+  const bool isDay = text.find('T') == std::string::npos;
+  const auto toml = text.find_first_not_of("0123456789-:TZ") == std::string::npos
+                        ? parseToml("date = " + text +
+                                    (isDay                ? "T00:00:00Z"
+                                     : text.back() == 'Z' ? ""
+                                                          : "Z"))
+                        : Result<Dictionary>(malformed("no date"));
+  const Value* date = toml ? toml->find("date") : nullptr;
+  if (date == nullptr || date->date() == nullptr) {
+    throw std::runtime_error("--expires: '" + text +
+                             "' is no date such as 2027-01-31 or 2027-01-31T12:00:00");
+  }
+  return *date;
+}
+
+Dictionary withSignedKeys(const Dictionary& payload, const Invocation& invocation) {
+  MutableDictionary all(payload);
+  if (!invocation.storebagName.empty()) all.set("name", invocation.storebagName);
+  if (invocation.serial) all.set("serial", *invocation.serial);
+  if (!invocation.expires.empty()) all.set("expires", dateMeantBy(invocation.expires));
+  return all.share();
+}
+
 }  // namespace
 
 int runStorebagKeygen(const Invocation& invocation, const Output& output) {
@@ -38,7 +65,8 @@ int runStorebagSign(const Invocation& invocation, const Output& output) {
   auto checks = invocation.lenient ? StorebagChecks::Lenient : StorebagChecks::Strict;
   StorebagSource source = readStorebagSource(invocation.source, checks);
   for (const std::string& warning : source.warnings) output.note("warning: " + warning);
-  std::string document = signStorebag(source.payload, SigningKey::fromFile(invocation.key));
+  std::string document =
+      signStorebag(withSignedKeys(source.payload, invocation), SigningKey::fromFile(invocation.key));
   if (invocation.output.empty()) return output.raw(document);
   writeWholeFile(invocation.output, document, kReadableByAll);
   return output.done("signed " + invocation.output, {{"output", invocation.output}});
@@ -49,9 +77,18 @@ int runStorebagVerify(const Invocation& invocation, const Output& output) {
   std::string document = readWholeFile(path, kMaximumStorebag);
   auto inspection = inspectStorebag(document, publicKeyOf(invocation));
   if (!inspection.isValid()) return output.failed(path + ": " + inspection.problem);
-  auto version = inspection.payload->text("version");
-  return output.done(path + ": valid, " + (version ? "version " + version->string() : "no version"),
-                     {{"storebag", path}});
+  const Dictionary& payload = *inspection.payload;
+  auto version = payload.text("version");
+  std::string line = path + ": valid, " + (version ? "version " + version->string() : "no version");
+  MutableDictionary signedKeys;
+  for (const char* key : {"name", "serial", "expires"}) {
+    if (const Value* value = payload.find(key)) signedKeys.set(key, *value);
+  }
+  std::istringstream keyLines(storebagAsTOML(signedKeys.share()));
+  for (std::string each; std::getline(keyLines, each);) {
+    if (!each.empty()) line += ", " + each;
+  }
+  return output.done(line, {{"storebag", path}});
 }
 
 int runStorebagShow(const Invocation& invocation, const Output& output) {
