@@ -1,5 +1,7 @@
 #include "client/SessionWorker.h"
 
+#include <VeskReporting/VeskReportingKeys.h>
+
 #include <poll.h>
 
 #include <algorithm>
@@ -8,6 +10,7 @@
 #include <utility>
 
 #include "platform/log/SystemLog.h"
+#include "protocol/StorebagName.h"
 
 namespace vesk {
 
@@ -28,6 +31,10 @@ constexpr std::size_t kMaximumAnswersOwed = 512;
 // stream of messages then costs its senders no system calls.
 constexpr std::chrono::milliseconds kNap{1};
 
+// For the answer to a start whose caller doesn't wait: the daemon may be fetching a storebag.
+constexpr std::chrono::seconds kStartTime{60};
+
+constexpr std::string_view kDisconnected = "org.freedesktop.DBus.Error.Disconnected";
 constexpr char kLost[] = "the daemon has closed the connection";
 
 }  // namespace
@@ -58,6 +65,7 @@ void SessionWorker::step() {
   const auto urgency = takeCalls();
   endOverdue(now);
   reachDaemon(now, urgency);
+  if (startIsDue(now) && !start()) connectionBroke(now);
   sendWaiting(now);
   sayFarewell(now);
   if (!isFinished(now)) sleep(now);
@@ -186,9 +194,37 @@ void SessionWorker::linkHasChanged(DaemonLink::Change change) {
 void SessionWorker::connectionBroke(Time now) { linkHasChanged(_link.lose(now, kLost)); }
 
 void SessionWorker::introduceAgain() {
-  const bool isTold = (!_configuration || tell(wire::kSetSessionInfo, *_configuration)) &&
-                      (!_isStarted || tell(wire::kStartConfig, {}));
+  const bool isTold =
+      (!_configuration || tell(wire::kSetSessionInfo, *_configuration)) && (!_isStarted || start());
   if (!isTold) connectionBroke(Clock::now());
+}
+
+/// A start of the library's own.
+bool SessionWorker::start() {
+  _starts.started();
+  return _link.bus().send(
+             IPCOutgoingCall{wire::kSessionInterface, wire::kStartConfig.name, {}},
+             [this](BusAnswer& answer) { startWasAnswered(answer); },
+             kStartTime) == BusClient::SendResult::Sent;
+}
+
+bool SessionWorker::startIsDue(Time now) const noexcept {
+  return _link.isReady() && !_drainDeadline && now >= _starts.due();
+}
+
+void SessionWorker::startWasAnswered(const BusAnswer& answer) {
+  std::optional<std::vector<std::string>> backends;
+  const Time now = Clock::now();
+  if (answer.peek(backends) && backends) return _starts.answeredWithConfiguration(now);
+  // A lost connection starts the session anyway when it is there again.
+  if (answer.errorName() == kDisconnected || !mayGetConfiguration()) return _starts.started();
+  _starts.answeredWithNothing(now, std::uniform_real_distribution<double>()(_random));
+}
+
+bool SessionWorker::mayGetConfiguration() const noexcept {
+  const auto* info = _configuration ? std::get_if<Dictionary>(&_configuration->front()) : nullptr;
+  const auto type = info ? integerForKey(*info, kVeskReportingSessionInfoClientType) : std::nullopt;
+  return type && storebagNameForClientType(static_cast<std::int32_t>(*type));
 }
 
 bool SessionWorker::tell(const wire::Member& member, const std::vector<IPCArgument>& arguments) {
@@ -200,7 +236,10 @@ bool SessionWorker::tell(const wire::Member& member, const std::vector<IPCArgume
 void SessionWorker::remember(ClientCall& call) noexcept {
   constexpr std::size_t kUserInfoOfConfiguration = 1, kUserInfoOfStates = 0;
   if (call.effect == CallEffect::Configures) _configuration = std::move(call.arguments);
-  if (call.effect == CallEffect::Starts) _isStarted = true;
+  if (call.effect == CallEffect::Starts) {
+    _isStarted = true;
+    _starts.started();
+  }
   if (call.effect == CallEffect::ChangesUserInfo && _configuration) {
     (*_configuration)[kUserInfoOfConfiguration] = std::move(call.arguments[kUserInfoOfStates]);
   }
@@ -229,6 +268,11 @@ bool SessionWorker::sendTogether(Time now) {
   BusClient& bus = _link.bus();
   for (auto next = _waiting.begin(); next != _waiting.end();) {
     const auto call = next++;
+    if (call->effect == CallEffect::Starts && !call->end) {  // nobody waits, but the answer matters
+      call->end = [](ReportingStatus, BusAnswer*, std::string_view) {};
+      call->deadline = now + kStartTime;
+      _firstDeadline = std::min(_firstDeadline, call->deadline);
+    }
     const bool isAnswered = static_cast<bool>(call->end);
     if (isAnswered && _callsInBus > 0) break;
     const auto status = handOver(call, now);
@@ -279,8 +323,9 @@ void SessionWorker::callsHaveLeft() {
 void SessionWorker::answered(Call call, BusAnswer& answer) noexcept {
   ClientCalls one;
   one.splice(one.begin(), _owed, call);
+  if (call->effect == CallEffect::Starts) startWasAnswered(answer);
   if (!answer.isError()) return finish(*call, ReportingStatus::Done, &answer);
-  if (answer.errorName() == "org.freedesktop.DBus.Error.Disconnected") {
+  if (answer.errorName() == kDisconnected) {
     // A host that closes descriptors ends the session, whichever descriptor is noticed first.
     if (!_queue.ownsItsDescriptors()) return finish(*call, ReportingStatus::Closed);
     return finish(*call, ReportingStatus::NotConnected, nullptr, kLost);
@@ -319,6 +364,7 @@ SessionWorker::Time SessionWorker::nextDue(Time now) {
   Time due = std::min(now + std::chrono::hours(1), _firstDeadline);
   if (!_link.isAway() || wantsDaemon()) due = std::min(due, _link.nextDue(now));
   if (_drainDeadline) due = std::min(due, *_drainDeadline);
+  if (_link.isReady() && !_drainDeadline) due = std::min(due, _starts.due());
   if (_isNapping && _waiting.empty()) due = std::min(due, now + kNap);
   return due;
 }

@@ -7,6 +7,7 @@
 #include <chrono>
 #include <memory>
 #include <optional>
+#include <random>
 #include <string_view>
 #include <vector>
 
@@ -14,6 +15,7 @@
 #include "client/CallQueue.h"
 #include "client/ClientCall.h"
 #include "client/DaemonLink.h"
+#include "client/StartPolicy.h"
 #include "protocol/WireNames.h"
 
 namespace vesk {
@@ -22,7 +24,8 @@ namespace vesk {
 /// aggregated messages. Unless marked otherwise, members are used only by the thread that runs `run`.
 class SessionWorker {
  public:
-  explicit SessionWorker(const ReportingOptions& options) : _queue(options), _link(options, _receiver) {}
+  explicit SessionWorker(const ReportingOptions& options)
+      : _queue(options), _link(options, _receiver), _starts(options.refreshInterval) {}
 
   // Thread-safe.
 
@@ -57,6 +60,10 @@ class SessionWorker {
   void reachDaemon(Time now, DaemonLink::Urgency urgency);
   void linkHasChanged(DaemonLink::Change change);
   void introduceAgain();
+  bool start();
+  bool startIsDue(Time now) const noexcept;
+  void startWasAnswered(const BusAnswer& answer);
+  bool mayGetConfiguration() const noexcept;
   bool tell(const wire::Member& member, const std::vector<IPCArgument>& arguments);
   void remember(ClientCall& call) noexcept;
 
@@ -91,6 +98,8 @@ class SessionWorker {
   // As last sent; resent to the daemon after a reconnection.
   std::optional<std::vector<IPCArgument>> _configuration;
   bool _isStarted = false;
+  StartPolicy _starts;
+  std::minstd_rand _random{std::random_device{}()};
 
   std::optional<Time> _drainDeadline;  ///< set once the session is being closed
   Farewell _farewell = Farewell::NotYet;

@@ -4,26 +4,6 @@
 
 namespace vesk {
 
-std::optional<std::string_view> storebagNameForClientType(std::int32_t clientType) {
-  switch (clientType) {
-    case 5:
-      return "zelko";
-    case 6:
-      return "brannic";
-    case 7:
-    case 11:
-      return "palvo";
-    case 8:
-      return "tessin";
-    case 9:
-      return "quimby";
-    case 10:
-      return "dorvel";
-    default:
-      return std::nullopt;
-  }
-}
-
 std::optional<std::string_view> environmentNameForType(std::int32_t environmentType) {
   switch (environmentType) {
     case 1:

@@ -6,10 +6,9 @@
 #include <string>
 #include <string_view>
 
-namespace vesk {
+#include "protocol/StorebagName.h"
 
-/// Returns nullopt for a client type without a storebag. Types 7 and 11 share one.
-std::optional<std::string_view> storebagNameForClientType(std::int32_t clientType);
+namespace vesk {
 
 /// The name of an environment type's section; nullopt for types other than 1 to 4.
 std::optional<std::string_view> environmentNameForType(std::int32_t environmentType);

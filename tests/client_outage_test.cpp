@@ -8,6 +8,7 @@
 
 #include "client/DrainBudget.h"
 #include "client/ReconnectPolicy.h"
+#include "client/StartPolicy.h"
 #include "platform/ipc/UnixSocket.h"
 #include "tests/support/ClientHarness.h"
 
@@ -312,6 +313,35 @@ TEST(ReconnectPolicy, WaitsTwiceAsLongAfterEachFailureAndAllowsOneEarlyAttemptAW
   EXPECT_LE(policy.due(), now);
   policy.failed(now);
   EXPECT_EQ(policy.due(), now + 50ms);
+}
+
+TEST(StartPolicy, RepeatsWithGrowingWaitsUntilThereIsAConfiguration) {
+  const StartPolicy::Time now{1h};
+  StartPolicy once(0ms);
+  EXPECT_EQ(once.due(), StartPolicy::Time::max());
+  for (auto wait : {900s, 1800s, 3600s, 3600s}) {
+    once.answeredWithNothing(now, 0.8);
+    EXPECT_EQ(once.due(), now + wait + wait / 5);
+    once.started();
+    EXPECT_EQ(once.due(), StartPolicy::Time::max());
+  }
+  once.answeredWithConfiguration(now);
+  EXPECT_EQ(once.due(), StartPolicy::Time::max());
+  once.answeredWithNothing(now, 0.0);
+  EXPECT_EQ(once.due(), now + 900s);
+  StartPolicy refreshed(2h);
+  refreshed.answeredWithConfiguration(now);
+  EXPECT_EQ(refreshed.due(), now + 2h);
+}
+
+TEST_F(ClientOutage, StartsAnewAtEachRefreshInterval) {
+  daemon.emplace(socket, record);
+  auto refreshing = options();
+  refreshing.refreshInterval = 5ms;
+  VeskReporting session(refreshing);
+  EXPECT_EQ(session.setSessionInfo(sessionInfo), ReportingStatus::Queued);
+  EXPECT_EQ(session.startConfig(ReportingCallback<BackendNamesAnswer>()), ReportingStatus::Queued);
+  while (record.count("startConfig") < 3) std::this_thread::yield();
 }
 
 }  // namespace

@@ -41,6 +41,14 @@ class BusAnswer {
     return _arguments && _arguments->read(out);
   }
 
+  /// Like `read`, but the next `read` gives the same argument.
+  template <class T>
+  bool peek(T& out) const {
+    if (!_arguments) return false;
+    MessageReader copy(*_arguments);
+    return copy.read(out);
+  }
+
  private:
   MessageReader* _arguments = nullptr;
   std::string_view _errorName;
