@@ -36,7 +36,10 @@ FaultRun::FaultRun(Options options)
     : _options(options),
       _random(options.seed),
       _page((_harness.root / "page").string()),
-      _ledger(options.always ? Ledger::Kills::LoseNothing : Ledger::Kills::MayLose) {
+      _isRefusing(!options.always && options.seed % 2 == 0),
+      _ledger(options.always ? Ledger::Kills::LoseNothing
+              : _isRefusing  ? Ledger::Kills::MayLose
+                             : Ledger::Kills::LoseRecent) {
   _harness.writeStorebag("zelko", kStorebag);
   _harness.setPreference("keepStorebags", "true");
   if (_options.always) _harness.setPreference("outbox", "\"always\"");
@@ -78,12 +81,11 @@ void FaultRun::injectOne() {
   reboot(_options.always ? DaemonEnd::Killed : DaemonEnd::Terminated);
 }
 
-// A killed daemon reports no refusals, so where kills must lose nothing there are none.
 void FaultRun::answerBadly() {
   static constexpr const char* kAnswers[] = {"reset", "close",      "garbage", "cut",
                                              "slow",  "empty-body", "404",     "302"};
   constexpr std::size_t kRefusals = 2;
-  const auto answers = std::size(kAnswers) - (_options.always ? kRefusals : 0);
+  const auto answers = std::size(kAnswers) - (_isRefusing ? 0 : kRefusals);
   const std::string fault =
       "post=" + std::string(kAnswers[_random() % answers]) + "*" + std::to_string(upTo(4));
   say("collector: " + fault);

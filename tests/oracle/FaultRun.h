@@ -61,6 +61,7 @@ class FaultRun {
   std::mt19937_64 _random;
   DaemonHarness _harness;
   const SharedPage _page;
+  const bool _isRefusing;  ///< the collector refuses some posts
   Ledger _ledger;
   std::vector<std::unique_ptr<ChildProcess>> _clients;
   std::int64_t _clientsStarted = 0;

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <boost/json.hpp>
+#include <chrono>
 #include <cinttypes>
 #include <cstdio>
 #include <iterator>
@@ -14,6 +15,7 @@ namespace vesk::test {
 
 namespace {
 
+constexpr double kRecent = 6;  // seconds
 constexpr std::string_view kLossLine = "main: Lost since the start: ";
 
 // Losses of events that the collector should have received or that had no backend; not uploads, datagrams or
@@ -33,6 +35,7 @@ bool isLate(std::string_view reason) {
 void Ledger::daemonEnded(std::uint64_t incarnation, DaemonEnd end, std::string_view log) {
   Account& account = _accounts[incarnation];
   account.end = end;
+  account.ended = std::chrono::duration<double>(std::chrono::steady_clock::now().time_since_epoch()).count();
   if (end == DaemonEnd::Killed) {  // it reported no counts
     static const std::regex refused(" refused ([0-9]+) events that had waited");
     const std::string text(log);
@@ -57,9 +60,10 @@ void Ledger::clientReported(std::string_view output) {
   std::string word;
   std::int64_t first = 0, last = 0;
   std::uint64_t incarnation = 0;
-  while (words >> word >> first >> last >> incarnation) {
+  double seconds = 0;
+  while (words >> word >> first >> last >> incarnation >> seconds) {
     auto& accepted = _accounts[incarnation].accepted;
-    for (std::int64_t id = first; id <= last; ++id) accepted.push_back(id);
+    for (std::int64_t id = first; id <= last; ++id) accepted[id] = seconds;
   }
 }
 
@@ -85,14 +89,19 @@ void Ledger::readEvent(const std::string& line) {
 
 std::vector<std::int64_t> Ledger::missing(const Account& account) const {
   std::vector<std::int64_t> missing;
-  std::copy_if(account.accepted.begin(), account.accepted.end(), std::back_inserter(missing),
-               [this](std::int64_t id) { return !_arrived.contains(id); });
+  for (const auto& [id, seconds] : account.accepted) {
+    if (!_arrived.contains(id)) missing.push_back(id);
+  }
   return missing;
 }
 
 std::size_t Ledger::uncovered(const Account& account) const {
   if (account.end == DaemonEnd::Killed && _kills == Kills::MayLose) return 0;
-  const std::size_t lost = missing(account).size();
+  const bool mayLoseRecent = account.end == DaemonEnd::Killed && _kills == Kills::LoseRecent;
+  const auto missing = this->missing(account);
+  const auto lost = static_cast<std::size_t>(std::count_if(missing.begin(), missing.end(), [&](auto id) {
+    return !mayLoseRecent || account.accepted.at(id) + kRecent < account.ended;
+  }));
   return lost > account.counted ? lost - account.counted : 0;
 }
 

@@ -26,13 +26,18 @@ enum class DaemonEnd : std::uint8_t {
 /// Lost since the start: BACKEND REASON COUNT") may be missing. The counters also include the sessions' own
 /// start and end messages and messages that were never confirmed, so these can hide a loss. The fewer drops
 /// are counted, the sharper the judgement; without drops it is exact. A post that waits on disk may be lost
-/// under a later daemon, so those losses cover the messages of any. Losses of a killed daemon are excused,
-/// and shown, unless it writes all posts before it sends them.
+/// under a later daemon, so those losses cover the messages of any. What a killed daemon may lose is
+/// shown.
 ///
 /// Every message that arrives, accepted or not, is checked to be *unchanged*.
 class Ledger {
  public:
-  enum class Kills : std::uint8_t { MayLose, LoseNothing };
+  /// What a killed daemon may lose.
+  enum class Kills : std::uint8_t {
+    MayLose,     ///< anything, since the collector refuses posts, and its counts of that end with it
+    LoseRecent,  ///< what it accepted in its last six seconds
+    LoseNothing
+  };
   explicit Ledger(Kills kills) : _kills(kills) {}
 
   void daemonEnded(std::uint64_t incarnation, DaemonEnd end, std::string_view log);
@@ -54,7 +59,8 @@ class Ledger {
     std::uint64_t counted = 0;
     std::uint64_t countedLate = 0;  ///< of posts that had waited on disk
     std::string reasons;
-    std::vector<std::int64_t> accepted;
+    std::map<std::int64_t, double> accepted;  ///< seconds of the steady clock, by message
+    double ended = 0;                         ///< by the same clock
   };
   void readEvent(const std::string& line);
   std::vector<std::int64_t> missing(const Account& account) const;

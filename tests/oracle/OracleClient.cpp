@@ -101,8 +101,9 @@ bool OracleClient::sendOnce(VeskReporting& session) {
 
 void OracleClient::confirm(std::int64_t first, std::uint64_t incarnation) {
   if (first == _nextID || _page->incarnation != incarnation) return;
-  std::printf("accepted %lld %lld %llu\n", static_cast<long long>(first), static_cast<long long>(_nextID - 1),
-              static_cast<unsigned long long>(incarnation));
+  const std::chrono::duration<double> now = std::chrono::steady_clock::now().time_since_epoch();
+  std::printf("accepted %lld %lld %llu %.3f\n", static_cast<long long>(first),
+              static_cast<long long>(_nextID - 1), static_cast<unsigned long long>(incarnation), now.count());
   std::fflush(stdout);
 }
 
