@@ -153,7 +153,7 @@ class Outbox : public testing::Test {
 
   CapturedLog log;
   TempDirectory directory;
-  HandClock clock;
+  HandClock clock{1'800'000'000};
   RecordingServer server;
   std::mutex mutex;
   std::condition_variable changed;
@@ -296,7 +296,7 @@ TEST_F(Outbox, PostsExpireUnlessTheirDateIsOfAClockThatWasNotSet) {
   begin();
   EXPECT_TRUE(isPutAside(post("undated")));
   end();
-  clock.set(1'700'000'000 + 8 * 24 * 3600);
+  clock.set(1'800'000'000 + 8 * 24 * 3600);
   begin();
   waitFor(Outcome::Expired, 1);
   server.start();
