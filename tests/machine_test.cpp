@@ -1,14 +1,11 @@
-// The daemon on a failing machine: disks, descriptors, and its own sudden end.
+// The daemon on a failing machine: disks, descriptors, memory.
 #include <gtest/gtest.h>
 #include <sched.h>
 #include <sys/mount.h>
 #include <sys/resource.h>
 
 #include <algorithm>
-#include <atomic>
 #include <csignal>
-#include <random>
-#include <thread>
 
 #include "tests/support/DaemonHarness.h"
 #include "tests/support/ProcessFacts.h"
@@ -135,47 +132,6 @@ TEST(Machine, WithoutMemoryItSaysSoAndEnds) {
   EXPECT_FALSE(client.reporting.sendMessageAndWait(message(3, {{"text", std::string(900'000, 'x')}})));
   EXPECT_EQ(harness.daemon().wait(), EXIT_FAILURE);
   EXPECT_NE(harness.daemon().errors().find("<3>main: Out of memory, ending\n"), std::string::npos);
-}
-
-// Before its signals are set up, a daemon ends like any program; it has not accepted anyone then.
-bool endedInOrder(int signal, int status, const std::string& log) {
-  if (status == 128 + signal) return signal == SIGKILL || log.find("start loop.") == std::string::npos;
-  return signal == SIGTERM && status == 0;
-}
-
-TEST(Machine, MayEndAtAnyMomentAndItsClientsReturnByThemselves) {
-  DaemonHarness harness;
-  harness.startDaemon();
-  auto options = harness.clientOptions();
-  options.lastReconnectWait = 20ms;
-  RoadClient client(harness, {}, std::nullopt, {}, options);
-  std::atomic<bool> stop{false};
-  std::thread sender([&] {
-    while (!stop) (void)client.reporting.sendMessageAndWait(message(3), 50ms);
-  });
-  const auto seed = std::random_device()();
-  SCOPED_TRACE("seed " + std::to_string(seed));
-  std::mt19937 random(seed);
-  const auto end = std::chrono::steady_clock::now() + 20s;
-  while (std::chrono::steady_clock::now() < end && !HasFailure()) {
-    std::this_thread::sleep_for(std::chrono::milliseconds(random() % 100));  // a random moment
-    const int signal = random() % 4 == 0 ? SIGKILL : SIGTERM;
-    harness.daemon().signal(signal);
-    const int status = harness.daemon().wait().value_or(-1);
-    const std::string log = harness.daemon().errors();
-    EXPECT_TRUE(endedInOrder(signal, status, log)) << "signal " << signal << ", status " << status << "\n"
-                                                   << log;
-    harness.launchDaemon();
-    if (random() % 2 == 0) {
-      EXPECT_TRUE(harness.daemon().waitForText("start loop.")) << harness.daemon().errors();
-    }
-  }
-  stop = true;
-  sender.join();
-  auto sent = client.reporting.sendMessageAndWait(message(5), ChildProcess::kPatience);
-  EXPECT_TRUE(sent) << sent.detail;
-  harness.waitForEventsOfMethod(5, 1);
-  EXPECT_EQ(harness.stopDaemon(), 0);
 }
 
 }  // namespace

@@ -30,14 +30,6 @@ class Queues : public testing::Test {
   std::shared_ptr<TimedQueue> queue = thread.makeQueue("queue");
 };
 
-TEST_F(Queues, RunTheirWorkInOrder) {
-  std::vector<int> order;  // guarded by the queue itself
-  for (int i = 0; i < 500; ++i) queue->submit([&, i] { order.push_back(i); });
-  drain();
-  ASSERT_EQ(order.size(), 500u);
-  EXPECT_TRUE(std::is_sorted(order.begin(), order.end()));
-}
-
 TEST_F(Queues, GoOnAfterWorkThatThrows) {
   test::CapturedLog log;
   queue->submit([] { throw std::runtime_error("broken"); });
@@ -45,24 +37,6 @@ TEST_F(Queues, GoOnAfterWorkThatThrows) {
   drain();
   EXPECT_EQ(log.count(3, "queue: work failed: broken"), 1);
   EXPECT_EQ(log.count(3, "queue: work failed"), 1);
-}
-
-TEST_F(Queues, TimersRepeatUntilTheyCancelThemselves) {
-  int fired = 0;
-  std::promise<void> done;
-  std::unique_ptr<TimedQueue::Source> timer;
-  queue->submit([&] {
-    timer = queue->makeTimer(milliseconds(0), milliseconds(1), [&] {
-      if (++fired < 3) return;
-      timer.reset();
-      done.set_value();
-    });
-  });
-  done.get_future().wait();
-  std::promise<void> later;
-  queue->submitAfter(milliseconds(20), [&] { later.set_value(); });
-  later.get_future().wait();
-  EXPECT_EQ(fired, 3);
 }
 
 TEST_F(Queues, SourcesLetGoOfTheirDescriptorWhenDestroyedElsewhere) {

@@ -25,29 +25,6 @@ TEST(Counters, CountByBackendAndReason) {
                                   {"wren", DropReason::NoURL, 5}}));
 }
 
-TEST(Counters, PutNamesBeyondTheBoundTogether) {
-  Counters counters;
-  for (int i = 0; i < 100; ++i) counters.count(std::to_string(i), DropReason::OverBound);
-  EXPECT_EQ(counters.snapshot().size(), 65u);
-  EXPECT_EQ(counts(counters).back(),
-            std::make_tuple(std::string("other"), DropReason::OverBound, std::uint64_t{36}));
-  counters.count("63", DropReason::OverBound);
-  EXPECT_EQ(counters.snapshot().size(), 65u);
-}
-
-TEST(Counters, HaveANameForEveryReason) {
-  const std::string_view names[] = {
-      "state-disabled",    "transport-error", "no-url",       "server-error-5xx", "over-bound",
-      "body-not-built",    "invalid-message", "no-backend",   "upload-failed",    "never-enabled",
-      "unacknowledged",    "not-aggregated",  "not-recorded", "adaptor-failed",   "server-refused",
-      "deferred",          "delivered-late",  "refused",      "expired",          "over-quota",
-      "consent-withdrawn", "damaged",         "not-written",
-  };
-  ASSERT_EQ(std::size(names), kDropReasonCount);
-  for (std::size_t i = 0; i <= kDropReasonCount; ++i)
-    EXPECT_EQ(nameOfDropReason(static_cast<DropReason>(i)), i < kDropReasonCount ? names[i] : "unknown");
-}
-
 TEST(SamplingDraw, FollowsTheDefaultSequence) {
   // The values of drand48 in a program that never seeds it.
   EXPECT_NEAR(nextSamplingDraw(), 0.0, 1e-9);

@@ -131,7 +131,7 @@ void BusConnection::sendOutgoing() {
 
 void BusConnection::wait(Time deadline) {
   if (_hasMore && !mustWait()) return;
-  const short wanted = isBackedUp() ? POLLOUT : mustWait() ? 0 : POLLIN;
+  const auto wanted = static_cast<short>(isBackedUp() ? POLLOUT : mustWait() ? 0 : POLLIN);
   pollfd polls[] = {{_socket.get(), wanted, 0}, {_wakeup->fd(), POLLIN, 0}};
   if (::poll(polls, 2, _isReady ? -1 : untilDeadline(deadline)) <= 0) return;
   if (polls[0].revents & (POLLHUP | POLLERR)) {

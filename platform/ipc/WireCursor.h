@@ -26,7 +26,7 @@ class WireCursor {
     const std::size_t end = (_at + to - 1) & ~(to - 1);
     if (end > _bytes.size()) return false;
     char padding = '\0';
-    for (; _at < end; ++_at) padding |= _bytes[_at];
+    for (; _at < end; ++_at) padding = static_cast<char>(padding | _bytes[_at]);
     return padding == '\0';
   }
 
