@@ -323,7 +323,13 @@ void SessionWorker::callsHaveLeft() {
 void SessionWorker::answered(Call call, BusAnswer& answer) noexcept {
   ClientCalls one;
   one.splice(one.begin(), _owed, call);
-  if (call->effect == CallEffect::Starts) startWasAnswered(answer);
+  if (call->effect == CallEffect::Starts) {
+    try {
+      startWasAnswered(answer);
+    } catch (const std::exception&) {
+      // No memory for the names of the backends; the session is not started again by itself.
+    }
+  }
   if (!answer.isError()) return finish(*call, ReportingStatus::Done, &answer);
   if (answer.errorName() == kDisconnected) {
     // A host that closes descriptors ends the session, whichever descriptor is noticed first.

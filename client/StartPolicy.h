@@ -7,9 +7,9 @@
 namespace vesk {
 
 /// A start that gave no configuration is repeated after 900 s, when the daemon may fetch a storebag again,
-/// and then after waits that double up to an hour. Each is up to a quarter longer at random, so that many
-/// clients don't return together. A start that gave one is repeated after the refresh interval, if there is
-/// one. Depends only on its arguments. Not thread-safe.
+/// and then after waits that double, up to an hour. Each is up to a quarter longer at random within that, so
+/// that many clients don't return together. A start that gave one is repeated after the refresh interval, if
+/// there is one. Depends only on its arguments. Not thread-safe.
 class StartPolicy {
  public:
   using Time = std::chrono::steady_clock::time_point;
@@ -17,10 +17,12 @@ class StartPolicy {
   static constexpr std::chrono::seconds kFirstWait{900};
   static constexpr std::chrono::seconds kLongestWait{3600};
 
-  /// `refreshInterval`: 0 for none.
+  /// `refreshInterval`: 0 for none, otherwise at least a second.
   explicit StartPolicy(std::chrono::milliseconds refreshInterval)
-      : _refreshInterval(std::clamp<std::chrono::milliseconds>(refreshInterval, std::chrono::milliseconds(0),
-                                                               std::chrono::hours(24 * 365))) {}
+      : _refreshInterval(refreshInterval.count() <= 0
+                             ? std::chrono::milliseconds(0)
+                             : std::clamp<std::chrono::milliseconds>(refreshInterval, std::chrono::seconds(1),
+                                                                     std::chrono::hours(24 * 365))) {}
 
   /// When the next start is due; the end of time if none is.
   Time due() const noexcept { return _due; }
@@ -29,7 +31,8 @@ class StartPolicy {
   void started() noexcept { _due = Time::max(); }
   /// `random`: from [0, 1).
   void answeredWithNothing(Time now, double random) noexcept {
-    _due = now + std::chrono::duration_cast<Time::duration>(_wait * (1 + random / 4));
+    _due = now + std::min<Time::duration>(
+                     std::chrono::duration_cast<Time::duration>(_wait * (1 + random / 4)), kLongestWait);
     _wait = std::min(_wait * 2, kLongestWait);
   }
   void answeredWithConfiguration(Time now) noexcept {

@@ -10,14 +10,24 @@ std::optional<Dictionary> StorebagCache::storebagForClientType(std::int32_t clie
   if (!name) return std::nullopt;
   auto record = _records.find(std::string(*name));
   if (record == _records.end()) {
-    if (auto kept = keptRecord(clientType)) record = _records.emplace(*name, *std::move(kept)).first;
+    if (auto kept = keptRecord(clientType)) {
+      record = _records.emplace(*name, *std::move(kept)).first;
+      publish(record->first, record->second);
+    }
   }
-  if (record == _records.end() || !isFresh(record->second, clientType)) {
+  if (record == _records.end() || mustReplace(*name, record->second) ||
+      !isFresh(record->second, clientType)) {
     fetchAndCacheStorebag(clientType);
     record = _records.find(std::string(*name));
   }
   if (_hasExpired && _hasExpired(*name)) return std::nullopt;
   return record->second.storebagData;
+}
+
+// However fresh it is, an expired storebag is fetched again, as often as after a failure.
+bool StorebagCache::mustReplace(std::string_view name, const Record& record) const {
+  if (!_hasExpired || !record.storebagFetchTime || !_hasExpired(name)) return false;
+  return std::chrono::abs(_clock.now() - *record.storebagFetchTime) >= kMinimumWaitAfterFailure;
 }
 
 // Uses the absolute age: if the clock was set back, the wait gets longer or shorter, but fetching is never
@@ -64,6 +74,24 @@ void StorebagCache::fetchAndCacheStorebag(std::int32_t clientType) {
         static_cast<std::int32_t>(maxAge * KeptStorebagSource::kShortening * _kept->random());
   }
   if (lastModified) record.storebagLastModified = std::move(lastModified);
+  publish(std::string(*storebagNameForClientType(clientType)), record);
+}
+
+void StorebagCache::publish(const std::string& name, const Record& record) {
+  MutexLock lock(_mutex);
+  _published[name] = {.name = name,
+                      .section = record.storebagData,
+                      .version = record.storebagVersion,
+                      .fetched = record.storebagFetchTime,
+                      .isGood = record.storebagFetchState == FetchState::Successful,
+                      .maxAge = record.storebagMaxAge};
+}
+
+std::vector<StorebagStatus> StorebagCache::status() const {
+  MutexLock lock(_mutex);
+  std::vector<StorebagStatus> all;
+  for (const auto& [name, status] : _published) all.push_back(status);
+  return all;
 }
 
 std::optional<StorebagCache::Record> StorebagCache::keptRecord(std::int32_t clientType) const {

@@ -8,8 +8,10 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include <VeskReporting/values/Value.h>
+#include "platform/sync/Mutex.h"
 #include "platform/time/Clock.h"
 #include "storebag/StorebagFetch.h"
 
@@ -39,9 +41,19 @@ struct KeptStorebagSource {
   static constexpr double kShortening = 0.1;
 };
 
-/// Keeps one record per storebag name, in memory, for the life of the daemon. Not thread-safe: the agent
-/// calls it with its monitor held, also during a fetch, so that two sessions never fetch the same storebag at
-/// once.
+/// What the daemon knows of a storebag, for operators.
+struct StorebagStatus {
+  std::string name;
+  std::optional<Dictionary> section;  ///< in force; nullopt if there is none
+  std::optional<std::string> version;
+  std::optional<WallTime> fetched;  ///< the end of the last attempt
+  bool isGood = false;              ///< the last attempt succeeded
+  std::int32_t maxAge = 0;          ///< seconds
+};
+
+/// Keeps one record per storebag name, in memory, for the life of the daemon. Except for `status`, not
+/// thread-safe: the agent calls it with its monitor held, also during a fetch, so that two sessions never
+/// fetch the same storebag at once.
 class StorebagCache {
  public:
   /// The wait after a failed attempt.
@@ -59,6 +71,9 @@ class StorebagCache {
   /// The version of the last good section; never fetches.
   std::optional<std::string> versionForClientType(std::int32_t clientType) const;
 
+  /// All records. Thread-safe; doesn't wait for a fetch.
+  std::vector<StorebagStatus> status() const;
+
  private:
   enum class FetchState { Successful, Failure };
 
@@ -73,15 +88,21 @@ class StorebagCache {
 
   /// Whether the record may be served without a fetch. Logs the reason.
   bool isFresh(const Record& record, std::int32_t clientType) const;
+  bool mustReplace(std::string_view name, const Record& record) const;
   void fetchAndCacheStorebag(std::int32_t clientType);
   /// A new record from the kept storebag, fresh until its first fetch is due; nullopt if there is none.
   std::optional<Record> keptRecord(std::int32_t clientType) const;
+
+  void publish(const std::string& name, const Record& record);
 
   const StorebagFetcher _fetch;
   const std::optional<KeptStorebagSource> _kept;
   const WallClock& _clock;
   const StorebagExpiry _hasExpired;
   std::map<std::string, Record> _records;
+
+  mutable Mutex _mutex;  // a leaf
+  std::map<std::string, StorebagStatus> _published VESK_GUARDED_BY(_mutex);
 };
 
 }  // namespace vesk

@@ -34,8 +34,14 @@ std::optional<KeptStorebags::Kept> KeptStorebags::load(std::string_view name) co
   const std::string path = pathFor(name);
   const auto file = readTrustedFile(path, kMaximumFile, TrustedOwner::OwnUser);
   if (!file && file.error().kind == Error::Kind::Missing) return std::nullopt;
-  auto kept = file ? parse(name, *file) : file.error();
-  if (kept) return *std::move(kept);
+  auto kept = file ? parse(*file) : file.error();
+  if (kept) {
+    const auto accepted = _acceptance ? _acceptance->accept(name, kept->payload) : Result<void>();
+    if (accepted) return *std::move(kept);
+    // The file stays: after the next start, its serial still keeps older ones out.
+    VESK_LOG_ERROR("KeptStorebags: %s is not used: %s", path.c_str(), accepted.error().text.c_str());
+    return std::nullopt;
+  }
   VESK_LOG_ERROR("KeptStorebags: %s is removed: %s", path.c_str(), kept.error().text.c_str());
   ::unlink(path.c_str());
   return std::nullopt;
@@ -46,7 +52,7 @@ std::string KeptStorebags::pathFor(std::string_view name) const {
 }
 
 // The first line is the server's date, which may be empty.
-Result<KeptStorebags::Kept> KeptStorebags::parse(std::string_view name, std::string_view file) const {
+Result<KeptStorebags::Kept> KeptStorebags::parse(std::string_view file) const {
   const auto end = file.find('\n');
   if (end == std::string_view::npos) return malformed("it is incomplete");
   const auto document = parsePropertyList(file.substr(end + 1));
@@ -55,10 +61,6 @@ Result<KeptStorebags::Kept> KeptStorebags::parse(std::string_view name, std::str
   auto verification = verifySignedDocument(*document->dictionary(), _publicKeys());
   if (verification.verdict != Verification::Verdict::Good)
     return malformed("its signature can not be verified");
-  if (_acceptance) {
-    if (const auto accepted = _acceptance->accept(name, verification.payload); !accepted)
-      return accepted.error();
-  }
   Kept kept{.payload = std::move(verification.payload), .lastModified = std::nullopt};
   if (end > 0) kept.lastModified = std::string(file.substr(0, end));
   return kept;

@@ -33,13 +33,13 @@ class KeptStorebags {
   void keep(std::string_view name, std::string_view document,
             const std::optional<std::string>& lastModified) const;
 
-  /// The kept storebag of that name. A file that doesn't hold one that verifies and is accepted is removed,
-  /// with one line of level 3.
+  /// The kept storebag of that name. A file that doesn't hold one that verifies is removed; one that is
+  /// not accepted stays, but is not used. Either gives one line of level 3.
   std::optional<Kept> load(std::string_view name) const;
 
  private:
   std::string pathFor(std::string_view name) const;
-  Result<Kept> parse(std::string_view name, std::string_view file) const;
+  Result<Kept> parse(std::string_view file) const;
 
   const std::string _directory;
   const std::function<PublicKeys()> _publicKeys;

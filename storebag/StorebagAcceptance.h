@@ -31,6 +31,9 @@ class StorebagAcceptance {
   /// against it.
   Result<void> accept(std::string_view name, const Dictionary& payload);
 
+  /// The built-in storebag is in force under that name, and does not expire. The highest serial stays.
+  void usesBuiltIn(std::string_view name);
+
   /// Whether the storebag of that name that was accepted last has expired. Logs it once.
   bool hasExpired(std::string_view name);
 

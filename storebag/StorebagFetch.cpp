@@ -137,6 +137,7 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryF
     // The caller has the kept storebag already.
     if (kept && kept->load(name)) return std::nullopt;
     VESK_LOG_INFO("fetchStorebagWithName: Loading default storebag '%s'", std::string(name).c_str());
+    if (library.acceptance) library.acceptance->usesBuiltIn(name);
     return fallbackStorebag();
   }
   maxAge = maxAgeFromCacheControl(listInHeader(*result.response, "Cache-Control"));

@@ -230,6 +230,7 @@ TEST_F(StorebagFetch, SignedKeysProtectAgainstAnotherAnOldAndAnExpiredStorebag) 
       {{}, "it has no serial, after 5"},
       {{{"serial", -1}}, "its serial is no integer from 0"},
       {{{"serial", "6"}}, "its serial is no integer from 0"},
+      {{{"serial", 6.9}}, "its serial is no integer from 0"},
       {{{"serial", 6}, {"expires", seconds(-1)}}, "it has expired"},
       {{{"serial", 6}, {"expires", "2027-01-01"}}, "its key 'expires' is no date"},
   };
@@ -264,6 +265,15 @@ TEST_F(StorebagFetch, SignedKeysProtectAgainstAnotherAnOldAndAnExpiredStorebag) 
   EXPECT_TRUE(keptStorebagForClientType(*kept, 5));
   serve(signedStorebag(payload({{"serial", 7}})));
   EXPECT_FALSE(fetch()) << "the kept one's serial survives a restart";
+  serve(signedStorebag(payload({{"serial", 9}, {"expires", seconds(60)}})));
+  EXPECT_TRUE(fetch());
+  clock.advance(std::chrono::seconds(61));
+  StorebagAcceptance later(clock, [] { return true; });
+  library.acceptance = &later;
+  kept = std::make_unique<KeptStorebags>((testRoot() / "kept-serial").string(), library.publicKeys, &later);
+  EXPECT_FALSE(keptStorebagForClientType(*kept, 5)) << "it has expired";
+  serve(signedStorebag(payload({{"serial", 8}})));
+  EXPECT_FALSE(fetch()) << "an expired one's serial counts";
 }
 
 TEST_F(StorebagFetch, AKeptStorebagServesUntilItIsTamperedWith) {

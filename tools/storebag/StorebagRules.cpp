@@ -31,6 +31,10 @@ constexpr Shape kText{"a text", isText};
 constexpr Shape kNumber{"a number", [](const Value& value) { return value.isNumber(); }};
 constexpr Shape kNumberOrText{"a number or a text",
                               [](const Value& value) { return value.isNumber() || isText(value); }};
+constexpr Shape kSerial{"an integer from 0", [](const Value& value) {
+                          return value.real() == nullptr && value.boolean() == nullptr &&
+                                 value.asInteger().value_or(-1) >= 0;
+                        }};
 constexpr Shape kDate{"a date", [](const Value& value) { return value.date() != nullptr; }};
 constexpr Shape kBoolean{"true or false", [](const Value& value) { return value.boolean() != nullptr; }};
 constexpr Shape kTexts{"a list of texts", isListOf<isText>};
@@ -108,7 +112,7 @@ constexpr std::array kTop{
     KeyRule{"version", kText, "the storebag has no version"},
     KeyRule{"refresh_cycle", kNumber},
     KeyRule{"name", kText},
-    KeyRule{"serial", kNumber},
+    KeyRule{"serial", kSerial},
     KeyRule{"expires", kDate},
 };
 

@@ -47,9 +47,9 @@ struct Invocation {
   std::string source;           ///< source or signed document, depending on the command
   std::string output;
   bool lenient = false;
-  std::string storebagName;  ///< the signed keys; empty or nullopt: as in the source
+  std::optional<std::string> storebagName;  ///< the signed keys; empty or nullopt: as in the source
   std::optional<std::int64_t> serial;
-  std::string expires;  ///< a date, or a date and time of UTC
+  std::optional<std::string> expires;  ///< a date, or a date and time of UTC
 };
 
 /// Throws `Exit` if the tool should just exit; help, version or error have been printed then.

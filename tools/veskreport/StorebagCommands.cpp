@@ -44,9 +44,11 @@ Value dateMeantBy(const std::string& text) {
 
 Dictionary withSignedKeys(const Dictionary& payload, const Invocation& invocation) {
   MutableDictionary all(payload);
-  if (!invocation.storebagName.empty()) all.set("name", invocation.storebagName);
+  if (invocation.storebagName && invocation.storebagName->empty())
+    throw std::runtime_error("--name: it is empty");
+  if (invocation.storebagName) all.set("name", *invocation.storebagName);
   if (invocation.serial) all.set("serial", *invocation.serial);
-  if (!invocation.expires.empty()) all.set("expires", dateMeantBy(invocation.expires));
+  if (invocation.expires) all.set("expires", dateMeantBy(*invocation.expires));
   return all.share();
 }
 

@@ -86,8 +86,9 @@ struct ReportingOptions {
   std::chrono::milliseconds firstReconnectWait{50};
   std::chrono::milliseconds lastReconnectWait{5'000};
   /// How often a started session starts anew, so that a program that runs for long takes up a new storebag or
-  /// consent, or reports again after a server's error. 0: never. Each start sends a session's start event. A
-  /// start that gave no configuration is repeated in any case, after 15 minutes at the earliest.
+  /// consent, or reports again after a server's error. 0: never; otherwise at least a second. Each start
+  /// sends a session's start event. A start that gave no configuration is repeated in any case, after 15
+  /// minutes at the earliest.
   std::chrono::milliseconds refreshInterval{0};
 };
 
