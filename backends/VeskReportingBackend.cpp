@@ -23,6 +23,19 @@ VeskReportingBackend::VeskReportingBackend(const std::string& name, const std::o
       _services(services),
       _samplingFactor(nextSamplingDraw()) {}
 
+std::string_view nameOfState(std::int32_t state) {
+  switch (state) {
+    case BackendStatePending:
+      return "pending";
+    case BackendStateEnabled:
+      return "enabled";
+    case BackendStateOverride:
+      return "override";
+    default:
+      return "disabled";
+  }
+}
+
 std::string VeskReportingBackend::convertIntoSHA256(std::string_view text) { return hexLower(sha256(text)); }
 
 void VeskReportingBackend::cleanup() {

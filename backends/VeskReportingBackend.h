@@ -26,6 +26,9 @@ enum BackendState : std::int32_t {
 };
 
 /// A message's flag: one of these, or both. With any other value it is an ordinary message.
+/// "pending", "enabled", "disabled" or "override".
+std::string_view nameOfState(std::int32_t state);
+
 enum MessageFlag : std::int32_t {
   MessageFlagRealtime = 1,
   MessageFlagOverrideSampling = 2,
@@ -89,6 +92,8 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
   /// Also written by the completion of a post.
   std::int32_t state() const noexcept { return _state.load(); }
   void setState(std::int32_t state) noexcept { _state.store(state); }
+  /// Why it doesn't send, for operators; nullopt if it does or if there is nothing to say.
+  virtual std::optional<std::string> stateReason() const { return std::nullopt; }
   /// This backend's sampling draw, uniform in [0, 1).
   double samplingFactor() const noexcept { return _samplingFactor.load(); }
   void setSamplingFactor(double factor) noexcept { _samplingFactor.store(factor); }

@@ -11,6 +11,7 @@
 
 #include "common/PersistentIdentifiers.h"
 #include "common/Resources.h"
+#include "daemon/Diagnostics.h"
 #include "daemon/ReportingdAgent.h"
 #include "platform/device/DeviceInformation.h"
 #include "platform/files/RootPrefix.h"
@@ -136,6 +137,10 @@ OutboxMode outboxMode() {
   return OutboxMode::Outage;
 }
 
+const char* nameOf(OutboxMode mode) {
+  return mode == OutboxMode::Off ? "off" : mode == OutboxMode::Always ? "always" : "outage";
+}
+
 // In the mode "always" callers wait for this long, so that many of them share a transaction.
 constexpr std::chrono::milliseconds kGroupCommit{50};
 
@@ -213,10 +218,18 @@ struct Daemon::Parts {
         agent(std::make_shared<ReportingdAgent>(
             sessionServices, storebagFetcher(), busyMarker, keptStorebagSource(),
             [this](std::string_view name) { return acceptance.hasExpired(name); })),
+        diagnostics(std::make_shared<Diagnostics>(Diagnostics::Sources{
+            .agent = *agent,
+            .services = backendServices,
+            .outbox = outbox.get(),
+            .settings = {{"outbox", nameOf(mode)}, {"keepStorebags", keptStorebags != nullptr}},
+            .publicKeys = publicKeysDER})),
         listener(listenerOptions(serviceManager)) {
     backendServices.heldBudget = std::make_shared<HeldBudget>(heldLimits());
     backendServices.postBudget = std::make_shared<PostBudget>(PostBudget::Limits{}, outbox.get());
     listener.setDelegate(agent.get());
+    agent->setDiagnostics(wire::kDiagnosticsPath,
+                          [this](const IPCPeer& peer) { return diagnosticsObject(diagnostics, peer); });
     if (!outbox) return;
     outbox->setConsent(diagnosticsSubmissionConsent());
     outbox->start(http);
@@ -267,6 +280,7 @@ struct Daemon::Parts {
   std::unique_ptr<PostOutbox> outbox;
   HTTPClient http;
   std::shared_ptr<ReportingdAgent> agent;
+  std::shared_ptr<const Diagnostics> diagnostics;
   IPCListener listener;
 };
 

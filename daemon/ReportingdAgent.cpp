@@ -51,6 +51,7 @@ bool ReportingdAgent::shouldAcceptNewConnection(const std::shared_ptr<IPCConnect
       .invalidation = [session, agent = shared_from_this()] { agent->sessionInvalidated(session); },
       .loss = [&counters = _services.backends.counters](
                   std::size_t calls) { counters.count("session", DropReason::NotAggregated, calls); }};
+  if (_makeDiagnostics) handlers.otherObjects[_diagnosticsPath] = _makeDiagnostics(connection->peer());
   // Last, so that no failure leaves behind a session without a connection to end it.
   {
     MutexLock lock(_sessionListMutex);
@@ -66,6 +67,11 @@ void ReportingdAgent::sessionInvalidated(const std::shared_ptr<ReportingdSession
   VESK_LOG_DEBUG("listener: Orvo connection to %s was invalidated", session->description().c_str());
   removeFromSessionList(session);
   removeFromCorrelation(session);
+}
+
+std::vector<std::shared_ptr<ReportingdSession>> ReportingdAgent::sessions() {
+  MutexLock lock(_sessionListMutex);
+  return _sessionList;
 }
 
 // The caller holds a reference, so neither erasure destroys the session under a lock.

@@ -33,6 +33,19 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
                   std::optional<KeptStorebagSource> keptStorebags = std::nullopt,
                   StorebagExpiry hasExpired = {});
 
+  /// Makes a connection's second object, exported under `path`. Call before connections are accepted.
+  using ObjectMaker = std::function<std::shared_ptr<IPCExportedObject>(const IPCPeer& peer)>;
+  void setDiagnostics(std::string path, ObjectMaker make) {
+    _diagnosticsPath = std::move(path);
+    _makeDiagnostics = std::move(make);
+  }
+
+  /// For operators; thread-safe. The caller may end up as a session's last holder.
+  std::vector<std::shared_ptr<ReportingdSession>> sessions();
+  std::vector<StorebagStatus> storebagStatus() const VESK_NO_THREAD_SAFETY_ANALYSIS {
+    return _cachedStorebags.status();
+  }
+
   // --- IPCListenerDelegate
   bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) override;
   /// Called when a session's connection has ended. Removes the session from the list and from every family.
@@ -76,6 +89,10 @@ class ReportingdAgent final : public ReportingdSessionDelegate,
   // wait for a storebag.
   std::atomic<int> _sessionCount{0};
   std::atomic<int> _familyCount{0};
+
+  // Constant once connections are accepted.
+  std::string _diagnosticsPath;
+  ObjectMaker _makeDiagnostics;
 
   // Constant after construction.
   const SessionServices& _services;

@@ -28,6 +28,18 @@ inline constexpr Member kUploadFile{"uploadFileAtPath", "sah", "b"};
 inline constexpr Member kUploadLogData{"uploadLogData", "av", "bas"};
 inline constexpr Member kSendMessageWithSessionInfo{"sendMessageWithSessionInfo", "a{sv}aa{sv}qqaa{sv}", "s"};
 
+// The daemon's second object, for operators.
+inline constexpr const char* kDiagnosticsPath = "/com/corvane/veskreportingd/diagnostics";
+inline constexpr const char* kDiagnosticsInterface = "com.corvane.veskreportingd.DiagnosticsInterface";
+inline constexpr Member kGetStatus{"getStatus", "", "a{sv}"};
+inline constexpr Member kExplain{"explain", "a{sv}", "a{sv}"};
+inline constexpr const char* kDiagnosticsIntrospection =
+    "  <interface name=\"com.corvane.veskreportingd.DiagnosticsInterface\">\n"
+    "    <method name=\"getStatus\"><arg name=\"status\" type=\"a{sv}\" direction=\"out\"/></method>\n"
+    "    <method name=\"explain\"><arg name=\"request\" type=\"a{sv}\" direction=\"in\"/>"
+    "<arg name=\"explanation\" type=\"a{sv}\" direction=\"out\"/></method>\n"
+    "  </interface>\n";
+
 // The client's object. Its method has no answer.
 inline constexpr const char* kReplyInterface = "com.corvane.veskreportingd.ClientSessionReplyInterface";
 inline constexpr Member kSendMessageToClient{"sendMessageToClient", "aa{sv}dqqaa{sv}", ""};

@@ -370,6 +370,33 @@ void ReportingdSession::receivedUserInfo(const std::optional<Dictionary>& userIn
   updateSessionWithDefaultSessionInfo();
 }
 
+Dictionary ReportingdSession::diagnosis() const {
+  const auto info = sessionInfo(), sender = userInfo();
+  const auto textOf = [](const std::optional<Dictionary>& from, const char* key) {
+    const auto text = from ? from->text(key) : std::nullopt;
+    return text ? Value(*text) : Value();
+  };
+  MutableDictionary states;
+  if (const auto set = backends()) {
+    for (const auto& [name, backend] : *set) {
+      MutableDictionary each(Dictionary{{"state", std::string(nameOfState(backend->state()))}});
+      const auto reason = backend->state() == BackendStateEnabled ? std::nullopt : backend->stateReason();
+      if (reason) each.set("reason", *reason);
+      states.set(name, each.share());
+    }
+  }
+  return Dictionary{
+      {"process", static_cast<std::int64_t>(_connection->peer().process)},
+      {"user", static_cast<std::int64_t>(user())},
+      {"sessionID", static_cast<std::int64_t>(sessionID())},
+      {"clientType", info ? integerForKey(*info, kVeskReportingSessionInfoClientType).value_or(0) : 0},
+      {"clientName", textOf(sender, kVeskReportingUserInfoClientName)},
+      {"serviceName", textOf(sender, kVeskReportingUserInfoServiceName)},
+      {"level", static_cast<std::int64_t>(getSessionHierarchy())},
+      {"storebagVersion", storebagVersion().value_or("")},
+      {"backends", states.share()}};
+}
+
 // --- Family
 
 std::int32_t ReportingdSession::getSessionHierarchy() const {

@@ -76,6 +76,11 @@ class ReportingdSession final : public ClientSessionInterface,
   /// `correlationKeyForUserInfo` of the current user info, cached because every message needs it.
   std::shared_ptr<const std::string> correlationKey() const;
   std::string description() const;
+  /// The user of its client process.
+  uid_t user() const noexcept { return _client.user; }
+  /// For operators: `process`, `user`, `sessionID`, `clientType`, `clientName`, `serviceName`, `level`,
+  /// `storebagVersion`, `backends` (by name: `state` and `reason`). Thread-safe.
+  Dictionary diagnosis() const;
 
   // --- Family
   /// The level in the family; 0 is the top.

@@ -2,6 +2,7 @@
 
 #include "backends/https/EventRecord.h"
 #include "backends/https/PolicyLog.h"
+#include "backends/https/PostExplanation.h"
 #include "platform/log/SystemLog.h"
 #include "storebag/Settings.h"
 #include "storebag/StorebagProfile.h"
@@ -44,19 +45,15 @@ HTTPSPostBackend::HTTPSPostBackend(const std::string& name, const Dictionary& pr
       _uuidRespectDnu(services.persistentIdentifierForDNU(true)),
       _uuidOverrideDnu(services.persistentIdentifierForDNU(false)) {
   MutexLock lock(_mutex);
-  _settings._batchEvents = identity._batchEvents;
-  _settings._postURL = preferenceStringForKey("httpsPostURL");
+  _settings = initialPostSettings(identity._batchEvents);
   if (_settings._postURL) {
     VESK_LOG_DEBUG("HTTPSPostBackend(initWithName): Using user default '%s' for postURL",
                    _settings._postURL->c_str());
   }
-  _settings._useDefaultPostURL = _settings._postURL.has_value();
-  _settings._realtimePostURL = preferenceStringForKey("httpsRealtimePostURL");
   if (_settings._realtimePostURL) {
     VESK_LOG_DEBUG("HTTPSPostBackend(initWithName): Using user default '%s' for realtimePostURL",
                    _settings._realtimePostURL->c_str());
   }
-  _settings._useDefaultRealtimePostURL = _settings._realtimePostURL.has_value();
   _displayURL = profileText(name, profile, "display_url");
 }
 
@@ -76,6 +73,11 @@ void HTTPSPostBackend::setPostURL(const std::optional<std::string>& url) {
   _settings._postURL = url;
 }
 
+std::optional<std::string> HTTPSPostBackend::stateReason() const {
+  MutexLock lock(_mutex);
+  return _stateReason;
+}
+
 std::int32_t HTTPSPostBackend::updateBackendState() {
   const double draw = samplingFactor();
   auto decision = PostPolicy::decide({.profile = _profile,
@@ -92,6 +94,9 @@ std::int32_t HTTPSPostBackend::updateBackendState() {
     if (step.rule == "filters" && decision.filters) _filters.createFiltersFromArray(*decision.filters, _name);
   }
   if (decision.filters) setSamplingThreshold(decision.samplingThreshold);
+  const auto* reason = decision.reason();
+  _stateReason =
+      reason && decision.state != BackendStateEnabled ? std::optional(reasonOf(*reason)) : std::nullopt;
   _settings = std::move(decision.settings);
   setHierarchy(_settings._hierarchy);
   return decision.state;
@@ -319,6 +324,10 @@ void HTTPSPostBackend::postCompleted(const HTTPResult& result, std::size_t event
   }
   VESK_LOG_INFO("postJSONMessage: backend %s disabled by server %ld return code", _name.c_str(), status);
   setState(BackendStateDisabled);
+  {
+    MutexLock lock(_mutex);
+    _stateReason = "the server answered with status " + std::to_string(status);
+  }
   _services.counters.count(_name, DropReason::ServerError5xx, eventCount);
 }
 

@@ -26,6 +26,7 @@ class HTTPSPostBackend final : public VeskReportingBackend {
 
   std::optional<std::string> postURL() const;
   void setPostURL(const std::optional<std::string>& url);
+  std::optional<std::string> stateReason() const override;
 
  protected:
   std::optional<std::string> sendMessageInTurn(const std::optional<Dictionary>& payload,
@@ -86,6 +87,7 @@ class HTTPSPostBackend final : public VeskReportingBackend {
 
   // Guarded by _mutex.
   PostPolicy::Settings _settings VESK_GUARDED_BY(_mutex);
+  std::optional<std::string> _stateReason VESK_GUARDED_BY(_mutex);  ///< unless it is enabled
   std::unique_ptr<EventBatch> _batchedEvents VESK_GUARDED_BY(_mutex);
   EventFilters _filters VESK_GUARDED_BY(_mutex);
 };

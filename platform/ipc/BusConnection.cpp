@@ -45,7 +45,7 @@ BusConnection::BusConnection(FileDescriptor socket, std::uint64_t serial, const 
 
 void BusConnection::resume(IPCHandlers handlers) {
   if (_started.exchange(true)) return;
-  _router.setExportedObject(std::move(handlers.object));
+  _router.setExportedObject(std::move(handlers.object), std::move(handlers.otherObjects));
   _handlers = std::move(handlers);
   try {
     _registry->launch([self = shared_from_this()] { self->run(); });
@@ -263,7 +263,7 @@ void BusConnection::dropHandlers() noexcept {
   auto interruption = std::exchange(_handlers.interruption, nullptr);
   auto invalidation = std::exchange(_handlers.invalidation, nullptr);
   auto beforeSending = std::exchange(_handlers.beforeSending, nullptr);
-  auto object = _router.takeExportedObject();
+  auto objects = _router.takeExportedObjects();
 }
 
 void BusConnection::close() noexcept {

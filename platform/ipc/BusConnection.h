@@ -104,7 +104,7 @@ class BusConnection final : public IPCConnection, public std::enable_shared_from
   // Set before `resume`, then used only by the thread.
   FileDescriptor _socket;
   CallRouter _router;
-  IPCHandlers _handlers;  // except for the object, which the router has
+  IPCHandlers _handlers;  // except for the objects, which the router has
 
   // Used only by the thread.
   SaslServer _sasl;

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <fstream>
 #include <iterator>
+#include <set>
 
 #include "platform/ipc/IPCIncomingCall.h"
 #include "platform/log/SystemLog.h"
@@ -73,36 +74,46 @@ void CallRouter::warn(std::string_view member, const char* what) {
   }
 }
 
+void CallRouter::setExportedObject(std::shared_ptr<IPCExportedObject> object, Objects others) {
+  _objects = std::move(others);
+  if (object) _objects[_objectPath] = std::move(object);
+}
+
+std::shared_ptr<IPCExportedObject> CallRouter::objectAt(std::string_view path) const {
+  const auto found = _objects.find(path);
+  return found == _objects.end() ? nullptr : found->second;
+}
+
 void CallRouter::route(Message& message) {
   const MessageHeader& header = *message.header;
   if (header.type != MessageType::Call) return;
   IPCIncomingCall call(message, _outbox, _owner, _limits);
+  // Keeps the object alive during its call, even if the call makes the connection drop it.
+  const auto object = objectAt(header.path);
   if (header.interfaceName == kPeer) {
     servePeer(call);
   } else if (header.interfaceName == kIntrospectable) {
     serveIntrospectable(call, header.path);
-  } else if (header.path != _objectPath || !_object) {
+  } else if (!object) {
     call.refuse(kErrorUnknownObject, kNoSuchObject);
   } else if (header.interfaceName == kProperties) {
-    serveProperties(call);
-  } else if (!header.interfaceName.empty() && header.interfaceName != _object->interfaceName()) {
+    serveProperties(call, *object);
+  } else if (!header.interfaceName.empty() && header.interfaceName != object->interfaceName()) {
     call.refuse(kErrorUnknownInterface, kNoSuchInterface);
   } else {  // D-Bus allows callers to omit the interface
-    serveObject(call);
+    serveObject(call, *object);
   }
   if (call.complaint()) warn(call.member(), call.complaint());
 }
 
-void CallRouter::serveObject(IPCIncomingCall& call) {
-  // Keeps the object alive during its call, even if the call makes the connection drop it.
-  auto object = _object;
+void CallRouter::serveObject(IPCIncomingCall& call, IPCExportedObject& object) {
   auto fail = [&](const char* what) {
     VESK_LOG_ERROR("ipc: %s: %.*s failed%s", _connectionName.c_str(), static_cast<int>(call.member().size()),
                    call.member().data(), what);
     if (call.expectsReply()) call.refuse(kErrorFailed, "The call failed");
   };
   try {
-    object->handle(call);
+    object.handle(call);
     if (call.expectsReply() && !call.isSettled()) call.refuse(kErrorFailed, "The call was not answered");
   } catch (const std::exception& error) {
     fail((std::string(": ") + error.what()).c_str());
@@ -128,20 +139,23 @@ void CallRouter::serveIntrospectable(IPCIncomingCall& call, std::string_view pat
   if (call.member() != "Introspect") return call.refuse(kErrorUnknownMethod, kNoSuchMethod);
   std::string xml = kDoctype;
   xml += "<node>\n";
-  if (path == _objectPath && _object) {
+  std::set<std::string_view> children;
+  for (const auto& [each, exported] : _objects) {
+    if (const auto child = childTowards(path, each); !child.empty()) children.insert(child);
+  }
+  if (const auto object = objectAt(path)) {
     xml += kStandardInterfaces;
-    xml += _object->introspection();
-  } else if (auto child = childTowards(path, _objectPath); !child.empty()) {
-    xml.append("  <node name=\"").append(child).append("\"/>\n");
-  } else {
+    xml += object->introspection();
+  } else if (children.empty()) {
     return call.refuse(kErrorUnknownObject, kNoSuchObject);
   }
+  for (const auto child : children) xml.append("  <node name=\"").append(child).append("\"/>\n");
   xml += "</node>\n";
   call.answer({IPCArgument(std::move(xml))});
 }
 
 /// The interfaces here have no properties.
-void CallRouter::serveProperties(IPCIncomingCall& call) {
+void CallRouter::serveProperties(IPCIncomingCall& call, const IPCExportedObject& object) {
   std::string interfaceName;
   std::string property;
   Value value;
@@ -154,7 +168,7 @@ void CallRouter::serveProperties(IPCIncomingCall& call) {
   } else {
     return call.refuse(kErrorUnknownMethod, kNoSuchMethod);
   }
-  const std::string_view known[] = {"", _object->interfaceName(), kPeer, kIntrospectable, kProperties};
+  const std::string_view known[] = {"", object.interfaceName(), kPeer, kIntrospectable, kProperties};
   if (std::find(std::begin(known), std::end(known), interfaceName) == std::end(known)) {
     return call.refuse(kErrorUnknownInterface, kNoSuchInterface);
   }

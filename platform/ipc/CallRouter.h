@@ -1,6 +1,8 @@
 // Routes incoming calls to the exported object. Private to platform/ipc.
 #pragma once
 
+#include <functional>
+#include <map>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -15,25 +17,30 @@ namespace vesk {
 
 class IPCIncomingCall;
 
-/// Passes method calls to the object exported under one path, serves D-Bus's standard interfaces, and answers
-/// other calls with the standard errors. Drops signals and stray answers. Used on the connection's thread.
+/// Passes method calls to the objects exported under their paths, serves D-Bus's standard interfaces, and
+/// answers other calls with the standard errors. Drops signals and stray answers. Used on the connection's
+/// thread.
 class CallRouter {
  public:
   /// `owner`: see IPCIncomingCall. `limits`: for the arguments of one call.
   CallRouter(std::string objectPath, std::string connectionName, std::shared_ptr<Outbox> outbox,
              const ExtensionOwner& owner, CodecLimits limits = {});
 
-  void setExportedObject(std::shared_ptr<IPCExportedObject> object) { _object = std::move(object); }
-  /// Detaches the object; it receives no further calls. The caller releases it.
-  std::shared_ptr<IPCExportedObject> takeExportedObject() { return std::exchange(_object, nullptr); }
+  using Objects = std::map<std::string, std::shared_ptr<IPCExportedObject>, std::less<>>;
+
+  /// `object` is exported under the router's own path.
+  void setExportedObject(std::shared_ptr<IPCExportedObject> object, Objects others = {});
+  /// Detaches the objects; they receive no further calls. The caller releases them.
+  Objects takeExportedObjects() { return std::exchange(_objects, {}); }
 
   void route(Message& message);
 
  private:
-  void serveObject(IPCIncomingCall& call);
+  std::shared_ptr<IPCExportedObject> objectAt(std::string_view path) const;
+  void serveObject(IPCIncomingCall& call, IPCExportedObject& object);
   void servePeer(IPCIncomingCall& call);
   void serveIntrospectable(IPCIncomingCall& call, std::string_view path);
-  void serveProperties(IPCIncomingCall& call);
+  void serveProperties(IPCIncomingCall& call, const IPCExportedObject& object);
   void warn(std::string_view member, const char* what);
 
   const std::string _objectPath;
@@ -41,7 +48,7 @@ class CallRouter {
   const std::shared_ptr<Outbox> _outbox;
   const ExtensionOwner _owner;
   const CodecLimits _limits;
-  std::shared_ptr<IPCExportedObject> _object;
+  Objects _objects;
   WarningBurst _warnings;
 };
 

@@ -6,6 +6,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <functional>
+#include <map>
 #include <memory>
 #include <optional>
 #include <string>
@@ -22,6 +23,7 @@ class IPCIncomingCall;
 struct IPCPeer {
   uid_t user = static_cast<uid_t>(-1);
   pid_t process = 0;
+  std::vector<gid_t> groups{};  ///< its supplementary groups; none if there are more than 256
 };
 
 /// The object exported under a connection's object path. Receives each method call on the connection's thread
@@ -66,7 +68,9 @@ struct IPCEncodedCall {
 /// They are destroyed after the invalidation handler has run, which breaks reference cycles with the
 /// connection.
 struct IPCHandlers {
-  std::shared_ptr<IPCExportedObject> object{};
+  std::shared_ptr<IPCExportedObject> object{};  ///< under the listener's object path
+  /// Further objects, by path.
+  std::map<std::string, std::shared_ptr<IPCExportedObject>, std::less<>> otherObjects{};
   /// Runs before answers and calls are sent, while there are any. May wait for what they confirm.
   std::function<void()> beforeSending{};
   std::function<void()> interruption{};

@@ -91,7 +91,11 @@ IPCPeer peerOfSocket(int socket) {
   ucred credentials{};
   socklen_t size = sizeof credentials;
   if (::getsockopt(socket, SOL_SOCKET, SO_PEERCRED, &credentials, &size) != 0) fail(errno, "SO_PEERCRED");
-  return {credentials.uid, credentials.pid};
+  std::vector<gid_t> groups(256);
+  size = static_cast<socklen_t>(groups.size() * sizeof groups[0]);
+  const bool hasGroups = ::getsockopt(socket, SOL_SOCKET, SO_PEERGROUPS, groups.data(), &size) == 0;
+  groups.resize(hasGroups ? size / sizeof groups[0] : 0);
+  return {credentials.uid, credentials.pid, std::vector<gid_t>(groups)};
 }
 
 }  // namespace vesk

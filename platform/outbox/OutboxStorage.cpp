@@ -154,12 +154,18 @@ void OutboxStorage::onEach(Lost& lost, Action action) {
   if (_memory) action(*_memory);
 }
 
-std::uint64_t OutboxStorage::count() const {
-  std::uint64_t count = 0;
+std::map<std::string, std::uint64_t> OutboxStorage::countByHost() const {
+  std::map<std::string, std::uint64_t> counts;
   for (const auto* store : {_file.get(), _memory.get()}) {
     if (!store) continue;
-    for (const auto& [host, posts] : store->countByHost()) count += posts;
+    for (const auto& [host, posts] : store->countByHost()) counts[host] += posts;
   }
+  return counts;
+}
+
+std::uint64_t OutboxStorage::count() const {
+  std::uint64_t count = 0;
+  for (const auto& [host, posts] : countByHost()) count += posts;
   return count;
 }
 
@@ -168,15 +174,6 @@ bool OutboxStorage::has(std::string_view host) const {
     return store && store->countByHost().find(host) != store->countByHost().end();
   };
   return contains(_file) || contains(_memory);
-}
-
-std::set<std::string> OutboxStorage::hosts() const {
-  std::set<std::string> hosts;
-  for (const auto* store : {_file.get(), _memory.get()}) {
-    if (!store) continue;
-    for (const auto& [host, count] : store->countByHost()) hosts.insert(host);
-  }
-  return hosts;
 }
 
 void OutboxStorage::open() { _file = std::make_unique<OutboxStore>(_path); }

@@ -3,8 +3,8 @@
 
 #include <chrono>
 #include <cstdint>
+#include <map>
 #include <memory>
-#include <set>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -63,8 +63,9 @@ class OutboxStorage {
 
   bool isEmpty() const { return count() == 0; }
   std::uint64_t count() const;
+  std::map<std::string, std::uint64_t> countByHost() const;
+  std::uint64_t bytes() const { return (_file ? _file->bytes() : 0) + (_memory ? _memory->bytes() : 0); }
   bool has(std::string_view host) const;
-  std::set<std::string> hosts() const;
   std::int64_t lastID() const { return _file ? _file->lastID() : 0; }
 
  private:

@@ -45,8 +45,9 @@ PostOutbox::PostOutbox(Options options)
       _random(std::random_device{}()) {
   _lastID = _storage.lastID();
   const auto now = std::chrono::steady_clock::now();
-  for (const auto& host : _storage.hosts()) _hosts[host].backoff.resume(now, random());
+  for (const auto& [host, posts] : _storage.countByHost()) _hosts[host].backoff.resume(now, random());
   _isWaiting = !_storage.isEmpty();
+  publish();
 }
 
 PostOutbox::~PostOutbox() {
@@ -184,6 +185,7 @@ void PostOutbox::run() {
     if (stopping) break;
     expire();
     sendReady();
+    publish();
     const bool isWaiting = !_storage.isEmpty() || _changes.size() > 0;
     if (isWaiting != wasWaiting) _options.onWaiting(isWaiting);
     if (wasWaiting && !isWaiting) {
@@ -193,6 +195,25 @@ void PostOutbox::run() {
     wasWaiting = isWaiting;
   }
   report(Outcome::NotWritten, _storage.waitingInMemory());
+}
+
+void PostOutbox::publish() {
+  Status status;
+  for (const auto& [name, posts] : _storage.countByHost()) {
+    const auto host = _hosts.find(name);
+    status.hosts[name] = {posts, host == _hosts.end() ? Instant{} : host->second.backoff.next()};
+    status.posts += posts;
+  }
+  status.bytes = _storage.bytes();
+  MutexLock lock(_mutex);
+  _status = std::move(status);
+}
+
+PostOutbox::Status PostOutbox::status() {
+  MutexLock lock(_mutex);
+  Status status = _status;
+  status.maximumBytes = _options.maximumBytes;
+  return status;
 }
 
 void PostOutbox::tellWritten(Ticket upTo) {

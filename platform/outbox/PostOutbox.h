@@ -84,6 +84,19 @@ class PostOutbox final : public PostKeeper {
   /// wait for the deletion.
   void setConsent(bool consent);
 
+  /// What waits, for operators.
+  struct Status {
+    struct Host {
+      std::uint64_t posts = 0;
+      std::chrono::steady_clock::time_point next{};  ///< the next attempt; in the past if posts go out
+    };
+    std::map<std::string, Host> hosts;
+    std::uint64_t posts = 0;
+    std::uint64_t bytes = 0;
+    std::uint64_t maximumBytes = 0;
+  };
+  Status status();
+
   bool keep(HTTPRequest post, std::chrono::seconds delay) override;
   Ticket keepCopy(const HTTPRequest& post) override;
   void sendLater(Ticket ticket, std::chrono::seconds delay) override;
@@ -142,6 +155,8 @@ class PostOutbox final : public PostKeeper {
   void report(const OutboxStorage::Lost& lost) const;
   double random() { return std::uniform_real_distribution<double>()(_random); }
 
+  void publish();
+
   // Constant after construction.
   const Options _options;
   const Wakeup _wakeup;
@@ -156,6 +171,7 @@ class PostOutbox final : public PostKeeper {
   std::int64_t _lastID VESK_GUARDED_BY(_mutex) = 0;
   bool _isClosedToConsent VESK_GUARDED_BY(_mutex) = false;
   bool _isStopped VESK_GUARDED_BY(_mutex) = false;
+  Status _status VESK_GUARDED_BY(_mutex);
   std::thread _thread VESK_GUARDED_BY(_mutex);  ///< started when the first post is kept
 
   std::atomic<bool> _isWaiting{false};  ///< a post is kept

@@ -17,6 +17,7 @@
 #define VESK_EXCLUDES(...) VESK_THREAD_ANNOTATION(locks_excluded(__VA_ARGS__))
 #define VESK_ACQUIRE(...) VESK_THREAD_ANNOTATION(acquire_capability(__VA_ARGS__))
 #define VESK_RELEASE(...) VESK_THREAD_ANNOTATION(release_capability(__VA_ARGS__))
+#define VESK_NO_THREAD_SAFETY_ANALYSIS VESK_THREAD_ANNOTATION(no_thread_safety_analysis)
 #define VESK_RETURNS_CAPABILITY(x) VESK_THREAD_ANNOTATION(lock_returned(x))
 
 namespace vesk {

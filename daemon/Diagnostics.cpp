@@ -1,0 +1,208 @@
+#include "daemon/Diagnostics.h"
+
+#include <VeskReporting/VeskReportingKeys.h>
+
+#include <grp.h>
+#include <unistd.h>
+
+#include <algorithm>
+
+#include "backends/https/PostExplanation.h"
+#include "platform/ipc/IPCIncomingCall.h"
+#include "protocol/WireNames.h"
+#include "storebag/Settings.h"
+#include "storebag/StorebagNaming.h"
+#include "util/ReportingdUtil.h"
+
+namespace vesk {
+
+namespace {
+
+constexpr char kGroup[] = "veskreporting";
+constexpr double kNearlyFull = 0.8;
+
+std::optional<gid_t> idOfGroup(const char* name) {
+  group entry{};
+  group* found = nullptr;
+  std::vector<char> buffer(4096);
+  if (::getgrnam_r(name, &entry, buffer.data(), buffer.size(), &found) != 0 || found == nullptr)
+    return std::nullopt;
+  return found->gr_gid;
+}
+
+double secondsBetween(std::chrono::steady_clock::time_point from, std::chrono::steady_clock::time_point to) {
+  return std::chrono::duration<double>(to - from).count();
+}
+
+Value number(std::uint64_t value) { return Value(static_cast<std::int64_t>(value)); }
+
+List countersIn(const Counters& counters) {
+  std::vector<Value> all;
+  for (const auto& [backend, reason, count] : counters.snapshot()) {
+    all.emplace_back(Dictionary{{"backend", backend},
+                                {"reason", std::string(nameOfDropReason(reason))},
+                                {"count", number(count)},
+                                {"lost", isLoss(reason)}});
+  }
+  return List(std::move(all));
+}
+
+class Object final : public IPCExportedObject {
+ public:
+  Object(std::shared_ptr<const Diagnostics> diagnostics, const IPCPeer& viewer)
+      : _diagnostics(std::move(diagnostics)), _viewer(viewer) {}
+
+  const char* interfaceName() const override { return wire::kDiagnosticsInterface; }
+  const char* introspection() const override { return wire::kDiagnosticsIntrospection; }
+  void handle(IPCIncomingCall& call) override {
+    if (call.member() == wire::kGetStatus.name) {
+      if (call.read(wire::kGetStatus.arguments)) call.answer({_diagnostics->status(_viewer)});
+    } else if (call.member() == wire::kExplain.name) {
+      Dictionary request;
+      if (call.read(wire::kExplain.arguments, request)) call.answer({_diagnostics->explain(request)});
+    } else {
+      call.refuse("org.freedesktop.DBus.Error.UnknownMethod", "The interface has no such method");
+    }
+  }
+
+ private:
+  const std::shared_ptr<const Diagnostics> _diagnostics;
+  const IPCPeer _viewer;
+};
+
+}  // namespace
+
+Diagnostics::Diagnostics(Sources sources) : _sources(std::move(sources)), _group(idOfGroup(kGroup)) {}
+
+Dictionary Diagnostics::status(const IPCPeer& viewer) const {
+  std::vector<Value> problems;
+  const auto add = [&problems](const List& more) {
+    problems.insert(problems.end(), more.begin(), more.end());
+  };
+  if (_sources.publicKeys().empty())
+    problems.emplace_back("no usable public key is installed, so no storebag is accepted");
+  List found;
+  const List bags = storebags(found);
+  add(found);
+  const Dictionary outbox = outboxStatus(found);
+  add(found);
+  const auto now = std::chrono::steady_clock::now();
+  return Dictionary{
+      {"health", problems.empty() ? "ok" : "degraded"},
+      {"reasons", List(std::move(problems))},
+      {"version", VESK_VERSION},
+      {"process", static_cast<std::int64_t>(::getpid())},
+      {"uptime", secondsBetween(_begun, now)},
+      {"environment", std::string(environmentNameForType(currentEnvironmentType()).value_or("(none)"))},
+      {"settings", _sources.settings},
+      {"storebags", bags},
+      {"sessions", sessions(viewer)},
+      {"outbox", outbox},
+      {"counters", countersIn(_sources.services.counters)}};
+}
+
+bool Diagnostics::seesAll(const IPCPeer& viewer) const {
+  return viewer.user == 0 || viewer.user == ::geteuid() ||
+         (_group && std::find(viewer.groups.begin(), viewer.groups.end(), *_group) != viewer.groups.end());
+}
+
+List Diagnostics::storebags(List& problems) const {
+  std::vector<Value> all, wrong;
+  const WallTime now = _sources.services.clock.now();
+  for (const auto& status : _sources.agent.storebagStatus()) {
+    MutableDictionary bag(Dictionary{{"name", status.name},
+                                     {"state", !status.section ? "none"
+                                               : status.isGood ? "current"
+                                                               : "old"},
+                                     {"maxAge", static_cast<std::int64_t>(status.maxAge)}});
+    if (status.version) bag.set("version", *status.version);
+    if (status.fetched) bag.set("age", std::chrono::duration<double>(now - *status.fetched).count());
+    all.emplace_back(bag.share());
+    if (!status.section) {
+      wrong.emplace_back("there is no storebag '" + status.name + "', so its clients report nothing");
+    } else if (!status.isGood) {
+      wrong.emplace_back("the last fetch of the storebag '" + status.name + "' failed");
+    }
+  }
+  problems = List(std::move(wrong));
+  return List(std::move(all));
+}
+
+List Diagnostics::sessions(const IPCPeer& viewer) const {
+  std::vector<Value> all;
+  const bool everything = seesAll(viewer);
+  for (const auto& session : _sources.agent.sessions()) {
+    // A connection that never configured its session, such as the operator's own, is of no interest.
+    if (!session->sessionInfo() || (!everything && session->user() != viewer.user)) continue;
+    all.emplace_back(session->diagnosis());
+  }
+  return List(std::move(all));
+}
+
+Dictionary Diagnostics::outboxStatus(List& problems) const {
+  problems = {};
+  if (!_sources.outbox) return {};
+  const auto status = _sources.outbox->status();
+  const auto now = std::chrono::steady_clock::now();
+  std::vector<Value> hosts, wrong;
+  for (const auto& [name, host] : status.hosts) {
+    const double wait = std::max(0.0, secondsBetween(now, host.next));
+    hosts.emplace_back(Dictionary{{"host", name}, {"posts", number(host.posts)}, {"nextAttempt", wait}});
+    wrong.emplace_back(std::to_string(host.posts) + " posts wait for " + name);
+  }
+  const double used = static_cast<double>(status.bytes) /
+                      static_cast<double>(std::max<std::uint64_t>(status.maximumBytes, 1));
+  if (used >= kNearlyFull) {
+    wrong.emplace_back("the outbox is " + std::to_string(static_cast<int>(used * 100)) + " % full");
+  }
+  problems = List(std::move(wrong));
+  return Dictionary{{"posts", number(status.posts)},
+                    {"bytes", number(status.bytes)},
+                    {"maximumBytes", number(status.maximumBytes)},
+                    {"hosts", List(std::move(hosts))}};
+}
+
+Dictionary Diagnostics::explain(const Dictionary& request) const {
+  const auto problem = [](const std::string& text) { return Dictionary{{"problem", text}}; };
+  const auto type = integerForKey(request, kVeskReportingSessionInfoClientType);
+  if (!type) return problem("the request has no clientType");
+  const auto name = storebagNameForClientType(static_cast<std::int32_t>(*type));
+  if (!name) return problem("client type " + std::to_string(*type) + " has no storebag");
+  const auto known = _sources.agent.storebagStatus();
+  const auto bag =
+      std::find_if(known.begin(), known.end(), [&](const auto& each) { return each.name == *name; });
+  if (bag == known.end())
+    return problem("the storebag '" + std::string(*name) +
+                   "' was not fetched yet, since no such client started");
+  if (!bag->section) return problem("there is no storebag '" + std::string(*name) + "': its fetch failed");
+  const auto family = deviceName();
+  if (!family)
+    return problem("the device has no product family (DeviceName), so there are no HTTPS backends");
+
+  MutableDictionary backends;
+  for (const auto& [key, profile] : *bag->section) {
+    if (!isPostBackend(key.view()) || profile.dictionary() == nullptr) continue;
+    const auto draw = request.find("draw");
+    backends.set(
+        key,
+        explainPosts({.profile = *profile.dictionary(),
+                      .userInfo = request.dictionary("userInfo"),
+                      .requireUserInfo =
+                          booleanForKey(request, kVeskReportingSessionInfoRequireUserInfo).value_or(true),
+                      .productFamily = family->string(),
+                      .regionCode = _sources.services.regionCode(),
+                      .dnuEnabled = _sources.services.diagnosticsSubmissionConsent(),
+                      .samplingFactor = draw ? draw->asDouble().value_or(0) : 0},
+                     initialPostSettings(false)));
+  }
+  MutableDictionary answer(Dictionary{{"storebag", std::string(*name)}, {"backends", backends.share()}});
+  if (bag->version) answer.set("version", *bag->version);
+  return answer.share();
+}
+
+std::shared_ptr<IPCExportedObject> diagnosticsObject(std::shared_ptr<const Diagnostics> diagnostics,
+                                                     const IPCPeer& viewer) {
+  return std::make_shared<Object>(std::move(diagnostics), viewer);
+}
+
+}  // namespace vesk

@@ -1,0 +1,59 @@
+// Answers operators' questions about the running daemon.
+#pragma once
+
+#include <sys/types.h>
+
+#include <chrono>
+#include <functional>
+#include <memory>
+#include <optional>
+
+#include <VeskReporting/values/Value.h>
+#include "daemon/ReportingdAgent.h"
+#include "platform/ipc/IPCConnection.h"
+#include "platform/outbox/PostOutbox.h"
+#include "storebag/SignedDocument.h"
+#include "util/Counters.h"
+
+namespace vesk {
+
+/// Thread-safe. Asking makes no event, session, backend or fetch.
+class Diagnostics {
+ public:
+  /// Everything in it outlives this.
+  struct Sources {
+    ReportingdAgent& agent;
+    const BackendServices& services;
+    PostOutbox* outbox;   ///< null: there is none
+    Dictionary settings;  ///< in force
+    std::function<PublicKeys()> publicKeys;
+  };
+  /// Also finds the group whose members see everything, so it must be made before the sandbox is entered.
+  explicit Diagnostics(Sources sources);
+
+  /// `health` ("ok" or "degraded") and `reasons`, `version`, `uptime` in seconds, `environment`, `settings`,
+  /// `storebags`, `sessions`, `outbox`, `counters` (docs/wire.md). Root, the daemon's user and the group
+  /// veskreporting see all sessions, others their own.
+  Dictionary status(const IPCPeer& viewer) const;
+
+  /// What the HTTPS backends of the storebag in force would do for `clientType` and `userInfo` in the
+  /// request, `requireUserInfo` (true by default) and `draw` (0 by default): `storebag`, `version`, and
+  /// `backends` (PostExplanation.h) by name; or `problem`.
+  Dictionary explain(const Dictionary& request) const;
+
+ private:
+  bool seesAll(const IPCPeer& viewer) const;
+  List storebags(List& problems) const;
+  List sessions(const IPCPeer& viewer) const;
+  Dictionary outboxStatus(List& problems) const;
+
+  const Sources _sources;
+  const std::optional<gid_t> _group;
+  const std::chrono::steady_clock::time_point _begun = std::chrono::steady_clock::now();
+};
+
+/// The object of one connection.
+std::shared_ptr<IPCExportedObject> diagnosticsObject(std::shared_ptr<const Diagnostics> diagnostics,
+                                                     const IPCPeer& viewer);
+
+}  // namespace vesk
