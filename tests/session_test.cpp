@@ -5,6 +5,7 @@
 
 #include <sstream>
 
+#include "daemon/Diagnostics.h"
 #include "platform/ipc/ExtensionTokens.h"
 #include "platform/unicode/UTF8.h"
 #include "tests/support/AgentHarness.h"
@@ -116,6 +117,19 @@ TEST_F(Session, PausesItsConnectionWhileTooMuchOfItWaitsForAServerThatAnswers) {
   EXPECT_TRUE(session.connection->isPaused);
   harness.posts();
   EXPECT_FALSE(session.connection->isPaused);
+}
+
+TEST_F(Session, OperatorsSeeTheirOwnOrAll) {
+  const auto connection = std::make_shared<RecordingConnection>();
+  harness.agent->shouldAcceptNewConnection(connection);
+  harness.agent->sessions().front()->setSessionInfo(identified(5), std::nullopt, {}, false);
+  const Diagnostics diagnostics(
+      {*harness.agent, harness.services, nullptr, {}, [] { return PublicKeys{"k"}; }});
+  const auto seen = [&](uid_t user) { return diagnostics.status({user}).find("sessions")->list()->size(); };
+  EXPECT_EQ(seen(0), 1u);
+  EXPECT_EQ(seen(static_cast<uid_t>(-1)), 1u) << "the session's own user";
+  EXPECT_EQ(seen(12345), 0u);
+  connection->invalidate();
 }
 
 TEST_F(Session, BackendsAreStampedWithTheDeviceAndTheClient) {

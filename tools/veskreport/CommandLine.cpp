@@ -85,6 +85,7 @@ class Reader {
     addMessageCommands();
     addUploadCommands();
     addPowerLogCommand();
+    addDiagnosticsCommands();
     addStorebagCommands();
     unmarkValues(_app);
   }
@@ -112,24 +113,47 @@ class Reader {
     return sub;
   }
 
-  CLI::App* addClient(const char* name, const char* description, Command* command) {
+  CLI::App* addConnected(const char* name, const char* description, Command* command) {
     CLI::App* sub = add(_app, name, description, command);
     sub->add_option("--root", _invocation.root, "Directory to use as / (default: $VESKREPORTINGD_ROOT)");
     sub->add_option("--socket", _invocation.socket, "The daemon's socket")->excludes("--root");
-    sub->add_option("--client-type", _invocation.clientType, "Client type; selects the storebag")->required();
-    sub->add_option("--client-version", _invocation.clientVersion, "Client version")->capture_default_str();
-    sub->add_option("--session-id", _invocation.sessionID, "Session ID (default: a random one)");
-    sub->add_option("--client-name", _invocation.clientName, "Client name of the user info");
-    sub->add_option("--service-name", _invocation.serviceName, "Service name of the user info");
-    sub->add_option("--user-info", _invocation.userInfo, "Further user info, key=text or key:=json")
-        ->take_all()
-        ->allow_extra_args(false);
-    sub->add_flag("--require-user-info", _invocation.requireUserInfo,
-                  "Make backends wait for user info and apply it");
-    sub->add_flag("--batch", _invocation.batch, "Make backends collect messages into batches");
     sub->add_option("--timeout", _timeout, "Seconds to wait for each answer")
         ->check(CLI::Range(0.001, kLongestTimeout) & CLI::Validator(isNumber, "", "NUMBER"))
         ->capture_default_str();
+    return sub;
+  }
+
+  void addUserInfo(CLI::App& sub) {
+    sub.add_option("--client-name", _invocation.clientName, "Client name of the user info");
+    sub.add_option("--service-name", _invocation.serviceName, "Service name of the user info");
+    sub.add_option("--user-info", _invocation.userInfo, "Further user info, key=text or key:=json")
+        ->take_all()
+        ->allow_extra_args(false);
+  }
+
+  void addDiagnosticsCommands() {
+    CLI::App* status = addConnected("status", "Show what the daemon does, and what is wrong", runStatus);
+    status->add_flag("--openmetrics", _invocation.openMetrics, "Print metrics for a textfile collector")
+        ->excludes("--json");
+    CLI::App* explain =
+        addConnected("explain", "Show whether a client's messages are reported, and why", runExplain);
+    explain->add_option("--client-type", _invocation.clientType, "Client type; selects the storebag")
+        ->required();
+    addUserInfo(*explain);
+    explain->add_option("--draw", _invocation.draw, "The session's draw for sampling, from 0 to 1")
+        ->check(CLI::Range(0.0, 1.0))
+        ->capture_default_str();
+  }
+
+  CLI::App* addClient(const char* name, const char* description, Command* command) {
+    CLI::App* sub = addConnected(name, description, command);
+    sub->add_option("--client-type", _invocation.clientType, "Client type; selects the storebag")->required();
+    sub->add_option("--client-version", _invocation.clientVersion, "Client version")->capture_default_str();
+    sub->add_option("--session-id", _invocation.sessionID, "Session ID (default: a random one)");
+    addUserInfo(*sub);
+    sub->add_flag("--require-user-info", _invocation.requireUserInfo,
+                  "Make backends wait for user info and apply it");
+    sub->add_flag("--batch", _invocation.batch, "Make backends collect messages into batches");
     return sub;
   }
 

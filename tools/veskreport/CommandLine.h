@@ -41,6 +41,9 @@ struct Invocation {
   std::vector<std::string> logData;  ///< one text each
   std::string since;                 ///< a time, or an age such as "90m"; empty: from the beginning
 
+  bool openMetrics = false;
+  double draw = 0;  ///< a session's, for sampling
+
   // Storebags.
   std::string directory = ".";  ///< of a new key pair
   std::string key;              ///< private or public, depending on the command
@@ -70,6 +73,11 @@ int runUploadLog(const Invocation& invocation, const Output& output);
 int runAggregate(const Invocation& invocation, const Output& output);
 
 int runPowerLog(const Invocation& invocation, const Output& output);
+
+/// Shows the daemon's status. Returns kExitFailed if it is degraded.
+int runStatus(const Invocation& invocation, const Output& output);
+/// Shows what the daemon would do with a client's messages, and why.
+int runExplain(const Invocation& invocation, const Output& output);
 
 int runStorebagKeygen(const Invocation& invocation, const Output& output);
 int runStorebagSign(const Invocation& invocation, const Output& output);

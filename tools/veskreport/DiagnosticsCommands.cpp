@@ -1,0 +1,199 @@
+#include <VeskReporting/VeskReportingKeys.h>
+
+#include <poll.h>
+
+#include <cmath>
+#include <cstdio>
+#include <cstring>
+#include <system_error>
+
+#include "platform/files/RootPrefix.h"
+#include "platform/ipc/BusClient.h"
+#include "protocol/WireNames.h"
+#include "tools/text/Printable.h"
+#include "tools/veskreport/CommandLine.h"
+#include "tools/veskreport/PayloadParser.h"
+
+namespace vesk {
+
+namespace {
+
+/// Calls the daemon's diagnostics object and returns its answer.
+Dictionary askDaemon(const Invocation& invocation, const Output& output, const wire::Member& member,
+                     std::vector<IPCArgument> arguments = {}) {
+  const std::string path = invocation.socket.empty() ? pathUnderRoot(wire::kSocketPath) : invocation.socket;
+  std::optional<Dictionary> result;
+  std::string problem;
+  try {
+    BusClient::Options options;
+    options.socketPath = path;
+    options.objectPath = wire::kDiagnosticsPath;
+    BusClient bus(std::move(options));
+    const auto onAnswer = [&](BusAnswer& answer) {
+      Dictionary value;
+      if (answer.read(value)) result = std::move(value);
+      if (!result)
+        problem = answer.errorText().empty() ? "its answer is of another type" : answer.errorText();
+    };
+    auto sent = bus.send(IPCOutgoingCall{wire::kDiagnosticsInterface, member.name, std::move(arguments)},
+                         onAnswer, invocation.timeout);
+    if (sent != BusClient::SendResult::Sent) problem = "the request can not be sent";
+    while (!result && problem.empty()) {
+      pollfd source{bus.fd(), bus.events(), 0};
+      ::poll(&source, 1, bus.timeout());
+      if (bus.process() == BusClient::Progress::Disconnected && !result && problem.empty())
+        problem = "the daemon has closed the connection";
+    }
+  } catch (const std::system_error& error) {
+    output.fail("no daemon at " + path + ": is veskreportingd running? (" +
+                std::strerror(error.code().value()) + ")");
+  }
+  if (!result) output.fail("the daemon does not tell: " + problem);
+  return *std::move(result);
+}
+
+std::string textIn(const Dictionary& from, const char* key) {
+  const Value* value = from.find(key);
+  if (value == nullptr || value->isNone()) return "";
+  return printable(value->text() ? value->text()->string() : describe(*value));
+}
+
+Dictionary dictionaryIn(const Dictionary& from, const char* key) {
+  return from.dictionary(key).value_or(Dictionary());
+}
+
+std::vector<Dictionary> listIn(const Dictionary& from, const char* key) {
+  std::vector<Dictionary> all;
+  const Value* value = from.find(key);
+  const List* list = value ? value->list() : nullptr;
+  for (std::size_t i = 0; list && i < list->size(); ++i) {
+    if (const Dictionary* each = (*list)[i].dictionary()) all.push_back(*each);
+  }
+  return all;
+}
+
+/// "45 s", "12 min", "3 h" or "2 d".
+std::string duration(const Value* seconds) {
+  const double all = seconds ? std::max(0.0, seconds->asDouble().value_or(0)) : 0;
+  const auto whole = [](double number, const char* unit) {
+    return std::to_string(std::llround(number)) + unit;
+  };
+  if (all < 120) return whole(all, " s");
+  if (all < 7200) return whole(all / 60, " min");
+  if (all < 172'800) return whole(all / 3600, " h");
+  return whole(all / 86'400, " d");
+}
+
+std::vector<std::string> statusLines(const Dictionary& status) {
+  std::vector<std::string> lines{"veskreportingd " + textIn(status, "version") + ": " +
+                                 textIn(status, "health") + ", up " + duration(status.find("uptime")) +
+                                 ", environment " + textIn(status, "environment")};
+  if (const Value* reasons = status.find("reasons"); reasons && reasons->list()) {
+    for (const Value& each : *reasons->list())
+      lines.push_back("  ! " + printable(each.text() ? each.text()->string() : describe(each)));
+  }
+  for (const auto& bag : listIn(status, "storebags")) {
+    lines.push_back("storebag " + textIn(bag, "name") + ": " + textIn(bag, "state") + ", version " +
+                    textIn(bag, "version") + ", fetched " + duration(bag.find("age")) + " ago, good for " +
+                    duration(bag.find("maxAge")));
+  }
+  for (const auto& session : listIn(status, "sessions")) {
+    std::string line =
+        "session " + textIn(session, "sessionID") + ": client type " + textIn(session, "clientType");
+    for (const char* key : {"clientName", "serviceName"}) {
+      if (const auto name = textIn(session, key); !name.empty()) line += " " + name;
+    }
+    lines.push_back(line + " (user " + textIn(session, "user") + ", process " + textIn(session, "process") +
+                    ")");
+    for (const auto& [name, backend] : dictionaryIn(session, "backends")) {
+      if (backend.dictionary() == nullptr) continue;
+      const auto reason = textIn(*backend.dictionary(), "reason");
+      lines.push_back("  " + printable(name.view()) + ": " + textIn(*backend.dictionary(), "state") +
+                      (reason.empty() ? "" : ", since " + reason));
+    }
+  }
+  for (const auto& host : listIn(dictionaryIn(status, "outbox"), "hosts")) {
+    lines.push_back("outbox: " + textIn(host, "posts") + " posts for " + textIn(host, "host") +
+                    ", next attempt in " + duration(host.find("nextAttempt")));
+  }
+  for (const auto& counter : listIn(status, "counters")) {
+    lines.push_back(std::string(booleanForKey(counter, "lost").value_or(true) ? "lost" : "delayed") +
+                    " since the start: " + textIn(counter, "count") + " " + textIn(counter, "backend") + " " +
+                    textIn(counter, "reason"));
+  }
+  return lines;
+}
+
+/// For node_exporter's textfile collector.
+std::string openMetrics(const Dictionary& status) {
+  const auto outbox = dictionaryIn(status, "outbox");
+  const auto number = [](const std::string& text) { return text.empty() ? std::string("0") : text; };
+  std::string text = "# TYPE veskreporting_healthy gauge\nveskreporting_healthy " +
+                     std::string(textIn(status, "health") == "ok" ? "1" : "0") +
+                     "\n# TYPE veskreporting_sessions gauge\nveskreporting_sessions " +
+                     std::to_string(listIn(status, "sessions").size()) +
+                     "\n# TYPE veskreporting_outbox_posts gauge\nveskreporting_outbox_posts " +
+                     number(textIn(outbox, "posts")) +
+                     "\n# TYPE veskreporting_outbox_bytes gauge\nveskreporting_outbox_bytes " +
+                     number(textIn(outbox, "bytes")) + "\n# TYPE veskreporting_events counter\n";
+  for (const auto& counter : listIn(status, "counters")) {
+    text += "veskreporting_events_total{backend=\"" + textIn(counter, "backend") + "\",outcome=\"" +
+            textIn(counter, "reason") + "\"} " + textIn(counter, "count") + "\n";
+  }
+  return text + "# EOF\n";
+}
+
+std::vector<std::string> explanationLines(const Dictionary& explanation) {
+  std::vector<std::string> lines{"storebag " + textIn(explanation, "storebag") + ", version " +
+                                 textIn(explanation, "version")};
+  for (const auto& [name, value] : dictionaryIn(explanation, "backends")) {
+    const Dictionary* backend = value.dictionary();
+    if (backend == nullptr) continue;
+    const auto reason = textIn(*backend, "reason");
+    lines.push_back(printable(name.view()) + ": " + textIn(*backend, "state") +
+                    (reason.empty() ? "" : ", since " + reason));
+    for (const auto& step : listIn(*backend, "steps")) {
+      const auto entry = textIn(step, "entry"), found = textIn(step, "value"),
+                 expected = textIn(step, "expected");
+      lines.push_back("  " + (entry.empty() ? "" : "clients[" + entry + "].") + textIn(step, "rule") + " " +
+                      textIn(step, "verdict") + (found.empty() ? "" : ": " + found) +
+                      (expected.empty() ? "" : " (storebag: " + expected + ")"));
+    }
+    if (const Value* share = backend->find("samplingShare")) {
+      char text[64];
+      std::snprintf(text, sizeof text, "  reports for %.4g %% of the sessions",
+                    100 * share->asDouble().value_or(0));
+      lines.emplace_back(text);
+    }
+    if (const auto url = textIn(*backend, "postURL"); !url.empty()) lines.push_back("  posts to " + url);
+  }
+  return lines;
+}
+
+}  // namespace
+
+int runStatus(const Invocation& invocation, const Output& output) {
+  const auto status = askDaemon(invocation, output, wire::kGetStatus);
+  const int written =
+      invocation.openMetrics ? output.raw(openMetrics(status)) : output.done(statusLines(status), status);
+  return written == kExitDone && textIn(status, "health") == "ok" ? kExitDone : kExitFailed;
+}
+
+int runExplain(const Invocation& invocation, const Output& output) {
+  auto further = parsePairs(invocation.userInfo);
+  if (!further) output.fail("user info " + further.error().text, kExitUsage);
+  MutableDictionary userInfo;
+  if (!invocation.clientName.empty()) userInfo.set(kVeskReportingUserInfoClientName, invocation.clientName);
+  if (!invocation.serviceName.empty())
+    userInfo.set(kVeskReportingUserInfoServiceName, invocation.serviceName);
+  userInfo.setAll(*further);
+  MutableDictionary request(
+      Dictionary{{kVeskReportingSessionInfoClientType, invocation.clientType}, {"draw", invocation.draw}});
+  if (!userInfo.empty()) request.set("userInfo", userInfo.share());
+  const auto explanation = askDaemon(invocation, output, wire::kExplain, {request.share()});
+  if (const auto problem = textIn(explanation, "problem"); !problem.empty())
+    return output.failed(problem, explanation);
+  return output.done(explanationLines(explanation), explanation);
+}
+
+}  // namespace vesk
