@@ -63,12 +63,5 @@ TEST(JSON, RefusesWhatItCannotCarry) {
   EXPECT_NE(compact(nested(64)), "(nothing)");
 }
 
-TEST(JSON, PrettyTextSaysTheSameWithIndentation) {
-  const Value value = Dictionary{{"a", List{0.37, 1, "text \""}}, {"b", Dictionary{{"c", List{}}}}};
-  const auto pretty = toJSON(value, JSONStyle::Pretty).value();
-  EXPECT_TRUE(pretty.starts_with("{\n    \"a\": [\n        0.37,\n")) << pretty;
-  EXPECT_EQ(boost::json::parse(pretty), boost::json::parse(compact(value)));
-}
-
 }  // namespace
 }  // namespace vesk

@@ -7,38 +7,6 @@
 namespace vesk {
 namespace {
 
-TEST(Unicode, LowercasesByTheFullMapping) {
-  const std::pair<const char*, const char*> cases[] = {
-      {"MyApp 42 I", "myapp 42 i"},
-      {"ΟΔΟΣ", "οδος"},       // a final sigma has its own form
-      {"İ", "i\xCC\x87"},     // becomes two characters
-      {"AÄ\xFFZ", "aä\xFFz"}  // not UTF-8
-  };
-  for (auto [text, lower] : cases) EXPECT_EQ(lowercase(text), lower);
-}
-
-TEST(Unicode, ComparesWithoutCase) {
-  const struct {
-    const char* a;
-    const char* b;
-    bool isEqual;
-  } cases[] = {
-      {"USERNAME", "username", true}, {"username", "usernames", false}, {"@", "`", false},
-      {"straße", "STRASSE", true},    {"Kelvin", "\u212Aelvin", true},  {"user é", "USER É ", false},
-  };
-  for (const auto& c : cases) {
-    EXPECT_EQ(equalsIgnoringCase(c.a, c.b), c.isEqual) << c.a << " " << c.b;
-    EXPECT_EQ(equalsIgnoringCase(c.b, c.a), c.isEqual) << c.b << " " << c.a;
-  }
-}
-
-TEST(Unicode, FindsFragmentsWithoutCase) {
-  EXPECT_TRUE(containsIgnoringCase("MyCallService", "call"));
-  EXPECT_TRUE(containsIgnoringCase("Große Straße", "STRASSE"));
-  EXPECT_FALSE(containsIgnoringCase("call", "calls"));
-  EXPECT_FALSE(containsIgnoringCase("anything", ""));
-}
-
 TEST(Unicode, TellsWellFormedUTF8) {
   for (const char* text :
        {"", "ASCII only, longer than eight", "\x7F\xC2\x80\xDF\xBF\xE0\xA0\x80", "\uFDD0\uFFFE\uFFFF",
