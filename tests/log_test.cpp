@@ -3,7 +3,6 @@
 
 #include <future>
 
-#include "platform/log/LogRateLimit.h"
 #include "platform/log/LogUser.h"
 #include "platform/queue/QueueThread.h"
 #include "tests/support/CapturedLog.h"
@@ -12,39 +11,6 @@ namespace vesk::test {
 namespace {
 
 using namespace std::chrono_literals;
-
-class RateLimit : public testing::Test {
- protected:
-  /// How many of `lines` lines may be written.
-  int written(const char& site, std::uint32_t user, int lines) {
-    int count = 0;
-    for (int i = 0; i < lines; ++i) {
-      auto verdict = limit.admit(&site, user, LogLevel::Warning, "format", now);
-      count += verdict.mayWrite ? 1 : 0;
-      leftOut.insert(leftOut.end(), verdict.leftOut.begin(), verdict.leftOut.end());
-    }
-    return count;
-  }
-
-  LogRateLimit limit{3};
-  LogRateLimit::Time now{1h};
-  std::vector<LogRateLimit::LeftOut> leftOut;
-  const char sites[3] = {};
-};
-
-TEST_F(RateLimit, CountsEachSiteAndUserByItselfAndTellsWhatItLeftOutOnce) {
-  EXPECT_EQ(written(sites[0], 1, 10), 3);
-  EXPECT_EQ(written(sites[0], 2, 2), 2);
-  EXPECT_EQ(written(sites[1], 1, 5), 3);
-  now += 10s - 1ns;
-  EXPECT_EQ(written(sites[0], 1, 1), 0);
-  EXPECT_TRUE(leftOut.empty());
-  now += 1ns;
-  EXPECT_EQ(written(sites[2], 3, 1), 1) << "any line brings the news";
-  using LeftOut = LogRateLimit::LeftOut;
-  EXPECT_EQ(leftOut,
-            (std::vector<LeftOut>{{LogLevel::Warning, 1, "format", 8}, {LogLevel::Warning, 1, "format", 2}}));
-}
 
 TEST(SystemLog, LimitsAllButErrorsForEachUserOnWhoseBehalfAThreadWorks) {
   CapturedLog log;

@@ -130,26 +130,5 @@ TEST_F(Preferences, ThatOthersCanWriteToAreRefusedInOneLine) {
   }
 }
 
-TEST(PreferenceForms, AreTextAndInteger) {
-  const struct {
-    Value value;
-    std::optional<std::string> text;
-    std::int64_t integer;
-  } cases[] = {{"text", "text", 0},
-               {"12abc", "12abc", 12},
-               {"-99999999999999999999", "-99999999999999999999", INT64_MIN},
-               {UINT64_MAX, "18446744073709551615", -1},
-               {2.5, "2.5", 2},
-               {1e5, "100000", 100'000},
-               {0.0001, "0.0001", 0},
-               {1e20, "1e+20", INT64_MAX},
-               {true, "1", 1},
-               {List{1}, std::nullopt, 0}};
-  for (const auto& c : cases) {
-    EXPECT_EQ(stringForm(c.value), c.text) << describe(c.value);
-    EXPECT_EQ(integerForm(c.value), c.integer) << describe(c.value);
-  }
-}
-
 }  // namespace
 }  // namespace vesk::test

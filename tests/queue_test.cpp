@@ -1,10 +1,6 @@
 // Serial queues and timers, on their real thread.
 #include <gtest/gtest.h>
 
-#include <unistd.h>
-
-#include <algorithm>
-#include <array>
 #include <future>
 #include <optional>
 #include <stdexcept>
@@ -37,24 +33,6 @@ TEST_F(Queues, GoOnAfterWorkThatThrows) {
   drain();
   EXPECT_EQ(log.count(3, "queue: work failed: broken"), 1);
   EXPECT_EQ(log.count(3, "queue: work failed"), 1);
-}
-
-TEST_F(Queues, SourcesLetGoOfTheirDescriptorWhenDestroyedElsewhere) {
-  std::array<int, 2> ends{};
-  ASSERT_EQ(::pipe(ends.data()), 0);
-  FileDescriptor writer(ends[1]);
-  auto reader = std::make_shared<const FileDescriptor>(ends[0]);
-  std::promise<void> read;
-  auto source = queue->makeReadSource(reader, [&] {
-    char byte;
-    EXPECT_EQ(::read(reader->get(), &byte, 1), 1);
-    read.set_value();
-  });
-  ASSERT_EQ(::write(writer.get(), "x", 1), 1);
-  read.get_future().wait();
-  source.reset();
-  drain();
-  EXPECT_EQ(reader.use_count(), 1);
 }
 
 TEST(QueueThread, StopDestroysWhatHasNotRun) {

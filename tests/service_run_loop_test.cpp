@@ -44,14 +44,6 @@ class RunLoopTest : public testing::Test {
   BusyMarker _busy;
 };
 
-TEST_F(RunLoopTest, StopsFromAnyThreadAlsoBeforehand) {
-  RunLoop loop({}, _busy, _service);
-  std::thread stopper([&] { loop.stop(); });
-  EXPECT_EQ(loop.run(), Outcome::Stopped);
-  stopper.join();
-  EXPECT_EQ(loop.run(), Outcome::Stopped);
-}
-
 TEST_F(RunLoopTest, StopsOnEachStopSignal) {
   for (int signal : {SIGTERM, SIGINT}) {
     RunLoop loop({}, _busy, _service);

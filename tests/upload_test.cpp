@@ -308,42 +308,5 @@ TEST_F(UploadTest, TakesItsUsersShareForTheFileAndItsCompressedForm) {
   EXPECT_TRUE(services.uploads->enter(user, 200'000)) << "all of it is free again";
 }
 
-TEST(UploadGateTest, LetsInWhatThereIsRoomForAndLeavesSomeToOthers) {
-  UploadGate gate({.uploads = 3,
-                   .bytes = 100,
-                   .uploadsOfUser = 2,
-                   .bytesOfUser = 90,
-                   .patience = std::chrono::milliseconds(0)});
-  auto first = gate.enter(1, 80);
-  ASSERT_TRUE(first);
-  EXPECT_FALSE(gate.enter(1, 11)) << "bytes of one user";
-  EXPECT_FALSE(gate.enter(2, 21)) << "bytes";
-  first->shrinkTo(40);
-  first->shrinkTo(90);
-  auto second = gate.enter(1, 50);
-  EXPECT_TRUE(second);
-  EXPECT_FALSE(gate.enter(1, 0)) << "uploads of one user";
-  auto third = gate.enter(2, 10);
-  EXPECT_TRUE(third);
-  EXPECT_FALSE(gate.enter(3, 0)) << "uploads";
-  second.reset();
-  EXPECT_TRUE(gate.enter(1, 50));
-}
-
-TEST(UploadGateTest, LetsThoseInWhoWaitAndNobodyAfterTheEnd) {
-  UploadGate gate(UploadGate::Limits{.uploads = 1});
-  auto wait = [&] { return std::async(std::launch::async, [&] { return gate.enter(2, 20).has_value(); }); };
-  auto first = gate.enter(1, 10);
-  auto second = wait();
-  first.reset();
-  EXPECT_TRUE(second.get() && gate.isOpen());
-  auto last = gate.enter(1, 10);
-  auto third = wait();
-  gate.close();
-  EXPECT_FALSE(third.get() || gate.isOpen());
-  last.reset();
-  EXPECT_FALSE(gate.enter(1, 0));
-}
-
 }  // namespace
 }  // namespace vesk::test

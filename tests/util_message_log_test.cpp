@@ -111,20 +111,6 @@ TEST_F(MessageLogTest, StartsOneFileAndAppendsToIt) {
   EXPECT_EQ(fs::status(_logs / kFirst).permissions(), fs::perms(0640) & ~fs::perms(0022));
 }
 
-TEST_F(MessageLogTest, NamesAFileAfterTheSecondIn32Bits) {
-  for (const auto& [time, number] :
-       std::map<microseconds, const char*>{{microseconds(1'999'999), "1"},
-                                           {microseconds(-1'999'999), "-1"},
-                                           {seconds(2'147'483'647), "2147483647"},
-                                           {seconds(2'147'483'648), "-2147483648"},
-                                           {seconds(4'294'967'301), "5"}}) {
-    fs::remove_all(_logs);
-    _clock.time = WallTime(time);
-    _log.write("message");
-    EXPECT_EQ(files(), Names{std::string("veskreportingd_") + number + "_messageLog.diag"});
-  }
-}
-
 TEST_F(MessageLogTest, ReplacesAFileOlderThanADay) {
   const std::string old = "veskreportingd_whatever_messageLog.diag";
   for (bool staysOpen : {false, true}) {
@@ -205,16 +191,9 @@ TEST_F(MessageLogTest, SeesWhatHappensToItsFileBetweenTwoLines) {
   const Case cases[] = {
       {[] {}, kFirst, one},
       {[&] { fs::remove(_logs / kFirst); }, kFirst, ""},
-      {[&] { fs::rename(_logs / kFirst, _logs / other); }, other, one},
       {[&] { fs::rename(_root.write("new", "new\n"), _logs / kFirst); }, kFirst, "new\n"},
       {[&] { makeYounger(other, kFirst); }, other, "before\n"},
       {[&] { fs::remove_all(_logs); }, kFirst, ""},
-      {[&] {
-         fs::remove_all(_root / "elsewhere");
-         fs::rename(_logs, _root / "elsewhere");
-         make(other);
-       },
-       other, "before\n"},
       {[&] { writeWithoutRoom(_log); }, kFirst, ""},
   };
   int number = 0;
@@ -238,7 +217,6 @@ TEST_F(MessageLogTest, SeesWhatHappensToItsFileBetweenTwoLines) {
 TEST_F(MessageLogTest, EveryLineThatIsLostIsCountedAndSaidWhy) {
   const std::string failed = "writeToLogFile: Failed to create new veskreportingd log file ";
   const std::string notHere = _root.write("file", "untouched").string();
-  FileDescriptor reader;
   struct Case {
     std::string directory;
     std::function<void()> prepare;
@@ -255,14 +233,7 @@ TEST_F(MessageLogTest, EveryLineThatIsLostIsCountedAndSaidWhy) {
         {3, failed + "/proc/vesk/logs/" + kFirst}}},
       {_logs, [&] { fs::create_directories(_logs / kFirst); }, {{3, failed + path(kFirst)}}},
       {_logs, [&] { fs::create_symlink(notHere, _logs / kFirst); }, {}},
-      {_logs, [&] { fs::create_symlink(_root.path(), _logs / kFirst); }, {}},
       {_logs, [&] { ::mkfifo(path(kFirst).c_str(), 0600); }, {}},
-      {_logs,
-       [&] {
-         ::mkfifo(path(kFirst).c_str(), 0600);
-         reader = FileDescriptor(::open(path(kFirst).c_str(), O_RDWR | O_CLOEXEC));
-       },
-       {}},
       {_logs, [&] { make(kFirst); }, {}},
   };
   std::uint64_t count = 0;
@@ -308,7 +279,6 @@ TEST(LogFormat, ShowsEveryValueByItsOwnType) {
        {5, INT64_MIN, 0.1, static_cast<const char*>(nullptr)},
        "5 -9223372036854775808 0.1 (null)"},
       {"%d %5d|%-5d|%05d|%+d|% d %i", {-1, 2, 3, 4, 5, 6, 7}, "-1     2|3    |00004|+5| 6 7"},
-      {"%u %x %#X %o %.3d", {7u, 255, 255u, 8, 7}, "7 ff 0XFF 10 007"},
       {"%llu %ld %hhd %qd %jd %zd %td",
        {UINT64_MAX, -1L, 300, 1, 2, 3, 4},
        "18446744073709551615 -1 300 1 2 3 4"},
@@ -320,10 +290,8 @@ TEST(LogFormat, ShowsEveryValueByItsOwnType) {
       {"%d %f %x", {"text", "text", "text"}, "text text text"},
       {"%d %u %x %d", {1.5, -1, -1, UINT64_MAX}, "1.5 -1 ffffffffffffffff 18446744073709551615"},
       {"%@ %@ %5d|", {"one"}, "one %@ %5d|"},
-      {"%@", {"one", "two"}, "one"},
       {"%@", {"%@ %s %n"}, "%@ %s %n"},
       {"%999999999999d", {1}, blanks + "1"},
-      {"%------d|%300d", {1, 2}, "1|" + blanks + "2"},
       {"%.99999f", {0.0}, "0." + std::string(256, '0')},
   };
   for (const auto& test : cases) EXPECT_EQ(formatLogMessage(test.format, test.arguments), test.shown);
