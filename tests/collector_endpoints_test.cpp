@@ -178,19 +178,6 @@ TEST_F(CollectorEndpoints, GiveFaultsInTheirOrderAndAsOftenAsAsked) {
   EXPECT_EQ(_stats.faults, 6U);
 }
 
-TEST_F(CollectorEndpoints, AreSteeredAndCountedOverTheControlPath) {
-  ControlEndpoint control({_console, _stats, _faults});
-  EXPECT_EQ(control.answer(request("POST", "/_control/fault", {}, "post=500*1\r\n\nstorebag=stall\n")).body,
-            "[\"post=500*1\",\"storebag=stall\"]\n");
-  EXPECT_EQ(control.answer(request("POST", "/_control/fault", {}, "nonsense")).status, 400U);
-  EXPECT_EQ(_events.answer(post()).status, 500U);
-  EXPECT_EQ(control.answer(request("GET", "/_control/fault")).body, "[\"storebag=stall\"]\n");
-  EXPECT_EQ(control.answer(request("DELETE", "/_control/fault")).body, "[]\n");
-  EXPECT_EQ(control.answer(request("GET", "/_control/other")).status, 404U);
-  auto counters = *parseJSON(control.answer(request("GET", "/_control/stats")).body);
-  EXPECT_EQ(integerForKey(*counters.dictionary(), "faults"), 1);
-}
-
 class StorebagServing : public CollectorEndpoints {
  protected:
   HTTPAnswer get(const std::string& path, const std::string& since = {}) {
@@ -238,15 +225,6 @@ TEST_F(StorebagServing, RefusesNamesItDoesNotHaveAndSourcesWithMistakes) {
   EXPECT_NE(bad.body.find("bad.json: version: must be a text"), std::string::npos);
   EXPECT_EQ(problemOf(get("/bags/good")), "");
   EXPECT_EQ(_endpoint.answer(request("POST", "/bags/good")).status, 405U);
-}
-
-TEST(HTTPReceived, UnpacksNoMoreThanItsLimit) {
-  for (std::size_t size : {1000, 1001}) {
-    auto packed = request("POST", "/", {{"Content-Encoding", "gzip"}}, gzip(std::string(size, 'x')));
-    auto plain = request("POST", "/", {}, std::string(size, 'x'));
-    EXPECT_EQ(packed.decodedBody(1000).body.has_value(), size == 1000);
-    EXPECT_EQ(plain.decodedBody(1000).body.has_value(), size == 1000);
-  }
 }
 
 }  // namespace

@@ -12,30 +12,6 @@ using test::WebClient;
 
 HTTPAnswer echo(const HTTPReceived& received) { return HTTPAnswer::text(200, received.method); }
 
-TEST(CollectorServer, RefusesWhatIsNoProtocolWithALine) {
-  std::mutex mutex;
-  std::vector<std::string> lines;
-  CertificateAuthority authority = CertificateAuthority::generate();
-  HTTPServer::Options options;
-  options.maximumBody = 1000;
-  options.onRefused = [&](const std::string& line) {
-    std::lock_guard lock(mutex);
-    lines.push_back(line);
-  };
-  HTTPServer plain(options, echo);
-  options.tls = authority.issueServerIdentity();
-  HTTPServer secure(options, echo);
-
-  EXPECT_EQ(WebClient().post(plain.baseURL(), std::string(5'000'000, 'x')).status, 413);
-  EXPECT_EQ(WebClient().get(plain.baseURL(), {"X-Long: " + std::string(70'000, 'x')}).status, 431);
-  EXPECT_NE(WebClient().get("http://127.0.0.1:" + std::to_string(secure.port())).outcome, CURLE_OK);
-  EXPECT_NE(WebClient().get("https://127.0.0.1:" + std::to_string(plain.port())).outcome, CURLE_OK);
-  plain.stop();
-  secure.stop();
-  EXPECT_EQ(lines.size(), 4U);
-  EXPECT_EQ(plain.connectionsOpen(), 0U);
-}
-
 TEST(CollectorCertificates, AreKeptAndVerifiedByNameAndAddress) {
   TempDirectory files;
   std::string authority = CertificateAuthority::openOrCreate(files.path()).certificate();

@@ -1,11 +1,10 @@
-// The daemon on a failing machine: disks, descriptors, memory.
+// The daemon on a failing machine: disks, descriptors and memory.
 #include <gtest/gtest.h>
 #include <sched.h>
 #include <sys/mount.h>
 #include <sys/resource.h>
 
 #include <algorithm>
-#include <csignal>
 
 #include "tests/support/DaemonHarness.h"
 #include "tests/support/ProcessFacts.h"
