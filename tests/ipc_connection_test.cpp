@@ -86,21 +86,6 @@ TEST(IPCConnection, AnswersWhatCannotBeServedWithAnError) {
   EXPECT_EQ(log.countContaining(3, "ipc: connection"), 1) << "the exception";
 }
 
-TEST(IPCConnection, TellsWhatThereIs) {
-  TestService service;
-  TestClient client(service);
-  EXPECT_EQ(client.call("Ping", {}, "org.freedesktop.DBus.Peer"), "done");
-  EXPECT_EQ(client.call("setSessionInfo",
-                        {Dictionary(), std::optional<Dictionary>(), std::vector<std::string>(), false}),
-            "done")
-      << "also to those who ask for an answer";
-  auto xml = client.call("Introspect", {}, "org.freedesktop.DBus.Introspectable");
-  for (const auto* member :
-       {&wire::kSetSessionInfo, &wire::kUploadFile, &wire::kSendMessageWithSessionInfo}) {
-    EXPECT_NE(xml.find(std::string("<method name=\"") + member->name + "\">"), std::string::npos) << xml;
-  }
-}
-
 TEST(IPCConnection, KeepsADescriptorUnderATokenThatIsGoodOnce) {
   TestService service;
   int pipe[2];

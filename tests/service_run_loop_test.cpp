@@ -6,7 +6,6 @@
 
 #include <cstdlib>
 #include <future>
-#include <semaphore>
 #include <thread>
 
 #include "daemon/RunLoop.h"
@@ -73,19 +72,6 @@ TEST_F(RunLoopTest, EndsWhenIdleButNotWhileBusy) {
   EXPECT_TRUE(_busy.isBusy());
   _busy.end();
   EXPECT_EQ(outcome.get(), Outcome::Idle);
-}
-
-TEST_F(RunLoopTest, NotesAPauseAfterWorkOnce) {
-  std::binary_semaphore paused{0};
-  RunLoop loop({.onPause = [&] { paused.release(); }, .pause = 1ms}, _busy, _service);
-  auto outcome = std::async(std::launch::async, [&] { return loop.run(); });
-  EXPECT_FALSE(paused.try_acquire_for(50ms)) << "no work, no wake-up";
-  _busy.begin();
-  _busy.end();
-  EXPECT_TRUE(paused.try_acquire_for(30s));
-  EXPECT_FALSE(paused.try_acquire_for(50ms));
-  loop.stop();
-  outcome.get();
 }
 
 TEST_F(RunLoopTest, TellsTheManagerHowItGoes) {

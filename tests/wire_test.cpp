@@ -233,19 +233,13 @@ TEST(Wire, WritesNothingThatNoReceiverTakes) {
     Value value;
     CodecResult result;
   };
-  Value lists = 1;
-  for (int i = 0; i < 63; ++i) lists = List{lists};
   for (const Case& c : {
            Case{"not UTF-8", "\xff", CodecResult::Malformed},
-           Case{"a NUL", std::string("12345678\0", 9), CodecResult::Malformed},
-           Case{"a bad key", Dictionary{{"\xff", 1}}, CodecResult::Malformed},
            Case{"100,000 values", List(std::vector<Value>(100'000)), CodecResult::LimitExceeded},
            Case{"1 MiB", std::string(std::size_t{1} << 20, 'x'), CodecResult::LimitExceeded},
            Case{"too many containers", nested(kDeepest + 1), CodecResult::LimitExceeded},
-           Case{"too many lists", lists, CodecResult::LimitExceeded},
            Case{"too long a message", List(std::vector<Value>(90'000, Date{})), CodecResult::LimitExceeded},
            Case{"the deepest", nested(kDeepest), CodecResult::Ok},
-           Case{"text", "\x01 \u00e9", CodecResult::Ok},
        }) {
     SCOPED_TRACE(c.what);
     std::string out = "before";

@@ -54,7 +54,9 @@ std::optional<WallTime> dateInName(std::string_view name) {
   return WallTime(std::chrono::seconds(static_cast<std::uint32_t>(seconds)));
 }
 
-/// The creation date of the file opened as `descriptor` or, without a descriptor, of the file at `path`.
+/// The creation date of the file opened as `descriptor` or, without a descriptor, of the file at `path`. It
+/// is its birth time if the file system records one, otherwise the seconds in its name, which stay the same
+/// when lines are added, otherwise the time of its last change.
 std::optional<WallTime> creationDate(const std::string& path, int descriptor = -1) {
   struct statx status {};
   const bool isOpen = descriptor >= 0;
@@ -62,7 +64,13 @@ std::optional<WallTime> creationDate(const std::string& path, int descriptor = -
               isOpen ? AT_EMPTY_PATH : AT_SYMLINK_NOFOLLOW, STATX_BTIME | STATX_MTIME, &status) != 0) {
     return std::nullopt;
   }
-  return logFileCreationDate(status, std::string_view(path).substr(path.rfind('/') + 1));
+  const bool hasBirth = status.stx_mask & STATX_BTIME;
+  if (!hasBirth) {
+    if (auto named = dateInName(std::string_view(path).substr(path.rfind('/') + 1))) return named;
+    if (!(status.stx_mask & STATX_MTIME)) return std::nullopt;
+  }
+  const auto& when = hasBirth ? status.stx_btime : status.stx_mtime;
+  return WallTime(std::chrono::seconds(when.tv_sec) + std::chrono::microseconds(when.tv_nsec / 1000));
 }
 
 std::string dateText(const LogFile& file) { return file.created ? logDate(*file.created) : "unknown date"; }
@@ -168,16 +176,6 @@ bool isSameState(const struct stat& one, const struct stat& other) {
 }  // namespace
 
 std::string logDate(WallTime time) { return civilTime(time) + " +0000"; }
-
-std::optional<WallTime> logFileCreationDate(const struct statx& status, std::string_view name) {
-  const bool hasBirth = status.stx_mask & STATX_BTIME;
-  if (!hasBirth) {
-    if (auto named = dateInName(name)) return named;
-    if (!(status.stx_mask & STATX_MTIME)) return std::nullopt;
-  }
-  const auto& when = hasBirth ? status.stx_btime : status.stx_mtime;
-  return WallTime(std::chrono::seconds(when.tv_sec) + std::chrono::microseconds(when.tv_nsec / 1000));
-}
 
 MessageLog::MessageLog(std::string directory, const WallClock& clock, const Options& options)
     : _directory(std::move(directory)), _clock(clock), _options(options) {}

@@ -70,10 +70,6 @@ class MessageLog {
   WarningBurst _full;
 };
 
-/// The creation time of the log file with that name: its birth time if the file system records one, otherwise
-/// the seconds in its name, which stay the same when lines are added, otherwise the time of its last change.
-std::optional<WallTime> logFileCreationDate(const struct statx& status, std::string_view name);
-
 /// Formats a time for the log, in UTC: "2026-11-24 20:31:29 +0000".
 std::string logDate(WallTime time);
 
