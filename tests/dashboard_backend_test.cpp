@@ -189,23 +189,6 @@ TEST_F(Dashboard, WritesPayloadsShortestValueFirst) {
   EXPECT_EQ(descriptionForObject(std::nullopt), "null");
 }
 
-TEST_F(Dashboard, ReadsWholeDatagramsOnly) {
-  auto backend = make(profile(Dictionary{{"reliable", 500}}));
-  const auto datagram = datagramOf(*backend, Dictionary{{"a", "y"}});
-  const auto header = decodeDashboardHeader(datagram);
-  ASSERT_TRUE(header);
-  EXPECT_TRUE(header->isReliable);
-  EXPECT_FALSE(header->isWithoutProfile);
-  EXPECT_EQ(header->deviceIDText(), kUdid);
-  auto otherFormat = datagram;
-  otherFormat[2] = 2;
-  for (const auto& bytes :
-       {std::string(), datagram.substr(0, 63), datagram.substr(0, 64), datagram + "x", otherFormat}) {
-    EXPECT_EQ(decodeDashboardHeader(bytes), std::nullopt);
-    EXPECT_EQ(writeLocalLog(bytes), std::nullopt);
-  }
-}
-
 TEST_F(Dashboard, ACutCharacterCostsTheLineOnly) {
   auto backend = make(profile());
   const Dictionary payload{{"k", std::string(1019, 'x') + "ä"}};

@@ -120,16 +120,6 @@ TEST_F(Delivery, KeepsItsBeatWhileItIdles) {
   EXPECT_EQ(arrivalsDuring(3000), (Arrivals{{0, 1}, {700, 1}, {2200, 1}}));
 }
 
-TEST_F(Delivery, AnAcknowledgedDatagramIsNeverSentAgain) {
-  start();
-  send(1);
-  send(0x1234);
-  EXPECT_EQ(arrivalsDuring(2500),
-            (Arrivals{{0, 1}, {0, 0x1234}, {1000, 1}, {1000, 0x1234}, {2500, 1}, {2500, 0x1234}}));
-  _server.acknowledge(0x1234);
-  EXPECT_EQ(arrivalsDuring(2500), (Arrivals{{2500, 1}}));
-}
-
 TEST_F(Delivery, AnAcknowledgementTakesTheFirstDatagramWithItsEventID) {
   auto carrying = [](std::uint16_t id, std::size_t size) {
     std::string bytes(2000, '\x7F');

@@ -49,10 +49,8 @@ class Member {
     while (!ends && _problem.empty()) step();
   }
 
-  std::string problem() const { return _problem; }
-  int number() const { return _number; }
   std::uint64_t aggregated() const { return _aggregated; }
-  void leave() { _reporting.reset(); }
+  std::string problem() const { return _problem; }
 
  private:
   bool chance(int of) { return std::uniform_int_distribution(0, of - 1)(_random) == 0; }
@@ -85,7 +83,7 @@ class Member {
   void step() {
     const Dictionary payload{{"n", ++_steps}};
     const int choice = std::uniform_int_distribution(0, 19)(_random);
-    if (choice == 0) return leave(), connect(chance(2));
+    if (choice == 0) return _reporting.reset(), connect(chance(2));
     if (choice == 1) return configure(chance(2));
     if (choice == 2) _family = 1 - _family;
     if (choice <= 4) return expect("fetch states", _reporting->fetchStates(familyName(_family), kPatience));
@@ -118,10 +116,7 @@ TEST(FamilyStress, TwoFamiliesThatDoEverythingAtOnceNeitherHangNorBreakTheDaemon
   harness.startDaemon({"--log-level", "6"});
 
   std::vector<std::unique_ptr<Member>> members;
-  for (int i = 0; i < kMembers; ++i) {
-    members.push_back(std::make_unique<Member>(harness, i, seed));
-    ASSERT_EQ(members.back()->problem(), "");
-  }
+  for (int i = 0; i < kMembers; ++i) members.push_back(std::make_unique<Member>(harness, i, seed));
   std::uint64_t aggregated = 0;
   {
     std::atomic<bool> ends{false};
@@ -132,12 +127,12 @@ TEST(FamilyStress, TwoFamiliesThatDoEverythingAtOnceNeitherHangNorBreakTheDaemon
     ends = true;
     for (auto& thread : threads) thread.join();
     for (const auto& member : members) {
-      EXPECT_EQ(member->problem(), "") << "member " << member->number();
+      EXPECT_EQ(member->problem(), "");
       aggregated += member->aggregated();
     }
     EXPECT_GT(aggregated, 0u) << "nobody ever aggregated: the families did not form";
     // Half of the members leave first; the others are still connected when the daemon ends.
-    for (int i = 0; i < kMembers; i += 2) members[static_cast<std::size_t>(i)]->leave();
+    members.resize(kMembers / 2);
   }
   EXPECT_EQ(harness.stopDaemon(), 0);
 }

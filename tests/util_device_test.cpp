@@ -9,6 +9,7 @@
 #include "platform/device/FirmwareFacts.h"
 #include "tests/support/TestRoot.h"
 #include "util/ReportingdUtil.h"
+#include "util/SamplingDraw.h"
 #include "util/URLQuery.h"
 #include "values/Conversions.h"
 
@@ -203,6 +204,13 @@ TEST(ReportingdUtil, EncodesWhatAQueryMayNotHold) {
   EXPECT_EQ(encodedForURLQuery(" #%[]\"\\\n<>^`{|}\x7f\xc3\xa9"),
             "%20%23%25%5B%5D%22%5C%0A%3C%3E%5E%60%7B%7C%7D%7F%C3%A9");
   EXPECT_EQ(encodedForURL(unreserved + "#[]%20 \"\xc3\xa9"), unreserved + "#[]%20%20%22%C3%A9");
+}
+
+TEST(SamplingDraw, FollowsTheDefaultSequence) {
+  // The values of drand48 in a program that never seeds it.
+  EXPECT_NEAR(nextSamplingDraw(), 0.0, 1e-9);
+  EXPECT_NEAR(nextSamplingDraw(), 0.000985394675650, 1e-12);
+  EXPECT_NEAR(nextSamplingDraw(), 0.041631001594613, 1e-12);
 }
 
 }  // namespace

@@ -132,19 +132,6 @@ TEST_F(MessageLogTest, ReplacesAFileOlderThanADay) {
   }
 }
 
-TEST_F(MessageLogTest, KeepsTheNewestOfItsFiles) {
-  const std::string names[] = {"veskreportingd_9_messageLog.diag", "veskreportingd_5_messageLog.diag",
-                               "veskreportingd__messageLog.diag"};
-  make(names[0]);
-  makeYounger(names[1], names[0]);
-  makeYounger(names[2], names[1]);
-  _clock.time = birth(_logs / names[2]);
-  const std::string dates[] = {logDate(birth(_logs / names[0])), logDate(birth(_logs / names[1]))};
-  _log.write("message");
-  EXPECT_EQ(files(), Names{names[2]});
-  for (int i : {0, 1}) EXPECT_EQ(_lines.count(6, deleted(names[i], dates[i])), 1);
-}
-
 TEST_F(MessageLogTest, TouchesNothingElse) {
   const Names others = {"veskreportingd_messageLog.diag",
                         "veskreportingd_1_2_messageLog.diag",
