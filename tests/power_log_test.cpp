@@ -26,12 +26,9 @@ class PowerLogTest : public testing::Test {
     powerLog.flush();
   }
   std::vector<PowerLogEvent> events(WallTime since = {}) const {
-    std::vector<PowerLogEvent> all;
-    EXPECT_TRUE(readPowerLog(path, since, [&](const PowerLogEvent& event) {
-      all.push_back(event);
-      return true;
-    }));
-    return all;
+    auto read = readPowerLog(path, since);
+    EXPECT_TRUE(read);
+    return read ? *read : std::vector<PowerLogEvent>();
   }
 
   TempDirectory directory;

@@ -31,8 +31,6 @@ class LogRateLimit {
     std::uint32_t user;  ///< LogUser::kNobody for the process itself and for the shared entry
     const char* format;  ///< format of the lines
     std::uint64_t lines;
-
-    friend bool operator==(const LeftOut&, const LeftOut&) = default;
   };
 
   struct Verdict {

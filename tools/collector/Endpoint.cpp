@@ -62,13 +62,9 @@ std::string describeRequest(const HTTPReceived& received) {
 }
 
 HTTPAnswer EndpointTable::serve(const HTTPReceived& received, const CollectorFault*) {
-  const std::pair<std::string, Endpoint*>* best = nullptr;
-  for (const auto& entry : _endpoints) {
-    if (!isAtOrBelow(received.path(), entry.first)) continue;
-    if (best == nullptr || entry.first.size() > best->first.size()) best = &entry;
-  }
-  if (best == nullptr) throw Refusal{404, "nothing is offered under this path"};
-  return best->second->answer(received);
+  for (const auto& [path, endpoint] : _endpoints)
+    if (isAtOrBelow(received.path(), path)) return endpoint->answer(received);
+  throw Refusal{404, "nothing is offered under this path"};
 }
 
 HTTPAnswer ControlEndpoint::serve(const HTTPReceived& received, const CollectorFault*) {

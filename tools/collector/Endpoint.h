@@ -104,8 +104,8 @@ std::string describeRequest(const HTTPReceived& received);
 class EndpointTable : public Endpoint {
  public:
   explicit EndpointTable(const CollectorServices& services) : Endpoint(services) {}
-  /// Adds `path` ("/events") and everything below it. The longest matching path wins. The endpoint must
-  /// outlive the table.
+  /// Adds `path` ("/events") and everything below it; not below one added before. The endpoint must outlive
+  /// the table.
   void add(std::string path, Endpoint& endpoint) { _endpoints.emplace_back(std::move(path), &endpoint); }
 
  private:

@@ -57,7 +57,6 @@ class HTTPServer::Core : public HTTPConnection::Owner {
   const Options options;
   std::uint16_t port = 0;  // constant after construction
   std::atomic<std::size_t> accepted = 0;
-  std::atomic<std::size_t> open = 0;
 
   HTTPAnswer answerTo(const HTTPReceived& received) noexcept override {
     try {
@@ -73,7 +72,6 @@ class HTTPServer::Core : public HTTPConnection::Owner {
 
   void connectionEnded(const std::shared_ptr<HTTPConnection>& connection) noexcept override {
     _connections.erase(connection);
-    open = _connections.size();
   }
 
  private:
@@ -134,7 +132,6 @@ class HTTPServer::Core : public HTTPConnection::Owner {
     auto connection = std::make_shared<HTTPConnection>(
         std::move(socket), HTTPConnection::Setting{options.maximumBody, _tls.get()}, *this);
     _connections.insert(connection);
-    open = _connections.size();
     connection->start();
   }
 
@@ -172,7 +169,5 @@ std::string HTTPServer::baseURL() const {
 void HTTPServer::stop() { _core->stop(); }
 
 std::size_t HTTPServer::connectionsAccepted() const { return _core->accepted; }
-
-std::size_t HTTPServer::connectionsOpen() const { return _core->open; }
 
 }  // namespace vesk

@@ -53,8 +53,6 @@ class HTTPServer {
   void stop();
 
   std::size_t connectionsAccepted() const;
-  /// The number of currently open connections.
-  std::size_t connectionsOpen() const;
 
  private:
   class Core;

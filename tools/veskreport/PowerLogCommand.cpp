@@ -17,13 +17,8 @@ namespace vesk {
 namespace {
 
 constexpr int kBusyMilliseconds = 5000;
-constexpr std::size_t kBatchEvents = 500;
-constexpr std::size_t kBatchBytes = std::size_t{1} << 20;
-
-// The "+" keeps the planner from using the index of times and sorting.
 constexpr char kEvents[] =
-    "SELECT identifier, name, time, dictionary, id FROM events"
-    " WHERE id BETWEEN ?1 AND ?2 AND +time >= ?3 ORDER BY id";
+    "SELECT identifier, name, time, dictionary FROM events WHERE time >= ?1 ORDER BY id";
 
 std::string textIn(sqlite3_stmt* row, int column) {
   const auto* text = reinterpret_cast<const char*>(sqlite3_column_text(row, column));
@@ -38,47 +33,6 @@ PowerLogEvent eventIn(sqlite3_stmt* row) {
   event.time = WallTime(std::chrono::microseconds(std::llround(sqlite3_column_double(row, 2) * 1e6)));
   event.dictionary = textIn(row, 3);
   return event;
-}
-
-/// Reads up to a batch of events that begins with the row `next`, which then is the row after it. Returns
-/// SQLITE_ROW while more may follow, SQLITE_DONE with the last batch.
-int readBatch(sqlite3* database, std::int64_t& next, std::int64_t last, double since,
-              std::vector<PowerLogEvent>& events) {
-  auto row = prepare(database, kEvents);
-  if (!row) return sqlite3_errcode(database);
-  sqlite3_bind_int64(row.get(), 1, next);
-  sqlite3_bind_int64(row.get(), 2, last);
-  sqlite3_bind_double(row.get(), 3, since);
-  int result = SQLITE_ROW;
-  for (std::size_t bytes = 0; events.size() < kBatchEvents && bytes < kBatchBytes;) {
-    result = sqlite3_step(row.get());
-    if (result != SQLITE_ROW) break;
-    events.push_back(eventIn(row.get()));
-    bytes += events.back().dictionary.size();
-    next = sqlite3_column_int64(row.get(), 4) + 1;
-  }
-  return result;
-}
-
-/// Reads in batches. An open statement keeps the file's state from its start and prevents the write-ahead log
-/// from being reset, so none is open while events are passed on, which may take as long as a person reads.
-/// Returns SQLITE_DONE or a result code that is an error.
-int readBatches(sqlite3* database, double since, const std::function<bool(const PowerLogEvent&)>& take) {
-  auto range = prepare(database, "SELECT min(id), max(id) FROM events WHERE time >= ?1");
-  if (!range) return sqlite3_errcode(database);
-  sqlite3_bind_double(range.get(), 1, since);
-  int result = sqlite3_step(range.get());
-  if (result == SQLITE_ROW && sqlite3_column_type(range.get(), 0) == SQLITE_NULL) return SQLITE_DONE;
-  std::int64_t next = sqlite3_column_int64(range.get(), 0);
-  const std::int64_t last = sqlite3_column_int64(range.get(), 1);
-  range.reset();
-  while (result == SQLITE_ROW) {
-    std::vector<PowerLogEvent> events;
-    result = readBatch(database, next, last, since, events);
-    for (const PowerLogEvent& event : events)
-      if (!take(event)) return SQLITE_DONE;
-  }
-  return result;
 }
 
 // Covers any time that a log can hold, and stays within the clock's range.
@@ -138,16 +92,19 @@ int show(const PowerLogEvent& event, const Output& output) {
 
 }  // namespace
 
-Result<void> readPowerLog(const std::string& path, WallTime since,
-                          const std::function<bool(const PowerLogEvent& event)>& take) {
+Result<std::vector<PowerLogEvent>> readPowerLog(const std::string& path, WallTime since) {
   sqlite3* opened = nullptr;
-  const auto failure = [&opened] { return Error{Error::Kind::Failed, sqlite3_errmsg(opened)}; };
   int result = sqlite3_open_v2(path.c_str(), &opened, SQLITE_OPEN_READONLY | SQLITE_OPEN_NOMUTEX, nullptr);
   SQLiteDatabase database(opened);
-  if (result != SQLITE_OK) return failure();
-  sqlite3_busy_timeout(opened, kBusyMilliseconds);
-  if (readBatches(opened, secondsFrom(since), take) != SQLITE_DONE) return failure();
-  return {};
+  std::vector<PowerLogEvent> events;
+  if (result == SQLITE_OK) {
+    sqlite3_busy_timeout(opened, kBusyMilliseconds);
+    auto row = prepare(opened, kEvents);
+    sqlite3_bind_double(row.get(), 1, secondsFrom(since));
+    while (row && (result = sqlite3_step(row.get())) == SQLITE_ROW) events.push_back(eventIn(row.get()));
+  }
+  if (result != SQLITE_DONE) return Error{Error::Kind::Failed, sqlite3_errmsg(opened)};
+  return events;
 }
 
 int runPowerLog(const Invocation& invocation, const Output& output) {
@@ -156,12 +113,11 @@ int runPowerLog(const Invocation& invocation, const Output& output) {
   std::error_code unknown;
   if (!std::filesystem::exists(path, unknown))
     return output.failed(path + ": " + (unknown ? unknown.message() : "nothing has been recorded"));
-  int status = kExitDone;
-  const auto read = readPowerLog(path, since, [&](const PowerLogEvent& event) {
-    status = show(event, output);
-    return status == kExitDone;
-  });
-  return read ? status : output.failed(path + ": " + read.error().text);
+  const auto events = readPowerLog(path, since);
+  if (!events) return output.failed(path + ": " + events.error().text);
+  for (const PowerLogEvent& event : *events)
+    if (const int status = show(event, output); status != kExitDone) return status;
+  return kExitDone;
 }
 
 }  // namespace vesk

@@ -1,16 +1,16 @@
 // Reads the power log's file.
 #pragma once
 
-#include <functional>
 #include <string>
+#include <vector>
 
 #include "platform/powerlog/PowerLogFile.h"
 
 namespace vesk {
 
-/// Passes the events from `since` on to `take`, oldest first, until it returns false. Works while a daemon
-/// writes, and ignores events added meanwhile. A slow `take` does not block the daemon.
-Result<void> readPowerLog(const std::string& path, WallTime since,
-                          const std::function<bool(const PowerLogEvent& event)>& take);
+/// Returns the events from `since` on, oldest first. Works while a daemon writes. Takes memory for all of
+/// them, which the file's limit bounds, so that the file is closed when they are shown, which may take as
+/// long as a person reads.
+Result<std::vector<PowerLogEvent>> readPowerLog(const std::string& path, WallTime since);
 
 }  // namespace vesk
