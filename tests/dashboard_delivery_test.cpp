@@ -285,40 +285,6 @@ TEST(UDPSocketTest, FindsAnotherWayOrReceivesNothing) {
   EXPECT_EQ(server.take(), std::vector<std::string>{"y"});
 }
 
-/// A reliable delivery to `server` in real time.
-std::shared_ptr<DashboardDelivery> reliableOn(QueueThread& thread, const DashboardServer& server,
-                                              std::shared_ptr<DashboardLinger> linger, Counters& counters,
-                                              milliseconds tick) {
-  UDPSocket socket;
-  EXPECT_TRUE(socket.open());
-  auto delivery = std::make_shared<DashboardDelivery>(std::move(socket), thread.makeQueue("test"),
-                                                      std::move(linger), counters, "dashboard");
-  delivery->useReliableUDP();
-  EXPECT_TRUE(delivery->connect(server.endpoint()));
-  EXPECT_TRUE(delivery->start(tick));
-  return delivery;
-}
-
-TEST(DeliveryOnThreads, SendsAgainUntilAnsweredInRealTime) {
-  const long before = openDescriptors();
-  Counters counters;
-  DashboardServer server;
-  {
-    QueueThread thread;
-    auto delivery =
-        reliableOn(thread, server, std::make_shared<DashboardLinger>(1), counters, milliseconds(10));
-    delivery->send(std::make_unique<DashboardDelivery::Buffer>(), kDashboardHeaderSize, 0);
-    const auto first = server.next();
-    EXPECT_EQ(server.next(), first);
-    server.send(first);
-    delivery->cleanup();
-    delivery.reset();
-    EXPECT_TRUE(thread.waitUntilUnused(std::chrono::minutes(1)));
-  }
-  EXPECT_EQ(openDescriptors(), before + 1) << "the server's";
-  EXPECT_TRUE(counters.snapshot().empty());
-}
-
 TEST(DeliveryOnThreads, EndAtOnceBeyondTheirPlacesAndLeaveNothingBehindWhenStopped) {
   constexpr int kPlaces = 8;
   const long before = openDescriptors();
@@ -329,7 +295,12 @@ TEST(DeliveryOnThreads, EndAtOnceBeyondTheirPlacesAndLeaveNothingBehindWhenStopp
     QueueThread thread;
     const long started = openDescriptors();
     for (int i = 0; i < 3 * kPlaces; ++i) {
-      auto delivery = reliableOn(thread, server, linger, counters, milliseconds(500));
+      UDPSocket socket;
+      EXPECT_TRUE(socket.open());
+      auto delivery = std::make_shared<DashboardDelivery>(std::move(socket), thread.makeQueue("test"), linger,
+                                                          counters, "dashboard");
+      delivery->useReliableUDP();
+      EXPECT_TRUE(delivery->connect(server.endpoint()) && delivery->start(milliseconds(500)));
       delivery->send(std::make_unique<DashboardDelivery::Buffer>(), kDashboardHeaderSize, 1);
       delivery->cleanup();
       EXPECT_LE(openDescriptors(), started + kPlaces + 4) << "three are the thread's, one may be on its way";

@@ -172,22 +172,6 @@ TEST(HTTPClient, GivesUpWhatMovesTooSlowlyAndOnlyThat) {
   }
 }
 
-TEST(HTTPClient, TakesABodyUpToTheLimitAndNoEndOfHeaders) {
-  RecordingServer server([](const HTTPReceived& request, std::size_t) {
-    HTTPAnswer answer;
-    answer.body = std::string(1000, 'b');
-    if (request.path() == "/headers") {
-      answer.headers.assign(300, {"X-Header", std::string(1000, 'h')});
-    }
-    return answer;
-  });
-  HTTPClient exact(HTTPClient::Options{.maximumBody = 1000});
-  EXPECT_EQ(exact.perform(fetchFrom(server.url())).response->body.size(), 1000u);
-  EXPECT_EQ(exact.perform(fetchFrom(server.url("/headers"))).error->kind, Kind::TooLarge);
-  HTTPClient less(HTTPClient::Options{.maximumBody = 999});
-  EXPECT_EQ(less.perform(fetchFrom(server.url())).error->kind, Kind::TooLarge);
-}
-
 TEST(HTTPClient, ItsEndFailsWhatIsOutstandingAtOnce) {
   RecordingServer server([](const HTTPReceived&, std::size_t) { return faulty(Fault::Stall); });
   auto client = std::make_unique<HTTPClient>();

@@ -175,56 +175,6 @@ TEST(Wire, AgreesWithSdBusOnBrokenMessages) {
   EXPECT_LT(lax, 300);
 }
 
-/// A header with these fields, each a code, a type and a value, without a body.
-std::string headerOnly(char type, const std::vector<std::tuple<char, const char*, std::string>>& list) {
-  Marshalled fields(false);
-  for (const auto& [code, signature, value] : list) {
-    if (*signature == 'u') {
-      fields.align(8);
-      fields.raw(std::string(1, code) + "\1u\0"s);
-      fields.number(static_cast<std::uint32_t>(std::stoul(value)));
-    } else {
-      fields.field(code, signature, value);
-    }
-  }
-  return wholeMessage(std::string("l") + type + "\1\1", fields.take(), "");
-}
-
-TEST(Wire, AgreesWithSdBusOnHeaders) {
-  using Fields = std::vector<std::tuple<char, const char*, std::string>>;
-  const std::tuple<char, const char*, std::string> path{1, "o", "/o"};
-  const std::tuple<char, const char*, std::string> member{3, "s", "m"};
-  struct Case {
-    const char* what;
-    char type;
-    Fields fields;
-    bool isValid;
-    bool sdBusIsLax = false;
-  };
-  BusServer server;
-  for (const Case& c : {
-           Case{"fields in another order", 1, {member, path}, true},
-           Case{"a call without a path", 1, {member}, false},
-           Case{"a call without a member", 1, {path}, false},
-           Case{"a signal without an interface", 4, {path, member}, false},
-           Case{"an answer to no call", 2, {}, false},
-           Case{"an answer", 2, {{5, "u", "3"}}, true},
-           Case{"an answer to call 0", 2, {{5, "u", "0"}}, false},
-           Case{"an error without a name", 3, {{5, "u", "3"}}, false},
-           Case{"an error", 3, {{5, "u", "3"}, {4, "s", "a.B"}}, true},
-           Case{"a field twice", 1, {path, member, member}, false},
-           Case{"a field of another type", 1, {{1, "s", "/o"}, member}, false},
-           Case{"a member that begins with a digit", 1, {path, {3, "s", "1m"}}, false, true},
-           Case{"a field of a later version", 1, {path, member, {42, "s", "x"}}, true},
-           Case{"a signature that a body lacks", 1, {path, member, {8, "g", "s"}}, false},
-       }) {
-    SCOPED_TRACE(c.what);
-    const std::string bytes = headerOnly(c.type, c.fields);
-    EXPECT_EQ(readHere(bytes) != "refused", c.isValid);
-    EXPECT_EQ(readBySdBus(server, bytes) != "refused", c.isValid || c.sdBusIsLax);
-  }
-}
-
 // --- Limits
 
 TEST(Wire, WritesNothingThatNoReceiverTakes) {

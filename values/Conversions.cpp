@@ -12,13 +12,6 @@ std::string_view withoutLeadingSpace(std::string_view text) noexcept {
   return start == std::string_view::npos ? std::string_view() : text.substr(start);
 }
 
-template <class Number>
-std::string decimal(Number number) {
-  char digits[64];
-  auto [end, error] = std::to_chars(digits, digits + sizeof digits, number);
-  return error == std::errc{} ? std::string(digits, end) : std::string();
-}
-
 // Uses an exponent only for very large or small numbers, so that reading 100000 as an integer doesn't give 1.
 std::string decimal(double number) {
   const double size = std::abs(number);
@@ -47,9 +40,9 @@ std::optional<std::string> stringForm(const Value& value) {
     case Value::Kind::Boolean:
       return *value.boolean() ? "1" : "0";
     case Value::Kind::Signed:
-      return decimal(*value.signedInteger());
+      return std::to_string(*value.signedInteger());
     case Value::Kind::Unsigned:
-      return decimal(*value.unsignedInteger());
+      return std::to_string(*value.unsignedInteger());
     case Value::Kind::Double:
       return decimal(*value.real());
     default:

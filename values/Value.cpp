@@ -4,7 +4,6 @@
 #include <cmath>
 #include <limits>
 #include <unordered_map>
-#include <unordered_set>
 
 namespace vesk {
 
@@ -26,6 +25,22 @@ bool areUnique(const std::vector<DictionaryEntry>& entries) noexcept {
     }
   }
   return true;
+}
+
+/// Leaves one entry for each key, with the place of its first and the value of its last.
+void makeUnique(std::vector<DictionaryEntry>& entries) {
+  std::unordered_map<Text, std::size_t> places;
+  places.reserve(entries.size());
+  std::size_t count = 0;
+  for (auto& entry : entries) {
+    auto [at, isNew] = places.emplace(entry.key, count);
+    if (!isNew) {
+      entries[at->second].value = std::move(entry.value);
+    } else if (auto& place = entries[count++]; &place != &entry) {
+      place = std::move(entry);
+    }
+  }
+  entries.erase(entries.begin() + static_cast<std::ptrdiff_t>(count), entries.end());
 }
 
 }  // namespace
@@ -125,15 +140,8 @@ void MutableDictionary::setAll(const Dictionary& source) {
     for (const auto& entry : source) set(entry.key, entry.value);
     return;
   }
-  // The source has an index; this dictionary has none.
-  std::unordered_set<const Value*> taken;
-  for (auto& entry : _entries) {
-    const Value* value = source.find(entry.key.view());
-    if (value && taken.insert(value).second) entry.value = *value;
-  }
-  for (const auto& entry : source) {
-    if (!taken.contains(&entry.value)) append(entry.key, entry.value);
-  }
+  _entries.insert(_entries.end(), source.begin(), source.end());
+  makeUnique(_entries);
 }
 
 void MutableDictionary::remove(std::string_view key) {
@@ -148,32 +156,7 @@ Dictionary MutableDictionary::share() {
 }
 
 Dictionary MutableDictionary::shareUnique() {
-  if (_entries.size() <= kLinearScanLimit && areUnique(_entries)) return share();
-  std::vector<DictionaryEntry> unique;
-  unique.reserve(_entries.size());
-  if (_entries.size() <= kLinearScanLimit) {
-    for (auto& entry : _entries) {
-      auto same =
-          std::find_if(unique.begin(), unique.end(), [&](const auto& e) { return e.key == entry.key; });
-      if (same == unique.end()) {
-        unique.push_back(std::move(entry));
-      } else {
-        same->value = std::move(entry.value);
-      }
-    }
-  } else {
-    std::unordered_map<Text, std::size_t> seen;
-    seen.reserve(_entries.size());
-    for (auto& entry : _entries) {
-      auto [at, isNew] = seen.emplace(entry.key, unique.size());
-      if (isNew) {
-        unique.push_back(std::move(entry));
-      } else {
-        unique[at->second].value = std::move(entry.value);
-      }
-    }
-  }
-  _entries = std::move(unique);
+  if (_entries.size() > kLinearScanLimit || !areUnique(_entries)) makeUnique(_entries);
   return share();
 }
 

@@ -2,7 +2,6 @@
 #pragma once
 
 #include <gtest/gtest.h>
-#include <poll.h>
 
 #include <filesystem>
 
@@ -29,14 +28,6 @@ class DashboardServer {
     char buffer[2048];
     while (auto size = _socket.receive(buffer, &_client)) datagrams.emplace_back(buffer, *size);
     return datagrams;
-  }
-  /// Waits for the next datagram, in real time.
-  std::string next() {
-    pollfd arrival{_socket.descriptor(), POLLIN, 0};
-    EXPECT_EQ(::poll(&arrival, 1, 60'000), 1);
-    char buffer[2048];
-    auto size = _socket.receive(buffer, &_client);
-    return std::string(buffer, size.value_or(0));
   }
   std::vector<int> takeEventIDs() {
     std::vector<int> ids;
