@@ -1,6 +1,7 @@
 // Limits the posts that wait although their server answers.
 #pragma once
 
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
@@ -63,8 +64,9 @@ class PostAccount {
   void add(std::size_t bytes) { _budget->change(*this, bytes, 0); }
   void remove(std::size_t bytes) { _budget->change(*this, 0, bytes); }
 
-  /// Notes the keeper's ticket of the sender's latest post. Called on the sender's thread.
-  void noteKept(PostKeeper::Ticket ticket) { _lastKept = ticket; }
+  /// Notes the keeper's ticket of the sender's latest post; 0 if it was not kept. Called on the sender's
+  /// thread.
+  void noteKept(PostKeeper::Ticket ticket) { _lastKept = std::max(_lastKept, ticket); }
   /// Waits until the posts that the sender's thread has made are on disk, if they are written before they are
   /// sent. Called on that thread.
   void waitUntilWritten();
