@@ -26,9 +26,9 @@ std::int32_t startOfMinute(double seconds) {
 
 // Sets a field. If its source is unknown, the field is left out, even if the payload has one.
 template <class T>
-void setIfKnown(MutableDictionary& event, Text key, const std::optional<T>& value) {
+void setIfKnown(MutableDictionary& event, const Text& key, const std::optional<T>& value) {
   if (value) {
-    event.set(std::move(key), *value);
+    event.set(key, *value);
   } else {
     event.remove(key.view());
   }

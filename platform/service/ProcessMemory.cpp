@@ -5,6 +5,7 @@
 #include <sys/mman.h>
 #include <unistd.h>
 
+#include <bit>
 #include <cstdint>
 #include <cstdlib>
 #include <new>
@@ -24,7 +25,7 @@ int releaseObject(dl_phdr_info* object, std::size_t, void*) {
     if (segment.p_type != PT_LOAD || (segment.p_flags & PF_W) != 0) continue;
     const std::uintptr_t start = object->dlpi_addr + segment.p_vaddr;
     const std::uintptr_t begin = start / page * page;
-    ::madvise(reinterpret_cast<void*>(begin), start + segment.p_memsz - begin, MADV_DONTNEED);
+    ::madvise(std::bit_cast<void*>(begin), start + segment.p_memsz - begin, MADV_DONTNEED);
   }
   return 0;
 }
