@@ -94,7 +94,7 @@ ReportingStatus statusOf(const Error& error) noexcept {
 
 }  // namespace
 
-VeskReporting::VeskReporting(ReportingOptions options) noexcept {
+VeskReporting::VeskReporting(const ReportingOptions& options) noexcept {
   try {
     _implementation = std::make_unique<Implementation>(options);
   } catch (const std::exception& error) {

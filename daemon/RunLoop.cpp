@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <climits>
 #include <system_error>
+#include <utility>
 
 namespace vesk {
 
@@ -25,7 +26,7 @@ sigset_t stopSignals() {
 }  // namespace
 
 RunLoop::RunLoop(Options options, BusyMarker& busyMarker, ServiceManager& serviceManager)
-    : _options(options), _busyMarker(busyMarker), _serviceManager(serviceManager) {
+    : _options(std::move(options)), _busyMarker(busyMarker), _serviceManager(serviceManager) {
   sigset_t signals = stopSignals();
   _signals = FileDescriptor(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
   if (!_signals) throw std::system_error(errno, std::generic_category(), "signalfd");

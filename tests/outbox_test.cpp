@@ -102,8 +102,10 @@ class Outbox : public testing::Test {
       changed.notify_all();
     };
     outbox = std::make_unique<PostOutbox>(options);
-    client = std::make_unique<HTTPClient>(HTTPClient::Options{
-        .keeper = outbox.get(), .keepsFirst = keepsFirst, .retryFor = 20ms, .firstRetryAfter = 5ms});
+    client = std::make_unique<HTTPClient>(HTTPClient::Options{.keeper = outbox.get(),
+                                                              .keepsFirst = keepsFirst,
+                                                              .retryFor = keepsFirst ? 60'000ms : 20ms,
+                                                              .firstRetryAfter = 5ms});
     outbox->start(*client);
   }
   void end() {

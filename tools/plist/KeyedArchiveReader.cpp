@@ -154,7 +154,7 @@ void print(const Value& value, std::size_t indent, std::string& out) {
 Result<Value> unarchiveValue(std::string_view bytes, const PropertyListLimits& limits) {
   if (!bytes.starts_with(kBinaryPropertyListMagic))
     return malformed("no keyed archive: it is no binary property list");
-  const auto parsed = parsePropertyList(bytes, PropertyListFlavor::KeyedArchive, limits);
+  auto parsed = parsePropertyList(bytes, PropertyListFlavor::KeyedArchive, limits);
   if (!parsed) return parsed;
   try {
     return unarchived(*parsed, limits);

@@ -28,7 +28,7 @@ class VESK_API VeskReporting {
   static constexpr std::chrono::milliseconds kDefaultTimeout{30'000};
 
   /// Starts the session's thread, which connects to the daemon with the first operation.
-  explicit VeskReporting(ReportingOptions options = {}) noexcept;
+  explicit VeskReporting(const ReportingOptions& options = {}) noexcept;
   /// Waits until the daemon has taken and answered what is queued, for at most `ReportingOptions::drainTime`.
   /// If the daemon was never reached, makes one attempt. Waits for a running callback or handler without a
   /// time limit, so it must not be called from one, or while holding a lock that one needs.
