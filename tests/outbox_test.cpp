@@ -57,6 +57,9 @@ TEST(HostBackoff, ResumesWhenTheHostAnswersUnlessItAskedToWait) {
   EXPECT_EQ(backoff.next(), now + 24h) << "no server stops a device for longer";
   backoff.held(now, std::nullopt, 0.5);
   EXPECT_EQ(backoff.next(), now + 900s) << "without a wish the waits grow";
+  backoff.failed(now, 0.5);
+  backoff.hostAnswered(now);
+  EXPECT_EQ(backoff.next(), now) << "it no longer asks to wait";
   backoff.succeeded();
   EXPECT_TRUE(backoff.isUp());
   EXPECT_LE(backoff.next(), now);
