@@ -31,9 +31,8 @@ class StartPolicy {
   void started() noexcept { _due = Time::max(); }
   /// `random`: from [0, 1).
   void answeredWithNothing(Time now, double random) noexcept {
-    _due = now + std::min<Time::duration>(
-                     std::chrono::duration_cast<Time::duration>(_wait * (1 + random / 4)), kLongestWait);
-    _wait = std::min(_wait * 2, kLongestWait);
+    _due = now + std::chrono::duration_cast<Time::duration>(_wait * (1 + random / 4));
+    _wait = std::min(_wait * 2, kLongestWait * 4 / 5);
   }
   void answeredWithConfiguration(Time now) noexcept {
     _wait = kFirstWait;
