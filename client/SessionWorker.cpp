@@ -268,7 +268,8 @@ bool SessionWorker::sendTogether(Time now) {
   BusClient& bus = _link.bus();
   for (auto next = _waiting.begin(); next != _waiting.end();) {
     const auto call = next++;
-    if (call->effect == CallEffect::Starts && !call->end) {  // nobody waits, but the answer matters
+    if (call->effect == CallEffect::Starts &&
+        !call->end) {  // has no callback, but its answer decides about another start
       call->end = [](ReportingStatus, BusAnswer*, std::string_view) {};
       call->deadline = now + kStartTime;
       _firstDeadline = std::min(_firstDeadline, call->deadline);

@@ -7,15 +7,15 @@
 namespace vesk {
 
 /// A start that gave no configuration is repeated after 900 s, when the daemon may fetch a storebag again,
-/// and then after waits that double, up to an hour. Each is up to a quarter longer at random within that, so
-/// that many clients don't return together. A start that gave one is repeated after the refresh interval, if
+/// and then after waits that double up to 48 minutes. Each wait is up to a quarter longer at random, so that
+/// many clients don't return together. A start that gave one is repeated after the refresh interval, if
 /// there is one. Depends only on its arguments. Not thread-safe.
 class StartPolicy {
  public:
   using Time = std::chrono::steady_clock::time_point;
 
   static constexpr std::chrono::seconds kFirstWait{900};
-  static constexpr std::chrono::seconds kLongestWait{3600};
+  static constexpr std::chrono::seconds kLongestWait{3600};  ///< with its random part
 
   /// `refreshInterval`: 0 for none, otherwise at least a second.
   explicit StartPolicy(std::chrono::milliseconds refreshInterval)

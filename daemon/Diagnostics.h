@@ -28,7 +28,7 @@ class Diagnostics {
     Dictionary settings;  ///< in force
     std::function<PublicKeys()> publicKeys;
   };
-  /// Also finds the group whose members see everything, so it must be made before the sandbox is entered.
+  /// Reads /etc/group for the group whose members see everything.
   explicit Diagnostics(Sources sources);
 
   /// `health` ("ok" or "degraded") and `reasons`, `version`, `uptime` in seconds, `environment`, `settings`,

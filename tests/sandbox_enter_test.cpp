@@ -10,6 +10,7 @@
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
+#include <sys/timex.h>
 #include <sys/un.h>
 #include <sys/wait.h>
 
@@ -140,6 +141,12 @@ TEST_F(SandboxTest, DeniesWhatIsNotGranted) {
       {"signal a process", [&] { return ::kill(parent, 0); }},
       {"make a namespace", [] { return ::unshare(CLONE_NEWNET); }},
       {"change the root", [] { return ::chroot("/"); }},
+      {"set the clock",
+       [] {
+         timex change{};
+         change.modes = ADJ_OFFSET;
+         return ::adjtimex(&change);
+       }},
       {"become a user", [] { return ::setuid(::getuid()); }},
       {"load a BPF program", [] { return ::syscall(SYS_bpf, 0, nullptr, 0); }},
       {"use a key ring", [] { return ::syscall(SYS_keyctl, 0, 0, 0); }},

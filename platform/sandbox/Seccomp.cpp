@@ -1,6 +1,7 @@
 #include "platform/sandbox/Seccomp.h"
 
 #include <fcntl.h>
+#include <linux/capability.h>
 #include <linux/netlink.h>
 #include <sched.h>
 #include <seccomp.h>
@@ -9,6 +10,7 @@
 #include <sys/resource.h>
 #include <sys/shm.h>
 #include <sys/socket.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -88,7 +90,8 @@ std::vector<Rule> allRules() {
                   "vm86",       "vm86old",         "modify_ldt",    "_sysctl",        "nfsservctl",
                   "vhangup",    "fanotify_init"}},
 
-      // Not adjtimex, which tells whether the clock is synchronised, and sets it only with a capability.
+      // Not adjtimex, which tells whether the clock is synchronised. It sets it only with the capability that
+      // the process gives up.
       {"clock", {"settimeofday", "clock_settime", "clock_settime64", "stime"}},
 
       {"identity",
@@ -172,6 +175,16 @@ int load(const std::vector<std::string>& groups) {
   return result == 0 ? seccomp_load(filter.get()) : result;
 }
 
+/// Gives up the capability to set the clock, for a daemon that root starts without the service manager.
+int giveUpSettingTheClock() {
+  __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
+  __user_cap_data_struct sets[_LINUX_CAPABILITY_U32S_3] = {};
+  if (::syscall(SYS_capget, &header, sets) != 0) return -errno;
+  for (auto* set : {&sets[0].effective, &sets[0].permitted, &sets[0].inheritable})
+    *set &= ~(1U << CAP_SYS_TIME);
+  return ::syscall(SYS_capset, &header, sets) == 0 ? 0 : -errno;
+}
+
 }  // namespace
 
 bool isCallGroup(std::string_view name) {
@@ -180,7 +193,9 @@ bool isCallGroup(std::string_view name) {
 }
 
 Result<void> denyCalls(const std::vector<std::string>& groups) {
-  const int result = groups.empty() ? 0 : load(groups);
+  const bool deniesClock = std::ranges::find(groups, "clock") != groups.end();
+  int result = deniesClock ? giveUpSettingTheClock() : 0;  // before the filter, which denies capset
+  if (result == 0 && !groups.empty()) result = load(groups);
   if (result == 0) return {};
   return systemError(-result, "the system-call filter can't be loaded");
 }

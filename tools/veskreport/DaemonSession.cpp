@@ -28,16 +28,21 @@ Dictionary sessionInfoOf(const Invocation& invocation) {
 
 }  // namespace
 
+std::optional<Dictionary> userInfoOf(const Invocation& invocation, const Output& output) {
+  auto further = parsePairs(invocation.userInfo);
+  if (!further) output.fail("user info " + further.error().text, kExitUsage);
+  MutableDictionary userInfo;
+  if (!invocation.clientName.empty()) userInfo.set(kVeskReportingUserInfoClientName, invocation.clientName);
+  if (!invocation.serviceName.empty())
+    userInfo.set(kVeskReportingUserInfoServiceName, invocation.serviceName);
+  userInfo.setAll(*further);
+  if (userInfo.empty()) return std::nullopt;
+  return userInfo.share();
+}
+
 DaemonSession::DaemonSession(const Invocation& invocation, const Output& output)
     : _invocation(invocation), _output(output), _sessionInfo(sessionInfoOf(_invocation)) {
-  auto further = parsePairs(_invocation.userInfo);
-  if (!further) _output.fail("user info " + further.error().text, kExitUsage);
-  MutableDictionary userInfo;
-  if (!_invocation.clientName.empty()) userInfo.set(kVeskReportingUserInfoClientName, _invocation.clientName);
-  if (!_invocation.serviceName.empty())
-    userInfo.set(kVeskReportingUserInfoServiceName, _invocation.serviceName);
-  userInfo.setAll(*further);
-  if (!userInfo.empty()) _userInfo = userInfo.share();
+  _userInfo = userInfoOf(_invocation, _output);
   const std::string path = _invocation.socket.empty() ? pathUnderRoot(wire::kSocketPath) : _invocation.socket;
   ReportingOptions options;
   options.socketPath = path;

@@ -40,6 +40,9 @@ class DaemonSession {
   std::optional<Dictionary> _userInfo;
 };
 
+/// The user info that the command line gives; nullopt if it gives none. Ends the command if it is malformed.
+std::optional<Dictionary> userInfoOf(const Invocation& invocation, const Output& output);
+
 /// Why a call failed, in words.
 std::string causeOf(ReportingStatus status, const std::string& detail);
 

@@ -12,7 +12,7 @@
 #include "protocol/WireNames.h"
 #include "tools/text/Printable.h"
 #include "tools/veskreport/CommandLine.h"
-#include "tools/veskreport/PayloadParser.h"
+#include "tools/veskreport/DaemonSession.h"
 
 namespace vesk {
 
@@ -180,16 +180,9 @@ int runStatus(const Invocation& invocation, const Output& output) {
 }
 
 int runExplain(const Invocation& invocation, const Output& output) {
-  auto further = parsePairs(invocation.userInfo);
-  if (!further) output.fail("user info " + further.error().text, kExitUsage);
-  MutableDictionary userInfo;
-  if (!invocation.clientName.empty()) userInfo.set(kVeskReportingUserInfoClientName, invocation.clientName);
-  if (!invocation.serviceName.empty())
-    userInfo.set(kVeskReportingUserInfoServiceName, invocation.serviceName);
-  userInfo.setAll(*further);
   MutableDictionary request(
       Dictionary{{kVeskReportingSessionInfoClientType, invocation.clientType}, {"draw", invocation.draw}});
-  if (!userInfo.empty()) request.set("userInfo", userInfo.share());
+  if (const auto userInfo = userInfoOf(invocation, output)) request.set("userInfo", *userInfo);
   const auto explanation = askDaemon(invocation, output, wire::kExplain, {request.share()});
   if (const auto problem = textIn(explanation, "problem"); !problem.empty())
     return output.failed(problem, explanation);
