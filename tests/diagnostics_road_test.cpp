@@ -92,6 +92,10 @@ TEST_F(DiagnosticsRoad, ExplainGivesTheReasonThatTheDaemonActsUpon) {
       EXPECT_TRUE(contains(told.text, "httpPost: " + state)) << told.text;
       EXPECT_TRUE(contains(told.text, test.reason)) << told.text;
     }
+    const auto told = ask({"explain", "--client-type", "5", "--client-name", test.name});
+    const bool isEnabled = state.empty();
+    EXPECT_EQ(contains(told.text, "  posts to https://"), isEnabled) << told.text;
+    EXPECT_EQ(contains(told.text, "  reports for 100 % of the sessions"), isEnabled) << told.text;
     EXPECT_EQ(harness.stopDaemon(), 0);
   }
   harness.setPreference("diagnosticsSubmission", "false");
