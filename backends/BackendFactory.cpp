@@ -38,18 +38,22 @@ constexpr struct {
                  {kVeskReportingBackendKilnar, make<KilnarBackend>},
                  {kVeskReportingBackendWren, make<WrenBackend>}};
 
+const auto* backendWithName(std::string_view name) {
+  const bool hasNone = name == kVeskReportingBackendWren && deviceProductType() == Text::literal("Bramble");
+  const auto* known = std::find_if(std::begin(kBackends), std::end(kBackends),
+                                   [&](const auto& backend) { return backend.name == name; });
+  return known == std::end(kBackends) || hasNone ? nullptr : known;
+}
+
 }  // namespace
+
+bool isBackendName(std::string_view name) { return backendWithName(name) != nullptr; }
 
 std::shared_ptr<VeskReportingBackend> newBackendWithName(const std::string& name,
                                                          const std::optional<Dictionary>& profile,
                                                          const BackendIdentity& identity,
                                                          const BackendServices& services) {
-  const auto known = std::find_if(std::begin(kBackends), std::end(kBackends),
-                                  [&](const auto& backend) { return backend.name == name; });
-  const bool hasNone = name == kVeskReportingBackendWren && deviceProductType() == Text::literal("Bramble");
-  if (known != std::end(kBackends) && !hasNone) {
-    return known->make(name, profile, identity, services);
-  }
+  if (const auto* known = backendWithName(name)) return known->make(name, profile, identity, services);
   VESK_LOG_ERROR("VeskReportingBackend(newBackendWithName): %s", name.c_str());
   return nullptr;
 }

@@ -16,4 +16,7 @@ std::shared_ptr<VeskReportingBackend> newBackendWithName(const std::string& name
                                                          const BackendIdentity& identity,
                                                          const BackendServices& services);
 
+/// Whether `newBackendWithName` knows the name, on this device.
+bool isBackendName(std::string_view name);
+
 }  // namespace vesk

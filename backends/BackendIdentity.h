@@ -19,7 +19,8 @@ namespace vesk {
 
 /// The client process of a session.
 struct BackendClient {
-  uid_t user = UploadGate::kNobody;      ///< charged for posts and uploads that wait
+  uid_t user = UploadGate::kNobody;  ///< charged for posts and uploads that wait
+  pid_t process = 0;
   std::shared_ptr<PostAccount> posts{};  ///< of its connection. Null: its posts are not limited.
 };
 

@@ -16,6 +16,7 @@
 #include "platform/queue/TimedQueue.h"
 #include "platform/time/Clock.h"
 #include "util/Counters.h"
+#include "util/DeliveryTap.h"
 
 namespace vesk {
 
@@ -45,6 +46,8 @@ struct BackendServices {
   std::shared_ptr<HeldBudget> heldBudget = std::make_shared<HeldBudget>();
   /// How many bytes of posts may wait for servers that answer.
   std::shared_ptr<PostBudget> postBudget = std::make_shared<PostBudget>();
+  /// Those who look at what becomes of messages.
+  std::shared_ptr<DeliveryTap> tap = std::make_shared<DeliveryTap>();
   /// Logs refused posts.
   std::shared_ptr<RefusedPosts> refusedPosts = std::make_shared<RefusedPosts>();
 };

@@ -16,11 +16,14 @@ std::optional<Text> textFrom(const std::optional<std::string>& text) {
 }  // namespace
 
 VeskReportingBackend::VeskReportingBackend(const std::string& name, const std::optional<Dictionary>& profile,
-                                           const BackendIdentity& identity, const BackendServices& services)
+                                           const BackendIdentity& identity, const BackendServices& services,
+                                           std::shared_ptr<Outcomes> outcomes)
     : _profile(profile.value_or(Dictionary())),
       _name(name),
       _identity(identity),
       _services(services),
+      _outcomes(outcomes ? std::move(outcomes)
+                         : std::make_shared<Outcomes>(name, identity, services.counters, services.tap)),
       _samplingFactor(nextSamplingDraw()) {}
 
 std::string_view nameOfState(std::int32_t state) {
@@ -94,6 +97,7 @@ void VeskReportingBackend::setCombinedSessionIDString(const std::optional<std::s
 }
 
 void VeskReportingBackend::setUserInfoDict(const std::optional<Dictionary>& userInfo) {
+  _outcomes->setUserInfo(userInfo);
   MutexLock lock(_mutex);
   _userInfoDict = userInfo;
 }

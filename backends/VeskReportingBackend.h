@@ -13,6 +13,7 @@
 #include <VeskReporting/values/Value.h>
 #include "backends/BackendIdentity.h"
 #include "backends/BackendServices.h"
+#include "backends/Outcomes.h"
 #include "platform/sync/Mutex.h"
 #include "platform/sync/Snapshot.h"
 
@@ -112,7 +113,8 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
 
  protected:
   VeskReportingBackend(const std::string& name, const std::optional<Dictionary>& profile,
-                       const BackendIdentity& identity, const BackendServices& services);
+                       const BackendIdentity& identity, const BackendServices& services,
+                       std::shared_ptr<Outcomes> outcomes = nullptr);
 
   virtual std::optional<std::string> sendMessageInTurn(const std::optional<Dictionary>& payload,
                                                        const timeval& timestamp, std::uint16_t method,
@@ -133,6 +135,7 @@ class VeskReportingBackend : public std::enable_shared_from_this<VeskReportingBa
   const std::string _name;
   const BackendIdentity _identity;
   const BackendServices& _services;
+  const std::shared_ptr<Outcomes> _outcomes;  // also of datagrams that outlive the backend
 
   // Thread-safe by themselves.
   std::atomic<std::int32_t> _state{BackendStatePending};

@@ -7,6 +7,7 @@
 
 #include <algorithm>
 
+#include "backends/BackendFactory.h"
 #include "backends/https/PostExplanation.h"
 #include "platform/ipc/IPCIncomingCall.h"
 #include "protocol/WireNames.h"
@@ -20,6 +21,8 @@ namespace {
 
 constexpr char kGroup[] = "veskreporting";
 constexpr double kNearlyFull = 0.8;
+// How long a call waits for records. The connection's end has to wait for it.
+constexpr std::chrono::milliseconds kTapPatience{500};
 
 std::optional<gid_t> idOfGroup(const char* name) {
   group entry{};
@@ -35,6 +38,8 @@ double secondsBetween(std::chrono::steady_clock::time_point from, std::chrono::s
 }
 
 Value number(std::uint64_t value) { return Value(static_cast<std::int64_t>(value)); }
+
+Dictionary problem(const std::string& text) { return Dictionary{{"problem", text}}; }
 
 List countersIn(const Counters& counters) {
   std::vector<Value> all;
@@ -60,14 +65,32 @@ class Object final : public IPCExportedObject {
     } else if (call.member() == wire::kExplain.name) {
       Dictionary request;
       if (call.read(wire::kExplain.arguments, request)) call.answer({_diagnostics->explain(request)});
+    } else if (call.member() == wire::kOpenTap.name) {
+      Dictionary filter;
+      if (call.read(wire::kOpenTap.arguments, filter)) call.answer({openTap(filter)});
+    } else if (call.member() == wire::kReadTap.name) {
+      if (call.read(wire::kReadTap.arguments)) call.answer({readTap()});
     } else {
       call.refuse("org.freedesktop.DBus.Error.UnknownMethod", "The interface has no such method");
     }
   }
 
  private:
+  Dictionary openTap(const Dictionary& filter) {
+    _tap = nullptr;
+    _tap = _diagnostics->openTap(_viewer, filter);
+    return _tap ? Dictionary() : problem("too many are looking already");
+  }
+
+  Dictionary readTap() {
+    if (!_tap) return problem("openTap comes first");
+    auto batch = _tap->take(kTapPatience);
+    return {{"records", List(std::move(batch.records))}, {"lost", number(batch.lost)}};
+  }
+
   const std::shared_ptr<const Diagnostics> _diagnostics;
   const IPCPeer _viewer;
+  std::shared_ptr<DeliveryTap::Reader> _tap;
 };
 
 }  // namespace
@@ -163,7 +186,6 @@ Dictionary Diagnostics::outboxStatus(List& problems) const {
 }
 
 Dictionary Diagnostics::explain(const Dictionary& request) const {
-  const auto problem = [](const std::string& text) { return Dictionary{{"problem", text}}; };
   const auto type = integerForKey(request, kVeskReportingSessionInfoClientType);
   if (!type) return problem("the request has no clientType");
   const auto name = storebagNameForClientType(static_cast<std::int32_t>(*type));
@@ -181,7 +203,11 @@ Dictionary Diagnostics::explain(const Dictionary& request) const {
 
   MutableDictionary backends;
   for (const auto& [key, profile] : *bag->section) {
-    if (!isPostBackend(key.view()) || profile.dictionary() == nullptr) continue;
+    if (profile.dictionary() == nullptr || !isBackendName(key.view())) continue;
+    if (!isPostBackend(key.view())) {  // no policy governs it
+      backends.set(key, Dictionary{{"state", std::string(nameOfState(BackendStateEnabled))}});
+      continue;
+    }
     const auto draw = request.find("draw");
     backends.set(
         key,
@@ -198,6 +224,18 @@ Dictionary Diagnostics::explain(const Dictionary& request) const {
   MutableDictionary answer(Dictionary{{"storebag", std::string(*name)}, {"backends", backends.share()}});
   if (bag->version) answer.set("version", *bag->version);
   return answer.share();
+}
+
+std::shared_ptr<DeliveryTap::Reader> Diagnostics::openTap(const IPCPeer& viewer,
+                                                          const Dictionary& filter) const {
+  MutableDictionary wanted(filter, 1);
+  if (!seesAll(viewer)) wanted.set("user", static_cast<std::int64_t>(viewer.user));
+  return _sources.services.tap->open([wanted = wanted.share()](const Dictionary& record) {
+    return std::all_of(wanted.begin(), wanted.end(), [&record](const auto& each) {
+      const Value* value = record.find(each.key.view());
+      return value != nullptr && describe(*value) == describe(each.value);
+    });
+  });
 }
 
 std::shared_ptr<IPCExportedObject> diagnosticsObject(std::shared_ptr<const Diagnostics> diagnostics,

@@ -36,10 +36,14 @@ class Diagnostics {
   /// veskreporting see all sessions, others their own.
   Dictionary status(const IPCPeer& viewer) const;
 
-  /// What the HTTPS backends of the storebag in force would do for `clientType` and `userInfo` in the
+  /// What the backends of the storebag in force would do for `clientType` and `userInfo` in the
   /// request, `requireUserInfo` (true by default) and `draw` (0 by default): `storebag`, `version`, and
   /// `backends` (PostExplanation.h) by name; or `problem`.
   Dictionary explain(const Dictionary& request) const;
+
+  /// Shows the viewer the records that have each value of `filter`: all, or those of its own sessions, as for
+  /// `status`. Returns null if too many look.
+  std::shared_ptr<DeliveryTap::Reader> openTap(const IPCPeer& viewer, const Dictionary& filter) const;
 
  private:
   bool seesAll(const IPCPeer& viewer) const;

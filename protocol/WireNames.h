@@ -33,11 +33,16 @@ inline constexpr const char* kDiagnosticsPath = "/com/corvane/veskreportingd/dia
 inline constexpr const char* kDiagnosticsInterface = "com.corvane.veskreportingd.DiagnosticsInterface";
 inline constexpr Member kGetStatus{"getStatus", "", "a{sv}"};
 inline constexpr Member kExplain{"explain", "a{sv}", "a{sv}"};
+inline constexpr Member kOpenTap{"openTap", "a{sv}", "a{sv}"};
+inline constexpr Member kReadTap{"readTap", "", "a{sv}"};
 inline constexpr const char* kDiagnosticsIntrospection =
     "  <interface name=\"com.corvane.veskreportingd.DiagnosticsInterface\">\n"
     "    <method name=\"getStatus\"><arg name=\"status\" type=\"a{sv}\" direction=\"out\"/></method>\n"
     "    <method name=\"explain\"><arg name=\"request\" type=\"a{sv}\" direction=\"in\"/>"
     "<arg name=\"explanation\" type=\"a{sv}\" direction=\"out\"/></method>\n"
+    "    <method name=\"openTap\"><arg name=\"filter\" type=\"a{sv}\" direction=\"in\"/>"
+    "<arg name=\"opened\" type=\"a{sv}\" direction=\"out\"/></method>\n"
+    "    <method name=\"readTap\"><arg name=\"records\" type=\"a{sv}\" direction=\"out\"/></method>\n"
     "  </interface>\n";
 
 // The client's object. Its method has no answer.

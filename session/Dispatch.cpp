@@ -99,7 +99,7 @@ void cleanupBackends(const BackendSet& backends) {
 }
 
 bool uploadFileWithURL(const BackendSet* backends, const std::string& fileURL,
-                       const std::string& extensionToken, Counters& counters) {
+                       const std::string& extensionToken, const Outcomes& outcomes) {
   std::string path = pathFromFileURL(fileURL);
   std::string url = fileURL;
   bool succeeded = false;
@@ -116,14 +116,14 @@ bool uploadFileWithURL(const BackendSet* backends, const std::string& fileURL,
     VESK_LOG_DEBUG("uploadFileWithURL: File upload successful for %s", path.c_str());
   } else {
     VESK_LOG_ERROR("uploadFileWithURL: File upload failed for %s", path.c_str());
-    counters.count("session", DropReason::UploadFailed);
+    outcomes.count("upload", DropReason::UploadFailed);
   }
   writeToLogFile("[uploadFileWithURL] Upload %@ for file %@", succeeded ? "succeeded" : "failed",
                  encodedForURL(url));
   return succeeded;
 }
 
-bool uploadLogData(const BackendSet* backends, const List& logData, Counters& counters) {
+bool uploadLogData(const BackendSet* backends, const List& logData, const Outcomes& outcomes) {
   VESK_LOG_DEBUG("uploadLogData: Uploading log data array: %s", describe(logData).c_str());
   bool succeeded = false;
   if (backends) {
@@ -135,7 +135,7 @@ bool uploadLogData(const BackendSet* backends, const List& logData, Counters& co
     VESK_LOG_DEBUG("uploadLogData: Log data array upload successful");
   } else {
     VESK_LOG_ERROR("uploadLogData: Log data array upload failed");
-    counters.count("session", DropReason::UploadFailed);
+    outcomes.count("upload", DropReason::UploadFailed);
   }
   return succeeded;
 }
@@ -146,11 +146,12 @@ void sendMessageWithSessionInfo(const SessionServices& services, const BackendCl
                                 const std::optional<Dictionary>& storebag, std::uint16_t category,
                                 std::uint16_t type, const std::optional<Dictionary>& payload) {
   const Dictionary info = sessionInfo.value_or(Dictionary());
+  const Outcomes outcomes = outcomesOfSession(client, services.backends);
   VESK_LOG_DEBUG("sendMessageWithSessionInfo: Sending single message with sessionID %ld",
                  static_cast<long>(integerForKey(info, kVeskReportingSessionInfoSessionID).value_or(0)));
   if (!sessionInfo || !storebag) {
     VESK_LOG_ERROR("RsendMessageWithSessionInfo: Attempted to send message with one or more nil parameters");
-    services.backends.counters.count("session", DropReason::NoBackend);
+    outcomes.count("message", DropReason::NoBackend);
     return;
   }
   std::array<char, 41> deviceID{};
@@ -159,7 +160,7 @@ void sendMessageWithSessionInfo(const SessionServices& services, const BackendCl
                                  client, services.backends);
   if (!backends) {
     VESK_LOG_ERROR("sendMessageWithSessionInfo: No backends available to send single message");
-    services.backends.counters.count("session", DropReason::NoBackend);
+    outcomes.count("message", DropReason::NoBackend);
     return;
   }
   if (userInfo && !booleanForKey(info, kVeskReportingSessionInfoRequireUserInfo).value_or(false)) {

@@ -9,9 +9,9 @@
 #include <string>
 
 #include <VeskReporting/values/Value.h>
+#include "backends/Outcomes.h"
 #include "session/BackendSet.h"
 #include "session/SessionServices.h"
-#include "util/Counters.h"
 
 namespace vesk {
 
@@ -40,8 +40,8 @@ void cleanupBackends(const BackendSet& backends);
 /// Returns true if a backend accepted the file or data. `backends` may be null. May block until servers have
 /// answered.
 bool uploadFileWithURL(const BackendSet* backends, const std::string& fileURL,
-                       const std::string& extensionToken, Counters& counters);
-bool uploadLogData(const BackendSet* backends, const List& logData, Counters& counters);
+                       const std::string& extensionToken, const Outcomes& outcomes);
+bool uploadLogData(const BackendSet* backends, const List& logData, const Outcomes& outcomes);
 
 /// Sends one message through backends created for it alone. Without session info or storebag the message is
 /// lost, with a line of level 3.

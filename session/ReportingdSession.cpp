@@ -30,8 +30,9 @@ bool requiresUserInfo(const Dictionary& sessionInfo) {
 
 // The account keeps the connection until the last of its posts is done.
 BackendClient clientOf(const std::shared_ptr<IPCConnection>& connection, PostBudget& budget) {
-  const uid_t user = connection->peer().user;
-  return {user, budget.accountFor(user, [connection](bool isPaused) { connection->setPaused(isPaused); })};
+  const IPCPeer peer = connection->peer();
+  return {peer.user, peer.process,
+          budget.accountFor(peer.user, [connection](bool isPaused) { connection->setPaused(isPaused); })};
 }
 
 // Whether both have the same text under `key`.
@@ -51,6 +52,7 @@ ReportingdSession::ReportingdSession(std::shared_ptr<ReportingdSessionDelegate> 
       _services(services),
       _sessionIDString(freshIdentity()),
       _client(clientOf(_connection, *services.backends.postBudget)),
+      _outcomes(outcomesOfSession(_client, services.backends)),
       _aggregator(_connection, services.backends.counters),
       _correlationKey(keyFor(std::nullopt)) {
   VESK_LOG_DEBUG("initWithSessionDelegate: ReportingdSession initWithSessionDelegate:%s",
@@ -209,14 +211,12 @@ void ReportingdSession::flushMessagesWithReply(Reply<std::optional<std::string>>
 void ReportingdSession::uploadFileAtPath(const std::string& fileURL, const std::string& extensionToken,
                                          Reply<bool> completionHandler) {
   VESK_LOG_DEBUG("uploadFileAtPath: Uploading file for session %u", sessionID());
-  completionHandler(
-      uploadFileWithURL(backends().get(), fileURL, extensionToken, _services.backends.counters));
+  completionHandler(uploadFileWithURL(backends().get(), fileURL, extensionToken, _outcomes));
 }
 
 void ReportingdSession::uploadLogData(const List& logData,
                                       Reply<bool, std::optional<std::string>> completionHandler) {
-  completionHandler(vesk::uploadLogData(backends().get(), logData, _services.backends.counters),
-                    std::nullopt);
+  completionHandler(vesk::uploadLogData(backends().get(), logData, _outcomes), std::nullopt);
 }
 
 void ReportingdSession::sendMessageWithSessionInfo(const Dictionary& sessionInfo,
@@ -227,7 +227,7 @@ void ReportingdSession::sendMessageWithSessionInfo(const Dictionary& sessionInfo
   if (!integerForKey(sessionInfo, kVeskReportingSessionInfoClientType) ||
       !integerForKey(sessionInfo, kVeskReportingSessionInfoSessionID)) {
     VESK_LOG_ERROR("sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo");
-    _services.backends.counters.count("session", DropReason::InvalidMessage);
+    _outcomes.count("message", DropReason::InvalidMessage);
     return;  // destroying the reply uncalled sends an error
   }
   {
@@ -239,7 +239,7 @@ void ReportingdSession::sendMessageWithSessionInfo(const Dictionary& sessionInfo
   VESK_LOG_DEBUG("sendMessageWithSessionInfo: Sending message with session info for session %u", sessionID());
   auto storebag = _sessionDelegate->storebagForSession(*this);
   if (!storebag) {
-    _services.backends.counters.count("session", DropReason::NoBackend);
+    _outcomes.count("message", DropReason::NoBackend);
     reply("storebag not available");
     return;
   }
@@ -266,12 +266,12 @@ std::optional<std::string> ReportingdSession::sendMessageWithDictionary(const Di
   if (!set) {
     VESK_LOG_DEBUG("sendMessageWithDictionary: No backends available to send message");
     // The session's own closing message is not counted if it never had a backend.
-    if (!_isEnding) _services.backends.counters.count("session", DropReason::NoBackend);
+    if (!_isEnding) _outcomes.count("message", DropReason::NoBackend);
     return std::nullopt;
   }
   const auto message = messageFrom(parameters);
   if (!message) {
-    _services.backends.counters.count("session", DropReason::InvalidMessage);
+    _outcomes.count("message", DropReason::InvalidMessage);
     return std::nullopt;
   }
   const timeval now = timevalFrom(_services.backends.clock.now());

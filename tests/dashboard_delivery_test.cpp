@@ -13,6 +13,11 @@
 namespace vesk::test {
 namespace {
 
+std::shared_ptr<const Outcomes> outcomesIn(Counters& counters) {
+  return std::make_shared<Outcomes>("dashboard", BackendIdentity{}, counters,
+                                    std::make_shared<DeliveryTap>());
+}
+
 using std::chrono::milliseconds;
 
 constexpr char kCleanUpLine[] = "DashboardBackend(myPeriodicTask): clean up at myPeriodicTask.";
@@ -26,7 +31,7 @@ class Delivery : public testing::Test {
     UDPSocket socket;
     ASSERT_TRUE(socket.open());
     _delivery =
-        std::make_shared<DashboardDelivery>(std::move(socket), _queue, _linger, _counters, "dashboard");
+        std::make_shared<DashboardDelivery>(std::move(socket), _queue, _linger, outcomesIn(_counters));
     if (reliable) _delivery->useReliableUDP();
     ASSERT_TRUE(_delivery->connect(_server.endpoint()));
     ASSERT_TRUE(_delivery->start(tick));
@@ -298,7 +303,7 @@ TEST(DeliveryOnThreads, EndAtOnceBeyondTheirPlacesAndLeaveNothingBehindWhenStopp
       UDPSocket socket;
       EXPECT_TRUE(socket.open());
       auto delivery = std::make_shared<DashboardDelivery>(std::move(socket), thread.makeQueue("test"), linger,
-                                                          counters, "dashboard");
+                                                          outcomesIn(counters));
       delivery->useReliableUDP();
       EXPECT_TRUE(delivery->connect(server.endpoint()) && delivery->start(milliseconds(500)));
       delivery->send(std::make_unique<DashboardDelivery::Buffer>(), kDashboardHeaderSize, 1);

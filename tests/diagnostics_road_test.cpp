@@ -52,7 +52,7 @@ TEST_F(DiagnosticsRoad, StatusTellsWhatIsReportedAndWhatIsWrong) {
   EXPECT_EQ(told.status, 0) << told.text;
   for (const char* part :
        {": ok, up ", "storebag zelko: current, version 7", "client type 5 Camera (user ",
-        "  httpPost: enabled\n", "  httpPost: disabled, since no client entry is for 'Nobody'\n"}) {
+        "  httpPost: enabled\n", "  httpPost: disabled, since client 'Nobody' is in no entry\n"}) {
     EXPECT_TRUE(contains(told.text, part)) << part << "\n" << told.text;
   }
   EXPECT_TRUE(contains(ask({"status", "--openmetrics"}).text, "veskreporting_sessions 2\n"));
@@ -74,7 +74,7 @@ TEST_F(DiagnosticsRoad, ExplainGivesTheReasonThatTheDaemonActsUpon) {
     const char* reason;  ///< of both, or "enabled"
   } cases[] = {
       {kReports, "Camera", "enabled"},
-      {kReports, "Nobody", "no client entry is for 'Nobody'"},
+      {kReports, "Nobody", "client 'Nobody' is in no entry"},
       {"sampling_threshold = 1.0\nfilters = []\n", "Camera", "the entry has no locale_whitelist"},
       {"locale_whitelist = [\"FR\", \"DE\"]\nfilters = []\n", "Camera",
        "the region 'US' is not among 'FR', 'DE'"},
@@ -105,6 +105,68 @@ TEST_F(DiagnosticsRoad, ExplainGivesTheReasonThatTheDaemonActsUpon) {
        {ask({"status"}), ask({"explain", "--client-type", "5", "--client-name", "Camera"})}) {
     EXPECT_TRUE(contains(told.text, "httpPost: disabled, since the user did not agree")) << told.text;
   }
+}
+
+TEST_F(DiagnosticsRoad, SendTellsWhatBecameOfTheMessage) {
+  start(kReports + std::string("[release.dashboard]\nip = \"127.0.0.1\"\nport = @UDPPORT@\nreliable = 50\n"));
+  const std::vector<std::string> camera{"send", "--client-type", "5", "-c", "3", "-t", "1", "--client-name"};
+  const auto send = [&](const std::string& name, std::vector<std::string> more = {}) {
+    auto arguments = camera;
+    arguments.push_back(name);
+    arguments.insert(arguments.end(), more.begin(), more.end());
+    return ask(arguments);
+  };
+  const struct {
+    const char* name;
+    std::vector<std::string> more;
+    int status;
+    std::vector<std::string> told;
+  } cases[] = {
+      {"Camera", {}, 0, {"httpPost: sent\n", "dashboard: sent\n"}},
+      {"Camera", {"--batch"}, 0, {"httpPost: held until a flush\n", "dashboard: sent\n"}},
+      {"Nobody", {}, 0, {"httpPost: dropped: client 'Nobody' is in no entry (storebag 7)\n"}},
+      {"Nobody", {"--no-require-user-info"}, 0, {"httpPost: sent", "asks neither consent, client entry"}},
+      {"Camera", {"--json"}, 0, {R"("httpPost":{"outcome":"sent","cause":""})"}},
+  };
+  for (const auto& test : cases) {
+    const auto told = send(test.name, test.more);
+    EXPECT_EQ(told.status, test.status) << told.text;
+    for (const auto& part : test.told) EXPECT_TRUE(contains(told.text, part)) << part << "\n" << told.text;
+  }
+  EXPECT_EQ(ask({"send", "--client-type", "5", "-c", "3", "-t", "1"}).status, 2) << "without user info";
+  harness.stopCollector();
+  EXPECT_TRUE(contains(send("Camera", {"--no-wait"}).text, "httpPost: deferred: ")) << "after some seconds";
+}
+
+TEST_F(DiagnosticsRoad, SendFailsIfAllIsDropped) {
+  start(kReports);
+  auto told = ask({"send", "--client-type", "5", "-c", "3", "-t", "1", "--client-name", "Nobody"});
+  EXPECT_EQ(told.status, 1);
+  EXPECT_EQ(told.text, "veskreport: dropped: httpPost: client 'Nobody' is in no entry (storebag 7)\n");
+  told = ask({"states", "--client-type", "5", "--client-name", "Camera"});
+  EXPECT_EQ(told.text, "httpPost\n");
+  EXPECT_EQ(ask({"states", "--client-type", "5", "--client-name", "Nobody", "--json"}).text,
+            "{\"status\":\"done\",\"backends\":[]}\n");
+}
+
+TEST_F(DiagnosticsRoad, TapShowsWhatLeavesTheDevice) {
+  start(kReports);
+  ChildProcess tap({VESK_BIN_DIRECTORY "/veskreport", "tap", "--root", harness.root.path().string(),
+                    "--client-name", "Camera", "--bodies", "--count", "6"});
+  ASSERT_TRUE(tap.waitForText("watching"));
+  {
+    auto nobody = session("Nobody");  // not asked for
+    auto camera = session("Camera");
+    EXPECT_TRUE(camera.reporting.sendMessageAndWait(message(3, {{"x", "secret"}, {"y", 1}})));
+  }
+  EXPECT_EQ(tap.wait(), 0);
+  const std::string text = tap.output();
+  for (const char* part : {"httpPost: message 3/2 posted [client type 5 Camera, session 77]\n",
+                           "httpPost: post of 1 delivered, status 200, https://", "\"y\":1"}) {
+    EXPECT_TRUE(contains(text, part)) << part << "\n" << text;
+  }
+  EXPECT_FALSE(contains(text, "secret")) << "it is shown as it was sent, after the filters";
+  EXPECT_FALSE(contains(text, "Nobody"));
 }
 
 }  // namespace

@@ -34,7 +34,8 @@ class VeskreportCommand : public testing::Test {
   }
   /// Runs it with the options of a client of the recording daemon.
   Outcome runClient(std::vector<std::string> arguments, std::string input = {}) const {
-    for (const char* more : {"--root", root.c_str(), "--client-type", "5", "--session-id", "7"})
+    for (const char* more :
+         {"--root", root.c_str(), "--client-type", "5", "--session-id", "7", "--service-name", "Demo"})
       arguments.emplace_back(more);
     return run(std::move(arguments), std::move(input));
   }
@@ -54,20 +55,20 @@ TEST_F(VeskreportCommand, EachCommandPrintsItsAnswer) {
     std::string call;
   };
   for (const Case& c : {
-           Case{{"states"}, "httpPost\nwren", "fetchStates none"},
-           Case{{"states", "--json"},
+           Case{{"states", "--start"}, "httpPost\nwren", R"(fetchStates {"serviceName": "Demo"})"},
+           Case{{"states", "--start", "--json"},
                 R"({"status":"done","backends":["httpPost","wren"]})",
-                "fetchStates none"},
+                R"(fetchStates {"serviceName": "Demo"})"},
            Case{{"display-url"}, "https://display.example/", "fetchDisplayURL"},
            Case{{"flush"}, "posted all", "flush"},
            Case{{"send", "-c", "1", "-t", "2", "k=v", "n:=3"},
                 "accepted",
                 R"(parameters {"category": 1, "type": 2, "payload": {"k": "v", "n": 3}, "flag": 0})"},
            Case{{"send", "-c", "1", "-t", "2", "--realtime", "--override-sampling", "--json"},
-                R"({"status":"done","answer":null})",
+                R"({"status":"done","answer":null,"backends":{}})",
                 R"(parameters {"category": 1, "type": 2, "flag": 3})"},
            Case{{"send", "-c", "4", "-t", "2", "--no-wait"},
-                "sent",
+                "accepted",
                 R"(parameters {"category": 4, "type": 2, "flag": 0})"},
            Case{{"send-once", "-c", "1", "-t", "2", "k=v"}, "finished", "messageOnce "},
            Case{{"upload-file", file}, "uploaded " + file, "uploadFile file://" + file + " contents"},
@@ -131,8 +132,8 @@ TEST_F(VeskreportCommand, AggregateEndsWhenItIsToldTo) {
 }
 
 TEST_F(VeskreportCommand, IntroducesItselfAsTheOptionsSay) {
-  runClient({"states", "--client-version", "3", "--client-name", "[Camera]", "--service-name", "Demo",
-             "--user-info", "region=north", "--user-info", "floor:=2", "--require-user-info", "--batch"});
+  runClient({"states", "--start", "--client-version", "3", "--client-name", "[Camera]", "--user-info",
+             "region=north", "--user-info", "floor:=2", "--batch"});
   EXPECT_EQ(
       record.lines().front(),
       R"(setSessionInfo {"sessionID": 7, "clientType": 5, "clientVersion": 3, "requireUserInfo": true, )"
@@ -153,9 +154,9 @@ TEST_F(VeskreportCommand, SendsEachLineOfStandardInput) {
 
   outcome =
       runClient({"send", "--stdin", "-c", "4", "-t", "5", "--json"}, "{\"category\":\"a payload's own\"}\n");
-  EXPECT_EQ(
-      outcome.output,
-      "{\"status\":\"done\",\"line\":1,\"answer\":null}\n{\"status\":\"done\",\"sent\":1,\"failed\":0}\n");
+  EXPECT_EQ(outcome.output,
+            "{\"status\":\"done\",\"line\":1,\"answer\":null}\n{\"status\":\"done\",\"sent\":1,\"failed\":0,"
+            "\"dropped\":0}\n");
   EXPECT_EQ(
       record.count(
           R"(parameters {"category": 4, "type": 5, "payload": {"category": "a payload's own"}, "flag": 0})"),
@@ -172,7 +173,7 @@ TEST_F(VeskreportCommand, SaysWhatFailed) {
             "\"the daemon has no storebag for client type 5 (its log says why)\"}\n");
 
   record.setBackends(BackendNames{});
-  outcome = runClient({"states"});
+  outcome = runClient({"states", "--start"});
   EXPECT_EQ(outcome.status, 0);
   EXPECT_EQ(outcome.errors, "veskreport: no backend is enabled\n");
   EXPECT_EQ(runClient({"upload-file", root + "/missing"}).errors,
@@ -202,7 +203,7 @@ TEST_F(VeskreportCommand, SaysThatNoDaemonIsThereOrTakesItIn) {
                                               ": is veskreportingd running? (No such file or directory)\n");
   daemon.emplace(socket, record, 1);
   const FileDescriptor first = connectUnixSocket(socket);
-  const auto outcome = runClient({"states"});
+  const auto outcome = runClient({"states", "--start"});
   EXPECT_EQ(outcome.status, 1);
   EXPECT_EQ(outcome.errors, "veskreport: too many connections: " + socket + ": the daemon takes no more\n");
 }
@@ -213,7 +214,7 @@ TEST_F(VeskreportCommand, ObeysTheEnvironmentUnlessItIsSetuid) {
   if (::chown(copy.c_str(), 65534, 65534) != 0) GTEST_SKIP() << "needs the right to give files away";
   for (mode_t mode : {0755, 04755}) {
     ASSERT_EQ(::chmod(copy.c_str(), mode), 0);
-    ChildProcess process(ChildProcess::Options{.command = {copy, "states", "--client-type", "5"},
+    ChildProcess process(ChildProcess::Options{.command = {copy, "flush", "--client-type", "5"},
                                                .environment = {{"VESKREPORTINGD_ROOT", root}}});
     EXPECT_EQ(process.wait(), mode == 0755 ? 0 : 1);
     EXPECT_EQ(process.errors().find(root), std::string::npos);

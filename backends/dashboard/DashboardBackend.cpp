@@ -103,10 +103,11 @@ std::shared_ptr<DashboardBackend> DashboardBackend::createConnected(
   }
   auto queue = networkQueue(services);
   if (!queue) return nullptr;
+  auto outcomes = std::make_shared<Outcomes>(name, identity, services.counters, services.tap);
   auto delivery = std::make_shared<DashboardDelivery>(std::move(socket), std::move(queue),
-                                                      services.dashboardLinger, services.counters, name);
+                                                      services.dashboardLinger, outcomes);
   std::shared_ptr<DashboardBackend> backend(
-      new DashboardBackend(name, profile, identity, delivery, services));
+      new DashboardBackend(name, profile, identity, delivery, services, std::move(outcomes)));
   if (!profile) settings = settingsFrom(serverIP, serverPort);
   if (!settings) return nullptr;  // here and below, the destructor cleans up
   if (settings->isReliable) delivery->useReliableUDP();
@@ -124,8 +125,8 @@ std::shared_ptr<DashboardBackend> DashboardBackend::createConnected(
 DashboardBackend::DashboardBackend(const std::string& name, const std::optional<Dictionary>& profile,
                                    const BackendIdentity& identity,
                                    std::shared_ptr<DashboardDelivery> delivery,
-                                   const BackendServices& services)
-    : VeskReportingBackend(name, profile, identity, services),
+                                   const BackendServices& services, std::shared_ptr<Outcomes> outcomes)
+    : VeskReportingBackend(name, profile, identity, services, std::move(outcomes)),
       _usingProfile(profile.has_value()),
       _postURL(profileText(name, _profile, "post_url")),
       _delivery(std::move(delivery)) {
@@ -170,6 +171,10 @@ std::optional<std::string> DashboardBackend::sendMessageInTurn(const std::option
   header.length = static_cast<std::uint16_t>(kDashboardHeaderSize + textLength);
   encodeDashboardHeader(header, buffer->data());
   auto line = writeLocalLog({buffer->data(), header.length});
+  if (_outcomes->isWatched()) {
+    _outcomes->show("message", "posted", {{"category", method}, {"type", respCode}, {"eventID", eventID}},
+                    line.value_or(""));
+  }
   _delivery->send(std::move(buffer), header.length, eventID);
   return line;
 }

@@ -46,7 +46,7 @@ class DashboardBackend final : public VeskReportingBackend {
  private:
   DashboardBackend(const std::string& name, const std::optional<Dictionary>& profile,
                    const BackendIdentity& identity, std::shared_ptr<DashboardDelivery> delivery,
-                   const BackendServices& services);
+                   const BackendServices& services, std::shared_ptr<Outcomes> outcomes);
 
   static std::shared_ptr<DashboardBackend> createConnected(const std::string& name,
                                                            const std::optional<Dictionary>& profile,

@@ -20,12 +20,11 @@ constexpr std::array<std::int32_t, 4> kTicksBeforeRetransmit{2, 3, 5, 9};
 }  // namespace
 
 DashboardDelivery::DashboardDelivery(UDPSocket socket, std::shared_ptr<TimedQueue> networkProcQueue,
-                                     std::shared_ptr<DashboardLinger> linger, Counters& counters,
-                                     std::string backendName)
+                                     std::shared_ptr<DashboardLinger> linger,
+                                     std::shared_ptr<const Outcomes> outcomes)
     : _networkProcQueue(std::move(networkProcQueue)),
       _linger(std::move(linger)),
-      _counters(counters),
-      _backendName(std::move(backendName)),
+      _outcomes(std::move(outcomes)),
       _socket(std::move(socket)) {}
 
 DashboardDelivery::~DashboardDelivery() {
@@ -82,7 +81,7 @@ void DashboardDelivery::send(std::unique_ptr<Buffer> buffer, std::uint16_t lengt
   try {
     {
       MutexLock lock(_mutex);
-      if (_handedOver.size() >= kMaximumHandedOver) return countLost(DropReason::OverBound);
+      if (_handedOver.size() >= kMaximumHandedOver) return lose(eventNumber, DropReason::OverBound);
       isFirst = _handedOver.empty();
       _handedOver.push_back({std::move(buffer), length, eventNumber});
     }
@@ -90,7 +89,7 @@ void DashboardDelivery::send(std::unique_ptr<Buffer> buffer, std::uint16_t lengt
     if (isFirst) _networkProcQueue->submit([self = shared_from_this()] { self->sendHandedOver(); });
   } catch (const std::exception&) {  // out of memory
     MutexLock lock(_mutex);
-    if (!isFirst) return countLost(DropReason::OverBound);
+    if (!isFirst) return lose(eventNumber, DropReason::OverBound);
     // No task will handle the list. If it stayed, later datagrams would wait for such a task for ever.
     countLost(DropReason::OverBound, std::max<std::size_t>(_handedOver.size(), 1));
     _handedOver.clear();
@@ -162,14 +161,17 @@ void DashboardDelivery::waitForRoom(std::vector<HandedOver> datagrams) {
 
 bool DashboardDelivery::tryToSendMsg(const char* bytes, std::uint16_t length, std::uint16_t eventNumber) {
   if (!_timer) {  // torn down: there will be no further attempt
-    countLost(DropReason::Unacknowledged);
+    lose(eventNumber, DropReason::Unacknowledged);
     return true;
   }
   const std::string_view datagram(bytes, length);
   const auto outcome = transmit(datagram);
   if (outcome == UDPSocket::Outcome::WouldBlock) return false;
   const bool isSent = outcome == UDPSocket::Outcome::Sent;
-  if (isSent && !_reliableUDP) return true;
+  if (isSent && !_reliableUDP) {
+    show("sent", eventNumber);
+    return true;
+  }
   UDPPacketToSend packet(datagram, eventNumber);
   if (isSent) packet.setState(UDPPacketToSend::Sent);
   append(std::move(packet));
@@ -187,8 +189,8 @@ UDPSocket::Outcome DashboardDelivery::transmit(std::string_view datagram) {
 void DashboardDelivery::append(UDPPacketToSend packet) {
   _messageQueue.push_back(std::move(packet));
   if (_messageQueue.size() > kMaximumQueued) {
+    lose(_messageQueue.front().eventNumber(), DropReason::OverBound);
     _messageQueue.erase(_messageQueue.begin());
-    countLost(DropReason::OverBound);
   }
   keepTicking();
 }
@@ -201,6 +203,7 @@ void DashboardDelivery::processSocketRead() {
   if (!eventID) return;
   for (auto packet = _messageQueue.begin(); packet != _messageQueue.end(); ++packet) {
     if (packet->eventNumber() != *eventID) continue;
+    show("delivered", *eventID);
     _messageQueue.erase(packet);
     return;
   }
@@ -224,6 +227,7 @@ void DashboardDelivery::walkQueue() {
       const bool isSent = transmit(packet.data()) == UDPSocket::Outcome::Sent;
       if (isSent && _reliableUDP) packet.setState(UDPPacketToSend::Sent);
       isDone = isSent && !_reliableUDP;
+      if (isDone) show("sent", packet.eventNumber());
     } else {
       isDone = !keepsWaiting(packet);
     }
@@ -239,7 +243,7 @@ void DashboardDelivery::walkQueue() {
 bool DashboardDelivery::keepsWaiting(UDPPacketToSend& packet) {
   const auto retransmits = static_cast<std::size_t>(packet.numberOfRetransmits());
   if (retransmits >= kTicksBeforeRetransmit.size()) {
-    countLost(DropReason::Unacknowledged);
+    lose(packet.eventNumber(), DropReason::Unacknowledged);
     return false;
   }
   const std::int32_t checks = packet.numberOfChecks() + 1;
@@ -285,8 +289,16 @@ void DashboardDelivery::leavePlace() {
   if (std::exchange(_hasPlace, false)) _linger->release();
 }
 
-void DashboardDelivery::countLost(DropReason reason, std::size_t count) {
-  if (count > 0) _counters.count(_backendName, reason, count);
+void DashboardDelivery::countLost(DropReason reason, std::size_t count) const {
+  if (count > 0) _outcomes->count("datagram", reason, count);
+}
+
+void DashboardDelivery::lose(std::uint16_t eventNumber, DropReason reason) const {
+  _outcomes->count("datagram", reason, 1, [eventNumber] { return Dictionary{{"eventID", eventNumber}}; });
+}
+
+void DashboardDelivery::show(const char* outcome, std::uint16_t eventNumber) const {
+  if (_outcomes->isWatched()) _outcomes->show("datagram", outcome, {{"eventID", eventNumber}});
 }
 
 }  // namespace vesk

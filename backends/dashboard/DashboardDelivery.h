@@ -12,6 +12,7 @@
 #include <string_view>
 #include <vector>
 
+#include "backends/Outcomes.h"
 #include "backends/dashboard/DashboardDatagram.h"
 #include "backends/dashboard/DashboardLinger.h"
 #include "backends/dashboard/UDPPacketToSend.h"
@@ -19,7 +20,6 @@
 #include "platform/queue/Metronome.h"
 #include "platform/queue/TimedQueue.h"
 #include "platform/sync/Mutex.h"
-#include "util/Counters.h"
 
 namespace vesk {
 
@@ -46,9 +46,9 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   /// The delay before a datagram is sent again if the system had no room for it.
   static constexpr std::chrono::milliseconds kRoomWait{10};
 
-  /// `socket` must be open. Drops are counted in `counters` under `backendName`.
+  /// `socket` must be open.
   DashboardDelivery(UDPSocket socket, std::shared_ptr<TimedQueue> networkProcQueue,
-                    std::shared_ptr<DashboardLinger> linger, Counters& counters, std::string backendName);
+                    std::shared_ptr<DashboardLinger> linger, std::shared_ptr<const Outcomes> outcomes);
   ~DashboardDelivery();
   DashboardDelivery(const DashboardDelivery&) = delete;
   DashboardDelivery& operator=(const DashboardDelivery&) = delete;
@@ -100,13 +100,14 @@ class DashboardDelivery : public std::enable_shared_from_this<DashboardDelivery>
   void keepTicking();
   void cleanupSources();
   void leavePlace() VESK_REQUIRES(_mutex);
-  void countLost(DropReason reason, std::size_t count = 1);
+  void show(const char* outcome, std::uint16_t eventNumber) const;
+  void countLost(DropReason reason, std::size_t count = 1) const;
+  void lose(std::uint16_t eventNumber, DropReason reason) const;
 
   // Constant after construction.
   const std::shared_ptr<TimedQueue> _networkProcQueue;
   const std::shared_ptr<DashboardLinger> _linger;
-  Counters& _counters;
-  const std::string _backendName;
+  const std::shared_ptr<const Outcomes> _outcomes;
   bool _reliableUDP = false;
 
   // Only used on the queue, once constructed.

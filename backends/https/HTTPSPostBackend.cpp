@@ -60,7 +60,7 @@ HTTPSPostBackend::HTTPSPostBackend(const std::string& name, const Dictionary& pr
 HTTPSPostBackend::~HTTPSPostBackend() {
   MutexLock lock(_mutex);
   // Events that were held by a backend that was never enabled leave no other trace.
-  if (holdsEvents()) _services.counters.count(_name, DropReason::NeverEnabled, _batchedEvents->size());
+  if (holdsEvents()) _outcomes->count("message", DropReason::NeverEnabled, _batchedEvents->size());
 }
 
 std::optional<std::string> HTTPSPostBackend::postURL() const {
@@ -109,7 +109,12 @@ std::optional<std::string> HTTPSPostBackend::sendMessageInTurn(const std::option
                                                                std::uint16_t respCode, std::uint16_t eventID,
                                                                std::int32_t flag) {
   if (state() == BackendStateDisabled) {
-    _services.counters.count(_name, DropReason::StateDisabled);
+    _outcomes->count("message", DropReason::StateDisabled, 1, [&] {
+      return Dictionary{{"category", method},
+                        {"type", respCode},
+                        {"eventID", eventID},
+                        {"because", stateReason().value_or("reporting is off")}};
+    });
     return std::nullopt;
   }
   // The event gets its place before the lock is released, so that changes by relatives while a body is built
@@ -127,11 +132,17 @@ std::optional<std::string> HTTPSPostBackend::sendMessageInTurn(const std::option
     batchEvents = _settings._batchEvents;
     if (mustHold(flag)) {
       earlier = batchEvent(std::move(event));
+      _lastHeldEventID = eventID;
     } else {
       earlier = takeBatchBeforeSingleEvent();
       own = makePost(std::make_unique<EventBatch>(_identity._heldBytes, std::move(event)), flag, method,
                      respCode);
+      if (_outcomes->isWatched()) own->messages = {{"eventID", eventID}};
     }
+  }
+  if (_outcomes->isWatched()) {
+    _outcomes->show("message", own ? "posted" : "held",
+                    {{"category", method}, {"type", respCode}, {"eventID", eventID}});
   }
   if (earlier) buildAndPost(std::move(earlier));
   if (!own) {
@@ -208,7 +219,7 @@ void HTTPSPostBackend::boundHeldEvents() {
 }
 
 void HTTPSPostBackend::countDropped(std::size_t events) const {
-  if (events > 0) _services.counters.count(_name, DropReason::OverBound, events);
+  if (events > 0) _outcomes->count("message", DropReason::OverBound, events);
 }
 
 std::optional<std::string> HTTPSPostBackend::flushMessagesInTurn() {
@@ -229,6 +240,7 @@ HTTPSPostBackend::PostToBuild HTTPSPostBackend::takeBatch() {
   }
   VESK_LOG_DEBUG("HTTPSPostBackend(flushMessages): called");
   PostToBuild post = makePost(std::move(_batchedEvents), 0, std::nullopt, std::nullopt);
+  if (_outcomes->isWatched()) post->messages = {{"upToEventID", _lastHeldEventID}};
   if (_userInfoDict) {
     MutableDictionary filtered(*_userInfoDict);
     _filters.filterEvent(filtered);
@@ -284,17 +296,25 @@ std::optional<std::string> HTTPSPostBackend::buildAndPost(PostToBuild post) {
     }
   } catch (...) {
     // Out of memory; the events are already lost.
-    _services.counters.count(_name, DropReason::BodyNotBuilt, eventCount);
+    _outcomes->count("post", DropReason::BodyNotBuilt, eventCount);
     throw;
   }
-  _services.counters.count(_name, DropReason::BodyNotBuilt, eventCount);
+  _outcomes->count("post", DropReason::BodyNotBuilt, eventCount);
   return std::nullopt;
 }
 
 void HTTPSPostBackend::postJSONMessage(Post post, std::string json, std::size_t eventCount) {
   if (!post.url) {
-    _services.counters.count(_name, DropReason::NoURL, eventCount);
+    _outcomes->count("post", DropReason::NoURL, eventCount, [&post] { return post.messages; });
     return;
+  }
+  std::unique_ptr<Shown> shown;
+  if (_outcomes->isWatched()) {
+    MutableDictionary facts(post.messages, 3);
+    facts.set("url", *post.url);
+    facts.set("events", eventCount);
+    facts.set("bytes", json.size());
+    shown = std::make_unique<Shown>(Shown{facts.share(), json});
   }
   auto request =
       postRequest(std::move(*post.url), std::move(post.headers), std::move(json), _identity._client);
@@ -303,22 +323,42 @@ void HTTPSPostBackend::postJSONMessage(Post post, std::string json, std::size_t 
   request.respectsConsent = post.respectsConsent;
   // The completion keeps the backend alive. At a session's end it may hold the last reference.
   auto self = std::static_pointer_cast<HTTPSPostBackend>(shared_from_this());
-  _services.http.start(std::move(request), [self, eventCount](const HTTPResult& result) {
-    self->postCompleted(result, eventCount);
-  });
+  _services.http.start(
+      std::move(request),
+      [self, eventCount, shown = std::shared_ptr<Shown>(std::move(shown))](const HTTPResult& result) {
+        self->postCompleted(result, eventCount, shown.get());
+      });
 }
 
-void HTTPSPostBackend::postCompleted(const HTTPResult& result, std::size_t eventCount) {
+void HTTPSPostBackend::showPost(const char* outcome, const HTTPResult& result, const Shown* shown) const {
+  if (shown == nullptr || !_outcomes->isWatched()) return;
+  MutableDictionary facts(shown->facts, 1);
+  if (result.response) facts.set("httpStatus", result.response->status);
+  _outcomes->show("post", outcome, facts.share(), shown->body);
+}
+
+void HTTPSPostBackend::countPost(DropReason reason, std::size_t events, const HTTPResult& result,
+                                 const Shown* shown) const {
+  const auto facts = [&] {
+    MutableDictionary all(shown ? shown->facts : Dictionary(), 2);
+    if (result.response) all.set("httpStatus", result.response->status);
+    if (result.error) all.set("because", result.error->description);
+    return all.share();
+  };
+  _outcomes->count("post", reason, events, facts, shown ? shown->body : std::string());
+}
+
+void HTTPSPostBackend::postCompleted(const HTTPResult& result, std::size_t eventCount, const Shown* shown) {
   if (result.error) {
     VESK_LOG_ERROR("HTTPSPostBackend(postJsonMessage): post error: %s", result.error->description.c_str());
   }
   const long status = result.response ? result.response->status : 0;
   if (status < 500 || status > 599) {
-    if (status >= 200 && status <= 299) return;
+    if (status >= 200 && status <= 299) return showPost("delivered", result, shown);
     const auto reason = status != 0              ? DropReason::ServerRefused
                         : result.error->deferred ? DropReason::Deferred
                                                  : DropReason::TransportError;
-    _services.counters.count(_name, reason, eventCount);
+    countPost(reason, eventCount, result, shown);
     if (status != 0) _services.refusedPosts->note(_name, status, eventCount);
     return;
   }
@@ -328,7 +368,7 @@ void HTTPSPostBackend::postCompleted(const HTTPResult& result, std::size_t event
     MutexLock lock(_mutex);
     _stateReason = "the server answered with status " + std::to_string(status);
   }
-  _services.counters.count(_name, DropReason::ServerError5xx, eventCount);
+  countPost(DropReason::ServerError5xx, eventCount, result, shown);
 }
 
 void HTTPSPostBackend::setCorrelatedSessionIDLocked(const std::optional<Text>& sessionID) {

@@ -47,6 +47,7 @@ class HTTPSPostBackend final : public VeskReportingBackend {
     std::optional<std::string> url;
     std::string clientID;
     PostHeaders headers;
+    Dictionary messages;           ///< which ones it carries, for operators who look
     bool isPrintable = false;      ///< the text may go to the local message log
     bool respectsConsent = false;  ///< it was allowed by the user's consent
   };
@@ -77,7 +78,14 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   // Building and posting run without _mutex, since a body may be large.
   std::optional<std::string> buildAndPost(PostToBuild post) VESK_REQUIRES(_sendMutex) VESK_EXCLUDES(_mutex);
   void postJSONMessage(Post post, std::string json, std::size_t eventCount);
-  void postCompleted(const HTTPResult& result, std::size_t eventCount);
+  /// A post as it is shown to operators.
+  struct Shown {
+    Dictionary facts;
+    std::string body;
+  };
+  void postCompleted(const HTTPResult& result, std::size_t eventCount, const Shown* shown);
+  void showPost(const char* outcome, const HTTPResult& result, const Shown* shown) const;
+  void countPost(DropReason reason, std::size_t events, const HTTPResult& result, const Shown* shown) const;
 
   // Constant after construction.
   const bool _dnuEnabled;  // the user's consent
@@ -89,6 +97,7 @@ class HTTPSPostBackend final : public VeskReportingBackend {
   PostPolicy::Settings _settings VESK_GUARDED_BY(_mutex);
   std::optional<std::string> _stateReason VESK_GUARDED_BY(_mutex);  ///< unless it is enabled
   std::unique_ptr<EventBatch> _batchedEvents VESK_GUARDED_BY(_mutex);
+  std::uint16_t _lastHeldEventID VESK_GUARDED_BY(_mutex) = 0;
   EventFilters _filters VESK_GUARDED_BY(_mutex);
 };
 

@@ -64,8 +64,7 @@ std::string reasonOf(const PostPolicy::Step& step) {
   const std::string value = shown(step.value), expected = shown(step.expected);
   if (step.rule == "userInfo") return "the session has not sent its user info";
   if (step.rule == "clients") {
-    return isNone(step.value) ? "no client entry is for a client without a name"
-                              : "no client entry is for " + value;
+    return (isNone(step.value) ? "a client without a name" : "client " + value) + " is in no entry";
   }
   if (step.rule == "override_dnu") return "the user did not agree to the submission of diagnostics";
   if (step.rule == "locale_whitelist") {

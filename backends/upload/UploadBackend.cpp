@@ -151,8 +151,12 @@ bool UploadBackend::accepted(const HTTPResult& result, const std::string& upload
   if (result.error || !result.response) {
     VESK_LOG_ERROR("UploadBackend(uploadFileAtPath): post %s",
                    result.error ? result.error->description.c_str() : "(null)");
-    _services.counters.count(_name, DropReason::TransportError);
+    _outcomes->count("upload", DropReason::TransportError, 1, [&] { return Dictionary{{"url", uploadURL}}; });
     return false;
+  }
+  if (_outcomes->isWatched()) {
+    _outcomes->show("upload", "sent", {{"url", uploadURL}, {"httpStatus", result.response->status}},
+                    result.response->body);
   }
   const std::string& answer = result.response->body;
   const bool isText = isValidUTF8(answer);

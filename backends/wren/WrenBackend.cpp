@@ -105,13 +105,15 @@ std::optional<std::string> WrenBackend::sendMessageInTurn(const std::optional<Di
   if (!forward) {
     VESK_LOG_ERROR("WrenBackend(sendMessage): Wren adaptor %s does not respond to forwarding selector %s",
                    adaptorDescription(), VESK_WREN_SEND_MESSAGE);
-    _services.counters.count(_name, DropReason::AdaptorFailed);
+    _outcomes->count("message", DropReason::AdaptorFailed);
     return std::nullopt;
   }
   if (const auto forwarded = forwardTo(forward, method, respCode, payload); !forwarded) {
     VESK_LOG_ERROR("WrenBackend(sendMessage): Wren adaptor %s failed: %s", adaptorDescription(),
                    forwarded.error().text.c_str());
-    _services.counters.count(_name, DropReason::AdaptorFailed);
+    _outcomes->count("message", DropReason::AdaptorFailed);
+  } else if (_outcomes->isWatched()) {
+    _outcomes->show("message", "delivered", {{"category", method}, {"type", respCode}});
   }
   return std::nullopt;
 }

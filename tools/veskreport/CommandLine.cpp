@@ -140,9 +140,23 @@ class Reader {
     explain->add_option("--client-type", _invocation.clientType, "Client type; selects the storebag")
         ->required();
     addUserInfo(*explain);
+    addTap();
     explain->add_option("--draw", _invocation.draw, "The session's draw for sampling, from 0 to 1")
         ->check(CLI::Range(0.0, 1.0))
         ->capture_default_str();
+  }
+
+  void addTap() {
+    CLI::App* tap =
+        addConnected("tap", "Show what leaves the device, and what becomes of it, as it happens", runTap);
+    tap->add_option("--client-type", _invocation.tap.clientType, "Only of this client type");
+    tap->add_option("--client-name", _invocation.clientName, "Only of clients with this name");
+    tap->add_option("--backend", _invocation.tap.backend, "Only of this backend, such as httpPost");
+    tap->add_option("--outcome", _invocation.tap.outcome, "Only what ended so")
+        ->check(CLI::IsMember({"held", "posted", "sent", "delivered", "deferred", "dropped"}));
+    tap->add_flag("--bodies", _invocation.tap.bodies, "Show what was sent, too");
+    tap->add_option("--count", _invocation.tap.count, "Exit after this many lines (default: never)")
+        ->check(CLI::NonNegativeNumber);
   }
 
   CLI::App* addClient(const char* name, const char* description, Command* command) {
@@ -151,20 +165,31 @@ class Reader {
     sub->add_option("--client-version", _invocation.clientVersion, "Client version")->capture_default_str();
     sub->add_option("--session-id", _invocation.sessionID, "Session ID (default: a random one)");
     addUserInfo(*sub);
-    sub->add_flag("--require-user-info", _invocation.requireUserInfo,
-                  "Make backends wait for user info and apply it");
+    sub->add_flag("!--no-require-user-info,--require-user-info", _invocation.requireUserInfo,
+                  "Report without asking for consent, client entry, region, sampling and filters");
     sub->add_flag("--batch", _invocation.batch, "Make backends collect messages into batches");
     return sub;
   }
 
   void addSessionCommands() {
-    addClient("states", "Show the names of the enabled backends", runStates);
+    CLI::App* states = addClient("states", "Show the names of the backends that a client gets", runStates);
+    states->add_flag("--start", _invocation.start, "Start a session to find out; it reports its start");
     addClient("display-url", "Show where the session's messages can be viewed", runDisplayURL);
     addClient("flush", "Make the backends send what they hold back", runFlush);
     addClient("aggregate", "Show the messages of this session and of those below it as they are sent",
               runAggregate)
         ->add_option("--count", _invocation.aggregateCount, "Exit after this many messages (default: never)")
         ->check(CLI::NonNegativeNumber);
+  }
+
+  /// Such a message would be held back for ever.
+  void checkUserInfo(const char* command) const {
+    if (!_invocation.requireUserInfo || !_invocation.clientName.empty() || !_invocation.serviceName.empty() ||
+        !_invocation.userInfo.empty())
+      return;
+    throw CLI::ValidationError(command,
+                               "--client-name is required, since without user info nothing is reported "
+                               "(or --no-require-user-info)");
   }
 
   void addMessageCommands() {
@@ -177,6 +202,10 @@ class Reader {
       if (isOnce) {
         category->required();
         type->required();
+        sub->callback([this] {
+          _invocation.command = runSendOnce;
+          checkUserInfo("send-once");
+        });
         continue;
       }
       sub->add_flag("--realtime", _realtime, "Post at once, without batching");
@@ -195,6 +224,7 @@ class Reader {
         _invocation.command = runSend;
         if (!_invocation.category && !_invocation.fromStandardInput)
           throw CLI::ValidationError("send", "--category and --type are required");
+        checkUserInfo("send");
       });
     }
   }

@@ -25,7 +25,8 @@ struct Invocation {
   std::string clientName;
   std::string serviceName;
   std::vector<std::string> userInfo;  ///< other key=text and key:=json pairs
-  bool requireUserInfo = false;
+  bool requireUserInfo = true;
+  bool start = false;  ///< a session, to ask for its states
   bool batch = false;
   std::chrono::milliseconds timeout{30'000};
 
@@ -43,6 +44,14 @@ struct Invocation {
 
   bool openMetrics = false;
   double draw = 0;  ///< a session's, for sampling
+  /// What to show of what becomes of messages.
+  struct Tap {
+    std::optional<int> clientType;
+    std::string backend;      ///< empty: all
+    std::string outcome;      ///< empty: all
+    bool bodies = false;      ///< with what was sent
+    std::uint64_t count = 0;  ///< the number of records after which to end; 0: never
+  } tap;
 
   // Storebags.
   std::string directory = ".";  ///< of a new key pair
@@ -78,6 +87,8 @@ int runPowerLog(const Invocation& invocation, const Output& output);
 int runStatus(const Invocation& invocation, const Output& output);
 /// Shows what the daemon would do with a client's messages, and why.
 int runExplain(const Invocation& invocation, const Output& output);
+/// Shows what becomes of messages, while it happens, until the daemon ends.
+int runTap(const Invocation& invocation, const Output& output);
 
 int runStorebagKeygen(const Invocation& invocation, const Output& output);
 int runStorebagSign(const Invocation& invocation, const Output& output);

@@ -43,6 +43,10 @@ std::optional<Dictionary> userInfoOf(const Invocation& invocation, const Output&
 DaemonSession::DaemonSession(const Invocation& invocation, const Output& output)
     : _invocation(invocation), _output(output), _sessionInfo(sessionInfoOf(_invocation)) {
   _userInfo = userInfoOf(_invocation, _output);
+  if (!_invocation.requireUserInfo)
+    _output.note(
+        "without required user info the daemon asks neither consent, client entry, region, sampling "
+        "nor filters");
   const std::string path = _invocation.socket.empty() ? pathUnderRoot(wire::kSocketPath) : _invocation.socket;
   ReportingOptions options;
   options.socketPath = path;

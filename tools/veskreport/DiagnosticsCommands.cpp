@@ -1,76 +1,14 @@
-#include <VeskReporting/VeskReportingKeys.h>
-
-#include <poll.h>
-
 #include <cmath>
 #include <cstdio>
-#include <cstring>
-#include <system_error>
 
-#include "platform/files/RootPrefix.h"
-#include "platform/ipc/BusClient.h"
 #include "protocol/WireNames.h"
 #include "tools/text/Printable.h"
 #include "tools/veskreport/CommandLine.h"
-#include "tools/veskreport/DaemonSession.h"
+#include "tools/veskreport/DiagnosticsClient.h"
 
 namespace vesk {
 
 namespace {
-
-/// Calls the daemon's diagnostics object and returns its answer.
-Dictionary askDaemon(const Invocation& invocation, const Output& output, const wire::Member& member,
-                     std::vector<IPCArgument> arguments = {}) {
-  const std::string path = invocation.socket.empty() ? pathUnderRoot(wire::kSocketPath) : invocation.socket;
-  std::optional<Dictionary> result;
-  std::string problem;
-  try {
-    BusClient::Options options;
-    options.socketPath = path;
-    options.objectPath = wire::kDiagnosticsPath;
-    BusClient bus(std::move(options));
-    const auto onAnswer = [&](BusAnswer& answer) {
-      Dictionary value;
-      if (answer.read(value)) result = std::move(value);
-      if (!result)
-        problem = answer.errorText().empty() ? "its answer is of another type" : answer.errorText();
-    };
-    auto sent = bus.send(IPCOutgoingCall{wire::kDiagnosticsInterface, member.name, std::move(arguments)},
-                         onAnswer, invocation.timeout);
-    if (sent != BusClient::SendResult::Sent) problem = "the request can not be sent";
-    while (!result && problem.empty()) {
-      pollfd source{bus.fd(), bus.events(), 0};
-      ::poll(&source, 1, bus.timeout());
-      if (bus.process() == BusClient::Progress::Disconnected && !result && problem.empty())
-        problem = "the daemon has closed the connection";
-    }
-  } catch (const std::system_error& error) {
-    output.fail("no daemon at " + path + ": is veskreportingd running? (" +
-                std::strerror(error.code().value()) + ")");
-  }
-  if (!result) output.fail("the daemon does not tell: " + problem);
-  return *std::move(result);
-}
-
-std::string textIn(const Dictionary& from, const char* key) {
-  const Value* value = from.find(key);
-  if (value == nullptr || value->isNone()) return "";
-  return printable(value->text() ? value->text()->string() : describe(*value));
-}
-
-Dictionary dictionaryIn(const Dictionary& from, const char* key) {
-  return from.dictionary(key).value_or(Dictionary());
-}
-
-std::vector<Dictionary> listIn(const Dictionary& from, const char* key) {
-  std::vector<Dictionary> all;
-  const Value* value = from.find(key);
-  const List* list = value ? value->list() : nullptr;
-  for (std::size_t i = 0; list && i < list->size(); ++i) {
-    if (const Dictionary* each = (*list)[i].dictionary()) all.push_back(*each);
-  }
-  return all;
-}
 
 /// "45 s", "12 min", "3 h" or "2 d".
 std::string duration(const Value* seconds) {
@@ -173,17 +111,15 @@ std::vector<std::string> explanationLines(const Dictionary& explanation) {
 }  // namespace
 
 int runStatus(const Invocation& invocation, const Output& output) {
-  const auto status = askDaemon(invocation, output, wire::kGetStatus);
+  const auto status = DiagnosticsClient(invocation, output).ask(wire::kGetStatus);
   const int written =
       invocation.openMetrics ? output.raw(openMetrics(status)) : output.done(statusLines(status), status);
   return written == kExitDone && textIn(status, "health") == "ok" ? kExitDone : kExitFailed;
 }
 
 int runExplain(const Invocation& invocation, const Output& output) {
-  MutableDictionary request(
-      Dictionary{{kVeskReportingSessionInfoClientType, invocation.clientType}, {"draw", invocation.draw}});
-  if (const auto userInfo = userInfoOf(invocation, output)) request.set("userInfo", *userInfo);
-  const auto explanation = askDaemon(invocation, output, wire::kExplain, {request.share()});
+  const auto explanation =
+      DiagnosticsClient(invocation, output).ask(wire::kExplain, {explanationRequest(invocation, output)});
   if (const auto problem = textIn(explanation, "problem"); !problem.empty())
     return output.failed(problem, explanation);
   return output.done(explanationLines(explanation), explanation);

@@ -3,6 +3,7 @@
 
 #include "tools/veskreport/CommandLine.h"
 #include "tools/veskreport/DaemonSession.h"
+#include "tools/veskreport/MessageFate.h"
 #include "tools/veskreport/PayloadParser.h"
 #include "tools/veskreport/Terminal.h"
 
@@ -105,16 +106,19 @@ class MessageStream {
 
   int finish() {
     std::lock_guard lock(_mutex);
+    const auto drops = _watch.drops();
     if (!_lines.error().empty()) return _output.failed("standard input: " + _lines.error());
     std::string words = std::to_string(_sent) + (_sent == 1 ? " message sent" : " messages sent");
     if (_failed > 0) words += ", " + std::to_string(_failed) + " failed";
-    const int told = _output.done(words, {{"sent", _sent}, {"failed", _failed}});
-    return _failed == 0 ? told : kExitFailed;
+    if (drops.count > 0) words += ", " + std::to_string(drops.count) + " dropped (" + drops.cause + ")";
+    const int told = _output.done(words, {{"sent", _sent}, {"failed", _failed}, {"dropped", drops.count}});
+    return _failed == 0 && drops.count == 0 ? told : kExitFailed;
   }
 
   DaemonSession& _session;
   const Invocation& _invocation;
   const Output& _output;
+  MessageWatch _watch{_invocation, _output, "dropped"};
   LineReader _lines;
   Progress _progress{STDIN_FILENO};
 
@@ -131,9 +135,12 @@ class MessageStream {
 int runSend(const Invocation& invocation, const Output& output) {
   const auto payload = payloadOf(invocation, output);
   DaemonSession session(invocation, output);
-  const BackendNames backends = session.start();
-  if (invocation.fromStandardInput) return MessageStream(session, invocation, output).run();
-  if (backends.empty() && !output.isJSON()) output.note("no backend is enabled for this session");
+  if (invocation.fromStandardInput) {
+    session.start();
+    return MessageStream(session, invocation, output).run();
+  }
+  MessageWatch watch(invocation, output);
+  session.start();
   Dictionary parameters = parametersOf(invocation, payload);
   const auto timeout = invocation.timeout;
   if (invocation.noWait) {
@@ -143,19 +150,21 @@ int runSend(const Invocation& invocation, const Output& output) {
     auto next = session->fetchDisplayURL(timeout);
     if (session->drops().invalid > 0) session.fail(ReportingStatus::InvalidArgument);
     session.answerOf(next);
-    return output.done("sent", {{"answer", Value()}});
+    return reportFates(watch.fates(*invocation.category, *invocation.type), std::nullopt, output);
   }
-  return output.answered(session.answerOf(session->sendMessageAndWait(parameters, timeout)), "accepted");
+  const auto answer = session.answerOf(session->sendMessageAndWait(parameters, timeout));
+  return reportFates(watch.fates(*invocation.category, *invocation.type), answer, output);
 }
 
 int runSendOnce(const Invocation& invocation, const Output& output) {
   const auto payload = payloadOf(invocation, output);
   DaemonSession session(invocation, output);
+  MessageWatch watch(invocation, output);
   std::string answer = session.answerOf(
       session->sendMessageOnceAndWait(session.sessionInfo(), session.userInfo(), *invocation.category,
                                       *invocation.type, payload, invocation.timeout));
   if (answer != "finished") return output.failed(answer);
-  return output.answered(answer, "");
+  return reportFates(watch.fates(*invocation.category, *invocation.type), answer, output);
 }
 
 }  // namespace vesk

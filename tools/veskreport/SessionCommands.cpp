@@ -1,8 +1,10 @@
 #include <filesystem>
 #include <future>
 
+#include "protocol/WireNames.h"
 #include "tools/veskreport/CommandLine.h"
 #include "tools/veskreport/DaemonSession.h"
+#include "tools/veskreport/DiagnosticsClient.h"
 #include "tools/veskreport/PayloadParser.h"
 #include "tools/veskreport/Terminal.h"
 
@@ -35,15 +37,33 @@ std::string sizeInWords(const std::string& path) {
   return std::to_string(bytes >> 20) + " MiB";
 }
 
+int showStates(const BackendNames& names, const Output& output) {
+  if (names.empty() && !output.isJSON()) output.note("no backend is enabled");
+  return output.done(names, {{"backends", List(std::vector<Value>(names.begin(), names.end()))}});
+}
+
+/// What a session would get, without one: a session reports its start.
+int statesWithoutSession(const Invocation& invocation, const Output& output) {
+  const auto explanation =
+      DiagnosticsClient(invocation, output).ask(wire::kExplain, {explanationRequest(invocation, output)});
+  if (const auto problem = textIn(explanation, "problem"); !problem.empty())
+    return output.failed(problem + " (--start starts one)");
+  BackendNames names;
+  for (const auto& [name, backend] : dictionaryIn(explanation, "backends")) {
+    if (backend.dictionary() && textIn(*backend.dictionary(), "state") == "enabled")
+      names.push_back(name.string());
+  }
+  return showStates(names, output);
+}
+
 }  // namespace
 
 int runStates(const Invocation& invocation, const Output& output) {
+  if (!invocation.start) return statesWithoutSession(invocation, output);
   DaemonSession session(invocation, output);
   session.start();
   auto states = session->fetchStates(session.userInfo(), invocation.timeout);
-  BackendNames names = session.answerOf(states).value_or(BackendNames{});
-  if (names.empty() && !output.isJSON()) output.note("no backend is enabled");
-  return output.done(names, {{"backends", List(std::vector<Value>(names.begin(), names.end()))}});
+  return showStates(session.answerOf(states).value_or(BackendNames{}), output);
 }
 
 int runDisplayURL(const Invocation& invocation, const Output& output) {

@@ -1,0 +1,72 @@
+#include "util/DeliveryTap.h"
+
+#include <algorithm>
+
+namespace vesk {
+
+void DeliveryTap::tell(const Dictionary& record, const std::string& body, Clock::time_point now) {
+  MutexLock lock(_mutex);
+  for (Reader* reader : _readers) {
+    if (reader->_filter(record)) reader->add(record, body, now);
+  }
+}
+
+std::shared_ptr<DeliveryTap::Reader> DeliveryTap::open(Filter filter) {
+  auto reader = std::make_shared<Reader>(*this, std::move(filter));
+  MutexLock lock(_mutex);
+  if (_readers.size() >= kMostReaders) return nullptr;
+  _readers.push_back(reader.get());
+  _isOpen = true;
+  return reader;
+}
+
+void DeliveryTap::close(const Reader* reader) {
+  MutexLock lock(_mutex);
+  std::erase(_readers, reader);
+  _isOpen = !_readers.empty();
+}
+
+bool DeliveryTap::Reader::takesBody(std::size_t bytes, Clock::time_point now) {
+  if (now - _secondBegan >= std::chrono::seconds(1)) {
+    _secondBegan = now;
+    _bodyBytes = 0;
+  }
+  if (bytes > kBodyBytesInBatch || _bodyBytes + bytes > kBodyBytesPerSecond) return false;
+  _bodyBytes += bytes;
+  return true;
+}
+
+void DeliveryTap::Reader::add(const Dictionary& record, const std::string& body, Clock::time_point now) {
+  MutexLock lock(_mutex);
+  if (_waiting.size() >= kMostWaiting) {
+    ++_lost;
+    return;
+  }
+  if (body.empty() || !takesBody(body.size(), now)) {
+    _waiting.push_back({record, 0});
+  } else {
+    MutableDictionary whole(record, 1);
+    whole.set("body", body);
+    _waiting.push_back({whole.share(), body.size()});
+  }
+  _added.notify_one();
+}
+
+DeliveryTap::Batch DeliveryTap::Reader::take(Clock::duration patience) {
+  Batch batch;
+  MutexLock lock(_mutex);
+  const auto deadline = Clock::now() + patience;
+  while (_waiting.empty() && _lost == 0) {
+    if (_added.wait_until(_mutex, deadline) == std::cv_status::timeout) break;
+  }
+  for (std::size_t bytes = 0; !_waiting.empty() && batch.records.size() < kMostInBatch;) {
+    bytes += _waiting.front().bodyBytes;
+    if (!batch.records.empty() && bytes > kBodyBytesInBatch) break;
+    batch.records.emplace_back(std::move(_waiting.front().record));
+    _waiting.pop_front();
+  }
+  batch.lost = std::exchange(_lost, 0);
+  return batch;
+}
+
+}  // namespace vesk
