@@ -10,6 +10,7 @@
 
 #include "backends/HeldBytes.h"
 #include "backends/dashboard/DashboardLinger.h"
+#include "backends/https/AcceptedPosts.h"
 #include "backends/https/RefusedPosts.h"
 #include "backends/upload/UploadGate.h"
 #include "platform/http/HTTPClient.h"
@@ -48,6 +49,10 @@ struct BackendServices {
   std::shared_ptr<PostBudget> postBudget = std::make_shared<PostBudget>();
   /// Those who look at what becomes of messages.
   std::shared_ptr<DeliveryTap> tap = std::make_shared<DeliveryTap>();
+  /// Set once the user withdrew consent: sessions that had it may not post by it any more.
+  std::shared_ptr<std::atomic<bool>> consentWithdrawn = std::make_shared<std::atomic<bool>>(false);
+  /// When servers accepted posts.
+  std::shared_ptr<AcceptedPosts> acceptedPosts = std::make_shared<AcceptedPosts>();
   /// Logs refused posts.
   std::shared_ptr<RefusedPosts> refusedPosts = std::make_shared<RefusedPosts>();
 };

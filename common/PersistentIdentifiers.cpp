@@ -1,5 +1,7 @@
 #include "common/PersistentIdentifiers.h"
 
+#include <unistd.h>
+
 #include <algorithm>
 #include <cctype>
 #include <cerrno>
@@ -43,6 +45,13 @@ std::string PersistentIdentifiers::identifier(bool respectsConsent) {
   MutexLock lock(_mutex);
   if (!_pair) _pair = load();
   return respectsConsent ? _pair->respecting : _pair->overriding;
+}
+
+void PersistentIdentifiers::renew() {
+  MutexLock lock(_mutex);
+  if (::unlink(_path.c_str()) != 0 && errno != ENOENT)
+    VESK_LOG_WARNING("VeskReporting: cannot remove %s: %s", _path.c_str(), std::strerror(errno));
+  _pair = load();
 }
 
 PersistentIdentifiers::Pair PersistentIdentifiers::load() const {
@@ -109,12 +118,22 @@ std::optional<PersistentIdentifiers::Pair> PersistentIdentifiers::parse(const st
   return pair;
 }
 
+namespace {
+
+PersistentIdentifiers& identifiersOfProcess() {
+  // Never destroyed: another thread may still report while the process exits.
+  static auto* identifiers =
+      new PersistentIdentifiers(pathUnderRoot("/var/lib/veskreportingd/identifiers.toml"));
+  return *identifiers;
+}
+
+}  // namespace
+
+void renewPersistentIdentifiers() { identifiersOfProcess().renew(); }
+
 std::string persistentIdentifierForDNU(bool respectsConsent) noexcept {
   try {
-    // Never destroyed: another thread may still report while the process exits.
-    static auto* identifiers =
-        new PersistentIdentifiers(pathUnderRoot("/var/lib/veskreportingd/identifiers.toml"));
-    return identifiers->identifier(respectsConsent);
+    return identifiersOfProcess().identifier(respectsConsent);
   } catch (...) {
     return {};
   }

@@ -23,6 +23,9 @@ class PersistentIdentifiers {
   /// Returns a UUID as text.
   std::string identifier(bool respectsConsent);
 
+  /// Makes new identifiers, in the file too.
+  void renew();
+
  private:
   struct Pair {
     std::string respecting;
@@ -42,5 +45,8 @@ class PersistentIdentifiers {
 /// Uses the process's one instance, for /var/lib/veskreportingd/identifiers.toml. Returns an empty string if
 /// out of memory.
 std::string persistentIdentifierForDNU(bool respectsConsent) noexcept;
+
+/// Makes new ones.
+void renewPersistentIdentifiers();
 
 }  // namespace vesk

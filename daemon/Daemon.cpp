@@ -11,7 +11,7 @@
 
 #include "common/PersistentIdentifiers.h"
 #include "common/Resources.h"
-#include "daemon/Diagnostics.h"
+#include "daemon/DiagnosticsObject.h"
 #include "daemon/ReportingdAgent.h"
 #include "platform/device/DeviceInformation.h"
 #include "platform/files/RootPrefix.h"
@@ -38,6 +38,7 @@ constexpr std::size_t kOtherDescriptors = 256;
 constexpr std::uint64_t kLogRateLimit = 200;
 
 constexpr char kKeptStorebags[] = "/var/lib/veskreportingd/storebags";
+constexpr char kCountersPath[] = "/var/lib/veskreportingd/counters.toml";
 constexpr char kOutboxPath[] = "/var/lib/veskreportingd/outbox.sqlite";
 constexpr std::uint64_t kMostOutboxDays = 3650;
 
@@ -87,6 +88,9 @@ void countFate(const PostOutbox::Fate& fate, RefusedPosts& refusedPosts) {
       break;
     case Outcome::NotWritten:
       reason = DropReason::NotWritten;
+      break;
+    case Outcome::Exported:
+      reason = DropReason::Exported;
       break;
   }
   Counters::shared().count(fate.source, reason, fate.events);
@@ -199,8 +203,9 @@ void logLosses() {
 }  // namespace
 
 struct Daemon::Parts {
-  Parts(ServiceManager& serviceManager, BusyMarker& busyMarker)
-      : backendServices{.http = http,
+  Parts(ServiceManager& manager, BusyMarker& busyMarker, std::function<void()> reload)
+      : serviceManager(manager),
+        backendServices{.http = http,
                         .clock = WallClock::system(),
                         .counters = Counters::shared(),
                         .networkQueues = networkQueues,
@@ -223,13 +228,19 @@ struct Daemon::Parts {
             .services = backendServices,
             .outbox = outbox.get(),
             .settings = {{"outbox", nameOf(mode)}, {"keepStorebags", keptStorebags != nullptr}},
-            .publicKeys = publicKeysDER})),
+            .publicKeys = publicKeysDER,
+            .history = history})),
+        operations(std::make_shared<Operations>(Operations::Sources{.agent = *agent,
+                                                                    .services = backendServices,
+                                                                    .outbox = outbox.get(),
+                                                                    .reload = std::move(reload)})),
         listener(listenerOptions(serviceManager)) {
     backendServices.heldBudget = std::make_shared<HeldBudget>(heldLimits());
     backendServices.postBudget = std::make_shared<PostBudget>(PostBudget::Limits{}, outbox.get());
     listener.setDelegate(agent.get());
-    agent->setDiagnostics(wire::kDiagnosticsPath,
-                          [this](const IPCPeer& peer) { return diagnosticsObject(diagnostics, peer); });
+    agent->setDiagnostics(wire::kDiagnosticsPath, [this](const IPCPeer& peer) {
+      return diagnosticsObject(diagnostics, operations, peer);
+    });
     if (!outbox) return;
     outbox->setConsent(diagnosticsSubmissionConsent());
     outbox->start(http);
@@ -238,6 +249,7 @@ struct Daemon::Parts {
   /// Also called for each new session, so that a withdrawal reaches the posts that wait.
   bool consent() const {
     const bool consent = diagnosticsSubmissionConsent();
+    if (consent) *backendServices.consentWithdrawn = false;
     if (outbox) outbox->setConsent(consent);
     return consent;
   }
@@ -267,6 +279,7 @@ struct Daemon::Parts {
         .uptime = uptime};
   }
 
+  ServiceManager& serviceManager;
   // Sending a datagram doesn't block, so one thread serves all backends.
   QueueThread networkQueues;
   // Declared before the client: posts that complete while the client ends still use the services.
@@ -280,12 +293,14 @@ struct Daemon::Parts {
   std::unique_ptr<PostOutbox> outbox;
   HTTPClient http;
   std::shared_ptr<ReportingdAgent> agent;
+  CounterHistory history{pathUnderRoot(kCountersPath), Counters::shared()};
   std::shared_ptr<const Diagnostics> diagnostics;
+  std::shared_ptr<Operations> operations;
   IPCListener listener;
 };
 
-Daemon::Daemon(ServiceManager& serviceManager, BusyMarker& busyMarker)
-    : _parts(std::make_unique<Parts>(serviceManager, busyMarker)) {
+Daemon::Daemon(ServiceManager& serviceManager, BusyMarker& busyMarker, std::function<void()> reload)
+    : _parts(std::make_unique<Parts>(serviceManager, busyMarker, std::move(reload))) {
   SystemLog::setRateLimit(preferenceNumberForKey("logRateLimit", 0).value_or(kLogRateLimit));
 }
 
@@ -294,6 +309,17 @@ Daemon::~Daemon() {
 }
 
 void Daemon::resume() { _parts->listener.resume(); }
+
+void Daemon::takeStock() {
+  _parts->history.save();
+  std::uint64_t lost = 0;
+  for (const auto& [backend, reason, count] : Counters::shared().snapshot())
+    lost += isLoss(reason) ? count : 0;
+  const auto outbox = _parts->outbox ? _parts->outbox->status() : PostOutbox::Status{};
+  _parts->serviceManager.notifyStatus(std::to_string(_parts->agent->sessions().size()) + " connections, " +
+                                      std::to_string(outbox.posts) + " posts wait, " + std::to_string(lost) +
+                                      " messages lost since the start");
+}
 
 bool Daemon::stop() {
   if (std::exchange(_stopped, true)) return !_parts;
@@ -317,6 +343,7 @@ bool Daemon::stop() {
                      static_cast<int>(kDatagramWait.count()));
   }
   _parts->stopPosting();  // puts aside, or abandons and counts, what is left
+  _parts->history.save();
   if (haveEnded) _parts.reset();
   logLosses();
   return haveEnded;

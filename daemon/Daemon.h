@@ -2,6 +2,7 @@
 #pragma once
 
 #include <chrono>
+#include <functional>
 #include <memory>
 
 #include "daemon/DaemonOptions.h"
@@ -14,12 +15,17 @@ namespace vesk {
 class Daemon {
  public:
   /// Does not accept clients yet. Throws std::system_error if the socket can't be created.
-  Daemon(ServiceManager& serviceManager, BusyMarker& busyMarker);
+  /// `reload`, on any thread, asks the process to end so that it is started anew; it must outlive this.
+  Daemon(
+      ServiceManager& serviceManager, BusyMarker& busyMarker, std::function<void()> reload = [] {});
   /// Like `stop`, but waits for all sessions without a limit.
   ~Daemon();
 
   /// Starts accepting clients.
   void resume();
+
+  /// Writes what was counted to disk, and tells the service manager how things stand. Called now and then.
+  void takeStock();
 
   /// Stops in order: closes the listener, destroys the sessions (they send their closing messages and flush),
   /// then waits for posts in progress, at most `kPostWait`, and for datagrams, at most `kDatagramWait`.

@@ -9,8 +9,6 @@
 
 #include "backends/BackendFactory.h"
 #include "backends/https/PostExplanation.h"
-#include "platform/ipc/IPCIncomingCall.h"
-#include "protocol/WireNames.h"
 #include "storebag/Settings.h"
 #include "storebag/StorebagNaming.h"
 #include "util/ReportingdUtil.h"
@@ -21,8 +19,6 @@ namespace {
 
 constexpr char kGroup[] = "veskreporting";
 constexpr double kNearlyFull = 0.8;
-// How long a call waits for records. The connection's end has to wait for it.
-constexpr std::chrono::milliseconds kTapPatience{500};
 
 std::optional<gid_t> idOfGroup(const char* name) {
   group entry{};
@@ -41,9 +37,9 @@ Value number(std::uint64_t value) { return Value(static_cast<std::int64_t>(value
 
 Dictionary problem(const std::string& text) { return Dictionary{{"problem", text}}; }
 
-List countersIn(const Counters& counters) {
+List described(const std::vector<Counters::Count>& counts) {
   std::vector<Value> all;
-  for (const auto& [backend, reason, count] : counters.snapshot()) {
+  for (const auto& [backend, reason, count] : counts) {
     all.emplace_back(Dictionary{{"backend", backend},
                                 {"reason", std::string(nameOfDropReason(reason))},
                                 {"count", number(count)},
@@ -51,47 +47,6 @@ List countersIn(const Counters& counters) {
   }
   return List(std::move(all));
 }
-
-class Object final : public IPCExportedObject {
- public:
-  Object(std::shared_ptr<const Diagnostics> diagnostics, const IPCPeer& viewer)
-      : _diagnostics(std::move(diagnostics)), _viewer(viewer) {}
-
-  const char* interfaceName() const override { return wire::kDiagnosticsInterface; }
-  const char* introspection() const override { return wire::kDiagnosticsIntrospection; }
-  void handle(IPCIncomingCall& call) override {
-    if (call.member() == wire::kGetStatus.name) {
-      if (call.read(wire::kGetStatus.arguments)) call.answer({_diagnostics->status(_viewer)});
-    } else if (call.member() == wire::kExplain.name) {
-      Dictionary request;
-      if (call.read(wire::kExplain.arguments, request)) call.answer({_diagnostics->explain(request)});
-    } else if (call.member() == wire::kOpenTap.name) {
-      Dictionary filter;
-      if (call.read(wire::kOpenTap.arguments, filter)) call.answer({openTap(filter)});
-    } else if (call.member() == wire::kReadTap.name) {
-      if (call.read(wire::kReadTap.arguments)) call.answer({readTap()});
-    } else {
-      call.refuse("org.freedesktop.DBus.Error.UnknownMethod", "The interface has no such method");
-    }
-  }
-
- private:
-  Dictionary openTap(const Dictionary& filter) {
-    _tap = nullptr;
-    _tap = _diagnostics->openTap(_viewer, filter);
-    return _tap ? Dictionary() : problem("too many are looking already");
-  }
-
-  Dictionary readTap() {
-    if (!_tap) return problem("openTap comes first");
-    auto batch = _tap->take(kTapPatience);
-    return {{"records", List(std::move(batch.records))}, {"lost", number(batch.lost)}};
-  }
-
-  const std::shared_ptr<const Diagnostics> _diagnostics;
-  const IPCPeer _viewer;
-  std::shared_ptr<DeliveryTap::Reader> _tap;
-};
 
 }  // namespace
 
@@ -121,12 +76,23 @@ Dictionary Diagnostics::status(const IPCPeer& viewer) const {
       {"storebags", bags},
       {"sessions", sessions(viewer)},
       {"outbox", outbox},
-      {"counters", countersIn(_sources.services.counters)}};
+      {"counters", described(_sources.services.counters.snapshot())},
+      {"total", described(_sources.history.total())},
+      {"lastPosts", lastPosts()}};
 }
 
 bool Diagnostics::seesAll(const IPCPeer& viewer) const {
   return viewer.user == 0 || viewer.user == ::geteuid() ||
          (_group && std::find(viewer.groups.begin(), viewer.groups.end(), *_group) != viewer.groups.end());
+}
+
+// By host: how long ago a server last accepted a post.
+Dictionary Diagnostics::lastPosts() const {
+  MutableDictionary ages;
+  const auto now = std::chrono::steady_clock::now();
+  for (const auto& [host, time] : _sources.services.acceptedPosts->all())
+    ages.set(host, secondsBetween(time, now));
+  return ages.share();
 }
 
 List Diagnostics::storebags(List& problems) const {
@@ -178,8 +144,10 @@ Dictionary Diagnostics::outboxStatus(List& problems) const {
   if (used >= kNearlyFull) {
     wrong.emplace_back("the outbox is " + std::to_string(static_cast<int>(used * 100)) + " % full");
   }
+  if (status.isHeld) wrong.emplace_back("an operator holds the outbox");
   problems = List(std::move(wrong));
   return Dictionary{{"posts", number(status.posts)},
+                    {"isHeld", status.isHeld},
                     {"bytes", number(status.bytes)},
                     {"maximumBytes", number(status.maximumBytes)},
                     {"hosts", List(std::move(hosts))}};
@@ -236,11 +204,6 @@ std::shared_ptr<DeliveryTap::Reader> Diagnostics::openTap(const IPCPeer& viewer,
       return value != nullptr && describe(*value) == describe(each.value);
     });
   });
-}
-
-std::shared_ptr<IPCExportedObject> diagnosticsObject(std::shared_ptr<const Diagnostics> diagnostics,
-                                                     const IPCPeer& viewer) {
-  return std::make_shared<Object>(std::move(diagnostics), viewer);
 }
 
 }  // namespace vesk

@@ -13,7 +13,7 @@
 #include "platform/ipc/IPCConnection.h"
 #include "platform/outbox/PostOutbox.h"
 #include "storebag/SignedDocument.h"
-#include "util/Counters.h"
+#include "util/CounterHistory.h"
 
 namespace vesk {
 
@@ -27,13 +27,18 @@ class Diagnostics {
     PostOutbox* outbox;   ///< null: there is none
     Dictionary settings;  ///< in force
     std::function<PublicKeys()> publicKeys;
+    const CounterHistory& history;
   };
   /// Reads /etc/group for the group whose members see everything.
   explicit Diagnostics(Sources sources);
 
+  /// Whether the viewer sees all sessions and may use the operations: root, the daemon's user and the group
+  /// veskreporting.
+  bool seesAll(const IPCPeer& viewer) const;
+
   /// `health` ("ok" or "degraded") and `reasons`, `version`, `uptime` in seconds, `environment`, `settings`,
-  /// `storebags`, `sessions`, `outbox`, `counters` (docs/wire.md). Root, the daemon's user and the group
-  /// veskreporting see all sessions, others their own.
+  /// `storebags`, `sessions` (all, or the viewer's own), `outbox`, `counters`, `total`, `lastPosts`
+  /// (docs/wire.md).
   Dictionary status(const IPCPeer& viewer) const;
 
   /// What the backends of the storebag in force would do for `clientType` and `userInfo` in the
@@ -46,7 +51,7 @@ class Diagnostics {
   std::shared_ptr<DeliveryTap::Reader> openTap(const IPCPeer& viewer, const Dictionary& filter) const;
 
  private:
-  bool seesAll(const IPCPeer& viewer) const;
+  Dictionary lastPosts() const;
   List storebags(List& problems) const;
   List sessions(const IPCPeer& viewer) const;
   Dictionary outboxStatus(List& problems) const;
@@ -55,9 +60,5 @@ class Diagnostics {
   const std::optional<gid_t> _group;
   const std::chrono::steady_clock::time_point _begun = std::chrono::steady_clock::now();
 };
-
-/// The object of one connection.
-std::shared_ptr<IPCExportedObject> diagnosticsObject(std::shared_ptr<const Diagnostics> diagnostics,
-                                                     const IPCPeer& viewer);
 
 }  // namespace vesk

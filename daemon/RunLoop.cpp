@@ -20,6 +20,7 @@ sigset_t stopSignals() {
   ::sigemptyset(&signals);
   ::sigaddset(&signals, SIGTERM);
   ::sigaddset(&signals, SIGINT);
+  ::sigaddset(&signals, SIGHUP);
   return signals;
 }
 
@@ -47,9 +48,9 @@ RunLoop::Outcome RunLoop::run() {
       signalfd_siginfo signal{};
       [[maybe_unused]] auto taken = ::read(_signals.get(), &signal, sizeof signal);
       ::pthread_sigmask(SIG_SETMASK, &_previousMask, nullptr);
-      return Outcome::Signalled;
+      return signal.ssi_signo == SIGHUP ? Outcome::Reload : Outcome::Signalled;
     }
-    if (events[1].revents != 0) return Outcome::Stopped;
+    if (events[1].revents != 0) return _requested;
     auto now = Clock::now();
     if (events[2].revents != 0) noteBusyMarker(now);
     pingWatchdog(now);
@@ -58,7 +59,10 @@ RunLoop::Outcome RunLoop::run() {
   }
 }
 
-void RunLoop::stop() noexcept { _stopRequest.signal(); }
+void RunLoop::end(Outcome outcome) noexcept {
+  _requested = outcome;
+  _stopRequest.signal();
+}
 
 void RunLoop::noteBusyMarker(Clock::time_point now) {
   _busyMarker.acknowledge();

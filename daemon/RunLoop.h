@@ -1,6 +1,7 @@
 // The daemon's main run loop, which waits for a reason to stop.
 #pragma once
 
+#include <atomic>
 #include <chrono>
 #include <functional>
 #include <optional>
@@ -21,6 +22,7 @@ class RunLoop {
   enum class Outcome {
     Stopped,    ///< by `stop`
     Signalled,  ///< by SIGTERM or SIGINT
+    Reload,     ///< by `reload` or SIGHUP
     Idle,       ///< no work for the idle time
   };
 
@@ -33,25 +35,28 @@ class RunLoop {
     std::chrono::milliseconds pause{3000};
   };
 
-  /// The marker and the service manager must outlive the loop. Blocks SIGTERM and SIGINT for this thread and
-  /// all threads created later, so that `run` receives them, and ignores SIGPIPE. Construct it before the
-  /// process has other threads. Throws std::system_error if no descriptor is left.
+  /// The marker and the service manager must outlive the loop. Blocks SIGTERM, SIGINT and SIGHUP for this
+  /// thread and all threads created later, so that `run` receives them, and ignores SIGPIPE. Construct it
+  /// before the process has other threads. Throws std::system_error if no descriptor is left.
   RunLoop(Options options, BusyMarker& busyMarker, ServiceManager& serviceManager);
   /// Restores the calling thread's signal mask.
   ~RunLoop();
   RunLoop(const RunLoop&) = delete;
   RunLoop& operator=(const RunLoop&) = delete;
 
-  /// Returns when there is a reason to stop. After a signal, SIGTERM and SIGINT have their default effect
-  /// again, so that a second one ends a process that is slow to stop.
+  /// Returns when there is a reason to stop. After a signal, these signals have their default effect again,
+  /// so that a second one ends a process that is slow to stop.
   Outcome run();
 
   /// Makes `run` return, even if called before it. Thread-safe; may be called repeatedly.
-  void stop() noexcept;
+  void stop() noexcept { end(Outcome::Stopped); }
+  /// The same, with another outcome.
+  void reload() noexcept { end(Outcome::Reload); }
 
  private:
   using Clock = std::chrono::steady_clock;
 
+  void end(Outcome outcome) noexcept;
   void noteBusyMarker(Clock::time_point now);
   void pingWatchdog(Clock::time_point now);
   void lookForPause(Clock::time_point now);
@@ -63,6 +68,7 @@ class RunLoop {
 
   FileDescriptor _signals;
   Wakeup _stopRequest;
+  std::atomic<Outcome> _requested{Outcome::Stopped};
   sigset_t _previousMask{};
 
   // Only used by `run`.

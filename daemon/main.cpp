@@ -21,6 +21,8 @@ namespace {
 constexpr char kServiceName[] = "com.corvane.veskreportingd";
 // The service manager starts us again on the next connection.
 constexpr std::chrono::seconds kIdleExitWhenActivated{300};
+// The unit restarts the service on this exit status (EX_TEMPFAIL), and counts it as a success.
+constexpr int kStartAnew = 75;
 constexpr std::chrono::seconds kPatienceOfLog{1};
 
 int run(const vesk::DaemonOptions& options) {
@@ -38,21 +40,31 @@ int run(const vesk::DaemonOptions& options) {
   vesk::BusyMarker busyMarker;
   vesk::RunLoop::Options loopOptions{options.idleExit};
   if (!options.idleExit && serviceManager.isSocketActivated()) loopOptions.idleExit = kIdleExitWhenActivated;
-  loopOptions.onPause = vesk::releaseFreePages;
+  vesk::Daemon* running = nullptr;
+  loopOptions.onPause = [&running] {
+    vesk::releaseFreePages();
+    if (running) running->takeStock();
+  };
   vesk::RunLoop loop(loopOptions, busyMarker, serviceManager);
 
-  vesk::Daemon daemon(serviceManager, busyMarker);
+  vesk::Daemon daemon(serviceManager, busyMarker, [&loop] { loop.reload(); });
+  running = &daemon;
   daemon.resume();
   VESK_LOG_INFO("%s", options.sandbox ? "main: Listener resumes with sandbox, start loop."
                                       : "main: Listener resumes without sandbox, start loop.");
   serviceManager.notifyReady();
   vesk::releaseStartUpPages();
-  loop.run();
+  const bool reloads = loop.run() == vesk::RunLoop::Outcome::Reload;
+  if (reloads) {
+    VESK_LOG_INFO("%s", serviceManager.isPresent()
+                            ? "main: Ending, so that the service manager starts the daemon anew."
+                            : "main: Ending. No service manager starts the daemon anew.");
+  }
   serviceManager.notifyStopping();
   const bool haveEnded = daemon.stop();
   vesk::VeskReportingLogging::close();
   if (!haveEnded) std::_Exit(1);  // its sessions' threads still use what would be destroyed
-  return 0;
+  return reloads && vesk::ServiceManager::isPresent() ? kStartAnew : 0;
 }
 
 }  // namespace

@@ -35,6 +35,11 @@ inline constexpr Member kGetStatus{"getStatus", "", "a{sv}"};
 inline constexpr Member kExplain{"explain", "a{sv}", "a{sv}"};
 inline constexpr Member kOpenTap{"openTap", "a{sv}", "a{sv}"};
 inline constexpr Member kReadTap{"readTap", "", "a{sv}"};
+inline constexpr Member kReload{"reload", "", "a{sv}"};
+inline constexpr Member kHoldOutbox{"holdOutbox", "a{sv}", "a{sv}"};
+inline constexpr Member kReadOutbox{"readOutbox", "a{sv}", "a{sv}"};
+inline constexpr Member kRemoveFromOutbox{"removeFromOutbox", "a{sv}", "a{sv}"};
+inline constexpr Member kApplyConsent{"applyConsent", "", "a{sv}"};
 inline constexpr const char* kDiagnosticsIntrospection =
     "  <interface name=\"com.corvane.veskreportingd.DiagnosticsInterface\">\n"
     "    <method name=\"getStatus\"><arg name=\"status\" type=\"a{sv}\" direction=\"out\"/></method>\n"
@@ -43,6 +48,14 @@ inline constexpr const char* kDiagnosticsIntrospection =
     "    <method name=\"openTap\"><arg name=\"filter\" type=\"a{sv}\" direction=\"in\"/>"
     "<arg name=\"opened\" type=\"a{sv}\" direction=\"out\"/></method>\n"
     "    <method name=\"readTap\"><arg name=\"records\" type=\"a{sv}\" direction=\"out\"/></method>\n"
+    "    <method name=\"reload\"><arg name=\"done\" type=\"a{sv}\" direction=\"out\"/></method>\n"
+    "    <method name=\"holdOutbox\"><arg name=\"request\" type=\"a{sv}\" direction=\"in\"/>"
+    "<arg name=\"done\" type=\"a{sv}\" direction=\"out\"/></method>\n"
+    "    <method name=\"readOutbox\"><arg name=\"request\" type=\"a{sv}\" direction=\"in\"/>"
+    "<arg name=\"posts\" type=\"a{sv}\" direction=\"out\"/></method>\n"
+    "    <method name=\"removeFromOutbox\"><arg name=\"request\" type=\"a{sv}\" direction=\"in\"/>"
+    "<arg name=\"done\" type=\"a{sv}\" direction=\"out\"/></method>\n"
+    "    <method name=\"applyConsent\"><arg name=\"done\" type=\"a{sv}\" direction=\"out\"/></method>\n"
     "  </interface>\n";
 
 // The client's object. Its method has no answer.

@@ -65,6 +65,9 @@ class ReportingdSession final : public ClientSessionInterface,
   /// Called on the connection's thread.
   void waitForPosts() { _client.posts->waitUntilWritten(); }
 
+  /// Ends the connection; the client may start anew.
+  void end() { _connection->invalidate(); }
+
   // --- Identity
   /// The session's number, chosen by the client; 0 until configured.
   std::uint32_t sessionID() const;

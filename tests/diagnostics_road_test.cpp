@@ -2,45 +2,14 @@
 // not.
 #include <gtest/gtest.h>
 
-#include "tests/support/DaemonHarness.h"
+#include "tests/support/OperatorTest.h"
 
 namespace vesk::test {
 namespace {
 
-class DiagnosticsRoad : public testing::Test {
- protected:
-  struct Told {
-    int status;
-    std::string text;
-  };
-  Told ask(std::vector<std::string> arguments) {
-    arguments.insert(arguments.begin() + 1, {"--root", harness.root.path().string()});
-    arguments.insert(arguments.begin(), VESK_BIN_DIRECTORY "/veskreport");
-    ChildProcess tool(std::move(arguments));
-    const int status = tool.wait().value_or(-1);
-    return {status, tool.output() + tool.errors()};
-  }
-  RoadClient session(const char* name) {
-    return RoadClient(harness, Dictionary{{kVeskReportingSessionInfoRequireUserInfo, true}},
-                      Dictionary{{kVeskReportingUserInfoClientName, name}});
-  }
-  void start(const std::string& bag) {
-    harness.writeStorebag("zelko",
-                          "version = \"7\"\n[[release.httpPost.clients]]\nclient = \"Camera\"\n" + bag);
-    harness.startDaemon();
-  }
-  static bool contains(const std::string& text, const std::string& part) {
-    return text.find(part) != text.npos;
-  }
+using Diagnostics = OperatorTest;
 
-  DaemonHarness harness;
-};
-
-constexpr char kReports[] =
-    "locale_whitelist = [\"US\"]\nsampling_threshold = 1.0\npost_url = \"@EVENTS@\"\n"
-    "[[release.httpPost.clients.filters]]\nkey = \"x\"\naction = \"remove\"\n";
-
-TEST_F(DiagnosticsRoad, StatusTellsWhatIsReportedAndWhatIsWrong) {
+TEST_F(Diagnostics, StatusTellsWhatIsReportedAndWhatIsWrong) {
   EXPECT_EQ(ask({"status"}).status, 1);
   EXPECT_TRUE(contains(ask({"status"}).text, "is veskreportingd running?"));
   start(kReports);
@@ -67,7 +36,7 @@ TEST_F(DiagnosticsRoad, StatusTellsWhatIsReportedAndWhatIsWrong) {
   EXPECT_TRUE(contains(told.text, "posts wait for https://")) << told.text;
 }
 
-TEST_F(DiagnosticsRoad, ExplainGivesTheReasonThatTheDaemonActsUpon) {
+TEST_F(Diagnostics, ExplainGivesTheReasonThatTheDaemonActsUpon) {
   const struct {
     const char* bag;
     const char* name;
@@ -107,7 +76,7 @@ TEST_F(DiagnosticsRoad, ExplainGivesTheReasonThatTheDaemonActsUpon) {
   }
 }
 
-TEST_F(DiagnosticsRoad, SendTellsWhatBecameOfTheMessage) {
+TEST_F(Diagnostics, SendTellsWhatBecameOfTheMessage) {
   start(kReports + std::string("[release.dashboard]\nip = \"127.0.0.1\"\nport = @UDPPORT@\nreliable = 50\n"));
   const std::vector<std::string> camera{"send", "--client-type", "5", "-c", "3", "-t", "1", "--client-name"};
   const auto send = [&](const std::string& name, std::vector<std::string> more = {}) {
@@ -138,7 +107,7 @@ TEST_F(DiagnosticsRoad, SendTellsWhatBecameOfTheMessage) {
   EXPECT_TRUE(contains(send("Camera", {"--no-wait"}).text, "httpPost: deferred: ")) << "after some seconds";
 }
 
-TEST_F(DiagnosticsRoad, SendFailsIfAllIsDropped) {
+TEST_F(Diagnostics, SendFailsIfAllIsDropped) {
   start(kReports);
   auto told = ask({"send", "--client-type", "5", "-c", "3", "-t", "1", "--client-name", "Nobody"});
   EXPECT_EQ(told.status, 1);
@@ -149,7 +118,7 @@ TEST_F(DiagnosticsRoad, SendFailsIfAllIsDropped) {
             "{\"status\":\"done\",\"backends\":[]}\n");
 }
 
-TEST_F(DiagnosticsRoad, TapShowsWhatLeavesTheDevice) {
+TEST_F(Diagnostics, TapShowsWhatLeavesTheDevice) {
   start(kReports);
   ChildProcess tap({VESK_BIN_DIRECTORY "/veskreport", "tap", "--root", harness.root.path().string(),
                     "--client-name", "Camera", "--bodies", "--count", "6"});

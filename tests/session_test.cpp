@@ -123,8 +123,9 @@ TEST_F(Session, OperatorsSeeTheirOwnOrAll) {
   const auto connection = std::make_shared<RecordingConnection>();
   harness.agent->shouldAcceptNewConnection(connection);
   harness.agent->sessions().front()->setSessionInfo(identified(5), std::nullopt, {}, false);
+  const CounterHistory history("", harness.services.counters);
   const Diagnostics diagnostics(
-      {*harness.agent, harness.services, nullptr, {}, [] { return PublicKeys{"k"}; }});
+      {*harness.agent, harness.services, nullptr, {}, [] { return PublicKeys{"k"}; }, history});
   const auto seen = [&](uid_t user) { return diagnostics.status({user}).find("sessions")->list()->size(); };
   EXPECT_EQ(seen(0), 1u);
   EXPECT_EQ(seen(static_cast<uid_t>(-1)), 1u) << "the session's own user";

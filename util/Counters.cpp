@@ -59,6 +59,8 @@ std::string_view nameOfDropReason(DropReason reason) noexcept {
       return "damaged";
     case DropReason::NotWritten:
       return "not-written";
+    case DropReason::Exported:
+      return "exported";
   }
   return "unknown";
 }

@@ -39,13 +39,15 @@ enum class DropReason : std::uint8_t {
   ConsentWithdrawn,  ///< the user withdrew consent
   Damaged,           ///< its record could not be read
   NotWritten,        ///< it was not on disk when the daemon ended
+  Exported,          ///< not lost: an operator took it away
                      // kDropReasonCount depends on the last reason.
 };
-inline constexpr std::size_t kDropReasonCount = static_cast<std::size_t>(DropReason::NotWritten) + 1;
+inline constexpr std::size_t kDropReasonCount = static_cast<std::size_t>(DropReason::Exported) + 1;
 
 /// False for those that only tell of a delay.
 constexpr bool isLoss(DropReason reason) {
-  return reason != DropReason::Deferred && reason != DropReason::DeliveredLate;
+  return reason != DropReason::Deferred && reason != DropReason::DeliveredLate &&
+         reason != DropReason::Exported;
 }
 
 /// A name for tools and logs, such as "state-disabled".

@@ -3,6 +3,7 @@
 #include "backends/https/EventRecord.h"
 #include "backends/https/PolicyLog.h"
 #include "backends/https/PostExplanation.h"
+#include "platform/http/HTTPExchange.h"
 #include "platform/log/SystemLog.h"
 #include "storebag/Settings.h"
 #include "storebag/StorebagProfile.h"
@@ -308,6 +309,10 @@ void HTTPSPostBackend::postJSONMessage(Post post, std::string json, std::size_t 
     _outcomes->count("post", DropReason::NoURL, eventCount, [&post] { return post.messages; });
     return;
   }
+  if (post.respectsConsent && *_services.consentWithdrawn) {
+    _outcomes->count("post", DropReason::ConsentWithdrawn, eventCount, [&post] { return post.messages; });
+    return;
+  }
   std::unique_ptr<Shown> shown;
   if (_outcomes->isWatched()) {
     MutableDictionary facts(post.messages, 3);
@@ -316,6 +321,7 @@ void HTTPSPostBackend::postJSONMessage(Post post, std::string json, std::size_t 
     facts.set("bytes", json.size());
     shown = std::make_unique<Shown>(Shown{facts.share(), json});
   }
+  std::string host(hostOfURL(*post.url));
   auto request =
       postRequest(std::move(*post.url), std::move(post.headers), std::move(json), _identity._client);
   request.source = _name;
@@ -323,11 +329,13 @@ void HTTPSPostBackend::postJSONMessage(Post post, std::string json, std::size_t 
   request.respectsConsent = post.respectsConsent;
   // The completion keeps the backend alive. At a session's end it may hold the last reference.
   auto self = std::static_pointer_cast<HTTPSPostBackend>(shared_from_this());
-  _services.http.start(
-      std::move(request),
-      [self, eventCount, shown = std::shared_ptr<Shown>(std::move(shown))](const HTTPResult& result) {
-        self->postCompleted(result, eventCount, shown.get());
-      });
+  _services.http.start(std::move(request),
+                       [self, eventCount, host = std::move(host),
+                        shown = std::shared_ptr<Shown>(std::move(shown))](const HTTPResult& result) {
+                         if (result.response && result.response->status / 100 == 2)
+                           self->_services.acceptedPosts->note(host);
+                         self->postCompleted(result, eventCount, shown.get());
+                       });
 }
 
 void HTTPSPostBackend::showPost(const char* outcome, const HTTPResult& result, const Shown* shown) const {

@@ -3,11 +3,14 @@
 #include <poll.h>
 #include <pthread.h>
 #include <signal.h>
+#include <unistd.h>
 
 #include <algorithm>
+#include <future>
 #include <limits>
 #include <utility>
 
+#include "platform/files/PrivateFile.h"
 #include "platform/http/HTTPExchange.h"
 #include "platform/log/SystemLog.h"
 #include "platform/outbox/RetryAfter.h"
@@ -27,6 +30,8 @@ PostOutbox::Outcome outcomeOf(long status) {
   return status >= 200 && status <= 299 ? PostOutbox::Outcome::Delivered : PostOutbox::Outcome::Refused;
 }
 
+std::string holdFile(const std::string& path) { return path + ".hold"; }
+
 OutboxStore::Losses removeRespectingConsent(std::vector<WaitingPost>& posts) {
   OutboxStore::Losses removed;
   std::erase_if(posts, [&removed](const WaitingPost& post) {
@@ -41,6 +46,7 @@ OutboxStore::Losses removeRespectingConsent(std::vector<WaitingPost>& posts) {
 
 PostOutbox::PostOutbox(Options options)
     : _options(std::move(options)),
+      _isHeld(::access(holdFile(_options.path).c_str(), F_OK) == 0),
       _storage(_options.path, {_options.maximumBytes, _options.maximumBytesInMemory}),
       _random(std::random_device{}()) {
   _lastID = _storage.lastID();
@@ -159,7 +165,74 @@ PostOutbox::Ticket PostOutbox::put(HTTPRequest post, std::chrono::seconds delay,
   return static_cast<Ticket>(id);
 }
 
+// --- For operators
+
+void PostOutbox::runOnThread(const std::function<void()>& task) {
+  std::promise<void> ended;
+  {
+    MutexLock lock(_mutex);
+    if (_isStopped || !_thread.joinable()) return;
+    _inbox.tasks.emplace_back([&task, &ended] {
+      task();
+      ended.set_value();
+    });
+  }
+  _wakeup.signal();
+  ended.get_future().wait();
+}
+
+Result<void> PostOutbox::setHeld(bool held) {
+  const std::string file = holdFile(_options.path);
+  if (held) {
+    const auto made = makePrivateFile(file);
+    if (!made && made.error().kind != Error::Kind::Exists) return made.error();
+  } else if (::unlink(file.c_str()) != 0 && errno != ENOENT) {
+    return systemError(errno, file);
+  }
+  _isHeld = held;
+  runOnThread([this] {
+    for (auto& [name, host] : _hosts) readAgainFromTheOldest(host);
+  });
+  return {};
+}
+
+void PostOutbox::withdrawConsent() {
+  setConsent(false);
+  runOnThread([this] { write(); });
+}
+
+std::vector<WaitingPost> PostOutbox::waiting(std::string_view host, std::int64_t id) {
+  std::vector<WaitingPost> posts;
+  runOnThread([&] { posts = readWaiting(host, id); });
+  return posts;
+}
+
+void PostOutbox::removeExported(std::string_view host, std::int64_t last) {
+  runOnThread([&] {
+    for (const auto& post : readWaiting(host, 0)) {
+      if (post.id > last) continue;
+      _changes.removed.push_back(post.id);
+      _options.onFate({Outcome::Exported, post.request.source, post.request.events});
+    }
+    write();
+  });
+}
+
 // --- The outbox's thread
+
+std::vector<WaitingPost> PostOutbox::readWaiting(std::string_view host, std::int64_t id) {
+  constexpr WallTime kAnyTime = WallTime::max() - std::chrono::hours(1);
+  if (_changes.size() > 0) write();
+  OutboxStorage::Lost lost;
+  std::vector<WaitingPost> idle;
+  auto posts = _storage.read(host, id, kAnyTime, lost);
+  report(lost);
+  MutexLock lock(_mutex);
+  for (auto& post : posts) {
+    if (!_beingSent.contains(post.id) && !_taken.contains(post.id)) idle.push_back(std::move(post));
+  }
+  return idle;
+}
 
 void PostOutbox::run() {
   sigset_t all;
@@ -178,7 +251,9 @@ void PostOutbox::run() {
       taken = static_cast<Ticket>(_lastID);
       stopping = _isStopped;
     }
+    const auto tasks = std::move(inbox.tasks);
     take(std::move(inbox));
+    for (const auto& task : tasks) task();
     if (stopping) _storage.tryFileAgain();
     if (stopping || (_writeBy && *_writeBy <= std::chrono::steady_clock::now())) write();
     if (_changes.added.empty()) tellWritten(taken);
@@ -213,6 +288,7 @@ PostOutbox::Status PostOutbox::status() {
   MutexLock lock(_mutex);
   Status status = _status;
   status.maximumBytes = _options.maximumBytes;
+  status.isHeld = _isHeld;
   return status;
 }
 
@@ -248,7 +324,7 @@ std::optional<PostOutbox::Instant> PostOutbox::nextEvent() const {
   if (!_storage.isEmpty()) consider(_nextExpiry);
   for (const auto& [name, host] : _hosts) {
     // Otherwise the answers wake the thread.
-    if (_mustSend && host.sending == 0)
+    if (_mustSend && !_isHeld && host.sending == 0)
       consider(std::max(host.backoff.next(), host.ready.empty() ? host.readAgain : Instant{}));
   }
   return next;
@@ -373,7 +449,7 @@ void PostOutbox::sendReady() {
   _mustSend = hasPostsToSend();
   for (auto each = _hosts.begin(); each != _hosts.end();) {
     auto& [name, host] = *each;
-    if (_mustSend) sendReady(name, host);
+    if (_mustSend && !_isHeld) sendReady(name, host);
     const bool isDone =
         host.sending == 0 && host.ready.empty() && _changes.added.empty() && !_storage.has(name);
     each = isDone ? _hosts.erase(each) : std::next(each);

@@ -22,6 +22,7 @@
 #include "platform/net/NetworkMonitor.h"
 #include "platform/outbox/HostBackoff.h"
 #include "platform/outbox/OutboxStorage.h"
+#include "platform/result/Result.h"
 #include "platform/sync/Mutex.h"
 #include "platform/sync/Wakeup.h"
 #include "platform/time/Clock.h"
@@ -45,6 +46,7 @@ class PostOutbox final : public PostKeeper {
     ConsentWithdrawn,  ///< the user withdrew consent
     Damaged,           ///< its record could not be read
     NotWritten,        ///< it could not be written before the process ended
+    Exported,          ///< an operator took it away
   };
   struct Fate {
     Outcome outcome;
@@ -94,8 +96,22 @@ class PostOutbox final : public PostKeeper {
     std::uint64_t posts = 0;
     std::uint64_t bytes = 0;
     std::uint64_t maximumBytes = 0;
+    bool isHeld = false;
   };
   Status status();
+
+  // For operators. These wait for the outbox's thread, so they may wait for the disk.
+
+  /// While it is held, nothing that waits is sent; new posts are still tried once. A file beside the outbox's
+  /// keeps that over restarts.
+  Result<void> setHeld(bool held);
+  /// Deletes the posts that respect consent, and keeps no more of them until `setConsent(true)`.
+  void withdrawConsent();
+  /// Some of the posts for `host` after `id`, oldest first. None of them is being sent; hold the outbox so
+  /// that it stays so.
+  std::vector<WaitingPost> waiting(std::string_view host, std::int64_t id);
+  /// Removes those of them up to `last`.
+  void removeExported(std::string_view host, std::int64_t last);
 
   bool keep(HTTPRequest post, std::chrono::seconds delay) override;
   Ticket keepCopy(const HTTPRequest& post) override;
@@ -129,11 +145,15 @@ class PostOutbox final : public PostKeeper {
     std::vector<Answer> answers;
     std::set<std::string, std::less<>> hosts;  ///< those that answered
     bool consentWithdrawn = false;
+    std::vector<std::function<void()>> tasks;
   };
 
   // Called on any thread.
   Ticket put(HTTPRequest post, std::chrono::seconds delay, bool isBeingSent);
   WallTime after(std::chrono::seconds delay) const { return _options.clock->now() + delay; }
+  /// Runs the task on the outbox's thread and waits for it. If nothing waits, there is no thread and no task
+  /// to run.
+  void runOnThread(const std::function<void()>& task);
 
   // Called on the outbox's thread only.
   void run();
@@ -145,6 +165,7 @@ class PostOutbox final : public PostKeeper {
   void write();
   void expire();
   void deletePostsThatRespectConsent();
+  std::vector<WaitingPost> readWaiting(std::string_view host, std::int64_t id);
   bool hasPostsToSend();
   void sendReady();
   void sendReady(const std::string& name, Host& host);
@@ -175,6 +196,7 @@ class PostOutbox final : public PostKeeper {
   std::thread _thread VESK_GUARDED_BY(_mutex);  ///< started when the first post is kept
 
   std::atomic<bool> _isWaiting{false};  ///< a post is kept
+  std::atomic<bool> _isHeld;
   std::atomic<Ticket> _writtenUpTo{0};
   std::condition_variable_any _written;  ///< `_writtenUpTo` grew; used with _mutex
 

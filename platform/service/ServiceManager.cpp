@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cstdint>
+#include <cstdlib>
 
 #include "platform/log/SystemLog.h"
 
@@ -36,6 +37,12 @@ ServiceManager::ServiceManager() : _watchdogInterval(askedInterval()) {
 }
 
 void ServiceManager::notifyReady() const noexcept { sd_notify(0, "READY=1"); }
+
+bool ServiceManager::isPresent() noexcept { return std::getenv("NOTIFY_SOCKET") != nullptr; }
+
+void ServiceManager::notifyStatus(const std::string& line) const noexcept {
+  sd_notify(0, ("STATUS=" + line).c_str());
+}
 
 void ServiceManager::notifyStopping() const noexcept { sd_notify(0, "STOPPING=1"); }
 

@@ -3,6 +3,7 @@
 
 #include <chrono>
 #include <optional>
+#include <string>
 #include <utility>
 
 #include "platform/files/FileDescriptor.h"
@@ -24,7 +25,12 @@ class ServiceManager {
   /// The inherited listening socket; empty if there was none or it has been taken.
   FileDescriptor takeListeningSocket() noexcept { return std::move(_socket); }
 
+  /// Whether there is one.
+  static bool isPresent() noexcept;
+
   void notifyReady() const noexcept;
+  /// Shows one line to whoever asks the manager about the service.
+  void notifyStatus(const std::string& line) const noexcept;
   void notifyStopping() const noexcept;
 
   /// The interval between pings; nullopt without a watchdog.

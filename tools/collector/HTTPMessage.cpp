@@ -1,43 +1,13 @@
 #include "tools/collector/HTTPMessage.h"
 
-#include <zlib.h>
-
-#include <array>
 #include <boost/beast/http/status.hpp>
-#include <memory>
 
 #include "platform/text/ASCII.h"
+#include "tools/files/Gunzip.h"
 
 namespace vesk {
 
 namespace beast = boost::beast;
-
-namespace {
-
-/// Unpacks a single gzip member, which must span all of `compressed`.
-HTTPReceived::Decoded gunzipped(std::string_view compressed, std::size_t limit) {
-  constexpr int kGzipOnly = 16 + MAX_WBITS;
-  z_stream stream{};
-  if (::inflateInit2(&stream, kGzipOnly) != Z_OK) return {std::nullopt, "the gzip decoder can't be started"};
-  const std::unique_ptr<z_stream, decltype(&::inflateEnd)> ending(&stream, &::inflateEnd);
-  stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(compressed.data()));  // zlib only reads it
-  stream.avail_in = static_cast<uInt>(compressed.size());
-  std::string out;
-  std::array<char, 65536> piece;
-  for (int result = Z_OK; result != Z_STREAM_END;) {
-    stream.next_out = reinterpret_cast<Bytef*>(piece.data());
-    stream.avail_out = piece.size();
-    result = ::inflate(&stream, Z_NO_FLUSH);
-    out.append(piece.data(), piece.size() - stream.avail_out);
-    if (out.size() > limit)
-      return {std::nullopt, "the body unpacks to more than " + std::to_string(limit) + " bytes"};
-    if (result != Z_OK && result != Z_STREAM_END) return {std::nullopt, "the body is no whole gzip stream"};
-  }
-  if (stream.avail_in != 0) return {std::nullopt, "bytes follow the gzip stream of the body"};
-  return {std::move(out), {}};
-}
-
-}  // namespace
 
 std::optional<std::string_view> findHeader(const HTTPHeaderList& headers, std::string_view name) {
   for (const auto& [key, value] : headers)
@@ -70,7 +40,9 @@ HTTPReceived::Decoded HTTPReceived::decodedBody(std::size_t limit) const {
   }
   if (!equalsIgnoringASCIICase(*encoding, "gzip"))
     return {std::nullopt, "Content-Encoding is neither gzip nor absent: " + std::string(*encoding)};
-  return gunzipped(body, limit);
+  auto unpacked = gunzipped(body, limit);
+  if (!unpacked) return {std::nullopt, unpacked.error().text};
+  return {*std::move(unpacked), {}};
 }
 
 HTTPAnswer HTTPAnswer::text(unsigned status, std::string_view line) {

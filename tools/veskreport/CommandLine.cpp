@@ -141,9 +141,34 @@ class Reader {
         ->required();
     addUserInfo(*explain);
     addTap();
+    addConnected("drops", "Show what was lost or delayed, and why", runDrops);
+    addConnected("reload", "Make the daemon read its settings: it ends in order and is started anew",
+                 runReload);
+    CLI::App* outbox =
+        addConnected("outbox", "Show what waits to be sent, or hold, release or export it", runOutbox);
+    outbox->require_subcommand(0, 1);
+    addAction(*outbox, "show", "Show what waits");
+    addAction(*outbox, "hold", "Send nothing of it, for example over a metered link");
+    addAction(*outbox, "release", "Send it again");
+    addAction(*outbox, "export", "Append it to a file as JSON lines, and remove it once written")
+        ->add_option("file", _invocation.output, "The file")
+        ->required();
+    CLI::App* consent =
+        addConnected("consent", "Show, grant or withdraw the user's consent to diagnostics", runConsent);
+    consent->require_subcommand(0, 1);
+    addAction(*consent, "show", "Show it");
+    addAction(*consent, "grant", "Store it, and let sessions start anew with it");
+    addAction(*consent, "withdraw", "Store it, delete what waits because of it, and make new identifiers");
     explain->add_option("--draw", _invocation.draw, "The session's draw for sampling, from 0 to 1")
         ->check(CLI::Range(0.0, 1.0))
         ->capture_default_str();
+  }
+
+  CLI::App* addAction(CLI::App& command, const char* name, const char* description) {
+    CLI::App* action = command.add_subcommand(name, description);
+    action->callback([this, name] { _invocation.action = name; });
+    action->fallthrough();
+    return action;
   }
 
   void addTap() {

@@ -43,7 +43,8 @@ struct Invocation {
   std::string since;                 ///< a time, or an age such as "90m"; empty: from the beginning
 
   bool openMetrics = false;
-  double draw = 0;  ///< a session's, for sampling
+  std::string action = "show";  ///< with the outbox or the consent
+  double draw = 0;              ///< a session's, for sampling
   /// What to show of what becomes of messages.
   struct Tap {
     std::optional<int> clientType;
@@ -87,6 +88,14 @@ int runPowerLog(const Invocation& invocation, const Output& output);
 int runStatus(const Invocation& invocation, const Output& output);
 /// Shows what the daemon would do with a client's messages, and why.
 int runExplain(const Invocation& invocation, const Output& output);
+/// Shows what was lost or delayed.
+int runDrops(const Invocation& invocation, const Output& output);
+/// Makes the daemon end, so that it is started anew.
+int runReload(const Invocation& invocation, const Output& output);
+/// Shows, holds, releases or exports what waits.
+int runOutbox(const Invocation& invocation, const Output& output);
+/// Shows, grants or withdraws the user's consent.
+int runConsent(const Invocation& invocation, const Output& output);
 /// Shows what becomes of messages, while it happens, until the daemon ends.
 int runTap(const Invocation& invocation, const Output& output);
 

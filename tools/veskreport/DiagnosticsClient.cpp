@@ -4,6 +4,7 @@
 
 #include <poll.h>
 
+#include <cmath>
 #include <cstring>
 #include <system_error>
 
@@ -84,6 +85,18 @@ std::vector<Dictionary> listIn(const Dictionary& from, const char* key) {
     if (const Dictionary* each = (*list)[i].dictionary()) all.push_back(*each);
   }
   return all;
+}
+
+std::string durationIn(const Dictionary& from, const char* key) {
+  const Value* seconds = from.find(key);
+  const double all = seconds ? std::max(0.0, seconds->asDouble().value_or(0)) : 0;
+  const auto whole = [](double number, const char* unit) {
+    return std::to_string(std::llround(number)) + unit;
+  };
+  if (all < 120) return whole(all, " s");
+  if (all < 7200) return whole(all / 60, " min");
+  if (all < 172'800) return whole(all / 3600, " h");
+  return whole(all / 86'400, " d");
 }
 
 }  // namespace vesk

@@ -39,5 +39,7 @@ Dictionary explanationRequest(const Invocation& invocation, const Output& output
 std::string textIn(const Dictionary& from, const char* key);
 Dictionary dictionaryIn(const Dictionary& from, const char* key);
 std::vector<Dictionary> listIn(const Dictionary& from, const char* key);
+/// A number of seconds as "45 s", "12 min", "3 h" or "2 d".
+std::string durationIn(const Dictionary& from, const char* key);
 
 }  // namespace vesk

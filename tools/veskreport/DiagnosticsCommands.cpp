@@ -1,4 +1,3 @@
-#include <cmath>
 #include <cstdio>
 
 #include "protocol/WireNames.h"
@@ -10,21 +9,20 @@ namespace vesk {
 
 namespace {
 
-/// "45 s", "12 min", "3 h" or "2 d".
-std::string duration(const Value* seconds) {
-  const double all = seconds ? std::max(0.0, seconds->asDouble().value_or(0)) : 0;
-  const auto whole = [](double number, const char* unit) {
-    return std::to_string(std::llround(number)) + unit;
-  };
-  if (all < 120) return whole(all, " s");
-  if (all < 7200) return whole(all / 60, " min");
-  if (all < 172'800) return whole(all / 3600, " h");
-  return whole(all / 86'400, " d");
+/// What was lost or delayed, by backend and reason.
+std::vector<std::string> dropLines(const Dictionary& status, const char* key, const char* since) {
+  std::vector<std::string> lines;
+  for (const auto& counter : listIn(status, key)) {
+    lines.push_back(std::string(booleanForKey(counter, "lost").value_or(true) ? "lost" : "delayed") + since +
+                    textIn(counter, "count") + " " + textIn(counter, "backend") + " " +
+                    textIn(counter, "reason"));
+  }
+  return lines;
 }
 
 std::vector<std::string> statusLines(const Dictionary& status) {
   std::vector<std::string> lines{"veskreportingd " + textIn(status, "version") + ": " +
-                                 textIn(status, "health") + ", up " + duration(status.find("uptime")) +
+                                 textIn(status, "health") + ", up " + durationIn(status, "uptime") +
                                  ", environment " + textIn(status, "environment")};
   if (const Value* reasons = status.find("reasons"); reasons && reasons->list()) {
     for (const Value& each : *reasons->list())
@@ -32,8 +30,8 @@ std::vector<std::string> statusLines(const Dictionary& status) {
   }
   for (const auto& bag : listIn(status, "storebags")) {
     lines.push_back("storebag " + textIn(bag, "name") + ": " + textIn(bag, "state") + ", version " +
-                    textIn(bag, "version") + ", fetched " + duration(bag.find("age")) + " ago, good for " +
-                    duration(bag.find("maxAge")));
+                    textIn(bag, "version") + ", fetched " + durationIn(bag, "age") + " ago, good for " +
+                    durationIn(bag, "maxAge"));
   }
   for (const auto& session : listIn(status, "sessions")) {
     std::string line =
@@ -52,13 +50,13 @@ std::vector<std::string> statusLines(const Dictionary& status) {
   }
   for (const auto& host : listIn(dictionaryIn(status, "outbox"), "hosts")) {
     lines.push_back("outbox: " + textIn(host, "posts") + " posts for " + textIn(host, "host") +
-                    ", next attempt in " + duration(host.find("nextAttempt")));
+                    ", next attempt in " + durationIn(host, "nextAttempt"));
   }
-  for (const auto& counter : listIn(status, "counters")) {
-    lines.push_back(std::string(booleanForKey(counter, "lost").value_or(true) ? "lost" : "delayed") +
-                    " since the start: " + textIn(counter, "count") + " " + textIn(counter, "backend") + " " +
-                    textIn(counter, "reason"));
+  for (const auto& [host, age] : dictionaryIn(status, "lastPosts")) {
+    lines.push_back("last post accepted by " + printable(host.view()) + " " +
+                    durationIn(dictionaryIn(status, "lastPosts"), host.string().c_str()) + " ago");
   }
+  for (const auto& line : dropLines(status, "counters", " since the start: ")) lines.push_back(line);
   return lines;
 }
 
@@ -74,7 +72,7 @@ std::string openMetrics(const Dictionary& status) {
                      number(textIn(outbox, "posts")) +
                      "\n# TYPE veskreporting_outbox_bytes gauge\nveskreporting_outbox_bytes " +
                      number(textIn(outbox, "bytes")) + "\n# TYPE veskreporting_events counter\n";
-  for (const auto& counter : listIn(status, "counters")) {
+  for (const auto& counter : listIn(status, "total")) {
     text += "veskreporting_events_total{backend=\"" + textIn(counter, "backend") + "\",outcome=\"" +
             textIn(counter, "reason") + "\"} " + textIn(counter, "count") + "\n";
   }
@@ -115,6 +113,22 @@ int runStatus(const Invocation& invocation, const Output& output) {
   const int written =
       invocation.openMetrics ? output.raw(openMetrics(status)) : output.done(statusLines(status), status);
   return written == kExitDone && textIn(status, "health") == "ok" ? kExitDone : kExitFailed;
+}
+
+int runDrops(const Invocation& invocation, const Output& output) {
+  DiagnosticsClient daemon(invocation, output);
+  const auto status = daemon.ask(wire::kGetStatus);
+  auto lines = dropLines(status, "counters", " since the start: ");
+  for (const auto& line : dropLines(status, "total", " since the installation: ")) lines.push_back(line);
+  if (lines.empty()) lines.emplace_back("nothing was lost or delayed");
+  const Value *counters = status.find("counters"), *total = status.find("total");
+  return output.done(lines, {{"sinceStart", counters ? *counters : Value()},
+                             {"sinceInstallation", total ? *total : Value()}});
+}
+
+int runReload(const Invocation& invocation, const Output& output) {
+  DiagnosticsClient(invocation, output).ask(wire::kReload);
+  return output.done("the daemon ends, to be started anew", {});
 }
 
 int runExplain(const Invocation& invocation, const Output& output) {
