@@ -12,6 +12,7 @@
 #include "backends/dashboard/DashboardLinger.h"
 #include "backends/https/AcceptedPosts.h"
 #include "backends/https/RefusedPosts.h"
+#include "backends/https/UnlistedClients.h"
 #include "backends/upload/UploadGate.h"
 #include "platform/http/HTTPClient.h"
 #include "platform/queue/TimedQueue.h"
@@ -53,6 +54,8 @@ struct BackendServices {
   std::shared_ptr<std::atomic<bool>> consentWithdrawn = std::make_shared<std::atomic<bool>>(false);
   /// When servers accepted posts.
   std::shared_ptr<AcceptedPosts> acceptedPosts = std::make_shared<AcceptedPosts>();
+  /// Logs clients that storebags do not list.
+  std::shared_ptr<UnlistedClients> unlistedClients = std::make_shared<UnlistedClients>();
   /// Logs refused posts.
   std::shared_ptr<RefusedPosts> refusedPosts = std::make_shared<RefusedPosts>();
 };

@@ -13,6 +13,7 @@
 #include "common/Resources.h"
 #include "daemon/DiagnosticsObject.h"
 #include "daemon/ReportingdAgent.h"
+#include "daemon/SetupProblems.h"
 #include "platform/device/DeviceInformation.h"
 #include "platform/files/RootPrefix.h"
 #include "platform/http/HTTPClient.h"
@@ -262,11 +263,14 @@ struct Daemon::Parts {
   }
 
   StorebagFetcher storebagFetcher() {
-    return [this, library = LibraryFacts{sessionServices.libraryVersion, publicKeysDER, &acceptance}](
-               std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version,
-               bool& notModified, std::optional<std::string>& lastModified) {
-      return fetchStorebagForEnvironmentAndClientType(http, library, clientType, maxAge, version, notModified,
-                                                      &lastModified, keptStorebags.get());
+    return [this](std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version,
+                  bool& notModified, std::optional<std::string>& lastModified) {
+      long status = 0;
+      const LibraryFacts library{sessionServices.libraryVersion, publicKeysDER, &acceptance, &status};
+      auto section = fetchStorebagForEnvironmentAndClientType(
+          http, library, clientType, maxAge, version, notModified, &lastModified, keptStorebags.get());
+      if (!section && !notModified) fetchProblems.note({clientType, status, !publicKeysDER().empty()});
+      return section;
     };
   }
 
@@ -285,6 +289,7 @@ struct Daemon::Parts {
   // Declared before the client: posts that complete while the client ends still use the services.
   BackendServices backendServices;
   SessionServices sessionServices;
+  FetchProblems fetchProblems;  // used with the agent's monitor held
   StorebagAcceptance acceptance{WallClock::system(), kernelClockIsSet};
   std::unique_ptr<const KeptStorebags> keptStorebags;  // null: storebags are kept in memory only
   const OutboxMode mode;
@@ -301,6 +306,7 @@ struct Daemon::Parts {
 
 Daemon::Daemon(ServiceManager& serviceManager, BusyMarker& busyMarker, std::function<void()> reload)
     : _parts(std::make_unique<Parts>(serviceManager, busyMarker, std::move(reload))) {
+  warnOfUnknownSettings();
   SystemLog::setRateLimit(preferenceNumberForKey("logRateLimit", 0).value_or(kLogRateLimit));
 }
 

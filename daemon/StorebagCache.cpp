@@ -7,7 +7,11 @@ namespace vesk {
 
 std::optional<Dictionary> StorebagCache::storebagForClientType(std::int32_t clientType) {
   auto name = storebagNameForClientType(clientType);
-  if (!name) return std::nullopt;
+  if (!name) {
+    if (_unknownTypes.begins())
+      VESK_LOG_WARNING("storebagForSession: no storebag is for client type %d", clientType);
+    return std::nullopt;
+  }
   auto record = _records.find(std::string(*name));
   if (record == _records.end()) {
     if (auto kept = keptRecord(clientType)) {

@@ -11,6 +11,7 @@
 #include <vector>
 
 #include <VeskReporting/values/Value.h>
+#include "platform/ipc/WarningBurst.h"
 #include "platform/sync/Mutex.h"
 #include "platform/time/Clock.h"
 #include "storebag/StorebagFetch.h"
@@ -99,6 +100,7 @@ class StorebagCache {
   const std::optional<KeptStorebagSource> _kept;
   const WallClock& _clock;
   const StorebagExpiry _hasExpired;
+  WarningBurst _unknownTypes;
   std::map<std::string, Record> _records;
 
   mutable Mutex _mutex;  // a leaf

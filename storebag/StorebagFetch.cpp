@@ -140,6 +140,7 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryF
     if (library.acceptance) library.acceptance->usesBuiltIn(name);
     return fallbackStorebag();
   }
+  if (library.status) *library.status = result.response->status;
   maxAge = maxAgeFromCacheControl(listInHeader(*result.response, "Cache-Control"));
   if (hasNotChanged(*result.response, lastModified)) {
     notModified = true;

@@ -22,6 +22,8 @@ struct LibraryFacts {
   std::function<PublicKeys()> publicKeys;
   /// Checks the optional signed keys. Null: they are not checked.
   StorebagAcceptance* acceptance = nullptr;
+  /// If not null, gets the HTTP status of each answer.
+  long* status = nullptr;
 };
 
 /// The maximum age in seconds that a "Cache-Control" header gives a storebag; 86400 if the header is absent

@@ -107,11 +107,34 @@ TEST_F(Diagnostics, SendTellsWhatBecameOfTheMessage) {
   EXPECT_TRUE(contains(send("Camera", {"--no-wait"}).text, "httpPost: deferred: ")) << "after some seconds";
 }
 
+TEST_F(Diagnostics, TheLogTellsWhatAnOperatorHasToMend) {
+  harness.setPreference("keepStorebag", "true");
+  harness.setDeviceFact("Regioncode", "\"US\"");
+  std::filesystem::remove(harness.root / "usr/share/veskreporting/publicKey.der");
+  start(kReports);
+  for (const char* type : {"5", "99", "9"}) {  // of the last, the server has no storebag
+    EXPECT_EQ(ask({"send", "--client-type", type, "-c", "1", "-t", "1", "--client-name", "Camera"}).status,
+              1);
+  }
+  EXPECT_EQ(harness.stopDaemon(), 0);
+  std::string log = harness.daemon().errors();
+  for (const char* line :
+       {"nothing reads the key 'keepStorebag'; is 'keepStorebags' meant?",
+        "nothing reads the key 'Regioncode'; is 'RegionCode' meant?",
+        "<4> storebagForSession: there is no usable public key at ",
+        "<4> storebagForSession: no storebag is for client type 99",
+        "<4> storebagForSession: the storebag server answered with status 404 for client type 9"}) {
+    EXPECT_TRUE(contains(log, line)) << line;
+  }
+}
+
 TEST_F(Diagnostics, SendFailsIfAllIsDropped) {
   start(kReports);
   auto told = ask({"send", "--client-type", "5", "-c", "3", "-t", "1", "--client-name", "Nobody"});
   EXPECT_EQ(told.status, 1);
   EXPECT_EQ(told.text, "veskreport: dropped: httpPost: client 'Nobody' is in no entry (storebag 7)\n");
+  EXPECT_TRUE(harness.daemon().waitForText(
+      "<4> HTTPSPostBackend(updateBackendState): httpPost reports nothing: client 'Nobody' is in no entry"));
   told = ask({"states", "--client-type", "5", "--client-name", "Camera"});
   EXPECT_EQ(told.text, "httpPost\n");
   EXPECT_EQ(ask({"states", "--client-type", "5", "--client-name", "Nobody", "--json"}).text,

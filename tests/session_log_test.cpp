@@ -81,6 +81,7 @@ TEST_F(SessionLog, OfASession) {
 7 setSessionInfo: Configuring session 0
 7 startConfigWithCompletionHandler: Starting configuration for session 0
 7 storebagForSession: Retrieving storebag for session 0 with client type 0
+4 storebagForSession: no storebag is for client type 0
 7 setSessionInfo: Configuring session 4000000000
 7 startConfigWithCompletionHandler: Starting configuration for session 4000000000
 7 storebagForSession: Retrieving storebag for session 4000000000 with client type 5

@@ -98,6 +98,7 @@ std::int32_t HTTPSPostBackend::updateBackendState() {
   const auto* reason = decision.reason();
   _stateReason =
       reason && decision.state != BackendStateEnabled ? std::optional(reasonOf(*reason)) : std::nullopt;
+  if (_stateReason && reason->rule == "clients") _services.unlistedClients->note(_name, *_stateReason);
   _settings = std::move(decision.settings);
   setHierarchy(_settings._hierarchy);
   return decision.state;
