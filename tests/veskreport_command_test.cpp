@@ -235,11 +235,26 @@ TEST_F(VeskreportCommand, WrongUsageIsStatusTwo) {
            {"nonsense --json", "unknown command 'nonsense'"},
            {"uplod-fil", "unknown command 'uplod-fil': did you mean 'upload-file'?"},
            {"storebag sing", "unknown command 'sing': did you mean 'sign'?"},
+           {"states --clint-type 5", "unknown option '--clint-type': did you mean '--client-type'?"},
+           {"send --client-type 5 -c 1 -t 1",
+            "send: --client-name is required, since without user info nothing is reported (or "
+            "--no-require-user-info)"},
            {"\x1b[2J", "unknown command '\\x1b[2J'"}}) {
     auto outcome = run(words(line));
     EXPECT_EQ(outcome.status, 2);
     EXPECT_EQ(outcome.errors, message + kHelp);
   }
+  for (const std::string shell : {"bash", "zsh", "fish"}) {
+    const auto script = run({"completion", shell}).output;
+    for (const char* word : {"storebag", "client-name", "withdraw"})
+      EXPECT_NE(script.find(word), std::string::npos) << shell;
+  }
+  ChildProcess bash(
+      {"/bin/bash", "-c",
+       "eval \"$(" VESK_BIN_DIRECTORY "/veskreport completion bash)\"; "
+       "COMP_WORDS=(veskreport outbox --root x exp) COMP_CWORD=4; _veskreport; echo \"${COMPREPLY[@]}\""});
+  EXPECT_EQ(bash.wait(), 0);
+  EXPECT_EQ(bash.output(), "export\n");
   EXPECT_EQ(run({"--help"}).status, 0);
   EXPECT_EQ(run({"send", "--help"}).status, 0);
   EXPECT_EQ(run({"--version"}).output, "veskreport " VESK_VERSION "\n");

@@ -6,10 +6,11 @@
 #include <cstdlib>
 #include <iterator>
 #include <limits>
-#include <numeric>
 #include <utility>
 
+#include "platform/text/NearestWord.h"
 #include "tools/text/Printable.h"
+#include "tools/veskreport/Completion.h"
 
 namespace vesk {
 
@@ -42,34 +43,16 @@ void unmarkValues(CLI::App& app) {
   for (CLI::App* sub : app.get_subcommands({})) unmarkValues(*sub);
 }
 
-/// The number of letters to insert, delete or replace to turn one into the other.
-std::size_t editDistance(std::string_view a, std::string_view b) {
-  std::vector<std::size_t> row(b.size() + 1);
-  std::iota(row.begin(), row.end(), 0U);
-  for (std::size_t i = 1; i <= a.size(); ++i) {
-    std::size_t diagonal = std::exchange(row[0], i);
-    for (std::size_t j = 1; j <= b.size(); ++j) {
-      const std::size_t replaced = diagonal + (a[i - 1] == b[j - 1] ? 0 : 1);
-      diagonal = std::exchange(row[j], std::min({row[j] + 1, row[j - 1] + 1, replaced}));
-    }
-  }
-  return row.back();
-}
-
 /// Throws if `argument` is not a command of `app` but should be. CLI11 would only say that a command is
 /// required.
 void checkCommand(const CLI::App& app, const std::string& argument) {
-  constexpr std::size_t kSimilar = 2;  // edits
   if (argument.starts_with('-')) return;
-  const CLI::App* nearest = nullptr;
-  std::size_t distance = kSimilar + 1;
-  for (const CLI::App* sub : app.get_subcommands([](auto) { return true; })) {
-    if (sub->get_name() == argument) return;
-    const std::size_t edits = editDistance(argument.substr(0, 80), sub->get_name());
-    if (edits < distance) nearest = sub, distance = edits;
-  }
+  std::vector<std::string> names;
+  for (const CLI::App* sub : app.get_subcommands([](auto) { return true; })) names.push_back(sub->get_name());
+  if (std::find(names.begin(), names.end(), argument) != names.end()) return;
+  const std::string nearest(nearestOf(argument, names));
   std::string message = "unknown command '" + printable(argument) + "'";
-  if (nearest != nullptr) message += ": did you mean '" + nearest->get_name() + "'?";
+  if (!nearest.empty()) message += ": did you mean '" + nearest + "'?";
   throw CLI::ParseError(message, CLI::ExitCodes::ExtrasError);
 }
 
@@ -87,6 +70,7 @@ class Reader {
     addPowerLogCommand();
     addDiagnosticsCommands();
     addStorebagCommands();
+    addCompletion();
     unmarkValues(_app);
   }
 
@@ -96,16 +80,46 @@ class Reader {
     try {
       if (argc > 1) checkCommand(_app, argv[1]);
       if (argc > 2 && argv[1] == kStorebag) checkCommand(*_app.get_subcommand(argv[1]), argv[2]);
-      _app.parse(backwards);
+      parse(std::move(backwards));
     } catch (const CLI::ParseError& error) {
       throw Exit{_app.exit(error) == 0 ? kExitDone : kExitUsage};
     }
+    if (!_invocation.shell.empty()) _invocation.completion = completionScript(_app, _invocation.shell);
     _invocation.timeout = std::chrono::milliseconds(static_cast<long>(_timeout * 1000));
     _invocation.flag = (_realtime ? 1U : 0U) | (_overrideSampling ? 2U : 0U);
     return std::move(_invocation);
   }
 
  private:
+  void parse(std::vector<std::string> backwards) {
+    try {
+      _app.parse(std::move(backwards));
+    } catch (const CLI::ParseError& error) {
+      if (error.get_exit_code() == 0) throw;  // help or version
+      // A misspelt option may be the reason why another one is missing.
+      for (const auto& argument : _app.remaining(true)) {
+        if (!argument.starts_with("--")) continue;
+        throw CLI::ParseError(
+            "unknown option '" + printable(argument) + "'" + meantOption(argument.substr(2)),
+            CLI::ExitCodes::ExtrasError);
+      }
+      throw;
+    }
+  }
+
+  /// A hint at the nearest option of the command that was given.
+  std::string meantOption(const std::string& name) const {
+    std::vector<std::string> names;
+    for (const CLI::App* app = &_app; app != nullptr;) {
+      for (const CLI::Option* option : app->get_options())
+        names.insert(names.end(), option->get_lnames().begin(), option->get_lnames().end());
+      const auto below = app->get_subcommands();
+      app = below.empty() ? nullptr : below.front();
+    }
+    const std::string nearest(nearestOf(name.substr(0, name.find('=')), names));
+    return nearest.empty() ? "" : ": did you mean '--" + nearest + "'?";
+  }
+
   CLI::App* add(CLI::App& parent, const char* name, const char* description, Command* command) {
     CLI::App* sub = parent.add_subcommand(name, description);
     sub->callback([this, command] { _invocation.command = command; });
@@ -140,6 +154,8 @@ class Reader {
     explain->add_option("--client-type", _invocation.clientType, "Client type; selects the storebag")
         ->required();
     addUserInfo(*explain);
+    status->add_flag("--no-color", _invocation.noColor, "Use no colours, even on a terminal");
+    addConnected("top", "Show the status as a live page; q quits", runTop);
     addTap();
     addConnected("drops", "Show what was lost or delayed, and why", runDrops);
     addConnected("reload", "Make the daemon read its settings: it ends in order and is started anew",
@@ -162,6 +178,13 @@ class Reader {
     explain->add_option("--draw", _invocation.draw, "The session's draw for sampling, from 0 to 1")
         ->check(CLI::Range(0.0, 1.0))
         ->capture_default_str();
+  }
+
+  void addCompletion() {
+    CLI::App* completion = add(_app, "completion", "Print a completion script for a shell", runCompletion);
+    completion->add_option("shell", _invocation.shell, "bash, zsh or fish")
+        ->required()
+        ->check(CLI::IsMember({"bash", "zsh", "fish"}));
   }
 
   CLI::App* addAction(CLI::App& command, const char* name, const char* description) {
@@ -308,6 +331,10 @@ class Reader {
 };
 
 }  // namespace
+
+int runCompletion(const Invocation& invocation, const Output& output) {
+  return output.raw(invocation.completion);
+}
 
 Invocation parseCommandLine(int argc, char** argv) { return Reader().read(argc, argv); }
 

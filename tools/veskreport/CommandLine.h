@@ -43,6 +43,9 @@ struct Invocation {
   std::string since;                 ///< a time, or an age such as "90m"; empty: from the beginning
 
   bool openMetrics = false;
+  bool noColor = false;
+  std::string shell;            ///< whose completion script is wanted
+  std::string completion;       ///< that script
   std::string action = "show";  ///< with the outbox or the consent
   double draw = 0;              ///< a session's, for sampling
   /// What to show of what becomes of messages.
@@ -88,6 +91,10 @@ int runPowerLog(const Invocation& invocation, const Output& output);
 int runStatus(const Invocation& invocation, const Output& output);
 /// Shows what the daemon would do with a client's messages, and why.
 int runExplain(const Invocation& invocation, const Output& output);
+/// The status as a live page in the terminal.
+int runTop(const Invocation& invocation, const Output& output);
+/// Prints a completion script.
+int runCompletion(const Invocation& invocation, const Output& output);
 /// Shows what was lost or delayed.
 int runDrops(const Invocation& invocation, const Output& output);
 /// Makes the daemon end, so that it is started anew.

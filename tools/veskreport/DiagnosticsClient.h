@@ -42,4 +42,7 @@ std::vector<Dictionary> listIn(const Dictionary& from, const char* key);
 /// A number of seconds as "45 s", "12 min", "3 h" or "2 d".
 std::string durationIn(const Dictionary& from, const char* key);
 
+/// The daemon's status, as `status` prints it.
+std::vector<std::string> statusLines(const Dictionary& status);
+
 }  // namespace vesk

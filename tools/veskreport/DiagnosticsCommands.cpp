@@ -4,6 +4,7 @@
 #include "tools/text/Printable.h"
 #include "tools/veskreport/CommandLine.h"
 #include "tools/veskreport/DiagnosticsClient.h"
+#include "tools/veskreport/Terminal.h"
 
 namespace vesk {
 
@@ -20,43 +21,11 @@ std::vector<std::string> dropLines(const Dictionary& status, const char* key, co
   return lines;
 }
 
-std::vector<std::string> statusLines(const Dictionary& status) {
-  std::vector<std::string> lines{"veskreportingd " + textIn(status, "version") + ": " +
-                                 textIn(status, "health") + ", up " + durationIn(status, "uptime") +
-                                 ", environment " + textIn(status, "environment")};
-  if (const Value* reasons = status.find("reasons"); reasons && reasons->list()) {
-    for (const Value& each : *reasons->list())
-      lines.push_back("  ! " + printable(each.text() ? each.text()->string() : describe(each)));
+/// What is wrong in red, if the output takes that.
+std::vector<std::string> colored(std::vector<std::string> lines, bool takesColor) {
+  for (auto& line : lines) {
+    if (takesColor && line.starts_with("  ! ")) line = "\x1b[31m" + line + "\x1b[0m";
   }
-  for (const auto& bag : listIn(status, "storebags")) {
-    lines.push_back("storebag " + textIn(bag, "name") + ": " + textIn(bag, "state") + ", version " +
-                    textIn(bag, "version") + ", fetched " + durationIn(bag, "age") + " ago, good for " +
-                    durationIn(bag, "maxAge"));
-  }
-  for (const auto& session : listIn(status, "sessions")) {
-    std::string line =
-        "session " + textIn(session, "sessionID") + ": client type " + textIn(session, "clientType");
-    for (const char* key : {"clientName", "serviceName"}) {
-      if (const auto name = textIn(session, key); !name.empty()) line += " " + name;
-    }
-    lines.push_back(line + " (user " + textIn(session, "user") + ", process " + textIn(session, "process") +
-                    ")");
-    for (const auto& [name, backend] : dictionaryIn(session, "backends")) {
-      if (backend.dictionary() == nullptr) continue;
-      const auto reason = textIn(*backend.dictionary(), "reason");
-      lines.push_back("  " + printable(name.view()) + ": " + textIn(*backend.dictionary(), "state") +
-                      (reason.empty() ? "" : ", since " + reason));
-    }
-  }
-  for (const auto& host : listIn(dictionaryIn(status, "outbox"), "hosts")) {
-    lines.push_back("outbox: " + textIn(host, "posts") + " posts for " + textIn(host, "host") +
-                    ", next attempt in " + durationIn(host, "nextAttempt"));
-  }
-  for (const auto& [host, age] : dictionaryIn(status, "lastPosts")) {
-    lines.push_back("last post accepted by " + printable(host.view()) + " " +
-                    durationIn(dictionaryIn(status, "lastPosts"), host.string().c_str()) + " ago");
-  }
-  for (const auto& line : dropLines(status, "counters", " since the start: ")) lines.push_back(line);
   return lines;
 }
 
@@ -108,10 +77,52 @@ std::vector<std::string> explanationLines(const Dictionary& explanation) {
 
 }  // namespace
 
+std::vector<std::string> statusLines(const Dictionary& status) {
+  std::vector<std::string> lines{"veskreportingd " + textIn(status, "version") + ": " +
+                                 textIn(status, "health") + ", up " + durationIn(status, "uptime") +
+                                 ", environment " + textIn(status, "environment")};
+  if (const Value* reasons = status.find("reasons"); reasons && reasons->list()) {
+    for (const Value& each : *reasons->list())
+      lines.push_back("  ! " + printable(each.text() ? each.text()->string() : describe(each)));
+  }
+  for (const auto& bag : listIn(status, "storebags")) {
+    lines.push_back("storebag " + textIn(bag, "name") + ": " + textIn(bag, "state") + ", version " +
+                    textIn(bag, "version") + ", fetched " + durationIn(bag, "age") + " ago, good for " +
+                    durationIn(bag, "maxAge"));
+  }
+  for (const auto& session : listIn(status, "sessions")) {
+    std::string line =
+        "session " + textIn(session, "sessionID") + ": client type " + textIn(session, "clientType");
+    for (const char* key : {"clientName", "serviceName"}) {
+      if (const auto name = textIn(session, key); !name.empty()) line += " " + name;
+    }
+    lines.push_back(line + " (user " + textIn(session, "user") + ", process " + textIn(session, "process") +
+                    ")");
+    for (const auto& [name, backend] : dictionaryIn(session, "backends")) {
+      if (backend.dictionary() == nullptr) continue;
+      const auto reason = textIn(*backend.dictionary(), "reason");
+      lines.push_back("  " + printable(name.view()) + ": " + textIn(*backend.dictionary(), "state") +
+                      (reason.empty() ? "" : ", since " + reason));
+    }
+  }
+  for (const auto& host : listIn(dictionaryIn(status, "outbox"), "hosts")) {
+    lines.push_back("outbox: " + textIn(host, "posts") + " posts for " + textIn(host, "host") +
+                    ", next attempt in " + durationIn(host, "nextAttempt"));
+  }
+  for (const auto& [host, age] : dictionaryIn(status, "lastPosts")) {
+    lines.push_back("last post accepted by " + printable(host.view()) + " " +
+                    durationIn(dictionaryIn(status, "lastPosts"), host.string().c_str()) + " ago");
+  }
+  for (const auto& line : dropLines(status, "counters", " since the start: ")) lines.push_back(line);
+  return lines;
+}
+
 int runStatus(const Invocation& invocation, const Output& output) {
   const auto status = DiagnosticsClient(invocation, output).ask(wire::kGetStatus);
   const int written =
-      invocation.openMetrics ? output.raw(openMetrics(status)) : output.done(statusLines(status), status);
+      invocation.openMetrics
+          ? output.raw(openMetrics(status))
+          : output.done(colored(statusLines(status), !invocation.noColor && takesColor()), status);
   return written == kExitDone && textIn(status, "health") == "ok" ? kExitDone : kExitFailed;
 }
 

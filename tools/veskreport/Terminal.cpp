@@ -1,11 +1,13 @@
 #include "tools/veskreport/Terminal.h"
 
+#include <sys/ioctl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
 #include <string>
 
@@ -46,6 +48,19 @@ std::optional<std::string> LineReader::next() {
     if (line.find_first_not_of(" \t\r") != std::string::npos) return line;
   }
   return std::nullopt;
+}
+
+std::size_t columns() {
+  const char* wanted = std::getenv("COLUMNS");
+  if (const long number = wanted ? std::strtol(wanted, nullptr, 10) : 0; number > 0)
+    return static_cast<std::size_t>(number);
+  winsize size{};
+  return ::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 0 ? size.ws_col : 80;
+}
+
+bool takesColor() {
+  const char* none = std::getenv("NO_COLOR");
+  return ::isatty(STDOUT_FILENO) == 1 && (none == nullptr || *none == '\0');
 }
 
 Progress::Progress(int input) noexcept : _isTerminal(::isatty(STDERR_FILENO) == 1), _size(sizeOf(input)) {}

@@ -28,6 +28,12 @@ class LineReader {
   std::string _error;
 };
 
+/// The width of lines, in characters: of $COLUMNS, otherwise of the terminal, otherwise 80.
+std::size_t columns();
+
+/// Whether standard output takes colours: a terminal, without $NO_COLOR.
+bool takesColor();
+
 /// Only drawn if standard error is a terminal, at most ten times a second.
 class Progress {
  public:
