@@ -2,7 +2,12 @@
 // not.
 #include <gtest/gtest.h>
 
+#include <set>
+#include <tuple>
+
+#include "platform/json/JSONWriter.h"
 #include "tests/support/OperatorTest.h"
+#include "tests/support/RandomEntries.h"
 
 namespace vesk::test {
 namespace {
@@ -159,6 +164,53 @@ TEST_F(Diagnostics, TapShowsWhatLeavesTheDevice) {
   }
   EXPECT_FALSE(contains(text, "secret")) << "it is shown as it was sent, after the filters";
   EXPECT_FALSE(contains(text, "Nobody"));
+}
+
+// The daemon's own draws are not known, so the thresholds let all sessions through or none.
+TEST_F(Diagnostics, ExplainTellsWhatTheDaemonThenDoes) {
+  RandomEntries random(3);
+  int enabled = 0;
+  for (const auto& [device, region, consent] : {std::tuple("Phone", "US", "true"),
+                                                {"Watch", "FR", "true"},
+                                                {"Phone", "US", "false"},
+                                                {"Tablet", "US", "true"}}) {
+    MutableDictionary storebag(Dictionary{{"version", "7"}});
+    std::vector<Value> entries;
+    for (int i = 0; i < 26; ++i)
+      entries.emplace_back(
+          random.entry("C" + std::to_string(i), "@EVENTS@", {-1.0, 1.0, 1.0, 1.0, 1.0, 1.0}));
+    storebag.set("release", Dictionary{{"httpPost", Dictionary{{"clients", List(std::move(entries))}}}});
+    harness.writeStorebag("zelko", *toJSON(storebag.share(), JSONStyle::Compact), ".json");
+    harness.setDeviceFact("DeviceName", "\"" + std::string(device) + "\"");
+    harness.setDeviceFact("RegionCode", "\"" + std::string(region) + "\"");
+    harness.setPreference("diagnosticsSubmission", consent);
+    harness.startDaemon();
+    { session("C0"); }  // fetches the storebag
+    const std::size_t before = harness.waitForEvents([](const auto&) { return true; }).size();
+    std::set<std::string> expected;
+    for (int i = 0; i < 26; ++i) {
+      const std::string name = "C" + std::to_string(i);
+      SCOPED_TRACE(std::string(device) + " " + name);
+      const auto told = ask({"explain", "--client-type", "5", "--client-name", name, "--json"});
+      const auto backend = boost::json::parse(told.text).at("backends").at("httpPost").as_object();
+      auto client = session(name.c_str());
+      const bool isEnabled = client.enabled && client.enabled->size() == 1;
+      EXPECT_EQ(isEnabled, backend.at("state") == "enabled") << told.text;
+      if (isEnabled && backend.contains("postURL")) expected.insert(name);
+      enabled += isEnabled ? 1 : 0;
+      EXPECT_TRUE(client.reporting.sendMessageAndWait(message(3, {{"case", name}, {"x", 1}})));
+      EXPECT_TRUE(client.reporting.flushMessagesAndWait(ChildProcess::kPatience));
+    }
+    EXPECT_EQ(harness.stopDaemon(), 0);
+    std::set<std::string> arrived;
+    const auto events = harness.waitForEvents([](const auto&) { return true; });
+    for (std::size_t i = before; i < events.size(); ++i) {
+      const auto& event = events[i].at("event").as_object();
+      if (event.contains("case")) arrived.emplace(event.at("case").as_string());
+    }
+    EXPECT_EQ(arrived, expected) << device;
+  }
+  EXPECT_GT(enabled, 20) << "of 104";
 }
 
 }  // namespace

@@ -117,11 +117,12 @@ int DaemonHarness::stopDaemon() {
   return status;
 }
 
-void DaemonHarness::writeStorebag(const std::string& name, std::string source) {
+void DaemonHarness::writeStorebag(const std::string& name, std::string source, const char* ending) {
   source = replaced(std::move(source), "@EVENTS@", fact("eventsURL"));
   source = replaced(std::move(source), "@LOGDATA@", fact("logDataURL"));
   source = replaced(std::move(source), "@UDPPORT@", std::to_string(_facts.at("udpPort").as_int64()));
-  root.write("storebags/" + name + ".toml", source);
+  std::filesystem::remove(root / ("storebags/" + name + ".toml"));
+  root.write("storebags/" + name + ending, source);
 }
 
 std::string DaemonHarness::socketPath() const {

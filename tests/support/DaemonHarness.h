@@ -40,7 +40,7 @@ class DaemonHarness {
 
   /// Writes a storebag source. In its text, @EVENTS@ and @LOGDATA@ are replaced by the collector's HTTPS URLs
   /// for events and log data, and @UDPPORT@ by its datagram port.
-  void writeStorebag(const std::string& name, std::string source);
+  void writeStorebag(const std::string& name, std::string source, const char* ending = ".toml");
   /// Sets a line of the daemon's preferences or the device's facts. `value` is TOML; "" removes the line.
   void setPreference(const std::string& key, const std::string& value) { _preferences[key] = value; }
   void setDeviceFact(const std::string& key, const std::string& value) { _deviceFacts[key] = value; }

@@ -31,6 +31,7 @@ struct Stamp {
   std::optional<Text> build = std::nullopt;
   std::string selfVersion = "7.2.9";
   double start = 1'000'000'019.7;
+  double draw = 0.30;
 };
 
 class HTTPSBackendTest : public ::testing::Test {
@@ -66,7 +67,7 @@ class HTTPSBackendTest : public ::testing::Test {
         newBackendWithName(kVeskReportingBackendHTTPPost, Dictionary{{"clients", std::move(clients)}},
                            identity, harness.services));
     backend->setCombinedSessionIDString("session-text");
-    backend->setSamplingFactor(0.30);
+    backend->setSamplingFactor(stamp.draw);
     update(*backend, stamp.userInfo);
     return backend;
   }
