@@ -123,6 +123,22 @@ ReportingStatus VeskReporting::setSessionInfo(Dictionary sessionInfo, std::optio
   return post(_implementation, setInfo, sessionInfo, userInfo, frameworksToCheck, aggregationHandler);
 }
 
+ReportingStatus VeskReporting::setSessionInfo(const ReportingSession& session) noexcept {
+  try {
+    MutableDictionary userInfo;
+    if (!session.clientName.empty()) userInfo.set(kVeskReportingUserInfoClientName, session.clientName);
+    if (!session.serviceName.empty()) userInfo.set(kVeskReportingUserInfoServiceName, session.serviceName);
+    return setSessionInfo({{kVeskReportingSessionInfoSessionID, session.sessionID},
+                           {kVeskReportingSessionInfoClientType, session.clientType},
+                           {kVeskReportingSessionInfoClientVersion, int{session.clientVersion}},
+                           {kVeskReportingSessionInfoRequireUserInfo, session.requireUserInfo},
+                           {kVeskReportingSessionInfoBatchEvent, session.batchEvents}},
+                          userInfo.empty() ? std::nullopt : std::optional(userInfo.share()));
+  } catch (const std::exception&) {
+    return ReportingStatus::OutOfResources;
+  }
+}
+
 ReportingResult<BackendNamesAnswer> VeskReporting::startConfig(Timeout timeout) noexcept {
   return wait<BackendNamesAnswer>(_implementation, timeout, start);
 }

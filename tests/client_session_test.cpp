@@ -31,6 +31,15 @@ struct Caught {
   }
 };
 
+TEST_F(ClientSession, TheShortFormRequiresUserInfo) {
+  VeskReporting session(options());
+  EXPECT_EQ(session.setSessionInfo(ReportingSession{.clientType = 5, .clientName = "Camera"}),
+            ReportingStatus::Queued);
+  EXPECT_TRUE(record.waitFor(
+      R"(setSessionInfo {"sessionID": 0, "clientType": 5, "clientVersion": 0, "requireUserInfo": true, )"
+      R"("batchEvent": false} {"clientName": "Camera"} [])"));
+}
+
 TEST_F(ClientSession, TellsTheDaemonEveryOperationAndGetsItsAnswers) {
   auto file = directory.write("some file.txt", "contents");
   VeskReporting session(options());

@@ -14,11 +14,9 @@ int main(int argc, char** argv) {
     std::fprintf(stderr, "cpp_client: %s (%s)\n", describe(connected.status), connected.detail.c_str());
     return 1;
   }
-  ReportingStatus configured = reporting.setSessionInfo(
-      {{kVeskReportingSessionInfoSessionID, 1},
-       {kVeskReportingSessionInfoClientType, 5},
-       {kVeskReportingSessionInfoRequireUserInfo, true}},  // so that consent, sampling and filters apply
-      Dictionary{{kVeskReportingUserInfoClientName, "Camera"}});
+  // The user's consent and the storebag's rules for this client apply.
+  ReportingStatus configured =
+      reporting.setSessionInfo(ReportingSession{.clientType = 5, .clientName = "Camera"});
   if (configured != ReportingStatus::Queued) return 1;
 
   auto started = reporting.startConfig(20s);  // the daemon may have to fetch the storebag

@@ -46,6 +46,8 @@ class VESK_API VeskReporting {
   ReportingStatus setSessionInfo(Dictionary sessionInfo, std::optional<Dictionary> userInfo = std::nullopt,
                                  std::vector<std::string> frameworksToCheck = {},
                                  AggregationHandler aggregationHandler = nullptr) noexcept;
+  /// The same, in short.
+  ReportingStatus setSessionInfo(const ReportingSession& session) noexcept;
 
   /// 2. Starts the session: the daemon fetches the storebag of the client type and creates its backends. If
   /// the daemon is not reached in time, this is done once it is reached.

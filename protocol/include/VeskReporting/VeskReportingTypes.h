@@ -34,6 +34,19 @@ enum class [[nodiscard]] ReportingStatus : std::uint8_t{
 /// A short description for a log line.
 VESK_API const char* describe(ReportingStatus status) noexcept;
 
+/// Who reports. With the defaults, the user's consent and the storebag's rules for the client apply; then
+/// `clientName` must be set, or nothing is reported.
+struct ReportingSession {
+  std::int32_t clientType = 0;  ///< selects the storebag
+  std::string clientName{};     ///< finds the client's entry in it
+  std::string serviceName{};
+  std::uint16_t clientVersion = 0;
+  std::uint32_t sessionID = 0;  ///< the client's own number for the session
+  bool batchEvents = false;     ///< collect events into few posts
+  bool requireUserInfo =
+      true;  ///< false: report without asking for consent, entry, region, sampling, filters
+};
+
 /// The outcome of a call that has an answer.
 template <class Answer>
 struct [[nodiscard]] ReportingResult {
