@@ -27,6 +27,8 @@ class Outcomes {
   void setUserInfo(const std::optional<Dictionary>& userInfo);
 
   bool isWatched() const noexcept { return _tap->isOpen(); }
+  /// Whether what becomes of each message is of interest, and not only what leaves the device or is lost.
+  bool watchesMessages() const noexcept { return _tap->wantsMessages(); }
   /// `what`: "message", "post", "datagram" or "upload". `outcome`: "held", "posted", "sent", "delivered",
   /// "deferred" or "dropped". docs/wire.md has the facts. Expensive; ask `isWatched` first.
   void show(const char* what, const char* outcome, const Dictionary& facts,

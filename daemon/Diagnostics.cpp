@@ -197,13 +197,16 @@ Dictionary Diagnostics::explain(const Dictionary& request) const {
 std::shared_ptr<DeliveryTap::Reader> Diagnostics::openTap(const IPCPeer& viewer,
                                                           const Dictionary& filter) const {
   MutableDictionary wanted(filter, 1);
+  const bool messages = booleanForKey(filter, "messages").value_or(false);
+  wanted.remove("messages");
   if (!seesAll(viewer)) wanted.set("user", static_cast<std::int64_t>(viewer.user));
-  return _sources.services.tap->open([wanted = wanted.share()](const Dictionary& record) {
+  const auto matches = [wanted = wanted.share()](const Dictionary& record) {
     return std::all_of(wanted.begin(), wanted.end(), [&record](const auto& each) {
       const Value* value = record.find(each.key.view());
       return value != nullptr && describe(*value) == describe(each.value);
     });
-  });
+  };
+  return _sources.services.tap->open(matches, messages);
 }
 
 }  // namespace vesk

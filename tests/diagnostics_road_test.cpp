@@ -149,7 +149,7 @@ TEST_F(Diagnostics, SendFailsIfAllIsDropped) {
 TEST_F(Diagnostics, TapShowsWhatLeavesTheDevice) {
   start(kReports);
   ChildProcess tap({VESK_BIN_DIRECTORY "/veskreport", "tap", "--root", harness.root.path().string(),
-                    "--client-name", "Camera", "--bodies", "--count", "6"});
+                    "--client-name", "Camera", "--messages", "--bodies", "--count", "6"});
   ASSERT_TRUE(tap.waitForText("watching"));
   {
     auto nobody = session("Nobody");  // not asked for

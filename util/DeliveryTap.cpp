@@ -11,19 +11,24 @@ void DeliveryTap::tell(const Dictionary& record, const std::string& body, Clock:
   }
 }
 
-std::shared_ptr<DeliveryTap::Reader> DeliveryTap::open(Filter filter) {
-  auto reader = std::make_shared<Reader>(*this, std::move(filter));
+std::shared_ptr<DeliveryTap::Reader> DeliveryTap::open(Filter filter, bool wantsMessages) {
+  auto reader = std::make_shared<Reader>(*this, std::move(filter), wantsMessages);
   MutexLock lock(_mutex);
   if (_readers.size() >= kMostReaders) return nullptr;
   _readers.push_back(reader.get());
-  _isOpen = true;
+  update();
   return reader;
 }
 
 void DeliveryTap::close(const Reader* reader) {
   MutexLock lock(_mutex);
   std::erase(_readers, reader);
+  update();
+}
+
+void DeliveryTap::update() {
   _isOpen = !_readers.empty();
+  _wantsMessages = std::ranges::any_of(_readers, [](const Reader* reader) { return reader->_wantsMessages; });
 }
 
 bool DeliveryTap::Reader::takesBody(std::size_t bytes, Clock::time_point now) {

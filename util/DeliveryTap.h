@@ -35,7 +35,8 @@ class DeliveryTap {
 
   class Reader {
    public:
-    Reader(DeliveryTap& tap, Filter filter) : _tap(tap), _filter(std::move(filter)) {}
+    Reader(DeliveryTap& tap, Filter filter, bool wantsMessages)
+        : _tap(tap), _filter(std::move(filter)), _wantsMessages(wantsMessages) {}
     ~Reader() { _tap.close(this); }
     Reader(const Reader&) = delete;
     Reader& operator=(const Reader&) = delete;
@@ -57,6 +58,7 @@ class DeliveryTap {
 
     DeliveryTap& _tap;
     const Filter _filter;
+    const bool _wantsMessages;
     Mutex _mutex;  // taken under the tap's
     std::condition_variable_any _added;
     std::deque<Waiting> _waiting VESK_GUARDED_BY(_mutex);
@@ -66,16 +68,20 @@ class DeliveryTap {
   };
 
   bool isOpen() const noexcept { return _isOpen.load(std::memory_order_relaxed); }
+  /// Whether a reader wants a record for each message, too, which costs as much as a tenth of the message.
+  bool wantsMessages() const noexcept { return _wantsMessages.load(std::memory_order_relaxed); }
   /// `body`: what was sent; becomes the record's `body`, unless it is empty or the reader has had too much.
   void tell(const Dictionary& record, const std::string& body = {}, Clock::time_point now = Clock::now());
 
   /// `filter` is called under the tap's lock. Returns null if there are `kMostReaders`.
-  std::shared_ptr<Reader> open(Filter filter);
+  std::shared_ptr<Reader> open(Filter filter, bool wantsMessages = false);
 
  private:
   void close(const Reader* reader);
+  void update() VESK_REQUIRES(_mutex);
 
   std::atomic<bool> _isOpen{false};
+  std::atomic<bool> _wantsMessages{false};
   Mutex _mutex;
   std::vector<Reader*> _readers VESK_GUARDED_BY(_mutex);
 };

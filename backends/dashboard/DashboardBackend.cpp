@@ -171,7 +171,7 @@ std::optional<std::string> DashboardBackend::sendMessageInTurn(const std::option
   header.length = static_cast<std::uint16_t>(kDashboardHeaderSize + textLength);
   encodeDashboardHeader(header, buffer->data());
   auto line = writeLocalLog({buffer->data(), header.length});
-  if (_outcomes->isWatched()) {
+  if (_outcomes->watchesMessages()) {
     _outcomes->show("message", "posted", {{"category", method}, {"type", respCode}, {"eventID", eventID}},
                     line.value_or(""));
   }

@@ -142,7 +142,7 @@ std::optional<std::string> HTTPSPostBackend::sendMessageInTurn(const std::option
       if (_outcomes->isWatched()) own->messages = {{"eventID", eventID}};
     }
   }
-  if (_outcomes->isWatched()) {
+  if (_outcomes->watchesMessages()) {
     _outcomes->show("message", own ? "posted" : "held",
                     {{"category", method}, {"type", respCode}, {"eventID", eventID}});
   }

@@ -28,7 +28,7 @@ std::optional<std::string> KilnarBackend::sendMessageInTurn(const std::optional<
   event.set(Text::literal("respCode"), unsigned{respCode});
   event.set(Text::literal("event"), unsigned{eventID});
   _services.powerLog->KLLogRegisteredEvent(kRegisteredEvent, kEventName, event.share(), std::nullopt);
-  if (_outcomes->isWatched()) {
+  if (_outcomes->watchesMessages()) {
     _outcomes->show("message", "delivered", {{"category", method}, {"type", respCode}, {"eventID", eventID}});
   }
   return std::nullopt;

@@ -112,7 +112,7 @@ std::optional<std::string> WrenBackend::sendMessageInTurn(const std::optional<Di
     VESK_LOG_ERROR("WrenBackend(sendMessage): Wren adaptor %s failed: %s", adaptorDescription(),
                    forwarded.error().text.c_str());
     _outcomes->count("message", DropReason::AdaptorFailed);
-  } else if (_outcomes->isWatched()) {
+  } else if (_outcomes->watchesMessages()) {
     _outcomes->show("message", "delivered", {{"category", method}, {"type", respCode}});
   }
   return std::nullopt;

@@ -202,6 +202,7 @@ class Reader {
     tap->add_option("--backend", _invocation.tap.backend, "Only of this backend, such as httpPost");
     tap->add_option("--outcome", _invocation.tap.outcome, "Only what ended so")
         ->check(CLI::IsMember({"held", "posted", "sent", "delivered", "deferred", "dropped"}));
+    tap->add_flag("--messages", _invocation.tap.messages, "Show what becomes of each message, too");
     tap->add_flag("--bodies", _invocation.tap.bodies, "Show what was sent, too");
     tap->add_option("--count", _invocation.tap.count, "Exit after this many lines (default: never)")
         ->check(CLI::NonNegativeNumber);

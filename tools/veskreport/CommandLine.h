@@ -53,6 +53,7 @@ struct Invocation {
     std::optional<int> clientType;
     std::string backend;      ///< empty: all
     std::string outcome;      ///< empty: all
+    bool messages = false;    ///< also of single messages
     bool bodies = false;      ///< with what was sent
     std::uint64_t count = 0;  ///< the number of records after which to end; 0: never
   } tap;

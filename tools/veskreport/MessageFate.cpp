@@ -36,7 +36,8 @@ std::string wordsFor(const Dictionary& record) {
 
 MessageWatch::MessageWatch(const Invocation& invocation, const Output& output, const char* outcome)
     : _invocation(invocation), _daemon(invocation, output) {
-  MutableDictionary filter(Dictionary{{"process", static_cast<std::int64_t>(::getpid())}}, 1);
+  MutableDictionary filter(Dictionary{{"process", static_cast<std::int64_t>(::getpid())}, {"messages", true}},
+                           1);
   if (*outcome != '\0') filter.set("outcome", outcome);
   const auto opened = _daemon.call(wire::kOpenTap, {filter.share()});
   _isOpen = opened && opened->empty();

@@ -51,7 +51,7 @@ std::string lineOf(const Dictionary& record) {
 }
 
 Dictionary filterOf(const Invocation& invocation) {
-  MutableDictionary filter;
+  MutableDictionary filter(Dictionary{{"messages", invocation.tap.messages}});
   if (invocation.tap.clientType) filter.set("clientType", *invocation.tap.clientType);
   if (!invocation.clientName.empty()) filter.set("clientName", invocation.clientName);
   if (!invocation.tap.backend.empty()) filter.set("backend", invocation.tap.backend);
