@@ -321,6 +321,7 @@ class Reader {
     verify->add_option("--key", _invocation.key, "Public key (DER; default: the installed one)");
     CLI::App* show = add(*storebag, "show", "Show what a signed storebag holds", runStorebagShow);
     show->add_option("storebag", _invocation.source, "Signed storebag")->required();
+    addStorebagAuthoring(*storebag, _invocation);
   }
 
   CLI::App _app;
