@@ -29,8 +29,4 @@ using StorebagFindings = std::vector<StorebagFinding>;
 /// Checks each key of the payload by itself: its name, type and range, and what is missing.
 StorebagFindings checkStorebag(const Dictionary& payload);
 
-/// Finds what single keys don't show, with the decisions that the daemon would make: entries and filters that
-/// never apply, thresholds out of order, events without a URL, environments in which nothing is reported.
-StorebagFindings reviewStorebag(const Dictionary& payload);
-
 }  // namespace vesk

@@ -12,6 +12,8 @@ using std::string_view;
 
 constexpr string_view kReportsNothing = "sessions that require user info report nothing here";
 
+constexpr string_view kNoPort = "no server has this port, only its lowest 16 bits are used";
+
 constexpr std::array<string_view, 4> kEnvironments{"development", "corvane_internal", "seed", "release"};
 constexpr std::array<string_view, 2> kActions{"remove", "sha256"};
 
@@ -22,14 +24,16 @@ constexpr std::array kFilter{
                 .example = "3",
                 .absent = "-1",
                 .most = 65535,
-                .outside = "no message has this number, the filter never applies"},
+                .above = "no message has this number, the filter never applies",
+                .mustBeWithin = true},
     StorebagKey{.key = "status",
                 .type = KeyType::Integer,
                 .effect = "The filter acts only on messages of this type; a negative number means any.",
                 .example = "2",
                 .absent = "-1",
                 .most = 65535,
-                .outside = "no message has this number, the filter never applies"},
+                .above = "no message has this number, the filter never applies",
+                .mustBeWithin = true},
     StorebagKey{.key = "key",
                 .type = KeyType::Text,
                 .effect =
@@ -121,7 +125,7 @@ constexpr std::array kClientEntry{
         .unit = "share of the sessions",
         .withoutIt = kReportsNothing,
         .most = 1,
-        .outside = "it is a share, every session reports"},
+        .above = "it is a share from 0 to 1, every session reports"},
     StorebagKey{
         .key = "override_sampling",
         .type = KeyType::Number,
@@ -132,7 +136,7 @@ constexpr std::array kClientEntry{
         .absent = "every session that is sampled out",
         .unit = "share of the sessions",
         .most = 1,
-        .outside = "it is a share, every session holds back"},
+        .above = "it is a share from 0 to 1, every session that is sampled out holds back"},
     StorebagKey{.key = "event_threshold",
                 .type = KeyType::Integer,
                 .effect =
@@ -142,7 +146,7 @@ constexpr std::array kClientEntry{
                 .absent = "49",
                 .unit = "events",
                 .least = 0,
-                .outside = "every event is posted by itself"},
+                .below = "every event is posted by itself"},
     StorebagKey{
         .key = "extras_on_internal",
         .type = KeyType::Flag,
@@ -200,7 +204,9 @@ constexpr std::array kDashboardProfile{
                 .withoutIt = kNotBuilt,
                 .least = 1,
                 .most = 65535,
-                .outside = "no server has this port, only its lowest 16 bits are used"},
+                .below = kNoPort,
+                .above = kNoPort,
+                .mustBeWithin = true},
     StorebagKey{
         .key = "reliable",
         .type = KeyType::IntegerOrText,
@@ -291,7 +297,8 @@ constexpr std::array kTop{
         .unit = "s",
         .least = 1,
         .most = 86400,
-        .outside = "more than a day counts as a day, less than 1 has every session's start fetch it again"},
+        .below = "every session's start fetches it again",
+        .above = "86400 is used"},
     StorebagKey{.key = "name",
                 .type = KeyType::Text,
                 .effect = "The only storebag name under which daemons accept it.",

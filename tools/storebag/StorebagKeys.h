@@ -42,7 +42,9 @@ struct StorebagKey {
   std::span<const std::string_view> words = {};  ///< the only values that have an effect, if they are few
   double least = -std::numeric_limits<double>::infinity();
   double most = std::numeric_limits<double>::infinity();
-  std::string_view outside = {};  ///< what becomes of a number outside that range
+  std::string_view below = {};  ///< what becomes of a number below that range; empty: it is as good as any
+  std::string_view above = {};  ///< likewise, above it
+  bool mustBeWithin = false;    ///< outside, the value can't work
 };
 
 /// What a missing key or an unusable value does to its backend.

@@ -149,12 +149,11 @@ class Checker {
   }
 
   void checkRange(const std::string& place, const Value& value, const StorebagKey& key) {
-    if (key.outside.empty()) return;
     const double number = value.isNumber() ? *value.asDouble() : static_cast<double>(integerForm(value));
-    if (number >= key.least && number <= key.most) return;
-    const bool hasNoEffect = key.key == "port" || key.key == "method" || key.key == "status";
-    add(hasNoEffect ? Kind::Impossible : Kind::Doubtful, place,
-        "is " + describe(value, 60) + ", " + std::string(key.outside));
+    const std::string_view effect = number < key.least ? key.below : number > key.most ? key.above : "";
+    if (effect.empty()) return;
+    add(key.mustBeWithin ? Kind::Impossible : Kind::Doubtful, place,
+        "is " + describe(value, 60) + ", " + std::string(effect));
   }
 
   StorebagFindings _findings;

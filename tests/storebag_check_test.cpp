@@ -1,0 +1,147 @@
+// `veskreport storebag check`: a bad storebag for each finding.
+#include <gtest/gtest.h>
+
+#include "tests/support/ChildProcess.h"
+#include "tests/support/TempDirectory.h"
+
+namespace vesk::test {
+namespace {
+
+struct Outcome {
+  int status = -1;
+  std::string output;
+  std::string errors;
+};
+
+Outcome veskreport(std::vector<std::string> arguments) {
+  arguments.insert(arguments.begin(), VESK_BIN_DIRECTORY "/veskreport");
+  ChildProcess process(ChildProcess::Options{.command = std::move(arguments)});
+  return {process.wait().value_or(-1), process.output(), process.errors()};
+}
+
+// A storebag without findings, of which cases replace parts.
+constexpr std::string_view kGood = R"(version = "1"
+[development]
+[corvane_internal]
+[[release.httpPost.clients]]
+client = "Camera"
+locale_whitelist = ["DE"]
+sampling_threshold = 0.5
+filters = [{key = "user", action = "sha256", method = 3}]
+post_url = "https://collect.example/events"
+)";
+
+std::string with(std::string_view part, std::string_view replacement) {
+  std::string text(kGood);
+  const auto at = text.find(part);
+  EXPECT_NE(at, std::string::npos) << part;
+  return text.replace(at, part.size(), replacement);
+}
+
+std::string followedBy(std::string_view more) { return std::string(kGood) + std::string(more); }
+
+constexpr const char* kLimits =
+    "locale_whitelist = [\"DE\"]\nsampling_threshold = 1\nfilters = []\n"
+    "post_url = \"https://collect.example/\"\n";
+
+struct Case {
+  std::string storebag;
+  const char* finding;  // the beginning of a line
+};
+
+const std::vector<Case>& cases() {
+  static const std::vector<Case> all{
+      {with("\"Camera\"", "3"), "error: release.httpPost.clients[0].client: must be a text, is 3"},
+      {with("https:", "htps:"),
+       "error: release.httpPost.clients[0].post_url: 'htps://collect.example/events' is no http or https "
+       "URL"},
+      {with("collect.example", "h:70000"),
+       "error: release.httpPost.clients[0].post_url: 'https://h:70000/events' has a port that is not"},
+      {with("= 3", "= 65536"), "error: release.httpPost.clients[0].filters[0].method: is 65536, no message"},
+      {followedBy("[release.dashboard]\nip = \"127.0.0.1\"\nport = \"70000\"\n"),
+       "error: release.dashboard.port: is \"70000\", no server has this port"},
+      {followedBy("[release.dashboard]\nip = \"localhost\"\nport = 1\n"),
+       "error: release.dashboard.ip: not four decimal numbers"},
+      {with("version", "verzion"), "warning: verzion: unknown key; did you mean 'version'?"},
+      {with("post_url", "post_uri"),
+       "warning: release.httpPost.clients[0].post_uri: unknown key; did you mean 'post_url'?"},
+      {with("sha256", "sha-256"),
+       "warning: release.httpPost.clients[0].filters[0].action: neither \"remove\" nor "
+       "\"sha256\", the filter changes nothing; did you mean 'sha256'?"},
+      {followedBy("[relase.wren]\n"),
+       "warning: relase: no environment has this name; did you mean 'release'?"},
+      {followedBy("[release.renw]\n"),
+       "warning: release.renw: no backend has this name; did you mean 'wren'?"},
+      {with("0.5", "50"), "warning: release.httpPost.clients[0].sampling_threshold: is 50, it is a share"},
+      {with("version", "refresh_cycle = 0\nversion"), "warning: refresh_cycle: is 0, every session's start"},
+      {with("version", "expires = 2020-01-31\nversion"), "warning: expires: is past, daemons refuse"},
+      {with("post_url = \"https://collect.example/events\"", ""),
+       "warning: release.httpPost.clients[0].post_url: missing, events are dropped"},
+      {with("filters", "override_sampling = 0.25\nfilters"),
+       "warning: release.httpPost.clients[0].override_sampling: is 0.25, below the sampling_threshold 0.5"},
+      {with("filters = [", "filters = [{key = \"USER\", action = \"remove\"}, "),
+       "warning: release.httpPost.clients[0].filters[1]: never applies, filters[0] decides about 'user' "
+       "first"},
+      {followedBy(std::string("[[release.httpPost.clients]]\nclient = \"CAMERA\"\nservice = \"x\"\n") +
+                  kLimits),
+       "warning: release.httpPost.clients[1]: is never reached, clients[0] before it is for all of its "
+       "sessions"},
+      {followedBy(std::string("[[release.httpPost.clients]]\nclient = \"Other\"\nservice = \"\"\n") +
+                  kLimits),
+       "warning: release.httpPost.clients[1]: is never reached, no session has such names"},
+      {with("[development]\n", ""),
+       "warning: development: no section, devices in this environment report nothing"},
+      {with("[\"DE\"]", "[]"),
+       "warning: release: no session that requires user info reports; httpPost: the locale_whitelist is "
+       "empty"},
+      {with("0.5", "-1\noverride_sampling = -1"),
+       "warning: release: no session that requires user info reports; httpPost: the draw"},
+      {followedBy("[seed.uploadServer]\n"),
+       "warning: seed: no session that requires user info reports; "
+       "uploadServer: the backend is not built"},
+  };
+  return all;
+}
+
+TEST(StorebagCheck, FindsEveryMistake) {
+  TempDirectory files;
+  for (const auto& [storebag, finding] : cases()) {
+    const auto outcome = veskreport({"storebag", "check", files.write("z.toml", storebag)});
+    EXPECT_NE(("\n" + outcome.output).find("\n" + std::string(finding)), std::string::npos) << finding << "\n"
+                                                                                            << outcome.output;
+    EXPECT_EQ(outcome.status, std::string_view(finding).starts_with("error") ? 1 : 0) << outcome.output;
+  }
+}
+
+TEST(StorebagCheck, SaysNothingOfAGoodOne) {
+  TempDirectory files;
+  const std::string narrowed =
+      std::string("[[release.httpPost.clients]]\nclient = \"Camera,Other\"\n") + kLimits +
+      "[[release.httpPost.clients]]\n" + kLimits +
+      "[release.wren]\n[seed.dashboard]\nip = \"127.0.0.1\"\nport = 9053\nreliable = 500\n";
+  for (const auto& storebag : {std::string(kGood), followedBy(narrowed)}) {
+    const std::string file = files.write("z.toml", storebag);
+    const auto outcome = veskreport({"storebag", "check", "--strict", file});
+    EXPECT_EQ(outcome.output, file + ": 0 errors, 0 warnings\n");
+    EXPECT_EQ(outcome.status, 0);
+  }
+}
+
+TEST(StorebagCheck, CountsWarningsAsErrorsAndSpeaksJSON) {
+  TempDirectory files;
+  const std::string file = files.write("z.toml", with("version", "verzion"));
+  EXPECT_EQ(veskreport({"storebag", "check", file}).status, 0);
+  const auto outcome = veskreport({"storebag", "check", "--strict", "--json", file});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.errors, "veskreport: " + file + ": 2 errors, 0 warnings\n");
+  EXPECT_NE(
+      outcome.output.find(R"({"status":"done","severity":"error","place":"verzion","text":"unknown key; )"
+                          R"(did you mean 'version'?"})"
+                          "\n"),
+      std::string::npos)
+      << outcome.output;
+  EXPECT_NE(outcome.output.find(R"("errors":2,"warnings":0})"), std::string::npos);
+}
+
+}  // namespace
+}  // namespace vesk::test
