@@ -1,23 +1,11 @@
 // `veskreport storebag check`: a bad storebag for each finding.
 #include <gtest/gtest.h>
 
-#include "tests/support/ChildProcess.h"
 #include "tests/support/TempDirectory.h"
+#include "tests/support/Veskreport.h"
 
 namespace vesk::test {
 namespace {
-
-struct Outcome {
-  int status = -1;
-  std::string output;
-  std::string errors;
-};
-
-Outcome veskreport(std::vector<std::string> arguments) {
-  arguments.insert(arguments.begin(), VESK_BIN_DIRECTORY "/veskreport");
-  ChildProcess process(ChildProcess::Options{.command = std::move(arguments)});
-  return {process.wait().value_or(-1), process.output(), process.errors()};
-}
 
 // A storebag without findings, of which cases replace parts.
 constexpr std::string_view kGood = R"(version = "1"

@@ -30,7 +30,7 @@ Dictionary readTomlOrJSON(const std::filesystem::path& file) {
   if (file.extension() != ".json") refuse("the name must end in .toml or .json");
   const auto value = parseJSON(text);
   if (!value) refuse(value.error().text);
-  if (value->dictionary() == nullptr) refuse("the storebag must be an object");
+  if (value->dictionary() == nullptr) refuse("the document must be an object");
   return *value->dictionary();
 }
 

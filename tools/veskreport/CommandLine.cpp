@@ -178,6 +178,7 @@ class Reader {
     explain->add_option("--draw", _invocation.draw, "The session's draw for sampling, from 0 to 1")
         ->check(CLI::Range(0.0, 1.0))
         ->capture_default_str();
+    addOfflineExplain(*explain, _invocation);
   }
 
   void addCompletion() {
