@@ -131,5 +131,70 @@ TEST(StorebagCheck, CountsWarningsAsErrorsAndSpeaksJSON) {
   EXPECT_NE(outcome.output.find(R"("errors":2,"warnings":0})"), std::string::npos);
 }
 
+TEST(StorebagCheck, ShowsWhatChangesForWhom) {
+  const Case changes[] = {
+      {with("0.5", "0.25"),
+       "seed, release: httpPost: Camera: in DE with consent: reports for 25 % of the sessions "
+       "instead of 50 % of the sessions"},
+      {with("[\"DE\"]", "[\"DE\", \"FR\"]"),
+       "seed, release: httpPost: Camera: in FR with consent: starts to report for 50 % of the sessions, to "
+       "https://collect.example/events"},
+      {with("[\"DE\"]", "[\"FR\"]"),
+       "seed, release: httpPost: Camera: in DE with consent: stops reporting, since the region 'DE' is not "
+       "among "
+       "'FR'"},
+      {with("filters", "override_dnu = 1\nfilters"),
+       "seed, release: httpPost: Camera: in DE without consent: starts to report for 50 %"},
+      {with("filters", "device_whitelist = [\"Pine\"]\nfilters"),
+       "seed, release: httpPost: Camera: in DE on other devices with consent: stops reporting"},
+      {with("\"Camera\"", "\"camera,Other\""),
+       "seed, release: httpPost: Other: in DE with consent: starts to report"},
+      {with("filters", "expedite = 0\nfilters"),
+       "seed, release: httpPost: Camera: in DE with consent: collects batches"},
+      {with("0.5", "-1"), "seed, release: httpPost: Camera: in DE with consent: holds messages back now"},
+      {with("collect.example", "other.example"),
+       "seed, release: httpPost: sessions that do not require user info: every device: posts to "
+       "https://other.example/events instead of https://collect.example/events"},
+      {with("{key = \"user\", action = \"sha256\", method = 3}", ""),
+       "seed, release: httpPost: Camera: in DE with consent: 'user' leaves in the clear now in messages of "
+       "category 3"},
+      {with("method = 3", "status = 2"),
+       "seed, release: httpPost: Camera: in DE with consent: 'user' leaves only as a digest now in messages "
+       "of type 2"},
+      {with("sha256", "remove"),
+       "seed, release: httpPost: Camera: in DE with consent: 'user' no longer leaves as a digest"},
+      {with("[{", "[{key = \"path\", action = \"remove\"}, {"),
+       "seed, release: httpPost: Camera: in DE with consent: 'path' no longer leaves\n"},
+      {followedBy("[seed.wren]\n"),
+       "seed: httpPost: Camera: in DE with consent: stops reporting, since the backend is gone"},
+      {followedBy("[seed.wren]\n"), "seed: wren: starts to report"},
+      {followedBy("[release.uploadServer]\npost_url = \"https://u/\"\n"),
+       "seed, release: uploadServer: starts to report"},
+      {std::string(kGood), ": 0 errors, 0 warnings, 0 changes"},
+  };
+  TempDirectory files;
+  const std::string old = files.write("old.toml", kGood);
+  for (const auto& [storebag, change] : changes) {
+    const auto outcome = veskreport({"storebag", "check", files.write("z.toml", storebag), "--against", old});
+    const bool isSummary = *change == ':';
+    EXPECT_TRUE(outcome.says((isSummary ? "z.toml" : "change: ") + std::string(change))) << change << "\n"
+                                                                                         << outcome.output;
+    EXPECT_EQ(outcome.status, 0);
+  }
+  const std::string changed = files.write("z.toml", with("[\"DE\"]", "[\"FR\"]"));
+  const auto outcome =
+      veskreport({"storebag", "check", changed, "--against", old, "--device",
+                  "RegionCode=FR,environment=release", "--device", "RegionCode=IT", "--json"});
+  EXPECT_EQ(
+      outcome.output,
+      R"({"status":"done","environment":"release","backend":"httpPost","clients":"Camera",)"
+      R"("devices":"RegionCode=FR,environment=release","change":"starts to report for 50 % of the sessions, )"
+      R"(to https://collect.example/events"})"
+      "\n"
+      R"({"status":"done","errors":0,"warnings":0,"changes":1})"
+      "\n");
+  EXPECT_EQ(veskreport({"storebag", "check", changed, "--device", "RegionCode=FR"}).status, 2);
+}
+
 }  // namespace
 }  // namespace vesk::test

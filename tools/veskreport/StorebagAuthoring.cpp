@@ -6,6 +6,7 @@
 
 #include "platform/log/SystemLog.h"
 #include "tools/storebag/StorebagCases.h"
+#include "tools/storebag/StorebagComparison.h"
 #include "tools/storebag/StorebagEvaluation.h"
 #include "tools/storebag/StorebagReference.h"
 #include "tools/storebag/StorebagReview.h"
@@ -27,6 +28,12 @@ int runReference(const Invocation& invocation, const Output& output) {
                                                   : storebagReferenceAsMarkdown());
 }
 
+template <class T>
+T valueOf(Result<T> result, const std::string& place) {
+  if (!result) throw std::runtime_error(place + ": " + result.error().text);
+  return *std::move(result);
+}
+
 std::string counted(std::size_t number, const std::string& thing) {
   return std::to_string(number) + " " + thing + (number == 1 ? "" : "s");
 }
@@ -46,15 +53,50 @@ std::size_t report(const StorebagFindings& findings, const Invocation& invocatio
   return errors;
 }
 
+/// The devices on the command line.
+std::vector<NamedDevice> devicesOf(const Invocation& invocation) {
+  std::vector<NamedDevice> devices;
+  for (const std::string& argument : invocation.authoring.devices) {
+    const Dictionary facts = valueOf(deviceFactsIn(argument), "--device");
+    devices.push_back(
+        {.region = argument,
+         .device = valueOf(storebagDevice(facts), "--device"),
+         .isOfOneEnvironment = facts.contains("environment") || facts.contains("environmentType")});
+  }
+  return devices;
+}
+
+/// Prints what the storebag changes, and returns the number of changes.
+std::size_t reportChanges(const Dictionary& payload, const Invocation& invocation, const Output& output) {
+  const auto changes =
+      compareStorebags(readAnyStorebag(invocation.authoring.against), payload, devicesOf(invocation));
+  for (const auto& change : changes) {
+    const int written =
+        output.done(printable("change: " + change.line()), {{"environment", change.environment},
+                                                            {"backend", change.backend},
+                                                            {"clients", change.clients},
+                                                            {"devices", change.devices},
+                                                            {"change", change.text}});
+    if (written != kExitDone) throw Exit{written};
+  }
+  return changes.size();
+}
+
 int runCheck(const Invocation& invocation, const Output& output) {
   SystemLog::setLevel(kSilent);
   const Dictionary payload = readAnyStorebag(invocation.source);
   StorebagFindings findings = checkStorebag(payload);
   for (auto& finding : reviewStorebag(payload)) findings.push_back(std::move(finding));
   const std::size_t errors = report(findings, invocation, output), warnings = findings.size() - errors;
-  const std::string summary =
+  std::string summary =
       invocation.source + ": " + counted(errors, "error") + ", " + counted(warnings, "warning");
-  const Dictionary counts{{"errors", errors}, {"warnings", warnings}};
+  MutableDictionary all(Dictionary{{"errors", errors}, {"warnings", warnings}});
+  if (!invocation.authoring.against.empty()) {
+    const std::size_t changes = reportChanges(payload, invocation, output);
+    summary += ", " + counted(changes, "change");
+    all.set("changes", changes);
+  }
+  const Dictionary counts = all.share();
   return errors == 0 ? output.done(summary, counts) : output.failed(summary, counts);
 }
 
@@ -69,12 +111,6 @@ bool reportCase(const StorebagCase& tested, const Dictionary& payload, const Out
                           {"failures", List(std::vector<Value>(failures.begin(), failures.end()))}};
   if (const int written = output.done(lines, fields); written != kExitDone) throw Exit{written};
   return failures.empty();
-}
-
-template <class T>
-T valueOf(Result<T> result, const std::string& place) {
-  if (!result) throw std::runtime_error(place + ": " + result.error().text);
-  return *std::move(result);
 }
 
 int runTest(const Invocation& invocation, const Output& output) {
@@ -131,6 +167,15 @@ void addStorebagAuthoring(CLI::App& storebag, Invocation& invocation) {
   CLI::App* check = add(storebag, invocation, "check", "Find mistakes in a storebag", runCheck);
   check->add_option("storebag", invocation.source, "Storebag as TOML or JSON, or a signed one")->required();
   check->add_flag("--strict", invocation.authoring.strict, "Count warnings as errors");
+  CLI::Option* against = check->add_option("--against", invocation.authoring.against,
+                                           "Show what changes for whom, compared with this storebag");
+  check
+      ->add_option(
+          "--device", invocation.authoring.devices,
+          "Compare for this device: RegionCode=DE,DeviceName=Pine,… or a file with such facts; may be "
+          "repeated (default: all that differ)")
+      ->allow_extra_args(false)
+      ->needs(against);
   check->add_flag("--json", invocation.json, "Print one JSON object per line");
   CLI::App* test = add(storebag, invocation, "test", "Check examples of what a storebag does", runTest);
   test->add_option("cases", invocation.source, "Cases as TOML or JSON")->required();
