@@ -4,6 +4,7 @@
 #include <fstream>
 #include <iterator>
 
+#include "platform/preferences/TomlFile.h"
 #include "tools/json/JSONReader.h"
 #include "tools/storebag/StorebagKeys.h"
 #include "tools/storebag/StorebagReference.h"
@@ -19,6 +20,26 @@ std::string fileNamed(const char* name) {
 TEST(StorebagReference, IsWhatThePagesSay) {
   EXPECT_TRUE(fileNamed("docs/storebag.md").ends_with("\n" + storebagReferenceAsMarkdown()))
       << "replace the end of docs/storebag.md by the output of `veskreport storebag reference`";
+  EXPECT_NE(fileNamed("packaging/man/veskreport-storebag.5").find("\n" + storebagReferenceAsMdoc() + ".Sh "),
+            std::string::npos)
+      << "replace the section KEYS by the output of `veskreport storebag reference --man`";
+}
+
+TEST(StorebagReference, HasEverySettingInTheInstalledSamples) {
+  const struct {
+    const char* file;
+    std::span<const StorebagKey> keys;
+  } samples[] = {{"packaging/device.toml", deviceFactKeys()},
+                 {"packaging/preferences/com.corvane.veskreporting.toml", preferenceKeys()}};
+  for (const auto& [file, keys] : samples) {
+    const std::string sample = fileNamed(file);
+    const auto active = parseToml(sample);
+    EXPECT_TRUE(active && active->empty()) << file << ": every setting must be commented out";
+    for (const auto& key : keys)
+      EXPECT_NE(sample.find("\n#" + std::string(key.key) + " = " + std::string(key.example) + "\n"),
+                std::string::npos)
+          << file << ": " << key.key;
+  }
 }
 
 TEST(StorebagReference, SaysSomethingOfEveryKey) {
@@ -26,6 +47,9 @@ TEST(StorebagReference, SaysSomethingOfEveryKey) {
     for (const auto& key : group.keys) {
       EXPECT_FALSE(key.effect.empty() || key.absent.empty()) << key.key;
       EXPECT_TRUE(key.effect.ends_with(".")) << key.key;
+      if (key.example.empty()) continue;
+      const auto example = parseToml("value = " + std::string(key.example));
+      EXPECT_TRUE(example && hasType(*example->find("value"), key.type)) << key.key;
     }
   }
 }

@@ -49,14 +49,17 @@ constexpr std::array kDeviceFacts{
     StorebagKey{.key = "UniqueDeviceID",
                 .type = KeyType::Text,
                 .effect = "The device's identifier, of at most 40 characters.",
+                .example = "\"00c0ffee00c0ffee\"",
                 .absent = "derived one-way from /etc/machine-id"},
     StorebagKey{.key = "SerialNumber",
                 .type = KeyType::Text,
                 .effect = "In the start messages of internal builds.",
+                .example = "\"C02X1234\"",
                 .absent = "DMI or device tree"},
     StorebagKey{.key = "HWModelStr",
                 .type = KeyType::Text,
                 .effect = "In the start messages of internal builds.",
+                .example = "\"P31AP\"",
                 .absent = "DMI or device tree"},
 };
 
@@ -65,8 +68,8 @@ constexpr std::array kPreferences{
         .key = "environmentType",
         .type = KeyType::Integer,
         .effect =
-            "The environment, see above. 0 names no section, so nothing is reported. Any other number counts "
-            "as 2.",
+            "1 is development, 2 corvane_internal, 3 seed, 4 release. 0 names no section, so nothing is "
+            "reported. Any other number counts as 2.",
         .example = "4",
         .absent = "3",
         .least = 0,
