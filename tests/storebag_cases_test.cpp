@@ -10,6 +10,7 @@ namespace {
 constexpr char kStorebag[] = R"(
 [release.httpPost2]
 clients = []
+[release.wren]
 [release.dashboard]
 ip = "127.0.0.1"
 [[release.httpPost.clients]]
@@ -43,6 +44,8 @@ TEST(StorebagTest, SaysWhichExpectationsDoNotHold) {
        "\"FX\"}}",
        ""},
       {"client = {clientName = \"Camera\", draw = 0.6}\nexpect = {state = \"override\"}", ""},
+      {"backend = \"wren\"\nexpect = {state = \"enabled\"}", ""},
+      {"backend = \"wren\"\ndevice = {ProductType = \"Bramble\"}\nexpect = {state = \"absent\"}", ""},
       {reported + "device = {environment = \"seed\"}\nexpect = {fields = {_internal = 2}}", ""},
       {reported + "device = {httpsPostURL = \"https://here/\"}\nexpect = {url = \"https://here/\"}", ""},
       {reported + "device = {RegionCode = \"FR\"}\nexpect = {state = \"enabled\"}",

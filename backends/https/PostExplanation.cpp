@@ -100,18 +100,6 @@ Dictionary explainPosts(const PostPolicy::Facts& facts, const PostPolicy::Settin
   return all.share();
 }
 
-Dictionary explainSection(const Dictionary& section, const PostPolicy::Facts& session,
-                          const PostPolicy::Settings& initial) {
-  MutableDictionary backends;
-  for (const auto& [name, profile] : section) {
-    if (!isPostBackend(name.view()) || profile.dictionary() == nullptr) continue;
-    PostPolicy::Facts facts = session;
-    facts.profile = *profile.dictionary();
-    backends.set(name, explainPosts(facts, initial));
-  }
-  return backends.share();
-}
-
 PostPolicy::Settings initialPostSettings(bool batchEvents) {
   PostPolicy::Settings settings{._postURL = preferenceStringForKey("httpsPostURL"),
                                 ._realtimePostURL = preferenceStringForKey("httpsRealtimePostURL"),

@@ -20,11 +20,6 @@ std::string reasonOf(const PostPolicy::Step& step);
 /// `verdict`, `value` and `expected`.
 Dictionary explainPosts(const PostPolicy::Facts& facts, const PostPolicy::Settings& initial);
 
-/// What the HTTPS backends of a storebag's section would do, by their names. `session`: all facts but the
-/// profile.
-Dictionary explainSection(const Dictionary& section, const PostPolicy::Facts& session,
-                          const PostPolicy::Settings& initial);
-
 /// The settings that a backend begins with: URLs from the preferences replace those of storebags.
 PostPolicy::Settings initialPostSettings(bool batchEvents);
 

@@ -6,8 +6,8 @@
 #include <set>
 
 #include "backends/https/PostExplanation.h"
-#include "storebag/StorebagFetch.h"
 #include "storebag/StorebagNaming.h"
+#include "storebag/StorebagSection.h"
 #include "tools/storebag/FieldChanges.h"
 #include "tools/storebag/StorebagReview.h"
 

@@ -1,5 +1,7 @@
 #include "tools/storebag/StorebagEvaluation.h"
 
+#include <VeskReporting/VeskReportingKeys.h>
+
 #include "backends/VeskReportingBackend.h"
 #include "backends/https/EventRecord.h"
 #include "backends/https/PostBody.h"
@@ -8,8 +10,9 @@
 #include "protocol/StorebagName.h"
 #include "storebag/Settings.h"
 #include "storebag/StorebagAcceptance.h"
-#include "storebag/StorebagFetch.h"
 #include "storebag/StorebagProfile.h"
+#include "storebag/StorebagSection.h"
+#include "tools/storebag/StorebagKeys.h"
 #include "util/ReportingdUtil.h"
 
 namespace vesk {
@@ -22,6 +25,12 @@ PostPolicy::Settings initialSettings(const StorebagDevice& device, const Storeba
   PostPolicy::Settings settings = device.initial;
   settings._batchEvents = session.batchEvents;
   return settings;
+}
+
+/// Whether such a device makes backends of that name.
+bool hasBackend(const StorebagDevice& device, std::string_view name) {
+  const bool hasNone = name == kVeskReportingBackendWren && device.hardwareType == Text::literal("Bramble");
+  return keyNamed(backendKeys(), name) != nullptr && !hasNone;
 }
 
 BackendIdentity identityOf(const StorebagDevice& device, const StorebagSession& session) {
@@ -67,10 +76,18 @@ Dictionary evaluateStorebag(const Dictionary& payload, const StorebagDevice& dev
                             const StorebagSession& session) {
   const auto section = sectionFor(payload, device, session.clientType);
   if (!section) return {{"problem", section.error().text}};
-  MutableDictionary answer(Dictionary{
-      {"storebag", std::string(*storebagNameForClientType(session.clientType))},
-      {"backends",
-       explainSection(*section, policyFacts({}, device, session), initialSettings(device, session))}});
+  MutableDictionary backends;
+  for (const auto& [name, profile] : *section) {
+    if (profile.dictionary() == nullptr || !hasBackend(device, name.view())) continue;
+    backends.set(name, isPostBackend(name.view())
+                           ? explainPosts(policyFacts(*profile.dictionary(), device, session),
+                                          initialSettings(device, session))
+                           // No policy governs it.
+                           : Dictionary{{"state", std::string(nameOfState(BackendStateEnabled))}});
+  }
+  MutableDictionary answer(
+      Dictionary{{"storebag", std::string(*storebagNameForClientType(session.clientType))},
+                 {"backends", backends.share()}});
   if (const auto version = profileText("storebag", payload, "version")) answer.set("version", *version);
   return answer.share();
 }

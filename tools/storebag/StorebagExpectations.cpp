@@ -37,13 +37,14 @@ class Trial {
 
  private:
   void decide(const Value* profile) {
-    _state = profile != nullptr && isBuilt(_case.backend, *profile) ? "enabled" : "absent";
-    if (_state == "absent" || !isPostBackend(_case.backend)) return;
-    _explanation = *evaluateStorebag(_payload, _case.device, _case.session)
-                        .dictionary("backends")
-                        ->dictionary(_case.backend);
+    const Dictionary backends =
+        evaluateStorebag(_payload, _case.device, _case.session).dictionary("backends").value_or(Dictionary());
+    const auto explanation = backends.dictionary(_case.backend);
+    if (!explanation || !isBuilt(_case.backend, *profile)) return;
+    _explanation = *explanation;
     _state = _explanation.text("state")->string();
-    _event = eventThatLeaves(*profile->dictionary(), _case.device, _case.session, _case.message);
+    if (isPostBackend(_case.backend))
+      _event = eventThatLeaves(*profile->dictionary(), _case.device, _case.session, _case.message);
   }
 
   std::string because() const {
@@ -102,7 +103,7 @@ class Trial {
 
   const StorebagCase& _case;
   const Dictionary& _payload;
-  std::string _state;
+  std::string _state = "absent";
   Dictionary _explanation;
   std::optional<Dictionary> _event;
   std::vector<std::string> _failures;

@@ -1,5 +1,7 @@
 #include "tools/veskreport/StorebagAuthoring.h"
 
+#include <VeskReporting/VeskReportingKeys.h>
+
 #include <CLI/CLI.hpp>
 #include <filesystem>
 #include <stdexcept>
@@ -156,11 +158,12 @@ Dictionary explainOffline(const Invocation& invocation, const Dictionary& reques
   const auto& devices = invocation.authoring.devices;
   const Dictionary facts =
       devices.empty() ? Dictionary() : valueOf(deviceFactsIn(devices.front()), "--device");
-  return evaluateStorebag(readAnyStorebag(invocation.authoring.storebag),
-                          valueOf(storebagDevice(facts), "--device"),
-                          {.clientType = invocation.clientType,
-                           .userInfo = request.dictionary("userInfo"),
-                           .draw = invocation.draw});
+  return evaluateStorebag(
+      readAnyStorebag(invocation.authoring.storebag), valueOf(storebagDevice(facts), "--device"),
+      {.clientType = invocation.clientType,
+       .userInfo = request.dictionary("userInfo"),
+       .requireUserInfo = booleanForKey(request, kVeskReportingSessionInfoRequireUserInfo).value_or(true),
+       .draw = invocation.draw});
 }
 
 void addStorebagAuthoring(CLI::App& storebag, Invocation& invocation) {
