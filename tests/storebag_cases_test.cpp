@@ -69,6 +69,8 @@ TEST(StorebagTest, SaysWhichExpectationsDoNotHold) {
       {"category = 65536", "case[0].category: must be from 0 to 65535"},
       {"device = {RegionCod = \"DE\"}\nexpect = {state = \"enabled\"}",
        "case[0].device.RegionCod: unknown fact; did you mean 'RegionCode'?"},
+      {"device = {RegionCode = \"Germany\"}\nexpect = {state = \"enabled\"}",
+       "case[0].device.RegionCode: must be two letters, is \"Germany\""},
       {"device = {environment = \"relase\"}\nexpect = {state = \"enabled\"}",
        "no environment has the name \"relase\"; did you mean 'release'?"},
       {"device = \"none.toml\"\nexpect = {state = \"enabled\"}", "none.toml: No such file"},
@@ -102,6 +104,7 @@ TEST(StorebagTest, NeedsAStorebagAndCases) {
             R"({"status":"done","cases":1,"failed":0})"
             "\n");
   EXPECT_TRUE(veskreport({"storebag", "test", files.write("no.toml", "")}).says("there is no [[case]]"));
+  EXPECT_EQ(veskreport({"storebag", "test", VESK_SOURCE_DIRECTORY "/examples/zelko-cases.toml"}).status, 0);
 }
 
 TEST(Explain, AnswersWithoutADaemonAsTheDaemonDoes) {

@@ -16,6 +16,11 @@ namespace {
 
 constexpr std::string_view kEnvironment = "environment";
 
+bool isRegionCode(std::string_view text) {
+  const auto isLetter = [](char c) { return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z'); };
+  return text.size() == 2 && std::ranges::all_of(text, isLetter);
+}
+
 /// Why the value can't stand under that key; nullopt if it can.
 std::optional<std::string> problemOf(std::string_view key, const Value& value) {
   if (key == kEnvironment) {
@@ -31,6 +36,8 @@ std::optional<std::string> problemOf(std::string_view key, const Value& value) {
   // A version such as 12 is a number in TOML; the daemon takes its text.
   const bool fits =
       known->type == KeyType::Text ? stringForm(value).has_value() : hasType(value, known->type);
+  if (fits && key == "RegionCode" && !isRegionCode(*stringForm(value)))
+    return "must be two letters, is " + describe(value, 60) + "; the daemon would take it as absent";
   if (fits) return std::nullopt;
   return "must be " + std::string(nameOf(known->type)) + ", is " + describe(value, 60);
 }
