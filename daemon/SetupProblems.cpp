@@ -28,9 +28,9 @@ constexpr std::array<std::string_view, 14> kPreferences{"diagnosticsSubmission",
                                                         "outboxDays",
                                                         "outboxMiB",
                                                         "veskreporting_storebag_url"};
-constexpr std::array<std::string_view, 7> kDeviceFacts{"BuildVersion",   "DeviceName", "ProductType",
-                                                       "ProductVersion", "RegionCode", "ReleaseType",
-                                                       "UniqueDeviceID"};
+constexpr std::array<std::string_view, 9> kDeviceFacts{"BuildVersion", "HWModelStr",  "SerialNumber",
+                                                       "DeviceName",   "ProductType", "ProductVersion",
+                                                       "RegionCode",   "ReleaseType", "UniqueDeviceID"};
 constexpr char kPublicKey[] = "/usr/share/veskreporting/publicKey.der";
 constexpr std::size_t kShown = 64;
 constexpr std::size_t kMostKinds = 64;

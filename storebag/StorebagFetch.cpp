@@ -151,25 +151,6 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryF
   return payload;
 }
 
-std::optional<Dictionary> storebagSectionForEnvironment(const Dictionary& payload,
-                                                        std::int32_t environmentType,
-                                                        std::int32_t clientType) {
-  auto name = environmentNameForType(environmentType);
-  auto section = name ? profileDictionary(kStorebag, payload, *name) : std::nullopt;
-  if (!section && environmentType == kSeedEnvironment) {
-    VESK_LOG_WARNING("fetchStorebagForEnvironmentAndClientType: Seed section is missing in the storebag.");
-    name = "release";
-    section = profileDictionary(kStorebag, payload, *name);
-  }
-  if (!section) {
-    VESK_LOG_ERROR(
-        "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type %d with %s "
-        "environment",
-        clientType, std::string(name.value_or("(none)")).c_str());
-  }
-  return section;
-}
-
 std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
     HTTPClient& http, const LibraryFacts& library, std::int32_t clientType, std::int32_t& maxAge,
     std::optional<std::string>& version, bool& notModified, std::optional<std::string>* lastModified,

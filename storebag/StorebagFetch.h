@@ -12,6 +12,7 @@
 #include "storebag/KeptStorebags.h"
 #include "storebag/SignedDocument.h"
 #include "storebag/StorebagAcceptance.h"
+#include "storebag/StorebagSection.h"
 
 namespace vesk {
 
@@ -51,13 +52,6 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryF
                                                 std::string_view name, std::int32_t& maxAge,
                                                 bool& notModified, std::optional<std::string>* lastModified,
                                                 const KeptStorebags* kept = nullptr);
-
-/// The section of a storebag's payload for an environment type. The section "release" replaces a missing
-/// section "seed". Returns nullopt, with a line of level 3, if there is no section; the line shows "(none)"
-/// for an environment type without a name.
-std::optional<Dictionary> storebagSectionForEnvironment(const Dictionary& payload,
-                                                        std::int32_t environmentType,
-                                                        std::int32_t clientType);
 
 /// Fetches the storebag of a client type as above and returns the section for this device's environment.
 /// `maxAge` is the storebag's own value if it has one. `version` is set if a section is returned.

@@ -269,4 +269,12 @@ const PostPolicy::Step* PostPolicy::Decision::reason() const {
   return step == steps.end() ? nullptr : &*step;
 }
 
+std::optional<std::size_t> PostPolicy::Decision::entry() const {
+  // The service is looked at last, and only if the client passes.
+  const auto step = std::find_if(steps.begin(), steps.end(), [](const Step& each) {
+    return each.rule == "service" && each.verdict == Passes;
+  });
+  return step == steps.end() ? std::nullopt : step->entry;
+}
+
 }  // namespace vesk

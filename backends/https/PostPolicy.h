@@ -69,6 +69,8 @@ struct PostPolicy {
 
     /// The first rule that held reporting back, or null.
     const Step* reason() const;
+    /// The first client entry that is for the session, as an index; nullopt if there is none.
+    std::optional<std::size_t> entry() const;
   };
 
   static Decision decide(const Facts& facts, const Settings& previous);

@@ -6,6 +6,7 @@
 #include <vector>
 
 #include <VeskReporting/values/Value.h>
+#include "tools/storebag/StorebagFindings.h"
 
 namespace vesk {
 
@@ -20,19 +21,17 @@ struct StorebagSource {
   std::vector<std::string> warnings;  ///< lines that begin with the file's name
 };
 
-/// Each finding is a line that begins with the place ("release.httpPost.clients[0].filters: …").
-struct StorebagFindings {
-  std::vector<std::string> errors;    ///< values of a wrong type, which the daemon treats as absent
-  std::vector<std::string> warnings;  ///< allowed, but probably a mistake
-};
-
-/// Checks the payload of a storebag, with its environment sections, backends and their profiles.
-StorebagFindings checkStorebag(const Dictionary& payload);
-
 /// Reads a file of at most 1 MiB as TOML or JSON, depending on its extension (".toml" or ".json"). Throws
 /// std::runtime_error with a message, possibly of several lines, that names the file and the key or line.
 StorebagSource readStorebagSource(const std::filesystem::path& file,
                                   StorebagChecks checks = StorebagChecks::Strict);
+
+/// Reads such a file without checking what it holds. Throws like `readStorebagSource`.
+Dictionary readTomlOrJSON(const std::filesystem::path& file);
+
+/// The payload of a source, or of a signed document, whose signature is not verified. Throws like
+/// `readStorebagSource`.
+Dictionary readAnyStorebag(const std::filesystem::path& file);
 
 /// The payload as a source. Reading it back gives an equal payload as far as the format allows: bytes become
 /// base64 text; in JSON, dates become numbers, and infinities and NaN become text. Throws std::runtime_error

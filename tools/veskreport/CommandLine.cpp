@@ -178,6 +178,7 @@ class Reader {
     explain->add_option("--draw", _invocation.draw, "The session's draw for sampling, from 0 to 1")
         ->check(CLI::Range(0.0, 1.0))
         ->capture_default_str();
+    addOfflineExplain(*explain, _invocation);
   }
 
   void addCompletion() {
@@ -322,6 +323,7 @@ class Reader {
     verify->add_option("--key", _invocation.key, "Public key (DER; default: the installed one)");
     CLI::App* show = add(*storebag, "show", "Show what a signed storebag holds", runStorebagShow);
     show->add_option("storebag", _invocation.source, "Signed storebag")->required();
+    addStorebagAuthoring(*storebag, _invocation);
   }
 
   CLI::App _app;

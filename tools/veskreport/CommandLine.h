@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "tools/veskreport/Output.h"
+#include "tools/veskreport/StorebagAuthoring.h"
 
 namespace vesk {
 
@@ -67,6 +68,7 @@ struct Invocation {
   std::optional<std::string> storebagName;  ///< the signed keys; empty or nullopt: as in the source
   std::optional<std::int64_t> serial;
   std::optional<std::string> expires;  ///< a date, or a date and time of UTC
+  StorebagOptions authoring;
 };
 
 /// Throws `Exit` if the tool should just exit; help, version or error have been printed then.

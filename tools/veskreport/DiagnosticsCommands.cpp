@@ -143,8 +143,10 @@ int runReload(const Invocation& invocation, const Output& output) {
 }
 
 int runExplain(const Invocation& invocation, const Output& output) {
-  const auto explanation =
-      DiagnosticsClient(invocation, output).ask(wire::kExplain, {explanationRequest(invocation, output)});
+  const Dictionary request = explanationRequest(invocation, output);
+  const auto explanation = invocation.authoring.storebag.empty()
+                               ? DiagnosticsClient(invocation, output).ask(wire::kExplain, {request})
+                               : explainOffline(invocation, request);
   if (const auto problem = textIn(explanation, "problem"); !problem.empty())
     return output.failed(problem, explanation);
   return output.done(explanationLines(explanation), explanation);
