@@ -29,6 +29,7 @@ class Outcomes {
   bool isWatched() const noexcept { return _tap->isOpen(); }
   /// Whether what becomes of each message is of interest, and not only what leaves the device or is lost.
   bool watchesMessages() const noexcept { return _tap->wantsMessages(); }
+  bool watchesBodies() const noexcept { return _tap->wantsBodies(); }
   /// `what`: "message", "post", "datagram" or "upload". `outcome`: "held", "posted", "sent", "delivered",
   /// "deferred" or "dropped". docs/wire.md has the facts. Expensive; ask `isWatched` first.
   void show(const char* what, const char* outcome, const Dictionary& facts,

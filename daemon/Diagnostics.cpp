@@ -197,8 +197,9 @@ Dictionary Diagnostics::explain(const Dictionary& request) const {
 std::shared_ptr<DeliveryTap::Reader> Diagnostics::openTap(const IPCPeer& viewer,
                                                           const Dictionary& filter) const {
   MutableDictionary wanted(filter, 1);
-  const bool messages = booleanForKey(filter, "messages").value_or(false);
-  wanted.remove("messages");
+  const DeliveryTap::Wishes wishes{.messages = booleanForKey(filter, "messages").value_or(false),
+                                   .bodies = booleanForKey(filter, "bodies").value_or(false)};
+  for (const char* wish : {"messages", "bodies"}) wanted.remove(wish);
   if (!seesAll(viewer)) wanted.set("user", static_cast<std::int64_t>(viewer.user));
   const auto matches = [wanted = wanted.share()](const Dictionary& record) {
     return std::all_of(wanted.begin(), wanted.end(), [&record](const auto& each) {
@@ -206,7 +207,7 @@ std::shared_ptr<DeliveryTap::Reader> Diagnostics::openTap(const IPCPeer& viewer,
       return value != nullptr && describe(*value) == describe(each.value);
     });
   };
-  return _sources.services.tap->open(matches, messages);
+  return _sources.services.tap->open(matches, wishes);
 }
 
 }  // namespace vesk

@@ -46,8 +46,8 @@ class Diagnostics {
   /// `backends` (PostExplanation.h) by name; or `problem`.
   Dictionary explain(const Dictionary& request) const;
 
-  /// Shows the viewer the records that have each value of `filter`, also of single messages if that has
-  /// `messages` (true): all, or those of its own sessions, as for `status`. Returns null if too many look.
+  /// Shows the viewer the records that have each value of `filter`, with the wishes `messages` and `bodies`
+  /// (true) of that: all, or those of its own sessions, as for `status`. Returns null if too many look.
   std::shared_ptr<DeliveryTap::Reader> openTap(const IPCPeer& viewer, const Dictionary& filter) const;
 
  private:

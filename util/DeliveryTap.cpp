@@ -11,8 +11,8 @@ void DeliveryTap::tell(const Dictionary& record, const std::string& body, Clock:
   }
 }
 
-std::shared_ptr<DeliveryTap::Reader> DeliveryTap::open(Filter filter, bool wantsMessages) {
-  auto reader = std::make_shared<Reader>(*this, std::move(filter), wantsMessages);
+std::shared_ptr<DeliveryTap::Reader> DeliveryTap::open(Filter filter, Wishes wishes) {
+  auto reader = std::make_shared<Reader>(*this, std::move(filter), wishes);
   MutexLock lock(_mutex);
   if (_readers.size() >= kMostReaders) return nullptr;
   _readers.push_back(reader.get());
@@ -28,7 +28,9 @@ void DeliveryTap::close(const Reader* reader) {
 
 void DeliveryTap::update() {
   _isOpen = !_readers.empty();
-  _wantsMessages = std::ranges::any_of(_readers, [](const Reader* reader) { return reader->_wantsMessages; });
+  _wantsMessages =
+      std::ranges::any_of(_readers, [](const Reader* reader) { return reader->_wishes.messages; });
+  _wantsBodies = std::ranges::any_of(_readers, [](const Reader* reader) { return reader->_wishes.bodies; });
 }
 
 bool DeliveryTap::Reader::takesBody(std::size_t bytes, Clock::time_point now) {
@@ -47,7 +49,7 @@ void DeliveryTap::Reader::add(const Dictionary& record, const std::string& body,
     ++_lost;
     return;
   }
-  if (body.empty() || !takesBody(body.size(), now)) {
+  if (body.empty() || !_wishes.bodies || !takesBody(body.size(), now)) {
     _waiting.push_back({record, 0});
   } else {
     MutableDictionary whole(record, 1);

@@ -28,6 +28,12 @@ class DeliveryTap {
   /// The bodies that a reader gets in a second; records beyond that come without one.
   static constexpr std::size_t kBodyBytesPerSecond = std::size_t{1} << 20;
 
+  /// What costs more than a reader usually needs.
+  struct Wishes {
+    bool messages = false;  ///< a record for each message, too, which costs as much as a tenth of the message
+    bool bodies = false;    ///< what was sent
+  };
+
   struct Batch {
     std::vector<Value> records;
     std::uint64_t lost = 0;  ///< since the batch before
@@ -35,8 +41,8 @@ class DeliveryTap {
 
   class Reader {
    public:
-    Reader(DeliveryTap& tap, Filter filter, bool wantsMessages)
-        : _tap(tap), _filter(std::move(filter)), _wantsMessages(wantsMessages) {}
+    Reader(DeliveryTap& tap, Filter filter, Wishes wishes)
+        : _tap(tap), _filter(std::move(filter)), _wishes(wishes) {}
     ~Reader() { _tap.close(this); }
     Reader(const Reader&) = delete;
     Reader& operator=(const Reader&) = delete;
@@ -58,7 +64,7 @@ class DeliveryTap {
 
     DeliveryTap& _tap;
     const Filter _filter;
-    const bool _wantsMessages;
+    const Wishes _wishes;
     Mutex _mutex;  // taken under the tap's
     std::condition_variable_any _added;
     std::deque<Waiting> _waiting VESK_GUARDED_BY(_mutex);
@@ -68,13 +74,15 @@ class DeliveryTap {
   };
 
   bool isOpen() const noexcept { return _isOpen.load(std::memory_order_relaxed); }
-  /// Whether a reader wants a record for each message, too, which costs as much as a tenth of the message.
+  /// Whether a reader has that wish.
   bool wantsMessages() const noexcept { return _wantsMessages.load(std::memory_order_relaxed); }
+  bool wantsBodies() const noexcept { return _wantsBodies.load(std::memory_order_relaxed); }
   /// `body`: what was sent; becomes the record's `body`, unless it is empty or the reader has had too much.
   void tell(const Dictionary& record, const std::string& body = {}, Clock::time_point now = Clock::now());
 
   /// `filter` is called under the tap's lock. Returns null if there are `kMostReaders`.
-  std::shared_ptr<Reader> open(Filter filter, bool wantsMessages = false);
+  std::shared_ptr<Reader> open(Filter filter, Wishes wishes);
+  std::shared_ptr<Reader> open(Filter filter) { return open(std::move(filter), Wishes()); }
 
  private:
   void close(const Reader* reader);
@@ -82,6 +90,7 @@ class DeliveryTap {
 
   std::atomic<bool> _isOpen{false};
   std::atomic<bool> _wantsMessages{false};
+  std::atomic<bool> _wantsBodies{false};
   Mutex _mutex;
   std::vector<Reader*> _readers VESK_GUARDED_BY(_mutex);
 };

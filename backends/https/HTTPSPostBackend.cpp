@@ -320,7 +320,7 @@ void HTTPSPostBackend::postJSONMessage(Post post, std::string json, std::size_t 
     facts.set("url", *post.url);
     facts.set("events", eventCount);
     facts.set("bytes", json.size());
-    shown = std::make_unique<Shown>(Shown{facts.share(), json});
+    shown = std::make_unique<Shown>(Shown{facts.share(), _outcomes->watchesBodies() ? json : std::string()});
   }
   std::string host(hostOfURL(*post.url));
   auto request =

@@ -51,7 +51,8 @@ std::string lineOf(const Dictionary& record) {
 }
 
 Dictionary filterOf(const Invocation& invocation) {
-  MutableDictionary filter(Dictionary{{"messages", invocation.tap.messages}});
+  MutableDictionary filter(
+      Dictionary{{"messages", invocation.tap.messages}, {"bodies", invocation.tap.bodies}});
   if (invocation.tap.clientType) filter.set("clientType", *invocation.tap.clientType);
   if (!invocation.clientName.empty()) filter.set("clientName", invocation.clientName);
   if (!invocation.tap.backend.empty()) filter.set("backend", invocation.tap.backend);
