@@ -56,16 +56,20 @@ void DeliveryTap::Reader::add(const Dictionary& record, const std::string& body,
     whole.set("body", body);
     _waiting.push_back({whole.share(), body.size()});
   }
-  _added.notify_one();
+  if (_waiting.size() == 1 || _waiting.size() == kMostInBatch) _added.notify_one();
+}
+
+void DeliveryTap::Reader::waitFor(std::size_t records, Clock::time_point deadline) {
+  while (_waiting.size() < records && _lost == 0) {
+    if (_added.wait_until(_mutex, deadline) == std::cv_status::timeout) return;
+  }
 }
 
 DeliveryTap::Batch DeliveryTap::Reader::take(Clock::duration patience) {
   Batch batch;
   MutexLock lock(_mutex);
-  const auto deadline = Clock::now() + patience;
-  while (_waiting.empty() && _lost == 0) {
-    if (_added.wait_until(_mutex, deadline) == std::cv_status::timeout) break;
-  }
+  waitFor(1, Clock::now() + patience);
+  if (!_waiting.empty()) waitFor(kMostInBatch, Clock::now() + std::min<Clock::duration>(patience, kGathering));
   for (std::size_t bytes = 0; !_waiting.empty() && batch.records.size() < kMostInBatch;) {
     bytes += _waiting.front().bodyBytes;
     if (!batch.records.empty() && bytes > kBodyBytesInBatch) break;

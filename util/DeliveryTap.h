@@ -54,12 +54,15 @@ class DeliveryTap {
    private:
     friend class DeliveryTap;
     static constexpr std::size_t kMostInBatch = 256;
+    // What comes shortly after the first goes along, so that a busy daemon does not wake the reader for each.
+    static constexpr std::chrono::milliseconds kGathering{20};
     static constexpr std::size_t kBodyBytesInBatch = std::size_t{256} << 10;
     struct Waiting {
       Dictionary record;
       std::size_t bodyBytes;
     };
     void add(const Dictionary& record, const std::string& body, Clock::time_point now);
+    void waitFor(std::size_t records, Clock::time_point deadline) VESK_REQUIRES(_mutex);
     bool takesBody(std::size_t bytes, Clock::time_point now) VESK_REQUIRES(_mutex);
 
     DeliveryTap& _tap;
