@@ -142,10 +142,6 @@ OutboxMode outboxMode() {
   return OutboxMode::Outage;
 }
 
-const char* nameOf(OutboxMode mode) {
-  return mode == OutboxMode::Off ? "off" : mode == OutboxMode::Always ? "always" : "outage";
-}
-
 // In the mode "always" callers wait for this long, so that many of them share a transaction.
 constexpr std::chrono::milliseconds kGroupCommit{50};
 
@@ -224,13 +220,12 @@ struct Daemon::Parts {
         agent(std::make_shared<ReportingdAgent>(
             sessionServices, storebagFetcher(), busyMarker, keptStorebagSource(),
             [this](std::string_view name) { return acceptance.hasExpired(name); })),
-        diagnostics(std::make_shared<Diagnostics>(Diagnostics::Sources{
-            .agent = *agent,
-            .services = backendServices,
-            .outbox = outbox.get(),
-            .settings = {{"outbox", nameOf(mode)}, {"keepStorebags", keptStorebags != nullptr}},
-            .publicKeys = publicKeysDER,
-            .history = history})),
+        diagnostics(std::make_shared<Diagnostics>(Diagnostics::Sources{.agent = *agent,
+                                                                       .services = backendServices,
+                                                                       .outbox = outbox.get(),
+                                                                       .settings = settingsInForce(),
+                                                                       .publicKeys = publicKeysDER,
+                                                                       .history = history})),
         operations(std::make_shared<Operations>(Operations::Sources{.agent = *agent,
                                                                     .services = backendServices,
                                                                     .outbox = outbox.get(),

@@ -165,7 +165,11 @@ Dictionary Diagnostics::explain(const Dictionary& request) const {
     return problem("the storebag '" + std::string(*name) +
                    "' was not fetched yet, since no such client started");
   if (!bag->section) return problem("there is no storebag '" + std::string(*name) + "': its fetch failed");
-  const auto family = deviceName();
+  const Dictionary other = request.dictionary("device").value_or(Dictionary());
+  const auto region = other.text("RegionCode");
+  const auto consent = booleanForKey(other, "diagnosticsSubmission");
+  const auto named = other.text("DeviceName");
+  const auto family = named ? named : deviceName();
   if (!family)
     return problem("the device has no product family (DeviceName), so there are no HTTPS backends");
 
@@ -184,10 +188,10 @@ Dictionary Diagnostics::explain(const Dictionary& request) const {
                       .requireUserInfo =
                           booleanForKey(request, kVeskReportingSessionInfoRequireUserInfo).value_or(true),
                       .productFamily = family->string(),
-                      .regionCode = _sources.services.regionCode(),
-                      .dnuEnabled = _sources.services.diagnosticsSubmissionConsent(),
+                      .regionCode = region ? std::optional(region->string()) : _sources.services.regionCode(),
+                      .dnuEnabled = consent.value_or(_sources.services.diagnosticsSubmissionConsent()),
                       .samplingFactor = draw ? draw->asDouble().value_or(0) : 0},
-                     initialPostSettings(false)));
+                     initialPostSettings(false), explainedMessageIn(request)));
   }
   MutableDictionary answer(Dictionary{{"storebag", std::string(*name)}, {"backends", backends.share()}});
   if (bag->version) answer.set("version", *bag->version);

@@ -25,7 +25,7 @@ class Diagnostics {
     ReportingdAgent& agent;
     const BackendServices& services;
     PostOutbox* outbox;   ///< null: there is none
-    Dictionary settings;  ///< in force
+    Dictionary settings;  ///< in force, as SetupProblems.h has them
     std::function<PublicKeys()> publicKeys;
     const CounterHistory& history;
   };
@@ -42,7 +42,9 @@ class Diagnostics {
   Dictionary status(const IPCPeer& viewer) const;
 
   /// What the backends of the storebag in force would do for `clientType` and `userInfo` in the
-  /// request, `requireUserInfo` (true by default) and `draw` (0 by default): `storebag`, `version`, and
+  /// request, `requireUserInfo` (true by default), `draw` (0 by default), `payload` with `category` and
+  /// `type`, and `device` (other facts than this device's: `DeviceName`, `RegionCode`,
+  /// `diagnosticsSubmission`): `storebag`, `version`, and
   /// `backends` (PostExplanation.h) by name; or `problem`.
   Dictionary explain(const Dictionary& request) const;
 

@@ -6,6 +6,7 @@
 
 #include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
+#include "platform/preferences/PreferencesSuite.h"
 #include "platform/preferences/TomlFile.h"
 #include "platform/text/NearestWord.h"
 #include "storebag/Settings.h"
@@ -31,6 +32,7 @@ constexpr std::array<std::string_view, 14> kPreferences{"diagnosticsSubmission",
 constexpr std::array<std::string_view, 9> kDeviceFacts{"BuildVersion", "HWModelStr",  "SerialNumber",
                                                        "DeviceName",   "ProductType", "ProductVersion",
                                                        "RegionCode",   "ReleaseType", "UniqueDeviceID"};
+constexpr char kSuite[] = "com.corvane.veskreporting";
 constexpr char kPublicKey[] = "/usr/share/veskreporting/publicKey.der";
 constexpr std::size_t kShown = 64;
 constexpr std::size_t kMostKinds = 64;
@@ -51,6 +53,16 @@ void warnOfUnknownKeys(const char* file, const Known& known) {
 void warnOfUnknownSettings() {
   warnOfUnknownKeys("/etc/veskreporting/preferences/com.corvane.veskreporting.toml", kPreferences);
   warnOfUnknownKeys("/etc/veskreporting/device.toml", kDeviceFacts);
+}
+
+Dictionary settingsInForce() {
+  const PreferencesSuite suite(kSuite);
+  MutableDictionary settings;
+  for (const auto key : kPreferences) {
+    if (const auto setting = suite.settingForKey(key))
+      settings.set(key, Dictionary{{"value", setting->value}, {"file", setting->file}});
+  }
+  return settings.share();
 }
 
 void FetchProblems::note(const Fetch& fetch) {

@@ -5,6 +5,8 @@
 #include <map>
 #include <string>
 
+#include <VeskReporting/values/Value.h>
+
 #include "platform/ipc/WarningBurst.h"
 
 namespace vesk {
@@ -12,6 +14,9 @@ namespace vesk {
 /// Keys of the daemon's preferences and of the device's facts that nothing reads, with the nearest known
 /// ones.
 void warnOfUnknownSettings();
+
+/// The preferences that are set, by key: `value` and `file`, the file that it comes from.
+Dictionary settingsInForce();
 
 /// Why storebags can't be fetched, beyond what the fetch itself says. For use by one thread at a time.
 class FetchProblems {

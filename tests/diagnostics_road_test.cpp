@@ -37,6 +37,9 @@ TEST_F(Diagnostics, StatusTellsWhatIsReportedAndWhatIsWrong) {
   told = ask({"status", "--json"});
   const auto status = boost::json::parse(told.text).as_object();
   EXPECT_EQ(status.at("health"), "degraded");
+  const auto setting = status.at("settings").at("environmentType").as_object();
+  EXPECT_EQ(setting.at("value"), 4);
+  EXPECT_TRUE(contains(std::string(setting.at("file").as_string()), "/etc/veskreporting/preferences/com."));
   EXPECT_GE(status.at("outbox").at("posts").as_int64(), 1);
   EXPECT_TRUE(contains(told.text, "posts wait for https://")) << told.text;
 }
@@ -72,6 +75,13 @@ TEST_F(Diagnostics, ExplainGivesTheReasonThatTheDaemonActsUpon) {
     EXPECT_EQ(contains(told.text, "  reports for 100 % of the sessions"), isEnabled) << told.text;
     EXPECT_EQ(harness.stopDaemon(), 0);
   }
+  start(kReports);
+  { session("Camera"); }  // fetches the storebag
+  auto asked = ask({"explain", "--client-type", "5", "--client-name", "Camera", "x=secret", "y:=1"});
+  EXPECT_TRUE(contains(asked.text, "  x is removed\n  y leaves as it is\n")) << asked.text;
+  asked = ask({"explain", "--client-type", "5", "--client-name", "Camera", "--device", "RegionCode=FR"});
+  EXPECT_TRUE(contains(asked.text, "the region 'FR' is not among 'US'")) << asked.text;
+  EXPECT_EQ(harness.stopDaemon(), 0);
   harness.setPreference("diagnosticsSubmission", "false");
   start(kReports);
   const auto client = session("Camera");

@@ -69,7 +69,8 @@ DeliveryTap::Batch DeliveryTap::Reader::take(Clock::duration patience) {
   Batch batch;
   MutexLock lock(_mutex);
   waitFor(1, Clock::now() + patience);
-  if (!_waiting.empty()) waitFor(kMostInBatch, Clock::now() + std::min<Clock::duration>(patience, kGathering));
+  if (!_waiting.empty())
+    waitFor(kMostInBatch, Clock::now() + std::min<Clock::duration>(patience, kGathering));
   for (std::size_t bytes = 0; !_waiting.empty() && batch.records.size() < kMostInBatch;) {
     bytes += _waiting.front().bodyBytes;
     if (!batch.records.empty() && bytes > kBodyBytesInBatch) break;

@@ -5,6 +5,7 @@
 #include <algorithm>
 
 #include "backends/VeskReportingBackend.h"
+#include "backends/https/EventFilters.h"
 #include "storebag/Settings.h"
 
 namespace vesk {
@@ -45,6 +46,21 @@ std::string shown(const Value& value) {
   return describe(value);
 }
 
+Dictionary filtered(const ExplainedMessage& message, const List& list) {
+  EventFilters filters;
+  filters.createFiltersFromArray(list, "explain");
+  // Filters may be for one category and type.
+  MutableDictionary event(message.payload, 2);
+  event.set("_method", static_cast<unsigned>(message.category));
+  event.set("_status", static_cast<unsigned>(message.type));
+  filters.filterEvent(event);
+  MutableDictionary left;
+  for (const auto& [key, value] : message.payload) {
+    if (const Value* now = event.find(key.view())) left.set(key, *now);
+  }
+  return left.share();
+}
+
 Dictionary described(const PostPolicy::Step& step) {
   MutableDictionary all(
       Dictionary{{"rule", std::string(step.rule)}, {"verdict", std::string(nameOfVerdict(step.verdict))}});
@@ -82,7 +98,17 @@ std::string reasonOf(const PostPolicy::Step& step) {
   return "the draw " + value + " is above the sampling_threshold and override_sampling " + expected;
 }
 
-Dictionary explainPosts(const PostPolicy::Facts& facts, const PostPolicy::Settings& initial) {
+std::optional<ExplainedMessage> explainedMessageIn(const Dictionary& request) {
+  const auto payload = request.dictionary("payload");
+  if (!payload) return std::nullopt;
+  const auto number = [&](const char* key) {
+    return static_cast<std::uint16_t>(integerForKey(request, key).value_or(0));
+  };
+  return ExplainedMessage{*payload, number("category"), number("type")};
+}
+
+Dictionary explainPosts(const PostPolicy::Facts& facts, const PostPolicy::Settings& initial,
+                        const std::optional<ExplainedMessage>& message) {
   const auto decision = PostPolicy::decide(facts, initial);
   MutableDictionary all(Dictionary{{"state", std::string(nameOfState(decision.state))},
                                    {"batchEvents", decision.settings._batchEvents}});
@@ -91,6 +117,7 @@ Dictionary explainPosts(const PostPolicy::Facts& facts, const PostPolicy::Settin
   if (decision.settings._postURL) all.set("postURL", *decision.settings._postURL);
   if (decision.settings._realtimePostURL) all.set("realtimePostURL", *decision.settings._realtimePostURL);
   if (decision.filters) all.set("filters", *decision.filters);
+  if (decision.filters && message) all.set("payload", filtered(*message, *decision.filters));
   if (decision.samplingThreshold) {
     all.set("samplingShare", std::clamp(decision.samplingThreshold->asDouble().value_or(0), 0.0, 1.0));
   }

@@ -49,23 +49,30 @@ std::optional<std::string> userConfigurationDirectory() {
   return std::nullopt;
 }
 
-Dictionary readSuite(const std::string& directory, std::string_view suite, TrustedOwner owner) {
-  return readTomlFile(pathUnderRoot(directory + "/veskreporting/preferences/" + std::string(suite) + ".toml"),
-                      owner);
-}
-
 }  // namespace
 
 PreferencesSuite::PreferencesSuite(std::string_view suite) {
   if (suite.size() > 128 || !isPlainFileName(suite)) return;
-  _system = readSuite("/etc", suite, TrustedOwner::Root);
-  if (auto user = userConfigurationDirectory()) _user = readSuite(*user, suite, TrustedOwner::OwnUser);
+  const auto read = [&](const std::string& directory, TrustedOwner owner) {
+    std::string path =
+        pathUnderRoot(directory + "/veskreporting/preferences/" + std::string(suite) + ".toml");
+    Dictionary settings = readTomlFile(path, owner);
+    _files.push_back({std::move(path), std::move(settings)});
+  };
+  read("/etc", TrustedOwner::Root);
+  if (auto user = userConfigurationDirectory()) read(*user, TrustedOwner::OwnUser);
+}
+
+std::optional<PreferencesSuite::Setting> PreferencesSuite::settingForKey(std::string_view key) const {
+  for (auto file = _files.rbegin(); file != _files.rend(); ++file) {
+    if (const Value* value = file->settings.find(key)) return Setting{*value, file->path};
+  }
+  return std::nullopt;
 }
 
 std::optional<Value> PreferencesSuite::valueForKey(std::string_view key) const {
-  if (const Value* value = _user.find(key)) return *value;
-  if (const Value* value = _system.find(key)) return *value;
-  return std::nullopt;
+  auto setting = settingForKey(key);
+  return setting ? std::optional(std::move(setting->value)) : std::nullopt;
 }
 
 }  // namespace vesk

@@ -4,6 +4,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include <VeskReporting/values/Value.h>
 
@@ -26,9 +27,19 @@ class PreferencesSuite {
   /// The value under `key`, a top-level key of the files.
   std::optional<Value> valueForKey(std::string_view key) const;
 
+  /// The same, with the path of the file.
+  struct Setting {
+    Value value;
+    std::string file;
+  };
+  std::optional<Setting> settingForKey(std::string_view key) const;
+
  private:
-  Dictionary _user;
-  Dictionary _system;
+  struct File {
+    std::string path;
+    Dictionary settings;
+  };
+  std::vector<File> _files;  ///< the last that has a key decides
 };
 
 }  // namespace vesk

@@ -81,7 +81,7 @@ Dictionary evaluateStorebag(const Dictionary& payload, const StorebagDevice& dev
     if (profile.dictionary() == nullptr || !hasBackend(device, name.view())) continue;
     backends.set(name, isPostBackend(name.view())
                            ? explainPosts(policyFacts(*profile.dictionary(), device, session),
-                                          initialSettings(device, session))
+                                          initialSettings(device, session), session.message)
                            // No policy governs it.
                            : Dictionary{{"state", std::string(nameOfState(BackendStateEnabled))}});
   }

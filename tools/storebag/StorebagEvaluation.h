@@ -6,6 +6,7 @@
 #include <string_view>
 
 #include <VeskReporting/values/Value.h>
+#include "backends/https/PostExplanation.h"
 #include "platform/result/Result.h"
 #include "tools/storebag/StorebagDevice.h"
 
@@ -18,6 +19,7 @@ struct StorebagSession {
   bool requireUserInfo = true;
   bool batchEvents = false;
   double draw = 0;
+  std::optional<ExplainedMessage> message{};  ///< to explain
 };
 
 /// One of its messages.

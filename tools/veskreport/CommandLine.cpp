@@ -178,6 +178,9 @@ class Reader {
     explain->add_option("--draw", _invocation.draw, "The session's draw for sampling, from 0 to 1")
         ->check(CLI::Range(0.0, 1.0))
         ->capture_default_str();
+    explain->add_option("payload", _invocation.payload, "A message's payload, key=text and key:=json");
+    explain->add_option("-c,--category", _invocation.category, "The message's category, for filters");
+    explain->add_option("-t,--type", _invocation.type, "The message's type, for filters");
     addOfflineExplain(*explain, _invocation);
   }
 

@@ -11,6 +11,7 @@
 #include "platform/files/RootPrefix.h"
 #include "tools/text/Printable.h"
 #include "tools/veskreport/DaemonSession.h"
+#include "tools/veskreport/PayloadParser.h"
 
 namespace vesk {
 
@@ -64,6 +65,14 @@ Dictionary explanationRequest(const Invocation& invocation, const Output& output
                                        {kVeskReportingSessionInfoRequireUserInfo, invocation.requireUserInfo},
                                        {"draw", invocation.draw}});
   if (const auto userInfo = userInfoOf(invocation, output)) request.set("userInfo", *userInfo);
+  if (!invocation.payload.empty()) {
+    auto payload = parsePairs(invocation.payload);
+    if (!payload) output.fail(payload.error().text, kExitUsage);
+    request.set("payload", *std::move(payload));
+    request.set("category", int{invocation.category.value_or(1)});
+    request.set("type", int{invocation.type.value_or(0)});
+  }
+  if (const auto device = explainedDevice(invocation)) request.set("device", *device);
   return request.share();
 }
 

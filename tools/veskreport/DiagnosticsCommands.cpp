@@ -48,7 +48,20 @@ std::string openMetrics(const Dictionary& status) {
   return text + "# EOF\n";
 }
 
-std::vector<std::string> explanationLines(const Dictionary& explanation) {
+/// What filters make of each entry of the payload.
+std::vector<std::string> payloadLines(const Dictionary& payload, const Dictionary& left) {
+  std::vector<std::string> lines;
+  for (const auto& [key, value] : payload) {
+    const Value* now = left.find(key.view());
+    std::string fate = " is removed";
+    if (now)
+      fate = *now == value ? " leaves as it is" : " is digested: " + textIn(left, key.string().c_str());
+    lines.push_back("  " + printable(key.view()) + fate);
+  }
+  return lines;
+}
+
+std::vector<std::string> explanationLines(const Dictionary& explanation, const Dictionary& payload) {
   std::vector<std::string> lines{"storebag " + textIn(explanation, "storebag") + ", version " +
                                  textIn(explanation, "version")};
   for (const auto& [name, value] : dictionaryIn(explanation, "backends")) {
@@ -69,6 +82,10 @@ std::vector<std::string> explanationLines(const Dictionary& explanation) {
       std::snprintf(text, sizeof text, "  reports for %.4g %% of the sessions",
                     100 * share->asDouble().value_or(0));
       lines.emplace_back(text);
+    }
+    if (backend->find("payload") != nullptr) {
+      for (auto& line : payloadLines(payload, dictionaryIn(*backend, "payload")))
+        lines.push_back(std::move(line));
     }
     if (const auto url = textIn(*backend, "postURL"); !url.empty()) lines.push_back("  posts to " + url);
   }
@@ -149,7 +166,7 @@ int runExplain(const Invocation& invocation, const Output& output) {
                                : explainOffline(invocation, request);
   if (const auto problem = textIn(explanation, "problem"); !problem.empty())
     return output.failed(problem, explanation);
-  return output.done(explanationLines(explanation), explanation);
+  return output.done(explanationLines(explanation, dictionaryIn(request, "payload")), explanation);
 }
 
 }  // namespace vesk

@@ -144,26 +144,30 @@ CLI::App* add(CLI::App& storebag, Invocation& invocation, const char* name, cons
 }  // namespace
 
 void addOfflineExplain(CLI::App& explain, Invocation& invocation) {
-  CLI::Option* storebag = explain.add_option("--storebag", invocation.authoring.storebag,
-                                             "Decide by this storebag, without a daemon (see --device)");
+  explain.add_option("--storebag", invocation.authoring.storebag,
+                     "Decide by this storebag, without a daemon (see --device)");
   explain
       .add_option("--device", invocation.authoring.devices,
                   "The device to decide for: RegionCode=DE,DeviceName=Pine,… or a file with such facts")
-      ->expected(1)
-      ->needs(storebag);
+      ->expected(1);
+}
+
+std::optional<Dictionary> explainedDevice(const Invocation& invocation) {
+  const auto& devices = invocation.authoring.devices;
+  if (devices.empty()) return std::nullopt;
+  return valueOf(deviceFactsIn(devices.front()), "--device");
 }
 
 Dictionary explainOffline(const Invocation& invocation, const Dictionary& request) {
   SystemLog::setLevel(kSilent);
-  const auto& devices = invocation.authoring.devices;
-  const Dictionary facts =
-      devices.empty() ? Dictionary() : valueOf(deviceFactsIn(devices.front()), "--device");
+  const Dictionary facts = explainedDevice(invocation).value_or(Dictionary());
   return evaluateStorebag(
       readAnyStorebag(invocation.authoring.storebag), valueOf(storebagDevice(facts), "--device"),
       {.clientType = invocation.clientType,
        .userInfo = request.dictionary("userInfo"),
        .requireUserInfo = booleanForKey(request, kVeskReportingSessionInfoRequireUserInfo).value_or(true),
-       .draw = invocation.draw});
+       .draw = invocation.draw,
+       .message = explainedMessageIn(request)});
 }
 
 void addStorebagAuthoring(CLI::App& storebag, Invocation& invocation) {

@@ -1,6 +1,7 @@
 // The commands for people who write storebags: they need neither a key nor a daemon.
 #pragma once
 
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -25,6 +26,8 @@ struct StorebagOptions {
 
 /// Adds the options with which `explain` needs no daemon.
 void addOfflineExplain(CLI::App& explain, Invocation& invocation);
+/// The facts that the command line gives to `explain`.
+std::optional<Dictionary> explainedDevice(const Invocation& invocation);
 /// The daemon's answer to that request of `explain`, for the storebag and the device on the command line.
 /// Throws std::runtime_error if they can't be read.
 Dictionary explainOffline(const Invocation& invocation, const Dictionary& request);
