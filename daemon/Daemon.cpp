@@ -259,12 +259,11 @@ struct Daemon::Parts {
 
   StorebagFetcher storebagFetcher() {
     return [this](std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version,
-                  bool& notModified, std::optional<std::string>& lastModified) {
-      long status = 0;
-      const LibraryFacts library{sessionServices.libraryVersion, publicKeysDER, &acceptance, &status};
+                  bool& notModified, std::optional<std::string>& lastModified, FetchFacts& facts) {
+      const LibraryFacts library{sessionServices.libraryVersion, publicKeysDER, &acceptance, &facts};
       auto section = fetchStorebagForEnvironmentAndClientType(
           http, library, clientType, maxAge, version, notModified, &lastModified, keptStorebags.get());
-      if (!section && !notModified) fetchProblems.note({clientType, status, !publicKeysDER().empty()});
+      if (!section && !notModified) fetchProblems.note({clientType, facts.status, !publicKeysDER().empty()});
       return section;
     };
   }

@@ -18,6 +18,7 @@ namespace vesk {
 namespace {
 
 constexpr char kGroup[] = "veskreporting";
+constexpr char kMessageLog[] = "message-log";
 constexpr double kNearlyFull = 0.8;
 
 std::optional<gid_t> idOfGroup(const char* name) {
@@ -62,6 +63,9 @@ Dictionary Diagnostics::status(const IPCPeer& viewer) const {
   List found;
   const List bags = storebags(found);
   add(found);
+  for (const auto& [backend, reason, count] : _sources.services.counters.snapshot()) {
+    if (backend == kMessageLog) problems.emplace_back("the local message log can't be written");
+  }
   const Dictionary outbox = outboxStatus(found);
   add(found);
   const auto now = std::chrono::steady_clock::now();
@@ -105,6 +109,8 @@ List Diagnostics::storebags(List& problems) const {
                                                                : "old"},
                                      {"maxAge", static_cast<std::int64_t>(status.maxAge)}});
     if (status.version) bag.set("version", *status.version);
+    if (!status.origin.empty()) bag.set("origin", status.origin);
+    if (!status.key.empty()) bag.set("key", status.key);
     if (status.fetched) bag.set("age", std::chrono::duration<double>(now - *status.fetched).count());
     all.emplace_back(bag.share());
     if (!status.section) {
@@ -137,7 +143,8 @@ Dictionary Diagnostics::outboxStatus(List& problems) const {
   for (const auto& [name, host] : status.hosts) {
     const double wait = std::max(0.0, secondsBetween(now, host.next));
     hosts.emplace_back(Dictionary{{"host", name}, {"posts", number(host.posts)}, {"nextAttempt", wait}});
-    wrong.emplace_back(std::to_string(host.posts) + " posts wait for " + name);
+    wrong.emplace_back(std::to_string(host.posts) + " posts wait for " + name + ", which has been away for " +
+                       std::to_string(static_cast<long>(secondsBetween(host.since, now))) + " s");
   }
   const double used = static_cast<double>(status.bytes) /
                       static_cast<double>(std::max<std::uint64_t>(status.maximumBytes, 1));

@@ -61,12 +61,15 @@ void StorebagCache::fetchAndCacheStorebag(std::int32_t clientType) {
   std::optional<std::string> version;
   bool notModified = false;
   std::optional<std::string> lastModified = record.storebagLastModified;
-  auto section = _fetch(clientType, maxAge, version, notModified, lastModified);
+  FetchFacts facts;
+  auto section = _fetch(clientType, maxAge, version, notModified, lastModified, facts);
   VESK_LOG_DEBUG("fetchAndCacheStorebag: Storebag max age: %d seconds", maxAge);
   bool successful = section || notModified;
   if (section) {
     record.storebagData = std::move(section);
     record.storebagVersion = std::move(version);
+    record.origin = std::move(facts.origin);
+    record.key = std::move(facts.key);
   } else if (!notModified) {
     VESK_LOG_ERROR("fetchAndCacheStorebag: Unable to fetch storebag for client type %d", clientType);
   }
@@ -88,7 +91,9 @@ void StorebagCache::publish(const std::string& name, const Record& record) {
                       .version = record.storebagVersion,
                       .fetched = record.storebagFetchTime,
                       .isGood = record.storebagFetchState == FetchState::Successful,
-                      .maxAge = record.storebagMaxAge};
+                      .maxAge = record.storebagMaxAge,
+                      .origin = record.origin,
+                      .key = record.key};
 }
 
 std::vector<StorebagStatus> StorebagCache::status() const {
@@ -105,6 +110,7 @@ std::optional<StorebagCache::Record> StorebagCache::keptRecord(std::int32_t clie
   record.storebagData = std::move(kept->section);
   record.storebagVersion = std::move(kept->version);
   record.storebagLastModified = std::move(kept->lastModified);
+  record.origin = "kept on disk";
   const auto due =
       std::chrono::duration_cast<std::chrono::seconds>(KeptStorebagSource::kSpread * _kept->random());
   const auto wait = due - _kept->uptime();

@@ -21,7 +21,7 @@ namespace vesk {
 /// Fetches the section of a client type's storebag that applies to this device. Blocks during the request.
 using StorebagFetcher = std::function<std::optional<Dictionary>(
     std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
-    std::optional<std::string>& lastModified)>;
+    std::optional<std::string>& lastModified, FetchFacts& facts)>;
 
 /// Whether the storebag of that name that is in force has expired.
 using StorebagExpiry = std::function<bool(std::string_view name)>;
@@ -50,6 +50,8 @@ struct StorebagStatus {
   std::optional<WallTime> fetched;  ///< the end of the last attempt
   bool isGood = false;              ///< the last attempt succeeded
   std::int32_t maxAge = 0;          ///< seconds
+  std::string origin{};             ///< its URL, "built in" or "kept on disk"
+  std::string key{};                ///< that verified it, unless it was kept or is built in
 };
 
 /// Keeps one record per storebag name, in memory, for the life of the daemon. Except for `status`, not
@@ -85,6 +87,8 @@ class StorebagCache {
     FetchState storebagFetchState = FetchState::Failure;
     std::int32_t storebagMaxAge = 0;  // seconds, as reported by the last attempt
     std::optional<std::string> storebagLastModified;
+    std::string origin;
+    std::string key;
   };
 
   /// Whether the record may be served without a fetch. Logs the reason.

@@ -2,6 +2,7 @@
 #pragma once
 
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include <VeskReporting/values/Value.h>
@@ -21,8 +22,12 @@ struct Verification {
   };
   Verdict verdict = Verdict::Unusable;
   Dictionary payload{};               ///< if good
+  std::string key{};                  ///< if good: names the key that made the signature, see nameOfPublicKey
   const void* keyIdentity = nullptr;  ///< of the first key, if the signature is wrong
 };
+
+/// The first 16 hexadecimal digits of the SHA-256 of the key's file.
+std::string nameOfPublicKey(std::string_view der);
 
 /// Verifies the signature of a parsed document with any of the keys. Logs nothing.
 Verification verifySignedDocument(const Dictionary& document, const PublicKeys& keys);

@@ -71,6 +71,7 @@ std::optional<Dictionary> verifiedPayload(const Dictionary& document, const Libr
                        accepted.error().text.c_str());
         break;
       }
+      if (library.facts) library.facts->key = verification.key;
       return std::move(verification.payload);
     case Verdict::SignatureMissing:
       VESK_LOG_ERROR("fetchStorebagWithName: Signature is missing");
@@ -138,15 +139,17 @@ std::optional<Dictionary> fetchStorebagWithName(HTTPClient& http, const LibraryF
     if (kept && kept->load(name)) return std::nullopt;
     VESK_LOG_INFO("fetchStorebagWithName: Loading default storebag '%s'", std::string(name).c_str());
     if (library.acceptance) library.acceptance->usesBuiltIn(name);
+    if (library.facts) library.facts->origin = "built in";
     return fallbackStorebag();
   }
-  if (library.status) *library.status = result.response->status;
+  if (library.facts) library.facts->status = result.response->status;
   maxAge = maxAgeFromCacheControl(listInHeader(*result.response, "Cache-Control"));
   if (hasNotChanged(*result.response, lastModified)) {
     notModified = true;
     return std::nullopt;
   }
   auto payload = verifiedPayload(documentIn(result.response->body), library, name);
+  if (payload && library.facts) library.facts->origin = url;
   if (payload && kept) kept->keep(name, result.response->body, lastModified ? *lastModified : std::nullopt);
   return payload;
 }

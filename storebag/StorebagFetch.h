@@ -16,6 +16,13 @@
 
 namespace vesk {
 
+/// What a fetch finds out besides the storebag, for operators.
+struct FetchFacts {
+  long status = 0;       ///< the server's; 0: it did not answer
+  std::string origin{};  ///< of the storebag: its URL, or "built in"
+  std::string key{};     ///< that verified it, see nameOfPublicKey
+};
+
 /// What a fetch uses from the client library's installation.
 struct LibraryFacts {
   std::string version;
@@ -23,8 +30,8 @@ struct LibraryFacts {
   std::function<PublicKeys()> publicKeys;
   /// Checks the optional signed keys. Null: they are not checked.
   StorebagAcceptance* acceptance = nullptr;
-  /// If not null, gets the HTTP status of each answer.
-  long* status = nullptr;
+  /// If not null, gets what a fetch finds out besides the storebag.
+  FetchFacts* facts = nullptr;
 };
 
 /// The maximum age in seconds that a "Cache-Control" header gives a storebag; 86400 if the header is absent

@@ -37,7 +37,7 @@ class AgentStorebags : public testing::Test {
   }
   std::optional<Dictionary> fetch(std::int32_t clientType, std::int32_t& maxAge,
                                   std::optional<std::string>& version, bool& notModified,
-                                  std::optional<std::string>& lastModified) {
+                                  std::optional<std::string>& lastModified, FetchFacts&) {
     EXPECT_TRUE(maxAge == 0 && !version && !notModified);
     fetched.push_back(clientType);
     previous = lastModified;

@@ -37,6 +37,9 @@ TEST_F(Diagnostics, StatusTellsWhatIsReportedAndWhatIsWrong) {
   told = ask({"status", "--json"});
   const auto status = boost::json::parse(told.text).as_object();
   EXPECT_EQ(status.at("health"), "degraded");
+  const auto bag = status.at("storebags").at(0).as_object();
+  EXPECT_TRUE(contains(std::string(bag.at("origin").as_string()), "/bags/sorrel/zelko?version="));
+  EXPECT_EQ(bag.at("key").as_string().size(), 16u);
   const auto setting = status.at("settings").at("environmentType").as_object();
   EXPECT_EQ(setting.at("value"), 4);
   EXPECT_TRUE(contains(std::string(setting.at("file").as_string()), "/etc/veskreporting/preferences/com."));

@@ -276,7 +276,8 @@ void PostOutbox::publish() {
   Status status;
   for (const auto& [name, posts] : _storage.countByHost()) {
     const auto host = _hosts.find(name);
-    status.hosts[name] = {posts, host == _hosts.end() ? Instant{} : host->second.backoff.next()};
+    status.hosts[name] = {posts, host == _hosts.end() ? Instant{} : host->second.backoff.next(),
+                          host == _hosts.end() ? std::chrono::steady_clock::now() : host->second.since};
     status.posts += posts;
   }
   status.bytes = _storage.bytes();

@@ -90,7 +90,8 @@ class PostOutbox final : public PostKeeper {
   struct Status {
     struct Host {
       std::uint64_t posts = 0;
-      std::chrono::steady_clock::time_point next{};  ///< the next attempt; in the past if posts go out
+      std::chrono::steady_clock::time_point next{};   ///< the next attempt; in the past if posts go out
+      std::chrono::steady_clock::time_point since{};  ///< when the first of them was put aside, or the start
     };
     std::map<std::string, Host> hosts;
     std::uint64_t posts = 0;
@@ -138,6 +139,7 @@ class PostOutbox final : public PostKeeper {
     std::size_t sending = 0;
     std::int64_t lastRead = 0;  ///< posts up to this ID were read
     Instant readAgain{};        ///< when no more were found
+    Instant since = std::chrono::steady_clock::now();
   };
   /// What other threads want from the outbox's thread.
   struct Inbox {

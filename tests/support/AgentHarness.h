@@ -104,7 +104,7 @@ class AgentHarness : public BackendHarness {
       : agent(std::make_shared<ReportingdAgent>(
             sessionServices,
             [this](std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool&,
-                   std::optional<std::string>&) -> std::optional<Dictionary> {
+                   std::optional<std::string>&, FetchFacts&) -> std::optional<Dictionary> {
               auto section = storebags.find(clientType);
               if (section == storebags.end()) return std::nullopt;
               maxAge = 3600;
