@@ -36,6 +36,12 @@ double secondsBetween(std::chrono::steady_clock::time_point from, std::chrono::s
 
 Value number(std::uint64_t value) { return Value(static_cast<std::int64_t>(value)); }
 
+/// Numbers may come with any sign and width.
+bool isSame(const Value& a, const Value& b) {
+  const auto number = a.asInteger(), other = b.asInteger();
+  return number && other ? *number == *other : a == b;
+}
+
 Dictionary problem(const std::string& text) { return Dictionary{{"problem", text}}; }
 
 List described(const std::vector<Counters::Count>& counts) {
@@ -69,20 +75,23 @@ Dictionary Diagnostics::status(const IPCPeer& viewer) const {
   const Dictionary outbox = outboxStatus(found);
   add(found);
   const auto now = std::chrono::steady_clock::now();
-  return Dictionary{
+  MutableDictionary status(Dictionary{
       {"health", problems.empty() ? "ok" : "degraded"},
       {"reasons", List(std::move(problems))},
       {"version", VESK_VERSION},
       {"process", static_cast<std::int64_t>(::getpid())},
       {"uptime", secondsBetween(_begun, now)},
       {"environment", std::string(environmentNameForType(currentEnvironmentType()).value_or("(none)"))},
-      {"settings", _sources.settings},
-      {"storebags", bags},
       {"sessions", sessions(viewer)},
-      {"outbox", outbox},
       {"counters", described(_sources.services.counters.snapshot())},
-      {"total", described(_sources.history.total())},
-      {"lastPosts", lastPosts()}};
+      {"total", described(_sources.history.total())}});
+  if (seesAll(viewer)) {
+    status.setAll({{"settings", _sources.settings},
+                   {"storebags", bags},
+                   {"outbox", outbox},
+                   {"lastPosts", lastPosts()}});
+  }
+  return status.share();
 }
 
 bool Diagnostics::seesAll(const IPCPeer& viewer) const {
@@ -211,14 +220,17 @@ std::shared_ptr<DeliveryTap::Reader> Diagnostics::openTap(const IPCPeer& viewer,
   const DeliveryTap::Wishes wishes{.messages = booleanForKey(filter, "messages").value_or(false),
                                    .bodies = booleanForKey(filter, "bodies").value_or(false)};
   for (const char* wish : {"messages", "bodies"}) wanted.remove(wish);
-  if (!seesAll(viewer)) wanted.set("user", static_cast<std::int64_t>(viewer.user));
+  const bool everything = seesAll(viewer);
+  if (!everything) wanted.set("user", static_cast<std::int64_t>(viewer.user));
   const auto matches = [wanted = wanted.share()](const Dictionary& record) {
     return std::all_of(wanted.begin(), wanted.end(), [&record](const auto& each) {
       const Value* value = record.find(each.key.view());
-      return value != nullptr && describe(*value) == describe(each.value);
+      return value != nullptr && isSame(*value, each.value);
     });
   };
-  return _sources.services.tap->open(matches, wishes);
+  // Others must not take the operators' places.
+  const std::size_t most = DeliveryTap::kMostReaders / (everything ? 1 : 2);
+  return _sources.services.tap->open(matches, wishes, most);
 }
 
 }  // namespace vesk

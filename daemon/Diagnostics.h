@@ -37,8 +37,8 @@ class Diagnostics {
   bool seesAll(const IPCPeer& viewer) const;
 
   /// `health` ("ok" or "degraded") and `reasons`, `version`, `uptime` in seconds, `environment`, `settings`,
-  /// `storebags`, `sessions` (all, or the viewer's own), `outbox`, `counters`, `total`, `lastPosts`
-  /// (docs/wire.md).
+  /// `storebags`, `sessions`, `outbox`, `counters`, `total`, `lastPosts` (docs/wire.md). Others than those
+  /// who see all get their own sessions, the health and the counters.
   Dictionary status(const IPCPeer& viewer) const;
 
   /// What the backends of the storebag in force would do for `clientType` and `userInfo` in the

@@ -71,8 +71,8 @@ Dictionary Operations::removeFromOutbox(const Dictionary& request) {
 
 Dictionary Operations::applyConsent() {
   const auto& services = _sources.services;
-  const bool consent = services.diagnosticsSubmissionConsent();
   const std::uint64_t before = withdrawnEvents(services.counters);
+  const bool consent = services.diagnosticsSubmissionConsent();  // without it, the outbox begins to delete
   *services.consentWithdrawn = !consent;
   if (!consent) {
     if (_sources.outbox) _sources.outbox->withdrawConsent();

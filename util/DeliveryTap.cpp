@@ -11,10 +11,10 @@ void DeliveryTap::tell(const Dictionary& record, const std::string& body, Clock:
   }
 }
 
-std::shared_ptr<DeliveryTap::Reader> DeliveryTap::open(Filter filter, Wishes wishes) {
+std::shared_ptr<DeliveryTap::Reader> DeliveryTap::open(Filter filter, Wishes wishes, std::size_t most) {
   auto reader = std::make_shared<Reader>(*this, std::move(filter), wishes);
   MutexLock lock(_mutex);
-  if (_readers.size() >= kMostReaders) return nullptr;
+  if (_readers.size() >= most) return nullptr;
   _readers.push_back(reader.get());
   update();
   return reader;
@@ -38,8 +38,11 @@ bool DeliveryTap::Reader::takesBody(std::size_t bytes, Clock::time_point now) {
     _secondBegan = now;
     _bodyBytes = 0;
   }
-  if (bytes > kBodyBytesInBatch || _bodyBytes + bytes > kBodyBytesPerSecond) return false;
+  if (bytes > kBodyBytesInBatch || _bodyBytes + bytes > kBodyBytesPerSecond ||
+      _waitingBodyBytes + bytes > kBodyBytesPerSecond)
+    return false;
   _bodyBytes += bytes;
+  _waitingBodyBytes += bytes;
   return true;
 }
 
@@ -74,6 +77,7 @@ DeliveryTap::Batch DeliveryTap::Reader::take(Clock::duration patience) {
   for (std::size_t bytes = 0; !_waiting.empty() && batch.records.size() < kMostInBatch;) {
     bytes += _waiting.front().bodyBytes;
     if (!batch.records.empty() && bytes > kBodyBytesInBatch) break;
+    _waitingBodyBytes -= _waiting.front().bodyBytes;
     batch.records.emplace_back(std::move(_waiting.front().record));
     _waiting.pop_front();
   }

@@ -23,9 +23,10 @@ class DeliveryTap {
   using Clock = std::chrono::steady_clock;
   using Filter = std::function<bool(const Dictionary& record)>;
 
-  static constexpr std::size_t kMostReaders = 8;
-  static constexpr std::size_t kMostWaiting = 4096;  ///< records for one reader
-  /// The bodies that a reader gets in a second; records beyond that come without one.
+  static constexpr std::size_t kMostReaders = 64;
+  static constexpr std::size_t kMostWaiting = 1024;  ///< records for one reader
+  /// The bodies that a reader gets in a second, and that may wait for it; records beyond that come without
+  /// one.
   static constexpr std::size_t kBodyBytesPerSecond = std::size_t{1} << 20;
 
   /// What costs more than a reader usually needs.
@@ -74,6 +75,7 @@ class DeliveryTap {
     std::uint64_t _lost VESK_GUARDED_BY(_mutex) = 0;
     Clock::time_point _secondBegan VESK_GUARDED_BY(_mutex){};
     std::size_t _bodyBytes VESK_GUARDED_BY(_mutex) = 0;  ///< in this second
+    std::size_t _waitingBodyBytes VESK_GUARDED_BY(_mutex) = 0;
   };
 
   bool isOpen() const noexcept { return _isOpen.load(std::memory_order_relaxed); }
@@ -83,9 +85,8 @@ class DeliveryTap {
   /// `body`: what was sent; becomes the record's `body`, unless it is empty or the reader has had too much.
   void tell(const Dictionary& record, const std::string& body = {}, Clock::time_point now = Clock::now());
 
-  /// `filter` is called under the tap's lock. Returns null if there are `kMostReaders`.
-  std::shared_ptr<Reader> open(Filter filter, Wishes wishes);
-  std::shared_ptr<Reader> open(Filter filter) { return open(std::move(filter), Wishes()); }
+  /// `filter` is called under the tap's lock, so it must be quick. Returns null if there are `most` readers.
+  std::shared_ptr<Reader> open(Filter filter, Wishes wishes, std::size_t most = kMostReaders);
 
  private:
   void close(const Reader* reader);

@@ -283,6 +283,10 @@ HTTPSPostBackend::PostToBuild HTTPSPostBackend::makePost(std::unique_ptr<EventBa
 std::optional<std::string> HTTPSPostBackend::buildAndPost(PostToBuild post) {
   EventBatch& events = *post->events;
   std::size_t eventCount = events.size();
+  if (post->respectsConsent && *_services.consentWithdrawn) {
+    _outcomes->count("post", DropReason::ConsentWithdrawn, eventCount, [&post] { return post->messages; });
+    return std::nullopt;
+  }
   try {
     // Events held before the user info arrived get it now.
     if (post->lateUserInfo) {
@@ -308,10 +312,6 @@ std::optional<std::string> HTTPSPostBackend::buildAndPost(PostToBuild post) {
 void HTTPSPostBackend::postJSONMessage(Post post, std::string json, std::size_t eventCount) {
   if (!post.url) {
     _outcomes->count("post", DropReason::NoURL, eventCount, [&post] { return post.messages; });
-    return;
-  }
-  if (post.respectsConsent && *_services.consentWithdrawn) {
-    _outcomes->count("post", DropReason::ConsentWithdrawn, eventCount, [&post] { return post.messages; });
     return;
   }
   std::unique_ptr<Shown> shown;

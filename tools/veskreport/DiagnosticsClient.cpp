@@ -4,6 +4,7 @@
 
 #include <poll.h>
 
+#include <algorithm>
 #include <cmath>
 #include <cstring>
 #include <system_error>
@@ -72,7 +73,16 @@ Dictionary explanationRequest(const Invocation& invocation, const Output& output
     request.set("category", int{invocation.category.value_or(1)});
     request.set("type", int{invocation.type.value_or(0)});
   }
-  if (const auto device = explainedDevice(invocation)) request.set("device", *device);
+  if (const auto device = explainedDevice(invocation)) {
+    for (const auto& [key, value] : *device) {
+      constexpr std::string_view kKnown[] = {"DeviceName", "RegionCode", "diagnosticsSubmission"};
+      if (invocation.authoring.storebag.empty() && std::ranges::find(kKnown, key.view()) == std::end(kKnown))
+        output.fail("--device: the daemon decides with its own " + printable(key.view()) +
+                        "; only with --storebag it can be another",
+                    kExitUsage);
+    }
+    request.set("device", *device);
+  }
   return request.share();
 }
 
