@@ -256,9 +256,9 @@ class Comparison {
 }  // namespace
 
 std::string StorebagChange::line() const {
-  std::string text = environment;
-  for (const std::string* part : {&backend, &clients, &devices}) text += part->empty() ? "" : ": " + *part;
-  return text + ": " + this->text;
+  std::string words = environment;
+  for (const std::string* part : {&backend, &clients, &devices}) words += part->empty() ? "" : ": " + *part;
+  return words + ": " + this->text;
 }
 
 std::vector<StorebagChange> compareStorebags(const Dictionary& before, const Dictionary& after,
