@@ -46,6 +46,7 @@ Dictionary problem(const std::string& text) { return Dictionary{{"problem", text
 
 List described(const std::vector<Counters::Count>& counts) {
   std::vector<Value> all;
+  all.reserve(counts.size());
   for (const auto& [backend, reason, count] : counts) {
     all.emplace_back(Dictionary{{"backend", backend},
                                 {"reason", std::string(nameOfDropReason(reason))},

@@ -45,6 +45,7 @@ std::vector<Counters::Count> CounterHistory::total() const {
     for (const auto& [backend, reason, count] : counts) sums[{backend, reason}] += count;
   }
   std::vector<Counters::Count> total;
+  total.reserve(sums.size());
   for (const auto& [of, count] : sums) total.push_back({of.first, of.second, count});
   return total;
 }

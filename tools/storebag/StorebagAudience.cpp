@@ -74,6 +74,7 @@ std::vector<Alike> groupsUnder(std::string_view key, std::string_view other,
     group.names += (group.names.empty() ? "" : ", ") + value;
   }
   std::vector<Alike> all;
+  all.reserve(groups.size() + 1);
   for (auto& [treatment, group] : groups) all.push_back(std::move(group));
   all.push_back({std::string(other), ""});
   return all;

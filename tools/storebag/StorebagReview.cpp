@@ -97,11 +97,9 @@ class Reviewer {
     std::string reasons;
     for (const auto& [name, profile] : section) {
       std::string reason = "the backend is not built";
-      if (!isBuilt(name.view(), profile)) {
-        reasons += "; " + name.string() + ": " + reason;
-      } else if (!isPostBackend(name.view())) {
-        reports = true;
-      } else if (reviewPosts(place + "." + name.string(), *profile.dictionary(), reason)) {
+      if (isBuilt(name.view(), profile) &&
+          (!isPostBackend(name.view()) ||
+           reviewPosts(place + "." + name.string(), *profile.dictionary(), reason))) {
         reports = true;
       } else {
         reasons += "; " + name.string() + ": " + reason;

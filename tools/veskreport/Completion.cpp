@@ -32,7 +32,7 @@ void forEach(const CLI::App& app, const std::string& path,
     forEach(*sub, path.empty() ? sub->get_name() : path + " " + sub->get_name(), visit);
 }
 
-std::string firstLine(std::string text) {
+std::string firstLine(const std::string& text) {
   std::string plain;
   for (char c : text.substr(0, text.find('\n'))) {
     if (c == '\'' || c == '\\') continue;  // would end the quotes

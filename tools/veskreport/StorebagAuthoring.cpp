@@ -106,6 +106,7 @@ int runCheck(const Invocation& invocation, const Output& output) {
 bool reportCase(const StorebagCase& tested, const Dictionary& payload, const Output& output) {
   const auto failures = failuresOf(tested, payload);
   std::vector<std::string> lines;
+  lines.reserve(failures.size() + 1);
   for (const auto& failure : failures) lines.push_back(printable("failed: " + tested.name + ": " + failure));
   if (failures.empty()) lines.push_back(printable("ok: " + tested.name));
   const Dictionary fields{{"case", tested.name},
