@@ -10,12 +10,17 @@ namespace vesk {
 Outcomes::Outcomes(std::string backend, const BackendIdentity& identity, Counters& counters,
                    std::shared_ptr<DeliveryTap> tap)
     : _backend(std::move(backend)),
-      _sessionID(identity._sessionID),
-      _clientType(identity._compType),
       _user(identity._client.user),
       _process(identity._client.process),
       _counters(counters),
-      _tap(std::move(tap)) {}
+      _tap(std::move(tap)),
+      _sessionID(identity._sessionID),
+      _clientType(identity._compType) {}
+
+void Outcomes::setSession(std::uint32_t sessionID, std::int32_t clientType) noexcept {
+  _sessionID = sessionID;
+  _clientType = clientType;
+}
 
 void Outcomes::setUserInfo(const std::optional<Dictionary>& userInfo) {
   const Value* name = userInfo ? userInfo->find(kVeskReportingUserInfoClientName) : nullptr;
@@ -29,8 +34,8 @@ void Outcomes::show(const char* what, const char* outcome, const Dictionary& fac
                                       {"what", what},
                                       {"outcome", outcome},
                                       {"backend", _backend},
-                                      {"clientType", _clientType},
-                                      {"sessionID", static_cast<std::int64_t>(_sessionID)},
+                                      {"clientType", _clientType.load()},
+                                      {"sessionID", static_cast<std::int64_t>(_sessionID.load())},
                                       {"user", _user},
                                       {"process", _process}});
   if (const auto name = _clientName.load()) record.set("clientName", *name);

@@ -1,6 +1,7 @@
 // What becomes of a backend's messages.
 #pragma once
 
+#include <atomic>
 #include <cstdint>
 #include <memory>
 #include <optional>
@@ -23,7 +24,8 @@ class Outcomes {
   Outcomes(std::string backend, const BackendIdentity& identity, Counters& counters,
            std::shared_ptr<DeliveryTap> tap);
 
-  /// Of the client, for those who look.
+  // Of the client, for those who look.
+  void setSession(std::uint32_t sessionID, std::int32_t clientType) noexcept;
   void setUserInfo(const std::optional<Dictionary>& userInfo);
 
   bool isWatched() const noexcept { return _tap->isOpen(); }
@@ -51,12 +53,12 @@ class Outcomes {
                    const std::string& body) const;
 
   const std::string _backend;
-  const std::uint32_t _sessionID;
-  const std::int32_t _clientType;
   const std::int64_t _user;
   const std::int64_t _process;
   Counters& _counters;
   const std::shared_ptr<DeliveryTap> _tap;
+  std::atomic<std::uint32_t> _sessionID;
+  std::atomic<std::int32_t> _clientType;
   Snapshot<std::optional<Value>> _clientName;
 };
 

@@ -146,7 +146,10 @@ void sendMessageWithSessionInfo(const SessionServices& services, const BackendCl
                                 const std::optional<Dictionary>& storebag, std::uint16_t category,
                                 std::uint16_t type, const std::optional<Dictionary>& payload) {
   const Dictionary info = sessionInfo.value_or(Dictionary());
-  const Outcomes outcomes = outcomesOfSession(client, services.backends);
+  Outcomes outcomes = outcomesOfSession(client, services.backends);
+  outcomes.setSession(
+      static_cast<std::uint32_t>(integerForKey(info, kVeskReportingSessionInfoSessionID).value_or(0)),
+      static_cast<std::int32_t>(integerForKey(info, kVeskReportingSessionInfoClientType).value_or(0)));
   VESK_LOG_DEBUG("sendMessageWithSessionInfo: Sending single message with sessionID %ld",
                  static_cast<long>(integerForKey(info, kVeskReportingSessionInfoSessionID).value_or(0)));
   if (!sessionInfo || !storebag) {

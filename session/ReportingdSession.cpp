@@ -24,6 +24,11 @@ std::uint32_t sessionIDIn(const Dictionary& sessionInfo) {
       integerForKey(sessionInfo, kVeskReportingSessionInfoSessionID).value_or(0));
 }
 
+std::int32_t clientTypeIn(const Dictionary& sessionInfo) {
+  return static_cast<std::int32_t>(
+      integerForKey(sessionInfo, kVeskReportingSessionInfoClientType).value_or(0));
+}
+
 bool requiresUserInfo(const Dictionary& sessionInfo) {
   return booleanForKey(sessionInfo, kVeskReportingSessionInfoRequireUserInfo).value_or(false);
 }
@@ -140,6 +145,8 @@ void ReportingdSession::setSessionInfo(const Dictionary& sessionInfo,
     VESK_LOG_WARNING("setSessionInfo: Configure session: user info provided without requiring it");
   }
   auto key = keyFor(userInfo);
+  _outcomes.setSession(newID, clientTypeIn(sessionInfo));
+  _outcomes.setUserInfo(userInfo);
   MutexLock lock(_mutex);
   _sessionInfo = sessionInfo;
   _frameworks = frameworksToCheck;
@@ -235,6 +242,7 @@ void ReportingdSession::sendMessageWithSessionInfo(const Dictionary& sessionInfo
     _sessionID = sessionIDIn(sessionInfo);
     _sessionInfo = sessionInfo;
   }
+  _outcomes.setSession(sessionIDIn(sessionInfo), clientTypeIn(sessionInfo));
   receivedUserInfo(userInfo);
   VESK_LOG_DEBUG("sendMessageWithSessionInfo: Sending message with session info for session %u", sessionID());
   auto storebag = _sessionDelegate->storebagForSession(*this);
@@ -274,6 +282,7 @@ std::optional<std::string> ReportingdSession::sendMessageWithDictionary(const Di
     _outcomes.count("message", DropReason::InvalidMessage);
     return std::nullopt;
   }
+  if (set->empty() && !_isEnding) _outcomes.count("message", DropReason::NoBackend);
   const timeval now = timevalFrom(_services.backends.clock.now());
   aggregateMessage(secondsFromTimeval(now), *message);
   return dispatchMessage(*set, *message, now);

@@ -123,7 +123,7 @@ class ReportingdSession final : public ClientSessionInterface,
   const SessionServices& _services;
   const std::string _sessionIDString;
   const BackendClient _client;
-  const Outcomes _outcomes;          // of what no backend took
+  Outcomes _outcomes;                // of what no backend took
   std::array<char, 41> _deviceid{};  // NUL-terminated; empty if the device has no ID
 
   bool _isEnding = false;  // written only by the destructor's thread

@@ -1,6 +1,6 @@
 #include "tools/veskreport/MessageFate.h"
 
-#include <unistd.h>
+#include <VeskReporting/VeskReportingKeys.h>
 
 #include <algorithm>
 #include <chrono>
@@ -34,10 +34,12 @@ std::string wordsFor(const Dictionary& record) {
 
 }  // namespace
 
-MessageWatch::MessageWatch(const Invocation& invocation, const Output& output, const char* outcome)
-    : _invocation(invocation), _daemon(invocation, output) {
-  MutableDictionary filter(Dictionary{{"process", static_cast<std::int64_t>(::getpid())}, {"messages", true}},
-                           1);
+MessageWatch::MessageWatch(const Invocation& invocation, const Output& output, const Dictionary& sessionInfo,
+                           const char* outcome)
+    : _invocation(invocation),
+      _sessionID(integerForKey(sessionInfo, kVeskReportingSessionInfoSessionID).value_or(0)),
+      _daemon(invocation, output) {
+  MutableDictionary filter(Dictionary{{"sessionID", _sessionID}, {"messages", true}}, 1);
   if (*outcome != '\0') filter.set("outcome", outcome);
   const auto opened = _daemon.call(wire::kOpenTap, {filter.share()});
   _isOpen = opened && opened->empty();
@@ -73,7 +75,6 @@ std::vector<MessageWatch::Fate> MessageWatch::fates(std::uint16_t category, std:
   } while (isWaiting() && std::chrono::steady_clock::now() < deadline);
 
   std::vector<Fate> all;
-  if (_messages.empty()) return {{"session", "dropped", "the session has no backends"}};
   std::string version;
   for (const auto& message : _messages) {
     all.push_back(message.fate);
@@ -110,7 +111,8 @@ bool MessageWatch::isWaiting() const {
 std::string MessageWatch::storebagVersion() {
   const auto status = _daemon.call(wire::kGetStatus);
   for (const auto& session : listIn(status ? *status : Dictionary(), "sessions")) {
-    if (integerForKey(session, "process") == ::getpid()) return textIn(session, "storebagVersion");
+    if (integerForKey(session, "sessionID") == _sessionID.asInteger())
+      return textIn(session, "storebagVersion");
   }
   return "";
 }

@@ -10,11 +10,12 @@
 
 namespace vesk {
 
-/// Watches this process's messages from its construction on, if the daemon lets it.
+/// Watches a session's messages from its construction on, if the daemon lets it.
 class MessageWatch {
  public:
   /// `outcome`: only these; empty: all.
-  MessageWatch(const Invocation& invocation, const Output& output, const char* outcome = "");
+  MessageWatch(const Invocation& invocation, const Output& output, const Dictionary& sessionInfo,
+               const char* outcome = "");
 
   struct Fate {
     std::string backend;
@@ -45,6 +46,7 @@ class MessageWatch {
   std::string storebagVersion();
 
   const Invocation& _invocation;
+  const Value _sessionID;
   DiagnosticsClient _daemon;
   bool _isOpen = false;
   std::vector<Message> _messages;

@@ -118,7 +118,7 @@ class MessageStream {
   DaemonSession& _session;
   const Invocation& _invocation;
   const Output& _output;
-  MessageWatch _watch{_invocation, _output, "dropped"};
+  MessageWatch _watch{_invocation, _output, _session.sessionInfo(), "dropped"};
   LineReader _lines;
   Progress _progress{STDIN_FILENO};
 
@@ -139,7 +139,7 @@ int runSend(const Invocation& invocation, const Output& output) {
     session.start();
     return MessageStream(session, invocation, output).run();
   }
-  MessageWatch watch(invocation, output);
+  MessageWatch watch(invocation, output, session.sessionInfo());
   session.start();
   Dictionary parameters = parametersOf(invocation, payload);
   const auto timeout = invocation.timeout;
@@ -159,7 +159,7 @@ int runSend(const Invocation& invocation, const Output& output) {
 int runSendOnce(const Invocation& invocation, const Output& output) {
   const auto payload = payloadOf(invocation, output);
   DaemonSession session(invocation, output);
-  MessageWatch watch(invocation, output);
+  MessageWatch watch(invocation, output, session.sessionInfo());
   std::string answer = session.answerOf(
       session->sendMessageOnceAndWait(session.sessionInfo(), session.userInfo(), *invocation.category,
                                       *invocation.type, payload, invocation.timeout));
