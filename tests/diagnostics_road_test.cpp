@@ -153,6 +153,12 @@ TEST_F(Diagnostics, SendFailsIfAllIsDropped) {
   EXPECT_EQ(told.text, "veskreport: dropped: httpPost: client 'Nobody' is in no entry (storebag 7)\n");
   EXPECT_TRUE(harness.daemon().waitForText(
       "<4> HTTPSPostBackend(updateBackendState): httpPost reports nothing: client 'Nobody' is in no entry"));
+  ChildProcess stream(ChildProcess::Options{
+      .command = {VESK_BIN_DIRECTORY "/veskreport", "send", "--root", harness.root.path().string(),
+                  "--client-type", "5", "--client-name", "Nobody", "-c", "3", "-t", "1", "--stdin"},
+      .input = "{}\n{}\n{}\n"});
+  EXPECT_EQ(stream.wait(), 1);
+  EXPECT_EQ(stream.output(), "3 messages sent, 3 dropped (httpPost: client 'Nobody' is in no entry)\n");
   told = ask({"states", "--client-type", "5", "--client-name", "Camera"});
   EXPECT_EQ(told.text, "httpPost\n");
   EXPECT_EQ(ask({"states", "--client-type", "5", "--client-name", "Nobody", "--json"}).text,

@@ -57,6 +57,7 @@ MessageWatch::Drops MessageWatch::drops() {
   if (!_isOpen) return drops;
   for (auto records = next(drops.count); !records.empty(); records = next(drops.count)) {
     for (const auto& record : records) {
+      if (integerForKey(record, "category") == 0) continue;  // the session's own start or end
       drops.count += static_cast<std::uint64_t>(integerForKey(record, "count").value_or(1));
       if (drops.cause.empty()) drops.cause = textIn(record, "backend") + ": " + causeIn(record);
     }
