@@ -60,6 +60,7 @@ int run(const vesk::DaemonOptions& options) {
                             ? "main: Ending, so that the service manager starts the daemon anew."
                             : "main: Ending. No service manager starts the daemon anew.");
   }
+  daemon.takeStock();
   serviceManager.notifyStopping();
   const bool haveEnded = daemon.stop();
   vesk::VeskReportingLogging::close();

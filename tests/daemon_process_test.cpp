@@ -174,10 +174,15 @@ TEST_F(DaemonProcess, TellsItsManagerHowItGoesAndKeepsToItsLimits) {
   FileDescriptor manager(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
   UnixSocketAddress address(harness.root / "notify");
   ASSERT_EQ(::bind(manager.get(), address.get(), address.size()), 0);
+  std::string status;  // the last that was told
   const auto notification = [&] {
-    char text[64];
-    const ssize_t size = ::recv(manager.get(), text, sizeof text, 0);
-    return std::string(text, static_cast<std::size_t>(std::max<ssize_t>(size, 0)));
+    for (;;) {
+      char text[256];
+      const ssize_t size = ::recv(manager.get(), text, sizeof text, 0);
+      std::string told(text, static_cast<std::size_t>(std::max<ssize_t>(size, 0)));
+      if (!told.starts_with("STATUS=")) return told;
+      status = std::move(told);
+    }
   };
   harness.setPreference("logRateLimit", "3");
   harness.setPreference("maxConnectionsPerUser", "2");
@@ -198,8 +203,10 @@ TEST_F(DaemonProcess, TellsItsManagerHowItGoesAndKeepsToItsLimits) {
   for (int i = 0; i < 6; ++i) EXPECT_TRUE(holding.reporting.sendMessageAndWait(bulk));
   VeskReporting third(harness.clientOptions());
   EXPECT_EQ(third.connect().status, ReportingStatus::TooManyConnections);
-  EXPECT_EQ(harness.stopDaemon(), 0);
+  harness.daemon().signal(SIGHUP);
+  EXPECT_EQ(harness.daemon().wait(), 75) << "asks for a new start";
   EXPECT_EQ(notification(), "STOPPING=1");
+  EXPECT_TRUE(status.starts_with("STATUS=2 connections, 0 posts wait, ")) << status;
   const std::string log = withoutTime(harness.daemon().errors());
   EXPECT_NE(log.find("<6> main: Lost since the start: httpPost over-bound "), log.npos) << log;
   EXPECT_NE(log.find("\n<6> main: Lost since the start: session no-backend 1\n"), log.npos) << log;
