@@ -1,16 +1,12 @@
 #include "values/Conversions.h"
 
+#include <algorithm>
 #include <charconv>
 #include <cmath>
 
 namespace vesk {
 
 namespace {
-
-std::string_view withoutLeadingSpace(std::string_view text) noexcept {
-  std::size_t start = text.find_first_not_of(" \t\n\v\f\r");
-  return start == std::string_view::npos ? std::string_view() : text.substr(start);
-}
 
 // Uses an exponent only for very large or small numbers, so that reading 100000 as an integer doesn't give 1.
 std::string decimal(double number) {
@@ -25,7 +21,7 @@ std::string decimal(double number) {
 }  // namespace
 
 std::int64_t leadingInteger(std::string_view text) noexcept {
-  text = withoutLeadingSpace(text);
+  text.remove_prefix(std::min(text.find_first_not_of(" \t\n\v\f\r"), text.size()));
   if (text.size() > 1 && text[0] == '+' && text[1] != '-') text.remove_prefix(1);
   std::int64_t number = 0;
   auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);

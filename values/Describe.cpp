@@ -6,45 +6,55 @@ namespace vesk {
 
 namespace {
 
+std::string formatted(const char* format, auto value) {
+  char buffer[32];
+  std::snprintf(buffer, sizeof buffer, format, value);
+  return buffer;
+}
+
 class Describer {
  public:
   explicit Describer(std::size_t limit) : _limit(limit) {}
 
   void add(const Value& value) {
-    if (full()) return;
-    switch (value.kind()) {
-      case Value::Kind::None:
-        _out += "null";
-        break;
-      case Value::Kind::Boolean:
-        _out += *value.boolean() ? "true" : "false";
-        break;
-      case Value::Kind::Signed:
-        _out += std::to_string(*value.signedInteger());
-        break;
-      case Value::Kind::Unsigned:
-        _out += std::to_string(*value.unsignedInteger());
-        break;
-      case Value::Kind::Double:
-        addNumber(*value.real());
-        break;
-      case Value::Kind::Text:
-        addText(value.text()->view());
-        break;
-      case Value::Kind::Bytes:
-        _out += "<" + std::to_string(value.bytes()->size()) + " bytes>";
-        break;
-      case Value::Kind::Date:
-        _out += "@";
-        addNumber(value.date()->secondsSince1970);
-        break;
-      case Value::Kind::List:
-        addList(*value.list());
-        break;
-      case Value::Kind::Dictionary:
-        addDictionary(*value.dictionary());
-        break;
+    if (!full()) value.visit(*this);
+  }
+
+  void operator()(std::monostate) { _out += "null"; }
+  void operator()(bool flag) { _out += flag ? "true" : "false"; }
+  void operator()(std::int64_t number) { _out += std::to_string(number); }
+  void operator()(std::uint64_t number) { _out += std::to_string(number); }
+  void operator()(double number) { _out += formatted("%.15g", number); }
+  void operator()(const Bytes& bytes) { _out += "<" + std::to_string(bytes.size()) + " bytes>"; }
+  void operator()(Date date) { _out += formatted("@%.15g", date.secondsSince1970); }
+
+  void operator()(const Text& text) {
+    _out += '"';
+    for (char c : text.view()) {
+      if (full()) return;
+      // Control characters must not split a log line.
+      const auto byte = static_cast<unsigned char>(c);
+      if (byte < 0x20 || byte == 0x7f) {
+        _out += formatted("\\x%02x", byte);
+      } else {
+        _out += c;
+      }
     }
+    _out += '"';
+  }
+
+  void operator()(const List& list) {
+    addItems('[', list, [this](const Value& value) { add(value); });
+    if (!full()) _out += ']';
+  }
+
+  void operator()(const Dictionary& dictionary) {
+    addItems('{', dictionary, [this](const DictionaryEntry& entry) {
+      (*this)(entry.key);
+      _out += ": ";
+      add(entry.value);
+    });
+    if (!full()) _out += '}';
   }
 
   std::string finish() {
@@ -60,50 +70,13 @@ class Describer {
  private:
   bool full() const { return _out.size() > _limit; }
 
-  void addNumber(double number) {
-    char buffer[32];
-    std::snprintf(buffer, sizeof buffer, "%.15g", number);
-    _out += buffer;
-  }
-
-  void addText(std::string_view text) {
-    _out += '"';
-    for (char c : text) {
+  void addItems(char bracket, const auto& items, auto addItem) {
+    _out += bracket;
+    for (const auto& item : items) {
       if (full()) return;
-      // Control characters must not split a log line.
-      if (static_cast<unsigned char>(c) < 0x20 || c == 0x7f) {
-        char buffer[8];
-        std::snprintf(buffer, sizeof buffer, "\\x%02x", static_cast<unsigned char>(c));
-        _out += buffer;
-      } else {
-        _out += c;
-      }
+      if (&item != items.begin()) _out += ", ";
+      addItem(item);
     }
-    _out += '"';
-  }
-
-  void addList(const List& list) {
-    _out += "[";
-    bool first = true;
-    for (const auto& value : list) {
-      if (full()) return;
-      if (!std::exchange(first, false)) _out += ", ";
-      add(value);
-    }
-    _out += "]";
-  }
-
-  void addDictionary(const Dictionary& dictionary) {
-    _out += "{";
-    bool first = true;
-    for (const auto& entry : dictionary) {
-      if (full()) return;
-      if (!std::exchange(first, false)) _out += ", ";
-      addText(entry.key.view());
-      _out += ": ";
-      add(entry.value);
-    }
-    _out += "}";
   }
 
   std::size_t _limit;

@@ -43,6 +43,12 @@ void makeUnique(std::vector<DictionaryEntry>& entries) {
   entries.erase(entries.begin() + static_cast<std::ptrdiff_t>(count), entries.end());
 }
 
+template <class T>
+std::optional<T> copyOf(const Value* value, const T* (Value::*kind)() const noexcept) {
+  const T* found = value ? (value->*kind)() : nullptr;
+  return found ? std::optional(*found) : std::nullopt;
+}
+
 }  // namespace
 
 // --- List
@@ -95,23 +101,11 @@ const Value* Dictionary::find(std::string_view key) const noexcept {
   return at == _storage->index.end() ? nullptr : &_storage->entries[at->second].value;
 }
 
-std::optional<Text> Dictionary::text(std::string_view key) const {
-  const Value* value = find(key);
-  if (!value || !value->text()) return std::nullopt;
-  return *value->text();
-}
-
+std::optional<Text> Dictionary::text(std::string_view key) const { return copyOf(find(key), &Value::text); }
 std::optional<Dictionary> Dictionary::dictionary(std::string_view key) const {
-  const Value* value = find(key);
-  if (!value || !value->dictionary()) return std::nullopt;
-  return *value->dictionary();
+  return copyOf(find(key), &Value::dictionary);
 }
-
-std::optional<List> Dictionary::list(std::string_view key) const {
-  const Value* value = find(key);
-  if (!value || !value->list()) return std::nullopt;
-  return *value->list();
-}
+std::optional<List> Dictionary::list(std::string_view key) const { return copyOf(find(key), &Value::list); }
 
 bool operator==(const Dictionary& a, const Dictionary& b) noexcept {
   if (a._storage == b._storage) return true;
@@ -162,54 +156,39 @@ Dictionary MutableDictionary::shareUnique() {
 
 // --- Numbers
 
+namespace {
+
+/// What `convert` makes of a number; nullopt for any other kind of value.
+template <class T, class Convert>
+std::optional<T> converted(const Value& value, Convert convert) noexcept {
+  return value.visit([&]<class Alternative>(const Alternative& number) -> std::optional<T> {
+    if constexpr (std::is_arithmetic_v<Alternative>) return convert(number);
+    return std::nullopt;
+  });
+}
+
+std::int64_t clamped(double number) noexcept {
+  if (std::isnan(number)) return 0;
+  if (number >= 0x1p63) return std::numeric_limits<std::int64_t>::max();
+  if (number < -0x1p63) return std::numeric_limits<std::int64_t>::min();
+  return static_cast<std::int64_t>(number);
+}
+
+}  // namespace
+
 std::optional<std::int64_t> Value::asInteger() const noexcept {
-  switch (kind()) {
-    case Kind::Boolean:
-      return *boolean() ? 1 : 0;
-    case Kind::Signed:
-      return *signedInteger();
-    case Kind::Unsigned:
-      return static_cast<std::int64_t>(*unsignedInteger());
-    case Kind::Double: {
-      double value = *real();
-      if (std::isnan(value)) return 0;
-      if (value >= 0x1p63) return std::numeric_limits<std::int64_t>::max();
-      if (value < -0x1p63) return std::numeric_limits<std::int64_t>::min();
-      return static_cast<std::int64_t>(value);
-    }
-    default:
-      return std::nullopt;
-  }
+  return converted<std::int64_t>(*this, []<class Number>(Number number) {
+    if constexpr (std::is_floating_point_v<Number>) return clamped(number);
+    return static_cast<std::int64_t>(number);
+  });
 }
 
 std::optional<double> Value::asDouble() const noexcept {
-  switch (kind()) {
-    case Kind::Boolean:
-      return *boolean() ? 1.0 : 0.0;
-    case Kind::Signed:
-      return static_cast<double>(*signedInteger());
-    case Kind::Unsigned:
-      return static_cast<double>(*unsignedInteger());
-    case Kind::Double:
-      return *real();
-    default:
-      return std::nullopt;
-  }
+  return converted<double>(*this, [](auto number) { return static_cast<double>(number); });
 }
 
 std::optional<bool> Value::asBoolean() const noexcept {
-  switch (kind()) {
-    case Kind::Boolean:
-      return *boolean();
-    case Kind::Signed:
-      return *signedInteger() != 0;
-    case Kind::Unsigned:
-      return *unsignedInteger() != 0;
-    case Kind::Double:
-      return *real() != 0;
-    default:
-      return std::nullopt;
-  }
+  return converted<bool>(*this, [](auto number) { return number != 0; });
 }
 
 std::optional<std::int64_t> integerForKey(const Dictionary& dictionary, std::string_view key) noexcept {
