@@ -19,13 +19,7 @@ namespace {
 
 constexpr std::uint64_t kFileRights =
     LANDLOCK_ACCESS_FS_EXECUTE | LANDLOCK_ACCESS_FS_READ_FILE | LANDLOCK_ACCESS_FS_WRITE_FILE;
-constexpr std::uint64_t kReadRights = LANDLOCK_ACCESS_FS_READ_FILE | LANDLOCK_ACCESS_FS_READ_DIR;
-constexpr std::uint64_t kWriteRights = kReadRights | LANDLOCK_ACCESS_FS_WRITE_FILE |
-                                       LANDLOCK_ACCESS_FS_REMOVE_FILE | LANDLOCK_ACCESS_FS_REMOVE_DIR |
-                                       LANDLOCK_ACCESS_FS_MAKE_REG | LANDLOCK_ACCESS_FS_MAKE_DIR;
-constexpr std::uint64_t kFirstVersionRights = kFileRights | kWriteRights | LANDLOCK_ACCESS_FS_MAKE_SOCK |
-                                              LANDLOCK_ACCESS_FS_MAKE_CHAR | LANDLOCK_ACCESS_FS_MAKE_FIFO |
-                                              LANDLOCK_ACCESS_FS_MAKE_BLOCK | LANDLOCK_ACCESS_FS_MAKE_SYM;
+constexpr std::uint64_t kFirstVersionRights = (LANDLOCK_ACCESS_FS_MAKE_SYM << 1) - 1;  // its last right
 
 // Not defined in the kernel headers of some build machines.
 constexpr int kPortRule = 2;
@@ -42,20 +36,6 @@ struct PortRule {
   std::uint64_t rights = 0;
   std::uint64_t port = 0;
 };
-
-std::uint64_t rights(SandboxPath::Access access) {
-  switch (access) {
-    case SandboxPath::Access::Read:
-      return kReadRights;
-    case SandboxPath::Access::Write:
-      return kWriteRights;
-    case SandboxPath::Access::Sockets:
-      return kWriteRights | LANDLOCK_ACCESS_FS_MAKE_SOCK;
-    case SandboxPath::Access::Remove:
-      return LANDLOCK_ACCESS_FS_REMOVE_FILE;
-  }
-  return 0;
-}
 
 long version() { return ::syscall(SYS_landlock_create_ruleset, nullptr, 0, LANDLOCK_CREATE_RULESET_VERSION); }
 
@@ -95,13 +75,13 @@ Result<void> addRule(int ruleset, const SandboxPath& path) {
   FileDescriptor target(::open(path.path.c_str(), O_PATH | O_CLOEXEC));
   if (!target) {
     bool nothingToGrant = errno == ENOENT || errno == ENOTDIR || errno == EACCES;
-    if (path.optional && nothingToGrant) return {};
+    if (path.isOptional && nothingToGrant) return {};
     return systemError(errno, path.path);
   }
   struct stat status {};
   if (::fstat(target.get(), &status) != 0) return systemError(errno, path.path);
   landlock_path_beneath_attr rule{};
-  rule.allowed_access = rights(path.access);
+  rule.allowed_access = path.rights;
   if (!S_ISDIR(status.st_mode)) rule.allowed_access &= kFileRights;
   rule.parent_fd = target.get();
   if (::syscall(SYS_landlock_add_rule, ruleset, LANDLOCK_RULE_PATH_BENEATH, &rule, 0) != 0) {

@@ -17,13 +17,26 @@ namespace vesk {
 
 namespace {
 
+namespace fs = std::filesystem;
+
 constexpr std::size_t kMaximumProfile = std::size_t{64} << 10;
 
 /// Landlock confines only the calling thread and the threads that it creates.
 bool hasOtherThreads() {
   std::error_code error;
-  const std::filesystem::directory_iterator threads("/proc/self/task", error);
+  const fs::directory_iterator threads("/proc/self/task", error);
   return error || std::distance(begin(threads), end(threads)) != 1;
+}
+
+Result<void> makeDirectories(const std::vector<SandboxPath>& paths) {
+  for (const SandboxPath& each : paths) {
+    std::error_code error;
+    if (each.created == fs::perms::none || fs::exists(each.path, error)) continue;
+    fs::create_directories(each.path, error);
+    if (!error) fs::permissions(each.path, each.created, error);
+    if (error) return systemError(error.value(), each.path);
+  }
+  return {};
 }
 
 Result<void> enter(const SandboxProfile& profile) {

@@ -1,10 +1,11 @@
 #include "platform/sandbox/SandboxProfile.h"
 
+#include <linux/landlock.h>
+
 #include <algorithm>
 #include <cstdlib>
 #include <filesystem>
 #include <iterator>
-#include <system_error>
 
 #include "platform/files/RootPrefix.h"
 #include "platform/preferences/TomlFile.h"
@@ -16,17 +17,23 @@ namespace {
 
 namespace fs = std::filesystem;
 
+constexpr std::uint64_t kRead = LANDLOCK_ACCESS_FS_READ_FILE | LANDLOCK_ACCESS_FS_READ_DIR;
+constexpr std::uint64_t kWrite = kRead | LANDLOCK_ACCESS_FS_WRITE_FILE | LANDLOCK_ACCESS_FS_REMOVE_FILE |
+                                 LANDLOCK_ACCESS_FS_REMOVE_DIR | LANDLOCK_ACCESS_FS_MAKE_REG |
+                                 LANDLOCK_ACCESS_FS_MAKE_DIR;
+
 struct PathKey {
   const char* name;
-  SandboxPath::Access access;
-  bool optional;
+  std::uint64_t rights;
+  bool isOptional;
+  fs::perms created;
 };
 constexpr PathKey kPathKeys[] = {
-    {"read", SandboxPath::Access::Read, false},
-    {"read-if-present", SandboxPath::Access::Read, true},
-    {"write", SandboxPath::Access::Write, false},
-    {"sockets", SandboxPath::Access::Sockets, false},
-    {"remove-if-present", SandboxPath::Access::Remove, true},
+    {"read", kRead, false, fs::perms::none},
+    {"read-if-present", kRead, true, fs::perms::none},
+    {"write", kWrite, false, fs::perms{0750}},
+    {"sockets", kWrite | LANDLOCK_ACCESS_FS_MAKE_SOCK, false, fs::perms{0755}},
+    {"remove-if-present", LANDLOCK_ACCESS_FS_REMOVE_FILE, true, fs::perms::none},
 };
 
 /// What it throws is caught in this file.
@@ -51,15 +58,27 @@ std::string expanded(std::string_view written) {
   return normal;
 }
 
-std::vector<std::string> texts(const std::string& where, const Value& value) {
-  const List* list = value.list();
-  if (!list) fail(where, "must be a list of strings");
-  std::vector<std::string> result;
-  for (const Value& item : *list) {
-    if (!item.text()) fail(where, "must be a list of strings");
-    result.push_back(item.text()->string());
+/// The items of a list; `item` returns nullopt for one that is not among `items`.
+template <class T>
+std::vector<T> listOf(const char* items, std::optional<T> (*item)(const Value&), const std::string& where,
+                      const Value& value) {
+  std::vector<T> result;
+  if (!value.list()) fail(where, std::string("must be a list of ") + items);
+  for (const Value& each : *value.list()) {
+    auto converted = item(each);
+    if (!converted) fail(where, std::string("must be a list of ") + items);
+    result.push_back(*std::move(converted));
   }
   return result;
+}
+
+std::optional<std::string> text(const Value& value) {
+  return value.text() ? std::optional(value.text()->string()) : std::nullopt;
+}
+
+std::optional<std::uint16_t> port(const Value& value) {
+  const std::int64_t number = value.asInteger().value_or(0);
+  return number >= 1 && number <= 65535 ? std::optional(static_cast<std::uint16_t>(number)) : std::nullopt;
 }
 
 void addPaths(std::vector<SandboxPath>& paths, const std::string& where, const DictionaryEntry& entry,
@@ -67,26 +86,14 @@ void addPaths(std::vector<SandboxPath>& paths, const std::string& where, const D
   const auto* key =
       std::ranges::find_if(kPathKeys, [&](const auto& known) { return entry.key == known.name; });
   if (key == std::end(kPathKeys)) fail(where, "unknown key");
-  for (const std::string& written : texts(where, entry.value)) {
+  for (const std::string& written : listOf("strings", text, where, entry.value)) {
     if (!written.starts_with('/') && !written.starts_with('$')) {
       fail(where, inQuotes(written) + " is no absolute path");
     }
     std::string path = expanded(written);
     if (path.empty()) continue;
-    paths.push_back({underRoot ? pathUnderRoot(path) : path, key->access, key->optional});
+    paths.push_back({underRoot ? pathUnderRoot(path) : path, key->rights, key->isOptional, key->created});
   }
-}
-
-std::vector<std::uint16_t> ports(const std::string& where, const Value& value) {
-  std::vector<std::uint16_t> ports;
-  const List* list = value.list();
-  if (!list) fail(where, "must be a list of ports");
-  for (const Value& port : *list) {
-    const std::int64_t number = port.asInteger().value_or(0);
-    if (number < 1 || number > 65535) fail(where, "must be a list of ports");
-    ports.push_back(static_cast<std::uint16_t>(number));
-  }
-  return ports;
 }
 
 void readEntry(SandboxProfile& profile, const Text& table, const DictionaryEntry& entry) {
@@ -94,9 +101,9 @@ void readEntry(SandboxProfile& profile, const Text& table, const DictionaryEntry
   if (table == "machine" || table == "root") {
     addPaths(profile.paths, where, entry, table == "root");
   } else if (where == "network.connect") {
-    profile.connectPorts = ports(where, entry.value);
+    profile.connectPorts = listOf("ports", port, where, entry.value);
   } else if (where == "calls.deny") {
-    profile.deniedCalls = texts(where, entry.value);
+    profile.deniedCalls = listOf("strings", text, where, entry.value);
     for (const std::string& group : profile.deniedCalls) {
       if (!isCallGroup(group)) fail(where, "unknown group " + inQuotes(group));
     }
@@ -133,19 +140,6 @@ Result<SandboxProfile> parseSandboxProfile(std::string_view toml) {
   } catch (const Error& error) {
     return error;
   }
-}
-
-Result<void> makeDirectories(const std::vector<SandboxPath>& paths) {
-  for (const SandboxPath& path : paths) {
-    if (path.access == SandboxPath::Access::Read || path.optional) continue;
-    std::error_code error;
-    if (fs::exists(path.path, error)) continue;
-    fs::create_directories(path.path, error);
-    auto mode = path.access == SandboxPath::Access::Sockets ? fs::perms{0755} : fs::perms{0750};
-    if (!error) fs::permissions(path.path, mode, error);
-    if (error) return systemError(error.value(), path.path);
-  }
-  return {};
 }
 
 }  // namespace vesk

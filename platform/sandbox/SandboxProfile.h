@@ -2,6 +2,7 @@
 #pragma once
 
 #include <cstdint>
+#include <filesystem>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -13,15 +14,11 @@ namespace vesk {
 
 /// A file, or a directory with its contents, that the process may use.
 struct SandboxPath {
-  enum class Access : unsigned char {
-    Read,
-    Write,    ///< read, write, create, rename and remove files and directories
-    Sockets,  ///< as `Write`, and bind Unix sockets there
-    Remove    ///< remove files only
-  };
-  std::string path;  ///< absolute, root prefix included
-  Access access = Access::Read;
-  bool optional = false;  ///< ignored if it is missing
+  std::string path;          ///< absolute, root prefix included
+  std::uint64_t rights = 0;  ///< Landlock's
+  bool isOptional = false;   ///< ignored if it is missing
+  std::filesystem::perms created =
+      std::filesystem::perms::none;  ///< of a missing directory; none: not created
 };
 
 struct SandboxProfile {
@@ -51,8 +48,5 @@ struct SandboxProfile {
 /// A path may begin with an environment variable ("$HOME/.config"); the entry is left out if that is unset or
 /// not an absolute path. Paths are resolved textually: "$SSL_CERT_FILE/.." is the directory of that file.
 Result<SandboxProfile> parseSandboxProfile(std::string_view toml);
-
-/// Creates missing directories among those to be written to.
-Result<void> makeDirectories(const std::vector<SandboxPath>& paths);
 
 }  // namespace vesk
