@@ -14,65 +14,41 @@ namespace {
 constexpr std::size_t kLargestDocument = 1 << 20;
 constexpr std::size_t kMostDotsInAKey = 6;
 
-Value valueFromNode(const toml::node& node);
-
-Dictionary dictionaryFromTable(const toml::table& table) {
-  MutableDictionary entries;
-  entries.reserve(table.size());
-  for (const auto& [key, node] : table) entries.append(Text(key.str()), valueFromNode(node));
-  return entries.share();
-}
-
-List listFromArray(const toml::array& array) {
-  std::vector<Value> values;
-  values.reserve(array.size());
-  for (const auto& node : array) values.push_back(valueFromNode(node));
-  return List(std::move(values));
-}
-
-std::int64_t secondsOfDay(const toml::date& date) {
+double secondsOf(const toml::date& date) {
   auto day = std::chrono::year(date.year) / std::chrono::month(date.month) / std::chrono::day(date.day);
-  return std::chrono::sys_seconds(std::chrono::sys_days(day)).time_since_epoch().count();
+  return static_cast<double>(std::chrono::sys_seconds(std::chrono::sys_days(day)).time_since_epoch().count());
 }
 
-Date dateFrom(const toml::date_time& when) {
-  const std::int64_t seconds = secondsOfDay(when.date) + when.time.hour * 3600 + when.time.minute * 60 +
-                               when.time.second - (when.offset ? when.offset->minutes * 60 : 0);
-  return Date{static_cast<double>(seconds) + when.time.nanosecond / 1e9};
-}
-
-template <class T>
-Text textFrom(const T& printable) {
-  std::ostringstream out;
-  out << printable;
-  return Text(out.str());
-}
-
-Value valueFromNode(const toml::node& node) {
-  switch (node.type()) {
-    case toml::node_type::table:
-      return dictionaryFromTable(*node.as_table());
-    case toml::node_type::array:
-      return listFromArray(*node.as_array());
-    case toml::node_type::string:
-      return Text(node.as_string()->get());
-    case toml::node_type::integer:
-      return node.as_integer()->get();
-    case toml::node_type::floating_point:
-      return node.as_floating_point()->get();
-    case toml::node_type::boolean:
-      return node.as_boolean()->get();
-    case toml::node_type::date:
-      return Date{static_cast<double>(secondsOfDay(node.as_date()->get()))};
-    case toml::node_type::date_time:
-      return dateFrom(node.as_date_time()->get());
-    case toml::node_type::time:
-      return textFrom(node.as_time()->get());
-    case toml::node_type::none:
-      break;
+struct Conversion {
+  Value operator()(const toml::table& table) const {
+    MutableDictionary entries;
+    entries.reserve(table.size());
+    for (const auto& [key, node] : table) entries.append(Text(key.str()), node.visit(*this));
+    return entries.share();
   }
-  return {};
-}
+  Value operator()(const toml::array& array) const {
+    std::vector<Value> values;
+    values.reserve(array.size());
+    for (const auto& node : array) values.push_back(node.visit(*this));
+    return List(std::move(values));
+  }
+  Value operator()(const toml::value<toml::date>& date) const { return Date{secondsOf(date.get())}; }
+  Value operator()(const toml::value<toml::date_time>& dateTime) const {
+    const toml::date_time& when = dateTime.get();
+    const int seconds = when.time.hour * 3600 + when.time.minute * 60 + when.time.second -
+                        (when.offset ? when.offset->minutes * 60 : 0);
+    return Date{secondsOf(when.date) + seconds + when.time.nanosecond / 1e9};
+  }
+  Value operator()(const toml::value<toml::time>& time) const {
+    std::ostringstream out;
+    out << time.get();
+    return out.str();
+  }
+  template <class Plain>
+  Value operator()(const toml::value<Plain>& value) const {
+    return value.get();
+  }
+};
 
 /// The index after the string that starts at `start`.
 std::size_t endOfString(std::string_view text, std::size_t start) {
@@ -122,7 +98,7 @@ Result<Dictionary> parseToml(std::string_view text) {
   if (text.size() > kLargestDocument) return malformed("larger than 1 MiB");
   if (hasKeyOfManyParts(text)) return malformed("a key with more than 7 parts");
   toml::parse_result result = toml::parse(text);
-  if (result) return dictionaryFromTable(result.table());
+  if (result) return *Conversion()(result.table()).dictionary();
   const toml::parse_error& error = result.error();
   std::ostringstream words;
   words << "line " << error.source().begin.line << ", column " << error.source().begin.column << ": "
