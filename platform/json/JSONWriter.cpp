@@ -99,12 +99,6 @@ void JSONWriter::key(std::string_view key) {
   _isMember = true;
 }
 
-template <class Integer>
-void JSONWriter::integer(Integer number) {
-  char digits[24];
-  _text.append(digits, std::to_chars(digits, std::end(digits), number).ptr);
-}
-
 void JSONWriter::real(double number) {
   _isGood = _isGood && std::isfinite(number);
   const double size = std::fabs(number);
@@ -129,8 +123,8 @@ void JSONWriter::value(const Value& value) {
   }
   separate();
   if (const Text* text = value.text()) return quote(text->view());
-  if (const std::int64_t* number = value.signedInteger()) return integer(*number);
-  if (const std::uint64_t* number = value.unsignedInteger()) return integer(*number);
+  if (const auto* number = value.signedInteger()) _text += std::to_string(*number);
+  if (const auto* number = value.unsignedInteger()) _text += std::to_string(*number);
   if (const double* number = value.real()) return real(*number);
   if (const Date* date = value.date()) return real(date->secondsSince1970);
   if (const bool* flag = value.boolean()) _text.append(*flag ? "true" : "false");

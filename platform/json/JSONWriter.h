@@ -55,8 +55,6 @@ class JSONWriter {
   void separate();
   void breakLine();
   void quote(std::string_view text);
-  template <class Integer>
-  void integer(Integer number);
   void real(double number);
   void object(const DictionaryEntry* begin, const DictionaryEntry* end);
 

@@ -26,10 +26,8 @@ bool isUnchangedSince(const HTTPReceived& received, std::time_t lastModified) {
 }
 
 bool isPlainName(std::string_view name) {
-  auto isPlain = [](char c) {
-    return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '-' || c == '_';
-  };
-  return !name.empty() && name.size() <= 100 && std::all_of(name.begin(), name.end(), isPlain);
+  constexpr std::string_view kPlain = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789-_";
+  return !name.empty() && name.size() <= 100 && name.find_first_not_of(kPlain) == name.npos;
 }
 
 bool isSameVersion(const struct stat& a, const struct stat& b) {
