@@ -53,10 +53,9 @@ std::string countedObject(unsigned kind, std::size_t count) {
   return objectMarker(kind, 0xF) + unsignedObject(count);
 }
 
-std::optional<std::string> textObject(std::string_view text) {
-  if (text.find('\0') != std::string_view::npos) return std::nullopt;
-  auto units = utf16BEFromUTF8(text);
-  if (!units) return std::nullopt;
+std::string textObject(std::string_view text) {
+  const auto units = utf16BEFromUTF8(text);
+  if (!units || text.find('\0') != std::string_view::npos) throw Unwritable();
   return isASCII(text) ? countedObject(0x5, text.size()).append(text)
                        : countedObject(0x6, units->size() / 2).append(*units);
 }
@@ -66,8 +65,8 @@ class BinaryWriter {
  public:
   explicit BinaryWriter(PropertyListFlavor flavor) : _flavor(flavor) {}
 
-  std::optional<std::string> write(const Value& root) {
-    if (!add(root, 1)) return std::nullopt;
+  std::string write(const Value& root) {
+    add(root, 1);
     const std::size_t referenceSize = sizeFor(_objects.size() - 1);
     std::string out(kBinaryPropertyListMagic);
     std::vector<std::size_t> offsets;
@@ -92,14 +91,15 @@ class BinaryWriter {
     std::string bytes;
     std::vector<std::size_t> references = {};
   };
-  using Index = std::optional<std::size_t>;  // nullopt if it can't be written
 
-  Index addBytes(std::string bytes) {
+  // These return the object's index.
+
+  std::size_t addBytes(std::string bytes) {
     _objects.push_back({std::move(bytes)});
     return _objects.size() - 1;
   }
 
-  Index add(const Value& value, std::size_t depth) {
+  std::size_t add(const Value& value, std::size_t depth) {
     switch (value.kind()) {
       case Value::Kind::None:
         return addBytes(objectMarker(0x0, 0x0));
@@ -122,47 +122,34 @@ class BinaryWriter {
       case Value::Kind::Dictionary:
         return addDictionary(*value.dictionary(), depth);
     }
-    return std::nullopt;
+    throw Unwritable();
   }
 
-  Index addText(const Text& text) {
-    if (auto known = _texts.find(text); known != _texts.end()) return known->second;
-    auto object = textObject(text.view());
-    if (!object) return std::nullopt;
-    Index index = addBytes(*std::move(object));
-    _texts.emplace(text, *index);
-    return index;
+  std::size_t addText(const Text& text) {
+    const auto [known, isNew] = _texts.try_emplace(text, _objects.size());
+    return isNew ? addBytes(textObject(text.view())) : known->second;
   }
 
-  Index addList(const List& list, std::size_t depth) {
-    if (depth > kDeepest) return std::nullopt;
-    Index index = addBytes(countedObject(0xA, list.size()));
+  std::size_t addContainer(unsigned kind, std::size_t count, std::size_t depth) {
+    if (depth > kDeepest) throw Unwritable();
+    return addBytes(countedObject(kind, count));
+  }
+
+  std::size_t addList(const List& list, std::size_t depth) {
+    const std::size_t index = addContainer(0xA, list.size(), depth);
     std::vector<std::size_t> references;
-    for (const Value& value : list) {
-      Index part = add(value, depth + 1);
-      if (!part) return std::nullopt;
-      references.push_back(*part);
-    }
-    _objects[*index].references = std::move(references);
+    for (const Value& value : list) references.push_back(add(value, depth + 1));
+    _objects[index].references = std::move(references);
     return index;
   }
 
-  Index addDictionary(const Dictionary& dictionary, std::size_t depth) {
+  std::size_t addDictionary(const Dictionary& dictionary, std::size_t depth) {
     if (auto uid = uidOf(dictionary)) return addBytes(*std::move(uid));
-    if (depth > kDeepest) return std::nullopt;
-    Index index = addBytes(countedObject(0xD, dictionary.size()));
+    const std::size_t index = addContainer(0xD, dictionary.size(), depth);
     std::vector<std::size_t> references;
-    for (const auto& entry : dictionary) {
-      Index key = addText(entry.key);
-      if (!key) return std::nullopt;
-      references.push_back(*key);
-    }
-    for (const auto& entry : dictionary) {
-      Index value = add(entry.value, depth + 1);
-      if (!value) return std::nullopt;
-      references.push_back(*value);
-    }
-    _objects[*index].references = std::move(references);
+    for (const auto& entry : dictionary) references.push_back(addText(entry.key));
+    for (const auto& entry : dictionary) references.push_back(add(entry.value, depth + 1));
+    _objects[index].references = std::move(references);
     return index;
   }
 
@@ -187,7 +174,11 @@ class BinaryWriter {
 }  // namespace
 
 std::optional<std::string> writeBinaryPropertyList(const Value& value, PropertyListFlavor flavor) {
-  return BinaryWriter(flavor).write(value);
+  try {
+    return BinaryWriter(flavor).write(value);
+  } catch (const Unwritable&) {
+    return std::nullopt;
+  }
 }
 
 }  // namespace vesk

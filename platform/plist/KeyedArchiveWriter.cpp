@@ -16,18 +16,15 @@ class ArchiveWriter {
   ArchiveWriter() { _objects.emplace_back(Text::literal(archive::kNull)); }
 
   std::optional<std::string> write(const Value& root) {
-    auto reference = add(root, 1);
-    if (!reference) return std::nullopt;
+    const Value reference = add(root, 1);
     const Dictionary document{{Text::literal(archive::kVersion), kKeyedArchiveVersion},
                               {Text::literal(archive::kArchiver), kKeyedArchiver},
-                              {Text::literal(archive::kTop), Dictionary{{archive::kRoot, *reference}}},
+                              {Text::literal(archive::kTop), Dictionary{{archive::kRoot, reference}}},
                               {Text::literal(archive::kObjects), List(std::move(_objects))}};
     return writeBinaryPropertyList(document, PropertyListFlavor::KeyedArchive);
   }
 
  private:
-  using Reference = std::optional<Value>;  // nullopt if nested too deeply
-
   static Value referenceTo(std::size_t index) {
     return Dictionary{{Text(kUIDKey), static_cast<std::uint64_t>(index)}};
   }
@@ -37,7 +34,7 @@ class ArchiveWriter {
     return referenceTo(_objects.size() - 1);
   }
 
-  Reference add(const Value& value, std::size_t depth) {
+  Value add(const Value& value, std::size_t depth) {
     switch (value.kind()) {
       case Value::Kind::None:
         return referenceTo(0);
@@ -50,10 +47,10 @@ class ArchiveWriter {
                          {{Text::literal(archive::kSeconds), value.date()->secondsSince1970}});
       case Value::Kind::List:
         return addShared(value.list()->begin(), archive::kListClass, depth,
-                         [&](MutableDictionary& object) { return fill(object, *value.list(), depth); });
+                         [&](MutableDictionary& object) { fill(object, *value.list(), depth); });
       case Value::Kind::Dictionary:
         return addShared(value.dictionary()->begin(), archive::kDictionaryClass, depth,
-                         [&](MutableDictionary& object) { return fill(object, *value.dictionary(), depth); });
+                         [&](MutableDictionary& object) { fill(object, *value.dictionary(), depth); });
       default:
         return append(value);  // numbers are archived as they are
     }
@@ -75,8 +72,8 @@ class ArchiveWriter {
 
   /// Adds a container, identified by the address of its contents. `fillIt` archives the contents.
   template <class Fill>
-  Reference addShared(const void* contents, const char* className, std::size_t depth, Fill fillIt) {
-    if (depth > kDeepest) return std::nullopt;
+  Value addShared(const void* contents, const char* className, std::size_t depth, Fill fillIt) {
+    if (depth > kDeepest) throw Unwritable();
     const std::size_t index = _objects.size();
     if (contents != nullptr) {
       auto [known, isNew] = _containers.try_emplace(contents, index);
@@ -84,33 +81,25 @@ class ArchiveWriter {
     }
     _objects.emplace_back();  // reserves its index; its contents follow
     MutableDictionary object;
-    if (!fillIt(object)) return std::nullopt;
+    fillIt(object);
     _objects[index] = withClass(std::move(object), className);
     return referenceTo(index);
   }
 
-  bool fill(MutableDictionary& object, const List& list, std::size_t depth) {
+  void fill(MutableDictionary& object, const List& list, std::size_t depth) {
     std::vector<Value> items;
-    for (const Value& value : list) {
-      auto reference = add(value, depth + 1);
-      if (!reference) return false;
-      items.push_back(*std::move(reference));
-    }
+    for (const Value& value : list) items.push_back(add(value, depth + 1));
     object.append(Text::literal(archive::kItems), List(std::move(items)));
-    return true;
   }
 
-  bool fill(MutableDictionary& object, const Dictionary& dictionary, std::size_t depth) {
+  void fill(MutableDictionary& object, const Dictionary& dictionary, std::size_t depth) {
     std::vector<Value> keys, items;
     for (const auto& entry : dictionary) {
       keys.push_back(addText(entry.key));
-      auto reference = add(entry.value, depth + 1);
-      if (!reference) return false;
-      items.push_back(*std::move(reference));
+      items.push_back(add(entry.value, depth + 1));
     }
     object.append(Text::literal(archive::kKeys), List(std::move(keys)));
     object.append(Text::literal(archive::kItems), List(std::move(items)));
-    return true;
   }
 
   Value withClass(MutableDictionary object, const char* className) {
@@ -134,6 +123,12 @@ class ArchiveWriter {
 
 }  // namespace
 
-std::optional<std::string> archiveValue(const Value& root) { return ArchiveWriter().write(root); }
+std::optional<std::string> archiveValue(const Value& root) {
+  try {
+    return ArchiveWriter().write(root);
+  } catch (const Unwritable&) {
+    return std::nullopt;
+  }
+}
 
 }  // namespace vesk

@@ -18,6 +18,9 @@ Result<Value> parseXMLPropertyList(std::string_view bytes, const PropertyListLim
 Result<Value> parseBinaryPropertyList(std::string_view bytes, PropertyListFlavor flavor,
                                       const PropertyListLimits& limits);
 
+/// Thrown within a writer for what it can't write.
+struct Unwritable {};
+
 /// Counts a document's cost. Each operation fails once a limit is exceeded; the error names the limit.
 class PropertyListBudget {
  public:
