@@ -30,20 +30,11 @@ std::int64_t leadingInteger(std::string_view text) noexcept {
 }
 
 std::optional<std::string> stringForm(const Value& value) {
-  switch (value.kind()) {
-    case Value::Kind::Text:
-      return value.text()->string();
-    case Value::Kind::Boolean:
-      return *value.boolean() ? "1" : "0";
-    case Value::Kind::Signed:
-      return std::to_string(*value.signedInteger());
-    case Value::Kind::Unsigned:
-      return std::to_string(*value.unsignedInteger());
-    case Value::Kind::Double:
-      return decimal(*value.real());
-    default:
-      return std::nullopt;
-  }
+  if (const Text* text = value.text()) return text->string();
+  if (const double* number = value.real()) return decimal(*number);
+  if (const auto* number = value.unsignedInteger()) return std::to_string(*number);
+  const auto number = value.asInteger();
+  return number ? std::optional(std::to_string(*number)) : std::nullopt;
 }
 
 std::int64_t integerForm(const Value& value) {
