@@ -58,10 +58,9 @@ FileDescriptor makeRuleset(long kernelVersion, bool restrictsConnections) {
       static_cast<int>(::syscall(SYS_landlock_create_ruleset, &ruleset, sizeof ruleset, 0)));
 }
 
-Result<void> addPort(int ruleset, std::uint16_t port) {
-  const PortRule rule{kConnectTCP, port};
-  if (::syscall(SYS_landlock_add_rule, ruleset, kPortRule, &rule, 0) == 0) return {};
-  return systemError(errno, "landlock_add_rule: port " + std::to_string(port));
+Result<void> addRule(int ruleset, int kind, const void* rule, const std::string& subject) {
+  if (::syscall(SYS_landlock_add_rule, ruleset, kind, rule, 0) == 0) return {};
+  return systemError(errno, "landlock_add_rule: " + subject);
 }
 
 /// A rule applies to the current inode. The kernel creates inodes below /proc on demand, and creates a new
@@ -71,7 +70,7 @@ void keepIfMadeUp(FileDescriptor& descriptor, const std::string& path) {
     int kept = descriptor.release();
 }
 
-Result<void> addRule(int ruleset, const SandboxPath& path) {
+Result<void> addPath(int ruleset, const SandboxPath& path) {
   FileDescriptor target(::open(path.path.c_str(), O_PATH | O_CLOEXEC));
   if (!target) {
     bool nothingToGrant = errno == ENOENT || errno == ENOTDIR || errno == EACCES;
@@ -84,11 +83,9 @@ Result<void> addRule(int ruleset, const SandboxPath& path) {
   rule.allowed_access = path.rights;
   if (!S_ISDIR(status.st_mode)) rule.allowed_access &= kFileRights;
   rule.parent_fd = target.get();
-  if (::syscall(SYS_landlock_add_rule, ruleset, LANDLOCK_RULE_PATH_BENEATH, &rule, 0) != 0) {
-    return systemError(errno, "landlock_add_rule: " + path.path);
-  }
-  keepIfMadeUp(target, path.path);
-  return {};
+  const auto added = addRule(ruleset, LANDLOCK_RULE_PATH_BENEATH, &rule, path.path);
+  if (added) keepIfMadeUp(target, path.path);
+  return added;
 }
 
 }  // namespace
@@ -104,11 +101,13 @@ Result<void> enterLandlock(const SandboxProfile& profile) {
   FileDescriptor ruleset = makeRuleset(kernelVersion, profile.connectPorts.has_value());
   if (!ruleset) return systemError(errno, "landlock_create_ruleset");
   for (const SandboxPath& path : profile.paths) {
-    if (auto added = addRule(ruleset.get(), path); !added) return added;
+    if (auto added = addPath(ruleset.get(), path); !added) return added;
   }
   if (kernelVersion >= 4 && profile.connectPorts) {
     for (std::uint16_t port : *profile.connectPorts) {
-      if (auto added = addPort(ruleset.get(), port); !added) return added;
+      const PortRule rule{kConnectTCP, port};
+      auto added = addRule(ruleset.get(), kPortRule, &rule, "port " + std::to_string(port));
+      if (!added) return added;
     }
   }
   if (::syscall(SYS_landlock_restrict_self, ruleset.get(), 0) != 0) {
