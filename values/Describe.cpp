@@ -6,12 +6,6 @@ namespace vesk {
 
 namespace {
 
-std::string formatted(const char* format, auto value) {
-  char buffer[32];
-  std::snprintf(buffer, sizeof buffer, format, value);
-  return buffer;
-}
-
 class Describer {
  public:
   explicit Describer(std::size_t limit) : _limit(limit) {}
@@ -24,9 +18,16 @@ class Describer {
   void operator()(bool flag) { _out += flag ? "true" : "false"; }
   void operator()(std::int64_t number) { _out += std::to_string(number); }
   void operator()(std::uint64_t number) { _out += std::to_string(number); }
-  void operator()(double number) { _out += formatted("%.15g", number); }
+  void operator()(double number) {
+    char buffer[32];
+    std::snprintf(buffer, sizeof buffer, "%.15g", number);
+    _out += buffer;
+  }
   void operator()(const Bytes& bytes) { _out += "<" + std::to_string(bytes.size()) + " bytes>"; }
-  void operator()(Date date) { _out += formatted("@%.15g", date.secondsSince1970); }
+  void operator()(Date date) {
+    _out += '@';
+    (*this)(date.secondsSince1970);
+  }
 
   void operator()(const Text& text) {
     _out += '"';
@@ -35,7 +36,9 @@ class Describer {
       // Control characters must not split a log line.
       const auto byte = static_cast<unsigned char>(c);
       if (byte < 0x20 || byte == 0x7f) {
-        _out += formatted("\\x%02x", byte);
+        char buffer[8];
+        std::snprintf(buffer, sizeof buffer, "\\x%02x", byte);
+        _out += buffer;
       } else {
         _out += c;
       }
