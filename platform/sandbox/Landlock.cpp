@@ -83,7 +83,7 @@ Result<void> addPath(int ruleset, const SandboxPath& path) {
   rule.allowed_access = path.rights;
   if (!S_ISDIR(status.st_mode)) rule.allowed_access &= kFileRights;
   rule.parent_fd = target.get();
-  const auto added = addRule(ruleset, LANDLOCK_RULE_PATH_BENEATH, &rule, path.path);
+  auto added = addRule(ruleset, LANDLOCK_RULE_PATH_BENEATH, &rule, path.path);
   if (added) keepIfMadeUp(target, path.path);
   return added;
 }
