@@ -220,7 +220,7 @@ std::shared_ptr<DeliveryTap::Reader> Diagnostics::openTap(const IPCPeer& viewer,
   MutableDictionary wanted(filter, 1);
   const DeliveryTap::Wishes wishes{.messages = booleanForKey(filter, "messages").value_or(false),
                                    .bodies = booleanForKey(filter, "bodies").value_or(false)};
-  for (const char* wish : {"messages", "bodies"}) wanted.remove(wish);
+  for (const char* wish : {"messages", "bodies", "wait"}) wanted.remove(wish);
   const bool everything = seesAll(viewer);
   if (!everything) wanted.set("user", static_cast<std::int64_t>(viewer.user));
   const auto matches = [wanted = wanted.share()](const Dictionary& record) {

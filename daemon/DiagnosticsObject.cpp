@@ -47,12 +47,13 @@ class Object final : public IPCExportedObject {
   Dictionary openTap(const Dictionary& filter) {
     _tap = nullptr;
     _tap = _diagnostics->openTap(_viewer, filter);
+    _patience = booleanForKey(filter, "wait").value_or(true) ? kTapPatience : kTapPatience.zero();
     return _tap ? Dictionary() : problem("too many are looking already");
   }
 
   Dictionary readTap() {
     if (!_tap) return problem("openTap comes first");
-    auto batch = _tap->take(kTapPatience);
+    auto batch = _tap->take(_patience);
     return {{"records", List(std::move(batch.records))}, {"lost", batch.lost}};
   }
 
@@ -60,6 +61,7 @@ class Object final : public IPCExportedObject {
   const std::shared_ptr<Operations> _operations;
   const IPCPeer _viewer;
   std::shared_ptr<DeliveryTap::Reader> _tap;
+  std::chrono::milliseconds _patience = kTapPatience;
 };
 
 const Object::Method Object::kMethods[9] = {

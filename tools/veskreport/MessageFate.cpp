@@ -35,12 +35,13 @@ std::string wordsFor(const Dictionary& record) {
 }  // namespace
 
 MessageWatch::MessageWatch(const Invocation& invocation, const Output& output, const Dictionary& sessionInfo,
-                           const char* outcome)
+                           const char* outcome, bool waits)
     : _invocation(invocation),
       _sessionID(integerForKey(sessionInfo, kVeskReportingSessionInfoSessionID).value_or(0)),
       _daemon(invocation, output) {
   MutableDictionary filter(Dictionary{{"sessionID", _sessionID}, {"messages", true}}, 1);
   if (*outcome != '\0') filter.set("outcome", outcome);
+  if (!waits) filter.set("wait", false);
   const auto opened = _daemon.call(wire::kOpenTap, {filter.share()});
   _isOpen = opened && opened->empty();
 }

@@ -13,9 +13,9 @@ namespace vesk {
 /// Watches a session's messages from its construction on, if the daemon lets it.
 class MessageWatch {
  public:
-  /// `outcome`: only these; empty: all.
+  /// `outcome`: only these; empty: all. `waits`: for what has not happened yet.
   MessageWatch(const Invocation& invocation, const Output& output, const Dictionary& sessionInfo,
-               const char* outcome = "");
+               const char* outcome = "", bool waits = true);
 
   struct Fate {
     std::string backend;

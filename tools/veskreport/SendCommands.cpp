@@ -118,7 +118,7 @@ class MessageStream {
   DaemonSession& _session;
   const Invocation& _invocation;
   const Output& _output;
-  MessageWatch _watch{_invocation, _output, _session.sessionInfo(), "dropped"};
+  MessageWatch _watch{_invocation, _output, _session.sessionInfo(), "dropped", false};
   LineReader _lines;
   Progress _progress{STDIN_FILENO};
 
