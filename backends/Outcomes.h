@@ -37,7 +37,7 @@ class Outcomes {
   void show(const char* what, const char* outcome, const Dictionary& facts,
             const std::string& body = {}) const;
 
-  /// Counts messages or events, and shows them. `facts` is only called if somebody looks.
+  /// Counts messages or events and passes them to open taps. Calls `facts` only if a tap is open.
   template <class Facts>
   void count(const char* what, DropReason reason, std::uint64_t n, Facts facts,
              const std::string& body = {}) const {

@@ -32,6 +32,17 @@ void noteMissingParent(const BackendSet& backends, std::uint32_t sessionID) {
   }
 }
 
+Dictionary describeStates(const BackendSet& backends) {
+  MutableDictionary states;
+  for (const auto& [name, backend] : backends) {
+    MutableDictionary each(Dictionary{{"state", std::string(nameOfState(backend->state()))}});
+    const auto reason = backend->state() == BackendStateEnabled ? std::nullopt : backend->stateReason();
+    if (reason) each.set("reason", *reason);
+    states.set(name, each.share());
+  }
+  return states.share();
+}
+
 BackendNames fetchReportingStates(const BackendSet& backends) {
   BackendNames enabled;
   for (const auto& [name, backend] : backends) {

@@ -20,6 +20,9 @@ void syncReportingStates(const BackendSet& backends, const BackendSet* parent);
 /// Logs a line for each backend with a hierarchy above 0, for a session without a parent.
 void noteMissingParent(const BackendSet& backends, std::uint32_t sessionID);
 
+/// For operators: each backend's `state` and, unless it is enabled, the `reason`, by name.
+Dictionary describeStates(const BackendSet& backends);
+
 /// The names of the enabled backends.
 BackendNames fetchReportingStates(const BackendSet& backends);
 

@@ -385,15 +385,7 @@ Dictionary ReportingdSession::diagnosis() const {
     const auto text = from ? from->text(key) : std::nullopt;
     return text ? Value(*text) : Value();
   };
-  MutableDictionary states;
-  if (const auto set = backends()) {
-    for (const auto& [name, backend] : *set) {
-      MutableDictionary each(Dictionary{{"state", std::string(nameOfState(backend->state()))}});
-      const auto reason = backend->state() == BackendStateEnabled ? std::nullopt : backend->stateReason();
-      if (reason) each.set("reason", *reason);
-      states.set(name, each.share());
-    }
-  }
+  const auto set = backends();
   return Dictionary{
       {"process", static_cast<std::int64_t>(_connection->peer().process)},
       {"user", static_cast<std::int64_t>(user())},
@@ -403,7 +395,7 @@ Dictionary ReportingdSession::diagnosis() const {
       {"serviceName", textOf(sender, kVeskReportingUserInfoServiceName)},
       {"level", static_cast<std::int64_t>(getSessionHierarchy())},
       {"storebagVersion", storebagVersion().value_or("")},
-      {"backends", states.share()}};
+      {"backends", set ? describeStates(*set) : Dictionary()}};
 }
 
 // --- Family

@@ -171,7 +171,7 @@ TEST_F(Diagnostics, TapShowsWhatLeavesTheDevice) {
                     "--client-name", "Camera", "--messages", "--bodies", "--count", "6"});
   ASSERT_TRUE(tap.waitForText("watching"));
   {
-    auto nobody = session("Nobody");  // not asked for
+    auto nobody = session("Nobody");  // filtered out
     auto camera = session("Camera");
     EXPECT_TRUE(camera.reporting.sendMessageAndWait(message(3, {{"x", "secret"}, {"y", 1}})));
   }

@@ -41,7 +41,7 @@ const std::vector<Case>& cases() {
   static const std::vector<Case> all{
       {with("\"Camera\"", "3"), "error: release.httpPost.clients[0].client: must be a text, is 3"},
       {with("https:", "htps:"),
-       "error: release.httpPost.clients[0].post_url: 'htps://collect.example/events' is no http or https "
+       "error: release.httpPost.clients[0].post_url: 'htps://collect.example/events' is not an http or https "
        "URL"},
       {with("collect.example", "h:70000"),
        "error: release.httpPost.clients[0].post_url: 'https://h:70000/events' has a port that is not"},

@@ -153,8 +153,8 @@ class PostOutbox final : public PostKeeper {
   // Called on any thread.
   Ticket put(HTTPRequest post, std::chrono::seconds delay, bool isBeingSent);
   WallTime after(std::chrono::seconds delay) const { return _options.clock->now() + delay; }
-  /// Runs the task on the outbox's thread and waits for it. If nothing waits, there is no thread and no task
-  /// to run.
+  /// Runs the task on the outbox's thread and waits for it to finish. Does nothing if the thread was never
+  /// started, since no post is kept then.
   void runOnThread(const std::function<void()>& task);
 
   // Called on the outbox's thread only.

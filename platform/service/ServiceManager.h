@@ -29,7 +29,7 @@ class ServiceManager {
   static bool isPresent() noexcept;
 
   void notifyReady() const noexcept;
-  /// Shows one line to whoever asks the manager about the service.
+  /// Sets the status line that the manager shows for the service.
   void notifyStatus(const std::string& line) const noexcept;
   void notifyStopping() const noexcept;
 

@@ -1,4 +1,4 @@
-// Finds the word that somebody meant.
+// Finds the known word closest to a misspelt one.
 #pragma once
 
 #include <algorithm>

@@ -1,4 +1,4 @@
-// Client entries of storebags as nobody would write them.
+// Random client entries for storebags, including combinations that nobody would write.
 #pragma once
 
 #include <random>

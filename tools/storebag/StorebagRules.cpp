@@ -132,7 +132,7 @@ class Checker {
   void checkURL(const std::string& place, std::string_view url) {
     const std::string shown = "'" + std::string(url.substr(0, 60)) + "' ";
     if (!isWebURL(url)) {
-      add(Kind::Impossible, place, shown + "is no http or https URL; begin it with https:// and a host");
+      add(Kind::Impossible, place, shown + "is not an http or https URL; begin it with https:// and a host");
     } else if (portIn(url) == -1) {
       add(Kind::Impossible, place, shown + "has a port that is not from 1 to 65535");
     }
