@@ -6,7 +6,7 @@
 #ifndef VESKREPORTING_WRENADAPTOR_H
 #define VESKREPORTING_WRENADAPTOR_H
 
-#include <stddef.h>
+#include <VeskReporting/VeskValues.h>
 #include <stdint.h>
 
 #ifdef __cplusplus
@@ -15,64 +15,8 @@ extern "C" {
 
 #define VESK_WREN_ADAPTOR_VERSION 1u
 
-/* ---- Payloads -------------------------------------------------------------------------------------------
- * A message's contents, read-only. Everything reachable from a view belongs to the daemon and is valid until
- * the operation that received the view returns. An adaptor that needs it longer must copy it. */
-
-enum VeskValueKind {
-  VeskValueNone = 0, /* the null marker */
-  VeskValueBoolean,
-  VeskValueSigned,
-  VeskValueUnsigned,
-  VeskValueDouble,
-  VeskValueText,
-  VeskValueBytes,
-  VeskValueDate,
-  VeskValueList,
-  VeskValueDictionary
-};
-
-typedef struct VeskValueView VeskValueView;
-typedef struct VeskEntryView VeskEntryView;
-
-/* UTF-8 text without NUL; not NUL-terminated. `data` may be null if `length` is 0. */
-typedef struct VeskTextView {
-  const char* data;
-  size_t length; /* bytes */
-} VeskTextView;
-
-typedef struct VeskListView {
-  const VeskValueView* values;
-  size_t count;
-} VeskListView;
-
-/* Keys are unique, in the client's order. */
-typedef struct VeskDictionaryView {
-  const VeskEntryView* entries;
-  size_t count;
-} VeskDictionaryView;
-
-/* Skip values of unknown kinds, since later versions may add some. Lists and dictionaries nest at most 64
- * levels deep. */
-struct VeskValueView {
-  uint32_t kind; /* an enum VeskValueKind */
-  union {
-    int boolean; /* 0 or 1 */
-    int64_t signedInteger;
-    uint64_t unsignedInteger;
-    double real;
-    double secondsSince1970; /* a date; may be any double */
-    VeskTextView text;
-    VeskTextView bytes; /* any bytes */
-    VeskListView list;
-    VeskDictionaryView dictionary;
-  } as;
-};
-
-struct VeskEntryView {
-  VeskTextView key;
-  VeskValueView value;
-};
+/* A message's payload is a read-only view. Everything reachable from it belongs to the daemon and is valid
+ * until the operation that received it returns. An adaptor that needs it longer must copy it. */
 
 /* ---- Adaptor --------------------------------------------------------------------------------------------
  */
