@@ -4,8 +4,10 @@
 
 #include <algorithm>
 #include <csignal>
+#include <exception>
 
 #include "client/DrainBudget.h"
+#include "client/Recorder.h"
 #include "platform/log/SystemLog.h"
 
 namespace vesk {
@@ -38,11 +40,18 @@ std::thread startThread(const std::shared_ptr<SessionWorker>& worker) {
   return thread;
 }
 
+/// Sessions that name no socket of their own connect to the recorder, if there is one.
+ReportingOptions withRecorder(ReportingOptions options) {
+  if (options.socketPath.empty()) options.socketPath = Recorder::currentSocket();
+  return options;
+}
+
 }  // namespace
 
 ClientSession::ClientSession(const ReportingOptions& options)
-    : _drainTime(boundedWait(options.drainTime)),
-      _worker(std::make_shared<SessionWorker>(options)),
+    : _isRecorded(options.socketPath.empty() && !Recorder::currentSocket().empty()),
+      _drainTime(boundedWait(options.drainTime)),
+      _worker(std::make_shared<SessionWorker>(withRecorder(options))),
       _thread(startThread(_worker)) {}
 
 ClientSession::~ClientSession() {
@@ -57,6 +66,23 @@ ClientSession::~ClientSession() {
   _thread.join();
   const auto now = std::chrono::steady_clock::now();
   DrainBudget::shared().spend(std::min<std::chrono::steady_clock::duration>(now - begun, granted), now);
+}
+
+CallEnd ClientSession::endFor(AnswerKind kind, Callback callback) {
+  return [kind, callback = std::move(callback)](ReportingStatus status, BusAnswer* answer,
+                                                std::string_view detail) {
+    ReportingAnswer result{status};
+    try {
+      result.detail = detail;
+      if (answer && !readAnswer(kind, *answer, result)) {
+        result = {ReportingStatus::Refused, "the daemon's answer is of another type"};
+      }
+    } catch (const std::exception&) {
+      // Still calls the callback, but without the text or without the answer.
+      result = {answer ? ReportingStatus::OutOfResources : status};
+    }
+    callback(result);
+  };
 }
 
 }  // namespace vesk

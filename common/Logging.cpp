@@ -1,32 +1,31 @@
-#include <VeskReporting/VeskReportingLogging.h>
+#include <VeskReporting/VeskLog.h>
 
-#include <utility>
+#include <memory>
+#include <string_view>
 
 #include "platform/log/SystemLog.h"
 
-namespace vesk {
-
-void VeskReportingLogging::startLogging(const char* processName, const char* facility) noexcept {
+void vesk_log_start(const char* process, const char* facility) {
   try {
-    SystemLog::open(processName ? processName : "", facility ? facility : "");
+    vesk::SystemLog::open(process ? process : "", facility ? facility : "");
   } catch (...) {
     // Out of memory: lines are logged without the names.
   }
 }
 
-void VeskReportingLogging::close() noexcept { SystemLog::close(); }
+void vesk_log_close() { vesk::SystemLog::close(); }
 
-void VeskReportingLogging::setLevel(int level) noexcept { SystemLog::setLevel(level); }
+void vesk_log_set_level(std::int32_t level) { vesk::SystemLog::setLevel(level); }
 
-void VeskReportingLogging::setSink(std::function<void(int level, std::string_view line)> sink) noexcept {
+void vesk_log_set_sink(vesk_log_sink sink, void (*release)(void* context), void* context) {
   try {
-    if (!sink) return SystemLog::setSink(nullptr);
-    SystemLog::setSink([sink = std::move(sink)](LogLevel level, std::string_view line) {
-      sink(static_cast<int>(level), line);
+    const std::shared_ptr<void> kept(
+        context, release ? release : [](void*) {});
+    if (!sink) return vesk::SystemLog::setSink(nullptr);
+    vesk::SystemLog::setSink([sink, kept](vesk::LogLevel level, std::string_view line) {
+      sink(kept.get(), static_cast<std::int32_t>(level), line.data(), line.size());
     });
   } catch (...) {
-    // Out of memory: the previous sink stays.
+    // Out of memory: the previous sink stays, and the context was released.
   }
 }
-
-}  // namespace vesk

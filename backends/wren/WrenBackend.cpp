@@ -1,10 +1,11 @@
 #include "backends/wren/WrenBackend.h"
 
+#include <VeskReporting/values/ValueViews.h>
+
 #include <cstring>
 #include <exception>
 #include <utility>
 
-#include "backends/wren/WrenPayload.h"
 #include "platform/files/RootPrefix.h"
 #include "platform/log/SystemLog.h"
 #include "util/SamplingDraw.h"
@@ -122,8 +123,8 @@ Result<void> WrenBackend::forwardTo(VeskWrenSendMessage forward, std::uint16_t m
                                     const std::optional<Dictionary>& payload) {
   return guarded([&] {
     const Dictionary dictionary = payload.value_or(Dictionary());
-    WrenPayload view(dictionary);
-    forward(_wrenAdaptor.get(), method, respCode, &view.view());
+    ValueViews view(dictionary);
+    forward(_wrenAdaptor.get(), method, respCode, &view.dictionary());
   });
 }
 

@@ -13,6 +13,7 @@
 #include <variant>
 #include <vector>
 
+#include <VeskReporting/VeskValues.h>
 #include <VeskReporting/values/Value.h>
 
 namespace vesk {
@@ -44,11 +45,12 @@ struct IPCDescriptor {
 };
 
 /// An argument of a call; its type determines its D-Bus type (docs/wire.md): b, q, d, s, a{sv}, av, aa{sv},
-/// as (at most one), as (any number), aas (at most one), ah (at most one).
-using IPCArgument =
-    std::variant<bool, std::uint16_t, double, std::string, Dictionary, List, std::optional<Dictionary>,
-                 std::optional<std::string>, std::vector<std::string>,
-                 std::optional<std::vector<std::string>>, IPCDescriptor>;
+/// as (at most one), as (any number), aas (at most one), ah (at most one). Views are written as the
+/// dictionaries that they show, and borrowed until the call was encoded.
+using IPCArgument = std::variant<bool, std::uint16_t, double, std::string, Dictionary, List,
+                                 std::optional<Dictionary>, std::optional<std::string>,
+                                 std::vector<std::string>, std::optional<std::vector<std::string>>,
+                                 IPCDescriptor, VeskDictionaryView, std::optional<VeskDictionaryView>>;
 
 /// A call to the remote object.
 struct IPCOutgoingCall {

@@ -1,7 +1,9 @@
 #include "platform/ipc/MessageWriter.h"
 
 #include <cstring>
+#include <iterator>
 #include <optional>
+#include <span>
 #include <type_traits>
 
 #include "platform/ipc/Signature.h"
@@ -48,11 +50,7 @@ class Writer {
   void add(std::monostate) { signature(""); }
   void add(const Text& text) { addText(text.view()); }
   void add(const std::string& text) { addText(text); }
-  void add(const Bytes& bytes) {
-    if (!count(bytes.size())) return;
-    number(static_cast<std::uint32_t>(bytes.size()));
-    _out.append(bytes.view());
-  }
+  void add(const Bytes& bytes) { addBytes(bytes.view()); }
   void add(Date date) {
     align(8);
     number(date.secondsSince1970);
@@ -71,6 +69,41 @@ class Writer {
   }
   void add(const List& list) {
     nested(1, 1, list, [this](const Value& item) { add(item); });  // variant
+  }
+  void add(const VeskDictionaryView& view) {
+    nested(8, 2, std::span(view.entries, view.count), [this](const VeskEntryView& entry) {
+      align(8);
+      addText(shown(entry.key));
+      add(entry.value);
+    });
+  }
+  void add(const VeskValueView& view) {  // as a variant
+    if (view.kind >= std::size(kValueSignatures)) return fail(CodecResult::Malformed);
+    if (!count(kNodeContent)) return;
+    signature(kValueSignatures[view.kind]);
+    switch (view.kind) {
+      case VeskValueNone:
+        return add(std::monostate());
+      case VeskValueBoolean:
+        return add(view.as.boolean != 0);
+      case VeskValueSigned:
+        return add(view.as.signedInteger);
+      case VeskValueUnsigned:
+        return add(view.as.unsignedInteger);
+      case VeskValueDouble:
+        return add(view.as.real);
+      case VeskValueText:
+        return addText(shown(view.as.text));
+      case VeskValueBytes:
+        return addBytes(shown(view.as.bytes));
+      case VeskValueDate:
+        return add(Date{view.as.secondsSince1970});
+      case VeskValueList:
+        return nested(1, 1, std::span(view.as.list.values, view.as.list.count),
+                      [this](const VeskValueView& item) { add(item); });
+      case VeskValueDictionary:
+        return add(view.as.dictionary);
+    }
   }
   void add(const std::vector<std::string>& texts) {
     array(4, [&] {
@@ -119,6 +152,15 @@ class Writer {
     });
   }
 
+  static std::string_view shown(VeskTextView text) noexcept {
+    return text.data ? std::string_view(text.data, text.length) : std::string_view();
+  }
+
+  void addBytes(std::string_view bytes) {
+    if (!count(bytes.size())) return;
+    number(static_cast<std::uint32_t>(bytes.size()));
+    _out.append(bytes);
+  }
   void addText(std::string_view text) {
     if (!count(text.size())) return;
     if (!isValidUTF8(text, false)) return fail(CodecResult::Malformed);

@@ -12,8 +12,8 @@
 namespace vesk {
 
 /// The D-Bus types of arguments, in the order of IPCArgument's alternatives.
-inline constexpr std::string_view kArgumentTypes[] = {"b",      "q",  "d",  "s",   "a{sv}", "av",
-                                                      "aa{sv}", "as", "as", "aas", "ah"};
+inline constexpr std::string_view kArgumentTypes[] = {"b",  "q",  "d",   "s",  "a{sv}", "av",    "aa{sv}",
+                                                      "as", "as", "aas", "ah", "a{sv}", "aa{sv}"};
 static_assert(std::size(kArgumentTypes) == std::variant_size_v<IPCArgument>);
 
 template <class T, std::size_t At = 0>

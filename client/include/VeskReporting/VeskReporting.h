@@ -1,8 +1,10 @@
-// The client API for telemetry reporting.
+// The client API for telemetry reporting: a layer over veskreporting.h that needs nothing to be linked but
+// the library's C functions.
 #pragma once
 
 #include <VeskReporting/VeskReportingKeys.h>
 #include <VeskReporting/VeskReportingTypes.h>
+#include <VeskReporting/veskreporting.h>
 
 #include <memory>
 
@@ -23,7 +25,7 @@ namespace vesk {
 /// with a callback returns Queued at once and delivers its result later; one that returns a `ReportingResult`
 /// waits up to `timeout`, and a tenth of a second longer while a callback occupies the session's thread. A
 /// timeout starts with the call and includes the time in the queue.
-class VESK_API VeskReporting {
+class VeskReporting {
  public:
   static constexpr std::chrono::milliseconds kDefaultTimeout{30'000};
 
@@ -32,7 +34,7 @@ class VESK_API VeskReporting {
   /// Waits until the daemon has taken and answered what is queued, for at most `ReportingOptions::drainTime`.
   /// If the daemon was never reached, makes one attempt. Waits for a running callback or handler without a
   /// time limit, so it must not be called from one, or while holding a lock that one needs.
-  ~VeskReporting();
+  ~VeskReporting() = default;
   VeskReporting(const VeskReporting&) = delete;
   VeskReporting& operator=(const VeskReporting&) = delete;
 
@@ -140,8 +142,12 @@ class VESK_API VeskReporting {
   [[nodiscard]] static std::optional<std::string> publicKey() noexcept;
 
  private:
-  class Implementation;
-  std::unique_ptr<Implementation> _implementation;
+  struct Freed {
+    void operator()(vesk_session* session) const noexcept { vesk_session_free(session); }
+  };
+  const std::unique_ptr<vesk_session, Freed> _session;  ///< null if it could not be made
 };
 
 }  // namespace vesk
+
+#include <VeskReporting/VeskReporting-inl.h>

@@ -6,10 +6,12 @@
  *
  * All functions of a session are thread-safe. None aborts the program or installs a signal handler. Texts
  * are UTF-8 without NUL; `const char *` parameters are NUL-terminated. Arguments are borrowed until the
- * function returns. Times are in milliseconds. Null handles are allowed: such calls fail, or do nothing. */
+ * function returns. Times are in milliseconds. A null session is one that could not be made: its calls return
+ * VESK_OUT_OF_RESOURCES. Other null handles are invalid arguments, or nothing is done. */
 #ifndef VESKREPORTING_VESKREPORTING_H
 #define VESKREPORTING_VESKREPORTING_H
 
+#include <VeskReporting/VeskLog.h>
 #include <VeskReporting/VeskValues.h>
 #include <stddef.h>
 #include <stdint.h>
@@ -18,7 +20,6 @@
 extern "C" {
 #endif
 
-#define VESK_API __attribute__((visibility("default")))
 #define VESK_MUST_CHECK __attribute__((warn_unused_result))
 
 #define VESK_DEFAULT_TIMEOUT_MS 30000
@@ -82,7 +83,8 @@ typedef struct vesk_dictionary vesk_dictionary;
 /* Null if memory runs out. */
 VESK_API vesk_dictionary* vesk_dictionary_new(void);
 VESK_API void vesk_dictionary_free(vesk_dictionary* dictionary);
-/* Each returns VESK_DONE, VESK_INVALID_ARGUMENT or VESK_OUT_OF_RESOURCES. */
+/* Each replaces the value under `key`, and returns VESK_DONE, VESK_INVALID_ARGUMENT or
+ * VESK_OUT_OF_RESOURCES. */
 VESK_API vesk_status vesk_dictionary_set(vesk_dictionary* dictionary, const char* key,
                                          const VeskValueView* value);
 VESK_API vesk_status vesk_dictionary_set_text(vesk_dictionary* dictionary, const char* key, const char* text);
@@ -257,21 +259,6 @@ VESK_API size_t vesk_persistent_identifier(int respects_consent, char* buffer, s
 VESK_API size_t vesk_version(char* buffer, size_t size);
 /* The RSA public key (DER) that verifies storebags. */
 VESK_API size_t vesk_public_key(char* buffer, size_t size);
-
-/* ---- The process's log --------------------------------------------------------------------------------- */
-
-/* Lines have the syslog priorities 3 (error), 4 (warning), 6 (info) and 7 (debug). They go to the journal if
- * standard error is connected to it, otherwise to standard error. Thread-safe. */
-
-/* Sets the names of the process and of its logging part. Call once, at start-up. */
-VESK_API void vesk_log_start(const char* process, const char* facility);
-VESK_API void vesk_log_close(void);
-/* Lines with a higher number are not formatted. Default: 6. */
-VESK_API void vesk_log_set_level(int32_t level);
-/* Sends every line (not NUL-terminated) to `sink` instead, on the thread that logs; a null sink restores the
- * default. The sink must not log. `release`, if not null, is called once the sink is no longer used. */
-VESK_API void vesk_log_set_sink(void (*sink)(void* context, int32_t level, const char* line, size_t length),
-                                void (*release)(void* context), void* context);
 
 /* ---- Testing ------------------------------------------------------------------------------------------- */
 

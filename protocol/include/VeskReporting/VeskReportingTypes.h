@@ -1,13 +1,13 @@
 // Argument and result types of a session's operations.
 #pragma once
 
-#include <VeskReporting/values/Export.h>
 #include <VeskReporting/values/Value.h>
 
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
+#include <iterator>
 #include <optional>
 #include <string>
 #include <vector>
@@ -32,7 +32,27 @@ enum class [[nodiscard]] ReportingStatus : std::uint8_t{
     TooManyConnections};
 
 /// A short description for a log line.
-VESK_API const char* describe(ReportingStatus status) noexcept;
+constexpr const char* describe(ReportingStatus status) noexcept {
+  // In the order of the enumeration.
+  constexpr const char* kTexts[] = {
+      "done",
+      "queued",
+      "too much waits to be sent",
+      "no connection to the daemon",
+      "no answer in time",
+      "refused by the daemon",
+      "too large, nested too deeply or no valid text",
+      "the file can't be opened",
+      "the session belongs to the parent process",
+      "a callback must not wait",
+      "the session was closed",
+      "out of memory, descriptors or threads",
+      "too many connections",
+  };
+  static_assert(std::size(kTexts) == static_cast<std::size_t>(ReportingStatus::TooManyConnections) + 1);
+  const auto index = static_cast<std::size_t>(status);
+  return index < std::size(kTexts) ? kTexts[index] : "unknown";
+}
 
 /// Who reports. With the defaults, the user's consent and the storebag's rules for the client apply; then
 /// `clientName` must be set, or nothing is reported.

@@ -7,14 +7,19 @@
 #include <string>
 #include <string_view>
 
-#include "Export.h"
+// Programs get the functions of values inline; this project compiles them once.
+#ifdef VESK_VALUES_COMPILED
+#define VESK_VALUES_INLINE
+#else
+#define VESK_VALUES_INLINE inline
+#endif
 
 namespace vesk {
 
 /// Text that shares its bytes with its copies. Copying costs a reference count, or nothing for a literal. The
 /// bytes never change, so any thread may read any copy. Text from a decoder (wire, property list, TOML) is
 /// valid UTF-8; the class itself does not check.
-class VESK_API Text {
+class Text {
  public:
   Text() noexcept = default;
 
@@ -52,7 +57,7 @@ class VESK_API Text {
 
 /// Creates many texts with few allocations. A decoder uses one arena per message. A chunk lives as long as
 /// any text in it. The arena is not thread-safe; its texts are.
-class VESK_API TextArena {
+class TextArena {
  public:
   /// `chunkSize`: bytes per allocation. Text longer than a quarter of it gets its own allocation.
   explicit TextArena(std::size_t chunkSize = 1024) noexcept : _chunkSize(chunkSize) {}
@@ -72,3 +77,7 @@ struct std::hash<vesk::Text> {
     return std::hash<std::string_view>{}(text.view());
   }
 };
+
+#ifndef VESK_VALUES_COMPILED
+#include "Text-inl.h"
+#endif

@@ -11,7 +11,6 @@
 #include <variant>
 #include <vector>
 
-#include "Export.h"
 #include "Text.h"
 
 namespace vesk {
@@ -40,7 +39,7 @@ class Bytes {
 };
 
 /// Immutable sequence of values, shared between copies.
-class VESK_API List {
+class List {
  public:
   List() noexcept = default;
   explicit List(std::vector<Value> values);
@@ -51,7 +50,7 @@ class VESK_API List {
   const Value& operator[](std::size_t index) const noexcept;
   const Value* begin() const noexcept;
   const Value* end() const noexcept;
-  friend VESK_API bool operator==(const List& a, const List& b) noexcept;
+  friend bool operator==(const List& a, const List& b) noexcept;
 
  private:
   std::shared_ptr<const std::vector<Value>> _values;
@@ -60,7 +59,7 @@ class VESK_API List {
 /// Immutable map from text to value that keeps the order of insertion. Keys are unique. Copies share their
 /// entries. Lookup scans up to 32 entries, which is faster than hashing at the size of a message, and uses an
 /// index above that.
-class VESK_API Dictionary {
+class Dictionary {
  public:
   Dictionary() noexcept = default;
   Dictionary(std::initializer_list<DictionaryEntry> entries);
@@ -79,8 +78,8 @@ class VESK_API Dictionary {
   std::optional<Dictionary> dictionary(std::string_view key) const;
   std::optional<List> list(std::string_view key) const;
 
-  friend VESK_API bool operator==(const Dictionary& a, const Dictionary& b) noexcept;
-  friend VESK_API std::size_t approximateMemory(const Dictionary& dictionary) noexcept;
+  friend bool operator==(const Dictionary& a, const Dictionary& b) noexcept;
+  friend std::size_t approximateMemory(const Dictionary& dictionary) noexcept;
 
  private:
   friend class MutableDictionary;
@@ -90,7 +89,7 @@ class VESK_API Dictionary {
 };
 
 /// One value of any kind. A default-constructed value is the null marker.
-class VESK_API Value {
+class Value {
  public:
   /// In the order of the variant's alternatives.
   enum class Kind : std::uint8_t {
@@ -176,7 +175,7 @@ struct DictionaryEntry {
 };
 
 /// A dictionary under construction. Not thread-safe.
-class VESK_API MutableDictionary {
+class MutableDictionary {
  public:
   MutableDictionary() noexcept = default;
   /// Starts as a copy of `source`, with room for `extra` more entries.
@@ -210,18 +209,22 @@ class VESK_API MutableDictionary {
 };
 
 /// The value under `key`, converted to a number; nullopt if it is absent or not a number.
-VESK_API std::optional<std::int64_t> integerForKey(const Dictionary& dictionary,
-                                                   std::string_view key) noexcept;
-VESK_API std::optional<double> doubleForKey(const Dictionary& dictionary, std::string_view key) noexcept;
-VESK_API std::optional<bool> booleanForKey(const Dictionary& dictionary, std::string_view key) noexcept;
+std::optional<std::int64_t> integerForKey(const Dictionary& dictionary, std::string_view key) noexcept;
+std::optional<double> doubleForKey(const Dictionary& dictionary, std::string_view key) noexcept;
+std::optional<bool> booleanForKey(const Dictionary& dictionary, std::string_view key) noexcept;
 
 /// One line that shows a value in logs and tools, cut at about `limit` bytes.
-VESK_API std::string describe(const Value& value, std::size_t limit = 1024);
+std::string describe(const Value& value, std::size_t limit = 1024);
 
 /// Approximate memory in bytes that a value's or dictionary's contents use beyond its own size. Text shared
 /// with other dictionaries counts in full.
-VESK_API std::size_t approximateMemory(const Value& value) noexcept;
-VESK_API std::size_t approximateMemory(const Dictionary& dictionary) noexcept;
-VESK_API std::size_t approximateMemory(const MutableDictionary& dictionary) noexcept;
+std::size_t approximateMemory(const Value& value) noexcept;
+std::size_t approximateMemory(const Dictionary& dictionary) noexcept;
+std::size_t approximateMemory(const MutableDictionary& dictionary) noexcept;
 
 }  // namespace vesk
+
+#ifndef VESK_VALUES_COMPILED
+#include "Describe-inl.h"
+#include "Value-inl.h"
+#endif

@@ -1,27 +1,32 @@
-#include <VeskReporting/values/Text.h>
+// The functions of Text.h.
+#pragma once
 
 #include <cstring>
 
+#include "Text.h"
+
 namespace vesk {
 
-namespace {
+namespace detail {
 
-std::shared_ptr<char[]> allocate(std::size_t size) { return std::make_shared_for_overwrite<char[]>(size); }
+inline std::shared_ptr<char[]> allocateText(std::size_t size) {
+  return std::make_shared_for_overwrite<char[]>(size);
+}
 
-}  // namespace
+}  // namespace detail
 
-Text::Text(std::string_view text) : _size(text.size()) {
+VESK_VALUES_INLINE Text::Text(std::string_view text) : _size(text.size()) {
   if (text.empty()) return;
-  auto storage = allocate(text.size());
+  auto storage = detail::allocateText(text.size());
   std::memcpy(storage.get(), text.data(), text.size());
   _data = std::shared_ptr<const char>(storage, storage.get());
 }
 
-Text TextArena::add(std::string_view text) {
+VESK_VALUES_INLINE Text TextArena::add(std::string_view text) {
   if (text.empty()) return {};
   if (text.size() > _chunkSize / 4) return Text(text);
   if (!_chunk || _used + text.size() > _chunkSize) {
-    _chunk = allocate(_chunkSize);
+    _chunk = detail::allocateText(_chunkSize);
     _used = 0;
   }
   char* at = _chunk.get() + _used;

@@ -1,10 +1,14 @@
-#include <cstdio>
+// The text form of a value.
+#pragma once
 
-#include <VeskReporting/values/Value.h>
+#include <cstdio>
+#include <string>
+
+#include "Value.h"
 
 namespace vesk {
 
-namespace {
+namespace detail {
 
 class Describer {
  public:
@@ -86,10 +90,10 @@ class Describer {
   std::string _out;
 };
 
-}  // namespace
+}  // namespace detail
 
-std::string describe(const Value& value, std::size_t limit) {
-  Describer describer(limit);
+VESK_VALUES_INLINE std::string describe(const Value& value, std::size_t limit) {
+  detail::Describer describer(limit);
   describer.add(value);
   return describer.finish();
 }
