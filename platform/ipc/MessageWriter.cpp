@@ -13,8 +13,13 @@ namespace vesk {
 
 namespace {
 
-// The signatures of a value's variant, in the order of Value::Kind. The empty signature is the null marker.
-constexpr const char* kValueSignatures[] = {"g", "b", "x", "t", "d", "s", "ay", "(d)", "av", "a{sv}"};
+using namespace std::string_view_literals;
+
+// The signatures of a value's variant as they are written, with length and NUL, in the order of Value::Kind.
+// The empty signature is the null marker.
+constexpr std::string_view kValueSignatures[] = {"\1g\0"sv,  "\1b\0"sv,    "\1x\0"sv,  "\1t\0"sv,
+                                                 "\1d\0"sv,  "\1s\0"sv,    "\2ay\0"sv, "\3(d)\0"sv,
+                                                 "\2av\0"sv, "\5a{sv}\0"sv};
 
 /// Appends values with D-Bus's alignment, relative to its start.
 class Writer {
@@ -24,7 +29,11 @@ class Writer {
 
   CodecResult result() const noexcept { return _result; }
 
-  void align(std::size_t to) { _out.append((to - (_out.size() - _start) % to) % to, '\0'); }
+  /// `to`: a power of two.
+  void align(std::size_t to) {
+    const std::size_t padding = (_start - _out.size()) & (to - 1);
+    if (padding > 0) _out.append(padding, '\0');
+  }
   void byte(char value) { _out.push_back(value); }
   template <class Number>
   void number(Number value) {
@@ -57,7 +66,7 @@ class Writer {
   }
   void add(const Value& value) {  // as a variant
     if (!count(kNodeContent)) return;
-    signature(kValueSignatures[static_cast<std::size_t>(value.kind())]);
+    _out.append(kValueSignatures[static_cast<std::size_t>(value.kind())]);
     value.visit([this](const auto& held) { add(held); });
   }
   void add(const Dictionary& dictionary) {
@@ -80,7 +89,7 @@ class Writer {
   void add(const VeskValueView& view) {  // as a variant
     if (view.kind >= std::size(kValueSignatures)) return fail(CodecResult::Malformed);
     if (!count(kNodeContent)) return;
-    signature(kValueSignatures[view.kind]);
+    _out.append(kValueSignatures[view.kind]);
     switch (view.kind) {
       case VeskValueNone:
         return add(std::monostate());
