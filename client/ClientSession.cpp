@@ -40,18 +40,21 @@ std::thread startThread(const std::shared_ptr<SessionWorker>& worker) {
   return thread;
 }
 
-/// Sessions that name no socket of their own connect to the recorder, if there is one.
-ReportingOptions withRecorder(ReportingOptions options) {
-  if (options.socketPath.empty()) options.socketPath = Recorder::currentSocket();
+ReportingOptions withSocket(ReportingOptions options, const std::string& path) {
+  if (!path.empty()) options.socketPath = path;
   return options;
 }
 
 }  // namespace
 
+// Sessions that name no socket of their own connect to the recorder, if there is one.
 ClientSession::ClientSession(const ReportingOptions& options)
-    : _isRecorded(options.socketPath.empty() && !Recorder::currentSocket().empty()),
+    : ClientSession(options, options.socketPath.empty() ? Recorder::currentSocket() : std::string()) {}
+
+ClientSession::ClientSession(const ReportingOptions& options, const std::string& recorderSocket)
+    : _isRecorded(!recorderSocket.empty()),
       _drainTime(boundedWait(options.drainTime)),
-      _worker(std::make_shared<SessionWorker>(withRecorder(options))),
+      _worker(std::make_shared<SessionWorker>(withSocket(options, recorderSocket))),
       _thread(startThread(_worker)) {}
 
 ClientSession::~ClientSession() {

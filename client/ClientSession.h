@@ -88,6 +88,8 @@ class ClientSession {
  private:
   static constexpr std::chrono::seconds kRecordingTime{10};
 
+  ClientSession(const ReportingOptions& options, const std::string& recorderSocket);
+
   template <class Make>
   ReportingStatus push(const Make& make) noexcept {
     if (!isOurs()) return ReportingStatus::ForkedProcess;

@@ -214,7 +214,9 @@ vesk_recorder* vesk_recorder_new() {
   }
 }
 
-void vesk_recorder_free(vesk_recorder* recorder) { delete recorder; }
+void vesk_recorder_free(vesk_recorder* recorder) {
+  if (recorder && recorder->isOurs()) delete recorder;
+}
 
 size_t vesk_recorder_count(const vesk_recorder* recorder, int32_t call) {
   return recorder ? recorder->count(call) : 0;

@@ -11,6 +11,7 @@
 #include <vector>
 
 #include <VeskReporting/values/ValueViews.h>
+#include "client/ForkGuard.h"
 #include "platform/ipc/IPCListener.h"
 #include "platform/sync/Mutex.h"
 
@@ -41,6 +42,9 @@ class Recorder : private IPCListenerDelegate {
   /// The socket of the newest recorder of this process; empty if there is none.
   static std::string currentSocket();
 
+  /// Returns false in a process forked from the one that created this, where its thread is gone.
+  bool isOurs() const noexcept { return _process.isOurs(); }
+
   void add(Call call);
   std::size_t count(std::int32_t kind) const;
   /// Null beyond the last. Valid until `clear`.
@@ -61,6 +65,7 @@ class Recorder : private IPCListenerDelegate {
 
   bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) override;
 
+  const ForkGuard _process;
   const std::string _directory;
   mutable Mutex _mutex;
   std::deque<Kept> _calls VESK_GUARDED_BY(_mutex);
