@@ -77,7 +77,8 @@ class Describer {
  private:
   bool full() const { return _out.size() > _limit; }
 
-  void addItems(char bracket, const auto& items, auto addItem) {
+  template <class Items, class AddItem>
+  void addItems(char bracket, const Items& items, const AddItem& addItem) {
     _out += bracket;
     for (const auto& item : items) {
       if (full()) return;

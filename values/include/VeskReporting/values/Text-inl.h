@@ -10,7 +10,11 @@ namespace vesk {
 namespace detail {
 
 inline std::shared_ptr<char[]> allocateText(std::size_t size) {
+#ifdef __cpp_lib_smart_ptr_for_overwrite
   return std::make_shared_for_overwrite<char[]>(size);
+#else
+  return std::shared_ptr<char[]>(new char[size]);
+#endif
 }
 
 }  // namespace detail

@@ -152,7 +152,8 @@ VESK_VALUES_INLINE void MutableDictionary::setAll(const Dictionary& source) {
 }
 
 VESK_VALUES_INLINE void MutableDictionary::remove(std::string_view key) {
-  std::erase_if(_entries, [&](const DictionaryEntry& entry) { return entry.key == key; });
+  const auto isNamed = [&](const DictionaryEntry& entry) { return entry.key == key; };
+  _entries.erase(std::remove_if(_entries.begin(), _entries.end(), isNamed), _entries.end());
 }
 
 VESK_VALUES_INLINE const Value* MutableDictionary::find(std::string_view key) const noexcept {
@@ -177,8 +178,8 @@ namespace detail {
 /// What `convert` makes of a number; nullopt for any other kind of value.
 template <class T, class Convert>
 std::optional<T> converted(const Value& value, Convert convert) noexcept {
-  return value.visit([&]<class Alternative>(const Alternative& number) -> std::optional<T> {
-    if constexpr (std::is_arithmetic_v<Alternative>) return convert(number);
+  return value.visit([&](const auto& number) -> std::optional<T> {
+    if constexpr (std::is_arithmetic_v<std::decay_t<decltype(number)>>) return convert(number);
     return std::nullopt;
   });
 }
@@ -193,8 +194,8 @@ inline std::int64_t clamped(double number) noexcept {
 }  // namespace detail
 
 VESK_VALUES_INLINE std::optional<std::int64_t> Value::asInteger() const noexcept {
-  return detail::converted<std::int64_t>(*this, []<class Number>(Number number) {
-    if constexpr (std::is_floating_point_v<Number>) return detail::clamped(number);
+  return detail::converted<std::int64_t>(*this, [](auto number) {
+    if constexpr (std::is_floating_point_v<decltype(number)>) return detail::clamped(number);
     return static_cast<std::int64_t>(number);
   });
 }

@@ -22,7 +22,7 @@ class MutableDictionary;
 /// A point in time in seconds since 1970. Input from outside may make it fractional, negative or not finite.
 struct Date {
   double secondsSince1970 = 0;
-  friend bool operator==(const Date&, const Date&) = default;
+  friend bool operator==(Date a, Date b) noexcept { return a.secondsSince1970 == b.secondsSince1970; }
 };
 
 /// Immutable bytes, shared between copies.
@@ -171,7 +171,9 @@ class Value {
 struct DictionaryEntry {
   Text key;
   Value value;
-  friend bool operator==(const DictionaryEntry&, const DictionaryEntry&) = default;
+  friend bool operator==(const DictionaryEntry& a, const DictionaryEntry& b) noexcept {
+    return a.key == b.key && a.value == b.value;
+  }
 };
 
 /// A dictionary under construction. Not thread-safe.
