@@ -70,6 +70,7 @@ class Reader {
     addPowerLogCommand();
     addDiagnosticsCommands();
     addStorebagCommands();
+    addDev();
     addCompletion();
     unmarkValues(_app);
   }
@@ -189,6 +190,16 @@ class Reader {
     completion->add_option("shell", _invocation.shell, "bash, zsh or fish")
         ->required()
         ->check(CLI::IsMember({"bash", "zsh", "fish"}));
+  }
+
+  void addDev() {
+    CLI::App* dev =
+        add(_app, "dev", "Run a daemon and a collector to try things out, and show all events", runDev);
+    dev->add_option("--directory", _invocation.keptRoot,
+                    "Keep keys, storebags and events here (default: a temporary directory)")
+        ->type_name("DIR");
+    dev->add_option("program", _invocation.program,
+                    "After --: a program to run with VESKREPORTINGD_ROOT set; dev ends with it");
   }
 
   CLI::App* addAction(CLI::App& command, const char* name, const char* description) {

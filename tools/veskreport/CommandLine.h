@@ -43,6 +43,9 @@ struct Invocation {
   std::vector<std::string> logData;  ///< one text each
   std::string since;                 ///< a time, or an age such as "90m"; empty: from the beginning
 
+  std::string keptRoot;              ///< of dev; empty: a temporary one
+  std::vector<std::string> program;  ///< that dev runs, with its arguments; empty: none
+
   bool openMetrics = false;
   bool noColor = false;
   std::string shell;            ///< whose completion script is wanted
@@ -96,6 +99,9 @@ int runStatus(const Invocation& invocation, const Output& output);
 int runExplain(const Invocation& invocation, const Output& output);
 /// The status as a live page in the terminal.
 int runTop(const Invocation& invocation, const Output& output);
+/// Runs a collector and a daemon that reports everything to it, until a signal asks for the end or the given
+/// program ends, whose exit status it returns then. Shows the events. Handles signals for the process.
+int runDev(const Invocation& invocation, const Output& output);
 /// Prints a completion script.
 int runCompletion(const Invocation& invocation, const Output& output);
 /// Shows what was lost or delayed.

@@ -42,6 +42,11 @@ std::vector<Dictionary> listIn(const Dictionary& from, const char* key);
 /// A number of seconds as "45 s", "12 min", "3 h" or "2 d".
 std::string durationIn(const Dictionary& from, const char* key);
 
+/// Seconds since 1970 as "18:42:07.123", in UTC.
+std::string clockIn(const Dictionary& from, const char* key);
+
+/// A record, as `tap` prints it.
+std::string tapLine(const Dictionary& record);
 /// The daemon's status, as `status` prints it.
 std::vector<std::string> statusLines(const Dictionary& status);
 

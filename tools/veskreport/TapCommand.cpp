@@ -12,19 +12,6 @@ namespace vesk {
 
 namespace {
 
-/// "18:42:07.123", in UTC.
-std::string timeOf(const Dictionary& record) {
-  const Value* seconds = record.find("time");
-  const double all = seconds ? seconds->asDouble().value_or(0) : 0;
-  const auto whole = static_cast<std::time_t>(all);
-  std::tm parts{};
-  ::gmtime_r(&whole, &parts);
-  char text[32];
-  std::snprintf(text, sizeof text, "%02d:%02d:%02d.%03d", parts.tm_hour, parts.tm_min, parts.tm_sec,
-                static_cast<int>((all - static_cast<double>(whole)) * 1000));
-  return text;
-}
-
 std::string subjectOf(const Dictionary& record) {
   std::string text = textIn(record, "what");
   if (const auto category = textIn(record, "category"); !category.empty())
@@ -33,21 +20,6 @@ std::string subjectOf(const Dictionary& record) {
     if (const auto number = textIn(record, key); !number.empty()) return text + " of " + number;
   }
   return text;
-}
-
-std::string lineOf(const Dictionary& record) {
-  std::string line = timeOf(record) + " " + textIn(record, "backend") + ": " + subjectOf(record) + " " +
-                     textIn(record, "outcome");
-  if (const auto reason = textIn(record, "reason"); !reason.empty()) line += ", " + reason;
-  if (const auto because = textIn(record, "because"); !because.empty()) line += " (" + because + ")";
-  if (const auto status = textIn(record, "httpStatus"); !status.empty()) line += ", status " + status;
-  if (const auto url = textIn(record, "url"); !url.empty()) line += ", " + url;
-  if (const auto type = textIn(record, "clientType"); !type.empty()) {
-    const auto name = textIn(record, "clientName");
-    line += " [client type " + type + (name.empty() ? "" : " " + name) + ", session " +
-            textIn(record, "sessionID") + "]";
-  }
-  return line;
 }
 
 Dictionary filterOf(const Invocation& invocation) {
@@ -62,6 +34,33 @@ Dictionary filterOf(const Invocation& invocation) {
 
 }  // namespace
 
+std::string clockIn(const Dictionary& from, const char* key) {
+  const Value* seconds = from.find(key);
+  const double all = seconds ? seconds->asDouble().value_or(0) : 0;
+  const auto whole = static_cast<std::time_t>(all);
+  std::tm parts{};
+  ::gmtime_r(&whole, &parts);
+  char text[32];
+  std::snprintf(text, sizeof text, "%02d:%02d:%02d.%03d", parts.tm_hour, parts.tm_min, parts.tm_sec,
+                static_cast<int>((all - static_cast<double>(whole)) * 1000));
+  return text;
+}
+
+std::string tapLine(const Dictionary& record) {
+  std::string line = clockIn(record, "time") + " " + textIn(record, "backend") + ": " + subjectOf(record) +
+                     " " + textIn(record, "outcome");
+  if (const auto reason = textIn(record, "reason"); !reason.empty()) line += ", " + reason;
+  if (const auto because = textIn(record, "because"); !because.empty()) line += " (" + because + ")";
+  if (const auto status = textIn(record, "httpStatus"); !status.empty()) line += ", status " + status;
+  if (const auto url = textIn(record, "url"); !url.empty()) line += ", " + url;
+  if (const auto type = textIn(record, "clientType"); !type.empty()) {
+    const auto name = textIn(record, "clientName");
+    line += " [client type " + type + (name.empty() ? "" : " " + name) + ", session " +
+            textIn(record, "sessionID") + "]";
+  }
+  return line;
+}
+
 int runTap(const Invocation& invocation, const Output& output) {
   DiagnosticsClient daemon(invocation, output);
   const auto opened = daemon.ask(wire::kOpenTap, {filterOf(invocation)});
@@ -70,7 +69,7 @@ int runTap(const Invocation& invocation, const Output& output) {
   for (std::uint64_t seen = 0;;) {
     const auto batch = daemon.ask(wire::kReadTap);
     for (const auto& record : listIn(batch, "records")) {
-      std::vector<std::string> lines{lineOf(record)};
+      std::vector<std::string> lines{tapLine(record)};
       if (const auto body = textIn(record, "body"); invocation.tap.bodies && !body.empty())
         lines.push_back("  " + body);
       if (output.done(lines, record) != kExitDone) return kExitFailed;
