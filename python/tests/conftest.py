@@ -1,21 +1,10 @@
 import pytest
 
 from veskreporting import Session
-
-try:
-    import importlib.metadata
-
-    importlib.metadata.distribution("veskreporting")  # an installed package brings the fixture itself
-except importlib.metadata.PackageNotFoundError:
-    pytest_plugins = ["veskreporting.pytest_plugin"]
+from veskreporting.pytest_plugin import veskreporting_recorder as recorder  # noqa: F401
 
 
 @pytest.fixture
-def recorder(veskreporting_recorder):
-    return veskreporting_recorder
-
-
-@pytest.fixture
-def session(recorder):
+def session(recorder):  # noqa: F811
     with Session(5, "Camera") as session:
         yield session

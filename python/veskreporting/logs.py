@@ -15,6 +15,7 @@ from .session import Session
 _MAXIMUM_TEXT = 16 * 1024  # characters of a record's message or exception
 _OWN = "veskreporting_own"  # marks the records of the library's own log
 
+_DEFAULT_LEVEL = 6
 _LEVELS = {3: logging.ERROR, 4: logging.WARNING, 6: logging.INFO, 7: logging.DEBUG}
 
 
@@ -103,6 +104,7 @@ def _stop() -> None:
     if _thread is None:
         return
     c.load().vesk_log_set_sink(c.LogSink(0), c.ContextCallback(0), None)
+    c.load().vesk_log_set_level(_DEFAULT_LEVEL)
     _lines.put(None)
     if _thread is not threading.current_thread():
         _thread.join()
