@@ -129,6 +129,16 @@ def test_closing_ends_calls(recorder):
         session.flush_and_wait()
 
 
+def test_closing_again_leaves_other_sessions_alone(recorder):
+    closed = [Session(5, "Camera", options=NOWHERE) for _ in range(5)]
+    for session in closed:
+        session.close()
+    others = [Session(5, "Camera") for _ in range(5)]  # usually at the same addresses
+    for session in closed:
+        session.close()
+    assert {other.send(3, 1) for other in others} == {Status.QUEUED}
+
+
 def test_threads_may_send_while_the_session_is_closed(recorder):
     session = Session(5, "Camera", options=NOWHERE)
     sent = threading.Barrier(5)

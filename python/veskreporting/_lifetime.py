@@ -81,7 +81,7 @@ class Handle:
         self.is_closed = _has_ended
         self._inside: List[None] = []  # one for each call in progress; lists are atomic
         if self.address:
-            _handles[self.address] = self
+            _open[self] = True
 
     def enter(self) -> bool:
         """Returns whether the library may be called; `leave` must follow in any case."""
@@ -97,11 +97,11 @@ class Handle:
             return
         while self._inside:  # calls take microseconds
             time.sleep(0.0005)
-        if _handles.pop(self.address, None):
+        if _open.pop(self, False):
             c.load().vesk_session_free(self.address)
 
 
-_handles: Dict[int, Handle] = {}
+_open: Dict[Handle, bool] = {}
 _freeing: List[Any] = []  # locks, each held while a thread frees a session
 _has_ended = False
 at_end: List[Callable[[], None]] = []  # what else must end, after all sessions
@@ -136,7 +136,7 @@ def _close_in_thread(handle: Handle) -> None:
 def _end() -> None:
     global _has_ended
     _has_ended = True
-    for handle in [*_handles.values()]:
+    for handle in [*_open]:
         handle.close()
     for done in [*_freeing]:
         done.acquire()
@@ -145,4 +145,4 @@ def _end() -> None:
 
 
 def open_handles() -> List[Handle]:
-    return [*_handles.values()]
+    return [*_open]

@@ -82,9 +82,9 @@ class Views:
         _put_view(self._block.bytes, at, address, count)
         return self._block.address + at
 
-    def _reserve(self, size: int, alignment: int = 8) -> int:
-        """Returns the offset of unused bytes in the current block."""
-        at = (self._used + alignment - 1) & -alignment
+    def _reserve(self, size: int) -> int:
+        """Returns the offset of unused bytes, aligned for views, in the current block."""
+        at = (self._used + 7) & -8
         if at + size > self._block.size:
             self._block = _Block(max(size, 2 * self._block.size))
             self._further.append(self._block)
@@ -93,9 +93,14 @@ class Views:
         return at
 
     def _copy(self, data: bytes) -> int:
-        at = self._reserve(len(data), 1)
-        self._block.bytes[at : at + len(data)] = data
-        return self._block.address + at
+        block, at = self._block, self._used
+        end = at + len(data)
+        if end > block.size:
+            at = self._reserve(len(data))
+            block, end = self._block, self._used
+        self._used = end
+        block.bytes[at:end] = data
+        return block.address + at
 
     def _entries(self, mapping: Mapping[str, Any], depth: int) -> "tuple[int, int]":
         items = [*mapping.items()]
