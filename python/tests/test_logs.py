@@ -16,7 +16,8 @@ def logger():
 
 
 def test_records_become_messages(session, recorder, logger):
-    logger.addHandler(VeskReportingHandler(session, 7, 2, logging.WARNING, fields=lambda record: {"line": record.lineno}))
+    logger.addHandler(VeskReportingHandler(session, 7, 2, logging.WARNING,
+                                           fields=lambda record: {"function": record.funcName}))
     logger.info("below the level")
     logger.warning("lens %s", "blocked")
     try:
@@ -26,7 +27,8 @@ def test_records_become_messages(session, recorder, logger):
     logger.error("%d", "no number")  # reported on standard error by logging itself
     first, second = recorder.messages
     assert (first.category, first.type) == (7, 2)
-    assert {**first.payload, "line": 0} == {"level": "WARNING", "logger": "app.camera", "message": "lens blocked", "line": 0}
+    assert first.payload == {"level": "WARNING", "logger": "app.camera", "message": "lens blocked",
+                             "function": "test_records_become_messages"}
     assert second.payload["message"] == "bad \\udc80 \\0 text"
     assert second.payload["exception"].endswith("KeyError: 'iso'")
 

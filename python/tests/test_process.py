@@ -30,7 +30,8 @@ recorder = Recorder()
     "Session(5, 'Camera', options=nowhere).start(callback=lambda _: None); gc.collect()",
     "for i in range(30): Session(5, 'Camera', options=nowhere)",
     "s = Session(5, 'Camera', options=nowhere); s.start(); os.fork(); s.start()",
-    "s = Session(5, 'Camera'); threading.Thread(target=lambda: [s.send(3, 1) for _ in iter(int, 1)], daemon=True).start()",
+    "s = Session(5, 'Camera'); "
+    "threading.Thread(target=lambda: [s.send(3, 1) for _ in iter(int, 1)], daemon=True).start()",
     "import atexit; s = Session(5, 'Camera'); atexit.register(lambda: s.send(3, 1))",
     "log_to(logging.getLogger('x')); s = Session(5, 'Camera', options=nowhere); s.send(3, 1, a=chr(0))",
     "s = Session(5, 'Camera', options=nowhere); s.send(3, 1, callback=lambda _: s.send(3, 1)); sys.exit(0)",

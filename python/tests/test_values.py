@@ -40,8 +40,9 @@ CIRCLE.append(CIRCLE)
 
 
 @pytest.mark.parametrize("payload, error", [
-    ({"value": {1, 2}}, TypeError), ({"value": object()}, TypeError), ({"value": [1, datetime.date(2024, 1, 1)]}, TypeError),
-    ({1: "value"}, TypeError), ({"a": {None: 1}}, TypeError), ({"value": 2**64}, ValueError),
+    ({"value": {1, 2}}, TypeError), ({"value": object()}, TypeError),
+    ({"value": [1, datetime.date(2024, 1, 1)]}, TypeError), ({1: "value"}, TypeError), ({"a": {None: 1}}, TypeError),
+    ({"value": 2**64}, ValueError),
     ({"value": -(2**63) - 1}, ValueError), ({"value": CIRCLE}, ValueError),
 ], ids=repr)
 def test_programming_errors_raise(session, recorder, payload, error):

@@ -128,9 +128,11 @@ class Session(Caller):
         return Drops(*(self._ask_library(lambda library, session: library.vesk_session_drops(session, reason))
                        for reason in range(3)))
 
-    # Starts the session: the daemon fetches the storebag and creates its backends. Answer: those that are enabled.
-
     def start(self, *, callback: Optional[Callback[Backends]] = None) -> Status:
+        """Starts the session: the daemon fetches the storebag and creates its backends.
+
+        Answer: those that are enabled.
+        """
         return self._post(operations.START, callback, self._timeout)
 
     def start_and_wait(self, timeout: float = DEFAULT_TIMEOUT) -> Backends:
@@ -139,12 +141,14 @@ class Session(Caller):
     async def astart(self, timeout: float = DEFAULT_TIMEOUT) -> Backends:
         return await self._await(operations.START, timeout)
 
-    # Sends a message. The payload is a mapping, keyword arguments, or both. `realtime` does not wait for a batch.
-    # Answer: the backends', if one gave any.
-
     def send(self, category: int, type: int, payload: Payload = None, /, *,
              callback: Optional[Callback[Optional[str]]] = None, realtime: bool = False,
              override_sampling: bool = False, **fields: Value) -> Status:
+        """Sends a message.
+
+        The payload is a mapping, keyword arguments, or both. `realtime` does not wait for a batch. Answer: the
+        backends', if one gave any.
+        """
         return self._post(operations.message(category, type, payload, fields, realtime, override_sampling), callback,
                           self._timeout)
 
@@ -156,11 +160,11 @@ class Session(Caller):
     async def asend(self, category: int, type: int, payload: Payload = None, /, *,
                     timeout: float = DEFAULT_TIMEOUT, realtime: bool = False, override_sampling: bool = False,
                     **fields: Value) -> Optional[str]:
-        return await self._await(operations.message(category, type, payload, fields, realtime, override_sampling), timeout)
-
-    # Makes the backends send what they hold back.
+        return await self._await(operations.message(category, type, payload, fields, realtime, override_sampling),
+                                 timeout)
 
     def flush(self, *, callback: Optional[Callback[Optional[str]]] = None) -> Status:
+        """Makes the backends send what they hold back."""
         return self._post(operations.FLUSH, callback, self._timeout)
 
     def flush_and_wait(self, timeout: float = DEFAULT_TIMEOUT) -> Optional[str]:
@@ -169,34 +173,30 @@ class Session(Caller):
     async def aflush(self, timeout: float = DEFAULT_TIMEOUT) -> Optional[str]:
         return await self._await(operations.FLUSH, timeout)
 
-    # Replaces the further keys of the user info.
-
     def set_user_info(self, user_info: Payload, *, callback: Optional[Callback[Backends]] = None) -> Status:
+        """Replaces the further keys of the user info."""
         replaced = {**(user_info or {}), **self._names}
         status = self._post(operations.states(replaced), callback, self._timeout)
         self._user_info = replaced
         return status
 
-    # Asks which backends are enabled.
-
     def states_and_wait(self, timeout: float = DEFAULT_TIMEOUT) -> Backends:
+        """Asks which backends are enabled."""
         return self._wait(operations.states(self._user_info), timeout)
 
     async def astates(self, timeout: float = DEFAULT_TIMEOUT) -> Backends:
         return await self._await(operations.states(self._user_info), timeout)
 
-    # Asks where the session's messages can be viewed; "URL not available" if nowhere.
-
     def display_url_and_wait(self, timeout: float = DEFAULT_TIMEOUT) -> Optional[str]:
+        """Asks where the session's messages can be viewed; "URL not available" if nowhere."""
         return self._wait(operations.DISPLAY_URL, timeout)
 
     async def adisplay_url(self, timeout: float = DEFAULT_TIMEOUT) -> Optional[str]:
         return await self._await(operations.DISPLAY_URL, timeout)
 
-    # Uploads a file, which the calling thread opens. Answer: whether a backend accepted it.
-
     def upload_file(self, path: Path, *,
                     callback: Optional[Callback[bool]] = None) -> Status:
+        """Uploads a file, which the calling thread opens. Answer: whether a backend accepted it."""
         return self._post(operations.file(path), callback, self._timeout)
 
     def upload_file_and_wait(self, path: Path, timeout: float = DEFAULT_TIMEOUT) -> bool:
@@ -205,9 +205,8 @@ class Session(Caller):
     async def aupload_file(self, path: Path, timeout: float = DEFAULT_TIMEOUT) -> bool:
         return await self._await(operations.file(path), timeout)
 
-    # Uploads log data. Answer: whether a backend accepted it.
-
     def upload_log_data(self, log_data: Sequence[Value], *, callback: Optional[Callback[bool]] = None) -> Status:
+        """Uploads log data. Answer: whether a backend accepted it."""
         return self._post(operations.log_data(log_data), callback, self._timeout)
 
     def upload_log_data_and_wait(self, log_data: Sequence[Value], timeout: float = DEFAULT_TIMEOUT) -> bool:
@@ -216,11 +215,13 @@ class Session(Caller):
     async def aupload_log_data(self, log_data: Sequence[Value], timeout: float = DEFAULT_TIMEOUT) -> bool:
         return await self._await(operations.log_data(log_data), timeout)
 
-    # Sends a single message under another identity. session_info has at least "clientType" and "sessionID".
-    # Set "requireUserInfo" in it. Answer: "finished" or "storebag not available".
-
     def send_once(self, session_info: Mapping[str, Value], user_info: Payload, category: int, type: int,
                   payload: Payload = None, *, callback: Optional[Callback[Optional[str]]] = None) -> Status:
+        """Sends a single message under another identity.
+
+        session_info has at least "clientType" and "sessionID". Set "requireUserInfo" in it. Answer: "finished" or
+        "storebag not available".
+        """
         return self._post(operations.once(session_info, user_info, category, type, payload), callback, self._timeout)
 
     def send_once_and_wait(self, session_info: Mapping[str, Value], user_info: Payload, category: int, type: int,
