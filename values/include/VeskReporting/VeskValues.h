@@ -44,8 +44,8 @@ typedef struct VeskDictionaryView {
   size_t count;
 } VeskDictionaryView;
 
-/* Skip values of unknown kinds when you read, since later versions may add some. Lists and dictionaries nest
- * at most 64 levels deep. */
+/* Skip values of unknown kinds when you read, since later versions may add some. They nest at most 64 levels
+ * deep. What clients send may have 42 dictionaries inside each other, or 61 lists. */
 struct VeskValueView {
   uint32_t kind; /* an enum VeskValueKind */
   union {
