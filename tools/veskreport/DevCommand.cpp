@@ -47,7 +47,10 @@ class Dev {
     ::signal(SIGPIPE, SIG_IGN);
     sigset_t watched;
     ::sigemptyset(&watched);
-    for (int each : {SIGINT, SIGTERM, SIGHUP, SIGCHLD}) ::sigaddset(&watched, each);
+    for (int each : {SIGINT, SIGTERM, SIGCHLD}) ::sigaddset(&watched, each);
+    struct sigaction hangUp {};
+    ::sigaction(SIGHUP, nullptr, &hangUp);
+    if (hangUp.sa_handler != SIG_IGN) ::sigaddset(&watched, SIGHUP);  // nohup ignores it
     ::sigprocmask(SIG_BLOCK, &watched, &_mask);
     _signals = FileDescriptor(::signalfd(-1, &watched, SFD_CLOEXEC | SFD_NONBLOCK));
   }
