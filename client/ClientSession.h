@@ -24,7 +24,8 @@ namespace vesk {
 class ClientSession {
  public:
   using Timeout = std::chrono::milliseconds;
-  using Callback = std::function<void(const ReportingAnswer& answer)>;
+  /// May take what the answer contains.
+  using Callback = std::function<void(ReportingAnswer& answer)>;
 
   /// Throws if memory, descriptors or threads are exhausted.
   explicit ClientSession(const ReportingOptions& options);
@@ -72,8 +73,8 @@ class ClientSession {
         std::binary_semaphore isThere{0};
       };
       auto waited = std::make_shared<Waited>();
-      const auto keep = [waited](const ReportingAnswer& answer) {
-        waited->answer = answer;
+      const auto keep = [waited](ReportingAnswer& answer) {
+        waited->answer = std::move(answer);
         waited->isThere.release();
       };
       const auto status = ask(make, kind, keep, timeout);

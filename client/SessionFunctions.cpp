@@ -42,7 +42,7 @@ vesk_status post(vesk_session* session, AnswerKind kind, const vesk_completion* 
   if (!completion || !completion->callback) return post(session, make);
   if (!session) return VESK_OUT_OF_RESOURCES;
   const auto deliver = [callback = completion->callback, context = completion->context](
-                           const ReportingAnswer& answer) { callback(context, &answer); };
+                           ReportingAnswer& answer) { callback(context, &answer); };
   return numberOf(
       session->session.ask(make, kind, deliver, std::chrono::milliseconds(completion->timeout_ms)));
 }
