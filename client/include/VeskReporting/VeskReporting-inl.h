@@ -174,7 +174,7 @@ inline ReportingStatus VeskReporting::setSessionInfo(Dictionary sessionInfo,
     vesk_aggregation aggregation{};
     if (aggregationHandler) {
       aggregation = {detail::handleAggregated, detail::releaseHandler,
-                     new AggregationHandler(std::move(aggregationHandler))};
+                     std::make_unique<AggregationHandler>(std::move(aggregationHandler)).release()};
     }
     return vesk_session_configure(_session.get(), &info.dictionary(), user.get(), frameworks.data(),
                                   frameworks.size(), &aggregation);
