@@ -157,7 +157,10 @@ class PostOutbox final : public PostKeeper {
   /// started, since no post is kept then.
   void runOnThread(const std::function<void()>& task);
 
-  // Called on the outbox's thread only.
+  /// Removes the posts that respect consent from `posts`.
+  static Losses removeRespectingConsent(std::vector<WaitingPost>& posts);
+
+  // Called on the outbox's thread only (PostOutboxThread.cpp).
   void run();
   void waitForWork(NetworkMonitor& network);
   std::optional<Instant> nextEvent() const;

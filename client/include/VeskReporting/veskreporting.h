@@ -303,8 +303,8 @@ VESK_API size_t vesk_recorder_count(const vesk_recorder* recorder, int32_t call)
  * is cleared or freed. */
 VESK_API const vesk_recorded* vesk_recorder_at(const vesk_recorder* recorder, int32_t call, size_t index);
 VESK_API void vesk_recorder_clear(vesk_recorder* recorder);
-/* The backends that starts and states name from now on; "httpPost" alone until then. A null array: there is
- * no storebag. */
+/* Sets the enabled backends that the recorder reports for later starts and state queries; null means that
+ * there is no storebag. The default is "httpPost". */
 VESK_API void vesk_recorder_set_backends(vesk_recorder* recorder, const char* const* backends, size_t count);
 
 #ifdef __cplusplus

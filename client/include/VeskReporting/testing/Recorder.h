@@ -62,8 +62,8 @@ class Recorder {
   std::size_t count(std::int32_t call) const noexcept { return vesk_recorder_count(_recorder.get(), call); }
   void clear() noexcept { vesk_recorder_clear(_recorder.get()); }
 
-  /// The backends that starts and states name from now on; nullopt: there is no storebag. "httpPost" until
-  /// then.
+  /// Sets the enabled backends that the recorder reports for later starts and state queries; nullopt means
+  /// that there is no storebag. The default is "httpPost".
   void setBackends(const std::optional<std::vector<std::string>>& backends) {
     if (!backends) return vesk_recorder_set_backends(_recorder.get(), nullptr, 0);
     std::vector<const char*> names(1);  // never a null array
