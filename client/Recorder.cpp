@@ -24,20 +24,13 @@ struct Sockets {
   std::vector<std::string> paths VESK_GUARDED_BY(mutex);  // the newest is the last
 };
 
-/// Never destroyed: sessions may outlive the end of `main`.
+/// Never destroyed, because sessions may outlive `main`.
 Sockets& sockets() {
   static auto& sockets = *new Sockets;
   return sockets;
 }
 
-std::string makeDirectory() {
-  std::error_code code;
-  auto directory = (std::filesystem::temp_directory_path(code) / "vesk-recorder.XXXXXX").string();
-  if (!::mkdtemp(directory.data())) throw std::system_error(errno, std::generic_category(), directory);
-  return directory;
-}
-
-std::string socketIn(const std::string& directory) { return directory + "/run/socket"; }
+std::string socketIn(const PrivateDirectory& directory) { return directory.path() + "/run/socket"; }
 
 /// The session of one connection. Its calls arrive on the connection's thread.
 class RecordingSession final : public ClientSessionInterface {
@@ -134,8 +127,19 @@ Recorder::Kept::Kept(Call received) : call(std::move(received)) {
   if (!call.path.empty()) view.path = call.path.c_str();
 }
 
+PrivateDirectory::PrivateDirectory() {
+  std::error_code code;
+  _path = (std::filesystem::temp_directory_path(code) / "vesk-recorder.XXXXXX").string();
+  if (!::mkdtemp(_path.data())) throw std::system_error(errno, std::generic_category(), _path);
+}
+
+PrivateDirectory::~PrivateDirectory() {
+  std::error_code ignored;
+  std::filesystem::remove_all(_path, ignored);
+}
+
 Recorder::Recorder()
-    : _directory(makeDirectory()), _listener([&] {
+    : _listener([&] {
         IPCListener::Options options;
         options.socketPath = socketIn(_directory);
         options.objectPath = wire::kObjectPath;
@@ -153,8 +157,6 @@ Recorder::~Recorder() {
     std::erase(sockets().paths, socketIn(_directory));
   }
   _listener.stop();
-  std::error_code ignored;
-  std::filesystem::remove_all(_directory, ignored);
 }
 
 std::string Recorder::currentSocket() {

@@ -1,4 +1,4 @@
-// Takes the daemon's place in the tests of a program that reports.
+// Replaces the daemon in a program's unit tests.
 #pragma once
 
 #include <VeskReporting/veskreporting.h>
@@ -17,8 +17,23 @@
 
 namespace vesk {
 
-/// Records what sessions of this process call, and answers as a daemon would whose storebag enables some
-/// backends. Listens on a socket of its own, so that calls take the same way as to a daemon. Thread-safe.
+/// A directory in TMPDIR that only this user can enter. Removed with its contents.
+class PrivateDirectory {
+ public:
+  /// Throws std::system_error.
+  PrivateDirectory();
+  ~PrivateDirectory();
+  PrivateDirectory(const PrivateDirectory&) = delete;
+  PrivateDirectory& operator=(const PrivateDirectory&) = delete;
+
+  const std::string& path() const noexcept { return _path; }
+
+ private:
+  std::string _path;
+};
+
+/// Records the calls of this process's sessions, and answers them like a daemon whose storebag enables the
+/// given backends. Listens on its own socket, so calls take the same path as to a daemon. Thread-safe.
 class Recorder : private IPCListenerDelegate {
  public:
   /// A call as it was received. Members that it doesn't have are empty.
@@ -66,7 +81,7 @@ class Recorder : private IPCListenerDelegate {
   bool shouldAcceptNewConnection(const std::shared_ptr<IPCConnection>& connection) override;
 
   const ForkGuard _process;
-  const std::string _directory;
+  const PrivateDirectory _directory;
   mutable Mutex _mutex;
   std::deque<Kept> _calls VESK_GUARDED_BY(_mutex);
   std::optional<std::vector<std::string>> _backends VESK_GUARDED_BY(_mutex) = {{"httpPost"}};

@@ -1,4 +1,4 @@
-// What came of a call, in the form that its caller gets.
+// The outcome of a call, as its caller receives it.
 #pragma once
 
 #include <VeskReporting/VeskReportingTypes.h>

@@ -66,7 +66,7 @@ std::optional<VeskDictionaryView> viewOf(const VeskDictionaryView* view) noexcep
   return view ? std::optional(*view) : std::nullopt;
 }
 
-/// Throws InvalidCall for what no dictionary can hold.
+/// Throws InvalidCall if the view is null or can't be copied.
 Dictionary ownedCopy(const VeskDictionaryView* view) {
   auto copy = view ? copyOf(*view) : std::nullopt;
   if (!copy) throw InvalidCall();

@@ -37,7 +37,7 @@ void vesk_result_free(vesk_result* result) { delete result; }
 
 struct vesk_dictionary {
   MutableDictionary entries;
-  // Made when it is asked for.
+  // Built on demand.
   mutable Dictionary shared;
   mutable std::unique_ptr<ValueViews> views;
 };

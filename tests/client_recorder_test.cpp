@@ -100,7 +100,7 @@ TEST(Recorder, TakesSessionsThatNameNoSocketWhileItExists) {
   VeskReporting session;
   EXPECT_TRUE(session.connect());
   recorder.reset();
-  // Its session ends with it, and no later one finds it.
+  // Its session has lost the connection, and there is no other recorder.
   EXPECT_EQ(session.connect(std::chrono::milliseconds(0)).status, ReportingStatus::NotConnected);
 }
 

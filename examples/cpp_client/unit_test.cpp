@@ -7,7 +7,7 @@
 
 namespace {
 
-/// What is tested: a part of some application.
+/// The code under test: part of an application.
 class Shutter {
  public:
   Shutter() {

@@ -83,7 +83,7 @@ class Dev {
 
   void startDaemon(const std::string& path) {
     _root.prepare();
-    // The user's proxy must not get what is for the collector.
+    // Posts to the collector must not go through the user's proxy.
     _daemon.program = std::make_unique<DevProgram>(
         DevProgram::Options{{path, "--root", _root.path()},
                             {{"SSL_CERT_FILE", textIn(_root.facts(), "authorityFile")}, {"no_proxy", "*"}},
@@ -117,7 +117,7 @@ class Dev {
   }
 
   void readTap() {
-    // A request from after the program's end that brings nothing shows that nothing is left.
+    // All drops were shown once a request made after the program's end returns nothing.
     ask(wire::kReadTap, {}, [this, isLate = _program && _program->status()](BusAnswer& answer) {
       Dictionary batch;
       const bool isOpen = answer.read(batch);
@@ -189,7 +189,7 @@ class Dev {
     }
   }
 
-  /// Waits for whatever comes next, and handles it.
+  /// Waits for the next event and handles it.
   void turn(int milliseconds) {
     pollfd sources[] = {{_signals.get(), POLLIN, 0}, {-1, POLLIN, 0}, {-1, POLLIN, 0}, {-1, 0, 0}};
     Server* const servers[] = {&_collector, &_daemon};
@@ -211,7 +211,7 @@ class Dev {
     while (::read(_signals.get(), &info, sizeof info) == sizeof info) {
       if (info.ssi_signo == SIGCHLD) continue;
       ++_endings;
-      // What a terminal sends reaches the program anyway.
+      // The terminal signals the program itself.
       if (_program && info.ssi_code <= 0) _program->signal(static_cast<int>(info.ssi_signo));
     }
   }

@@ -40,7 +40,7 @@ class DevProgram {
 
   pid_t pid() const { return _pid; }
   void signal(int number) const;
-  /// Its exit status, or 128 and the number of the signal that ended it; nullopt while it runs.
+  /// Its exit status, or 128 plus the number of the signal that ended it; nullopt while it runs.
   std::optional<int> status();
 
   /// What a server writes to standard output and error; -1 once it was read to the end.
@@ -51,7 +51,7 @@ class DevProgram {
  private:
   pid_t _pid = -1;
   FileDescriptor _output;
-  std::string _partial;  ///< a line whose end has not come
+  std::string _partial;  ///< an incomplete line
   std::optional<int> _status;
 };
 

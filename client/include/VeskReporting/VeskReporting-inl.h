@@ -47,7 +47,7 @@ void deliver(void* context, const vesk_result* result) {
   (*callback)(std::move(copy));
 }
 
-/// `call` gets a completion, or null if it is one-way. No exception leaves it.
+/// Makes a one-way call: `call` receives no completion. Catches its exceptions.
 template <class Call>
 ReportingStatus post(const Call& call) noexcept {
   try {
@@ -72,7 +72,7 @@ ReportingStatus ask(ReportingCallback<Answer>& callback, std::chrono::millisecon
   }
 }
 
-/// `call` gets where to put its result.
+/// `call` receives the address for its result.
 template <class Answer, class Call>
 ReportingResult<Answer> wait(const Call& call) noexcept {
   try {

@@ -1,5 +1,4 @@
-// The client API for telemetry reporting: a layer over veskreporting.h that needs nothing to be linked but
-// the library's C functions.
+// The client API for telemetry reporting: inline functions over the C API of veskreporting.h.
 #pragma once
 
 #include <VeskReporting/VeskReportingKeys.h>

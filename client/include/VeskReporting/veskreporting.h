@@ -47,7 +47,7 @@ enum {
 /* A short description for a log line. Static. */
 VESK_API const char* vesk_status_text(vesk_status status);
 
-/* What came of a call that has an answer. */
+/* The outcome of a call that has an answer. */
 typedef struct vesk_result vesk_result;
 
 VESK_API vesk_status vesk_result_status(const vesk_result* result);
@@ -101,16 +101,16 @@ VESK_API const VeskDictionaryView* vesk_dictionary_view(const vesk_dictionary* d
 
 typedef struct vesk_session vesk_session;
 
-/* The meaning and the defaults are those of vesk::ReportingOptions. */
+/* How a session behaves. */
 typedef struct vesk_options {
-  size_t size;             /* of this structure; set by vesk_options_init */
-  const char* socket_path; /* null: the daemon's own */
-  uint64_t maximum_queued_messages;
-  uint64_t maximum_queued_bytes;
-  int64_t drain_ms;
-  int64_t first_reconnect_ms;
-  int64_t last_reconnect_ms;
-  int64_t refresh_ms; /* 0: never */
+  size_t size;                      /* of this structure; set by vesk_options_init */
+  const char* socket_path;          /* null: the daemon's own */
+  uint64_t maximum_queued_messages; /* 4096; further messages are dropped */
+  uint64_t maximum_queued_bytes;    /* 8 MiB, approximate memory */
+  int64_t drain_ms;           /* 2000: how long vesk_session_free may take to send the queued messages */
+  int64_t first_reconnect_ms; /* 50: delay between connection attempts; it doubles ... */
+  int64_t last_reconnect_ms;  /* 5000: ... up to this */
+  int64_t refresh_ms;         /* 0, never: how often a started session starts anew, at least 1000 */
 } vesk_options;
 
 /* Sets the defaults. `size`: sizeof(vesk_options). */
@@ -262,10 +262,10 @@ VESK_API size_t vesk_public_key(char* buffer, size_t size);
 
 /* ---- Testing ------------------------------------------------------------------------------------------- */
 
-/* Takes the daemon's place in the tests of a program: while a recorder exists, new sessions without a
- * `socket_path` connect to the newest recorder of this process and reach no daemon. Their one-way calls wait
- * until they are recorded, so that a test can look at once. One recorder may serve many sessions;
- * free it after them. Thread-safe. */
+/* Replaces the daemon in a program's unit tests. While a recorder exists, new sessions without a
+ * `socket_path` connect to the newest recorder of this process instead of a daemon. Their one-way calls
+ * return after they were recorded, so a test can check them at once. A recorder may serve many sessions. Free
+ * it after them. Thread-safe. */
 typedef struct vesk_recorder vesk_recorder;
 
 /* What was called, in the order of the calls. */
@@ -297,7 +297,7 @@ typedef struct vesk_recorded {
 /* Null if it can't listen, which is logged. */
 VESK_API vesk_recorder* vesk_recorder_new(void);
 VESK_API void vesk_recorder_free(vesk_recorder* recorder);
-/* All calls, or with `call` not 0 those of that kind. */
+/* The number of calls of a kind; 0 counts all kinds. */
 VESK_API size_t vesk_recorder_count(const vesk_recorder* recorder, int32_t call);
 /* The call with that index, from 0, among those of the kind; null beyond the last. Valid until the recorder
  * is cleared or freed. */

@@ -1,4 +1,4 @@
-// Takes the daemon's place in the unit tests of a program that reports.
+// Replaces the daemon in a program's unit tests.
 #pragma once
 
 #include <VeskReporting/VeskReporting.h>
@@ -13,7 +13,7 @@
 
 namespace vesk::testing {
 
-/// A message as the daemon would have received it, also one that was sent by `sendMessageOnce`.
+/// A message as the daemon would receive it, including those sent by `sendMessageOnce`.
 struct RecordedMessage {
   std::uint16_t category = 0;
   std::uint16_t type = 0;
@@ -23,9 +23,9 @@ struct RecordedMessage {
   std::optional<Dictionary> userInfo;     ///< likewise
 };
 
-/// While it exists, new sessions of this process connect to it and reach no daemon, unless they name a socket
-/// of their own. Their one-way calls wait until they are recorded, so that a test can look at once. Answers
-/// are those of a daemon whose storebag enables the backends of `setBackends`. Must outlive its sessions.
+/// While it exists, new sessions of this process connect to it instead of a daemon, unless they name their
+/// own socket. Their one-way calls return after they were recorded, so a test can check them at once. It
+/// answers like a daemon whose storebag enables the backends of `setBackends`. Must outlive its sessions.
 /// Thread-safe.
 class Recorder {
  public:
@@ -58,7 +58,7 @@ class Recorder {
     }
     return data;
   }
-  /// How often a session was started (VESK_RECORDED_START), flushed and so on.
+  /// The number of recorded calls of a kind, such as VESK_RECORDED_START. 0 counts all kinds.
   std::size_t count(std::int32_t call) const noexcept { return vesk_recorder_count(_recorder.get(), call); }
   void clear() noexcept { vesk_recorder_clear(_recorder.get()); }
 
