@@ -58,7 +58,7 @@ class ReportingError(Exception):
 
 
 class Result(Generic[Answer]):
-    """What came of a call that has an answer."""
+    """The outcome of a call that has an answer."""
 
     def __init__(self, status: Status, answer: Optional[Answer] = None, detail: str = "") -> None:
         self.status = status
@@ -76,7 +76,7 @@ class Result(Generic[Answer]):
 
 
 def read_result(result: int, read: Callable[[Any, int], Answer]) -> Result[Answer]:
-    """Copies a vesk_result. `read` is one of the functions below, or alike."""
+    """Copies a vesk_result. `read` is a function such as those below."""
     library = c.load()
     status = status_of(library.vesk_result_status(result))
     answer = read(library, result) if status is Status.DONE else None

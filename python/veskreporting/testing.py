@@ -1,4 +1,4 @@
-"""A recorder takes the daemon's place in an application's tests. The fixture is `veskreporting_recorder`."""
+"""A recorder replaces the daemon in an application's tests. The fixture is `veskreporting_recorder`."""
 
 import ctypes
 import dataclasses
@@ -41,10 +41,10 @@ class Recorded:
 
 
 class Recorder:
-    """While it exists, new sessions of this process connect to it and reach no daemon. Thread-safe.
+    """While it exists, new sessions of this process connect to it instead of a daemon. Thread-safe.
 
-    Calls with a Status wait until they are recorded, so a test can look at once. The newest recorder counts. Make it
-    before the sessions; when it is closed, the sessions that were made since are closed, too.
+    One-way calls return after they were recorded, so a test can check them at once. Sessions connect to the newest
+    recorder. Make it before them. Closing it also closes the sessions made since.
     """
 
     def __init__(self) -> None:
@@ -89,7 +89,7 @@ class Recorder:
             self._library.vesk_recorder_clear(self._handle)
 
     def set_backends(self, names: Optional[Iterable[str]]) -> None:
-        """What starts and states name from now on; None: there is no storebag. "httpPost" alone until then."""
+        """Sets the enabled backends reported for later starts and state queries. None: no storebag. Default: "httpPost"."""
         encoded = None if names is None else [name.encode() for name in names]
         array = None if encoded is None else (ctypes.c_char_p * max(len(encoded), 1))(*encoded)
         with self._lock:
