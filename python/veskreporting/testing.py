@@ -89,7 +89,10 @@ class Recorder:
             self._library.vesk_recorder_clear(self._handle)
 
     def set_backends(self, names: Optional[Iterable[str]]) -> None:
-        """Sets the enabled backends reported for later starts and state queries. None: no storebag. Default: "httpPost"."""
+        """Sets the enabled backends reported for later starts and state queries. None: there is no storebag.
+
+        The default is "httpPost".
+        """
         encoded = None if names is None else [name.encode() for name in names]
         array = None if encoded is None else (ctypes.c_char_p * max(len(encoded), 1))(*encoded)
         with self._lock:
