@@ -2,6 +2,7 @@
 #include <VeskReporting/testing/Recorder.h>
 #include <VeskReporting/veskreporting.h>
 #include <gtest/gtest.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <fstream>
@@ -60,6 +61,7 @@ TEST(Recorder, SeesAtOnceWhatSessionsCall) {
     EXPECT_EQ(session.sendMessageOnce(once, std::nullopt, 1, 2), ReportingStatus::Queued);
     EXPECT_EQ(session.sendMessageAndWait(4, 1).status, ReportingStatus::Done);
     EXPECT_EQ(session.flushMessages(), ReportingStatus::Queued);
+    EXPECT_EQ(session.fetchDisplayURL().answer, "URL not available");
     EXPECT_TRUE(session.uploadFile(file).answer);
     EXPECT_TRUE(session.uploadLogData({"line", 2}).answer);
 
@@ -75,7 +77,7 @@ TEST(Recorder, SeesAtOnceWhatSessionsCall) {
     EXPECT_EQ(recorder.files(), std::vector<std::string>{file});
     EXPECT_EQ(recorder.logData(), (std::vector<List>{{"line", 2}}));
     EXPECT_EQ(recorder.count(VESK_RECORDED_FLUSH), 1U);
-    EXPECT_EQ(recorder.count(0), 10U);
+    EXPECT_EQ(recorder.count(0), 11U);
   }
   recorder.clear();
   recorder.setBackends(std::nullopt);
@@ -102,6 +104,23 @@ TEST(Recorder, TakesSessionsThatNameNoSocketWhileItExists) {
   recorder.reset();
   // Its session has lost the connection, and there is no other recorder.
   EXPECT_EQ(session.connect(std::chrono::milliseconds(0)).status, ReportingStatus::NotConnected);
+}
+
+TEST(Recorder, BelongsToTheProcessThatMadeIt) {
+  vesk_recorder* recorder = vesk_recorder_new();
+  VeskReporting session;
+  const pid_t child = ::fork();
+  if (child == 0) {
+    vesk_recorder_free(recorder);
+    ::_exit(0);
+  }
+  int status = -1;
+  ASSERT_EQ(::waitpid(child, &status, 0), child);
+  EXPECT_EQ(status, 0);
+  EXPECT_EQ(session.flushMessages(), ReportingStatus::Queued);
+  EXPECT_EQ(vesk_recorder_count(recorder, VESK_RECORDED_FLUSH), 1U);
+  vesk_recorder_free(recorder);
+  vesk_recorder_free(nullptr);
 }
 
 TEST(CApi, BuildsDictionariesAndDeliversAnswers) {

@@ -87,6 +87,11 @@ TEST_F(DevCommand, TheDaemonEndsWithIt) {
 }
 
 TEST_F(DevCommand, SaysWhichServerHasEnded) {
+  const auto killed = runScript(
+      "kill -9 $(sed -n 's/.*\"pid\": *\\([0-9]*\\).*/\\1/p' "
+      "$VESKREPORTINGD_ROOT/collector/ready.json); exec tail -f /dev/null");
+  EXPECT_EQ(killed.status, 1);
+  EXPECT_TRUE(killed.says("veskcollector has ended with status 137")) << killed.errors;
   const auto told = runScript("report reload; exec tail -f /dev/null");
   EXPECT_EQ(told.status, 1);
   EXPECT_TRUE(told.says("veskreportingd has ended with status 0\n")) << told.errors;
@@ -110,6 +115,7 @@ TEST_F(DevCommand, KeepsADirectoryOfItsOwn) {
 
 TEST_F(DevCommand, NamesWhatIsMissing) {
   EXPECT_EQ(run(dev({"--", "/nonexistent"})).status, 127);
+  EXPECT_EQ(runScript("kill -TERM $$; exit 3").status, 128 + SIGTERM);  // signals are as usual in the program
   EXPECT_TRUE(leavesNothing());
   std::filesystem::copy_file(kTool, temporary / "veskreport");
   auto alone = dev({}, temporary / "veskreport");
